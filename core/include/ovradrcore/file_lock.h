@@ -1,0 +1,37 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include "ovradrcore/export.h"
+
+#include <string>
+
+namespace OvraDRCore {
+
+/// An advisory lock between processes, flock(2) on a file of its own.
+///
+/// A bare name lives under /run/lock; a name with a slash is a path. The file is made when missing
+/// (mode 0600), never followed through a symbolic link, and never removed: every process arrives at
+/// the same file. The lock belongs to this object, not to the process, so two objects exclude each
+/// other within one process as well; it goes with the process when that dies.
+class OVRADRCORE_EXPORT FileLock {
+public:
+    /// Binds the object to its file; takes no lock.
+    explicit FileLock(const std::string &path);
+    /// Releases a lock still held.
+    ~FileLock();
+    FileLock(const FileLock &) = delete;
+    FileLock &operator=(const FileLock &) = delete;
+
+    /// Takes the lock; one that this object already holds is converted.
+    /// \param operation  the bits of flock(2): LOCK_SH or LOCK_EX, with or without LOCK_NB
+    /// \param wait       seconds to keep trying, on the monotonic clock; 0 tries once
+    /// \return true when held.
+    bool lock(int operation, unsigned int wait);
+    void unlock() const;
+
+private:
+    std::string path_;
+    mutable int fd_ = -1;
+};
+
+} // namespace OvraDRCore

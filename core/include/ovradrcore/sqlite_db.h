@@ -1,0 +1,59 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include "ovradrcore/err_recorder.h"
+#include "ovradrcore/export.h"
+#include "ovradrcore/sqlite_command.h"
+#include "ovradrcore/sqlite_value.h"
+
+#include <memory>
+#include <string>
+#include <vector>
+
+struct sqlite3;
+
+namespace OvraDRCore {
+
+/// An open SQLite file. Construction reports nothing: a file that cannot be opened makes every
+/// operation fail. The file is never created here, nor a table in it.
+///
+/// Every operation returns false on failure, records 407 with SQLite's own words as the message,
+/// and logs them once at WARN; nothing throws. A file that another process has locked is waited
+/// for.
+class OVRADRCORE_EXPORT SqliteDB : public ErrRecorder {
+public:
+    /// \param path       the database file
+    /// \param busyTime   seconds to wait for a lock that another process holds
+    /// \param infoTable  the table in which provisioning keeps the schema version
+    SqliteDB(const std::string &path, unsigned int busyTime, const std::string &infoTable);
+    SqliteDB(SqliteDB &&) noexcept;
+    SqliteDB &operator=(SqliteDB &&) noexcept;
+    ~SqliteDB() override;
+
+    /// The first row of the result, or an empty list when there is none.
+    bool SelectRecord(const SelectCommand &command, SqliteValueList &row);
+    /// Appends one list per row, in SQLite's order.
+    bool SelectRecords(const SelectCommand &command, std::vector<SqliteValueList> &rows);
+    bool InsertRecord(const InsertCommand &command);
+    /// Success does not depend on how many rows changed.
+    bool UpdateRecord(const UpdateCommand &command);
+    /// An empty condition is refused: a delete never means every row.
+    bool DeleteRecord(const std::string &condition, const SqliteTableHandler &table);
+
+    /// The schema version that provisioning wrote into the info table; -1 when it cannot be read.
+    int GetSchemaVersion();
+
+private:
+    struct Close {
+        void operator()(sqlite3 *db) const;
+    };
+
+    bool run(const std::string &sql, std::vector<SqliteValueList> *rows, bool firstOnly);
+    bool fail(const std::string &what) const;
+
+    std::string path_;
+    std::string infoTable_;
+    std::unique_ptr<sqlite3, Close> db_;
+};
+
+} // namespace OvraDRCore

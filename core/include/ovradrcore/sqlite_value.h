@@ -1,0 +1,82 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include "ovradrcore/export.h"
+
+#include <cstddef>
+#include <string>
+#include <utility>
+#include <variant>
+#include <vector>
+
+namespace OvraDRCore {
+
+/// One cell: text (any bytes, NUL included) or a signed 32-bit integer.
+class OVRADRCORE_EXPORT SqliteValue {
+public:
+    /// The empty text.
+    SqliteValue() = default;
+    SqliteValue(const std::string &text)
+        : value_(text) {} // NOLINT(google-explicit-constructor)
+    SqliteValue(const char *text)
+        : value_(std::string(text)) {} // NOLINT(google-explicit-constructor)
+    SqliteValue(int number)
+        : value_(number) {} // NOLINT(google-explicit-constructor)
+
+    /// True, and sets `text`, when the value holds text.
+    bool GetValue(std::string &text) const;
+    /// True, and sets `number`, when the value holds an integer.
+    bool GetValue(int &number) const;
+    /// The value as an SQL literal; text with a NUL in it as the text of its bytes.
+    std::string ToLiteral() const;
+
+private:
+    std::variant<std::string, int> value_;
+};
+
+/// One row: named values in the order in which they were added. Empty means that there is no row.
+class OVRADRCORE_EXPORT SqliteValueList {
+public:
+    using Column = std::pair<std::string, SqliteValue>;
+
+    /// Adds a column; a name that is already there gets the new value.
+    void AddValue(const std::string &name, const SqliteValue &value);
+    /// The column's value; an absent column gives the empty text.
+    SqliteValue GetValue(const std::string &name) const;
+    /// True, and sets the target, when the column is there and convertible; an integer reads as its
+    /// decimal text, and decimal text that fits reads as an integer.
+    bool GetValue(const std::string &name, std::string &text) const;
+    bool GetValue(const std::string &name, int &number) const;
+
+    bool empty() const { return columns_.empty(); }
+    std::size_t size() const { return columns_.size(); }
+    std::vector<Column>::const_iterator begin() const { return columns_.begin(); }
+    std::vector<Column>::const_iterator end() const { return columns_.end(); }
+
+private:
+    const SqliteValue *find(const std::string &name) const;
+
+    std::vector<Column> columns_;
+};
+
+/// A record class that maps to a table row.
+class OVRADRCORE_EXPORT SqliteRecord {
+public:
+    /// The current values of those listed columns that the record knows.
+    virtual SqliteValueList ToSqliteValues(const std::vector<std::string> &fields) const = 0;
+    /// Loads the columns that the record knows; false when the row has none of them.
+    virtual bool FromSqliteValues(const SqliteValueList &row) = 0;
+    /// The record's column names, in its own order.
+    virtual std::vector<std::string> ListSqliteField() const = 0;
+
+    /// The whole row.
+    SqliteValueList ToSqliteRecord() const { return ToSqliteValues(ListSqliteField()); }
+
+protected:
+    SqliteRecord() = default;
+    SqliteRecord(const SqliteRecord &) = default;
+    SqliteRecord &operator=(const SqliteRecord &) = default;
+    ~SqliteRecord() = default;
+};
+
+} // namespace OvraDRCore

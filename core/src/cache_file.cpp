@@ -1,0 +1,414 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "cache_file.h"
+
+#include "ovradrcore/log.h"
+
+#include <fcntl.h>
+#include <sys/file.h>
+#include <sys/stat.h>
+
+#include <algorithm>
+#include <array>
+#include <atomic>
+#include <bit>
+#include <cerrno>
+#include <chrono>
+#include <cstring>
+#include <thread>
+
+namespace OvraDRCore {
+
+namespace {
+
+using std::chrono::milliseconds;
+using std::chrono::steady_clock;
+
+constexpr std::size_t kPair = 2 * BucketImage::kSize;
+constexpr std::uint32_t kMinBuckets = 16;
+constexpr std::uint32_t kMaxBuckets = 65536;
+/// A bucket that overflows in a file emptier than this share holds names made to collide, or huge
+/// values: its oldest entries go, and the file does not grow.
+constexpr std::uint64_t kMinLoadToGrow = 64;
+constexpr milliseconds kLockWait{2000};
+constexpr milliseconds kLongestPause{20};
+
+using Pair = std::array<std::byte, kPair>;
+
+std::string directoryOf(const std::string &path) {
+    const std::size_t end = path.find_last_not_of('/', path.find_last_of('/'));
+    return end == std::string::npos ? "/" : path.substr(0, end + 1);
+}
+
+bool isOursAlone(const struct stat &status) {
+    return status.st_uid == geteuid() && (status.st_mode & (S_IWGRP | S_IWOTH)) == 0;
+}
+
+/// Whether the directory may be trusted. Somebody else cannot exchange it between this look and the
+/// opening of a file in it: its own folder is sticky or ours.
+bool checkDirectory(const std::string &directory, bool create) {
+    struct stat status {};
+    if (lstat(directory.c_str(), &status) != 0) {
+        if (errno != ENOENT || !create) {
+            return false;
+        }
+        if (mkdir(directory.c_str(), 0700) != 0 && errno != EEXIST) {
+            OVRA_WARN("Failed to create cache directory [%s]: %s", directory.c_str(),
+                      strerrordesc_np(errno));
+            return false;
+        }
+        if (lstat(directory.c_str(), &status) != 0) {
+            return false;
+        }
+    }
+    if (S_ISDIR(status.st_mode) && isOursAlone(status)) {
+        return true;
+    }
+    static std::atomic<bool> reported{false};
+    if (!reported.exchange(true)) {
+        OVRA_ERR("Cache directory [%s] is not a directory of user %u that only he may write; going "
+                 "on without a cache. Remove it",
+                 directory.c_str(), static_cast<unsigned int>(geteuid()));
+    }
+    return false;
+}
+
+/// The number of buckets of a file of this size; 0 when no cache file has it.
+std::uint32_t bucketsOf(const struct stat &status) {
+    const auto size = static_cast<std::uint64_t>(status.st_size);
+    const std::uint64_t buckets = size / kPair;
+    const bool right = S_ISREG(status.st_mode) && isOursAlone(status) && size % kPair == 0 &&
+                       buckets >= kMinBuckets && buckets <= kMaxBuckets &&
+                       std::has_single_bit(buckets);
+    return right ? static_cast<std::uint32_t>(buckets) : 0;
+}
+
+UniqueFd openFile(const std::string &path, int flags) {
+    return UniqueFd(open(path.c_str(), flags | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK, 0600));
+}
+
+/// Calls attempt() with growing pauses until it is true or the wait is over.
+template <typename Attempt>
+bool retry(milliseconds wait, Attempt attempt) {
+    const auto deadline = steady_clock::now() + wait;
+    for (auto pause = std::chrono::microseconds(50);;
+         pause = std::min(pause * 2, {kLongestPause})) {
+        if (attempt()) {
+            return true;
+        }
+        if (steady_clock::now() + pause > deadline) {
+            return false;
+        }
+        std::this_thread::sleep_for(pause);
+    }
+}
+
+bool lockFile(int fd, int operation) {
+    return flock(fd, operation | LOCK_NB) == 0 ||
+           retry(kLockWait, [&] { return flock(fd, operation | LOCK_NB) == 0; });
+}
+
+bool readPair(int fd, std::uint32_t index, Pair &pair) {
+    const auto offset = static_cast<off_t>(index) * static_cast<off_t>(kPair);
+    return pread(fd, pair.data(), pair.size(), offset) == static_cast<ssize_t>(pair.size());
+}
+
+std::uint32_t bucketOf(std::string_view name, std::uint32_t buckets) {
+    return static_cast<std::uint32_t>(cacheNameHash(name)) & (buckets - 1);
+}
+
+/// Which of the two copies counts, and which is to be overwritten next.
+struct Choice {
+    bool valid = false; ///< at least one copy is whole
+    std::size_t newer = 0;
+    std::uint64_t sequence = 0;
+};
+
+Choice choose(const Pair &pair, std::uint32_t buckets, std::uint32_t index) {
+    const auto first = BucketImage::check(pair.data(), buckets, index);
+    const auto second = BucketImage::check(pair.data() + BucketImage::kSize, buckets, index);
+    if (first && (!second || *first >= *second)) {
+        return {true, 0, *first};
+    }
+    if (second) {
+        return {true, 1, *second};
+    }
+    return {};
+}
+
+std::vector<CacheEntry> chosenEntries(const Pair &pair, const Choice &choice) {
+    return choice.valid ? BucketImage::entries(pair.data() + choice.newer * BucketImage::kSize)
+                        : std::vector<CacheEntry>();
+}
+
+bool isLongPast(const CacheEntry &entry, std::int64_t now) {
+    return now - entry.end > entry.lifetime + CacheFile::kKeepStale;
+}
+
+bool storeCopy(int fd, std::uint32_t buckets, std::uint32_t index, std::size_t which,
+               std::uint64_t sequence, const std::vector<CacheEntry> &entries) {
+    std::array<std::byte, BucketImage::kSize> copy{};
+    const std::size_t size = BucketImage::encode(copy, buckets, index, sequence, entries);
+    const auto offset = static_cast<off_t>(index) * static_cast<off_t>(kPair) +
+                        static_cast<off_t>(which * BucketImage::kSize);
+    return pwrite(fd, copy.data(), size, offset) == static_cast<ssize_t>(size);
+}
+
+/// A cache file under its exclusive lock.
+class LockedFile {
+public:
+    /// Opens and locks the file at `path`; one that is damaged or not ours is replaced.
+    static std::optional<LockedFile> open(const std::string &path, bool create) {
+        // The name may come to mean another file between opening and locking: a file that grew.
+        for (int attempt = 0; attempt < 100; ++attempt) {
+            LockedFile file;
+            file.fd_ = openFile(path, create ? O_RDWR | O_CREAT : O_RDWR);
+            if (!file.fd_) {
+                const bool hostile = errno == ELOOP || errno == EISDIR || errno == ENXIO ||
+                                     errno == EACCES || errno == EPERM;
+                if (create && hostile && discard(path)) {
+                    continue;
+                }
+                return std::nullopt;
+            }
+            if (!lockFile(file.fd_.get(), LOCK_EX)) {
+                OVRA_WARN("Cache file [%s] is locked for too long", path.c_str());
+                return std::nullopt;
+            }
+            struct stat status {};
+            if (fstat(file.fd_.get(), &status) != 0) {
+                return std::nullopt;
+            }
+            if (status.st_nlink == 0) {
+                continue;
+            }
+            file.buckets_ = bucketsOf(status);
+            if (file.buckets_ != 0) {
+                return file;
+            }
+            if (!S_ISREG(status.st_mode) || !isOursAlone(status)) {
+                if (!discard(path)) {
+                    return std::nullopt;
+                }
+                continue;
+            }
+            if (ftruncate(file.fd_.get(), 0) != 0 ||
+                ftruncate(file.fd_.get(), static_cast<off_t>(kMinBuckets * kPair)) != 0) {
+                return std::nullopt;
+            }
+            file.buckets_ = kMinBuckets;
+            return file;
+        }
+        return std::nullopt;
+    }
+
+    /// The entries of the bucket of `name`.
+    std::vector<CacheEntry> load(std::string_view name) {
+        index_ = bucketOf(name, buckets_);
+        Pair pair;
+        choice_ = readPair(fd_.get(), index_, pair) ? choose(pair, buckets_, index_) : Choice{};
+        return chosenEntries(pair, choice_);
+    }
+
+    /// Replaces the entries of the bucket that was loaded last.
+    bool store(const std::vector<CacheEntry> &entries) {
+        return storeCopy(fd_.get(), buckets_, index_, choice_.valid ? 1 - choice_.newer : 0,
+                         choice_.sequence + 1, entries);
+    }
+
+    /// Writes the file anew with twice the buckets, without what is long past, and goes on there.
+    /// \return false when that is not to be done or not possible: the old file stays as it is.
+    bool grow(const std::string &path, std::int64_t now) {
+        if (buckets_ == kMaxBuckets) {
+            return false;
+        }
+        const std::uint32_t buckets = 2 * buckets_;
+        std::vector<std::vector<CacheEntry>> contents(buckets);
+        std::uint64_t total = 0;
+        for (std::uint32_t index = 0; index < buckets_; ++index) {
+            Pair pair;
+            if (!readPair(fd_.get(), index, pair)) {
+                return false;
+            }
+            for (CacheEntry &entry : chosenEntries(pair, choose(pair, buckets_, index))) {
+                if (!isLongPast(entry, now)) {
+                    total += BucketImage::measure({entry});
+                    contents[bucketOf(entry.name, buckets)].push_back(std::move(entry));
+                }
+            }
+        }
+        if (total * kMinLoadToGrow < std::uint64_t{buckets_} * BucketImage::kSize) {
+            return false;
+        }
+        // Only the holder of the lock gets here, so a left-over of the same name is dead.
+        const std::string temporary = path + ".new";
+        unlink(temporary.c_str());
+        UniqueFd grown = openFile(temporary, O_RDWR | O_CREAT | O_EXCL);
+        bool written = grown && flock(grown.get(), LOCK_EX | LOCK_NB) == 0 &&
+                       ftruncate(grown.get(), static_cast<off_t>(buckets * kPair)) == 0;
+        for (std::uint32_t index = 0; written && index < buckets; ++index) {
+            written = contents[index].empty() ||
+                      storeCopy(grown.get(), buckets, index, 0, 1, contents[index]);
+        }
+        if (!written || rename(temporary.c_str(), path.c_str()) != 0) {
+            unlink(temporary.c_str());
+            return false;
+        }
+        fd_ = std::move(grown);
+        buckets_ = buckets;
+        return true;
+    }
+
+private:
+    static bool discard(const std::string &path) {
+        OVRA_WARN("Cache file [%s] is not a file of ours, replacing it", path.c_str());
+        return unlink(path.c_str()) == 0;
+    }
+
+    UniqueFd fd_;
+    std::uint32_t buckets_ = 0;
+    std::uint32_t index_ = 0;
+    Choice choice_;
+};
+
+void evictOldest(std::vector<CacheEntry> &entries) {
+    const auto oldest = std::min_element(
+        entries.begin(), entries.end(),
+        [](const CacheEntry &left, const CacheEntry &right) { return left.end < right.end; });
+    entries.erase(oldest);
+}
+
+} // namespace
+
+CacheFile::CacheFile(const std::string &path)
+    : path_(path) {}
+
+std::size_t CacheFile::maxEntrySize() {
+    return BucketImage::capacity() - BucketImage::measure({CacheEntry{}});
+}
+
+std::optional<CacheEntry> CacheFile::read(std::string_view name, int attempts) const {
+    if (!checkDirectory(directoryOf(path_), false)) {
+        return std::nullopt;
+    }
+    const UniqueFd fd = openFile(path_, O_RDONLY);
+    struct stat status {};
+    if (!fd || fstat(fd.get(), &status) != 0) {
+        return std::nullopt;
+    }
+    const std::uint32_t buckets = bucketsOf(status);
+    if (buckets == 0) {
+        return std::nullopt;
+    }
+    const std::uint32_t index = bucketOf(name, buckets);
+    Pair pair;
+    for (int attempt = 0; attempt <= attempts; ++attempt) {
+        // Two writes during one read can spoil both copies of it. The last attempt keeps them away.
+        if (attempt == attempts && !lockFile(fd.get(), LOCK_SH)) {
+            return std::nullopt;
+        }
+        if (!readPair(fd.get(), index, pair)) {
+            return std::nullopt;
+        }
+        const Choice choice = choose(pair, buckets, index);
+        if (choice.valid) {
+            return BucketImage::find(pair.data() + choice.newer * BucketImage::kSize, name);
+        }
+    }
+    return std::nullopt;
+}
+
+bool CacheFile::write(const CacheEntry &entry, std::int64_t now) const {
+    if (entry.name.size() + entry.value.size() > maxEntrySize()) {
+        OVRA_WARN("Value of cache entry [%s] in [%s] is too large: %zu bytes, %zu fit",
+                  entry.name.c_str(), path_.c_str(), entry.value.size(),
+                  maxEntrySize() - std::min(maxEntrySize(), entry.name.size()));
+        return false;
+    }
+    if (!checkDirectory(directoryOf(path_), true)) {
+        return false;
+    }
+    std::optional<LockedFile> file = LockedFile::open(path_, true);
+    if (!file) {
+        OVRA_WARN("Failed to open cache file [%s]", path_.c_str());
+        return false;
+    }
+    for (;;) {
+        std::vector<CacheEntry> entries = file->load(entry.name);
+        std::erase_if(entries, [&](const CacheEntry &other) {
+            return other.name == entry.name || isLongPast(other, now);
+        });
+        const std::size_t room = BucketImage::capacity() - BucketImage::measure({entry});
+        if (BucketImage::measure(entries) > room && file->grow(path_, now)) {
+            continue;
+        }
+        while (BucketImage::measure(entries) > room) {
+            evictOldest(entries);
+        }
+        entries.push_back(entry);
+        if (!file->store(entries)) {
+            OVRA_WARN("Failed to write cache file [%s]: %s", path_.c_str(), strerrordesc_np(errno));
+            return false;
+        }
+        return true;
+    }
+}
+
+bool CacheFile::remove(std::string_view name) const {
+    if (!checkDirectory(directoryOf(path_), false)) {
+        return true;
+    }
+    std::optional<LockedFile> file = LockedFile::open(path_, false);
+    if (!file) {
+        return access(path_.c_str(), F_OK) != 0;
+    }
+    std::vector<CacheEntry> entries = file->load(name);
+    if (std::erase_if(entries, [&](const CacheEntry &entry) { return entry.name == name; }) == 0) {
+        return true;
+    }
+    return file->store(entries);
+}
+
+namespace {
+
+/// The entries that this thread is refreshing, outermost first.
+thread_local std::vector<std::string> refreshing;
+
+} // namespace
+
+RefreshLock::RefreshLock(const std::string &path, const std::string &name)
+    : key_(path + '\0' + name)
+    , offset_(cacheNameHash(name) >> 2) { // an offset has to be positive, with room behind it
+    if (checkDirectory(directoryOf(path), true)) {
+        file_ = openFile(path + ".lock", O_RDWR | O_CREAT);
+    }
+}
+
+RefreshLock::~RefreshLock() {
+    if (held_) {
+        refreshing.pop_back();
+    }
+}
+
+bool RefreshLock::isHeldHere() const {
+    return std::find(refreshing.begin(), refreshing.end(), key_) != refreshing.end();
+}
+
+bool RefreshLock::tryAcquire() {
+    struct flock range {};
+    range.l_type = F_WRLCK;
+    range.l_whence = SEEK_SET;
+    range.l_start = static_cast<off_t>(offset_);
+    range.l_len = 1;
+    if (!file_ || fcntl(file_.get(), F_OFD_SETLK, &range) != 0) {
+        return false;
+    }
+    held_ = true;
+    refreshing.push_back(key_);
+    return true;
+}
+
+bool RefreshLock::acquire(long seconds) {
+    return retry(std::chrono::seconds(seconds), [this] { return tryAcquire(); });
+}
+
+} // namespace OvraDRCore

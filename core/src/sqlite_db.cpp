@@ -1,0 +1,168 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "ovradrcore/sqlite_db.h"
+
+#include "ovradrcore/log.h"
+
+#include <sqlite3.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <climits>
+#include <cstring>
+
+namespace OvraDRCore {
+
+namespace {
+
+struct Finalize {
+    void operator()(sqlite3_stmt *statement) const { sqlite3_finalize(statement); }
+};
+using Statement = std::unique_ptr<sqlite3_stmt, Finalize>;
+
+/// The row as named values. A NULL, a floating-point number and an integer over 32 bits have no
+/// place in a record: such a column reads as absent.
+SqliteValueList rowOf(sqlite3_stmt *statement) {
+    SqliteValueList row;
+    const int columns = sqlite3_column_count(statement);
+    for (int i = 0; i < columns; ++i) {
+        const char *name = sqlite3_column_name(statement, i);
+        const int type = sqlite3_column_type(statement, i);
+        if (name == nullptr) {
+            continue;
+        }
+        if (type == SQLITE_INTEGER) {
+            const sqlite3_int64 number = sqlite3_column_int64(statement, i);
+            if (number >= INT_MIN && number <= INT_MAX) {
+                row.AddValue(name, static_cast<int>(number));
+            }
+        } else if (type == SQLITE_TEXT || type == SQLITE_BLOB) {
+            const void *bytes = sqlite3_column_blob(statement, i);
+            const auto size = static_cast<std::size_t>(sqlite3_column_bytes(statement, i));
+            row.AddValue(name, std::string(static_cast<const char *>(bytes), bytes ? size : 0));
+        }
+    }
+    return row;
+}
+
+/// A condition comes as text: whatever follows its statement would be run unseen.
+bool isBlank(const char *tail, const char *end) {
+    return std::all_of(tail, end, [](char c) { return c == ' ' || c == '\n' || c == '\t'; });
+}
+
+} // namespace
+
+void SqliteDB::Close::operator()(sqlite3 *db) const {
+    sqlite3_close_v2(db);
+}
+
+SqliteDB::SqliteDB(const std::string &path, unsigned int busyTime, const std::string &infoTable)
+    : path_(path)
+    , infoTable_(infoTable) {
+    sqlite3 *db = nullptr;
+    // NOMUTEX: an object serves one thread.
+    const int result = sqlite3_open_v2(
+        path.c_str(), &db, SQLITE_OPEN_READWRITE | SQLITE_OPEN_NOMUTEX | SQLITE_OPEN_EXRESCODE,
+        nullptr);
+    db_.reset(db);
+    if (result != SQLITE_OK) {
+        return;
+    }
+    constexpr unsigned int kMilliseconds = 1000;
+    const unsigned int limit = INT_MAX / kMilliseconds;
+    sqlite3_busy_timeout(db, static_cast<int>(std::min(busyTime, limit) * kMilliseconds));
+    // A misspelt column is an error, not a text: a query has to fail on another schema.
+    sqlite3_db_config(db, SQLITE_DBCONFIG_DQS_DML, 0, nullptr);
+    // A file that a stranger has put there gets no code to run.
+    sqlite3_db_config(db, SQLITE_DBCONFIG_TRUSTED_SCHEMA, 0, nullptr);
+}
+
+SqliteDB::SqliteDB(SqliteDB &&) noexcept = default;
+SqliteDB &SqliteDB::operator=(SqliteDB &&) noexcept = default;
+SqliteDB::~SqliteDB() = default;
+
+bool SqliteDB::fail(const std::string &what) const {
+    SetErr(ERR::kFailed, what);
+    OVRA_WARN("Failed to use database [%s]: %s", path_.c_str(), what.c_str());
+    return false;
+}
+
+bool SqliteDB::run(const std::string &sql, std::vector<SqliteValueList> *rows, bool firstOnly) {
+    SetErr(ERR::kNone);
+    if (sql.empty()) {
+        return fail("the statement is incomplete, or its condition is invalid");
+    }
+    if (!db_) {
+        return fail("out of memory");
+    }
+    if (sql.size() > INT_MAX) {
+        return fail("the statement is too large");
+    }
+    sqlite3_stmt *prepared = nullptr;
+    const char *tail = nullptr;
+    int result =
+        sqlite3_prepare_v2(db_.get(), sql.data(), static_cast<int>(sql.size()), &prepared, &tail);
+    const Statement statement(prepared);
+    if (result != SQLITE_OK) {
+        return fail(sqlite3_errmsg(db_.get()));
+    }
+    if (!statement || !isBlank(tail, sql.data() + sql.size())) {
+        return fail("the condition holds more than a condition");
+    }
+    while ((result = sqlite3_step(statement.get())) == SQLITE_ROW) {
+        if (rows == nullptr) {
+            continue;
+        }
+        rows->push_back(rowOf(statement.get()));
+        if (firstOnly) {
+            return true;
+        }
+    }
+    return result == SQLITE_DONE || fail(sqlite3_errmsg(db_.get()));
+}
+
+bool SqliteDB::SelectRecord(const SelectCommand &command, SqliteValueList &row) {
+    std::vector<SqliteValueList> rows;
+    if (!run(command.ToStr(), &rows, true)) {
+        return false;
+    }
+    row = rows.empty() ? SqliteValueList() : rows.front();
+    return true;
+}
+
+bool SqliteDB::SelectRecords(const SelectCommand &command, std::vector<SqliteValueList> &rows) {
+    std::vector<SqliteValueList> found;
+    if (!run(command.ToStr(), &found, false)) {
+        return false;
+    }
+    rows.insert(rows.end(), found.begin(), found.end());
+    return true;
+}
+
+bool SqliteDB::InsertRecord(const InsertCommand &command) {
+    return run(command.ToStr(), nullptr, false);
+}
+
+bool SqliteDB::UpdateRecord(const UpdateCommand &command) {
+    return run(command.ToStr(), nullptr, false);
+}
+
+bool SqliteDB::DeleteRecord(const std::string &condition, const SqliteTableHandler &table) {
+    DeleteCommand command;
+    command.SetTable(table);
+    command.SetCondition(condition);
+    return run(command.ToStr(), nullptr, false);
+}
+
+int SqliteDB::GetSchemaVersion() {
+    SelectCommand select;
+    select.AddField("version");
+    select.SetTable(SqliteTableHandler(infoTable_, ""));
+    SqliteValueList row;
+    int version = -1;
+    if (SelectRecord(select, row)) {
+        row.GetValue("version", version);
+    }
+    return version;
+}
+
+} // namespace OvraDRCore

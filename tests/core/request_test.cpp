@@ -1,0 +1,96 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "ovradrcore/json.h"
+#include "ovradrcore/request.h"
+#include "ovradrcore/response.h"
+
+#include <gtest/gtest.h>
+
+using namespace OvraDRCore;
+
+namespace {
+
+Json::Value json(const std::string &text) {
+    Json::Value value;
+    EXPECT_TRUE(fromString(value, text)) << text;
+    return value;
+}
+
+} // namespace
+
+TEST(Request, SurvivesItsJsonForm) {
+    Request request("OVRA.DR.Node", 2, "info", Json::Value());
+    request.addParam("k", 1);
+    request.addParam("k", "b");
+    request.addParam(json(R"({"addr":"h","port":5})"));
+    request.addParam(Json::Value("not an object"));
+    request.setEncryptRequired(true);
+    const Request again(request.toJson());
+    EXPECT_TRUE(again.isValid());
+    EXPECT_TRUE(again.isEncryptRequired());
+    EXPECT_EQ(again.toStr(), request.toStr());
+    EXPECT_EQ(again.getParams(), json(R"({"k":"b","addr":"h","port":5})"));
+}
+
+TEST(Request, IncompleteOrForeignJsonIsInvalidAndNeverThrows) {
+    EXPECT_FALSE(Request().isValid());
+    EXPECT_TRUE(Request(json(R"({"api":"a","method":"m","version":1})")).isValid())
+        << "absent parameters count as none";
+    for (const char *text :
+         {"null", "[]", "\"a\"", "{}", R"({"api":"a","method":"m"})",
+          R"({"api":"","method":"m","version":1})", R"({"api":"a","method":3,"version":1})",
+          R"({"api":"a","method":"m","version":"1"})", R"({"api":"a","method":"m","version":0})",
+          R"({"api":"a","method":"m","version":9999999999})",
+          R"({"api":"a","method":"m","version":1,"params":[]})",
+          R"({"api":"a","method":"m","version":1,"encrypt":"yes"})"}) {
+        EXPECT_FALSE(Request(json(text)).isValid()) << text;
+    }
+}
+
+TEST(Response, UnderstandsTheTwoWireForms) {
+    Response response(json(R"({"success":true,"data":{"s":"x","n":5,"b":true,"o":{}}})"));
+    EXPECT_TRUE(response.isValid() && response.isSuccess());
+    EXPECT_EQ(response.getErrCode(), 0);
+    EXPECT_EQ(response.getDataFieldtoStr("s"), "x");
+    EXPECT_EQ(response.getDataFieldtoStr("n"), "5");
+    EXPECT_EQ(response.getDataFieldtoStr("b"), "true");
+    EXPECT_EQ(response.getDataFieldtoStr("o"), "");
+    EXPECT_EQ(response.getDataFieldtoStr("absent"), "");
+    EXPECT_TRUE(response.getDataField("absent").isNull());
+    response.setResp(std::string(R"({"success":false,"error":{"code":105,"msg":["a"]}})"));
+    EXPECT_TRUE(response.isValid());
+    EXPECT_FALSE(response.isSuccess() || response.hasDataField("s"));
+    EXPECT_EQ(response.getErrCode(), 105);
+    EXPECT_EQ(Response(response.toJson()).toJson(), response.toJson());
+    EXPECT_TRUE(Response(json(R"({"success":true})")).isSuccess()) << "no data is no failure";
+}
+
+TEST(Response, AnythingElseIsInvalidWithANonZeroCode) {
+    std::string deep;
+    for (int i = 0; i < 100000; ++i) {
+        deep += "[";
+    }
+    const std::vector<std::string> replies = {"",
+                                              "<html>busy</html>",
+                                              R"({"success":true,"data":{"a":1)",
+                                              "null",
+                                              "[]",
+                                              "true",
+                                              "{}",
+                                              deep,
+                                              R"({"success":"true"})",
+                                              R"({"success":true,"data":[1]})",
+                                              R"({"success":false})",
+                                              R"({"success":false,"error":{"code":0}})",
+                                              R"({"success":false,"error":{"code":"105"}})",
+                                              R"({"success":false,"error":105})",
+                                              R"({"success":true} trailing)",
+                                              R"({"success":false,"error":{"code":99999999999}})",
+                                              std::string("{\"success\":true}\0x", 18)};
+    for (const std::string &reply : replies) {
+        Response response(json(R"({"success":true,"data":{"old":1}})"));
+        response.setResp(reply);
+        EXPECT_FALSE(response.isValid() || response.isSuccess()) << reply.substr(0, 60);
+        EXPECT_EQ(response.getErrCode(), 407) << reply.substr(0, 60);
+        EXPECT_FALSE(response.hasDataField("old")) << reply.substr(0, 60);
+    }
+}

@@ -1,0 +1,218 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "ovradrcore/sqlite_db.h"
+#include "support/log_capture.h"
+
+#include <fcntl.h>
+#include <gtest/gtest.h>
+#include <sqlite3.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <fstream>
+#include <thread>
+
+using namespace OvraDRCore;
+
+namespace {
+
+constexpr const char *kPath = "/usr/ovra/test.db";
+const SqliteTableHandler kTable("t", "");
+
+void execute(const std::string &sql) {
+    sqlite3 *db = nullptr;
+    ASSERT_EQ(sqlite3_open(kPath, &db), SQLITE_OK);
+    char *error = nullptr;
+    EXPECT_EQ(sqlite3_exec(db, sql.c_str(), nullptr, nullptr, &error), SQLITE_OK) << error;
+    sqlite3_close(db);
+}
+
+SqliteDB openDb(unsigned int busyTime = 1) {
+    return {kPath, busyTime, "info"};
+}
+
+bool insert(const std::string &id, const SqliteValue &value) {
+    SqliteValueList row;
+    row.AddValue("id", id);
+    row.AddValue("v", value);
+    InsertCommand command;
+    command.SetTable(kTable);
+    command.SetFieldValues(row);
+    return openDb().InsertRecord(command);
+}
+
+std::vector<SqliteValueList> select(const SqliteCondition &condition) {
+    SelectCommand command;
+    command.SetTable(kTable);
+    command.SelectAll();
+    command.SetCondition(condition);
+    std::vector<SqliteValueList> rows;
+    EXPECT_TRUE(openDb().SelectRecords(command, rows));
+    return rows;
+}
+
+class Sqlite : public testing::Test {
+protected:
+    void SetUp() override { execute("CREATE TABLE t (id TEXT, v, session TEXT)"); }
+    LogCapture log;
+};
+
+} // namespace
+
+TEST_F(Sqlite, AnyBytesAreStoredAndMatchedExactly) {
+    const std::vector<std::string> texts = {"plain",
+                                            "",
+                                            "it's",
+                                            "''",
+                                            "a'); DROP TABLE t; --",
+                                            "\"quoted\" %s \\",
+                                            std::string("nul\0inside", 10),
+                                            std::string("nul\0inside'", 11),
+                                            "\xff\xfe not utf-8",
+                                            std::string(3000000, 'x')};
+    for (std::size_t i = 0; i < texts.size(); ++i) {
+        ASSERT_TRUE(insert(std::to_string(i), texts[i])) << i;
+    }
+    for (std::size_t i = 0; i < texts.size(); ++i) {
+        const auto rows = select(SqliteEqual("v", texts[i]));
+        ASSERT_EQ(rows.size(), 1U) << i;
+        std::string read;
+        EXPECT_TRUE(rows[0].GetValue("v", read));
+        EXPECT_TRUE(read == texts[i]) << i;
+        std::string id;
+        EXPECT_TRUE(rows[0].GetValue("id", id));
+        EXPECT_EQ(id, std::to_string(i));
+    }
+}
+
+TEST_F(Sqlite, KindsOfValuesReadBackAsTheyAre) {
+    insert("int", -5);
+    insert("text", "17");
+    execute("INSERT INTO t VALUES ('null', NULL, NULL), ('float', 1.5, NULL), ('wide', 1e12, NULL),"
+            "('big', 9999999999, NULL)");
+    const auto value = [](const char *id) { return select(SqliteEqual("id", id)).at(0); };
+    int number = 99;
+    std::string text = "unset";
+    EXPECT_TRUE(value("int").GetValue("v", number));
+    EXPECT_EQ(number, -5);
+    EXPECT_TRUE(value("int").GetValue("v", text));
+    EXPECT_EQ(text, "-5");
+    EXPECT_FALSE(value("int").GetValue("v").GetValue(text)) << "it does not hold text";
+    EXPECT_TRUE(value("text").GetValue("v", number));
+    EXPECT_EQ(number, 17);
+    number = 99;
+    for (const char *id : {"null", "float", "wide", "big"}) {
+        EXPECT_FALSE(value(id).GetValue("v", number)) << id;
+    }
+    EXPECT_FALSE(value("int").GetValue("absent", number));
+    EXPECT_EQ(number, 99) << "a failed read leaves the target";
+}
+
+TEST_F(Sqlite, OneRecordManyRecordsAndNone) {
+    insert("a", 1);
+    insert("b", 2);
+    SelectCommand all;
+    all.SetTable(kTable);
+    all.AddField("id");
+    std::vector<SqliteValueList> rows(1);
+    EXPECT_TRUE(openDb().SelectRecords(all, rows));
+    EXPECT_EQ(rows.size(), 3U) << "rows are appended";
+    EXPECT_EQ(rows[1].size(), 1U) << "only the columns asked for";
+    SqliteValueList row;
+    EXPECT_TRUE(openDb().SelectRecord(all, row));
+    EXPECT_FALSE(row.empty());
+    all.SetCondition(SqliteEqual("id", "z"));
+    EXPECT_TRUE(openDb().SelectRecord(all, row));
+    EXPECT_TRUE(row.empty()) << "no matching row is success";
+}
+
+TEST_F(Sqlite, UpdateAndDeleteReachWhatTheConditionNames) {
+    insert("a", 1);
+    insert("b", 1);
+    UpdateCommand update;
+    update.SetTable(kTable);
+    update.AddFieldValue("v", 2);
+    update.AddFieldValue("session", "x");
+    update.SetCondition(SqliteAnd(SqliteEqual("id", "a"), SqliteEqual("v", 1)));
+    EXPECT_TRUE(openDb().UpdateRecord(update));
+    EXPECT_EQ(select(SqliteEqual("v", 2)).size(), 1U);
+    EXPECT_TRUE(openDb().UpdateRecord(update)) << "no row changed is success";
+    EXPECT_TRUE(openDb().DeleteRecord(SqliteEqual("id", "a").text, kTable));
+    EXPECT_EQ(select(SqliteEqual("id", "a")).size(), 0U);
+    EXPECT_EQ(select(SqliteEqual("id", "b")).size(), 1U);
+}
+
+TEST_F(Sqlite, AConditionThatSaysNothingNeverMeansEveryRow) {
+    insert("a", 1);
+    SelectCommand unfiltered;
+    unfiltered.SetTable(kTable);
+    unfiltered.SelectAll();
+    unfiltered.SetCondition("");
+    std::vector<SqliteValueList> rows;
+    EXPECT_FALSE(openDb().SelectRecords(unfiltered, rows));
+    UpdateCommand update;
+    update.SetTable(kTable);
+    update.AddFieldValue("v", 9);
+    update.SetCondition(SqliteAnd(SqliteEqual("", "x"), SqliteEqual("id", "a")));
+    EXPECT_FALSE(openDb().UpdateRecord(update));
+    EXPECT_FALSE(openDb().DeleteRecord("", kTable));
+    EXPECT_FALSE(openDb().DeleteRecord("1=1; DELETE FROM t", kTable)) << "one statement only";
+    EXPECT_FALSE(openDb().DeleteRecord("\"idd\" = 'a'", kTable)) << "no such column";
+    EXPECT_EQ(select(SqliteEqual("v", 1)).size(), 1U);
+}
+
+TEST_F(Sqlite, IncompleteStatementsAreRefused) {
+    SelectCommand noField;
+    noField.SetTable(kTable);
+    InsertCommand noTable;
+    noTable.AddFieldValue("id", "a");
+    InsertCommand noValue;
+    noValue.SetTable(kTable);
+    EXPECT_EQ(noField.ToStr() + noTable.ToStr() + noValue.ToStr(), "");
+    EXPECT_FALSE(openDb().InsertRecord(noTable));
+    EXPECT_FALSE(openDb().InsertRecord(noValue));
+}
+
+TEST_F(Sqlite, TheLoggedStatementHidesTheSession) {
+    InsertCommand command;
+    command.SetTable(kTable);
+    command.AddFieldValue("id", "a");
+    command.AddFieldValue("session", "secret");
+    EXPECT_EQ(command.ToStr(), R"(INSERT INTO "t" ("id", "session") VALUES ('a', 'secret'))");
+    EXPECT_EQ(command.ToLogStr(), R"(INSERT INTO "t" ("id", "session") VALUES ('a', '***'))");
+}
+
+TEST_F(Sqlite, WaitsForALockOfAnotherAndFailsWhenItStays) {
+    sqlite3 *other = nullptr;
+    ASSERT_EQ(sqlite3_open(kPath, &other), SQLITE_OK);
+    ASSERT_EQ(sqlite3_exec(other, "BEGIN EXCLUSIVE", nullptr, nullptr, nullptr), SQLITE_OK);
+    EXPECT_FALSE(insert("a", 1));
+    EXPECT_EQ(log.count("database is locked"), 1);
+    std::thread release([&] {
+        std::this_thread::sleep_for(std::chrono::milliseconds(300));
+        sqlite3_exec(other, "COMMIT", nullptr, nullptr, nullptr);
+    });
+    EXPECT_TRUE(insert("a", 1));
+    release.join();
+    sqlite3_close(other);
+}
+
+TEST_F(Sqlite, AFileThatIsNotWhatItShouldBeFailsClearlyAndIsLeftAlone) {
+    insert("a", 1);
+    unlink(kPath);
+    EXPECT_FALSE(insert("b", 1));
+    EXPECT_NE(access(kPath, F_OK), 0) << "an absent file is not made";
+    std::ofstream(kPath).close();
+    EXPECT_FALSE(insert("b", 1)) << "an empty file has no table";
+    std::ofstream(kPath) << std::string(10000, '?');
+    EXPECT_FALSE(insert("b", 1));
+    EXPECT_EQ(log.count("file is not a database"), 1);
+    struct stat status {};
+    stat(kPath, &status);
+    EXPECT_EQ(status.st_size, 10000);
+}
+
+TEST_F(Sqlite, TheSchemaVersionIsThatOfProvisioning) {
+    EXPECT_EQ(openDb().GetSchemaVersion(), -1);
+    execute("CREATE TABLE info (version INTEGER); INSERT INTO info VALUES (3)");
+    EXPECT_EQ(openDb().GetSchemaVersion(), 3);
+}

@@ -1,0 +1,88 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "ovradrcore/file_lock.h"
+#include "ovradrcore/util.h"
+
+#include <gtest/gtest.h>
+#include <sys/file.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <chrono>
+#include <climits>
+#include <regex>
+#include <set>
+
+using namespace OvraDRCore;
+
+TEST(Util, UuidsAreVersionFourAndDiffer) {
+    const std::regex form("[0-9a-f]{8}-[0-9a-f]{4}-4[0-9a-f]{3}-[89ab][0-9a-f]{3}-[0-9a-f]{12}");
+    std::set<std::string> seen;
+    for (int i = 0; i < 1000; ++i) {
+        const std::string id = GenerateUUID();
+        EXPECT_TRUE(std::regex_match(id, form)) << id;
+        EXPECT_TRUE(seen.insert(id).second);
+    }
+}
+
+TEST(Util, SmallestIntHasElevenCharacters) {
+    EXPECT_EQ(ToString<int>(INT_MIN), "-2147483648");
+}
+
+TEST(Util, CreateDirMakesWhatIsMissingWithTheModeWhateverTheUmask) {
+    umask(077);
+    EXPECT_TRUE(File::CreateDir("/usr/ovra/a/b/", 0755));
+    struct stat status {};
+    ASSERT_EQ(stat("/usr/ovra/a/b", &status), 0);
+    EXPECT_EQ(status.st_mode & 07777U, 0755U);
+    EXPECT_TRUE(File::CreateDir("/usr/ovra/a", 0700));
+    ASSERT_EQ(stat("/usr/ovra/a", &status), 0);
+    EXPECT_EQ(status.st_mode & 07777U, 0755U) << "one that exists keeps its mode";
+    close(creat("/usr/ovra/file", 0600));
+    EXPECT_FALSE(File::CreateDir("/usr/ovra/file/x", 0755));
+    EXPECT_FALSE(File::CreateDir("/usr/ovra/file", 0755));
+}
+
+TEST(FileLock, IsOnePerNameForAllProcesses) {
+    FileLock shared("a.lock");
+    FileLock alsoShared("/run/lock/a.lock");
+    EXPECT_TRUE(shared.lock(LOCK_SH | LOCK_NB, 0));
+    EXPECT_TRUE(alsoShared.lock(LOCK_SH | LOCK_NB, 0));
+    FileLock exclusive("a.lock");
+    EXPECT_FALSE(exclusive.lock(LOCK_EX | LOCK_NB, 0));
+    shared.unlock();
+    alsoShared.unlock();
+    EXPECT_TRUE(exclusive.lock(LOCK_EX | LOCK_NB, 0));
+}
+
+TEST(FileLock, GivesUpAfterTheWaitAndGoesWithItsProcess) {
+    int ready[2];
+    ASSERT_EQ(pipe(ready), 0);
+    const pid_t child = fork();
+    if (child == 0) {
+        FileLock held("b.lock");
+        const char ok = held.lock(LOCK_EX | LOCK_NB, 0) ? 'y' : 'n';
+        (void)!write(ready[1], &ok, 1);
+        pause();
+        _exit(0);
+    }
+    char ok = 0;
+    ASSERT_EQ(read(ready[0], &ok, 1), 1);
+    ASSERT_EQ(ok, 'y');
+    FileLock lock("b.lock");
+    const auto start = std::chrono::steady_clock::now();
+    EXPECT_FALSE(lock.lock(LOCK_SH | LOCK_NB, 1));
+    const std::chrono::duration<double> waited = std::chrono::steady_clock::now() - start;
+    EXPECT_GE(waited.count(), 1.0);
+    EXPECT_LT(waited.count(), 2.0);
+    kill(child, SIGKILL);
+    waitpid(child, nullptr, 0);
+    EXPECT_TRUE(lock.lock(LOCK_SH | LOCK_NB, 0));
+}
+
+TEST(FileLock, DoesNotFollowASymbolicLink) {
+    ASSERT_EQ(symlink("/usr/ovra/target", "/run/lock/c.lock"), 0);
+    FileLock lock("c.lock");
+    EXPECT_FALSE(lock.lock(LOCK_EX | LOCK_NB, 0));
+    EXPECT_NE(access("/usr/ovra/target", F_OK), 0) << "nothing was made through the link";
+}
