@@ -27,9 +27,11 @@ OVRADRCORE_EXPORT void logMessage(LogLevel level, const char *file, int line, co
 #define OVRA_LOG_FILE __FILE__
 #endif
 
-/// The usual ways to log: level, place and function name are those of the calling line.
-#define OVRA_LOG(level, ...)                                                                       \
-    ::OvraDRCore::logMessage((level), OVRA_LOG_FILE, __LINE__, __func__, __VA_ARGS__)
+/// Logs under a function name of its own: for steps that belong to an operation of another name.
+#define OVRA_LOG_IN(level, function, ...)                                                          \
+    ::OvraDRCore::logMessage((level), OVRA_LOG_FILE, __LINE__, (function), __VA_ARGS__)
+/// The usual ways to log: the function name is that of the calling line.
+#define OVRA_LOG(level, ...) OVRA_LOG_IN((level), __func__, __VA_ARGS__)
 #define OVRA_ERR(...) OVRA_LOG(::OvraDRCore::LogLevel::kErr, __VA_ARGS__)
 #define OVRA_WARN(...) OVRA_LOG(::OvraDRCore::LogLevel::kWarn, __VA_ARGS__)
 #define OVRA_NOTICE(...) OVRA_LOG(::OvraDRCore::LogLevel::kNotice, __VA_ARGS__)

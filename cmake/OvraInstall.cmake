@@ -1,0 +1,30 @@
+# What `cmake --install` puts where, and the packages by which other projects find it.
+include(CMakePackageConfigHelpers)
+
+set(ovra_installed ovradrcore ovradrnode)
+if(TARGET ovradrplatform AND OVRADRNODE_PLATFORM STREQUAL "linux")
+  list(APPEND ovra_installed ovradrplatform)
+endif()
+install(TARGETS ${ovra_installed} EXPORT OvraDRNodeTargets
+  LIBRARY DESTINATION "${CMAKE_INSTALL_LIBDIR}")
+install(DIRECTORY include/ovradrnode core/include/ovradrcore
+  DESTINATION "${CMAKE_INSTALL_INCLUDEDIR}" FILES_MATCHING PATTERN "*.h")
+
+set(ovra_cmake_dir "${CMAKE_INSTALL_LIBDIR}/cmake/OvraDRNode")
+install(EXPORT OvraDRNodeTargets NAMESPACE OvraDRNode:: DESTINATION "${ovra_cmake_dir}")
+configure_package_config_file(cmake/OvraDRNodeConfig.cmake.in
+  "${PROJECT_BINARY_DIR}/OvraDRNodeConfig.cmake" INSTALL_DESTINATION "${ovra_cmake_dir}")
+write_basic_package_version_file("${PROJECT_BINARY_DIR}/OvraDRNodeConfigVersion.cmake"
+  COMPATIBILITY SameMajorVersion)
+install(FILES "${PROJECT_BINARY_DIR}/OvraDRNodeConfig.cmake"
+              "${PROJECT_BINARY_DIR}/OvraDRNodeConfigVersion.cmake"
+  DESTINATION "${ovra_cmake_dir}")
+
+# The packages say where they are by where they lie, so an installed tree can be moved.
+file(RELATIVE_PATH ovra_pc_to_prefix
+  "/prefix/${CMAKE_INSTALL_LIBDIR}/pkgconfig" "/prefix")
+foreach(package ovradrcore ovradrnode)
+  configure_file("cmake/${package}.pc.in" "${PROJECT_BINARY_DIR}/${package}.pc" @ONLY)
+  install(FILES "${PROJECT_BINARY_DIR}/${package}.pc"
+    DESTINATION "${CMAKE_INSTALL_LIBDIR}/pkgconfig")
+endforeach()

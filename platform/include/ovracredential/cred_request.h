@@ -1,0 +1,112 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+// Credential request library: authenticated web-API requests to a remote appliance.
+
+#include <json/value.h>
+
+#include <memory>
+#include <string>
+
+/// A credential: endpoint, account and password. Opaque.
+struct _tag_ovra_cred_;
+/// What a login granted: the access token (session id). Opaque.
+struct _tag_ovra_cred_sess_;
+using OVRACred = _tag_ovra_cred_;
+using OVRACredSess = _tag_ovra_cred_sess_;
+
+#define OVRA_PLATFORM_EXPORT __attribute__((visibility("default")))
+
+extern "C" {
+/// A new empty object, owned by the caller; null when there is no memory. Free accepts null.
+OVRA_PLATFORM_EXPORT OVRACred *OVRACredAlloc(void);
+OVRA_PLATFORM_EXPORT void OVRACredFree(OVRACred *cred);
+OVRA_PLATFORM_EXPORT OVRACredSess *OVRACredSessAlloc(void);
+OVRA_PLATFORM_EXPORT void OVRACredSessFree(OVRACredSess *sess);
+
+// Items: 0 when the item was taken, otherwise it is refused and the object is unchanged.
+OVRA_PLATFORM_EXPORT int OVRACredItemSetProtocol(OVRACred *cred, const char *protocol);
+OVRA_PLATFORM_EXPORT int OVRACredItemSetHost(OVRACred *cred, const char *host);
+OVRA_PLATFORM_EXPORT int OVRACredItemSetPort(OVRACred *cred, int port);
+OVRA_PLATFORM_EXPORT int OVRACredItemSetRemoteAccount(OVRACred *cred, const char *account);
+OVRA_PLATFORM_EXPORT int OVRACredItemSetRemotePasswd(OVRACred *cred, const char *passwd);
+OVRA_PLATFORM_EXPORT int OVRACredSessItemSetAccessToken(OVRACredSess *sess, const char *token);
+}
+
+namespace OVRA {
+
+/// One request. Operations that return int return non-zero on success; GetError() tells why not.
+/// Nothing throws. An object is for one thread at a time; any number of objects work at once.
+class OVRA_PLATFORM_EXPORT CredRequest {
+public:
+    CredRequest();
+    ~CredRequest();
+    CredRequest(const CredRequest &) = delete;
+    CredRequest &operator=(const CredRequest &) = delete;
+
+    /// \param protocol  "http" or "https"
+    /// \param address   a host name in ASCII, an IPv4 or an IPv6 address
+    /// \param path      relative to the root of the host: letters, digits and "-._/"
+    int SetURL(const std::string &protocol, const std::string &address, int port,
+               const std::string &path);
+    /// \param seconds  bound on the whole exchange, connecting included; 1 to 86,400. 60 unless set
+    int SetDefaultTimeout(long seconds);
+    /// \param seconds  bound on the whole exchange for this request; replaces the default
+    int SetResponseTimeout(long seconds);
+    /// Mode 2 seals parameters and session to the receiving appliance; 0 does so over http only,
+    /// and leaves it to TLS over https.
+    int SetEncryptMode(int mode);
+    /// A regular file to send along, read when the request is sent; over https only.
+    /// \param name  the name under which it is sent
+    int SetUploadFile(const std::string &path, const std::string &name);
+    /// Makes `req` the call of `api` to the credential's endpoint under the session.
+    /// \param sess    may be null or hold no token: a call without a session
+    /// \param params  an object or null; both are copied
+    static int CreateWebAPIRequest(CredRequest &req, OVRACred *cred, OVRACredSess *sess,
+                                   const std::string &api, int version, const std::string &method,
+                                   const Json::Value &params);
+    /// Sends and waits for the answer. A certificate that the system's store does not accept is
+    /// trusted on first use and must have the same key ever after (docs/wire.md).
+    /// \param reuse  a kept idle connection may carry it
+    /// \param mode   0: a request, the certificate is judged; 2: a probe, any answer of the entry
+    ///               point with an HTTP status below 500 other than 404 counts, the certificate
+    ///               is not judged, no secret is sent
+    int Process(bool reuse, int mode);
+    /// The document that the last request was answered with, opened when it came sealed; "" when it
+    /// got none.
+    std::string GetResponse() const;
+    /// The library's error number; 0 when there was none. 4: not permitted (HTTP 401, 403), 5:
+    /// cannot connect, 6: the endpoint's key is not the one trusted for it, 10: timed out.
+    int GetError() const;
+
+private:
+    struct Impl;
+    std::unique_ptr<Impl> impl_;
+};
+
+class OVRA_PLATFORM_EXPORT CredRequestUtil {
+public:
+    /// Logs in with the credential's account and password.
+    /// \param otp   one-time code, or ""
+    /// \param sess  takes the granted access token
+    /// \param out   receives the response document, also when the login was refused; when the call
+    ///              did not go through, one with error 100 and the message {"cred_error", "text"}
+    /// \return non-zero when the call went through, whatever the answer says.
+    /// Waits 60 seconds at most.
+    static int LoginWithOTP(OVRACred *cred, const std::string &otp, OVRACredSess *sess,
+                            Json::Value *out);
+    /// Ends the session that LoginWithOTP() got; the token is gone afterwards in any case. Waits 5
+    /// seconds at most. \return non-zero when the remote confirmed it.
+    static int Logout(OVRACred *cred, OVRACredSess *sess);
+};
+
+class OVRA_PLATFORM_EXPORT CredRequestFarlink {
+public:
+    /// Asks the relay service where `alias` is reached now.
+    /// \param info     receives an object with "host", "protocol" and "port"
+    /// \param options  reserved, null
+    /// \return non-zero on success.
+    static int GetConnInfo(const std::string &alias, Json::Value &info, const void *options);
+};
+
+} // namespace OVRA

@@ -1,0 +1,44 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "credential/cred_errors.h"
+
+namespace OvraPlatform {
+
+const char *credErrorText(int error) {
+    switch (static_cast<CredError>(error)) {
+    case CredError::kNone:
+        return "no error";
+    case CredError::kBadArgument:
+        return "the endpoint or the call is not valid: check protocol, host and port";
+    case CredError::kOutOfMemory:
+        return "out of memory or descriptors";
+    case CredError::kInternal:
+        return "the request failed: the system log says why";
+    case CredError::kNoPermission:
+        return "the endpoint does not permit the request";
+    case CredError::kCannotConnect:
+        return "cannot connect: check name, address and port, and that the appliance runs";
+    case CredError::kCertificateChanged:
+        return "the endpoint's key is not the one trusted for it: find out why it changed, then "
+               "forget the old one";
+    case CredError::kReplyTooLarge:
+        return "the reply is too large";
+    case CredError::kReplyBroken:
+        return "the reply is not one of a web API: check that the port is the appliance's";
+    case CredError::kConnectionLost:
+        return "the connection ended before the reply was complete: check whether the request was "
+               "carried out";
+    case CredError::kTimedOut:
+        return "no answer in time";
+    case CredError::kHttpStatus:
+        return "the endpoint answered with an HTTP error: check that the port is the appliance's";
+    case CredError::kUploadUnreadable:
+        return "the file cannot be sent: it must be a readable file, and go over https";
+    case CredError::kSealFailed:
+        return "the request could not be sealed: check that the endpoint is an appliance's";
+    case CredError::kTrustUnavailable:
+        return "the file of trusted keys cannot be read or written: the system log says why";
+    }
+    return "unknown error";
+}
+
+} // namespace OvraPlatform

@@ -1,0 +1,133 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "credential/cred_objects.h"
+#include "credential/web_call.h"
+#include "webapi/api_errors.h"
+
+#include <ovradrcore/json.h>
+#include <ovradrcore/log.h>
+#include <ovradrcore/response.h>
+
+#include <chrono>
+#include <exception>
+#include <string>
+#include <utility>
+
+namespace OVRA {
+
+using OvraPlatform::CredError;
+using OvraPlatform::WebReply;
+using OvraPlatform::WireCall;
+
+namespace {
+
+constexpr char kAuthApi[] = "OVRA.Core.Auth";
+/// The remote may slow a log-in down by some seconds, and hashes the password.
+constexpr std::chrono::seconds kLoginTime{60};
+constexpr std::chrono::seconds kLogoutTime{5};
+
+WireCall authCall(const char *method) {
+    WireCall call;
+    call.api = kAuthApi;
+    call.version = 1;
+    call.method = method;
+    return call;
+}
+
+/// The document that stands for an answer when there was none.
+Json::Value noAnswer(CredError error) {
+    Json::Value message(Json::objectValue);
+    message["cred_error"] = static_cast<int>(error);
+    message["text"] = OvraPlatform::credErrorText(static_cast<int>(error));
+    return OvraPlatform::apiError(OvraPlatform::APIError::kInternal, message);
+}
+
+CredError login(const OVRACred &cred, const std::string &otp, OVRACredSess &sess,
+                Json::Value &out) {
+    const auto endpoint = cred.endpoint();
+    if (!endpoint || cred.account.empty() || cred.passwd.empty()) {
+        return CredError::kBadArgument;
+    }
+    WireCall call = authCall("login");
+    call.params["account"] = cred.account;
+    call.params["passwd"] = cred.passwd.get();
+    if (!otp.empty()) {
+        call.params["otp_code"] = otp;
+    }
+    const WebReply reply =
+        OvraPlatform::callWebAPI(*endpoint, call, {std::chrono::steady_clock::now() + kLoginTime});
+    if (reply.error != CredError::kNone) {
+        return reply.error;
+    }
+    Json::Value document;
+    OvraDRCore::fromString(document, reply.document);
+    const OvraDRCore::Response response(document);
+    const std::string sid = response.getDataFieldtoStr("sid");
+    if (response.isSuccess() &&
+        (sid.empty() || OVRACredSessItemSetAccessToken(&sess, sid.c_str()) != 0)) {
+        return CredError::kReplyBroken;
+    }
+    out = std::move(document);
+    return CredError::kNone;
+}
+
+CredError logout(const OVRACred &cred, const OVRACredSess &sess, bool &confirmed) {
+    const auto endpoint = cred.endpoint();
+    if (!endpoint) {
+        return CredError::kBadArgument;
+    }
+    WireCall call = authCall("logout");
+    call.sid = sess.token.get();
+    const WebReply reply =
+        OvraPlatform::callWebAPI(*endpoint, call, {std::chrono::steady_clock::now() + kLogoutTime});
+    OvraDRCore::Response response;
+    response.setResp(reply.document);
+    confirmed = response.isSuccess();
+    return reply.error;
+}
+
+} // namespace
+
+int CredRequestUtil::LoginWithOTP(OVRACred *cred, const std::string &otp, OVRACredSess *sess,
+                                  Json::Value *out) {
+    if (cred == nullptr || sess == nullptr || out == nullptr) {
+        return 0;
+    }
+    CredError error = CredError::kInternal;
+    try {
+        error = login(*cred, otp, *sess, *out);
+        if (error != CredError::kNone) {
+            *out = noAnswer(error);
+        }
+    } catch (const std::exception &failure) {
+        OVRA_ERR("A log-in failed: [%s]", failure.what());
+        return 0;
+    }
+    return error == CredError::kNone ? 1 : 0;
+}
+
+int CredRequestUtil::Logout(OVRACred *cred, OVRACredSess *sess) {
+    if (cred == nullptr || sess == nullptr || sess->token.empty()) {
+        return 0;
+    }
+    bool confirmed = false;
+    try {
+        if (const CredError error = logout(*cred, *sess, confirmed); error != CredError::kNone) {
+            OVRA_NOTICE("A session could not be ended, it expires by itself: [%s]",
+                        OvraPlatform::credErrorText(static_cast<int>(error)));
+        }
+    } catch (const std::exception &failure) {
+        OVRA_ERR("A log-out failed: [%s]", failure.what());
+    }
+    sess->token = OvraPlatform::SecretText();
+    return confirmed ? 1 : 0;
+}
+
+int CredRequestFarlink::GetConnInfo(const std::string &alias, Json::Value &info, const void *) {
+    OVRA_NOTICE("The relay service is not set up on this appliance: [%s] cannot be looked up, use "
+                "a direct endpoint",
+                alias.c_str());
+    info = Json::Value();
+    return 0;
+}
+
+} // namespace OVRA

@@ -1,0 +1,185 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "ovracredential/cred_request.h"
+
+#include "credential/cred_objects.h"
+#include "credential/web_call.h"
+
+#include <ovradrcore/log.h>
+
+#include <chrono>
+#include <exception>
+#include <optional>
+#include <utility>
+
+namespace OVRA {
+
+using OvraPlatform::CredError;
+using OvraPlatform::Endpoint;
+using OvraPlatform::WebReply;
+using OvraPlatform::WireCall;
+
+namespace {
+
+constexpr long kDefaultSeconds = 60;
+constexpr long kMostSeconds = 24L * 60 * 60;
+constexpr int kModeRequest = 0;
+constexpr int kModeProbe = 2;
+constexpr int kPlain = 0;
+constexpr int kSealed = 2;
+
+} // namespace
+
+struct CredRequest::Impl {
+    std::optional<Endpoint> endpoint;
+    std::string url;
+    std::optional<WireCall> call;
+    long seconds = kDefaultSeconds;
+    int encryptMode = kPlain;
+    std::optional<OvraPlatform::Upload> upload;
+    std::string response;
+    CredError error = CredError::kNone;
+
+    ~Impl() { forgetCall(); }
+
+    void forgetCall() {
+        if (call) {
+            sodium_memzero(call->sid.data(), call->sid.size());
+        }
+        call.reset();
+    }
+
+    /// Notes why an operation failed. \return 0, what the operation returns then
+    int refuse(CredError why) {
+        error = why;
+        return 0;
+    }
+
+    int setTimeout(long wanted) {
+        if (wanted < 1 || wanted > kMostSeconds) {
+            return refuse(CredError::kBadArgument);
+        }
+        seconds = wanted;
+        return 1;
+    }
+
+    OvraPlatform::Deadline deadline() const {
+        return std::chrono::steady_clock::now() + std::chrono::seconds(seconds);
+    }
+
+    CredError send(bool reuse) {
+        if (!endpoint || !call) {
+            return CredError::kBadArgument;
+        }
+        WebReply reply = OvraPlatform::callWebAPI(
+            *endpoint, *call, {deadline(), reuse, encryptMode == kSealed, upload});
+        response = std::move(reply.document);
+        return reply.error;
+    }
+
+    CredError process(bool reuse, int mode) {
+        switch (mode) {
+        case kModeRequest:
+            return send(reuse);
+        case kModeProbe:
+            return endpoint ? OvraPlatform::probe(*endpoint, url, deadline())
+                            : CredError::kBadArgument;
+        default:
+            return CredError::kBadArgument;
+        }
+    }
+};
+
+CredRequest::CredRequest()
+    : impl_(std::make_unique<Impl>()) {}
+
+CredRequest::~CredRequest() = default;
+
+int CredRequest::SetURL(const std::string &protocol, const std::string &address, int port,
+                        const std::string &path) {
+    try {
+        auto endpoint = Endpoint::make(protocol, address, port);
+        auto url = endpoint ? endpoint->url(path) : std::nullopt;
+        if (!url) {
+            return impl_->refuse(CredError::kBadArgument);
+        }
+        impl_->endpoint = std::move(endpoint);
+        impl_->url = std::move(*url);
+        return 1;
+    } catch (const std::exception &) {
+        return impl_->refuse(CredError::kOutOfMemory);
+    }
+}
+
+int CredRequest::SetDefaultTimeout(long seconds) {
+    return impl_->setTimeout(seconds);
+}
+
+int CredRequest::SetResponseTimeout(long seconds) {
+    return impl_->setTimeout(seconds);
+}
+
+int CredRequest::SetEncryptMode(int mode) {
+    if (mode != kPlain && mode != kSealed) {
+        return impl_->refuse(CredError::kBadArgument);
+    }
+    impl_->encryptMode = mode;
+    return 1;
+}
+
+int CredRequest::SetUploadFile(const std::string &path, const std::string &name) {
+    if (path.empty() || name.empty()) {
+        return impl_->refuse(CredError::kBadArgument);
+    }
+    try {
+        impl_->upload = OvraPlatform::Upload{path, name};
+        return 1;
+    } catch (const std::exception &) {
+        return impl_->refuse(CredError::kOutOfMemory);
+    }
+}
+
+int CredRequest::CreateWebAPIRequest(CredRequest &req, OVRACred *cred, OVRACredSess *sess,
+                                     const std::string &api, int version, const std::string &method,
+                                     const Json::Value &params) {
+    const bool callable = cred != nullptr && !api.empty() && version > 0 && !method.empty() &&
+                          (params.isNull() || params.isObject());
+    if (!callable ||
+        req.SetURL(cred->protocol, cred->host, cred->port, OvraPlatform::kEntryPoint) == 0) {
+        return req.impl_->refuse(CredError::kBadArgument);
+    }
+    try {
+        req.impl_->forgetCall();
+        WireCall &call = req.impl_->call.emplace();
+        call.api = api;
+        call.version = version;
+        call.method = method;
+        call.params = params;
+        if (sess != nullptr) {
+            call.sid = sess->token.get();
+        }
+        return 1;
+    } catch (const std::exception &) {
+        return req.impl_->refuse(CredError::kOutOfMemory);
+    }
+}
+
+int CredRequest::Process(bool reuse, int mode) {
+    impl_->response.clear();
+    try {
+        impl_->error = impl_->process(reuse, mode);
+    } catch (const std::exception &error) {
+        OVRA_ERR("A request failed: [%s]", error.what());
+        impl_->error = CredError::kOutOfMemory;
+    }
+    return impl_->error == CredError::kNone ? 1 : 0;
+}
+
+std::string CredRequest::GetResponse() const {
+    return impl_->response;
+}
+
+int CredRequest::GetError() const {
+    return static_cast<int>(impl_->error);
+}
+
+} // namespace OVRA

@@ -1,0 +1,42 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include <optional>
+#include <string>
+
+namespace OvraPlatform {
+
+/// The path of the web-API entry point.
+inline constexpr char kEntryPoint[] = "webapi/query.cgi";
+
+/// Where a request goes: a checked protocol, host and port.
+class Endpoint {
+public:
+    /// \param protocol  "http" or "https"
+    /// \param host      a host name in ASCII (letters, digits, '-', '.', '_'), an IPv4 address, or
+    /// an
+    ///                  IPv6 address with or without brackets
+    /// \param port      1 to 65535
+    /// \return nothing when one of them is something else.
+    static std::optional<Endpoint> make(const std::string &protocol, const std::string &host,
+                                        int port);
+
+    bool isTls() const { return protocol_ == "https"; }
+    /// The host, in lower case, without brackets.
+    const std::string &host() const { return host_; }
+    bool isIpv6() const { return host_.find(':') != std::string::npos; }
+    /// "https://host:5001": the same text for the same endpoint.
+    std::string key() const;
+    /// \param path  relative to the root; nothing when a character in it would not be part of a
+    /// path
+    std::optional<std::string> url(const std::string &path) const;
+
+private:
+    Endpoint() = default;
+
+    std::string protocol_;
+    std::string host_;
+    int port_ = 0;
+};
+
+} // namespace OvraPlatform

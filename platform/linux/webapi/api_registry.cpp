@@ -1,0 +1,115 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "webapi/api_registry.h"
+
+#include "webapi/api_errors.h"
+
+#include <ovradrcore/log.h>
+
+#include <atomic>
+#include <exception>
+#include <utility>
+
+namespace OvraPlatform {
+
+namespace {
+
+std::atomic<const APIRegistry *> hostedRegistry{nullptr};
+
+bool isReplyDocument(const Json::Value &reply) {
+    return reply.isObject() && reply["success"].isBool();
+}
+
+Json::Value runHandler(const APIHandler &handler, const APICall &call, const APICaller &caller) {
+    try {
+        static const Json::Value kNoParams(Json::objectValue);
+        Json::Value reply = handler(call.params.isNull() ? kNoParams : call.params, caller);
+        if (isReplyDocument(reply)) {
+            return reply;
+        }
+        OVRA_ERR("The handler of [%s] method [%s] returned no reply document", call.api.c_str(),
+                 call.method.c_str());
+    } catch (const std::exception &error) {
+        OVRA_ERR("The handler of [%s] method [%s] failed: [%s]", call.api.c_str(),
+                 call.method.c_str(), error.what());
+    } catch (...) {
+        OVRA_ERR("The handler of [%s] method [%s] failed", call.api.c_str(), call.method.c_str());
+    }
+    return apiError(APIError::kInternal, "the call failed on the appliance: see its log");
+}
+
+const char *refusalText(int code) {
+    switch (code) {
+    case APIError::kNoSuchAPI:
+        return "the appliance has no such API: check the name, or update the appliance";
+    case APIError::kNoSuchMethod:
+        return "the API has no such method: check the name, or update the appliance";
+    default:
+        return "the method has no such version: check the number, or update the appliance";
+    }
+}
+
+} // namespace
+
+APIRegistry::~APIRegistry() {
+    const APIRegistry *self = this;
+    hostedRegistry.compare_exchange_strong(self, nullptr);
+}
+
+void APIRegistry::add(const std::string &api, int version, const std::string &method,
+                      APIRight right, APILane lane, APIHandler handler) {
+    apis_[api][method].insert_or_assign(version, Entry{right, lane, std::move(handler)});
+}
+
+const APIRegistry::Entry *APIRegistry::find(const APICall &call, int &error) const {
+    const auto methods = apis_.find(call.api);
+    if (methods == apis_.end()) {
+        error = APIError::kNoSuchAPI;
+        return nullptr;
+    }
+    const auto versions = methods->second.find(call.method);
+    if (versions == methods->second.end()) {
+        error = APIError::kNoSuchMethod;
+        return nullptr;
+    }
+    const auto entry = versions->second.find(call.version);
+    if (entry == versions->second.end()) {
+        error = APIError::kNoSuchVersion;
+        return nullptr;
+    }
+    return &entry->second;
+}
+
+APILane APIRegistry::lane(const APICall &call) const {
+    int error = 0;
+    const Entry *entry = find(call, error);
+    return entry == nullptr ? APILane::kQuick : entry->lane;
+}
+
+Json::Value APIRegistry::dispatch(const APICall &call, const APICaller &caller) const {
+    int error = 0;
+    const Entry *entry = find(call, error);
+    if (entry == nullptr) {
+        return apiError(error, refusalText(error));
+    }
+    if (entry->right != APIRight::kNone && caller.user.empty()) {
+        return apiError(APIError::kNoSession, "the session is unknown or expired: log in again");
+    }
+    if (entry->right == APIRight::kAdministrator && !caller.administrator) {
+        return apiError(APIError::kNoPermission,
+                        "the call needs an administrator: use an administrator's account");
+    }
+    if (!call.params.isNull() && !call.params.isObject()) {
+        return apiError(APIError::kBadRequest, "the parameters are not an object");
+    }
+    return runHandler(entry->handler, call, caller);
+}
+
+void APIRegistry::host() {
+    hostedRegistry = this;
+}
+
+const APIRegistry *APIRegistry::hosted() {
+    return hostedRegistry;
+}
+
+} // namespace OvraPlatform

@@ -1,0 +1,235 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "webapi/local_server.h"
+
+#include "core/appliance.h"
+#include "core/file_update.h"
+#include "core/unique_fd.h"
+#include "webapi/api_errors.h"
+#include "webapi/local_address.h"
+
+#include <ovradrcore/file_lock.h>
+#include <ovradrcore/json.h>
+#include <ovradrcore/log.h>
+
+#include <poll.h>
+#include <sys/eventfd.h>
+#include <sys/file.h>
+#include <sys/socket.h>
+#include <sys/stat.h>
+#include <sys/un.h>
+#include <unistd.h>
+
+#include <array>
+#include <cerrno>
+#include <chrono>
+#include <cstdint>
+#include <exception>
+#include <optional>
+#include <system_error>
+#include <thread>
+#include <utility>
+#include <vector>
+
+namespace OvraPlatform {
+
+namespace {
+
+constexpr std::chrono::seconds kReadTime{10};
+constexpr std::chrono::seconds kWriteTime{10};
+constexpr std::chrono::milliseconds kPauseWithoutDescriptors{50};
+constexpr int kQueue = 128;
+
+std::string folderOf(const std::string &path) {
+    const std::size_t slash = path.find_last_of('/');
+    return slash == std::string::npos ? "." : path.substr(0, slash);
+}
+
+/// Removes a socket file that nobody serves any more.
+/// \return false, with the reason, when the place is taken by something else.
+bool clearPlace(const std::string &path, const sockaddr_un &address, std::string &why) {
+    struct stat status {};
+    if (lstat(path.c_str(), &status) != 0) {
+        return true;
+    }
+    if (!S_ISSOCK(status.st_mode)) {
+        why = path + " is not a socket: move it away";
+        return false;
+    }
+    const UniqueFd probe(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
+    const bool answered = probe && (connectLocal(probe.get(), address) || errno != ECONNREFUSED);
+    if (answered) {
+        why = "another process already answers on " + path + ": stop it first";
+        return false;
+    }
+    if (unlink(path.c_str()) != 0) {
+        why = "cannot remove the old socket " + path + ": " + errnoText(errno);
+        return false;
+    }
+    return true;
+}
+
+} // namespace
+
+struct LocalServer::Impl {
+    Impl(std::string socketPath, LocalHandler callHandler, unsigned int count)
+        : path(std::move(socketPath))
+        , handler(std::move(callHandler))
+        , threadCount(count)
+        , lock(path + ".lock") {}
+
+    bool listenOn(std::string &why);
+    void serveConnections();
+    void serve(int peer);
+    Json::Value answer(const std::string &request);
+
+    const std::string path;
+    const LocalHandler handler;
+    const unsigned int threadCount;
+    OvraDRCore::FileLock lock;
+    UniqueFd listener;
+    UniqueFd stopEvent;
+    std::vector<std::thread> threads;
+};
+
+bool LocalServer::Impl::listenOn(std::string &why) {
+    const std::optional<sockaddr_un> address = localAddress(path);
+    if (!address) {
+        why = "the path " + path + " is too long for a socket: use a shorter folder";
+        return false;
+    }
+    if (!ensureStateDir(folderOf(path))) {
+        why = "the folder of " + path + " cannot be used: the log says why";
+        return false;
+    }
+    // Held as long as the server lives, so that two that start at once cannot take the place of
+    // each other.
+    if (!lock.lock(LOCK_EX | LOCK_NB, 0)) {
+        why = "another process holds " + path + ".lock: stop the daemon that runs already";
+        return false;
+    }
+    if (!clearPlace(path, *address, why)) {
+        return false;
+    }
+    UniqueFd fd(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
+    // The mode that the file gets from bind(2) is the socket's own, so that it is never open wider.
+    if (!fd || fchmod(fd.get(), 0600) != 0 || !bindLocal(fd.get(), *address) ||
+        listen(fd.get(), kQueue) != 0) {
+        why = "cannot listen on " + path + ": " + errnoText(errno);
+        return false;
+    }
+    listener = std::move(fd);
+    return true;
+}
+
+void LocalServer::Impl::serveConnections() {
+    for (;;) {
+        std::array<pollfd, 2> fds{{{listener.get(), POLLIN, 0}, {stopEvent.get(), POLLIN, 0}}};
+        if (poll(fds.data(), fds.size(), -1) < 0) {
+            continue; // EINTR
+        }
+        if (fds[1].revents != 0) {
+            return;
+        }
+        const UniqueFd peer(
+            accept4(listener.get(), nullptr, nullptr, SOCK_CLOEXEC | SOCK_NONBLOCK));
+        if (peer) {
+            serve(peer.get());
+        } else if (errno == EMFILE || errno == ENFILE || errno == ENOMEM || errno == ENOBUFS) {
+            std::this_thread::sleep_for(kPauseWithoutDescriptors);
+        }
+    }
+}
+
+void LocalServer::Impl::serve(int peer) {
+    try {
+        const auto now = std::chrono::steady_clock::now();
+        std::string reply;
+        if (isPeerTrusted(peer)) {
+            const std::optional<std::string> request =
+                receiveFrame(peer, now + kReadTime, stopEvent.get());
+            if (!request) {
+                return;
+            }
+            reply = OvraDRCore::toString(answer(*request));
+        } else {
+            OVRA_WARN("A process of another user was refused on [%s]", path.c_str());
+            reply = OvraDRCore::toString(apiError(
+                APIError::kNoPermission, "only root and the daemon's own user may call: use root"));
+        }
+        if (reply.size() > kMaxFrame) {
+            reply = OvraDRCore::toString(
+                apiError(APIError::kTooLarge, "the reply is too large: ask for less at once"));
+        }
+        // A stop does not cut this short: the call was carried out, its caller should know.
+        sendFrame(peer, reply, std::chrono::steady_clock::now() + kWriteTime);
+    } catch (const std::exception &error) {
+        OVRA_ERR("A local call could not be served: [%s]", error.what());
+    }
+}
+
+Json::Value LocalServer::Impl::answer(const std::string &request) {
+    const std::optional<LocalCall> call = parseLocalRequest(request);
+    if (!call) {
+        return apiError(APIError::kBadRequest, "not a request: api, version, method, params, user");
+    }
+    try {
+        return handler(*call);
+    } catch (const std::exception &error) {
+        OVRA_ERR("Local call of [%s] failed: [%s]", call->api.c_str(), error.what());
+    } catch (...) {
+        OVRA_ERR("Local call of [%s] failed", call->api.c_str());
+    }
+    return apiError(APIError::kInternal, "the call failed in the daemon: see the log");
+}
+
+LocalServer::LocalServer(std::string path, LocalHandler handler, unsigned int threads)
+    : impl_(std::make_unique<Impl>(std::move(path), std::move(handler), threads)) {}
+
+LocalServer::~LocalServer() {
+    stop();
+}
+
+bool LocalServer::start(std::string &why) {
+    if (impl_->listener) {
+        why = "it has been started already";
+        return false;
+    }
+    impl_->stopEvent.reset(eventfd(0, EFD_CLOEXEC));
+    if (!impl_->stopEvent) {
+        why = "cannot start: " + errnoText(errno);
+        return false;
+    }
+    if (!impl_->listenOn(why)) {
+        impl_->lock.unlock();
+        return false;
+    }
+    try {
+        for (unsigned int i = 0; i < impl_->threadCount; ++i) {
+            impl_->threads.emplace_back([impl = impl_.get()] { impl->serveConnections(); });
+        }
+    } catch (const std::system_error &error) {
+        why = std::string("cannot start a thread: ") + error.what();
+        stop();
+        return false;
+    }
+    return true;
+}
+
+void LocalServer::stop() {
+    if (!impl_->listener) {
+        return;
+    }
+    const std::uint64_t one = 1;
+    if (write(impl_->stopEvent.get(), &one, sizeof(one)) != sizeof(one)) {
+        OVRA_ERR("The local server cannot be told to stop: [%s]", errnoText(errno).c_str());
+    }
+    for (std::thread &thread : impl_->threads) {
+        thread.join();
+    }
+    impl_->threads.clear();
+    unlink(impl_->path.c_str());
+    impl_->listener.reset();
+    impl_->lock.unlock();
+}
+
+} // namespace OvraPlatform

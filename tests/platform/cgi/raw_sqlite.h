@@ -1,0 +1,43 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include <sqlite3.h>
+
+#include <memory>
+#include <string>
+
+namespace OvraTest {
+
+/// A connection of the scene's own, beside the one of the store that is tested.
+class RawSqlite {
+public:
+    explicit RawSqlite(const std::string &path) {
+        sqlite3 *raw = nullptr;
+        sqlite3_open(path.c_str(), &raw);
+        database_.reset(raw);
+    }
+
+    bool run(const std::string &sql) {
+        return sqlite3_exec(database_.get(), sql.c_str(), nullptr, nullptr, nullptr) == SQLITE_OK;
+    }
+    /// The first cell of the first row, as text.
+    std::string cell(const std::string &sql) {
+        std::string text = "(nothing)";
+        sqlite3_exec(
+            database_.get(), sql.c_str(),
+            [](void *target, int /*columns*/, char **values, char ** /*names*/) {
+                *static_cast<std::string *>(target) = values[0] != nullptr ? values[0] : "(null)";
+                return 0;
+            },
+            &text, nullptr);
+        return text;
+    }
+
+private:
+    struct Close {
+        void operator()(sqlite3 *database) const { sqlite3_close(database); }
+    };
+    std::unique_ptr<sqlite3, Close> database_;
+};
+
+} // namespace OvraTest

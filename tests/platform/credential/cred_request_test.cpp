@@ -1,0 +1,404 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "credential/cred_errors.h"
+#include "credential/peer_trust.h"
+#include "platform/own_files.h"
+#include "support/misbehaving_server.h"
+
+#include <ovracredential/cred_request.h>
+
+#include <gtest/gtest.h>
+
+#include <chrono>
+#include <cstdlib>
+#include <memory>
+#include <ostream>
+#include <string>
+#include <thread>
+#include <vector>
+
+namespace {
+
+using namespace OvraPlatform;
+using namespace OvraTest;
+using namespace std::chrono_literals;
+
+struct FreeObjects {
+    void operator()(OVRACred *cred) const { OVRACredFree(cred); }
+    void operator()(OVRACredSess *sess) const { OVRACredSessFree(sess); }
+};
+
+/// A credential for 127.0.0.1 and a session.
+struct Objects {
+    explicit Objects(const MisbehavingServer &server, const char *protocol = "https") {
+        EXPECT_EQ(OVRACredItemSetProtocol(cred.get(), protocol), 0);
+        EXPECT_EQ(OVRACredItemSetHost(cred.get(), "127.0.0.1"), 0);
+        EXPECT_EQ(OVRACredItemSetPort(cred.get(), server.port()), 0);
+        EXPECT_EQ(OVRACredSessItemSetAccessToken(sess.get(), "sid-1"), 0);
+    }
+    std::unique_ptr<OVRACred, FreeObjects> cred{OVRACredAlloc()};
+    std::unique_ptr<OVRACredSess, FreeObjects> sess{OVRACredSessAlloc()};
+};
+
+struct Result {
+    bool ok;
+    CredError error;
+    std::string response;
+};
+
+Result process(OVRA::CredRequest &request, bool reuse = true, int mode = 0) {
+    const bool ok = request.Process(reuse, mode) != 0;
+    return {ok, static_cast<CredError>(request.GetError()), request.GetResponse()};
+}
+
+/// Calls OVRA.Test "get" on the server.
+Result call(const MisbehavingServer &server, bool reuse = true, long seconds = 5) {
+    const Objects objects(server);
+    OVRA::CredRequest request;
+    Json::Value params;
+    params["text"] = "a&b";
+    EXPECT_NE(OVRA::CredRequest::CreateWebAPIRequest(
+                  request, objects.cred.get(), objects.sess.get(), "OVRA.Test", 1, "get", params),
+              0);
+    EXPECT_NE(request.SetResponseTimeout(seconds), 0);
+    return process(request, reuse);
+}
+
+Result probe(const std::string &protocol, int port, const std::string &host = "127.0.0.1") {
+    OVRA::CredRequest request;
+    EXPECT_NE(request.SetURL(protocol, host, port, "webapi/query.cgi"), 0);
+    EXPECT_NE(request.SetDefaultTimeout(1), 0);
+    return process(request, true, 2);
+}
+
+class CredRequestScene : public OwnFiles {
+protected:
+    void SetUp() override {
+        ASSERT_NO_FATAL_FAILURE(OwnFiles::SetUp());
+        std::filesystem::remove_all(kStateDir);
+    }
+};
+
+TEST_F(CredRequestScene, postsTheCallAndReturnsTheDocument) {
+    MisbehavingServer server({.tls = true});
+    const Result result = call(server);
+    EXPECT_TRUE(result.ok);
+    EXPECT_EQ(result.error, CredError::kNone);
+    EXPECT_EQ(result.response, R"({"success":true,"data":{}})");
+    const std::vector<Received> requests = server.requests();
+    ASSERT_EQ(requests.size(), 1U);
+    EXPECT_EQ(requests[0].method, "POST");
+    EXPECT_EQ(requests[0].path, "/webapi/query.cgi");
+    EXPECT_NE(requests[0].headers.find("application/x-www-form-urlencoded"), std::string::npos);
+    EXPECT_EQ(requests[0].body, "api=OVRA.Test&version=1&method=get&_sid=sid-1&text=%22a%26b%22");
+}
+
+struct AnswerScene {
+    const char *name;
+    Answer answer;
+    CredError error;
+};
+std::ostream &operator<<(std::ostream &out, const AnswerScene &scene) {
+    return out << scene.name;
+}
+
+class WhenItAnswers : public CredRequestScene, public testing::WithParamInterface<AnswerScene> {};
+
+TEST_P(WhenItAnswers, theErrorTellsWhatWasWrong) {
+    MisbehavingServer server({.tls = true});
+    server.answer(GetParam().answer);
+    const auto begin = std::chrono::steady_clock::now();
+    const Result result = call(server, true, 1);
+    EXPECT_EQ(result.error, GetParam().error);
+    EXPECT_EQ(result.ok, GetParam().error == CredError::kNone);
+    EXPECT_EQ(result.response.empty(), !result.ok);
+    EXPECT_LT(std::chrono::steady_clock::now() - begin, 3s);
+    EXPECT_EQ(server.requests().size(), 1U);
+}
+
+std::string manyHeaders() {
+    std::string bytes = "HTTP/1.1 200 OK\r\n";
+    for (int i = 0; i < 200; ++i) {
+        bytes += "X: " + std::string(1000, 'x') + "\r\n";
+    }
+    return bytes;
+}
+
+const std::string kRefusal = R"({"success":false,"error":{"code":105}})";
+
+INSTANTIATE_TEST_SUITE_P(
+    All, WhenItAnswers,
+    testing::Values(
+        AnswerScene{"an error document", Answer::json(kRefusal), CredError::kNone},
+        AnswerScene{"HTML", Answer::html(), CredError::kReplyBroken},
+        AnswerScene{"an empty body", Answer::empty(), CredError::kReplyBroken},
+        AnswerScene{"JSON of another shape", Answer::json("[1]"), CredError::kReplyBroken},
+        AnswerScene{"no success flag", Answer::json(R"({"data":{}})"), CredError::kReplyBroken},
+        AnswerScene{"failure with code 0", Answer::json(R"({"success":false,"error":{"code":0}})"),
+                    CredError::kReplyBroken},
+        AnswerScene{"a cut document", Answer::truncated(kRefusal), CredError::kConnectionLost},
+        AnswerScene{"50 MB", Answer::huge(50'000'000, true), CredError::kReplyTooLarge},
+        AnswerScene{"50 MB unannounced", Answer::huge(50'000'000, false),
+                    CredError::kReplyTooLarge},
+        AnswerScene{"headers without end", Answer::raw(manyHeaders()), CredError::kReplyTooLarge},
+        AnswerScene{"no HTTP", Answer::raw("220 hello\r\n"), CredError::kReplyBroken},
+        AnswerScene{"nothing, closing", Answer::closed(), CredError::kConnectionLost},
+        AnswerScene{"nothing, waiting", Answer::silence(), CredError::kTimedOut},
+        AnswerScene{"too slowly", Answer::drip(50ms), CredError::kTimedOut},
+        AnswerScene{"401", Answer::status(401), CredError::kNoPermission},
+        AnswerScene{"403", Answer::status(403), CredError::kNoPermission},
+        AnswerScene{"404", Answer::status(404), CredError::kHttpStatus},
+        AnswerScene{"500", Answer::status(500), CredError::kHttpStatus},
+        AnswerScene{"a redirect", Answer::redirect("https://127.0.0.1/"), CredError::kHttpStatus}));
+
+TEST_F(CredRequestScene, tellsWhyItCannotConnect) {
+    MisbehavingServer server({.tls = true});
+    MisbehavingServer plain;
+    server.refuse();
+    EXPECT_EQ(call(server).error, CredError::kCannotConnect);
+    EXPECT_EQ(call(plain).error, CredError::kCannotConnect) << "no TLS on that port";
+    EXPECT_EQ(probe("http", unusedPort()).error, CredError::kCannotConnect);
+    EXPECT_EQ(probe("http", 5000, "no-such-host.invalid").error, CredError::kCannotConnect);
+
+    MisbehavingServer silent({.tls = true});
+    silent.fallSilent();
+    const auto begin = std::chrono::steady_clock::now();
+    EXPECT_EQ(call(silent, true, 1).error, CredError::kTimedOut);
+    EXPECT_LT(std::chrono::steady_clock::now() - begin, 2s);
+}
+
+TEST_F(CredRequestScene, followsNeitherARedirectNorAProxyOfTheEnvironment) {
+    MisbehavingServer elsewhere;
+    const std::string url = "http://127.0.0.1:" + std::to_string(elsewhere.port()) + "/";
+    for (const char *name : {"http_proxy", "https_proxy", "all_proxy", "HTTPS_PROXY"}) {
+        setenv(name, url.c_str(), 1);
+    }
+    MisbehavingServer server({.tls = true});
+    EXPECT_TRUE(call(server).ok);
+    server.answer(Answer::redirect(url));
+    EXPECT_FALSE(call(server).ok);
+    EXPECT_EQ(elsewhere.connections(), 0);
+}
+
+TEST_F(CredRequestScene, refusesWhatCannotBeSent) {
+    MisbehavingServer server({.tls = true});
+    const Objects objects(server);
+    OVRA::CredRequest request;
+    EXPECT_EQ(process(request).error, CredError::kBadArgument);
+    EXPECT_EQ(request.SetURL("https", "a/b", 1, "x"), 0);
+    EXPECT_EQ(request.GetError(), static_cast<int>(CredError::kBadArgument));
+    EXPECT_EQ(request.SetDefaultTimeout(0), 0);
+    EXPECT_EQ(request.SetResponseTimeout(-1), 0);
+    EXPECT_EQ(request.SetEncryptMode(1), 0);
+    const auto create = [&](OVRACred *cred, const char *api, int version,
+                            const Json::Value &params) {
+        return OVRA::CredRequest::CreateWebAPIRequest(request, cred, objects.sess.get(), api,
+                                                      version, "get", params);
+    };
+    EXPECT_EQ(create(nullptr, "A", 1, {}), 0);
+    EXPECT_EQ(create(objects.cred.get(), "", 1, {}), 0);
+    EXPECT_EQ(create(objects.cred.get(), "A", 0, {}), 0);
+    EXPECT_EQ(create(objects.cred.get(), "A", 1, "text"), 0);
+    EXPECT_EQ(request.GetError(), static_cast<int>(CredError::kBadArgument));
+
+    EXPECT_NE(OVRACredItemSetProtocol(objects.cred.get(), "flk"), 0);
+    EXPECT_NE(OVRACredItemSetHost(objects.cred.get(), "a b"), 0);
+    EXPECT_NE(OVRACredItemSetPort(objects.cred.get(), 0), 0);
+    EXPECT_NE(OVRACredItemSetRemoteAccount(objects.cred.get(), ""), 0);
+    EXPECT_NE(OVRACredItemSetRemotePasswd(nullptr, "x"), 0);
+    EXPECT_NE(create(objects.cred.get(), "A", 1, {}), 0) << "what was refused changed nothing";
+}
+
+TEST_F(CredRequestScene, keepsAConnectionForTheNextRequest) {
+    MisbehavingServer server({.tls = true});
+    call(server); // pins the key, which ends the first connection
+    const int before = server.connections();
+    for (int i = 0; i < 5; ++i) {
+        EXPECT_TRUE(call(server).ok);
+    }
+    EXPECT_EQ(server.connections(), before + 1);
+    EXPECT_TRUE(call(server, false).ok);
+    EXPECT_EQ(server.connections(), before + 2);
+}
+
+TEST_F(CredRequestScene, replacesAKeptConnectionThatThePeerHasClosed) {
+    MisbehavingServer server({.tls = true});
+    call(server);
+    call(server);
+    server.closeConnections();
+    std::this_thread::sleep_for(50ms);
+    EXPECT_TRUE(call(server).ok);
+    EXPECT_EQ(server.requests().size(), 3U);
+}
+
+TEST_F(CredRequestScene, doesNotRepeatARequestThatMayHaveBeenCarriedOut) {
+    MisbehavingServer server({.tls = true});
+    call(server);
+    call(server);
+    server.answerOnce(Answer::closed());
+    EXPECT_EQ(call(server).error, CredError::kConnectionLost);
+    EXPECT_EQ(server.requests().size(), 3U);
+    EXPECT_EQ(server.requests()[2].connection, server.requests()[1].connection)
+        << "it was the kept connection";
+}
+
+TEST_F(CredRequestScene, refusesAnEndpointWhoseKeyHasChanged) {
+    MisbehavingServer server({.tls = true});
+    EXPECT_TRUE(call(server).ok);
+    server.changeCertificate();
+    server.closeConnections();
+    EXPECT_EQ(call(server).error, CredError::kCertificateChanged);
+    EXPECT_EQ(call(server, false).error, CredError::kCertificateChanged);
+    EXPECT_EQ(server.requests().size(), 1U) << "nothing may be sent to it";
+
+    const std::string endpoint = "https://127.0.0.1:" + std::to_string(server.port());
+    EXPECT_TRUE(TrustStore().forget(endpoint));
+    EXPECT_TRUE(call(server).ok);
+}
+
+TEST_F(CredRequestScene, dropsKeptConnectionsWhenTrustIsTakenBack) {
+    MisbehavingServer server({.tls = true});
+    call(server);
+    call(server);
+    const std::string endpoint = "https://127.0.0.1:" + std::to_string(server.port());
+    TrustStore().forget(endpoint);
+    EXPECT_EQ(
+        expectFingerprint("https", "127.0.0.1", server.port(), "SHA256:" + std::string(43, 'A')),
+        TrustVerdict::kTrusted);
+    EXPECT_EQ(call(server).error, CredError::kCertificateChanged);
+}
+
+TEST_F(CredRequestScene, sendsNothingWhenAKeyCannotBePinned) {
+    MisbehavingServer server({.tls = true});
+    OtherProcess full([&server] {
+        limitFileSize(0);
+        return static_cast<int>(call(server).error);
+    });
+    EXPECT_EQ(full.wait(), static_cast<int>(CredError::kTrustUnavailable));
+    EXPECT_TRUE(server.requests().empty());
+}
+
+TEST_F(CredRequestScene, showsTheFingerprintWithoutTrustingIt) {
+    MisbehavingServer server({.tls = true});
+    const PeerIdentity identity = peerFingerprint("https", "127.0.0.1", server.port(), 5);
+    EXPECT_EQ(identity.error, CredError::kNone);
+    EXPECT_EQ(identity.fingerprint, server.fingerprint());
+    EXPECT_FALSE(identity.acceptedBySystem);
+    EXPECT_EQ(identity.pinned, TrustVerdict::kUnknown);
+    EXPECT_TRUE(TrustStore().list()->empty());
+    EXPECT_TRUE(server.requests().empty());
+
+    EXPECT_EQ(expectFingerprint("https", "127.0.0.1", server.port(), server.fingerprint()),
+              TrustVerdict::kTrusted);
+    EXPECT_EQ(peerFingerprint("https", "127.0.0.1", server.port(), 5).pinned,
+              TrustVerdict::kTrusted);
+    EXPECT_EQ(peerFingerprint("https", "127.0.0.1", unusedPort(), 5).error,
+              CredError::kCannotConnect);
+    EXPECT_EQ(expectFingerprint("https", "127.0.0.1", server.port(), "SHA256:x"),
+              TrustVerdict::kUnavailable);
+}
+
+TEST_F(CredRequestScene, leavesTheParentsConnectionAloneInAForkedChild) {
+    MisbehavingServer server({.tls = true});
+    call(server);
+    call(server);
+    const int before = server.connections();
+    OtherProcess child([&server] { return call(server).ok && call(server).ok ? 0 : 1; });
+    EXPECT_EQ(child.wait(), 0);
+    EXPECT_EQ(server.connections(), before + 1);
+    EXPECT_TRUE(call(server).ok);
+    EXPECT_EQ(server.connections(), before + 1) << "the parent's must still be usable";
+}
+
+TEST_F(CredRequestScene, servesThreadsAtOnce) {
+    MisbehavingServer server({.tls = true});
+    call(server);
+    std::vector<std::thread> threads;
+    std::atomic<int> good{0};
+    for (int i = 0; i < 8; ++i) {
+        threads.emplace_back([&] {
+            for (int each = 0; each < 20; ++each) {
+                good += call(server).ok ? 1 : 0;
+            }
+        });
+    }
+    for (std::thread &thread : threads) {
+        thread.join();
+    }
+    EXPECT_EQ(good, 160);
+    EXPECT_EQ(server.requests().size(), 161U);
+}
+
+TEST_F(CredRequestScene, sendsAFileAlong) {
+    MisbehavingServer server({.tls = true});
+    writeFile(path("file"), "the content\n");
+    const Objects objects(server);
+    const auto upload = [&](const std::string &file) {
+        OVRA::CredRequest request;
+        OVRA::CredRequest::CreateWebAPIRequest(request, objects.cred.get(), objects.sess.get(),
+                                               "OVRA.Test", 1, "put", Json::Value());
+        EXPECT_NE(request.SetUploadFile(file, "report"), 0);
+        return process(request).error;
+    };
+    EXPECT_EQ(upload(path("file")), CredError::kNone);
+    EXPECT_EQ(upload(path("absent")), CredError::kUploadUnreadable);
+    EXPECT_EQ(upload("/dev/zero"), CredError::kUploadUnreadable);
+    ASSERT_EQ(server.requests().size(), 1U);
+    const Received request = server.requests()[0];
+    EXPECT_NE(request.headers.find("multipart/form-data"), std::string::npos);
+    for (const char *part : {"name=\"api\"\r\n\r\nOVRA.Test\r\n", "name=\"_sid\"\r\n\r\nsid-1\r\n",
+                             "name=\"report\"; filename=\"report\"", "\r\n\r\nthe content\n\r\n"}) {
+        EXPECT_NE(request.body.find(part), std::string::npos) << part;
+    }
+}
+
+struct ProbeScene {
+    const char *name;
+    Answer answer;
+    CredError error;
+};
+std::ostream &operator<<(std::ostream &out, const ProbeScene &scene) {
+    return out << scene.name;
+}
+
+class ProbeThatGets : public CredRequestScene, public testing::WithParamInterface<ProbeScene> {};
+
+TEST_P(ProbeThatGets, countsAnAnswerOfTheEntryPoint) {
+    for (const bool tls : {false, true}) {
+        MisbehavingServer server({.tls = tls});
+        server.answer(GetParam().answer);
+        const Result result = probe(tls ? "https" : "http", server.port());
+        EXPECT_EQ(result.error, GetParam().error) << tls;
+        EXPECT_EQ(result.ok, GetParam().error == CredError::kNone) << tls;
+        ASSERT_EQ(server.requests().size(), 1U);
+        EXPECT_EQ(server.requests()[0].method, "GET");
+        EXPECT_EQ(server.requests()[0].path, "/webapi/query.cgi");
+        EXPECT_EQ(server.requests()[0].body, "");
+        EXPECT_TRUE(TrustStore().list()->empty());
+    }
+}
+
+INSTANTIATE_TEST_SUITE_P(
+    All, ProbeThatGets,
+    testing::Values(ProbeScene{"a document", Answer::json(kRefusal), CredError::kNone},
+                    ProbeScene{"HTML", Answer::html(), CredError::kNone},
+                    ProbeScene{"403", Answer::status(403), CredError::kNone},
+                    ProbeScene{"a redirect", Answer::redirect("http://x/"), CredError::kNone},
+                    ProbeScene{"404", Answer::status(404), CredError::kHttpStatus},
+                    ProbeScene{"500", Answer::status(500), CredError::kHttpStatus},
+                    ProbeScene{"silence", Answer::silence(), CredError::kTimedOut},
+                    ProbeScene{"nothing", Answer::closed(), CredError::kConnectionLost},
+                    ProbeScene{"50 MB", Answer::huge(50'000'000, false),
+                               CredError::kReplyTooLarge}));
+
+TEST_F(CredRequestScene, probesOverConnectionsOfTheirOwn) {
+    MisbehavingServer server({.tls = true});
+    call(server);
+    server.changeCertificate();
+    EXPECT_TRUE(probe("https", server.port()).ok) << "a probe does not judge";
+    EXPECT_TRUE(probe("https", server.port()).ok);
+    EXPECT_EQ(server.connections(), 3);
+    server.closeConnections();
+    EXPECT_EQ(call(server).error, CredError::kCertificateChanged) << "nor does it vouch";
+}
+
+} // namespace

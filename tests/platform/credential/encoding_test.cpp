@@ -1,0 +1,118 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "credential/endpoint.h"
+#include "credential/wire_form.h"
+
+#include <ovradrcore/json.h>
+
+#include <gtest/gtest.h>
+
+#include <ostream>
+
+namespace {
+
+using namespace OvraPlatform;
+
+TEST(WireForm, bringsEveryValueBackAsItWas) {
+    WireCall call;
+    call.api = "OVRA.DR.Node";
+    call.version = 2;
+    call.method = "info";
+    call.sid = "a+b/c=&d %";
+    call.params["text"] = std::string(1, '\0') + " \"quoted\" & + % \xC3\xA9\n";
+    call.params["number"] = -17;
+    call.params["list"].append(1.5);
+    call.params["list"].append(Json::Value());
+    call.params["a name=&"]["inner"] = true;
+
+    const auto body = encodeForm(call);
+    ASSERT_TRUE(body);
+    EXPECT_TRUE(body->starts_with("api=OVRA.DR.Node&version=2&method=info&_sid=")) << *body;
+    std::string why;
+    const auto read = decodeForm(*body, why);
+    ASSERT_TRUE(read) << why;
+    EXPECT_EQ(read->api, call.api);
+    EXPECT_EQ(read->version, call.version);
+    EXPECT_EQ(read->method, call.method);
+    EXPECT_EQ(read->sid, call.sid);
+    EXPECT_EQ(OvraDRCore::toString(read->params), OvraDRCore::toString(call.params));
+}
+
+TEST(WireForm, readsWhatOtherClientsWrite) {
+    std::string why;
+    const auto call = decodeForm("method=get&&x=%22a+b%2f%2F%22&version=1&api=A&", why);
+    ASSERT_TRUE(call) << why;
+    EXPECT_EQ(call->params["x"], "a b//");
+}
+
+TEST(WireForm, refusesWhatIsNoCall) {
+    for (const char *body :
+         {"", "api=A&method=m", "api=A&version=0&method=m", "api=A&version=1x&method=m",
+          "api=A&version=99999999999&method=m", "version=1&method=m", "api=A&version=1",
+          "api=A&version=1&method=m&x", "api=A&version=1&method=m&x=%2",
+          "api=A&version=1&method=%zz", "api=A&version=1&method=m&x=text",
+          "api=A&version=1&method=m&x=1&x=2", "api=A&version=1&method=m&api=B",
+          "api=A&version=1&method=m&sealed=s&x=1", "api=A&version=1&method=m&sealed=s&_sid=t"}) {
+        std::string why;
+        EXPECT_FALSE(decodeForm(body, why)) << body;
+        EXPECT_FALSE(why.empty()) << body;
+    }
+    std::string many = "api=A&version=1&method=m";
+    for (int i = 0; i < 1000; ++i) {
+        many += "&p" + std::to_string(i) + "=1";
+    }
+    std::string why;
+    EXPECT_FALSE(decodeForm(many, why));
+}
+
+TEST(WireForm, hasNoParameterWithTheNameOfAField) {
+    for (const char *name : {"api", "version", "method", "_sid", "sealed"}) {
+        WireCall call{{"A", 1, "m"}};
+        call.params[name] = 1;
+        EXPECT_FALSE(encodeForm(call)) << name;
+    }
+}
+
+struct EndpointScene {
+    const char *protocol;
+    const char *host;
+    int port;
+    const char *key; ///< "" when it must be refused
+};
+std::ostream &operator<<(std::ostream &out, const EndpointScene &scene) {
+    return out << scene.protocol << " " << scene.host << " " << scene.port;
+}
+
+class EndpointIs : public testing::TestWithParam<EndpointScene> {};
+
+TEST_P(EndpointIs, oneSpellingOrRefused) {
+    const EndpointScene &scene = GetParam();
+    const auto endpoint = Endpoint::make(scene.protocol, scene.host, scene.port);
+    EXPECT_EQ(endpoint ? endpoint->key() : "", scene.key);
+}
+
+INSTANTIATE_TEST_SUITE_P(
+    All, EndpointIs,
+    testing::Values(EndpointScene{"https", "NAS.Example", 5001, "https://nas.example:5001"},
+                    EndpointScene{"http", "10.0.0.2", 80, "http://10.0.0.2:80"},
+                    EndpointScene{"https", "2001:DB8:0::1", 1, "https://[2001:db8::1]:1"},
+                    EndpointScene{"https", "[::1]", 65535, "https://[::1]:65535"},
+                    EndpointScene{"flk", "alias", 1, ""}, EndpointScene{"HTTPS", "a", 1, ""},
+                    EndpointScene{"ftp", "a", 1, ""}, EndpointScene{"https", "", 1, ""},
+                    EndpointScene{"https", "a", 0, ""}, EndpointScene{"https", "a", 65536, ""},
+                    EndpointScene{"https", "a b", 1, ""}, EndpointScene{"https", "a/b", 1, ""},
+                    EndpointScene{"https", "u@a", 1, ""}, EndpointScene{"https", "a?b", 1, ""},
+                    EndpointScene{"https", "a#b", 1, ""}, EndpointScene{"https", "a\nb", 1, ""},
+                    EndpointScene{"https", "a\\b", 1, ""}, EndpointScene{"https", "a%41", 1, ""},
+                    EndpointScene{"https", "a:80", 1, ""}, EndpointScene{"https", "[::1", 1, ""},
+                    EndpointScene{"https", "fe80::1%eth0", 1, ""}));
+
+TEST(Endpoint, takesNothingIntoAPathThatIsNotPartOfOne) {
+    const auto endpoint = Endpoint::make("https", "a", 1);
+    ASSERT_TRUE(endpoint);
+    EXPECT_EQ(endpoint->url("webapi/query.cgi"), "https://a:1/webapi/query.cgi");
+    for (const char *path : {"a?b", "a#b", "a b", "a\r\nb", "a@b", "%2e"}) {
+        EXPECT_FALSE(endpoint->url(path)) << path;
+    }
+}
+
+} // namespace

@@ -1,0 +1,234 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "credential/cred_errors.h"
+#include "credential/peer_trust.h"
+#include "platform/credential/sealing_daemon.h"
+#include "platform/own_files.h"
+
+#include <ovracredential/cred_request.h>
+
+#include <gtest/gtest.h>
+
+#include <atomic>
+#include <memory>
+#include <string>
+
+namespace {
+
+using namespace OvraPlatform;
+using namespace OvraTest;
+
+struct FreeObjects {
+    void operator()(OVRACred *cred) const { OVRACredFree(cred); }
+    void operator()(OVRACredSess *sess) const { OVRACredSessFree(sess); }
+};
+
+/// A daemon that grants "granted-sid" to ann with the password hunter2, and answers with what it
+/// was asked.
+Json::Value serve(const WireCall &call) {
+    if (call.method == "login") {
+        Json::Value data;
+        data["sid"] = "granted-sid";
+        const bool good = call.params["account"] == "ann" && call.params["passwd"] == "hunter2";
+        return good ? apiSuccess(data) : apiError(APIError::kLoginFailed);
+    }
+    Json::Value data;
+    data["sid"] = call.sid;
+    data["params"] = call.params;
+    return apiSuccess(data);
+}
+
+class SealedCallScene : public OwnFiles {
+protected:
+    void SetUp() override {
+        ASSERT_NO_FATAL_FAILURE(OwnFiles::SetUp());
+        std::filesystem::remove_all(kStateDir);
+        daemon_ = std::make_unique<SealingDaemon>(
+            path("seal"), serve,
+            ReplayGuard::Clocks{[this] { return wallClock() + skew_; },
+                                [this] { return wallClock() + skew_; }});
+    }
+
+    std::unique_ptr<MisbehavingServer> start(bool tls) {
+        auto server = std::make_unique<MisbehavingServer>(MisbehavingServer::Options{.tls = tls});
+        server->answerWith([this](const Received &request) { return daemon_->answer(request); });
+        OVRACredItemSetProtocol(cred_.get(), tls ? "https" : "http");
+        OVRACredItemSetHost(cred_.get(), "127.0.0.1");
+        OVRACredItemSetPort(cred_.get(), server->port());
+        OVRACredItemSetRemoteAccount(cred_.get(), "ann");
+        OVRACredItemSetRemotePasswd(cred_.get(), "hunter2");
+        OVRACredSessItemSetAccessToken(sess_.get(), "sid-1");
+        return server;
+    }
+
+    CredError call(int encryptMode = 0) {
+        OVRA::CredRequest request;
+        Json::Value params;
+        params["password"] = "topsecret";
+        OVRA::CredRequest::CreateWebAPIRequest(request, cred_.get(), sess_.get(), "OVRA.Test", 1,
+                                               "set", params);
+        request.SetEncryptMode(encryptMode);
+        request.SetResponseTimeout(5);
+        request.Process(true, 0);
+        OvraDRCore::fromString(reply_, request.GetResponse());
+        return static_cast<CredError>(request.GetError());
+    }
+
+    int login() {
+        return OVRA::CredRequestUtil::LoginWithOTP(cred_.get(), "", sess_.get(), &reply_);
+    }
+
+    static bool carries(const MisbehavingServer &server, const std::string &text) {
+        for (const Received &request : server.requests()) {
+            if ((request.path + request.headers + request.body).find(text) != std::string::npos) {
+                return true;
+            }
+        }
+        return false;
+    }
+
+    std::atomic<UnixMillis> skew_{0};
+    std::unique_ptr<SealingDaemon> daemon_;
+    std::unique_ptr<OVRACred, FreeObjects> cred_{OVRACredAlloc()};
+    std::unique_ptr<OVRACredSess, FreeObjects> sess_{OVRACredSessAlloc()};
+    Json::Value reply_;
+};
+
+TEST_F(SealedCallScene, keepsEverySecretOutOfPlainHttp) {
+    const auto server = start(false);
+    EXPECT_NE(login(), 0);
+    EXPECT_EQ(reply_["data"]["sid"], "granted-sid");
+    ASSERT_EQ(call(), CredError::kNone);
+    EXPECT_EQ(reply_["data"]["sid"], "granted-sid") << "the session of the log-in is used";
+    EXPECT_EQ(reply_["data"]["params"]["password"], "topsecret");
+    EXPECT_NE(OVRA::CredRequestUtil::Logout(cred_.get(), sess_.get()), 0);
+    for (const char *secret : {"hunter2", "granted-sid", "topsecret"}) {
+        EXPECT_FALSE(carries(*server, secret)) << secret;
+    }
+    EXPECT_TRUE(carries(*server, "api=OVRA.Test&version=1&method=set&sealed="));
+}
+
+TEST_F(SealedCallScene, logsInOverTlsWithoutASeal) {
+    const auto server = start(true);
+    EXPECT_NE(login(), 0);
+    EXPECT_EQ(reply_["data"]["sid"], "granted-sid");
+    EXPECT_FALSE(carries(*server, "sealed="));
+    EXPECT_TRUE(carries(*server, "passwd=%22hunter2%22"));
+}
+
+TEST_F(SealedCallScene, sealsOverTlsWhenThatIsAsked) {
+    const auto server = start(true);
+    ASSERT_EQ(call(2), CredError::kNone);
+    EXPECT_EQ(reply_["data"]["params"]["password"], "topsecret");
+    EXPECT_FALSE(carries(*server, "topsecret"));
+    EXPECT_FALSE(carries(*server, "sid-1"));
+}
+
+TEST_F(SealedCallScene, handsOutTheDocumentOfARefusedLogIn) {
+    const auto server = start(false);
+    OVRACredItemSetRemotePasswd(cred_.get(), "wrong");
+    EXPECT_NE(login(), 0);
+    EXPECT_EQ(reply_["error"]["code"], 400);
+}
+
+TEST_F(SealedCallScene, saysWhyALogInGotNoAnswer) {
+    const auto server = start(false);
+    server->refuse();
+    EXPECT_EQ(login(), 0);
+    EXPECT_FALSE(reply_["success"].asBool());
+    EXPECT_EQ(reply_["error"]["msg"]["cred_error"], 5);
+}
+
+TEST_F(SealedCallScene, takesNoSuccessWithoutASessionForALogIn) {
+    const auto server = start(true);
+    server->answer(Answer::success());
+    EXPECT_EQ(login(), 0);
+    EXPECT_FALSE(reply_["success"].asBool());
+}
+
+TEST_F(SealedCallScene, logsOutOnce) {
+    const auto server = start(true);
+    login();
+    EXPECT_NE(OVRA::CredRequestUtil::Logout(cred_.get(), sess_.get()), 0);
+    EXPECT_EQ(OVRA::CredRequestUtil::Logout(cred_.get(), sess_.get()), 0);
+    EXPECT_EQ(server->requests().size(), 2U);
+}
+
+TEST_F(SealedCallScene, getsThroughToAnApplianceWithAnotherTime) {
+    for (const UnixMillis skew : {-90'000'000, 90'000'000}) {
+        skew_ = skew;
+        daemon_ = std::make_unique<SealingDaemon>(
+            path("seal" + std::to_string(skew)), serve,
+            ReplayGuard::Clocks{[this] { return wallClock() + skew_; },
+                                [this] { return wallClock() + skew_; }});
+        const auto server = start(false);
+        EXPECT_EQ(call(), CredError::kNone) << skew;
+        EXPECT_TRUE(reply_["success"].asBool()) << skew;
+        EXPECT_EQ(server->requests().size(), 3U)
+            << "the key, a stale try, and one that got through";
+        EXPECT_EQ(call(), CredError::kNone) << skew;
+        EXPECT_EQ(server->requests().size(), 4U) << "the difference is remembered";
+    }
+}
+
+TEST_F(SealedCallScene, refusesAnHttpEndpointWhoseKeyHasChanged) {
+    const auto server = start(false);
+    ASSERT_EQ(call(), CredError::kNone);
+    daemon_->newKey(path("other"));
+    EXPECT_EQ(call(), CredError::kCertificateChanged);
+    EXPECT_EQ(call(), CredError::kCertificateChanged);
+    EXPECT_EQ(peerFingerprint("http", "127.0.0.1", server->port(), 5).fingerprint,
+              daemon_->fingerprint());
+    TrustStore().forget("http://127.0.0.1:" + std::to_string(server->port()));
+    EXPECT_EQ(call(), CredError::kNone);
+}
+
+TEST_F(SealedCallScene, takesANewKeyThatComesOverTls) {
+    const auto server = start(true);
+    ASSERT_EQ(call(2), CredError::kNone);
+    daemon_->newKey(path("other"));
+    EXPECT_EQ(call(2), CredError::kNone);
+}
+
+TEST_F(SealedCallScene, believesNothingThatCouldBeForged) {
+    const auto server = start(false);
+    ASSERT_EQ(call(), CredError::kNone);
+    const auto withoutTheKey = [](const std::string &reply) { return Answer::json(reply); };
+    for (const char *forged :
+         {R"({"success":true,"data":{"sid":"evil"}})", R"({"success":false,"error":{"code":105}})",
+          R"({"success":false,"error":{"code":400}})", R"({"sealed_reply":"AAAA"})",
+          R"({"success":false,"error":{"code":109,"msg":{"reason":"stale","time":1}}})"}) {
+        server->answerOnce(withoutTheKey(forged));
+        EXPECT_EQ(call(), CredError::kSealFailed) << forged;
+    }
+    server->answerOnce(withoutTheKey(R"({"success":false,"error":{"code":107}})"));
+    EXPECT_EQ(call(), CredError::kNone) << "that it is busy says nothing that could harm";
+    EXPECT_EQ(reply_["error"]["code"], 107);
+}
+
+TEST_F(SealedCallScene, sendsNothingToAnEndpointThatHasNoKey) {
+    const auto server = start(false);
+    server->answer(Answer::json(R"({"success":false,"error":{"code":102}})"));
+    EXPECT_EQ(login(), 0);
+    EXPECT_EQ(reply_["error"]["msg"]["cred_error"], static_cast<int>(CredError::kSealFailed));
+    EXPECT_EQ(server->requests().size(), 1U);
+}
+
+TEST_F(SealedCallScene, sendsNoFileOverPlainHttp) {
+    const auto server = start(false);
+    writeFile(path("file"), "content");
+    OVRA::CredRequest request;
+    OVRA::CredRequest::CreateWebAPIRequest(request, cred_.get(), sess_.get(), "OVRA.Test", 1, "put",
+                                           Json::Value());
+    request.SetUploadFile(path("file"), "file");
+    EXPECT_EQ(request.Process(true, 0), 0);
+    EXPECT_EQ(request.GetError(), static_cast<int>(CredError::kUploadUnreadable));
+    EXPECT_EQ(server->connections(), 0);
+}
+
+TEST(Relay, isNotSetUp) {
+    Json::Value info("x");
+    EXPECT_EQ(OVRA::CredRequestFarlink::GetConnInfo("alias", info, nullptr), 0);
+    EXPECT_TRUE(info.isNull());
+}
+
+} // namespace

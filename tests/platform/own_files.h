@@ -1,0 +1,109 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include "core/appliance.h"
+
+#include <gtest/gtest.h>
+#include <sys/resource.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <csignal>
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
+#include <functional>
+#include <sstream>
+#include <string>
+
+namespace OvraTest {
+
+inline void writeFile(const std::string &path, const std::string &content) {
+    std::filesystem::create_directories(std::filesystem::path(path).parent_path());
+    std::ofstream(path, std::ios::binary) << content;
+}
+
+inline std::string readFile(const std::string &path) {
+    std::ostringstream content;
+    content << std::ifstream(path, std::ios::binary).rdbuf();
+    return content.str();
+}
+
+inline unsigned int modeOf(const std::string &path) {
+    struct stat status {};
+    return lstat(path.c_str(), &status) == 0 ? status.st_mode & 07777U : 0U;
+}
+
+/// How the sandbox around this program works: root, user or proot; "" when there is none.
+inline std::string labWay() {
+    const char *const way = std::getenv("OVRADR_LAB_WAY"); // NOLINT(concurrency-mt-unsafe)
+    return way != nullptr ? way : "";
+}
+
+/// A scene with a folder of its own. The fixed paths of the appliance may be used too: the scene
+/// refuses to run where they would be this machine's.
+class OwnFiles : public testing::Test {
+protected:
+    void SetUp() override {
+        ASSERT_NE(labWay(), "") << "run this under lab/sandbox";
+        std::string pattern = "/tmp/ovrat.XXXXXX";
+        ASSERT_NE(mkdtemp(pattern.data()), nullptr);
+        folder_ = pattern;
+    }
+    void TearDown() override {
+        if (!folder_.empty()) {
+            std::filesystem::remove_all(folder_);
+            std::filesystem::remove_all(OvraPlatform::kConfigDir);
+            std::filesystem::remove_all(OvraPlatform::kStateDir);
+            umask(022);
+        }
+    }
+
+    std::string path(const std::string &name) const { return folder_ + "/" + name; }
+
+private:
+    std::string folder_;
+};
+
+/// Runs `work` in a process of its own. It must not use gtest assertions.
+class OtherProcess {
+public:
+    explicit OtherProcess(const std::function<int()> &work)
+        : pid_(fork()) {
+        if (pid_ == 0) {
+            _exit(work());
+        }
+    }
+    OtherProcess(const OtherProcess &) = delete;
+    OtherProcess &operator=(const OtherProcess &) = delete;
+    ~OtherProcess() {
+        if (pid_ > 0) {
+            end(SIGKILL);
+        }
+    }
+
+    /// Its exit code, or -1 when a signal ended it.
+    int wait() {
+        int status = 0;
+        waitpid(pid_, &status, 0);
+        pid_ = -1;
+        return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+    }
+    void end(int signal) {
+        kill(pid_, signal);
+        wait();
+    }
+
+private:
+    pid_t pid_;
+};
+
+/// From here on this process can write no file beyond `bytes`, as on a full disk.
+inline void limitFileSize(rlim_t bytes) {
+    std::signal(SIGXFSZ, SIG_IGN); // so that write(2) fails instead
+    const rlimit limit{bytes, bytes};
+    setrlimit(RLIMIT_FSIZE, &limit);
+}
+
+} // namespace OvraTest

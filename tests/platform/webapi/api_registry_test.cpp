@@ -1,0 +1,124 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "webapi/api_errors.h"
+#include "webapi/api_registry.h"
+
+#include <ovrawebapi/api_runner.h>
+
+#include <gtest/gtest.h>
+
+#include <ostream>
+#include <stdexcept>
+
+namespace {
+
+using namespace OvraPlatform;
+
+int codeOf(const Json::Value &reply) {
+    return reply["success"].asBool() ? 0 : reply["error"]["code"].asInt();
+}
+
+Json::Value echo(const Json::Value &params, const APICaller &caller) {
+    Json::Value data;
+    data["params"] = params;
+    data["user"] = caller.user;
+    data["administrator"] = caller.administrator;
+    data["local"] = caller.local;
+    return apiSuccess(data);
+}
+
+struct Scene {
+    const char *name;
+    APICall call;
+    APICaller caller;
+    int code;
+};
+std::ostream &operator<<(std::ostream &out, const Scene &scene) {
+    return out << scene.name;
+}
+
+const APICaller kNobody{};
+const APICaller kUser{"ann", false, "s1", "192.0.2.1", false};
+const APICaller kAdministrator{"root", true, "s2", "192.0.2.1", false};
+
+class Dispatch : public testing::TestWithParam<Scene> {};
+
+TEST_P(Dispatch, answersWithTheCodeOfTheWireForm) {
+    APIRegistry registry;
+    registry.add("Open", 1, "get", APIRight::kNone, APILane::kQuick, echo);
+    registry.add("Mine", 2, "get", APIRight::kSession, APILane::kQuick, echo);
+    registry.add("All", 1, "set", APIRight::kAdministrator, APILane::kSlow, echo);
+    registry.add("Bad", 1, "throw", APIRight::kNone, APILane::kQuick,
+                 [](const Json::Value &params, const APICaller &) -> Json::Value {
+                     return apiSuccess(params["list"].asInt());
+                 });
+    registry.add("Bad", 1, "throw_number", APIRight::kNone, APILane::kQuick,
+                 [](const Json::Value &, const APICaller &) -> Json::Value { throw 7; });
+    registry.add("Bad", 1, "no_document", APIRight::kNone, APILane::kQuick,
+                 [](const Json::Value &, const APICaller &) { return Json::Value("done"); });
+    EXPECT_EQ(codeOf(registry.dispatch(GetParam().call, GetParam().caller)), GetParam().code);
+}
+
+Json::Value objectWithList() {
+    Json::Value params(Json::objectValue);
+    params["list"].append(1);
+    return params;
+}
+
+INSTANTIATE_TEST_SUITE_P(
+    Calls, Dispatch,
+    testing::Values(
+        Scene{"anybody", {"Open", 1, "get"}, kNobody, 0},
+        Scene{"a user", {"Mine", 2, "get"}, kUser, 0},
+        Scene{"an administrator", {"All", 1, "set"}, kAdministrator, 0},
+        Scene{"no such API", {"Closed", 1, "get"}, kAdministrator, APIError::kNoSuchAPI},
+        Scene{"no such method", {"Open", 1, "set"}, kUser, APIError::kNoSuchMethod},
+        Scene{"no such version", {"Mine", 1, "get"}, kUser, APIError::kNoSuchVersion},
+        Scene{"no session", {"Mine", 2, "get"}, kNobody, APIError::kNoSession},
+        Scene{"no session, more needed", {"All", 1, "set"}, kNobody, APIError::kNoSession},
+        Scene{"no right", {"All", 1, "set"}, kUser, APIError::kNoPermission},
+        Scene{"no object", {"Open", 1, "get", "text"}, kUser, APIError::kBadRequest},
+        Scene{"wrong type used", {"Bad", 1, "throw", objectWithList()}, kUser, APIError::kInternal},
+        Scene{"not an exception", {"Bad", 1, "throw_number"}, kUser, APIError::kInternal},
+        Scene{"no document", {"Bad", 1, "no_document"}, kUser, APIError::kInternal}));
+
+TEST(APIRegistry, givesAHandlerAnObjectForNullParameters) {
+    APIRegistry registry;
+    registry.add("Open", 1, "get", APIRight::kNone, APILane::kQuick, echo);
+    const Json::Value reply = registry.dispatch({"Open", 1, "get", Json::Value()}, kNobody);
+    EXPECT_EQ(reply["data"]["params"], Json::Value(Json::objectValue));
+}
+
+TEST(APIRegistry, knowsTheLaneOfEachVersion) {
+    APIRegistry registry;
+    registry.add("A", 1, "get", APIRight::kNone, APILane::kQuick, echo);
+    registry.add("A", 2, "get", APIRight::kNone, APILane::kSlow, echo);
+    EXPECT_EQ(registry.lane({"A", 1, "get"}), APILane::kQuick);
+    EXPECT_EQ(registry.lane({"A", 2, "get"}), APILane::kSlow);
+    EXPECT_EQ(registry.lane({"B", 1, "get"}), APILane::kQuick);
+}
+
+TEST(APIRunner, runsTheHandlersThatItsProcessHostsAsALocalAdministrator) {
+    Json::Value out;
+    {
+        APIRegistry registry;
+        registry.add("All", 1, "set", APIRight::kAdministrator, APILane::kQuick, echo);
+        registry.host();
+        ASSERT_TRUE(OVRA::APIRunner().Exec(out, "All", 1, "set", Json::Value(), "admin"));
+        EXPECT_EQ(out["data"]["user"], "admin");
+        EXPECT_TRUE(out["data"]["administrator"].asBool());
+        EXPECT_TRUE(out["data"]["local"].asBool());
+        EXPECT_FALSE(OVRA::APIRunner().Exec(out, "All", 1, "set", Json::Value(), nullptr));
+        EXPECT_EQ(codeOf(out), APIError::kBadRequest);
+    }
+    EXPECT_EQ(APIRegistry::hosted(), nullptr);
+}
+
+TEST(APIValidator, acceptsPortsOnly) {
+    EXPECT_TRUE(OVRA::APIValidator::IsPort(1));
+    EXPECT_TRUE(OVRA::APIValidator::IsPort(65535));
+    EXPECT_FALSE(OVRA::APIValidator::IsPort(0));
+    EXPECT_FALSE(OVRA::APIValidator::IsPort(65536));
+    EXPECT_FALSE(OVRA::APIValidator::IsPort(-1));
+}
+
+} // namespace

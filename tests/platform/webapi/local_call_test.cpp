@@ -1,0 +1,229 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "core/appliance.h"
+#include "core/unique_fd.h"
+#include "platform/own_files.h"
+#include "webapi/api_errors.h"
+#include "webapi/local_address.h"
+#include "webapi/local_server.h"
+
+#include <ovradrcore/json.h>
+#include <ovrawebapi/api_runner.h>
+
+#include <gtest/gtest.h>
+#include <sys/socket.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <atomic>
+#include <chrono>
+#include <filesystem>
+#include <future>
+#include <string>
+#include <thread>
+#include <vector>
+
+namespace {
+
+using namespace OvraPlatform;
+using namespace std::chrono_literals;
+
+Json::Value echo(const LocalCall &call) {
+    Json::Value data;
+    data["api"] = call.api;
+    data["version"] = call.version;
+    data["method"] = call.method;
+    data["params"] = call.params;
+    data["user"] = call.user;
+    return apiSuccess(data);
+}
+
+int codeOf(const Json::Value &reply) {
+    return reply["success"].asBool() ? 0 : reply["error"]["code"].asInt();
+}
+
+Json::Value ask(const char *method = "get", const Json::Value &params = Json::Value()) {
+    Json::Value out;
+    OVRA::APIRunner().Exec(out, "Test", 1, method, params, "admin");
+    return out;
+}
+
+UniqueFd connectRaw() {
+    UniqueFd fd(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+    return connectLocal(fd.get(), *localAddress(kSocketFile)) ? std::move(fd) : UniqueFd();
+}
+
+/// What the server answers to these bytes; "" when it just hangs up.
+std::string answerTo(const std::string &bytes) {
+    const UniqueFd fd = connectRaw();
+    send(fd.get(), bytes.data(), bytes.size(), MSG_NOSIGNAL);
+    shutdown(fd.get(), SHUT_WR);
+    return receiveFrame(fd.get(), std::chrono::steady_clock::now() + 5s).value_or("");
+}
+
+class LocalCallScene : public OvraTest::OwnFiles {
+protected:
+    void SetUp() override {
+        ASSERT_NO_FATAL_FAILURE(OwnFiles::SetUp());
+        std::filesystem::remove_all(kStateDir);
+    }
+
+    std::string why_;
+};
+
+TEST_F(LocalCallScene, carriesTheWholeCallAndTheWholeReply) {
+    LocalServer server(kSocketFile, echo);
+    ASSERT_TRUE(server.start(why_)) << why_;
+    Json::Value params;
+    params["text"] = std::string(100'000, 'x') + "\n\xC3\xA9";
+    const Json::Value out = ask("get", params);
+    EXPECT_EQ(out["data"]["api"], "Test");
+    EXPECT_EQ(out["data"]["version"], 1);
+    EXPECT_EQ(out["data"]["method"], "get");
+    EXPECT_EQ(out["data"]["params"], params);
+    EXPECT_EQ(out["data"]["user"], "admin");
+    EXPECT_EQ(OvraTest::modeOf(kSocketFile), 0600U);
+    EXPECT_EQ(OvraTest::modeOf(kStateDir), 0700U);
+}
+
+TEST_F(LocalCallScene, saysSoWhenNoDaemonRuns) {
+    Json::Value out;
+    EXPECT_FALSE(OVRA::APIRunner().Exec(out, "Test", 1, "get", Json::Value(), "admin"));
+    EXPECT_EQ(codeOf(out), APIError::kInternal);
+    EXPECT_NE(out["error"]["msg"].asString().find("ovradrd does not answer"), std::string::npos);
+}
+
+TEST_F(LocalCallScene, saysSoWhenTheDaemonDiesDuringTheCall) {
+    OvraTest::OtherProcess daemon([this] {
+        LocalServer server(kSocketFile, [](const LocalCall &) -> Json::Value { _exit(9); });
+        server.start(why_);
+        pause();
+        return 0;
+    });
+    while (!connectRaw()) {
+        std::this_thread::sleep_for(10ms);
+    }
+    EXPECT_EQ(codeOf(ask()), APIError::kInternal);
+}
+
+TEST_F(LocalCallScene, replacesTheSocketOfADeadDaemonOnly) {
+    {
+        OvraTest::OtherProcess daemon([this] {
+            LocalServer server(kSocketFile, echo);
+            server.start(why_);
+            pause();
+            return 0;
+        });
+        while (!connectRaw()) {
+            std::this_thread::sleep_for(10ms);
+        }
+        LocalServer second(kSocketFile, echo);
+        EXPECT_FALSE(second.start(why_));
+        EXPECT_EQ(codeOf(ask()), 0) << "the first must go on answering";
+        daemon.end(SIGKILL);
+    }
+    LocalServer server(kSocketFile, echo);
+    ASSERT_TRUE(server.start(why_)) << why_;
+    EXPECT_EQ(codeOf(ask()), 0);
+}
+
+TEST_F(LocalCallScene, takesNoPlaceThatIsNotItsOwn) {
+    ASSERT_TRUE(ensureStateDir());
+    OvraTest::writeFile(kSocketFile, "precious");
+    LocalServer onFile(kSocketFile, echo);
+    EXPECT_FALSE(onFile.start(why_));
+    EXPECT_EQ(OvraTest::readFile(kSocketFile), "precious");
+
+    LocalServer tooLong(path(std::string(120, 'x')), echo);
+    EXPECT_FALSE(tooLong.start(why_));
+    EXPECT_NE(why_.find("too long"), std::string::npos) << why_;
+}
+
+TEST_F(LocalCallScene, refusesTheProcessesOfOtherUsers) {
+    if (geteuid() != 0) {
+        GTEST_SKIP() << "only root can become another user";
+    }
+    LocalServer server(kSocketFile, echo);
+    ASSERT_TRUE(server.start(why_)) << why_;
+    // The modes alone would keep them out: open them, so that the peer check has to.
+    ASSERT_EQ(chmod(kStateDir, 0755), 0);
+    ASSERT_EQ(chmod(kSocketFile, 0666), 0);
+    OvraTest::OtherProcess stranger([] {
+        constexpr uid_t kNobody = 65534;
+        return setuid(kNobody) == 0 ? codeOf(ask()) : -1;
+    });
+    EXPECT_EQ(stranger.wait(), APIError::kNoPermission);
+}
+
+TEST_F(LocalCallScene, survivesRubbish) {
+    LocalServer server(kSocketFile, echo);
+    ASSERT_TRUE(server.start(why_)) << why_;
+    const std::string four("\0\0\0\4", 4);
+    EXPECT_EQ(answerTo(""), "");
+    EXPECT_EQ(answerTo(std::string("\0\0", 2)), "");
+    EXPECT_EQ(answerTo(std::string("\xFF\xFF\xFF\xFF rubbish", 12)), "");
+    EXPECT_EQ(answerTo(four + "xy"), "");
+    for (const char *text : {"GET ", "[{}]", "null"}) {
+        Json::Value reply;
+        ASSERT_TRUE(OvraDRCore::fromString(reply, answerTo(four + text))) << text;
+        EXPECT_EQ(codeOf(reply), APIError::kBadRequest) << text;
+    }
+    EXPECT_EQ(codeOf(ask()), 0);
+}
+
+TEST_F(LocalCallScene, answersForAHandlerThatFails) {
+    LocalServer server(kSocketFile, [](const LocalCall &call) {
+        if (call.method == "throw") {
+            throw std::runtime_error("broken");
+        }
+        return apiSuccess(std::string(kMaxFrame, 'x'));
+    });
+    ASSERT_TRUE(server.start(why_)) << why_;
+    EXPECT_EQ(codeOf(ask("throw")), APIError::kInternal);
+    EXPECT_EQ(codeOf(ask("flood")), APIError::kTooLarge);
+}
+
+TEST_F(LocalCallScene, servesMoreCallersThanItHasThreads) {
+    std::atomic<int> running{0};
+    std::atomic<int> most{0};
+    LocalServer server(
+        kSocketFile,
+        [&](const LocalCall &call) {
+            const int now = ++running;
+            int seen = most;
+            while (seen < now && !most.compare_exchange_weak(seen, now)) {
+            }
+            std::this_thread::sleep_for(5ms);
+            --running;
+            return echo(call);
+        },
+        2);
+    ASSERT_TRUE(server.start(why_)) << why_;
+    std::vector<std::future<Json::Value>> callers;
+    for (int i = 0; i < 20; ++i) {
+        callers.push_back(std::async(std::launch::async, [] { return ask(); }));
+    }
+    for (auto &caller : callers) {
+        EXPECT_EQ(codeOf(caller.get()), 0);
+    }
+    EXPECT_EQ(most, 2);
+}
+
+TEST_F(LocalCallScene, stopsAtOnceButAnswersTheCallUnderWay) {
+    std::promise<void> entered;
+    LocalServer server(kSocketFile, [&](const LocalCall &call) {
+        entered.set_value();
+        std::this_thread::sleep_for(200ms);
+        return echo(call);
+    });
+    ASSERT_TRUE(server.start(why_)) << why_;
+    const UniqueFd idle = connectRaw(); // says nothing, and must not hold up the stop
+    auto caller = std::async(std::launch::async, [] { return ask(); });
+    entered.get_future().wait();
+    const auto begin = std::chrono::steady_clock::now();
+    server.stop();
+    EXPECT_LT(std::chrono::steady_clock::now() - begin, 2s);
+    EXPECT_EQ(codeOf(caller.get()), 0);
+    EXPECT_NE(access(kSocketFile, F_OK), 0) << "the socket file must be gone";
+}
+
+} // namespace

@@ -1,0 +1,23 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include <string>
+
+namespace OvraTest {
+
+inline constexpr const char *kNodeDatabase = "/usr/ovra/etc/ovradr/node.db";
+inline constexpr const char *kIdentityFile = "/usr/ovra/etc/ovradr/node.info";
+
+/// Makes the folders and the node database of the view that the test runs in, as set-up would.
+void provisionNode();
+
+/// Runs statements on the node database behind the library's back.
+void executeSql(const std::string &sql);
+/// The rows of a query, columns joined by '|', rows by '\n'.
+std::string querySql(const std::string &sql);
+
+/// Adds a row to a credential table.
+void addCred(const std::string &table, const std::string &nodeId, const std::string &credId,
+             const std::string &protocol, int port, const std::string &session);
+
+} // namespace OvraTest

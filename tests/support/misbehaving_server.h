@@ -1,0 +1,106 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include <chrono>
+#include <functional>
+#include <memory>
+#include <string>
+#include <vector>
+
+namespace OvraTest {
+
+/// What the server does once it has read a request: bytes, their pace, and what comes after.
+struct Answer {
+    enum class Ending { kKeep, kClose, kHang };
+
+    std::string bytes;
+    std::chrono::milliseconds pausePerByte{0};
+    Ending ending = Ending::kKeep;
+
+    /// A whole HTTP answer; the connection stays open.
+    static Answer http(int status, const std::string &type, const std::string &body,
+                       const std::string &headers = "");
+    static Answer json(const std::string &document);
+    /// {"success":true,"data":DATA}
+    static Answer success(const std::string &data = "{}");
+    static Answer html();
+    static Answer empty();
+    static Answer status(int status);
+    static Answer redirect(const std::string &url);
+    /// Nothing, for ever.
+    static Answer silence();
+    /// Closes without a byte.
+    static Answer closed();
+    /// Promises `document` and closes in the middle.
+    static Answer truncated(const std::string &document);
+    /// A body of that many bytes. \param announced  its length stands in the header
+    static Answer huge(std::size_t size, bool announced);
+    /// A good answer, a byte at a time.
+    static Answer drip(std::chrono::milliseconds pausePerByte);
+    /// These bytes and nothing else, then closes.
+    static Answer raw(const std::string &bytes);
+};
+
+/// A request as it arrived.
+struct Received {
+    std::string method;
+    std::string path;
+    std::string headers; ///< as they came, lines ended by \r\n
+    std::string body;
+    int connection = 0; ///< counted from 1
+};
+
+/// An HTTP server on loopback that does what it is told, for tests of those who have to cope.
+///
+///     MisbehavingServer server({.tls = true});
+///     server.answer(Answer::html());
+///     ... send to 127.0.0.1, server.port() ...
+///     EXPECT_EQ(server.requests().size(), 1U);
+///
+/// Threads serve the connections until the object goes. Every operation may be called at any time.
+class MisbehavingServer {
+public:
+    struct Options {
+        bool tls = false;
+        std::string address = "127.0.0.1";
+    };
+    using Responder = std::function<Answer(const Received &)>;
+
+    explicit MisbehavingServer(Options options);
+    MisbehavingServer()
+        : MisbehavingServer(Options()) {}
+    ~MisbehavingServer();
+
+    int port() const;
+    /// "SHA256:..." of the key of its present certificate; made with OpenSSL alone.
+    std::string fingerprint() const;
+
+    /// The answer to every request from now on; at first it is Answer::success().
+    void answer(Answer answer);
+    /// The answer to the next request only; several are used in order, before answer().
+    void answerOnce(Answer answer);
+    /// Computes every answer from now on.
+    void answerWith(Responder responder);
+
+    /// A new key and certificate for the connections to come.
+    void changeCertificate();
+    /// Accepts connections from now on, and says nothing on them, not even TLS.
+    void fallSilent();
+    /// Closes every open connection.
+    void closeConnections();
+    /// Closes the port: who connects is refused.
+    void refuse();
+
+    std::vector<Received> requests() const;
+    /// How many connections were accepted.
+    int connections() const;
+
+private:
+    struct Impl;
+    std::unique_ptr<Impl> impl_;
+};
+
+/// A port on 127.0.0.1 where nobody listens.
+int unusedPort();
+
+} // namespace OvraTest

@@ -1,0 +1,33 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include <openssl/evp.h>
+#include <openssl/x509.h>
+
+#include <memory>
+#include <string>
+
+namespace OvraTest {
+
+/// A fresh P-256 key with a certificate that it signed itself, valid for an hour.
+class TestCertificate {
+public:
+    /// \param names  as OpenSSL writes a subjectAltName, e.g. "DNS:localhost,IP:127.0.0.1"
+    explicit TestCertificate(const std::string &names = "DNS:localhost,IP:127.0.0.1");
+
+    EVP_PKEY *key() const { return key_.get(); }
+    X509 *certificate() const { return certificate_.get(); }
+
+private:
+    struct FreeKey {
+        void operator()(EVP_PKEY *key) const { EVP_PKEY_free(key); }
+    };
+    struct FreeCertificate {
+        void operator()(X509 *certificate) const { X509_free(certificate); }
+    };
+
+    std::unique_ptr<EVP_PKEY, FreeKey> key_;
+    std::unique_ptr<X509, FreeCertificate> certificate_;
+};
+
+} // namespace OvraTest
