@@ -1,0 +1,69 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include "ovradrcore/sqlite_value.h"
+#include "ovradrnode/export.h"
+
+#include <json/value.h>
+
+#include <string>
+#include <vector>
+
+namespace OvraDRNode {
+
+/// Whether `protocol` is one of the words "http", "https" and "flk" (relay), exactly.
+OVRADRNODE_EXPORT bool isValidProtocol(const std::string &protocol);
+
+/// How a node's web API is reached: over plain HTTP, over HTTPS, or through the relay service.
+/// A small value; nothing is validated until isValid() is asked. Nothing here throws.
+class OVRADRNODE_EXPORT Conn : public OvraDRCore::SqliteRecord {
+public:
+    /// Of the columns "addr", "protocol" (text) and "port" (integer), those that are listed.
+    OvraDRCore::SqliteValueList
+    ToSqliteValues(const std::vector<std::string> &fields) const override;
+    /// Loads whichever of the three columns the row has; false when it has none.
+    bool FromSqliteValues(const OvraDRCore::SqliteValueList &row) override;
+    std::vector<std::string> ListSqliteField() const override;
+
+    /// Invalid: no address, no protocol, port -1.
+    Conn() = default;
+    Conn(const std::string &addr, const std::string &protocol, int port);
+    Conn(const Conn &) = default;
+    Conn &operator=(const Conn &) = default;
+
+    static Conn http(const std::string &addr, int port);
+    static Conn https(const std::string &addr, int port);
+    /// The endpoint behind the relay server alias; its port, 443, stands for no route.
+    static Conn farlink(const std::string &alias);
+
+    bool isFarlink() const;
+    /// An address, a known protocol and, except for a relay endpoint, a port.
+    bool isValid() const;
+
+    bool operator==(const Conn &other) const;
+    bool operator!=(const Conn &other) const { return !(*this == other); }
+
+    /// Members "addr", "protocol" and "port".
+    Json::Value toJson() const;
+    /// The endpoint that `value` describes; an invalid one, and a WARN line, when a member is
+    /// missing or of the wrong type.
+    static Conn fromJson(const Json::Value &value);
+
+    /// The endpoints at which this appliance serves: HTTPS and HTTP of every address, then the
+    /// relay endpoint when the relay service is enabled. What cannot be found out is left out.
+    static std::vector<Conn> listLocal();
+    /// `addr` with the appliance's HTTP or HTTPS port.
+    static Conn localHttp(const std::string &addr);
+    static Conn localHttps(const std::string &addr);
+    /// Invalid when the relay service is not enabled.
+    static Conn localFarlink();
+    /// The direct endpoint behind a relay endpoint (asks the relay service); any other endpoint
+    /// comes back unchanged. Invalid when the relay does not know it.
+    static Conn translateFarlink(const Conn &conn);
+
+    std::string addr;
+    std::string protocol;
+    int port = -1;
+};
+
+} // namespace OvraDRNode

@@ -1,0 +1,47 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include "ovradrcore/cache.h"
+#include "ovradrcore/request.h"
+#include "ovradrnode/export.h"
+
+#include <json/value.h>
+
+#include <string>
+
+namespace OvraDRNode {
+
+/// Whether a credential has the right to operate on its node: noted after every attempt over it,
+/// and asked of the node again after 3 seconds.
+class OVRADRNODE_EXPORT CredPermissionCache : public OvraDRCore::Cache {
+public:
+    ~CredPermissionCache() override;
+    Json::Value GetInfo() const override;
+    bool GetUpdatedData(Json::Value &value) const override;
+    bool IsValid(const Json::Value &value) const override;
+    bool IsUpdatedDataRequired() const override;
+
+    explicit CredPermissionCache(const std::string &credId);
+
+    /// A value that is no verdict counts as having the right.
+    bool HasPrivilege(const Json::Value &value) const;
+    /// May ask the node.
+    bool HasPrivilege() const;
+    /// Never asks the node.
+    bool GetCachedHasPrivilege() const;
+
+    // These store a verdict; false when it could not be stored (an empty id never is).
+    bool SetCacheData(bool has) const;
+    bool SetHasPrivilege() const;
+    /// \param request  what was refused; a relayed test of the right says nothing about this
+    ///                 credential and is not stored
+    bool SetNoPrivilege(const OvraDRCore::Request &request) const;
+    bool SetPrivilege(const OvraDRCore::Request &request, bool has) const;
+    bool UpdateWithData(const Json::Value &value) const;
+    bool UpdateWithData(const Json::Value &value, long start, long end) const;
+
+private:
+    std::string credId;
+};
+
+} // namespace OvraDRNode

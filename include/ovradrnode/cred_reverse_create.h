@@ -1,0 +1,65 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include "ovradrcore/err_recorder.h"
+#include "ovradrcore/request.h"
+#include "ovradrcore/response.h"
+#include "ovradrnode/conn.h"
+#include "ovradrnode/dr_node.h"
+#include "ovradrnode/export.h"
+
+#include <json/value.h>
+
+#include <string>
+#include <vector>
+
+namespace OvraDRNode {
+
+/// Has a remote node make a credential back to this one, over a credential that this node holds:
+/// the remote picks one of the endpoints offered, gets a short-lived local session, and creates its
+/// credential with the two. setCredId(), setLocalAccount(), addLocalConns(), then check() or
+/// process(). Nothing is written here; the temporary session is always deleted again.
+class OVRADRNODE_EXPORT CredReverseCreate : public OvraDRCore::ErrRecorder {
+public:
+    ~CredReverseCreate() override;
+    /// Asks the remote node to create its credential.
+    virtual bool relayCreate(const Conn &conn, const std::string &session);
+
+    // Setters record no code.
+    bool setCredId(const std::string &credId);
+    bool setLocalAccount(const std::string &account);
+    void setCredInfo(const Json::Value &info) { credInfo = info; }
+    bool addLocalConn(const Conn &conn);
+    /// In order, up to the first that is refused.
+    bool addLocalConns(const std::vector<Conn> &conns);
+    bool checkParameter() const;
+    OvraDRCore::Response sendReq(const OvraDRCore::Request &request) const;
+    /// Learns which of the endpoints offered the remote node can reach (522 when its answer is
+    /// none).
+    bool testAvailableConn(Conn &conn) const;
+    /// The whole flow, except that the remote only checks.
+    bool check();
+    /// The whole flow. The result is whether an error was recorded.
+    bool process();
+
+    /// What the remote node reported about the credential that it made.
+    const Json::Value &getCredInfo() const { return credInfo; }
+
+private:
+    template <typename Step>
+    bool withTempSession(const char *function, Step step);
+
+    std::string localAccount;
+    DRNode record;
+    std::vector<Conn> localConns;
+    Json::Value credInfo;
+};
+
+/// The same for a temporary credential on the remote side.
+class OVRADRNODE_EXPORT TempCredReverseCreate : public CredReverseCreate {
+public:
+    ~TempCredReverseCreate() override;
+    bool relayCreate(const Conn &conn, const std::string &session) override;
+};
+
+} // namespace OvraDRNode

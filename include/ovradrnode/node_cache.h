@@ -1,0 +1,35 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include "ovradrcore/cache.h"
+#include "ovradrnode/export.h"
+
+#include <json/value.h>
+
+#include <string>
+
+namespace OvraDRNode {
+
+/// What a node says about itself (host name, serial number, time zone), asked again after 60
+/// seconds (5 for the local node). A node that cannot be reached keeps what it said last.
+class OVRADRNODE_EXPORT NodeCache : public OvraDRCore::Cache {
+public:
+    ~NodeCache() override;
+    Json::Value GetInfo() const override;
+    bool GetUpdatedData(Json::Value &value) const override;
+    bool IsValid(const Json::Value &value) const override;
+
+    /// \param flag  whether a reader waits for a refresh that another process is doing; always so
+    ///              for the local node
+    NodeCache(const std::string &nodeId, bool flag);
+
+    // Each is "" when unknown; may ask the node.
+    std::string GetHostName() const;
+    std::string GetSerialNum() const;
+    std::string GetTimeZone() const;
+
+private:
+    std::string nodeId;
+};
+
+} // namespace OvraDRNode

@@ -1,0 +1,89 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include "ovradrcore/err_recorder.h"
+#include "ovradrcore/request.h"
+#include "ovradrcore/response.h"
+#include "ovradrcore/sqlite_command.h"
+#include "ovradrnode/conn.h"
+#include "ovradrnode/dr_node.h"
+#include "ovradrnode/export.h"
+#include "ovradrnode/sender.h"
+
+#include <string>
+
+namespace OvraDRNode {
+
+/// Makes a credential: proves itself to the remote node, asks it who it is and for a session, and
+/// stores the record. Construct, call one setCred() form, then process() (or check()); on false
+/// read GetErr(). Nothing is written here before the last step; a session that the remote granted
+/// is not given back when that step fails.
+class OVRADRNODE_EXPORT CredCreate : public OvraDRCore::ErrRecorder {
+public:
+    ~CredCreate() override;
+    /// The request for the remote session of this kind of credential.
+    virtual OvraDRCore::Request getSessionRequestAPI() const = 0;
+    /// The table that the record goes to.
+    virtual OvraDRCore::SqliteTableHandler getCredTableHandler() const = 0;
+
+    CredCreate() = default;
+    CredCreate(const CredCreate &) = delete;
+    CredCreate &operator=(const CredCreate &) = delete;
+
+    /// Checks and probes the endpoint (401, 500).
+    bool setConn(const Conn &conn);
+    /// Takes ownership of a sender that is ready to use (403 for null).
+    bool setSender(BaseSender *newSender);
+    /// Initialises the sender (a login, for an account) and takes ownership of it; it is deleted
+    /// when that fails.
+    bool setCredSender(BaseCredSender *newSender);
+    void clearSender();
+    bool setCredAccount(const std::string &newAccount);
+
+    /// Proves itself by a login. `otp` may be empty.
+    bool setCred(const Conn &conn, const std::string &newAccount, const std::string &password,
+                 const std::string &otp);
+    /// Proves itself by a session that the remote node granted before.
+    bool setCred(const Conn &conn, const std::string &session);
+    /// Proves itself by a credential that this node holds.
+    bool setCred(const std::string &credId);
+
+    bool checkParameter() const;
+    /// Whether the account works on the remote node; creates nothing.
+    bool check() const;
+    bool checkCredAccount() const;
+    /// The one way by which every remote request of the flow goes.
+    OvraDRCore::Response sendReq(const OvraDRCore::Request &request) const;
+    bool getRemoteNodeInfo();
+    bool requestRemoteSession();
+    bool queryCredAccountBySession(const std::string &session, std::string &foundAccount) const;
+    bool insertCredNodeRecord();
+    /// The whole creation.
+    bool process();
+
+    /// The record as far as it has been built.
+    const DRNode &getNode() const { return node; }
+
+private:
+    DRNode node;
+    std::string account;
+    BaseSender *sender = nullptr;
+};
+
+/// A credential that lasts: a session for this node's id, a row in "node_cred".
+class OVRADRNODE_EXPORT DRNodeCredCreate : public CredCreate {
+public:
+    ~DRNodeCredCreate() override;
+    OvraDRCore::Request getSessionRequestAPI() const override;
+    OvraDRCore::SqliteTableHandler getCredTableHandler() const override;
+};
+
+/// A credential for short-lived use: a temporary session, a row in "temp_cred".
+class OVRADRNODE_EXPORT TempCredCreate : public CredCreate {
+public:
+    ~TempCredCreate() override;
+    OvraDRCore::Request getSessionRequestAPI() const override;
+    OvraDRCore::SqliteTableHandler getCredTableHandler() const override;
+};
+
+} // namespace OvraDRNode

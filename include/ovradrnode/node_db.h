@@ -1,0 +1,88 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include "ovradrcore/sqlite_db.h"
+#include "ovradrnode/conn.h"
+#include "ovradrnode/dr_node.h"
+#include "ovradrnode/dr_node_attr.h"
+#include "ovradrnode/export.h"
+
+#include <string>
+#include <vector>
+
+namespace OvraDRNode {
+
+/// Credentials for reaching remote nodes.
+class OVRADRNODE_EXPORT NodeCredSqliteTable : public OvraDRCore::SqliteTableHandler {
+public:
+    NodeCredSqliteTable();
+    NodeCredSqliteTable(const NodeCredSqliteTable &) = default;
+    ~NodeCredSqliteTable() override;
+};
+
+/// Credentials for short-lived use, of the same shape.
+class OVRADRNODE_EXPORT TempCredSqliteTable : public OvraDRCore::SqliteTableHandler {
+public:
+    TempCredSqliteTable();
+    TempCredSqliteTable(const TempCredSqliteTable &) = default;
+    ~TempCredSqliteTable() override;
+};
+
+/// Attributes of nodes.
+class OVRADRNODE_EXPORT NodeAttrSqliteTable : public OvraDRCore::SqliteTableHandler {
+public:
+    NodeAttrSqliteTable();
+    NodeAttrSqliteTable(const NodeAttrSqliteTable &) = default;
+    ~NodeAttrSqliteTable() override;
+};
+
+/// The node database, opened for one statement. It has to have been provisioned (`ovradr setup`).
+class OVRADRNODE_EXPORT NodeDBHandler : public OvraDRCore::SqliteDB {
+public:
+    NodeDBHandler();
+    NodeDBHandler(NodeDBHandler &&) noexcept = default;
+    ~NodeDBHandler() override;
+
+    /// A new handler at every call.
+    static NodeDBHandler GetHandler();
+};
+
+/// The store over the node database. Every operation opens it for one statement and closes it
+/// again; a failure is a false result and an ERR line. The local node has no row: its id is
+/// answered with DRNode::getLocalNode().
+class OVRADRNODE_EXPORT DRNodeDB {
+public:
+    /// Which credential tables are read; both bits: node credentials first.
+    enum CredType { CRED_TYPE_NODE = 1, CRED_TYPE_TEMP = 2 };
+
+    /// Deletes every node credential of the node; its temporary ones stay.
+    static bool Delete(const std::string &nodeId);
+    /// Appends every credential. True even when a table could not be read (which is logged).
+    /// \param type  a CredType, or both bits
+    static bool List(std::vector<DRNode> &nodes, int type);
+    /// Appends the credentials of one node, like List(); false for an empty id.
+    static bool ListCred(const std::string &nodeId, std::vector<DRNode> &nodes, int type);
+    /// The first node credential of the node. A node without any gives true and a record that holds
+    /// the node id alone, which is not valid.
+    static bool Get(const std::string &nodeId, DRNode &node);
+    /// The credential with this id, from either table; false when there is none that is valid.
+    static bool GetCred(const std::string &credId, DRNode &node);
+    /// How many credentials the node has (temporary ones count only when there are no others); -1
+    /// on an error.
+    static int IsNodeIdExist(const std::string &nodeId);
+    /// Points a node credential to another endpoint. True also when no credential has this id.
+    static bool SetConn(const std::string &credId, const Conn &conn);
+
+    /// Reads one attribute; false when there is none.
+    static bool GetAttr(const std::string &nodeId, const std::string &app, const std::string &attr,
+                        std::string &value);
+    /// Appends the attributes that the application keeps about the node.
+    static bool ListAttr(const std::string &nodeId, const std::string &app,
+                         std::vector<DRNodeAttr> &attrs);
+    /// Adds or changes one attribute. The test whether it exists and the write are two statements.
+    static bool SetAttr(const DRNodeAttr &attr);
+    static bool SetAttr(const std::string &nodeId, const std::string &app, const std::string &attr,
+                        const std::string &value);
+};
+
+} // namespace OvraDRNode

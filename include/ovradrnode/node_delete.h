@@ -1,0 +1,24 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include "ovradrnode/export.h"
+
+#include <string>
+
+namespace OvraDRNode {
+
+/// Deletes a node credential: the row first, then, when no other credential uses it, the session on
+/// the remote node. A remote node that does not answer never blocks the deletion.
+class OVRADRNODE_EXPORT DRNodeCredDelete {
+public:
+    explicit DRNodeCredDelete(const std::string &credId);
+
+    bool DeleteRecord() const;
+    /// \return whether the row is gone; nothing else decides.
+    bool process();
+
+private:
+    std::string credId;
+};
+
+} // namespace OvraDRNode

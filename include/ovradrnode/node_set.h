@@ -1,0 +1,46 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include "ovradrcore/err_recorder.h"
+#include "ovradrnode/conn.h"
+#include "ovradrnode/dr_node.h"
+#include "ovradrnode/export.h"
+#include "ovradrnode/sender.h"
+
+#include <string>
+
+namespace OvraDRNode {
+
+/// Changes a node credential: a new login, perhaps over another endpoint, to the same node. The row
+/// is rewritten first; then the session that nothing uses any more is released. Construct with the
+/// credential id, setCred(), process().
+class OVRADRNODE_EXPORT DRNodeCredSet : public OvraDRCore::ErrRecorder {
+public:
+    DRNodeCredSet() = default;
+    /// Runs setCredId() and keeps its error.
+    explicit DRNodeCredSet(const std::string &credId);
+    DRNodeCredSet(const DRNodeCredSet &) = delete;
+    DRNodeCredSet &operator=(const DRNodeCredSet &) = delete;
+    ~DRNodeCredSet() override;
+
+    /// Loads the credential to change (401, 404, 516).
+    bool setCredId(const std::string &credId);
+    /// The new endpoint and login (500, 401, or what the login failed with).
+    bool setCred(const Conn &conn, const std::string &account, const std::string &password,
+                 const std::string &otp);
+    bool IsSessionChanged() const;
+    /// Whether the new login reaches the node that the credential belongs to (518 when another).
+    bool check();
+    bool checkRemoteNodeInfo();
+    bool requestRemoteSession();
+    bool setCredRecord();
+    /// The whole update.
+    bool process();
+
+private:
+    DRNode record;
+    CredAccountSender sender;
+    std::string newSession;
+};
+
+} // namespace OvraDRNode

@@ -1,0 +1,189 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include "ovradrcore/err_recorder.h"
+#include "ovradrcore/request.h"
+#include "ovradrcore/response.h"
+#include "ovradrnode/conn.h"
+#include "ovradrnode/dr_node.h"
+#include "ovradrnode/export.h"
+
+#include <json/value.h>
+
+#include <string>
+
+struct _tag_ovra_cred_;
+struct _tag_ovra_cred_sess_;
+
+namespace OVRA {
+class CredRequest;
+}
+
+namespace OvraDRNode {
+
+/// Carries a web-API request to a node. A failure is recorded in the sender (GetErrCode(),
+/// GetErrMsg()); nothing throws. A sender serves one thread at a time.
+class OVRADRNODE_EXPORT BaseSender : public OvraDRCore::ErrRecorder {
+public:
+    ~BaseSender() override;
+    virtual bool isValid() const = 0;
+    virtual OvraDRCore::Response process(const OvraDRCore::Request &request) = 0;
+
+    /// Runs `request` on the local appliance with the administrator's rights.
+    static OvraDRCore::Response run(const OvraDRCore::Request &request);
+    /// Probes the endpoint now (at most 10 seconds) and records the verdict for all processes.
+    static bool IsConnectable(const Conn &conn);
+    /// The recorded verdict; probes only when that is older than 5 seconds.
+    static bool GetCachedConnectable(const Conn &conn);
+};
+
+/// Sends to one endpoint under one credential.
+class OVRADRNODE_EXPORT BaseCredSender : public BaseSender {
+public:
+    ~BaseCredSender() override;
+    bool isValid() const override;
+    /// Logs in on first use, asks for the endpoint's verdict, sends. Nothing is sent to an endpoint
+    /// that is held unreachable (500).
+    OvraDRCore::Response process(const OvraDRCore::Request &request) override;
+    virtual bool initCred() = 0;
+    virtual void doClear() = 0;
+    virtual bool isCredValid() const = 0;
+
+    BaseCredSender();
+    explicit BaseCredSender(const Conn &conn);
+    BaseCredSender(const BaseCredSender &) = delete;
+    BaseCredSender &operator=(const BaseCredSender &) = delete;
+
+    /// Takes the endpoint, translated when it is a relay endpoint; an invalid one is refused and
+    /// the old one stays.
+    bool setConn(const Conn &value);
+    const Conn &getConn() const { return conn; }
+    /// Puts the endpoint into the credential.
+    bool initConn() const;
+    /// Makes the credential usable: allocated, filled, and logged in where that applies.
+    bool init();
+    /// Back to the state before init().
+    void clear();
+    /// Records the error of the credential library; a connection failure marks the endpoint as
+    /// unreachable for all processes.
+    void SetCredRequestError(OVRA::CredRequest &request) const;
+
+protected:
+    _tag_ovra_cred_ *cred = nullptr;
+    _tag_ovra_cred_sess_ *credSess = nullptr;
+    Conn conn;
+    bool inited = false;
+
+private:
+    void freeHandles();
+    OvraDRCore::Response send(const OvraDRCore::Request &request, const char *function) const;
+};
+
+/// Logs in with account, password and one-time code before the first request, and out at the end.
+class OVRADRNODE_EXPORT CredAccountSender : public BaseCredSender {
+public:
+    ~CredAccountSender() override;
+    bool initCred() override;
+    void doClear() override;
+    bool isCredValid() const override;
+
+    CredAccountSender() = default;
+    CredAccountSender(const Conn &conn, const std::string &account, const std::string &passwd,
+                      const std::string &otp);
+    CredAccountSender(const std::string &account, const std::string &passwd,
+                      const std::string &otp);
+
+    /// False, changing nothing, when account or password is empty; `otp` may be.
+    bool setCred(const std::string &newAccount, const std::string &newPasswd,
+                 const std::string &newOtp);
+    bool login();
+    void logout();
+
+private:
+    bool loggedIn = false;
+    std::string account;
+    std::string passwd;
+    std::string otp;
+};
+
+/// Uses a session that the remote node granted earlier.
+class OVRADRNODE_EXPORT CredSessionSender : public BaseCredSender {
+public:
+    ~CredSessionSender() override;
+    bool initCred() override;
+    void doClear() override;
+    bool isCredValid() const override;
+
+    explicit CredSessionSender(const Conn &conn);
+    CredSessionSender(const Conn &conn, const std::string &session);
+
+    /// False when empty.
+    bool setCred(const std::string &newSession);
+
+private:
+    std::string session;
+};
+
+/// Sends to a node: locally when it is the local one, otherwise over the credential that worked
+/// last, then over every other credential of the node, until one gets through.
+class OVRADRNODE_EXPORT NodeSender : public BaseSender {
+public:
+    ~NodeSender() override;
+    bool isValid() const override;
+    OvraDRCore::Response process(const OvraDRCore::Request &request) override;
+
+    explicit NodeSender(const std::string &nodeId);
+
+    /// False when empty.
+    bool setNode(const std::string &id);
+    bool setNode(const DRNode &node);
+    /// Builds the request, sends it to `nodeId` and copies the answer's data into `out`.
+    /// \return whether an answer came; an error answer gives the empty object.
+    static bool process(const std::string &nodeId, const std::string &api,
+                        const std::string &method, int version, const Json::Value &params,
+                        Json::Value &out);
+    /// One attempt over one credential; true when the answer got through: it is valid, and not the
+    /// remote's refusal for lack of permission.
+    bool processByCred(const DRNode &node, const OvraDRCore::Request &request,
+                       OvraDRCore::Response &response);
+    bool processByCredId(const std::string &credId, const OvraDRCore::Request &request,
+                         OvraDRCore::Response &response);
+    /// The first node credential that has the right; "" when none has.
+    std::string getValidCredId() const;
+    /// The credential that worked last; looked for anew after 5 seconds.
+    std::string getCachedCredId() const;
+    /// Whether the node answers over any of its node credentials, probed now.
+    bool isConnectable() const;
+
+private:
+    std::string nodeId;
+};
+
+/// Sends over exactly one stored credential and keeps the verdict on its right up to date.
+class OVRADRNODE_EXPORT CredNodeSender : public BaseSender {
+public:
+    ~CredNodeSender() override;
+    bool isValid() const override;
+    OvraDRCore::Response process(const OvraDRCore::Request &request) override;
+
+    explicit CredNodeSender(const DRNode &node);
+    explicit CredNodeSender(const std::string &credId);
+
+    bool setCred(const DRNode &value);
+    bool setCred(const std::string &credId);
+    const DRNode &getNode() const { return node; }
+    /// Whether the credential has the right on its node; asks the node when the verdict is older
+    /// than 3 seconds.
+    bool testPrivilege();
+
+    using BaseSender::GetCachedConnectable;
+    using BaseSender::IsConnectable;
+    /// As for the record's endpoint; the local node is always connectable.
+    static bool IsConnectable(const DRNode &node);
+    static bool GetCachedConnectable(const DRNode &node);
+
+private:
+    DRNode node;
+};
+
+} // namespace OvraDRNode

@@ -1,0 +1,102 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "ovradrnode/operation_dispatcher.h"
+
+#include "ovradrcore/log.h"
+#include "ovradrnode/node_db.h"
+#include "ovradrnode/sender.h"
+
+namespace OvraDRNode {
+
+namespace ERR = OvraDRCore::ERR;
+using OvraDRCore::Response;
+
+NodeOperationDispatcher::NodeOperationDispatcher() = default;
+
+NodeOperationDispatcher::NodeOperationDispatcher(const std::string &nodeId_)
+    : nodeId(nodeId_) {}
+
+NodeOperationDispatcher::~NodeOperationDispatcher() = default;
+
+bool NodeOperationDispatcher::SetNodeId(const std::string &id) {
+    nodeId = id;
+    return true;
+}
+
+std::string NodeOperationDispatcher::GetCredId() const {
+    return {};
+}
+
+bool NodeOperationDispatcher::IsLocalNode() const {
+    return DRNode::isLocalNodeId(nodeId);
+}
+
+bool NodeOperationDispatcher::IsRemoteNode() const {
+    return !nodeId.empty() && !DRNode::isLocalNodeId(nodeId);
+}
+
+bool NodeOperationDispatcher::HasPrivilege() const {
+    return IsLocalNode() || DRNodeDB::IsNodeIdExist(nodeId) > 0;
+}
+
+bool NodeOperationDispatcher::Run() {
+    if (!IsValidParam()) {
+        OVRA_ERR("Bad Parameter");
+        SetErr(ERR::kBadParameter);
+        return false;
+    }
+    if (IsLocalNode()) {
+        return RunLocal();
+    }
+    if (HasPrivilege()) {
+        return RemoteRun();
+    }
+    OVRA_ERR("Runner [%s] is not privilege node", nodeId.c_str());
+    SetErr(ERR::kUnknownNode);
+    return false;
+}
+
+bool NodeOperationDispatcher::RemoteRun() {
+    const std::string credId = GetCredId();
+    return credId.empty() ? RunNodeSender() : RunCredNodeSender(credId);
+}
+
+bool NodeOperationDispatcher::RunNodeSender() {
+    NodeSender sender(nodeId);
+    const Response response = sender.process(GetRequest());
+    if (response.isSuccess()) {
+        result = response.getData();
+        return true;
+    }
+    if (sender.GetErrCode() != ERR::kNone) {
+        SetErr(&sender);
+    } else {
+        SetErr(response.getErrCode(), response.getErrMsg());
+    }
+    return false;
+}
+
+bool NodeOperationDispatcher::RunCredNodeSender(const std::string &credId) {
+    DRNode node;
+    if (!DRNodeDB::GetCred(credId, node)) {
+        SetErr(ERR::kNodeInfoFailed);
+        return false;
+    }
+    if (node.nodeId != nodeId) {
+        SetErr(ERR::kOtherNode);
+        return false;
+    }
+    CredNodeSender sender(node);
+    const Response response = sender.process(GetRequest());
+    if (sender.GetErrCode() != ERR::kNone) {
+        SetErr(&sender);
+        return false;
+    }
+    if (!response.isSuccess()) {
+        SetErr(response.getErrCode(), response.getErrMsg());
+        return false;
+    }
+    result = response.getData();
+    return true;
+}
+
+} // namespace OvraDRNode

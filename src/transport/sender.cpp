@@ -1,0 +1,47 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "ovradrnode/sender.h"
+
+#include "ovradrcore/json.h"
+#include "ovradrcore/log.h"
+#include "transport/conn_cache.h"
+#include "words.h"
+
+#include <ovrawebapi/api_runner.h>
+
+#include <ctime>
+
+namespace OvraDRNode {
+
+using OvraDRCore::Request;
+using OvraDRCore::Response;
+
+BaseSender::~BaseSender() = default;
+
+Response BaseSender::run(const Request &request) {
+    Json::Value reply;
+    OVRA::APIRunner().Exec(reply, request.getAPI().c_str(), request.getVersion(),
+                           request.getMethod().c_str(), request.getParams(), Word::kLocalUser);
+    return Response(reply);
+}
+
+bool BaseSender::IsConnectable(const Conn &conn) {
+    const std::time_t start = std::time(nullptr);
+    const ProbeResult probe = IsConnectableWithErrCheck(conn);
+    const std::time_t end = std::time(nullptr);
+    if (!probe.ran) {
+        OVRA_NOTICE("Failed to check connectable of conn[%s]",
+                    OvraDRCore::toString(conn.toJson()).c_str());
+    }
+    const ConnCache cache(conn);
+    cache.logChange(__func__, cache.getStoredVerdict(), probe.connectable);
+    cache.UpdateWithData(probe.connectable, start, end);
+    return probe.connectable;
+}
+
+bool BaseSender::GetCachedConnectable(const Conn &conn) {
+    const ConnCache cache(conn);
+    const Json::Value verdict = cache.Read();
+    return !cache.IsValid(verdict) || verdict.asBool();
+}
+
+} // namespace OvraDRNode

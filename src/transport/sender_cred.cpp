@@ -1,0 +1,351 @@
+// SPDX-License-Identifier: Apache-2.0
+#define OVRA_LOG_FILE "sender"
+
+// Senders over one endpoint and one credential.
+
+#include "ovradrcore/json.h"
+#include "ovradrcore/log.h"
+#include "ovradrnode/sender.h"
+#include "transport/conn_cache.h"
+
+#include <ovracredential/cred_request.h>
+
+#include <cstring>
+
+namespace OvraDRNode {
+
+namespace ERR = OvraDRCore::ERR;
+using OvraDRCore::LogLevel;
+using OvraDRCore::Request;
+using OvraDRCore::Response;
+
+namespace {
+
+/// Error numbers of the credential library that have a code of their own.
+constexpr int kLibraryNoPermission = 4;
+constexpr int kLibraryCannotConnect = 5;
+constexpr int kLibraryCertificate = 6;
+constexpr int kLibraryTimedOut = 10;
+
+constexpr int kSealParameters = 2;
+constexpr int kSend = 0;
+
+/// The remote's answer to a request for which the session has no right.
+constexpr int kRemoteNoPermission = 105;
+/// Remote log-in codes 400 to 404 are 501 to 505 here.
+constexpr int kFirstLoginCode = 400;
+constexpr int kLastLoginCode = 404;
+
+std::string text(const Conn &conn) {
+    return OvraDRCore::toString(conn.toJson());
+}
+
+std::string text(const Request &request) {
+    return OvraDRCore::toLogString(request.toJson());
+}
+
+bool CreateOvraWebAPIRequest(OVRA::CredRequest &credRequest, OVRACred *cred, OVRACredSess *sess,
+                             const Request &request) {
+    if (OVRA::CredRequest::CreateWebAPIRequest(credRequest, cred, sess, request.getAPI(),
+                                               request.getVersion(), request.getMethod(),
+                                               request.getParams()) == 0) {
+        OVRA_DEBUG("Failed to create cred request for request[%s]", text(request).c_str());
+        return false;
+    }
+    return true;
+}
+
+int loginError(int remoteCode) {
+    const bool listed = remoteCode >= kFirstLoginCode && remoteCode <= kLastLoginCode;
+    return listed ? ERR::kLoginFailed + (remoteCode - kFirstLoginCode) : ERR::kLoginFailed;
+}
+
+} // namespace
+
+BaseCredSender::BaseCredSender() = default;
+
+BaseCredSender::BaseCredSender(const Conn &conn_) {
+    setConn(conn_);
+}
+
+BaseCredSender::~BaseCredSender() {
+    freeHandles();
+}
+
+bool BaseCredSender::isValid() const {
+    return isCredValid() && conn.isValid();
+}
+
+bool BaseCredSender::setConn(const Conn &value) {
+    const Conn direct = Conn::translateFarlink(value);
+    if (!direct.isValid()) {
+        return false;
+    }
+    conn = direct;
+    return true;
+}
+
+bool BaseCredSender::initConn() const {
+    if (!conn.isValid()) {
+        SetErr(ERR::kBadParameter, "conn");
+        return false;
+    }
+    if (OVRACredItemSetProtocol(cred, conn.protocol.c_str()) != 0 ||
+        OVRACredItemSetHost(cred, conn.addr.c_str()) != 0 ||
+        OVRACredItemSetPort(cred, conn.port) != 0) {
+        SetErr(ERR::kCredItemRefused);
+        return false;
+    }
+    return true;
+}
+
+bool BaseCredSender::init() {
+    if (inited) {
+        return true;
+    }
+    if (cred == nullptr) {
+        cred = OVRACredAlloc();
+    }
+    if (cred != nullptr && credSess == nullptr) {
+        credSess = OVRACredSessAlloc();
+    }
+    if (cred == nullptr || credSess == nullptr) {
+        SetErr(ERR::kOutOfMemory);
+        OVRA_ERR("Failed to allocate memory for cred or sess");
+        return false;
+    }
+    if (!initConn()) {
+        OVRA_ERR("Failed to init conn [%s]", text(conn).c_str());
+        return false;
+    }
+    if (!initCred()) {
+        OVRA_ERR("Failed to init cred");
+        return false;
+    }
+    inited = true;
+    return true;
+}
+
+void BaseCredSender::freeHandles() {
+    if (cred != nullptr) {
+        OVRACredFree(cred);
+        cred = nullptr;
+    }
+    if (credSess != nullptr) {
+        OVRACredSessFree(credSess);
+        credSess = nullptr;
+    }
+}
+
+void BaseCredSender::clear() {
+    doClear();
+    freeHandles();
+    inited = false;
+}
+
+void BaseCredSender::SetCredRequestError(OVRA::CredRequest &request) const {
+    const int error = request.GetError();
+    if (error == 0) {
+        return;
+    }
+    OVRA_NOTICE("cred error [%d]", error);
+    switch (error) {
+    case kLibraryNoPermission:
+        SetErr(ERR::kNoPrivilege);
+        return;
+    case kLibraryCertificate:
+        SetErr(ERR::kCertificateChanged);
+        return;
+    case kLibraryCannotConnect:
+    case kLibraryTimedOut: {
+        SetErr(ERR::kNotConnectable);
+        const ConnCache cache(conn);
+        cache.logChange(__func__, cache.getStoredVerdict(), false);
+        cache.UpdateWithData(false);
+        return;
+    }
+    default:
+        SetErr(ERR::kCredLibrary, error);
+    }
+}
+
+/// The sending itself, once nothing speaks against it; its lines are those of process().
+Response BaseCredSender::send(const Request &request, const char *function) const {
+    Response response;
+    OVRA::CredRequest credRequest;
+    if (!CreateOvraWebAPIRequest(credRequest, cred, credSess, request)) {
+        SetCredRequestError(credRequest);
+        OVRA_LOG_IN(LogLevel::kNotice, function, "Failed to create cred request [%s]",
+                    text(request).c_str());
+        return response;
+    }
+    credRequest.SetResponseTimeout(request.getResponseTimeout());
+    if (request.isEncryptRequired()) {
+        credRequest.SetEncryptMode(kSealParameters);
+    }
+    if (!request.getUploadPath().empty() && !request.getUploadName().empty()) {
+        credRequest.SetUploadFile(request.getUploadPath(), request.getUploadName());
+    }
+    if (credRequest.Process(true, kSend) == 0) {
+        SetCredRequestError(credRequest);
+        OVRA_LOG_IN(LogLevel::kNotice, function, "Failed to process cred request [%s]",
+                    text(request).c_str());
+        return response;
+    }
+    response.setResp(credRequest.GetResponse());
+    if (response.isValid() && !response.isSuccess() &&
+        response.getErrCode() == kRemoteNoPermission) {
+        SetErr(ERR::kNoPrivilege);
+    }
+    return response;
+}
+
+Response BaseCredSender::process(const Request &request) {
+    SetErr(ERR::kNone);
+    Response response;
+    if (!request.isValid()) {
+        SetErr(ERR::kBadParameter, OvraDRCore::maskSecrets(request.toJson()));
+        OVRA_ERR("Invalid api");
+    } else if (!isValid()) {
+        SetErr(ERR::kBadParameter);
+        OVRA_ERR("invalid conn [%s] or cred", text(conn).c_str());
+    } else if (!inited && !init()) {
+        OVRA_ERR("Failed to init cred for conn [%s]", text(conn).c_str());
+    } else if (!GetCachedConnectable(conn)) {
+        SetErr(ERR::kNotConnectable, conn.toJson());
+        OVRA_NOTICE("Failed to send req [%s] since cache [%s] not connectable",
+                    text(request).c_str(), text(conn).c_str());
+    } else {
+        response = send(request, __func__);
+    }
+    if (GetErrCode() != ERR::kNone) {
+        OVRA_DEBUG("Failed to process request[%s] to conn [%s] since error [%s]",
+                   text(request).c_str(), text(conn).c_str(),
+                   OvraDRCore::toLogString(GetErr()).c_str());
+    }
+    return response;
+}
+
+CredAccountSender::CredAccountSender(const Conn &conn_, const std::string &account_,
+                                     const std::string &passwd_, const std::string &otp_)
+    : BaseCredSender(conn_)
+    , account(account_)
+    , passwd(passwd_)
+    , otp(otp_) {}
+
+CredAccountSender::CredAccountSender(const std::string &account_, const std::string &passwd_,
+                                     const std::string &otp_)
+    : account(account_)
+    , passwd(passwd_)
+    , otp(otp_) {}
+
+CredAccountSender::~CredAccountSender() {
+    logout();
+    explicit_bzero(passwd.data(), passwd.size());
+    explicit_bzero(otp.data(), otp.size());
+}
+
+bool CredAccountSender::setCred(const std::string &newAccount, const std::string &newPasswd,
+                                const std::string &newOtp) {
+    if (newAccount.empty() || newPasswd.empty()) {
+        return false;
+    }
+    account = newAccount;
+    passwd = newPasswd;
+    otp = newOtp;
+    return true;
+}
+
+bool CredAccountSender::isCredValid() const {
+    return !account.empty() && !passwd.empty();
+}
+
+bool CredAccountSender::initCred() {
+    if (cred == nullptr) {
+        SetErr(ERR::kNullSender);
+        OVRA_ERR("NULL Credential");
+        return false;
+    }
+    if (!isCredValid()) {
+        SetErr(ERR::kBadParameter);
+        OVRA_ERR("Bad parameter of credHost [%s]", conn.addr.c_str());
+        return false;
+    }
+    if (OVRACredItemSetRemoteAccount(cred, account.c_str()) != 0 ||
+        OVRACredItemSetRemotePasswd(cred, passwd.c_str()) != 0) {
+        SetErr(ERR::kCredItemRefused);
+        OVRA_ERR("Failed to set the credential infomation of host [%s]", account.c_str());
+        return false;
+    }
+    return login();
+}
+
+bool CredAccountSender::login() {
+    if (loggedIn) {
+        return true;
+    }
+    Json::Value reply;
+    if (OVRA::CredRequestUtil::LoginWithOTP(cred, otp, credSess, &reply) == 0) {
+        SetErr(ERR::kLoginCallFailed);
+    }
+    const Response response(reply);
+    if (response.isSuccess()) {
+        loggedIn = true;
+        return true;
+    }
+    const int error = loginError(response.getErrCode());
+    SetErr(error);
+    OVRA_ERR("Failed to login of server with resp[%s] for user[%s]/err[%s]",
+             OvraDRCore::toLogString(reply).c_str(), account.c_str(), ERR::ToString(error).c_str());
+    return false;
+}
+
+void CredAccountSender::logout() {
+    if (loggedIn) {
+        OVRA::CredRequestUtil::Logout(cred, credSess);
+        loggedIn = false;
+    }
+}
+
+void CredAccountSender::doClear() {
+    logout();
+}
+
+CredSessionSender::CredSessionSender(const Conn &conn_)
+    : BaseCredSender(conn_) {}
+
+CredSessionSender::CredSessionSender(const Conn &conn_, const std::string &session_)
+    : BaseCredSender(conn_)
+    , session(session_) {}
+
+CredSessionSender::~CredSessionSender() = default;
+
+bool CredSessionSender::setCred(const std::string &newSession) {
+    if (newSession.empty()) {
+        return false;
+    }
+    session = newSession;
+    return true;
+}
+
+bool CredSessionSender::isCredValid() const {
+    return !session.empty();
+}
+
+bool CredSessionSender::initCred() {
+    if (session.empty()) {
+        SetErr(ERR::kBadParameter, "session");
+        OVRA_ERR("Bad parameter [%s]", session.c_str());
+        return false;
+    }
+    if (OVRACredSessItemSetAccessToken(credSess, session.c_str()) != 0) {
+        SetErr(ERR::kCredItemRefused);
+        OVRA_ERR("Failed to set the credential session of host [%s]", conn.addr.c_str());
+        return false;
+    }
+    return true;
+}
+
+void CredSessionSender::doClear() {}
+
+} // namespace OvraDRNode

@@ -1,0 +1,257 @@
+// SPDX-License-Identifier: Apache-2.0
+#define OVRA_LOG_FILE "sender"
+
+// Senders to a node: which credential is used, and what is learnt from the answer.
+
+#include "ovradrcore/json.h"
+#include "ovradrcore/log.h"
+#include "ovradrnode/cred_permission_cache.h"
+#include "ovradrnode/node_db.h"
+#include "ovradrnode/sender.h"
+#include "transport/node_valid_cred_cache.h"
+
+#include <vector>
+
+namespace OvraDRNode {
+
+namespace ERR = OvraDRCore::ERR;
+using OvraDRCore::Request;
+using OvraDRCore::Response;
+
+namespace {
+
+constexpr int kRemoteNoPermission = 105;
+constexpr int kAllCreds = DRNodeDB::CRED_TYPE_NODE | DRNodeDB::CRED_TYPE_TEMP;
+
+bool isNoPermission(const Response &response) {
+    return response.isValid() && !response.isSuccess() &&
+           response.getErrCode() == kRemoteNoPermission;
+}
+
+/// The remote answered the request itself, well or badly; another credential would get the same.
+bool hasGotThrough(const Response &response) {
+    return response.isValid() && !isNoPermission(response);
+}
+
+bool isLocal(const DRNode &node) {
+    return DRNode::isLocalNodeId(node.nodeId) || DRNode::isLocalNodeId(node.credId);
+}
+
+} // namespace
+
+NodeSender::NodeSender(const std::string &nodeId_) {
+    setNode(nodeId_);
+}
+
+NodeSender::~NodeSender() = default;
+
+bool NodeSender::isValid() const {
+    return !nodeId.empty();
+}
+
+bool NodeSender::setNode(const std::string &id) {
+    if (id.empty()) {
+        return false;
+    }
+    nodeId = id;
+    return true;
+}
+
+bool NodeSender::setNode(const DRNode &node) {
+    return setNode(node.nodeId);
+}
+
+Response NodeSender::process(const Request &request) {
+    SetErr(ERR::kNone);
+    Response response;
+    if (!request.isValid()) {
+        OVRA_ERR("Bad api [%s]", OvraDRCore::toLogString(request.toJson()).c_str());
+        SetErr(ERR::kBadParameter);
+        return response;
+    }
+    if (nodeId == DRNode::getLocalNodeId()) {
+        return run(request);
+    }
+    const std::string remembered = getCachedCredId();
+    if (processByCredId(remembered, request, response)) {
+        return response;
+    }
+    std::vector<DRNode> nodes;
+    if (!DRNodeDB::ListCred(nodeId, nodes, kAllCreds)) {
+        return {};
+    }
+    for (const DRNode &node : nodes) {
+        SetErr(ERR::kNone);
+        if (node.credId != remembered && processByCred(node, request, response)) {
+            break;
+        }
+    }
+    return response;
+}
+
+bool NodeSender::process(const std::string &nodeId, const std::string &api,
+                         const std::string &method, int version, const Json::Value &params,
+                         Json::Value &out) {
+    const Response response = NodeSender(nodeId).process(Request(api, version, method, params));
+    out = response.getData();
+    return response.isValid();
+}
+
+bool NodeSender::processByCredId(const std::string &credId, const Request &request,
+                                 Response &response) {
+    if (credId.empty() || !request.isValid()) {
+        SetErr(ERR::kBadParameter);
+        return false;
+    }
+    DRNode node;
+    if (!DRNodeDB::GetCred(credId, node)) {
+        SetErr(ERR::kCredNotFound);
+        return false;
+    }
+    return processByCred(node, request, response);
+}
+
+bool NodeSender::processByCred(const DRNode &node, const Request &request, Response &response) {
+    if (!node.isValid() || !request.isValid()) {
+        SetErr(ERR::kBadParameter);
+        return false;
+    }
+    CredNodeSender sender(node);
+    response = sender.process(request);
+    const bool gotThrough = hasGotThrough(response);
+    if (gotThrough) {
+        NodeValidCredCache(node.nodeId).UpdateWithData(node.credId);
+        CredPermissionCache(node.credId).SetHasPrivilege();
+    }
+    if (isNoPermission(response)) {
+        CredPermissionCache(node.credId).SetNoPrivilege(request);
+    }
+    if (sender.GetErrCode() != ERR::kNone) {
+        SetErr(&sender);
+    }
+    return gotThrough;
+}
+
+std::string NodeSender::getValidCredId() const {
+    std::vector<DRNode> nodes;
+    if (nodeId.empty() || DRNode::isLocalNodeId(nodeId) ||
+        !DRNodeDB::ListCred(nodeId, nodes, DRNodeDB::CRED_TYPE_NODE)) {
+        return {};
+    }
+    for (const DRNode &node : nodes) {
+        if (CredNodeSender(node).testPrivilege()) {
+            return node.credId;
+        }
+    }
+    return {};
+}
+
+std::string NodeSender::getCachedCredId() const {
+    const Json::Value remembered = NodeValidCredCache(nodeId).Read();
+    return remembered.isString() ? remembered.asString() : "";
+}
+
+bool NodeSender::isConnectable() const {
+    const std::string id = getValidCredId();
+    if (!id.empty()) {
+        return BaseSender::IsConnectable(CredNodeSender(id).getNode().conn);
+    }
+    std::vector<DRNode> nodes;
+    if (!DRNodeDB::ListCred(nodeId, nodes, DRNodeDB::CRED_TYPE_NODE)) {
+        return false;
+    }
+    for (const DRNode &node : nodes) {
+        if (node.credId != id && BaseSender::IsConnectable(node.conn)) {
+            return true;
+        }
+    }
+    return false;
+}
+
+CredNodeSender::CredNodeSender(const DRNode &node_) {
+    setCred(node_);
+}
+
+CredNodeSender::CredNodeSender(const std::string &credId) {
+    setCred(credId);
+}
+
+CredNodeSender::~CredNodeSender() = default;
+
+bool CredNodeSender::isValid() const {
+    return node.isValid();
+}
+
+bool CredNodeSender::setCred(const DRNode &value) {
+    SetErr(ERR::kFailed);
+    if (!value.isValid()) {
+        SetErr(ERR::kCredInvalid);
+        return false;
+    }
+    node = value;
+    SetErr(ERR::kNone);
+    return true;
+}
+
+bool CredNodeSender::setCred(const std::string &credId) {
+    SetErr(ERR::kFailed);
+    if (credId.empty()) {
+        SetErr(ERR::kBadParameter);
+        return false;
+    }
+    DRNode found;
+    if (!DRNodeDB::GetCred(credId, found)) {
+        SetErr(ERR::kCredInvalid);
+        return false;
+    }
+    return setCred(found);
+}
+
+Response CredNodeSender::process(const Request &request) {
+    SetErr(ERR::kNone);
+    if (isLocal(node)) {
+        return run(request);
+    }
+    if (!node.isValid()) {
+        SetErr(ERR::kCredInvalid);
+        return {};
+    }
+    SetErr(ERR::kFailed);
+    CredSessionSender sender(node.conn, node.session);
+    Response response = sender.process(request);
+    CredPermissionCache(node.credId).SetPrivilege(request, hasGotThrough(response));
+    if (sender.GetErrCode() != ERR::kNone) {
+        SetErr(&sender);
+    } else {
+        SetErr(ERR::kNone);
+    }
+    return response;
+}
+
+bool CredNodeSender::testPrivilege() {
+    SetErr(ERR::kFailed);
+    if (!node.isValid()) {
+        SetErr(ERR::kCredInvalid);
+        return false;
+    }
+    if (isLocal(node)) {
+        return true; // nothing was tested: the code stays
+    }
+    if (!BaseSender::GetCachedConnectable(node.conn)) {
+        SetErr(ERR::kNotConnectable);
+        return false;
+    }
+    const bool has = CredPermissionCache(node.credId).HasPrivilege();
+    SetErr(has ? ERR::kNone : ERR::kNoPrivilege);
+    return has;
+}
+
+bool CredNodeSender::IsConnectable(const DRNode &node) {
+    return isLocal(node) || BaseSender::IsConnectable(node.conn);
+}
+
+bool CredNodeSender::GetCachedConnectable(const DRNode &node) {
+    return isLocal(node) || BaseSender::GetCachedConnectable(node.conn);
+}
+
+} // namespace OvraDRNode

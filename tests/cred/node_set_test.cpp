@@ -1,0 +1,115 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "cred/flow_fixture.h"
+#include "ovradrcore/json.h"
+#include "ovradrnode/node_set.h"
+
+using namespace OvraDRNode;
+using namespace OvraTest;
+
+namespace {
+
+class CredUpdate : public CredFlow {
+protected:
+    void SetUp() override {
+        CredFlow::SetUp();
+        addCred("node_cred", "n1", "c1", "http", 80, "old");
+    }
+    bool update(const std::string &credId = "c1") {
+        DRNodeCredSet set(credId);
+        const bool done = set.setCred(conn, "joe", "pw", "1") && set.process();
+        code = set.GetErrCode();
+        return done;
+    }
+    std::string row() { return rows("node_cred"); }
+
+    const std::string untouched = "n1|http|80|old\n";
+    int code = -1;
+};
+
+} // namespace
+
+TEST_F(CredUpdate, TheRowIsRewrittenAndThenTheOldSessionReleasedOverTheNewEndpoint) {
+    std::string seen;
+    remote.before("delete", [&] { seen = row(); });
+    EXPECT_TRUE(update());
+    EXPECT_EQ(code, 0);
+    EXPECT_EQ(row(), granted("granted"));
+    EXPECT_EQ(seen, granted("granted"));
+    EXPECT_EQ(remote.params("delete"), R"({"session":"old"})");
+    EXPECT_EQ(sent("old delete"), 1);
+}
+
+TEST_F(CredUpdate, ASessionThatAnotherCredentialUsesStays) {
+    addCred("node_cred", "n1", "c2", "https", remote.port(), "old");
+    EXPECT_TRUE(update());
+    EXPECT_EQ(sent("old delete"), 0);
+}
+
+TEST_F(CredUpdate, TheSameSessionOverTheSameEndpointWritesAndReleasesNothing) {
+    remote.answer("create", R"({"success":true,"data":{"session":"old"}})");
+    EXPECT_TRUE(update()) << "a change of the endpoint alone";
+    EXPECT_EQ(row(), granted("old"));
+    log.clear();
+    EXPECT_TRUE(update());
+    EXPECT_EQ(row(), granted("old"));
+    EXPECT_EQ(log.count("INFO", "node_set", "setCredRecord",
+                        "No change of conn or session of credId[n1]"),
+              1);
+    EXPECT_EQ(sent("old delete"), 0);
+}
+
+TEST_F(CredUpdate, FailsAtEachStepWithItsCodeAndTheOldRow) {
+    const struct {
+        const char *call;
+        const char *answer;
+        int code;
+    } cases[] = {
+        {"login", R"({"success":false,"error":{"code":403}})", 504},
+        {"info", R"({"success":false,"error":{"code":999}})", 519},
+        {"info", R"({"success":false,"error":{"code":105}})", 525},
+        {"info", R"({"success":true,"data":{"node_id":"n1"}})", 519},
+        {"info", R"({"success":true,"data":{"node_id":"n1","serial":""}})", 518},
+        {"info", R"({"success":true,"data":{"node_id":"n2","serial":"S"}})", 518},
+        {"create", R"({"success":false,"error":{"code":105}})", 509},
+        {"create", R"({"success":true,"data":{}})", 509},
+        {"granted test_privilege", R"({"success":false,"error":{"code":119}})", 509},
+    };
+    for (const auto &each : cases) {
+        SetUpAnswers();
+        remote.answer(each.call, each.answer);
+        EXPECT_FALSE(update()) << each.answer;
+        EXPECT_EQ(code, each.code) << each.call << each.answer;
+        EXPECT_EQ(row(), untouched);
+    }
+    EXPECT_EQ(log.count("ERR", "node_set", "checkRemoteNodeInfo",
+                        "Different nodeId [n2] to setCred, [n1] is expected"),
+              1);
+    EXPECT_EQ(sent("old delete") + sent("granted delete"), 0);
+    EXPECT_FALSE(update("c9"));
+    EXPECT_EQ(DRNodeCredSet("c9").GetErrCode(), 404);
+    EXPECT_EQ(DRNodeCredSet("").GetErrCode(), 401);
+    remote.die();
+    EXPECT_FALSE(update());
+    EXPECT_EQ(code, 500);
+}
+
+TEST_F(CredUpdate, ARowThatCannotBeWrittenOffersTheNewSessionForRelease) {
+    executeSql(
+        "CREATE TRIGGER no BEFORE UPDATE ON node_cred BEGIN SELECT RAISE(FAIL, 'full'); END");
+    EXPECT_FALSE(update());
+    EXPECT_EQ(code, 404);
+    EXPECT_EQ(row(), untouched);
+    EXPECT_EQ(sent("granted delete"), 1);
+    EXPECT_EQ(sent("old delete"), 0);
+    EXPECT_EQ(log.count("ERR", "node_set", "process",
+                        "Failed to set credId[c1], notify remote to delete new session"),
+              1);
+    EXPECT_EQ(log.count("'granted'"), 0);
+}
+
+TEST_F(CredUpdate, AReleaseThatFailsIsOnlyAWarning) {
+    remote.answer("delete", R"({"success":false,"error":{"code":100}})");
+    EXPECT_TRUE(update());
+    EXPECT_EQ(code, 0);
+    EXPECT_EQ(log.count("to delete not used session"), 1);
+}

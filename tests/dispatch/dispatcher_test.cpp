@@ -1,0 +1,115 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "ovradrnode/dr_node.h"
+#include "ovradrnode/node_api.h"
+#include "ovradrnode/operation_dispatcher.h"
+#include "support/local_node.h"
+#include "support/log_capture.h"
+#include "support/remote_node.h"
+
+#include <gtest/gtest.h>
+
+using namespace OvraDRNode;
+using namespace OvraTest;
+
+namespace {
+
+class Operation : public NodeOperationDispatcher {
+public:
+    using NodeOperationDispatcher::NodeOperationDispatcher;
+    bool RunLocal() override {
+        ++localRuns;
+        return localResult;
+    }
+    OvraDRCore::Request GetRequest() override { return WebAPI::getDRNodeInfoAPI({}); }
+    bool IsValidParam() override { return valid; }
+    std::string GetCredId() const override { return credId; }
+
+    bool valid = true;
+    bool localResult = true;
+    int localRuns = 0;
+    std::string credId;
+};
+
+class Dispatch : public testing::Test {
+protected:
+    void SetUp() override {
+        provisionNode();
+        DRNode::getLocalNodeId();
+        addCred("node_cred", "n1", "c1", "https", remote.port(), "s1");
+        addCred("node_cred", "n1", "c2", "https", remote.port(), "s2");
+        addCred("node_cred", "n2", "c3", "https", remote.port(), "s3");
+        remote.answer("info", R"({"success":true,"data":{"hostname":"b"}})");
+    }
+    RemoteNode remote;
+    LogCapture log;
+};
+
+} // namespace
+
+TEST_F(Dispatch, TheLocalNodeRunsHereAndNeedsNoCredential) {
+    Operation operation(DRNode::getLocalNodeId());
+    EXPECT_TRUE(operation.IsLocalNode() && operation.HasPrivilege() && !operation.IsRemoteNode());
+    EXPECT_TRUE(operation.Run());
+    EXPECT_EQ(operation.localRuns, 1);
+    operation.localResult = false;
+    EXPECT_FALSE(operation.Run()) << "its result is the result";
+    EXPECT_EQ(remote.calls(), "");
+}
+
+TEST_F(Dispatch, ParametersAreCheckedBeforeAnythingElse) {
+    Operation operation(DRNode::getLocalNodeId());
+    operation.valid = false;
+    EXPECT_FALSE(operation.Run());
+    EXPECT_EQ(operation.GetErrCode(), 401);
+    EXPECT_EQ(operation.localRuns, 0);
+    EXPECT_EQ(log.count("ERR", "operation_dispatcher", "Run", "Bad Parameter"), 1);
+}
+
+TEST_F(Dispatch, OnlyKnownNodesAreAddressed) {
+    Operation operation;
+    operation.SetNodeId("n9");
+    EXPECT_FALSE(operation.Run());
+    EXPECT_EQ(operation.GetErrCode(), 507);
+    EXPECT_EQ(log.count("ERR", "operation_dispatcher", "Run", "Runner [n9] is not privilege node"),
+              1);
+    EXPECT_FALSE(Operation("").Run());
+    EXPECT_FALSE(Operation("").IsRemoteNode());
+    EXPECT_EQ(remote.calls(), "");
+}
+
+TEST_F(Dispatch, ARemoteNodeIsAskedOverAnyCredentialAndTheOutcomeKept) {
+    Operation operation("n1");
+    EXPECT_TRUE(operation.Run());
+    EXPECT_EQ(operation.GetResult()["hostname"].asString(), "b");
+    EXPECT_EQ(operation.localRuns, 0);
+    remote.answer("info", R"({"success":false,"error":{"code":999,"msg":"why"}})");
+    Operation refused("n1");
+    EXPECT_FALSE(refused.Run());
+    EXPECT_EQ(refused.GetErrCode(), 999);
+    EXPECT_EQ(refused.GetErrMsg().asString(), "why");
+    EXPECT_TRUE(refused.GetResult().isNull());
+    remote.die();
+    Operation dead("n1");
+    EXPECT_FALSE(dead.Run());
+    EXPECT_EQ(dead.GetErrCode(), 500) << "the sender's code comes first";
+}
+
+TEST_F(Dispatch, ANamedCredentialIsUsedAloneAndNeverAnotherNodes) {
+    Operation operation("n1");
+    operation.credId = "c2";
+    EXPECT_TRUE(operation.Run());
+    EXPECT_EQ(remote.calls(), "probe, s2 info");
+    remote.forgetCalls();
+    operation.credId = "c3";
+    EXPECT_FALSE(operation.Run());
+    EXPECT_EQ(operation.GetErrCode(), 518);
+    operation.credId = "c9";
+    EXPECT_FALSE(operation.Run());
+    EXPECT_EQ(operation.GetErrCode(), 519);
+    EXPECT_EQ(remote.calls(), "");
+    operation.credId = "c2";
+    remote.answer("info", R"({"success":false,"error":{"code":105}})");
+    EXPECT_FALSE(operation.Run());
+    EXPECT_EQ(operation.GetErrCode(), 525);
+    EXPECT_EQ(remote.calls(), "s2 info") << "no other credential is tried";
+}

@@ -1,0 +1,128 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "ovradrnode/node.h"
+#include "support/local_node.h"
+#include "support/log_capture.h"
+#include "support/remote_node.h"
+
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <filesystem>
+#include <fstream>
+
+using namespace OvraDRNode;
+using namespace OvraTest;
+
+namespace {
+
+constexpr const char *kFolder = "/usr/ovra/ovradr/sbin/";
+constexpr const char *kTestFile = "/tmp/speed-file";
+
+void script(const std::string &name, const std::string &body) {
+    std::filesystem::create_directories(kFolder);
+    std::ofstream(kFolder + name) << "#!/bin/sh\n" << body << "\n";
+    chmod((kFolder + name).c_str(), 0755);
+}
+
+/// Three local endpoints (two addresses, one with HTTPS only is not possible: each has both), a
+/// remote node "n1", and a set-up script that makes a test file.
+class Speed : public testing::Test {
+protected:
+    void SetUp() override {
+        provisionNode();
+        std::ofstream("/usr/ovra/etc/ovradr/ovradrd.conf")
+            << "address=\"127.0.0.1,127.0.0.2\"\nhttps_port=\"444\"\nhttp_port=\"81\"\n";
+        addCred("node_cred", "n1", "c1", "https", remote.port(), "s1");
+        script("TestSyncSpeed.sh", "touch /tmp/speed-file; printf /tmp/speed-file");
+        remote.answer("test_download_speed", R"({"success":true,"data":{"speed":"11.5 MB/s"}})");
+    }
+    bool fileLeft() { return access(kTestFile, F_OK) == 0; }
+    std::string run(const std::string &nodeId = "n1") { return node.TestSyncSpeed(nodeId, 2, 3); }
+
+    RemoteNode remote;
+    Node node;
+    LogCapture log;
+};
+
+} // namespace
+
+TEST_F(Speed, TheFirstLineOfTheScriptIsTakenWhole) {
+    script("TestDownloadSpeed.sh", "printf '%s %s %s' \"$1\" \"$2\" \"$3\"");
+    EXPECT_EQ(node.TestDownloadSpeed("http://h/a b;`c`", 2, 3), "http://h/a b;`c` 2 3")
+        << "no shell between";
+    EXPECT_EQ(node.GetErrCode(), 0);
+    script("TestDownloadSpeed.sh", "echo one; echo two");
+    EXPECT_EQ(node.TestDownloadSpeed("u", 0, 0), "one\n");
+    script("TestDownloadSpeed.sh", "exit 3");
+    EXPECT_EQ(node.TestDownloadSpeed("u", 0, 0), "");
+    EXPECT_EQ(node.GetErrCode(), 407);
+    std::filesystem::remove_all(kFolder);
+    EXPECT_EQ(node.TestDownloadSpeed("u", 0, 0), "");
+    EXPECT_EQ(node.GetErrCode(), 401);
+    EXPECT_EQ(
+        log.count("ERR", "node", "TestDownloadSpeed",
+                  std::string("Failed to exec the command [") + kFolder + "TestDownloadSpeed.sh]."),
+        1);
+}
+
+TEST_F(Speed, TheRemoteIsAskedEndpointByEndpointUntilOneWorks) {
+    int asked = 0;
+    remote.before("test_download_speed", [&] {
+        if (++asked == 3) {
+            remote.answer("test_download_speed", R"({"success":true,"data":{"speed":"3 MB/s"}})");
+        }
+    });
+    remote.answer("test_download_speed", R"({"success":false,"error":{"code":999}})");
+    EXPECT_EQ(run(), "3 MB/s");
+    EXPECT_EQ(node.GetErrCode(), 0);
+    EXPECT_EQ(asked, 3);
+    EXPECT_EQ(remote.params("test_download_speed"),
+              R"({"retries":2,"timeout":3,"url":"https://127.0.0.2:444/webman/modules/ovradr//tmp/)"
+              R"(speed-file"})");
+    EXPECT_FALSE(fileLeft());
+}
+
+TEST_F(Speed, WhichPathsRemoveTheFileAndWhichCodeWins) {
+    const struct {
+        const char *what;
+        const char *answer;
+        const char *setUp;
+        const char *speed;
+        int code;
+    } cases[] = {
+        {"no endpoint answers", R"({"success":false,"error":{"code":999}})",
+         "touch /tmp/speed-file", "", 407},
+        {"no speed", R"({"success":true,"data":{}})", "touch /tmp/speed-file", "", 401},
+        {"speed is no string", R"({"success":true,"data":{"speed":12}})", "touch /tmp/speed-file",
+         "12", 0},
+        {"file cannot be removed, nothing measured", R"({"success":false,"error":{"code":999}})",
+         ":", "", 401},
+        {"file cannot be removed, but measured", R"({"success":true,"data":{"speed":"1"}})", ":",
+         "1", 0},
+    };
+    for (const auto &each : cases) {
+        script("TestSyncSpeed.sh", std::string(each.setUp) + "; printf /tmp/speed-file");
+        remote.answer("test_download_speed", each.answer);
+        EXPECT_EQ(run(), each.speed) << each.what;
+        EXPECT_EQ(node.GetErrCode(), each.code) << each.what;
+        EXPECT_FALSE(fileLeft()) << each.what;
+    }
+    EXPECT_EQ(
+        log.count("ERR", "node", "TestSyncSpeed", "Field 'speed' sould exist, being a string."), 2);
+}
+
+TEST_F(Speed, WithoutATestFileOrANodeNobodyIsAsked) {
+    EXPECT_EQ(run(""), "");
+    EXPECT_EQ(node.GetErrCode(), 407);
+    EXPECT_TRUE(fileLeft()) << "an unknown node leaves it to the sweep";
+    script("TestSyncSpeed.sh", "exit 1");
+    EXPECT_EQ(run(), "");
+    EXPECT_EQ(node.GetErrCode(), 401);
+    std::filesystem::remove_all(kFolder);
+    EXPECT_EQ(run(), "");
+    EXPECT_EQ(log.count("ERR", "node", "TestSyncSpeedMakeTestFile",
+                        std::string("Failed to execute command ") + kFolder + "TestSyncSpeed.sh."),
+              1);
+    EXPECT_EQ(remote.calls(), "");
+}

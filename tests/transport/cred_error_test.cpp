@@ -1,0 +1,241 @@
+// SPDX-License-Identifier: Apache-2.0
+
+// How every error number of the credential library is taken, with a double of that library that
+// fails where it is told to: the real one cannot be made to give them all.
+
+#include "ovradrcore/json.h"
+#include "ovradrnode/node_api.h"
+#include "ovradrnode/sender.h"
+#include "support/log_capture.h"
+#include "transport/conn_cache.h"
+
+#include <ovracredential/cred_request.h>
+
+#include <gtest/gtest.h>
+
+#include <set>
+
+struct _tag_ovra_cred_ {};
+struct _tag_ovra_cred_sess_ {};
+
+namespace {
+
+/// What the double does next.
+struct Script {
+    std::set<std::string> fail; ///< steps that fail
+    int error = 0;
+    int allocated = 0;
+    int sent = 0;
+    long timeout = 0;
+    int encryptMode = 0;
+    std::string upload;
+};
+Script script;
+
+int ok(const char *step) {
+    return script.fail.count(step) == 0 ? 1 : 0;
+}
+
+} // namespace
+
+OVRACred *OVRACredAlloc() {
+    if (ok("alloc") == 0) {
+        return nullptr;
+    }
+    ++script.allocated;
+    return new _tag_ovra_cred_;
+}
+void OVRACredFree(OVRACred *cred) {
+    --script.allocated;
+    delete cred;
+}
+OVRACredSess *OVRACredSessAlloc() {
+    if (ok("alloc sess") == 0) {
+        return nullptr;
+    }
+    ++script.allocated;
+    return new _tag_ovra_cred_sess_;
+}
+void OVRACredSessFree(OVRACredSess *sess) {
+    --script.allocated;
+    delete sess;
+}
+int OVRACredItemSetProtocol(OVRACred *, const char *) {
+    return 1 - ok("protocol");
+}
+int OVRACredItemSetHost(OVRACred *, const char *) {
+    return 1 - ok("host");
+}
+int OVRACredItemSetPort(OVRACred *, int) {
+    return 1 - ok("port");
+}
+int OVRACredItemSetRemoteAccount(OVRACred *, const char *) {
+    return 1 - ok("account");
+}
+int OVRACredItemSetRemotePasswd(OVRACred *, const char *) {
+    return 1 - ok("passwd");
+}
+int OVRACredSessItemSetAccessToken(OVRACredSess *, const char *) {
+    return 1 - ok("token");
+}
+
+namespace OVRA {
+struct CredRequest::Impl {};
+CredRequest::CredRequest() = default;
+CredRequest::~CredRequest() = default;
+int CredRequest::SetURL(const std::string &, const std::string &, int, const std::string &) {
+    return ok("url");
+}
+int CredRequest::SetDefaultTimeout(long) {
+    return ok("timeout");
+}
+int CredRequest::SetResponseTimeout(long seconds) {
+    script.timeout = seconds;
+    return 1;
+}
+int CredRequest::SetEncryptMode(int mode) {
+    script.encryptMode = mode;
+    return 1;
+}
+int CredRequest::SetUploadFile(const std::string &path, const std::string &name) {
+    script.upload = path + " as " + name;
+    return 1;
+}
+int CredRequest::CreateWebAPIRequest(CredRequest &, OVRACred *, OVRACredSess *, const std::string &,
+                                     int, const std::string &, const Json::Value &) {
+    return ok("create");
+}
+int CredRequest::Process(bool reuse, int mode) {
+    EXPECT_TRUE(reuse);
+    script.sent += mode == 0 ? 1 : 0;
+    return mode == 2 ? ok("probe") : ok("process");
+}
+std::string CredRequest::GetResponse() const {
+    return R"({"success":true})";
+}
+int CredRequest::GetError() const {
+    return script.error;
+}
+int CredRequestUtil::LoginWithOTP(OVRACred *, const std::string &, OVRACredSess *,
+                                  Json::Value *out) {
+    (*out)["success"] = ok("login answer") != 0;
+    return ok("login");
+}
+int CredRequestUtil::Logout(OVRACred *, OVRACredSess *) {
+    return 1;
+}
+int CredRequestFarlink::GetConnInfo(const std::string &alias, Json::Value &info, const void *) {
+    info["host"] = alias + ".relay";
+    info["protocol"] = "https";
+    info["port"] = 6001;
+    return 0; // the answer counts, not this
+}
+} // namespace OVRA
+
+using namespace OvraDRNode;
+
+namespace {
+
+class CredError : public testing::Test {
+protected:
+    void SetUp() override {
+        script = Script();
+        ConnCache(conn).UpdateWithData(true);
+    }
+    int send(std::set<std::string> fail, int error = 0) {
+        script.fail = std::move(fail);
+        script.error = error;
+        CredSessionSender sender(conn, "s");
+        sender.process(WebAPI::getDRNodeInfoAPI({}));
+        message = sender.GetErrMsg();
+        return sender.GetErrCode();
+    }
+    int logIn(std::set<std::string> fail) {
+        script.fail = std::move(fail);
+        CredAccountSender sender(conn, "joe", "pw", "");
+        sender.init();
+        return sender.GetErrCode();
+    }
+
+    Conn conn = Conn::https("h", 5001);
+    Json::Value message;
+    LogCapture log;
+};
+
+} // namespace
+
+TEST_F(CredError, LibraryNumbersBecomeCodesAndOnlyLostConnectionsMarkTheEndpoint) {
+    const struct {
+        const char *step;
+        int number;
+        int code;
+        const char *message;
+        bool marked;
+    } cases[] = {
+        {"process", 4, 525, "null", false}, {"process", 6, 526, "null", false},
+        {"process", 5, 500, "null", true},  {"process", 10, 500, "null", true},
+        {"process", 1, 524, "1", false},    {"process", 99, 524, "99", false},
+        {"process", 0, 0, "null", false},   {"create", 7, 524, "7", false},
+        {"create", 5, 500, "null", true},
+    };
+    for (const auto &each : cases) {
+        ConnCache(conn).UpdateWithData(true);
+        log.clear();
+        EXPECT_EQ(send({each.step}, each.number), each.code) << each.step << each.number;
+        EXPECT_EQ(OvraDRCore::toString(message), each.message) << each.step << each.number;
+        EXPECT_EQ(ConnCache(conn).getStoredVerdict(), !each.marked) << each.step << each.number;
+        EXPECT_EQ(log.count("Update conn cache"), each.marked ? 1 : 0);
+        EXPECT_EQ(log.count("cred error [" + std::to_string(each.number) + "]"),
+                  each.number == 0 ? 0 : 1);
+    }
+    EXPECT_EQ(script.allocated, 0) << "every handle was freed";
+}
+
+TEST_F(CredError, EveryStepBeforeSendingHasItsCode) {
+    EXPECT_EQ(send({"alloc"}), 402);
+    EXPECT_EQ(send({"alloc sess"}), 402);
+    for (const char *item : {"protocol", "host", "port", "token"}) {
+        EXPECT_EQ(send({item}), 506) << item;
+    }
+    EXPECT_EQ(logIn({"account"}), 506);
+    EXPECT_EQ(logIn({"passwd"}), 506);
+    EXPECT_EQ(log.count("ERR", "sender", "initCred",
+                        "Failed to set the credential infomation of host [joe]"),
+              2);
+    EXPECT_EQ(logIn({"login", "login answer"}), 501) << "the mapped answer replaces 523";
+    EXPECT_EQ(logIn({"login"}), 523) << "it stays when the answer is a success";
+    EXPECT_EQ(script.sent, 0);
+    EXPECT_EQ(script.allocated, 0);
+}
+
+TEST_F(CredError, TheRequestSaysHowItTravels) {
+    OvraDRCore::Request request = WebAPI::getDRNodeInfoAPI({});
+    request.setEncryptRequired(true);
+    request.setResponseTimeout(17);
+    request.setUpload("/a", "b");
+    CredSessionSender(conn, "s").process(request);
+    EXPECT_EQ(script.encryptMode, 2);
+    EXPECT_EQ(script.timeout, 17);
+    EXPECT_EQ(script.upload, "/a as b");
+    script = Script();
+    request.setEncryptRequired(false);
+    request.setUpload("/a", "");
+    CredSessionSender(conn, "s").process(request);
+    EXPECT_EQ(script.encryptMode, 0);
+    EXPECT_EQ(script.upload, "") << "both or neither";
+}
+
+TEST_F(CredError, ARelayEndpointIsResolvedBeforeUse) {
+    CredSessionSender sender(Conn::farlink("alias"), "s");
+    EXPECT_TRUE(sender.getConn() == Conn::https("alias.relay", 6001));
+    EXPECT_FALSE(sender.setConn(Conn()));
+    EXPECT_TRUE(sender.getConn() == Conn::https("alias.relay", 6001)) << "the old one stays";
+}
+
+TEST_F(CredError, AProbeThatCannotBeSetUpLeavesTheVerdictOfARefresh) {
+    script.fail = {"timeout"};
+    ConnCache(conn).UpdateWithData(true, 1, 1);
+    EXPECT_TRUE(BaseSender::GetCachedConnectable(conn));
+    EXPECT_FALSE(BaseSender::IsConnectable(conn));
+    EXPECT_EQ(log.count("Failed to set timeout of conn"), 2);
+}

@@ -1,0 +1,194 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "ovradrcore/json.h"
+#include "ovradrnode/node_api.h"
+#include "ovradrnode/sender.h"
+#include "support/local_node.h"
+#include "support/log_capture.h"
+#include "support/remote_node.h"
+#include "transport/conn_cache.h"
+
+#include <gtest/gtest.h>
+
+#include <chrono>
+
+using namespace OvraDRNode;
+using namespace OvraTest;
+using OvraDRCore::Request;
+using OvraDRCore::Response;
+
+namespace {
+
+class CredSender : public testing::Test {
+protected:
+    Response send(BaseSender &sender) { return sender.process(WebAPI::getDRNodeInfoAPI({})); }
+
+    RemoteNode remote;
+    Conn conn = Conn::https("127.0.0.1", remote.port());
+    LogCapture log;
+};
+
+} // namespace
+
+TEST_F(CredSender, CarriesTheRequestUnderTheSession) {
+    remote.answer("info", R"({"success":true,"data":{"hostname":"b"}})");
+    CredSessionSender sender(conn, "s1");
+    const Response response = send(sender);
+    EXPECT_TRUE(response.isSuccess());
+    EXPECT_EQ(response.getDataFieldtoStr("hostname"), "b");
+    EXPECT_EQ(sender.GetErrCode(), 0);
+    EXPECT_EQ(remote.calls(), "probe, s1 info");
+}
+
+TEST_F(CredSender, WhatCannotBeSentIsRefusedWithoutAWordToTheRemote) {
+    CredSessionSender good(conn, "s1");
+    EXPECT_FALSE(good.process(Request()).isValid());
+    EXPECT_EQ(good.GetErrCode(), 401);
+    EXPECT_TRUE(good.GetErrMsg().isObject()) << "the request";
+    EXPECT_EQ(log.count("ERR", "sender", "process", "Invalid api"), 1);
+    CredSessionSender noSession(conn);
+    send(noSession);
+    EXPECT_EQ(noSession.GetErrCode(), 401);
+    EXPECT_FALSE(noSession.init());
+    EXPECT_EQ(noSession.GetErrMsg().asString(), "session");
+    CredSessionSender noConn(Conn(), "s1");
+    send(noConn);
+    EXPECT_EQ(noConn.GetErrCode(), 401);
+    EXPECT_FALSE(noConn.init());
+    EXPECT_EQ(noConn.GetErrMsg().asString(), "conn");
+    CredAccountSender noPassword(conn, "joe", "", "");
+    send(noPassword);
+    EXPECT_EQ(noPassword.GetErrCode(), 401);
+    EXPECT_EQ(log.count("invalid conn ["), 3);
+    EXPECT_EQ(remote.calls(), "");
+}
+
+TEST_F(CredSender, NothingIsSentToAnEndpointHeldUnreachable) {
+    ConnCache(conn).UpdateWithData(false);
+    CredSessionSender sender(conn, "s1");
+    EXPECT_FALSE(send(sender).isValid());
+    EXPECT_EQ(sender.GetErrCode(), 500);
+    EXPECT_EQ(sender.GetErrMsg(), conn.toJson());
+    EXPECT_EQ(remote.calls(), "");
+}
+
+TEST_F(CredSender, AConnectionThatFailsMarksTheEndpointForEverybody) {
+    ConnCache(conn).UpdateWithData(true);
+    remote.die();
+    CredSessionSender sender(conn, "s1");
+    EXPECT_FALSE(send(sender).isValid());
+    EXPECT_EQ(sender.GetErrCode(), 500);
+    EXPECT_EQ(log.count("NOTICE", "sender", "SetCredRequestError",
+                        "Update conn cache [" + OvraDRCore::toString(conn.toJson()) +
+                            "] from [true] to [false]"),
+              1);
+    EXPECT_FALSE(BaseSender::GetCachedConnectable(conn));
+    CredSessionSender next(conn, "s2");
+    send(next);
+    EXPECT_TRUE(next.GetErrMsg().isObject()) << "stopped by the verdict";
+}
+
+TEST_F(CredSender, AReplyThatIsNoReplyIsInvalidInBoundedTime) {
+    const struct {
+        const char *what;
+        Answer answer;
+        int code; ///< of the sender
+    } cases[] = {
+        {"html", Answer::html(), 524},
+        {"empty", Answer::empty(), 524},
+        {"wrong shape", Answer::json(R"({"success":"yes"})"), 524},
+        {"truncated", Answer::truncated(R"({"success":true,"data":{}})"), 524},
+        {"50 MB announced", Answer::huge(50 << 20, true), 524},
+        {"50 MB not announced", Answer::huge(50 << 20, false), 524},
+        {"closed", Answer::closed(), 524},
+        {"redirect", Answer::redirect("http://127.0.0.1:1/"), 524},
+        {"forbidden", Answer::status(403), 525},
+        {"server error", Answer::status(500), 524},
+    };
+    for (const auto &each : cases) {
+        ConnCache(conn).UpdateWithData(true);
+        remote.answer("info", each.answer);
+        CredSessionSender sender(conn, "s1");
+        const auto start = std::chrono::steady_clock::now();
+        const Response response = send(sender);
+        EXPECT_FALSE(response.isValid() || response.isSuccess()) << each.what;
+        EXPECT_EQ(response.getErrCode(), 407) << each.what;
+        EXPECT_EQ(sender.GetErrCode(), each.code)
+            << each.what << " " << OvraDRCore::toString(sender.GetErr());
+        EXPECT_LT(std::chrono::steady_clock::now() - start, std::chrono::seconds(3)) << each.what;
+    }
+}
+
+TEST_F(CredSender, TheRemotesOwnErrorsAreTheCallersExceptNoPermission) {
+    CredSessionSender sender(conn, "s1");
+    remote.answer("info", R"({"success":false,"error":{"code":119}})");
+    EXPECT_EQ(send(sender).getErrCode(), 119);
+    EXPECT_EQ(sender.GetErrCode(), 0);
+    remote.answer("info", R"({"success":false,"error":{"code":105}})");
+    EXPECT_EQ(send(sender).getErrCode(), 105);
+    EXPECT_EQ(sender.GetErrCode(), 525);
+    remote.answer("info", R"({"success":true})");
+    EXPECT_TRUE(send(sender).isSuccess());
+    EXPECT_EQ(sender.GetErrCode(), 0) << "an old error does not stay";
+}
+
+TEST_F(CredSender, ARequestThatTakesTooLongIsCutAndMarksTheEndpoint) {
+    remote.answer("info", Answer::silence());
+    Request request = WebAPI::getDRNodeInfoAPI({});
+    request.setResponseTimeout(1);
+    CredSessionSender sender(conn, "s1");
+    const auto start = std::chrono::steady_clock::now();
+    EXPECT_FALSE(sender.process(request).isValid());
+    EXPECT_LT(std::chrono::steady_clock::now() - start, std::chrono::seconds(3));
+    EXPECT_EQ(sender.GetErrCode(), 500);
+    EXPECT_FALSE(ConnCache(conn).getStoredVerdict());
+}
+
+TEST_F(CredSender, AChangedCertificateIsNeverASilentSuccess) {
+    CredSessionSender first(conn, "s1");
+    EXPECT_TRUE(send(first).isSuccess());
+    remote.server.closeConnections();
+    remote.server.changeCertificate();
+    remote.forgetCalls();
+    CredSessionSender second(conn, "s1");
+    EXPECT_FALSE(send(second).isValid());
+    EXPECT_EQ(second.GetErrCode(), 526);
+    EXPECT_EQ(remote.calls().find("s1"), std::string::npos) << "the session never left";
+    EXPECT_TRUE(ConnCache(conn).getStoredVerdict()) << "the endpoint does answer";
+}
+
+TEST_F(CredSender, AnAccountLogsInOnceAndOutOnceAtTheEnd) {
+    remote.answer("login", R"({"success":true,"data":{"sid":"granted"}})");
+    {
+        CredAccountSender sender(conn, "joe", "pass-word", "123456");
+        EXPECT_TRUE(send(sender).isSuccess());
+        EXPECT_TRUE(send(sender).isSuccess());
+        EXPECT_EQ(remote.calls(), " login, probe, granted info, granted info");
+        sender.clear();
+        sender.clear();
+        EXPECT_TRUE(send(sender).isSuccess()) << "logs in again";
+        remote.forgetCalls();
+    }
+    EXPECT_EQ(remote.calls(), "granted logout");
+    EXPECT_EQ(log.count("pass-word") + log.count("123456") + log.count("granted"), 0);
+}
+
+TEST_F(CredSender, RemoteLogInCodesBecomeOurs) {
+    const struct {
+        int remote;
+        int ours;
+    } cases[] = {{400, 501}, {401, 502}, {402, 503}, {403, 504},
+                 {404, 505}, {407, 501}, {105, 501}};
+    for (const auto &each : cases) {
+        remote.answer("login",
+                      R"({"success":false,"error":{"code":)" + std::to_string(each.remote) + "}}");
+        CredAccountSender sender(conn, "joe", "pw", "");
+        EXPECT_FALSE(send(sender).isValid());
+        EXPECT_EQ(sender.GetErrCode(), each.ours) << each.remote;
+        EXPECT_TRUE(sender.GetErrMsg().isNull());
+    }
+    EXPECT_EQ(remote.calls().find("logout"), std::string::npos) << "who is not in does not log out";
+    remote.die();
+    CredAccountSender sender(conn, "joe", "pw", "");
+    EXPECT_FALSE(sender.init());
+    EXPECT_EQ(sender.GetErrCode(), 501);
+}

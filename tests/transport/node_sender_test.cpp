@@ -1,0 +1,227 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "clock.h"
+#include "ovradrcore/json.h"
+#include "ovradrnode/cred_permission_cache.h"
+#include "ovradrnode/node_api.h"
+#include "ovradrnode/sender.h"
+#include "support/local_node.h"
+#include "support/log_capture.h"
+#include "support/remote_node.h"
+#include "transport/conn_cache.h"
+#include "transport/node_valid_cred_cache.h"
+#include "webapi/api_errors.h"
+#include "webapi/api_registry.h"
+
+#include <gtest/gtest.h>
+#include <unistd.h>
+
+using namespace OvraDRNode;
+using namespace OvraTest;
+using OvraDRCore::Response;
+
+namespace {
+
+constexpr const char *kNoPermission = R"({"success":false,"error":{"code":105}})";
+constexpr const char *kOtherError = R"({"success":false,"error":{"code":999,"msg":"m"}})";
+
+/// A node with the credentials c1, c2 (node) and t1 (temporary), all to one endpoint; their
+/// sessions are s1, s2 and s3.
+class NodeSend : public testing::Test {
+protected:
+    void SetUp() override {
+        provisionNode();
+        DRNode::getLocalNodeId();
+        addCred("node_cred", "n1", "c1", "https", remote.port(), "s1");
+        addCred("node_cred", "n1", "c2", "https", remote.port(), "s2");
+        addCred("temp_cred", "n1", "t1", "https", remote.port(), "s3");
+        ConnCache(conn).UpdateWithData(true);
+    }
+    void remember(const std::string &credId) { NodeValidCredCache("n1").UpdateWithData(credId); }
+    std::string stored() { return NodeValidCredCache("n1").getStoredCredId(); }
+    Response send() {
+        remote.forgetCalls();
+        return sender.process(WebAPI::getDRNodeInfoAPI({}));
+    }
+
+    RemoteNode remote;
+    Conn conn = Conn::https("127.0.0.1", remote.port());
+    NodeSender sender{"n1"};
+    LogCapture log;
+};
+
+} // namespace
+
+TEST_F(NodeSend, TheOrderOfAttempts) {
+    const struct {
+        const char *what;
+        const char *remembered;
+        std::map<std::string, const char *> answers; // by session
+        const char *calls;
+        int code; // of the response
+        int senderCode;
+        const char *after; // remembered afterwards
+    } cases[] = {
+        {"remembered works", "c2", {}, "s2 info", 0, 0, "c2"},
+        {"remembered refused, not tried twice",
+         "c2",
+         {{"s2 info", kNoPermission}},
+         "s2 info, s1 info",
+         0,
+         0,
+         "c1"},
+        {"other error ends the search", "c2", {{"s2 info", kOtherError}}, "s2 info", 999, 0, "c2"},
+        {"refused, then success",
+         "c1",
+         {{"s1 info", kNoPermission}},
+         "s1 info, s2 info",
+         0,
+         0,
+         "c2"},
+        {"temporary ones come last",
+         "c1",
+         {{"s1 info", kNoPermission}, {"s2 info", kNoPermission}},
+         "s1 info, s2 info, s3 info",
+         0,
+         0,
+         "t1"},
+        {"no reply goes on", "c1", {{"s1 info", "<html>"}}, "s1 info, s2 info", 0, 0, "c2"},
+        {"all refused: the last answer",
+         "c1",
+         {{"s1 info", kNoPermission}, {"s2 info", kNoPermission}, {"s3 info", kNoPermission}},
+         "s1 info, s2 info, s3 info",
+         105,
+         525,
+         "c1"},
+        {"nothing usable remembered", "gone", {}, "s1 info", 0, 0, "c1"},
+    };
+    for (const auto &each : cases) {
+        for (const char *call : {"s1 info", "s2 info", "s3 info"}) {
+            const auto found = each.answers.find(call);
+            remote.answer(call,
+                          found == each.answers.end() ? R"({"success":true})" : found->second);
+        }
+        remember(each.remembered);
+        const Response response = send();
+        EXPECT_EQ(remote.calls(), each.calls) << each.what;
+        EXPECT_EQ(response.getErrCode(), each.code) << each.what;
+        EXPECT_EQ(sender.GetErrCode(), each.senderCode) << each.what;
+        EXPECT_EQ(stored(), each.after) << each.what;
+    }
+}
+
+TEST_F(NodeSend, ADeadEndpointIsPassedOver) {
+    const int dead = unusedPort();
+    executeSql("UPDATE node_cred SET port = " + std::to_string(dead) + " WHERE cred_id = 'c1'");
+    remember("c1");
+    EXPECT_TRUE(send().isSuccess());
+    EXPECT_EQ(remote.calls(), "s2 info");
+    EXPECT_EQ(stored(), "c2");
+    executeSql("UPDATE node_cred SET port = " + std::to_string(dead));
+    executeSql("DELETE FROM temp_cred");
+    remember("c1");
+    EXPECT_FALSE(send().isValid());
+    EXPECT_EQ(sender.GetErrCode(), 500);
+}
+
+TEST_F(NodeSend, WithNothingRememberedTheFirstWithTheRightIsFoundAndThenUsed) {
+    remote.answer("s1 test_privilege", kNoPermission);
+    EXPECT_TRUE(send().isSuccess());
+    EXPECT_EQ(remote.calls(), "s1 test_privilege, s2 test_privilege, s2 info");
+    EXPECT_TRUE(send().isSuccess());
+    EXPECT_EQ(remote.calls(), "s2 info") << "one call with a remembered credential";
+    EXPECT_FALSE(CredPermissionCache("c1").GetCachedHasPrivilege());
+}
+
+TEST_F(NodeSend, ANodeWithTemporaryCredentialsOnlyIsReachedButHasNoValidCredential) {
+    executeSql("DELETE FROM node_cred");
+    EXPECT_TRUE(send().isSuccess());
+    EXPECT_EQ(sender.getValidCredId(), "");
+    EXPECT_FALSE(sender.isConnectable());
+}
+
+TEST_F(NodeSend, AnUnknownNodeGetsNoAnswer) {
+    NodeSender nobody("n9");
+    EXPECT_FALSE(nobody.process(WebAPI::getDRNodeInfoAPI({})).isValid());
+    EXPECT_EQ(nobody.GetErrCode(), 401);
+    EXPECT_FALSE(nobody.isConnectable());
+    EXPECT_FALSE(nobody.process(OvraDRCore::Request()).isValid());
+    EXPECT_EQ(log.count("Bad api ["), 1);
+    EXPECT_FALSE(NodeSender("").isValid());
+}
+
+TEST_F(NodeSend, TheLocalNodeNeedsNeitherDatabaseNorCache) {
+    unlink(kNodeDatabase);
+    OvraPlatform::APIRegistry registry;
+    registry.add("OVRA.DR.Node", 1, "info", OvraPlatform::APIRight::kAdministrator,
+                 OvraPlatform::APILane::kQuick,
+                 [](const Json::Value &, const OvraPlatform::APICaller &) {
+                     Json::Value data;
+                     data["hostname"] = "here";
+                     return OvraPlatform::apiSuccess(data);
+                 });
+    registry.host();
+    const std::string id = DRNode::getLocalNodeId();
+    Json::Value out;
+    EXPECT_TRUE(NodeSender::process(id, "OVRA.DR.Node", "info", 1, Json::Value(), out));
+    EXPECT_EQ(out["hostname"].asString(), "here");
+    CredNodeSender local(DRNode::getLocalNode());
+    EXPECT_TRUE(local.process(WebAPI::getDRNodeInfoAPI({})).isSuccess());
+    EXPECT_TRUE(local.testPrivilege());
+    EXPECT_EQ(local.GetErrCode(), 407) << "nothing was tested";
+    EXPECT_TRUE(CredNodeSender::IsConnectable(DRNode::getLocalNode()));
+    EXPECT_EQ(log.lines().size(), 0U);
+}
+
+TEST_F(NodeSend, OneNamedCredential) {
+    DRNode node;
+    Response response;
+    EXPECT_FALSE(sender.processByCredId("", WebAPI::getDRNodeInfoAPI({}), response));
+    EXPECT_EQ(sender.GetErrCode(), 401);
+    EXPECT_FALSE(sender.processByCredId("c9", WebAPI::getDRNodeInfoAPI({}), response));
+    EXPECT_EQ(sender.GetErrCode(), 404);
+    EXPECT_FALSE(sender.processByCred(node, WebAPI::getDRNodeInfoAPI({}), response));
+    EXPECT_EQ(sender.GetErrCode(), 401);
+    EXPECT_FALSE(CredNodeSender("c9").isValid());
+    EXPECT_EQ(CredNodeSender("c9").GetErrCode(), 516);
+    EXPECT_EQ(CredNodeSender("").GetErrCode(), 401);
+    EXPECT_EQ(CredNodeSender("c1").GetErrCode(), 0);
+    EXPECT_EQ(CredNodeSender(node).GetErrCode(), 516);
+}
+
+TEST_F(NodeSend, TheRightIsAskedForAgainWhenTheVerdictHasExpired) {
+    static std::int64_t now = 2'000'000'000'000;
+    OvraDRCore::setSystemClock([] { return now; });
+    ConnCache(conn).UpdateWithData(true);
+    CredNodeSender cred("c1");
+    EXPECT_TRUE(cred.testPrivilege());
+    EXPECT_TRUE(cred.testPrivilege());
+    EXPECT_EQ(remote.calls(), "s1 test_privilege");
+    now += 3001;
+    remote.answer("test_privilege", kNoPermission);
+    EXPECT_FALSE(cred.testPrivilege());
+    EXPECT_EQ(cred.GetErrCode(), 525);
+    now += 1000;
+    ConnCache(conn).UpdateWithData(false);
+    EXPECT_FALSE(cred.testPrivilege());
+    EXPECT_EQ(cred.GetErrCode(), 500);
+    OvraDRCore::setSystemClock(nullptr);
+}
+
+TEST_F(NodeSend, ARelayedTestOfPrivilegeSaysNothingAboutTheCredentialThatCarriedIt) {
+    CredPermissionCache permission("c1");
+    EXPECT_TRUE(permission.SetHasPrivilege());
+    remote.answer("relay", kNoPermission);
+    CredNodeSender cred("c1");
+    cred.process(WebAPI::getDRNodeCredRelayAPI("x", WebAPI::getDRNodeTestPrivilegeAPI()));
+    EXPECT_EQ(cred.GetErrCode(), 525);
+    EXPECT_TRUE(permission.GetCachedHasPrivilege());
+    EXPECT_EQ(log.count("NOTICE", "cred_permission_cache", "SetNoPrivilege",
+                        "Not update no permission of credId[c1] in cache for relay test privilege "
+                        "request"),
+              1);
+    EXPECT_FALSE(permission.SetPrivilege(WebAPI::getDRNodeInfoAPI({}), false) == false);
+    EXPECT_FALSE(permission.GetCachedHasPrivilege());
+    EXPECT_FALSE(CredPermissionCache("").SetHasPrivilege());
+    EXPECT_TRUE(CredPermissionCache("new").GetCachedHasPrivilege());
+    EXPECT_EQ(log.count("Set cred [c1] permission cache from [true] to [false]"), 1);
+}

@@ -1,0 +1,147 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "clock.h"
+#include "ovradrcore/json.h"
+#include "ovradrnode/sender.h"
+#include "support/local_node.h"
+#include "support/log_capture.h"
+#include "support/remote_node.h"
+#include "transport/conn_cache.h"
+#include "webapi/api_errors.h"
+#include "webapi/api_registry.h"
+
+#include <gtest/gtest.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <chrono>
+
+using namespace OvraDRNode;
+using namespace OvraTest;
+
+namespace {
+
+std::int64_t fakeNow = 0;
+
+void setClock(std::int64_t milliseconds) {
+    fakeNow = milliseconds;
+    OvraDRCore::setSystemClock([] { return fakeNow; });
+}
+
+std::string text(const Conn &conn) {
+    return OvraDRCore::toString(conn.toJson());
+}
+
+class Probe : public testing::Test {
+protected:
+    void TearDown() override { OvraDRCore::setSystemClock(nullptr); }
+    RemoteNode remote;
+    Conn conn = Conn::https("127.0.0.1", remote.port());
+    LogCapture log;
+};
+
+} // namespace
+
+TEST_F(Probe, TheVerdictIsKeptForItsLifetimeAndThenAskedAgain) {
+    setClock(1'000'000'000'000);
+    EXPECT_TRUE(BaseSender::GetCachedConnectable(conn));
+    EXPECT_TRUE(BaseSender::GetCachedConnectable(conn));
+    EXPECT_EQ(remote.calls(), "probe");
+    setClock(fakeNow + 5001);
+    EXPECT_TRUE(BaseSender::GetCachedConnectable(conn));
+    EXPECT_EQ(remote.calls(), "probe, probe");
+    EXPECT_EQ(log.count("Update conn cache"), 0) << "the verdict never changed";
+}
+
+TEST_F(Probe, AnEndpointThatRefusesIsHeldUnreachableUntilItComesBack) {
+    const Conn dead = Conn::https("127.0.0.1", unusedPort());
+    EXPECT_FALSE(BaseSender::IsConnectable(dead));
+    EXPECT_EQ(log.count("NOTICE", "sender", "IsConnectableWithErrCheck",
+                        "Conn [" + text(dead) + "] is not connectable since cred error[5]"),
+              1);
+    EXPECT_EQ(log.count("DEBUG", "sender", "IsConnectableWithErrCheck",
+                        "Detect conn [127.0.0.1] disconnect costs [0]sec"),
+              1);
+    EXPECT_EQ(log.count("NOTICE", "sender", "IsConnectable",
+                        "Update conn cache [" + text(dead) + "] from [true] to [false]"),
+              1);
+    EXPECT_FALSE(BaseSender::IsConnectable(dead));
+    EXPECT_EQ(log.count("Update conn cache"), 1);
+    log.clear();
+    EXPECT_FALSE(BaseSender::GetCachedConnectable(dead));
+    EXPECT_EQ(log.lines().size(), 0U) << "answered from the cache, no probe";
+}
+
+TEST_F(Probe, AnyAnswerOfTheEntryPointCountsAndTheCertificateIsNotJudged) {
+    remote.answer("probe", Answer::html());
+    EXPECT_TRUE(BaseSender::IsConnectable(conn));
+    remote.server.changeCertificate();
+    EXPECT_TRUE(BaseSender::IsConnectable(conn));
+}
+
+TEST_F(Probe, AHostThatAcceptsAndSaysNothingCostsTheProbesTimeOutOnce) {
+    remote.server.fallSilent();
+    const auto start = std::chrono::steady_clock::now();
+    EXPECT_FALSE(BaseSender::GetCachedConnectable(conn));
+    const std::chrono::duration<double> took = std::chrono::steady_clock::now() - start;
+    EXPECT_GE(took.count(), 9.0);
+    EXPECT_LT(took.count(), 12.0);
+    EXPECT_FALSE(BaseSender::GetCachedConnectable(conn));
+    EXPECT_LT(std::chrono::steady_clock::now() - start, std::chrono::seconds(13));
+    EXPECT_EQ(log.count("cred error[10]"), 1);
+}
+
+TEST_F(Probe, ManyProcessesThatAskAtOnceSendOneProbe) {
+    // The port is closed while they ask: the refusal is quick, so only the order saves the probes.
+    for (int i = 0; i < 20; ++i) {
+        if (fork() == 0) {
+            _exit(BaseSender::GetCachedConnectable(conn) ? 0 : 1);
+        }
+    }
+    int good = 0;
+    int status = 0;
+    while (wait(&status) > 0) {
+        good += status == 0 ? 1 : 0;
+    }
+    EXPECT_EQ(good, 20);
+    EXPECT_EQ(remote.calls(), "probe");
+}
+
+TEST_F(Probe, AnEndpointThatCannotBeProbedIsNotConnectableAndARefreshKeepsTheOldVerdict) {
+    const Conn odd("a b/c", "https", 1);
+    EXPECT_FALSE(BaseSender::IsConnectable(odd));
+    EXPECT_EQ(log.count("ERR", "sender", "IsConnectableWithErrCheck",
+                        "Failed to set url of conn [" + text(odd) + "]"),
+              1);
+    EXPECT_EQ(log.count("NOTICE", "sender", "IsConnectable",
+                        "Failed to check connectable of conn[" + text(odd) + "]"),
+              1);
+    EXPECT_FALSE(ConnCache(odd).getStoredVerdict());
+    ConnCache(odd).UpdateWithData(true, 1, 1);
+    EXPECT_TRUE(BaseSender::GetCachedConnectable(odd));
+}
+
+TEST_F(Probe, AStoredValueThatIsNoVerdictReadsAsConnectableAndIsAskedAgain) {
+    const ConnCache cache(conn);
+    cache.UpdateWithData("rubbish");
+    EXPECT_TRUE(cache.getStoredVerdict());
+    EXPECT_TRUE(BaseSender::GetCachedConnectable(conn));
+    EXPECT_EQ(remote.calls(), "probe");
+    EXPECT_EQ(OvraDRCore::toString(cache.GetInfo()),
+              R"({"conn":)" + text(conn) + R"(,"name":"conn cache"})");
+}
+
+TEST(LocalRun, ReachesTheHandlerAsTheAdministratorAndWrapsWhatItSays) {
+    OvraPlatform::APIRegistry registry;
+    registry.add("A", 1, "m", OvraPlatform::APIRight::kAdministrator, OvraPlatform::APILane::kQuick,
+                 [](const Json::Value &params, const OvraPlatform::APICaller &caller) {
+                     EXPECT_EQ(caller.user, "admin");
+                     return OvraPlatform::apiError(777, params["x"]);
+                 });
+    registry.host();
+    OvraDRCore::Request request("A", 1, "m", Json::Value());
+    request.addParam("x", "why");
+    const OvraDRCore::Response response = BaseSender::run(request);
+    EXPECT_TRUE(response.isValid());
+    EXPECT_EQ(response.getErrCode(), 777);
+    EXPECT_EQ(response.getErrMsg().asString(), "why");
+}
