@@ -112,40 +112,53 @@ std::vector<CacheEntry> BucketImage::entries(const std::byte *copy) {
     return all;
 }
 
-std::size_t BucketImage::measure(const std::vector<CacheEntry> &entries) {
-    std::size_t size = 0;
-    for (const CacheEntry &entry : entries) {
-        size += sizeof(EntryHeader) + entry.name.size() + entry.value.size();
-    }
-    return size;
+std::size_t BucketImage::measure(const CacheEntry &entry) {
+    return sizeof(EntryHeader) + entry.name.size() + entry.value.size();
 }
 
 std::size_t BucketImage::capacity() {
     return kCapacity;
 }
 
-std::size_t BucketImage::encode(std::array<std::byte, kSize> &copy, std::uint32_t bucketCount,
-                                std::uint32_t bucketIndex, std::uint64_t sequence,
-                                const std::vector<CacheEntry> &entries) {
-    std::byte *place = copy.data() + sizeof(Header);
-    for (const CacheEntry &entry : entries) {
-        const EntryHeader header{entry.start, entry.end, entry.lifetime,
-                                 static_cast<std::uint32_t>(entry.name.size()),
-                                 static_cast<std::uint32_t>(entry.value.size())};
-        std::memcpy(place, &header, sizeof(header));
-        place += sizeof(header);
-        std::memcpy(place, entry.name.data(), entry.name.size());
-        place += entry.name.size();
-        std::memcpy(place, entry.value.data(), entry.value.size());
-        place += entry.value.size();
+bool BucketImage::append(std::int64_t start, std::int64_t end, std::int64_t lifetime,
+                         std::string_view name, std::string_view value) {
+    const std::size_t size = sizeof(EntryHeader) + name.size() + value.size();
+    if (size > kCapacity - used_) {
+        return false;
     }
-    const auto total = static_cast<std::size_t>(place - copy.data());
-    const std::size_t used = total - sizeof(Header);
-    Header header{0, kMagic, bucketCount, bucketIndex, static_cast<std::uint32_t>(used), sequence};
-    std::memcpy(copy.data(), &header, sizeof(header));
-    header.checksum = checksumOf(copy.data(), used);
-    std::memcpy(copy.data(), &header, sizeof(header));
-    return total;
+    const EntryHeader header{start, end, lifetime, static_cast<std::uint32_t>(name.size()),
+                             static_cast<std::uint32_t>(value.size())};
+    std::byte *place = bytes_.data() + sizeof(Header) + used_;
+    std::memcpy(place, &header, sizeof(header));
+    std::memcpy(place + sizeof(header), name.data(), name.size());
+    std::memcpy(place + sizeof(header) + name.size(), value.data(), value.size());
+    used_ += size;
+    return true;
+}
+
+bool BucketImage::copyFrom(const std::byte *copy, std::string_view name, std::int64_t oldest) {
+    bool room = true;
+    forEach(copy, [&](const EntryHeader &header, std::string_view key, std::string_view value) {
+        const bool longPast = header.end < oldest - header.lifetime;
+        if (key != name && !longPast) {
+            room = append(header.start, header.end, header.lifetime, key, value);
+        }
+        return room;
+    });
+    return room;
+}
+
+bool BucketImage::add(const CacheEntry &entry) {
+    return append(entry.start, entry.end, entry.lifetime, entry.name, entry.value);
+}
+
+std::string_view BucketImage::finish(std::uint64_t sequence) {
+    Header header{0,       kMagic, bucketCount_, bucketIndex_, static_cast<std::uint32_t>(used_),
+                  sequence};
+    std::memcpy(bytes_.data(), &header, sizeof(header));
+    header.checksum = checksumOf(bytes_.data(), used_);
+    std::memcpy(bytes_.data(), &header, sizeof(header));
+    return textAt(bytes_.data(), sizeof(Header) + used_);
 }
 
 std::uint64_t cacheNameHash(std::string_view name) {

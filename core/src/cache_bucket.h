@@ -35,13 +35,30 @@ public:
     /// All entries of a checked copy.
     static std::vector<CacheEntry> entries(const std::byte *copy);
 
-    /// Bytes that the entries need; more than capacity() do not fit.
-    static std::size_t measure(const std::vector<CacheEntry> &entries);
+    /// Bytes that an entry takes of capacity().
+    static std::size_t measure(const CacheEntry &entry);
     static std::size_t capacity();
-    /// Writes header and entries. \return bytes to store from the start of `copy`.
-    static std::size_t encode(std::array<std::byte, kSize> &copy, std::uint32_t bucketCount,
-                              std::uint32_t bucketIndex, std::uint64_t sequence,
-                              const std::vector<CacheEntry> &entries);
+
+    explicit BucketImage(std::uint32_t bucketCount, std::uint32_t bucketIndex)
+        : bucketCount_(bucketCount)
+        , bucketIndex_(bucketIndex) {}
+    /// Takes over the entries of a checked copy, except that of `name` and those that ended before
+    /// `oldest` for longer than they live.
+    /// \return false when there is no room for them.
+    bool copyFrom(const std::byte *copy, std::string_view name, std::int64_t oldest);
+    /// \return false when there is no room.
+    bool add(const CacheEntry &entry);
+    /// Completes the copy. \return its bytes.
+    std::string_view finish(std::uint64_t sequence);
+
+private:
+    bool append(std::int64_t start, std::int64_t end, std::int64_t lifetime, std::string_view name,
+                std::string_view value);
+
+    std::uint32_t bucketCount_;
+    std::uint32_t bucketIndex_;
+    std::size_t used_ = 0;
+    std::array<std::byte, kSize> bytes_;
 };
 
 /// The hash that chooses an entry's bucket and its refresh lock (XXH3, 64 bits).

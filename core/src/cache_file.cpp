@@ -135,22 +135,14 @@ Choice choose(const Pair &pair, std::uint32_t buckets, std::uint32_t index) {
     return {};
 }
 
-std::vector<CacheEntry> chosenEntries(const Pair &pair, const Choice &choice) {
-    return choice.valid ? BucketImage::entries(pair.data() + choice.newer * BucketImage::kSize)
-                        : std::vector<CacheEntry>();
+const std::byte *chosenCopy(const Pair &pair, const Choice &choice) {
+    return pair.data() + choice.newer * BucketImage::kSize;
 }
 
-bool isLongPast(const CacheEntry &entry, std::int64_t now) {
-    return now - entry.end > entry.lifetime + CacheFile::kKeepStale;
-}
-
-bool storeCopy(int fd, std::uint32_t buckets, std::uint32_t index, std::size_t which,
-               std::uint64_t sequence, const std::vector<CacheEntry> &entries) {
-    std::array<std::byte, BucketImage::kSize> copy{};
-    const std::size_t size = BucketImage::encode(copy, buckets, index, sequence, entries);
+bool storeCopy(int fd, std::uint32_t index, std::size_t which, std::string_view bytes) {
     const auto offset = static_cast<off_t>(index) * static_cast<off_t>(kPair) +
                         static_cast<off_t>(which * BucketImage::kSize);
-    return pwrite(fd, copy.data(), size, offset) == static_cast<ssize_t>(size);
+    return pwrite(fd, bytes.data(), bytes.size(), offset) == static_cast<ssize_t>(bytes.size());
 }
 
 /// A cache file under its exclusive lock.
@@ -201,55 +193,44 @@ public:
         return std::nullopt;
     }
 
-    /// The entries of the bucket of `name`.
-    std::vector<CacheEntry> load(std::string_view name) {
+    /// Reads the bucket of `name` into `pair`, which has to stay while the bucket is used.
+    void load(std::string_view name, Pair &pair) {
         index_ = bucketOf(name, buckets_);
-        Pair pair;
         choice_ = readPair(fd_.get(), index_, pair) ? choose(pair, buckets_, index_) : Choice{};
-        return chosenEntries(pair, choice_);
+        copy_ = choice_.valid ? chosenCopy(pair, choice_) : nullptr;
     }
 
-    /// Replaces the entries of the bucket that was loaded last.
-    bool store(const std::vector<CacheEntry> &entries) {
-        return storeCopy(fd_.get(), buckets_, index_, choice_.valid ? 1 - choice_.newer : 0,
-                         choice_.sequence + 1, entries);
+    /// The whole copy of the loaded bucket; null when there is none.
+    const std::byte *copy() const { return copy_; }
+
+    /// An empty copy for the loaded bucket.
+    BucketImage image() const { return BucketImage(buckets_, index_); }
+
+    /// Replaces the older copy of the loaded bucket.
+    bool store(BucketImage &image) {
+        const std::size_t older = choice_.valid ? 1 - choice_.newer : 0;
+        return storeCopy(fd_.get(), index_, older, image.finish(choice_.sequence + 1));
     }
 
     /// Writes the file anew with twice the buckets, without what is long past, and goes on there.
     /// \return false when that is not to be done or not possible: the old file stays as it is.
-    bool grow(const std::string &path, std::int64_t now) {
+    bool grow(const std::string &path, std::int64_t oldest) {
         if (buckets_ == kMaxBuckets) {
             return false;
         }
         const std::uint32_t buckets = 2 * buckets_;
-        std::vector<std::vector<CacheEntry>> contents(buckets);
-        std::uint64_t total = 0;
-        for (std::uint32_t index = 0; index < buckets_; ++index) {
-            Pair pair;
-            if (!readPair(fd_.get(), index, pair)) {
-                return false;
-            }
-            for (CacheEntry &entry : chosenEntries(pair, choose(pair, buckets_, index))) {
-                if (!isLongPast(entry, now)) {
-                    total += BucketImage::measure({entry});
-                    contents[bucketOf(entry.name, buckets)].push_back(std::move(entry));
-                }
-            }
-        }
-        if (total * kMinLoadToGrow < std::uint64_t{buckets_} * BucketImage::kSize) {
-            return false;
-        }
         // Only the holder of the lock gets here, so a left-over of the same name is dead.
         const std::string temporary = path + ".new";
         unlink(temporary.c_str());
         UniqueFd grown = openFile(temporary, O_RDWR | O_CREAT | O_EXCL);
         bool written = grown && flock(grown.get(), LOCK_EX | LOCK_NB) == 0 &&
                        ftruncate(grown.get(), static_cast<off_t>(buckets * kPair)) == 0;
-        for (std::uint32_t index = 0; written && index < buckets; ++index) {
-            written = contents[index].empty() ||
-                      storeCopy(grown.get(), buckets, index, 0, 1, contents[index]);
+        std::uint64_t total = 0;
+        for (std::uint32_t index = 0; written && index < buckets_; ++index) {
+            written = split(grown.get(), index, oldest, total);
         }
-        if (!written || rename(temporary.c_str(), path.c_str()) != 0) {
+        const bool worthIt = total * kMinLoadToGrow >= std::uint64_t{buckets_} * BucketImage::kSize;
+        if (!written || !worthIt || rename(temporary.c_str(), path.c_str()) != 0) {
             unlink(temporary.c_str());
             return false;
         }
@@ -259,6 +240,29 @@ public:
     }
 
 private:
+    /// Writes the entries of one bucket into the two of the grown file that they belong to.
+    bool split(int grown, std::uint32_t index, std::int64_t oldest, std::uint64_t &total) const {
+        Pair pair;
+        if (!readPair(fd_.get(), index, pair)) {
+            return false;
+        }
+        const Choice choice = choose(pair, buckets_, index);
+        if (choice.sequence == 0) {
+            return true;
+        }
+        BucketImage low(2 * buckets_, index);
+        BucketImage high(2 * buckets_, index + buckets_);
+        for (const CacheEntry &entry : BucketImage::entries(chosenCopy(pair, choice))) {
+            if (entry.end < oldest - entry.lifetime) {
+                continue;
+            }
+            total += BucketImage::measure(entry);
+            (bucketOf(entry.name, 2 * buckets_) == index ? low : high).add(entry);
+        }
+        return storeCopy(grown, index, 0, low.finish(1)) &&
+               storeCopy(grown, index + buckets_, 0, high.finish(1));
+    }
+
     static bool discard(const std::string &path) {
         OVRA_WARN("Cache file [%s] is not a file of ours, replacing it", path.c_str());
         return unlink(path.c_str()) == 0;
@@ -268,13 +272,24 @@ private:
     std::uint32_t buckets_ = 0;
     std::uint32_t index_ = 0;
     Choice choice_;
+    const std::byte *copy_ = nullptr;
 };
 
-void evictOldest(std::vector<CacheEntry> &entries) {
-    const auto oldest = std::min_element(
-        entries.begin(), entries.end(),
-        [](const CacheEntry &left, const CacheEntry &right) { return left.end < right.end; });
-    entries.erase(oldest);
+/// The entries of a copy without that of `name`, newest first.
+std::vector<CacheEntry> newestFirst(const std::byte *copy, std::string_view name) {
+    std::vector<CacheEntry> entries = BucketImage::entries(copy);
+    std::erase_if(entries, [&](const CacheEntry &entry) { return entry.name == name; });
+    std::sort(entries.begin(), entries.end(),
+              [](const CacheEntry &left, const CacheEntry &right) { return left.end > right.end; });
+    return entries;
+}
+
+/// The loaded bucket with `entry` in it. \return false when there is no room for all.
+bool compose(const LockedFile &file, const CacheEntry &entry, std::int64_t oldest,
+             BucketImage &image) {
+    image = file.image();
+    return (file.copy() == nullptr || image.copyFrom(file.copy(), entry.name, oldest)) &&
+           image.add(entry);
 }
 
 } // namespace
@@ -283,7 +298,7 @@ CacheFile::CacheFile(const std::string &path)
     : path_(path) {}
 
 std::size_t CacheFile::maxEntrySize() {
-    return BucketImage::capacity() - BucketImage::measure({CacheEntry{}});
+    return BucketImage::capacity() - BucketImage::measure(CacheEntry{});
 }
 
 std::optional<CacheEntry> CacheFile::read(std::string_view name, int attempts) const {
@@ -311,7 +326,7 @@ std::optional<CacheEntry> CacheFile::read(std::string_view name, int attempts) c
         }
         const Choice choice = choose(pair, buckets, index);
         if (choice.valid) {
-            return BucketImage::find(pair.data() + choice.newer * BucketImage::kSize, name);
+            return BucketImage::find(chosenCopy(pair, choice), name);
         }
     }
     return std::nullopt;
@@ -332,25 +347,27 @@ bool CacheFile::write(const CacheEntry &entry, std::int64_t now) const {
         OVRA_WARN("Failed to open cache file [%s]", path_.c_str());
         return false;
     }
-    for (;;) {
-        std::vector<CacheEntry> entries = file->load(entry.name);
-        std::erase_if(entries, [&](const CacheEntry &other) {
-            return other.name == entry.name || isLongPast(other, now);
-        });
-        const std::size_t room = BucketImage::capacity() - BucketImage::measure({entry});
-        if (BucketImage::measure(entries) > room && file->grow(path_, now)) {
-            continue;
-        }
-        while (BucketImage::measure(entries) > room) {
-            evictOldest(entries);
-        }
-        entries.push_back(entry);
-        if (!file->store(entries)) {
-            OVRA_WARN("Failed to write cache file [%s]: %s", path_.c_str(), strerrordesc_np(errno));
-            return false;
-        }
-        return true;
+    const std::int64_t oldest = now - kKeepStale;
+    Pair pair;
+    file->load(entry.name, pair);
+    BucketImage image = file->image();
+    bool fits = compose(*file, entry, oldest, image);
+    while (!fits && file->grow(path_, oldest)) {
+        file->load(entry.name, pair);
+        fits = compose(*file, entry, oldest, image);
     }
+    if (!fits) { // the oldest go
+        image = file->image();
+        image.add(entry);
+        for (const CacheEntry &other : newestFirst(file->copy(), entry.name)) {
+            image.add(other);
+        }
+    }
+    if (!file->store(image)) {
+        OVRA_WARN("Failed to write cache file [%s]: %s", path_.c_str(), strerrordesc_np(errno));
+        return false;
+    }
+    return true;
 }
 
 bool CacheFile::remove(std::string_view name) const {
@@ -361,11 +378,14 @@ bool CacheFile::remove(std::string_view name) const {
     if (!file) {
         return access(path_.c_str(), F_OK) != 0;
     }
-    std::vector<CacheEntry> entries = file->load(name);
-    if (std::erase_if(entries, [&](const CacheEntry &entry) { return entry.name == name; }) == 0) {
+    Pair pair;
+    file->load(name, pair);
+    if (file->copy() == nullptr || !BucketImage::find(file->copy(), name)) {
         return true;
     }
-    return file->store(entries);
+    BucketImage image = file->image();
+    image.copyFrom(file->copy(), name, INT64_MIN / 2);
+    return file->store(image);
 }
 
 namespace {

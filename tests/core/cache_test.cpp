@@ -16,6 +16,7 @@
 #include <atomic>
 #include <chrono>
 #include <csignal>
+#include <cstring>
 #include <fstream>
 #include <functional>
 #include <random>
@@ -453,9 +454,11 @@ TEST_F(CacheTest, ARefreshThatDiesIsTakenOver) {
 
 TEST_F(CacheTest, ADamagedCopyWithARightChecksumStaysWithinItsBounds) {
     // Sizes that point out of the copy, under a checksum that fits.
+    BucketImage image(16, 3);
+    ASSERT_TRUE(image.add({"name", "\"value\"", 1, 1, 1}));
+    const std::string_view bytes = image.finish(1);
     std::array<std::byte, BucketImage::kSize> copy{};
-    CacheEntry entry{"name", "\"value\"", 1, 1, 1};
-    const std::size_t size = BucketImage::encode(copy, 16, 3, 1, {entry});
+    std::memcpy(copy.data(), bytes.data(), bytes.size());
     ASSERT_EQ(BucketImage::check(copy.data(), 16, 3), 1U);
     EXPECT_FALSE(BucketImage::check(copy.data(), 16, 4)) << "a copy of another bucket";
     EXPECT_FALSE(BucketImage::check(copy.data(), 32, 3)) << "a copy of a smaller file";
@@ -466,5 +469,4 @@ TEST_F(CacheTest, ADamagedCopyWithARightChecksumStaysWithinItsBounds) {
         EXPECT_LE(BucketImage::entries(bent.data()).size(), 1U);
         BucketImage::find(bent.data(), "name");
     }
-    EXPECT_LT(size, BucketImage::kSize);
 }
