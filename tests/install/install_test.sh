@@ -15,7 +15,9 @@ cmake -S "$source/examples" -B "$work/cmake" -G Ninja -DCMAKE_PREFIX_PATH="$work
 cmake --build "$work/cmake"
 pc=$(dirname "$(find "$work/moved" -name ovradrnode.pc)")
 read -ra flags < <(PKG_CONFIG_PATH=$pc pkg-config --cflags --libs ovradrnode)
-g++ -std=c++17 "$source/examples/node_info.cpp" "${flags[@]}" -o "$work/by_pkg_config"
+# The program in the README, as it stands there.
+sed -n '/^```cpp$/,/^```$/{/^```/!p}' "$source/README.md" >"$work/readme.cpp"
+g++ -std=c++17 "$work/readme.cpp" "${flags[@]}" -o "$work/by_pkg_config"
 
 # A node that nothing is known about is a clear error, not a crash.
 library=$(dirname "$(find "$work/moved" -name libovradrnode.so.1)")

@@ -423,6 +423,21 @@ void MisbehavingServer::closeConnections() {
     impl_->closeAll();
 }
 
+bool MisbehavingServer::vanish() {
+    const std::lock_guard<std::mutex> lock(impl_->mutex);
+    for (const int fd : impl_->open) {
+        // A socket under repair is taken apart without a segment sent.
+        const int on = 1;
+        sockaddr none{};
+        none.sa_family = AF_UNSPEC;
+        if (setsockopt(fd, IPPROTO_TCP, TCP_REPAIR, &on, sizeof(on)) != 0 ||
+            connect(fd, &none, sizeof(none)) != 0) {
+            return false;
+        }
+    }
+    return true;
+}
+
 void MisbehavingServer::refuse() {
     impl_->refuse();
 }

@@ -88,6 +88,9 @@ public:
     void fallSilent();
     /// Closes every open connection.
     void closeConnections();
+    /// Forgets every open connection without a word to the peer, as after a loss of power.
+    /// \return false where that needs a right that this process lacks (CAP_NET_ADMIN).
+    bool vanish();
     /// Closes the port: who connects is refused.
     void refuse();
 

@@ -181,21 +181,6 @@ TEST_F(Sessions, ThatAreRemovedAreGoneFromTheFileToo) {
     EXPECT_EQ(readFile(file()).find(gone), std::string::npos);
 }
 
-TEST_F(Sessions, AreRemovedTogetherByATestThatMayUseTheStore) {
-    for (const char *user : {"ann", "bob", "ann", "cid"}) {
-        create(user, -1);
-    }
-    std::string made;
-    EXPECT_TRUE(store().removeIf([&](const SessionRecord &session) {
-        if (made.empty()) {
-            made = create("dan", -1);
-        }
-        return session.user == "ann" && store().find(session.id).has_value();
-    }));
-    EXPECT_EQ(count(), 3U);
-    EXPECT_TRUE(store().find(made));
-}
-
 TEST_F(Sessions, AreForTheirOwnerOnly) {
     umask(0);
     create("ann", -1);
@@ -233,18 +218,6 @@ TEST_F(Sessions, ADamagedOrForeignFileIsAClearErrorAndStaysAsItIs) {
         EXPECT_NE(sessions.error().find("move"), std::string::npos) << sessions.error();
         EXPECT_EQ(readFile(file()), content);
     }
-}
-
-TEST_F(Sessions, WaitForAProcessThatHoldsTheFile) {
-    create("ann", -1);
-    RawSqlite holder(file());
-    ASSERT_TRUE(holder.run("BEGIN EXCLUSIVE"));
-    std::thread release([&] {
-        std::this_thread::sleep_for(std::chrono::milliseconds(300));
-        holder.run("COMMIT");
-    });
-    EXPECT_NE(create("bob", -1), "");
-    release.join();
 }
 
 TEST_F(Sessions, ManyProcessesMakeTheStoreAndUseItAtOnce) {

@@ -230,6 +230,17 @@ TEST_F(CredRequestScene, replacesAKeptConnectionThatThePeerHasClosed) {
     EXPECT_EQ(server.requests().size(), 3U);
 }
 
+TEST_F(CredRequestScene, repeatsARequestOfWhichNothingArrived) {
+    MisbehavingServer server({.tls = true});
+    call(server);
+    call(server);
+    if (!server.vanish()) {
+        GTEST_SKIP() << "a connection cannot be made to vanish without CAP_NET_ADMIN";
+    }
+    EXPECT_TRUE(call(server).ok);
+    EXPECT_EQ(server.requests().size(), 3U);
+}
+
 TEST_F(CredRequestScene, doesNotRepeatARequestThatMayHaveBeenCarriedOut) {
     MisbehavingServer server({.tls = true});
     call(server);

@@ -3,6 +3,7 @@
 #include "credential/peer_trust.h"
 #include "platform/credential/sealing_daemon.h"
 #include "platform/own_files.h"
+#include "support/log_capture.h"
 
 #include <ovracredential/cred_request.h>
 
@@ -107,6 +108,28 @@ TEST_F(SealedCallScene, keepsEverySecretOutOfPlainHttp) {
     EXPECT_TRUE(carries(*server, "api=OVRA.Test&version=1&method=set&sealed="));
 }
 
+TEST_F(SealedCallScene, logsNothingSecretWhateverGoesWrong) {
+    const LogCapture log;
+    const auto server = start(false);
+    login();
+    call();
+    server->answerOnce(Answer::html());
+    call();
+    server->answerOnce(Answer::json(R"({"sealed_reply":"AAAA"})"));
+    login();
+    daemon_->newKey(path("other"));
+    call();
+    login();
+    server->refuse();
+    server->closeConnections();
+    OVRA::CredRequestUtil::Logout(cred_.get(), sess_.get());
+    EXPECT_GT(log.count("is not the one trusted for it"), 0);
+    EXPECT_GT(log.count("A session could not be ended"), 0);
+    for (const char *secret : {"hunter2", "granted-sid", "topsecret", "sid-1"}) {
+        EXPECT_EQ(log.count(secret), 0) << secret;
+    }
+}
+
 TEST_F(SealedCallScene, logsInOverTlsWithoutASeal) {
     const auto server = start(true);
     EXPECT_NE(login(), 0);
@@ -168,6 +191,16 @@ TEST_F(SealedCallScene, getsThroughToAnApplianceWithAnotherTime) {
         EXPECT_EQ(call(), CredError::kNone) << skew;
         EXPECT_EQ(server->requests().size(), 4U) << "the difference is remembered";
     }
+}
+
+TEST_F(SealedCallScene, triesNoMoreThanTwiceWhenTheTimeRunsAway) {
+    const auto runAway = [this] { return wallClock() + (skew_ += 1'000'000); };
+    daemon_ = std::make_unique<SealingDaemon>(path("runaway"), serve,
+                                              ReplayGuard::Clocks{runAway, runAway});
+    const auto server = start(false);
+    EXPECT_EQ(call(), CredError::kNone);
+    EXPECT_EQ(reply_["error"]["code"], APIError::kSealRefused);
+    EXPECT_EQ(server->requests().size(), 3U) << "the key and two tries";
 }
 
 TEST_F(SealedCallScene, refusesAnHttpEndpointWhoseKeyHasChanged) {

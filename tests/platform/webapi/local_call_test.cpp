@@ -147,11 +147,16 @@ TEST_F(LocalCallScene, refusesTheProcessesOfOtherUsers) {
     // The modes alone would keep them out: open them, so that the peer check has to.
     ASSERT_EQ(chmod(kStateDir, 0755), 0);
     ASSERT_EQ(chmod(kSocketFile, 0666), 0);
+    constexpr int kNoOtherUser = 99;
     OvraTest::OtherProcess stranger([] {
         constexpr uid_t kNobody = 65534;
-        return setuid(kNobody) == 0 ? codeOf(ask()) : -1;
+        return setuid(kNobody) == 0 ? codeOf(ask()) : kNoOtherUser;
     });
-    EXPECT_EQ(stranger.wait(), APIError::kNoPermission);
+    const int code = stranger.wait();
+    if (code == kNoOtherUser) {
+        GTEST_SKIP() << "there is no other user in this user namespace";
+    }
+    EXPECT_EQ(code, APIError::kNoPermission);
 }
 
 TEST_F(LocalCallScene, survivesRubbish) {
