@@ -39,7 +39,7 @@ std::string_view stemOf(std::string_view path) {
     return name.substr(0, name.find('.'));
 }
 
-std::string vformat(const char *format, va_list args) {
+__attribute__((format(printf, 1, 0))) std::string vformat(const char *format, va_list args) {
     va_list measured;
     va_copy(measured, args);
     // NOLINTNEXTLINE(clang-analyzer-valist.Uninitialized): the check does not know va_copy

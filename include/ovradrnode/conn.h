@@ -16,7 +16,7 @@ OVRADRNODE_EXPORT bool isValidProtocol(const std::string &protocol);
 
 /// How a node's web API is reached: over plain HTTP, over HTTPS, or through the relay service.
 /// A small value; nothing is validated until isValid() is asked. Nothing here throws.
-class OVRADRNODE_EXPORT Conn : public OvraDRCore::SqliteRecord {
+class OVRADRNODE_EXPORT Conn final : public OvraDRCore::SqliteRecord {
 public:
     /// Of the columns "addr", "protocol" (text) and "port" (integer), those that are listed.
     OvraDRCore::SqliteValueList

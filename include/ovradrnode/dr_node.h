@@ -15,7 +15,7 @@ namespace OvraDRNode {
 /// One credential that this node holds: which node it reaches, its own id, the endpoint, and the
 /// session that the remote node granted. The local node is the record whose two ids are both the
 /// local node id.
-class OVRADRNODE_EXPORT DRNode : public OvraDRCore::SqliteRecord {
+class OVRADRNODE_EXPORT DRNode final : public OvraDRCore::SqliteRecord {
 public:
     OvraDRCore::SqliteValueList
     ToSqliteValues(const std::vector<std::string> &fields) const override;

@@ -12,6 +12,7 @@
 #include "ovradrnode/node.h"
 #include "ovradrnode/node_api.h"
 #include "ovradrnode/node_cache.h"
+#include "ovradrnode/node_candidates.h"
 #include "ovradrnode/node_create.h"
 #include "ovradrnode/node_db.h"
 #include "ovradrnode/node_delete.h"

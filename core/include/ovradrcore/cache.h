@@ -53,6 +53,8 @@ public:
     /// Seconds since the stored value was taken, or -1 when nothing is stored (or it is stamped in
     /// the future). Sends nothing.
     double GetCachedAge() const;
+    /// Seconds for which a stored value is fresh.
+    long GetLifetime() const { return lifetime_; }
     /// Fetches now, whatever is stored, and stores the result.
     bool Update() const;
     /// Stores `value` as taken now.

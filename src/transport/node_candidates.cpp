@@ -1,0 +1,104 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "ovradrnode/node_candidates.h"
+
+#include "ovradrnode/cred_permission_cache.h"
+#include "ovradrnode/node_db.h"
+#include "transport/conn_cache.h"
+#include "transport/node_valid_cred_cache.h"
+#include "words.h"
+
+#include <algorithm>
+
+namespace OvraDRNode {
+
+namespace {
+
+CachedVerdict verdictOf(const OvraDRCore::Cache &cache) {
+    const Json::Value stored = cache.GetCachedData();
+    CachedVerdict verdict;
+    verdict.known = cache.IsValid(stored);
+    if (verdict.known) {
+        verdict.value = stored.asBool();
+        verdict.age = cache.GetCachedAge();
+        verdict.fresh = verdict.age >= 0 && verdict.age <= static_cast<double>(cache.GetLifetime());
+    }
+    return verdict;
+}
+
+Json::Value toJson(const CachedVerdict &verdict) {
+    Json::Value json(Json::objectValue);
+    json["known"] = verdict.known;
+    json["value"] = verdict.value;
+    json["fresh"] = verdict.fresh;
+    json["age"] = verdict.age;
+    return json;
+}
+
+const char *word(NodeCandidate::Outlook outlook) {
+    switch (outlook) {
+    case NodeCandidate::Outlook::kNext:
+        return "next";
+    case NodeCandidate::Outlook::kLater:
+        return "later";
+    case NodeCandidate::Outlook::kUnreachable:
+        return "unreachable";
+    case NodeCandidate::Outlook::kInvalid:
+        return "invalid";
+    }
+    return "later";
+}
+
+void addCandidates(const std::string &nodeId, DRNodeDB::CredType type,
+                   const std::string &remembered, std::vector<NodeCandidate> &candidates) {
+    std::vector<DRNode> nodes;
+    DRNodeDB::ListCred(nodeId, nodes, type);
+    for (const DRNode &node : nodes) {
+        NodeCandidate candidate;
+        candidate.node = node;
+        candidate.temporary = type == DRNodeDB::CRED_TYPE_TEMP;
+        candidate.remembered = !remembered.empty() && node.credId == remembered;
+        candidate.reachable = verdictOf(ConnCache(node.conn));
+        candidate.privilege = verdictOf(CredPermissionCache(node.credId));
+        candidates.push_back(candidate);
+    }
+}
+
+} // namespace
+
+Json::Value NodeCandidate::toJson() const {
+    Json::Value json(Json::objectValue);
+    json[Word::kCredId] = node.credId;
+    json["endpoint"] = node.conn.toJson();
+    json["temporary"] = temporary;
+    json["remembered"] = remembered;
+    json["reachable"] = OvraDRNode::toJson(reachable);
+    json["privilege"] = OvraDRNode::toJson(privilege);
+    json["outlook"] = word(outlook);
+    return json;
+}
+
+std::vector<NodeCandidate> listNodeCandidates(const std::string &nodeId) {
+    std::vector<NodeCandidate> candidates;
+    if (nodeId.empty() || DRNode::isLocalNodeId(nodeId)) {
+        return candidates;
+    }
+    const std::string remembered = NodeValidCredCache(nodeId).getStoredCredId();
+    addCandidates(nodeId, DRNodeDB::CRED_TYPE_NODE, remembered, candidates);
+    addCandidates(nodeId, DRNodeDB::CRED_TYPE_TEMP, remembered, candidates);
+    std::stable_partition(candidates.begin(), candidates.end(),
+                          [](const NodeCandidate &candidate) { return candidate.remembered; });
+    bool nextFound = false;
+    for (NodeCandidate &candidate : candidates) {
+        if (!candidate.node.isValid()) {
+            candidate.outlook = NodeCandidate::Outlook::kInvalid;
+        } else if (candidate.reachable.fresh && !candidate.reachable.value) {
+            candidate.outlook = NodeCandidate::Outlook::kUnreachable;
+        } else if (!nextFound) {
+            candidate.outlook = NodeCandidate::Outlook::kNext;
+            nextFound = true;
+        }
+    }
+    return candidates;
+}
+
+} // namespace OvraDRNode
