@@ -1,0 +1,28 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include "failure.h"
+#include "prompt.h"
+
+#include <CLI/CLI.hpp>
+
+#include <functional>
+
+namespace Ovradr {
+
+/// What the command line asks for, ready to run.
+using Command = std::function<Outcome()>;
+
+// Each adds a family of commands to the program. Parsing one of them sets `chosen`, which has to
+// live as long as `app`.
+void addSetupCommand(CLI::App &app, Command &chosen);
+void addNodeCommands(CLI::App &app, Command &chosen);
+void addUserCommands(CLI::App &app, Command &chosen);
+void addCredCommands(CLI::App &app, Command &chosen);
+void addCallCommand(CLI::App &app, Command &chosen);
+void addConnCommands(CLI::App &app, Command &chosen);
+
+/// --password-file and --password-stdin; `source` has to live as long as `command`.
+void addPasswordOptions(CLI::App &command, PasswordSource &source);
+
+} // namespace Ovradr

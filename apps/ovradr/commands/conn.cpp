@@ -1,0 +1,161 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "commands/commands.h"
+#include "output.h"
+#include "provision/server_certificate.h"
+#include "target.h"
+#include "trust.h"
+
+#include <ovracredential/cred_request.h>
+#include <ovradrnode/sender.h>
+
+#include <core/appliance.h>
+#include <credential/sealed_box.h>
+#include <credential/trust_store.h>
+
+#include <algorithm>
+#include <chrono>
+#include <memory>
+#include <vector>
+
+namespace Ovradr {
+
+namespace {
+
+using OvraDRNode::Conn;
+using OvraPlatform::CredError;
+using OvraPlatform::PeerIdentity;
+using OvraPlatform::TrustStore;
+
+constexpr long kReasonSeconds = 5;
+constexpr int kProbe = 2;
+
+/// What those who connect are shown; "" where the key cannot be read.
+std::string ownFingerprint(const Conn &conn) {
+    if (conn.protocol == "https") {
+        return certificateFingerprint(OvraPlatform::kTlsCertificateFile);
+    }
+    std::string why;
+    const auto keys = conn.protocol == "http"
+                          ? OvraPlatform::SealKeyPair::load(OvraPlatform::kSealKeyFile, why)
+                          : std::nullopt;
+    return keys ? OvraPlatform::fingerprintOf(keys->publicKey()) : "";
+}
+
+Outcome local() {
+    Report report;
+    report.data["conns"] = Json::Value(Json::arrayValue);
+    std::vector<std::vector<std::string>> rows;
+    for (const Conn &conn : Conn::listLocal()) {
+        Json::Value json = conn.toJson();
+        json["fingerprint"] = ownFingerprint(conn);
+        report.data["conns"].append(json);
+        rows.push_back({targetText(conn), json["fingerprint"].asString()});
+    }
+    report.text =
+        rows.empty() ? "This appliance serves at no address.\n" : table({"ENDPOINT", "KEY"}, rows);
+    return report;
+}
+
+/// Asks once more, to learn what the probe of the library leaves out.
+Failure whyNotReachable(const Conn &conn) {
+    OVRA::CredRequest request;
+    const bool answered =
+        request.SetURL(conn.protocol, conn.addr, conn.port, "webapi/query.cgi") != 0 &&
+        request.SetDefaultTimeout(kReasonSeconds) != 0 && request.Process(false, kProbe) != 0;
+    if (answered) {
+        return failure(ExitCode::kNotReachable,
+                       targetText(conn) + " did not answer at first, but does now.", "Try again.");
+    }
+    return endpointFailure(conn, static_cast<CredError>(request.GetError()));
+}
+
+Outcome test(const std::string &url) {
+    const Expected<Conn> conn = parseTarget(url);
+    if (!conn) {
+        return conn.failure();
+    }
+    const Conn direct = Conn::translateFarlink(*conn);
+    if (!direct.isValid()) {
+        return failure(ExitCode::kNotReachable,
+                       "The relay service does not know " + targetText(*conn) + ".",
+                       "Check the alias, and that the relay service is set up here.");
+    }
+    const auto start = std::chrono::steady_clock::now();
+    if (!OvraDRNode::BaseSender::IsConnectable(direct)) {
+        return whyNotReachable(direct);
+    }
+    const auto took = std::chrono::duration_cast<std::chrono::milliseconds>(
+                          std::chrono::steady_clock::now() - start)
+                          .count();
+    const PeerIdentity identity =
+        OvraPlatform::peerFingerprint(direct.protocol, direct.addr, direct.port, kMeetSeconds);
+    const bool shown = identity.error == CredError::kNone;
+    Report report;
+    report.data["endpoint"] = targetText(direct);
+    report.data["connectable"] = true;
+    report.data["milliseconds"] = Json::Int64(took);
+    if (shown) {
+        report.data["fingerprint"] = identity.fingerprint;
+        report.data["trust"] = trustWord(identity);
+    }
+    report.text = listing({{"endpoint", targetText(direct)},
+                           {"connectable", "yes, in " + std::to_string(took) + " ms"},
+                           {"key", shown ? identity.fingerprint : "none shown"},
+                           {"trusted", shown ? trustText(identity) : ""}});
+    return report;
+}
+
+Outcome forget(const std::string &url) {
+    const Expected<Conn> conn = parseTarget(url);
+    if (!conn) {
+        return conn.failure();
+    }
+    const std::string endpoint = targetText(*conn);
+    TrustStore store;
+    const auto known = store.list();
+    if (!known) {
+        return endpointFailure(*conn, CredError::kTrustUnavailable);
+    }
+    if (std::none_of(known->begin(), known->end(), [&endpoint](const TrustStore::Entry &entry) {
+            return entry.endpoint == endpoint;
+        })) {
+        return failure(ExitCode::kNotFound, "No key is known for " + endpoint + ".",
+                       "There is nothing to forget.");
+    }
+    if (!store.forget(endpoint)) {
+        return endpointFailure(*conn, CredError::kTrustUnavailable);
+    }
+    Report report;
+    report.data["endpoint"] = endpoint;
+    report.text = printable("The key of " + endpoint + " is forgotten.") + "\n";
+    return report;
+}
+
+using UrlAction = Outcome (*)(const std::string &);
+
+void addUrlCommand(CLI::App &family, const char *name, const char *description, const char *example,
+                   Command &chosen, UrlAction action) {
+    CLI::App *command = family.add_subcommand(name, description);
+    const auto url = std::make_shared<std::string>();
+    command->add_option("URL", *url, "https://HOST[:5001], http://HOST[:5000] or flk:ALIAS")
+        ->required();
+    command->footer(std::string("Example:\n  ") + example);
+    command->callback([&chosen, url, action] { chosen = [url, action] { return action(*url); }; });
+}
+
+} // namespace
+
+void addConnCommands(CLI::App &app, Command &chosen) {
+    CLI::App *family = app.add_subcommand("conn", "Endpoints, here and over there.");
+    family->require_subcommand(1);
+    CLI::App *localCommand =
+        family->add_subcommand("local", "List where this appliance serves, and with which keys.");
+    localCommand->footer("Example:\n  ovradr conn local");
+    localCommand->callback([&chosen] { chosen = local; });
+    addUrlCommand(*family, "test", "Test whether an endpoint answers, and with which key.",
+                  "ovradr conn test https://nas2", chosen, test);
+    addUrlCommand(*family, "forget", "Forget the known key of an endpoint, when it was changed.",
+                  "ovradr conn forget https://nas2", chosen, forget);
+}
+
+} // namespace Ovradr

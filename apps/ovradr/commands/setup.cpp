@@ -1,0 +1,272 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "commands/commands.h"
+#include "output.h"
+#include "provision/node_database.h"
+#include "provision/server_certificate.h"
+
+#include <ovracore/ovracore.h>
+#include <ovradrcore/util.h>
+#include <ovradrnode/dr_node.h>
+#include <ovranet/ovranet.h>
+
+#include <arpa/inet.h>
+#include <core/appliance.h>
+#include <credential/sealed_box.h>
+#include <netinet/in.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <array>
+#include <memory>
+#include <optional>
+#include <vector>
+
+namespace Ovradr {
+
+namespace {
+
+using OvraPlatform::ApplianceConfig;
+
+constexpr std::size_t kMaxHostname = 253; // RFC 1035, 2.3.4, as text
+constexpr std::size_t kMaxSerial = 64;
+constexpr int kHighestPort = 65535;
+constexpr int kMaxInterfaces = 32;
+
+/// The settings that were given; those that were not stay as they are.
+struct Settings {
+    std::optional<std::string> hostname;
+    std::optional<std::string> serial;
+    std::optional<std::string> addresses;
+    std::optional<int> httpPort;
+    std::optional<int> httpsPort;
+};
+
+// CLI11 validators: "" when the text is fine, otherwise why not.
+
+std::string checkHostname(const std::string &text) {
+    const bool valid =
+        text.size() <= kMaxHostname && std::all_of(text.begin(), text.end(), [](char c) {
+            return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z') || (c >= '0' && c <= '9') ||
+                   c == '-' || c == '.' || c == '_';
+        });
+    return valid ? "" : "a host name has letters, digits, \"-\", \".\" and \"_\"";
+}
+
+std::string checkSerial(const std::string &text) {
+    const bool valid = text.size() <= kMaxSerial &&
+                       std::all_of(text.begin(), text.end(),
+                                   [](char c) { return c >= ' ' && c <= '~' && c != '"'; });
+    return valid ? "" : "a serial number has at most 64 characters of ASCII without quotes";
+}
+
+std::string checkAddresses(const std::string &text) {
+    if (std::count(text.begin(), text.end(), ',') >= kMaxInterfaces) {
+        return "there may be 32 addresses at most";
+    }
+    for (std::size_t begin = 0; begin < text.size();) {
+        const std::size_t comma = std::min(text.find(',', begin), text.size());
+        const std::string address = text.substr(begin, comma - begin);
+        in6_addr parsed{};
+        if (inet_pton(AF_INET, address.c_str(), &parsed) != 1 &&
+            inet_pton(AF_INET6, address.c_str(), &parsed) != 1) {
+            return "\"" + address + "\" is not a numeric IPv4 or IPv6 address";
+        }
+        begin = comma + 1;
+    }
+    return "";
+}
+
+Trouble makeFolders() {
+    using OvraPlatform::kConfigDir;
+    if (!OvraDRCore::File::CreateDir(kConfigDir, 0755)) {
+        return fileFailure(kConfigDir, errno);
+    }
+    if (!OvraPlatform::ensureStateDir()) {
+        return failure(ExitCode::kNotSetUp,
+                       std::string("The folder ") + OvraPlatform::kStateDir +
+                           " cannot be made, or is not this user's alone.",
+                       "Run the command as root; the system log says more.");
+    }
+    return std::nullopt;
+}
+
+/// Writes the settings that were given; the others keep their lines.
+Expected<SetUpStep> writeSettings(const Settings &settings) {
+    std::vector<std::pair<const char *, std::string>> given;
+    const auto add = [&given](const char *key, const std::optional<std::string> &value) {
+        if (value) {
+            given.emplace_back(key, *value);
+        }
+    };
+    const auto number = [](const std::optional<int> &value) {
+        return value ? std::optional(std::to_string(*value)) : std::nullopt;
+    };
+    add("hostname", settings.hostname);
+    add("serial", settings.serial);
+    add("address", settings.addresses);
+    add("http_port", number(settings.httpPort));
+    add("https_port", number(settings.httpsPort));
+    std::string names;
+    for (const auto &[key, value] : given) {
+        if (OLIBCFileSetKeyValue(OvraPlatform::kConfigFile, key, value.c_str(), "%s=\"%s\"\n") <
+            0) {
+            return failure(ExitCode::kNotSetUp,
+                           std::string(OvraPlatform::kConfigFile) + " cannot be written.",
+                           "Run the command as root, on a disk that is not full.");
+        }
+        names += (names.empty() ? ": " : ", ") + std::string(key);
+    }
+    return SetUpStep{"settings", !given.empty(), OvraPlatform::kConfigFile + names};
+}
+
+/// The settings that will hold; refused when the appliance could not serve with them.
+Expected<ApplianceConfig> checkSettings(const Settings &settings) {
+    ApplianceConfig config = OvraPlatform::readApplianceConfig();
+    config.httpPort = settings.httpPort.value_or(config.httpPort);
+    config.httpsPort = settings.httpsPort.value_or(config.httpsPort);
+    if (config.httpPort == config.httpsPort) {
+        return failure(ExitCode::kUsage,
+                       "HTTP and HTTPS cannot both have port " + std::to_string(config.httpPort) +
+                           ".",
+                       "Choose another one with --http-port or --https-port.");
+    }
+    return config;
+}
+
+Trouble checkFile() {
+    const ApplianceConfig config = OvraPlatform::readApplianceConfig();
+    if (config.problems.empty()) {
+        return std::nullopt;
+    }
+    return failure(ExitCode::kNotSetUp,
+                   std::string(OvraPlatform::kConfigFile) + ": " + config.problems.front() + ".",
+                   "Correct the file and run `ovradr setup` again.");
+}
+
+ServerNames serverNames() {
+    std::array<OLIBNetInterface, kMaxInterfaces> interfaces{};
+    const int count = OLIBNetGetInterfaceInfo(interfaces.data(), kMaxInterfaces,
+                                              OLIB_NET_SELECT_IPV4 | OLIB_NET_SELECT_IPV6);
+    ServerNames names{OvraDRNode::DRNode::getLocalHostName(), {}};
+    for (int i = 0; i < count; ++i) {
+        names.addresses.emplace_back(interfaces.at(static_cast<std::size_t>(i)).address);
+    }
+    return names;
+}
+
+Expected<SetUpStep> provisionSealKey(std::string &fingerprint) {
+    const bool there = access(OvraPlatform::kSealKeyFile, F_OK) == 0;
+    std::string why;
+    const auto keys = OvraPlatform::SealKeyPair::loadOrCreate(OvraPlatform::kSealKeyFile, why);
+    if (!keys) {
+        return failure(ExitCode::kNotSetUp, "No sealing key: " + why + ".",
+                       "Correct that and run `ovradr setup` again.");
+    }
+    fingerprint = OvraPlatform::fingerprintOf(keys->publicKey());
+    return SetUpStep{"sealing key", !there, OvraPlatform::kSealKeyFile};
+}
+
+Expected<SetUpStep> provisionNodeId(std::string &nodeId) {
+    const std::string file = std::string(OvraPlatform::kConfigDir) + "/node.info";
+    const bool there = OLIBCFileExist(file.c_str()) != 0;
+    nodeId = OvraDRNode::DRNode::getLocalNodeId();
+    if (nodeId.empty()) {
+        return failure(ExitCode::kNotSetUp, "The node id can be neither read nor made.",
+                       "The system log says why.");
+    }
+    return SetUpStep{"node id", !there, nodeId};
+}
+
+struct SetUp {
+    std::vector<SetUpStep> steps;
+    std::string nodeId;
+    std::string httpsFingerprint;
+    std::string httpFingerprint;
+};
+
+Outcome report(const SetUp &setUp) {
+    Report report;
+    std::vector<std::vector<std::string>> rows;
+    for (const SetUpStep &step : setUp.steps) {
+        const char *state = step.made ? "made" : "kept";
+        rows.push_back({step.what, state, step.detail});
+        Json::Value item;
+        item["what"] = step.what;
+        item["made"] = step.made;
+        item["detail"] = step.detail;
+        report.data["steps"].append(item);
+    }
+    report.data["node_id"] = setUp.nodeId;
+    report.data["fingerprints"]["https"] = setUp.httpsFingerprint;
+    report.data["fingerprints"]["http"] = setUp.httpFingerprint;
+    report.text =
+        table({"WHAT", "STATE", "DETAIL"}, rows) +
+        "\nWho pairs with this appliance is shown one of these keys:\n" +
+        listing({{"  over https", setUp.httpsFingerprint}, {"  over http", setUp.httpFingerprint}});
+    return report;
+}
+
+Outcome setUp(const Settings &settings) {
+    const Expected<ApplianceConfig> config = checkSettings(settings);
+    if (!config) {
+        return config.failure();
+    }
+    const Expected<std::string> schema = findSchemaFile();
+    if (!schema) {
+        return schema.failure();
+    }
+    if (const Trouble trouble = makeFolders()) {
+        return *trouble;
+    }
+    SetUp done;
+    using OvraPlatform::kTlsCertificateFile;
+    using OvraPlatform::kTlsKeyFile;
+    const std::vector<std::function<Expected<SetUpStep>()>> steps = {
+        [&settings] { return writeSettings(settings); },
+        [&schema] { return provisionNodeDatabase(nodeDatabasePath(), *schema); },
+        [] { return provisionTlsKey(kTlsKeyFile); },
+        [] { return provisionCertificate(kTlsCertificateFile, kTlsKeyFile, serverNames()); },
+        [&done] { return provisionSealKey(done.httpFingerprint); },
+        [&done] { return provisionNodeId(done.nodeId); },
+    };
+    for (const auto &step : steps) {
+        const Expected<SetUpStep> result = step();
+        if (!result) {
+            return result.failure();
+        }
+        done.steps.push_back(*result);
+    }
+    if (const Trouble trouble = checkFile()) {
+        return *trouble;
+    }
+    done.httpsFingerprint = certificateFingerprint(kTlsCertificateFile);
+    return report(done);
+}
+
+} // namespace
+
+void addSetupCommand(CLI::App &app, Command &chosen) {
+    CLI::App *command = app.add_subcommand(
+        "setup", "Make what a fresh machine needs: folders, database, keys, node id.");
+    const auto settings = std::make_shared<Settings>();
+    command->add_option("--hostname", settings->hostname, "Name of this appliance")
+        ->check(checkHostname);
+    command
+        ->add_option("--serial", settings->serial, "Serial number to show instead of the machine's")
+        ->check(checkSerial);
+    command
+        ->add_option("--address", settings->addresses,
+                     "Numeric addresses to serve at, separated by commas; \"\" for all")
+        ->check(checkAddresses);
+    command->add_option("--http-port", settings->httpPort, "Port for HTTP (5000)")
+        ->check(CLI::Range(1, kHighestPort));
+    command->add_option("--https-port", settings->httpsPort, "Port for HTTPS (5001)")
+        ->check(CLI::Range(1, kHighestPort));
+    command->footer("What is there already stays as it is.\n"
+                    "Examples:\n"
+                    "  ovradr setup\n"
+                    "  ovradr setup --hostname nas1 --address 192.0.2.10,2001:db8::10");
+    command->callback([&chosen, settings] { chosen = [settings] { return setUp(*settings); }; });
+}
+
+} // namespace Ovradr

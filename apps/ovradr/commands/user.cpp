@@ -1,0 +1,324 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "commands/commands.h"
+#include "output.h"
+
+#include <ovradrnode/dr_node.h>
+
+#include <cgi/account_store.h>
+#include <cgi/session_store.h>
+#include <cgi/totp.h>
+#include <sodium.h>
+#include <unistd.h>
+
+#include <cctype>
+#include <memory>
+#include <vector>
+
+namespace Ovradr {
+
+namespace {
+
+using OvraPlatform::Account;
+using OvraPlatform::AccountStore;
+using OvraPlatform::SessionRecord;
+using OvraPlatform::SessionStore;
+
+struct UserOptions {
+    std::string name;
+    bool administrator = false;
+    bool off = false;
+    bool show = false;
+    PasswordSource password;
+};
+
+/// The stores say what was wrong in one sentence and what to do in the next.
+Failure storeFailure(ExitCode exit, const std::string &sentences) {
+    const std::size_t end = sentences.find(". ");
+    return failure(exit, sentences.substr(0, end == std::string::npos ? end : end + 1),
+                   end == std::string::npos ? "" : sentences.substr(end + 2));
+}
+
+Trouble checkOpen(const AccountStore &store) {
+    return store.isOpen() ? Trouble() : storeFailure(ExitCode::kNotSetUp, store.error());
+}
+
+/// The account, or why it cannot be had.
+Expected<Account> findAccount(AccountStore &store, const std::string &name) {
+    if (const Trouble trouble = checkOpen(store)) {
+        return *trouble;
+    }
+    const auto account = store.find(name);
+    if (account) {
+        return *account;
+    }
+    if (!store.error().empty()) {
+        return storeFailure(ExitCode::kNotSetUp, store.error());
+    }
+    return failure(ExitCode::kNotFound, "There is no account \"" + name + "\".",
+                   "`ovradr user list` shows all.");
+}
+
+Json::Value toJson(const Account &account) {
+    Json::Value json;
+    json["name"] = account.name;
+    json["administrator"] = account.administrator;
+    json["disabled"] = account.disabled;
+    json["remote_login"] = account.remoteLogin;
+    json["one_time_code"] = account.oneTimeCode;
+    json["created"] = Json::Int64(account.created);
+    return json;
+}
+
+/// What a change of an account tells.
+Outcome changed(AccountStore &store, const std::string &name, const std::string &sentence) {
+    const Expected<Account> account = findAccount(store, name);
+    if (!account) {
+        return account.failure();
+    }
+    Report report;
+    report.data["user"] = toJson(*account);
+    report.text = printable(sentence) + "\n";
+    return report;
+}
+
+/// Ends every session of the account: whoever has one would go on acting as the user. A session
+/// that a node was granted is among them.
+Expected<int> endSessions(const std::string &user) {
+    SessionStore sessions;
+    int ended = 0;
+    const bool done =
+        sessions.isOpen() && sessions.removeIf([&user, &ended](const SessionRecord &session) {
+            ended += session.user == user ? 1 : 0;
+            return session.user == user;
+        });
+    return done ? Expected<int>(ended) : storeFailure(ExitCode::kNotSetUp, sessions.error());
+}
+
+std::string endedText(int sessions) {
+    return sessions == 0 ? "" : " Its sessions (" + std::to_string(sessions) + ") have ended.";
+}
+
+Outcome add(const UserOptions &options) {
+    AccountStore store;
+    if (const Trouble trouble = checkOpen(store)) {
+        return *trouble;
+    }
+    if (!AccountStore::isName(options.name)) {
+        return failure(ExitCode::kUsage, "\"" + options.name + "\" is not an account name.",
+                       "Use 1 to 64 letters, digits, \".\", \"_\", \"-\" or \"@\", the first one a "
+                       "letter, a digit or \"_\".");
+    }
+    if (store.exists(options.name)) {
+        return failure(ExitCode::kFailed, "There is an account \"" + options.name + "\" already.",
+                       "Choose another name, or set its password with `ovradr user passwd`.");
+    }
+    const Expected<Secret> password =
+        obtainPassword(options.password, "Password of " + options.name, true);
+    if (!password) {
+        return password.failure();
+    }
+    if (!store.add(options.name, password->get(), options.administrator)) {
+        return storeFailure(ExitCode::kFailed, store.error());
+    }
+    return changed(store, options.name,
+                   std::string(options.administrator ? "Administrator" : "User") + " " +
+                       options.name + " was added.");
+}
+
+Outcome list() {
+    AccountStore store;
+    if (const Trouble trouble = checkOpen(store)) {
+        return *trouble;
+    }
+    std::vector<Account> accounts;
+    if (!store.list(accounts)) {
+        return storeFailure(ExitCode::kNotSetUp, store.error());
+    }
+    Report report;
+    report.data["users"] = Json::Value(Json::arrayValue);
+    std::vector<std::vector<std::string>> rows;
+    for (const Account &account : accounts) {
+        report.data["users"].append(toJson(account));
+        const char *login = !account.remoteLogin ? "not over the network" : "yes";
+        rows.push_back({account.name, account.administrator ? "administrator" : "user",
+                        account.disabled ? "disabled" : login, account.oneTimeCode ? "yes" : "no",
+                        timeText(account.created)});
+    }
+    report.text = rows.empty()
+                      ? "There are no accounts; `ovradr user add NAME` makes one.\n"
+                      : table({"NAME", "ROLE", "LOG-IN", "ONE-TIME CODE", "CREATED"}, rows);
+    return report;
+}
+
+Outcome setPassword(const UserOptions &options) {
+    AccountStore store;
+    const Expected<Account> account = findAccount(store, options.name);
+    if (!account) {
+        return account.failure();
+    }
+    const Expected<Secret> password =
+        obtainPassword(options.password, "New password of " + options.name, true);
+    if (!password) {
+        return password.failure();
+    }
+    if (!store.setPassword(options.name, password->get())) {
+        return storeFailure(ExitCode::kFailed, store.error());
+    }
+    return changed(store, options.name, "The password of " + options.name + " was set.");
+}
+
+Outcome switchTotpOff(AccountStore &store, const std::string &name) {
+    if (!store.clearTotp(name)) {
+        return storeFailure(ExitCode::kFailed, store.error());
+    }
+    return changed(store, name, "The account " + name + " needs no one-time code any more.");
+}
+
+Outcome switchTotpOn(AccountStore &store, const std::string &name) {
+    std::string secret = OvraPlatform::newTotpSecret();
+    if (secret.empty() || !store.setTotp(name, secret)) {
+        return storeFailure(ExitCode::kFailed,
+                            secret.empty() ? "The system gives no random numbers." : store.error());
+    }
+    const std::string uri =
+        OvraPlatform::totpUri(OvraDRNode::DRNode::getLocalHostName(), name, secret);
+    Report report;
+    report.data["account"] = name;
+    report.data["uri"] = uri;
+    report.data["secret"] = secret;
+    report.text = "The account " + printable(name) +
+                  " needs a one-time code from now on. Give this to its authenticator; it is not "
+                  "shown again.\n" +
+                  listing({{"URI", uri}, {"secret", secret}});
+    sodium_memzero(secret.data(), secret.size());
+    return report;
+}
+
+Outcome setTotp(const UserOptions &options) {
+    AccountStore store;
+    const Expected<Account> account = findAccount(store, options.name);
+    if (!account) {
+        return account.failure();
+    }
+    if (options.off) {
+        return switchTotpOff(store, account->name);
+    }
+    if (account->oneTimeCode) {
+        return failure(ExitCode::kFailed,
+                       "The account \"" + account->name + "\" needs a one-time code already.",
+                       "For a new secret run `ovradr user totp " + account->name +
+                           " --off` first.");
+    }
+    if (!options.show && isatty(STDOUT_FILENO) != 1) {
+        return failure(ExitCode::kUsage,
+                       "The secret is shown once, and the output is not a terminal.",
+                       "Add --show if the output goes where it is safe.");
+    }
+    return switchTotpOn(store, account->name);
+}
+
+Outcome setDisabled(const UserOptions &options) {
+    AccountStore store;
+    const Expected<Account> account = findAccount(store, options.name);
+    if (!account) {
+        return account.failure();
+    }
+    if (!store.setDisabled(account->name, !options.off)) {
+        return storeFailure(ExitCode::kFailed, store.error());
+    }
+    return changed(store, account->name,
+                   "The account " + account->name +
+                       (options.off
+                            ? " can log in again."
+                            : " is disabled; its sessions rest until it is enabled again."));
+}
+
+/// Disabled first: nothing is granted to it meanwhile, and a removal that broke off can be
+/// repeated.
+Outcome remove(const UserOptions &options) {
+    AccountStore store;
+    const Expected<Account> account = findAccount(store, options.name);
+    if (!account) {
+        return account.failure();
+    }
+    if (!store.setDisabled(account->name, true)) {
+        return storeFailure(ExitCode::kFailed, store.error());
+    }
+    const Expected<int> ended = endSessions(account->name);
+    if (!ended) {
+        return ended.failure();
+    }
+    if (!store.remove(account->name)) {
+        return storeFailure(ExitCode::kFailed, store.error());
+    }
+    Report report;
+    report.data["name"] = account->name;
+    report.data["ended_sessions"] = *ended;
+    report.text =
+        printable("The account " + account->name + " was removed." + endedText(*ended)) + "\n";
+    return report;
+}
+
+using UserAction = Outcome (*)(const UserOptions &);
+
+/// A command of the family that is about one account.
+CLI::App *addUserCommand(CLI::App &family, const char *name, const char *description,
+                         const std::shared_ptr<UserOptions> &options, Command &chosen,
+                         UserAction action) {
+    CLI::App *command = family.add_subcommand(name, description);
+    command->add_option("NAME", options->name, "The account")->required();
+    command->callback(
+        [&chosen, options, action] { chosen = [options, action] { return action(*options); }; });
+    return command;
+}
+
+} // namespace
+
+void addPasswordOptions(CLI::App &command, PasswordSource &source) {
+    CLI::Option *file = command.add_option("--password-file", source.file,
+                                           "A file whose first line is the password");
+    command.add_flag("--password-stdin", source.fromStdin, "Read the password from standard input")
+        ->excludes(file);
+}
+
+void addUserCommands(CLI::App &app, Command &chosen) {
+    CLI::App *family = app.add_subcommand("user", "The accounts of this appliance.");
+    family->require_subcommand(1);
+    const auto options = std::make_shared<UserOptions>();
+
+    CLI::App *adding = addUserCommand(*family, "add", "Add an account.", options, chosen, add);
+    adding->add_flag("--admin", options->administrator, "The account is an administrator");
+    addPasswordOptions(*adding, options->password);
+    adding->footer("Without an option the password is asked for.\n"
+                   "Examples:\n"
+                   "  ovradr user add repl --admin\n"
+                   "  ovradr user add repl --admin --password-file /root/repl.password");
+
+    CLI::App *listing = family->add_subcommand("list", "List the accounts.");
+    listing->footer("Example:\n  ovradr user list --json");
+    listing->callback([&chosen] { chosen = list; });
+
+    CLI::App *passwd = addUserCommand(*family, "passwd", "Set the password of an account.", options,
+                                      chosen, setPassword);
+    addPasswordOptions(*passwd, options->password);
+    passwd->footer("Example:\n  ovradr user passwd repl");
+
+    CLI::App *totp = addUserCommand(*family, "totp", "Have log-ins ask for a one-time code.",
+                                    options, chosen, setTotp);
+    CLI::Option *off = totp->add_flag("--off", options->off, "Do not ask any more");
+    totp->add_flag("--show", options->show, "Show the secret although this is not a terminal")
+        ->excludes(off);
+    totp->footer("Example:\n  ovradr user totp repl");
+
+    CLI::App *disable =
+        addUserCommand(*family, "disable", "Disable an account and rest its sessions.", options,
+                       chosen, setDisabled);
+    disable->add_flag("--off", options->off, "Enable it again");
+    disable->footer("Example:\n  ovradr user disable repl");
+
+    CLI::App *removal = addUserCommand(*family, "remove", "Remove an account and end its sessions.",
+                                       options, chosen, remove);
+    removal->footer("Example:\n  ovradr user remove repl");
+}
+
+} // namespace Ovradr

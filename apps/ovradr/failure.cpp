@@ -1,0 +1,168 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "failure.h"
+
+#include <ovradrcore/err_recorder.h>
+#include <ovradrcore/json.h>
+
+#include <credential/cred_errors.h>
+#include <webapi/api_errors.h>
+
+#include <algorithm>
+#include <array>
+
+namespace Ovradr {
+
+namespace {
+
+namespace ERR = OvraDRCore::ERR;
+namespace APIError = OvraPlatform::APIError;
+
+struct Meaning {
+    int code;
+    ExitCode exit;
+    const char *name;
+    const char *message;
+    const char *hint;
+};
+
+constexpr const char *kAdministrator =
+    "Use an account that is an administrator on the other appliance.";
+constexpr const char *kSameVersion = "Check that both appliances run versions that fit together.";
+constexpr const char *kCheckName = "Check how it is written, and what the other appliance offers.";
+constexpr const char *kPairAgain = "Make a new credential with `ovradr cred create`.";
+constexpr const char *kSystemLog = "The system log says more.";
+
+/// Everything that the library and the web API report by number.
+constexpr std::array kMeanings = {
+    Meaning{APIError::kInternal, ExitCode::kFailed, "internal",
+            "The appliance could not carry out the request",
+            "The system log of the appliance that was asked says why."},
+    Meaning{APIError::kBadRequest, ExitCode::kFailed, "bad_request",
+            "The appliance does not understand the request", kSameVersion},
+    Meaning{APIError::kNoSuchAPI, ExitCode::kNotFound, "no_such_api",
+            "The appliance has no such API", kCheckName},
+    Meaning{APIError::kNoSuchMethod, ExitCode::kNotFound, "no_such_method",
+            "The API has no such method", kCheckName},
+    Meaning{APIError::kNoSuchVersion, ExitCode::kNotFound, "no_such_version",
+            "The method has no such version", "Choose another one with --version."},
+    Meaning{APIError::kNoPermission, ExitCode::kNotPermitted, "no_permission",
+            "The appliance does not permit this request", kAdministrator},
+    Meaning{APIError::kBadParameter, ExitCode::kFailed, "bad_parameter",
+            "The appliance refused a parameter", "Correct it, or leave it out."},
+    Meaning{APIError::kTooBusy, ExitCode::kFailed, "too_busy",
+            "The appliance is too busy and did nothing", "Try again in a moment."},
+    Meaning{APIError::kTooLarge, ExitCode::kFailed, "too_large",
+            "The request or its answer is too large", "Ask for less at once."},
+    Meaning{APIError::kSealRefused, ExitCode::kFailed, "seal_refused",
+            "The appliance did not accept the sealed request",
+            "Try again; if that does not help, check the clocks of both appliances."},
+    Meaning{APIError::kNoSession, ExitCode::kLoginRefused, "no_session",
+            "The appliance no longer knows the session of the credential", kPairAgain},
+    Meaning{APIError::kLoginFailed, ExitCode::kLoginRefused, "login_failed",
+            "The account or the password is wrong", "Check both and try again."},
+    Meaning{ERR::kBadParameter, ExitCode::kFailed, "bad_argument",
+            "An argument is empty or not valid", "Correct it and try again."},
+    Meaning{ERR::kOutOfMemory, ExitCode::kFailed, "out_of_memory", "There is not enough memory",
+            "Free some and try again."},
+    Meaning{ERR::kNullSender, ExitCode::kFailed, "no_sender", "The request has no sender",
+            kSystemLog},
+    Meaning{ERR::kCredNotFound, ExitCode::kNotFound, "cred_not_found",
+            "There is no such credential", "`ovradr cred list` shows those that there are."},
+    Meaning{ERR::kFailed, ExitCode::kFailed, "failed",
+            "The operation failed, or its answer makes no sense", kSystemLog},
+    Meaning{ERR::kNotConnectable, ExitCode::kNotReachable, "not_connectable",
+            "The other end does not answer", "`ovradr conn test URL` says what is in the way."},
+    Meaning{ERR::kLoginFailed, ExitCode::kLoginRefused, "login_failed",
+            "The log-in failed: the account or the password is wrong",
+            "Check both; if they are right, the system log says what the other end answered."},
+    Meaning{ERR::kLoginDisabled, ExitCode::kLoginRefused, "login_disabled",
+            "The account is disabled on the other appliance",
+            "Have it enabled there, or use another account."},
+    Meaning{ERR::kLoginNotPermitted, ExitCode::kLoginRefused, "login_not_permitted",
+            "The account may not log in to the other appliance over the network",
+            "Use another account."},
+    Meaning{ERR::kLoginOtpRequired, ExitCode::kOneTimeCode, "otp_required",
+            "The account needs a one-time code", "Give the code of now with --otp."},
+    Meaning{ERR::kLoginOtpWrong, ExitCode::kOneTimeCode, "otp_wrong", "The one-time code is wrong",
+            "Use the code of now, each only once; check the clocks of both ends."},
+    Meaning{ERR::kCredItemRefused, ExitCode::kFailed, "item_refused",
+            "The endpoint or the account cannot be used as it is written",
+            "Check host, port and account name."},
+    Meaning{ERR::kUnknownNode, ExitCode::kNotFound, "unknown_node",
+            "No credential reaches this node", kPairAgain},
+    Meaning{ERR::kCredIncomplete, ExitCode::kFailed, "cred_incomplete",
+            "The other appliance granted no session that works", kAdministrator},
+    Meaning{ERR::kSessionNotCreated, ExitCode::kFailed, "session_not_created",
+            "The session could not be made", kSystemLog},
+    Meaning{ERR::kSessionNotRemoved, ExitCode::kFailed, "session_not_removed",
+            "The sessions could not be removed", kSystemLog},
+    Meaning{ERR::kCredInvalid, ExitCode::kNotFound, "cred_invalid",
+            "The credential cannot be found or is not complete", kPairAgain},
+    Meaning{ERR::kOtherNode, ExitCode::kFailed, "other_node",
+            "The credential belongs to another node", "`ovradr cred list` shows which."},
+    Meaning{ERR::kNodeInfoFailed, ExitCode::kFailed, "node_info_failed",
+            "The other end does not say which node it is",
+            "Check that the port is an appliance's, and that it is set up."},
+    Meaning{ERR::kCredCheckFailed, ExitCode::kFailed, "cred_check_failed",
+            "The credential did not pass its check", kSystemLog},
+    Meaning{ERR::kRemoteConnInvalid, ExitCode::kNotReachable, "remote_conn_invalid",
+            "The other appliance reaches none of the endpoints of this one",
+            "`ovradr conn local` shows them; test one from there."},
+    Meaning{ERR::kLoginCallFailed, ExitCode::kNotReachable, "login_call_failed",
+            "The log-in got no answer", "`ovradr conn test URL` says what is in the way."},
+    Meaning{ERR::kCredLibrary, ExitCode::kFailed, "request_failed", "The request failed",
+            kSystemLog},
+    Meaning{ERR::kNoPrivilege, ExitCode::kNotPermitted, "no_privilege",
+            "The other appliance does not permit this with this credential", kAdministrator},
+    Meaning{ERR::kCertificateChanged, ExitCode::kCertificate, "certificate_changed",
+            "The key of the other end is not the one that was trusted for it",
+            "Find out why it changed before you trust the new one."},
+    Meaning{ERR::kNoSuchUser, ExitCode::kNotFound, "no_such_user",
+            "There is no such user on that appliance", "Check the name."},
+    Meaning{ERR::kSessionUserUnknown, ExitCode::kNotFound, "session_user_unknown",
+            "The account of the session is not known", kPairAgain},
+};
+
+/// The names of what this program finds itself, in the order of the exit codes.
+constexpr std::array kExitNames = {
+    "ok",          "failed",    "usage",         "not_reachable", "login_refused", "one_time_code",
+    "certificate", "not_found", "not_permitted", "not_set_up",
+};
+
+std::string detailText(int code, const Json::Value &detail) {
+    if (code == ERR::kCredLibrary && detail.isInt()) {
+        return OvraPlatform::credErrorText(detail.asInt());
+    }
+    if (detail.isString()) {
+        return detail.asString();
+    }
+    const std::string text = OvraDRCore::memberString(detail, "text");
+    const std::string parameter = OvraDRCore::memberString(detail, "param");
+    if (!text.empty()) {
+        return parameter.empty() ? text : parameter + ": " + text;
+    }
+    return detail.isNull() ? std::string() : OvraDRCore::toLogString(detail);
+}
+
+} // namespace
+
+Failure failure(ExitCode exit, const std::string &message, const std::string &hint) {
+    const int number = static_cast<int>(exit);
+    return {exit, number, kExitNames.at(static_cast<std::size_t>(number)), message, hint};
+}
+
+Failure failureOf(int code, const Json::Value &detail) {
+    const auto *const meaning =
+        std::find_if(kMeanings.begin(), kMeanings.end(),
+                     [code](const Meaning &entry) { return entry.code == code; });
+    Failure found{ExitCode::kFailed, code, "error_" + std::to_string(code),
+                  "Error " + std::to_string(code), kSystemLog};
+    if (meaning != kMeanings.end()) {
+        found = {meaning->exit, code, meaning->name, meaning->message, meaning->hint};
+    }
+    const std::string text = detailText(code, detail);
+    found.message += text.empty() ? "." : " (" + text + ").";
+    return found;
+}
+
+} // namespace Ovradr

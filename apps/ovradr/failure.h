@@ -1,0 +1,75 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include <json/value.h>
+
+#include <optional>
+#include <string>
+#include <utility>
+#include <variant>
+
+namespace Ovradr {
+
+/// What the program exits with; docs/ovradr.md tells scripts.
+enum class ExitCode : int {
+    kOk = 0,
+    kFailed = 1,       ///< the operation failed
+    kUsage = 2,        ///< the command line is wrong
+    kNotReachable = 3, ///< no answer from the other end
+    kLoginRefused = 4,
+    kOneTimeCode = 5, ///< a one-time code is required, or it is wrong
+    kCertificate = 6, ///< the key of the other end is not, or not yet, trusted
+    kNotFound = 7,
+    kNotPermitted = 8,
+    kNotSetUp = 9, ///< not set up, or the files of this appliance cannot be used
+};
+
+/// Why a command did not do what it was asked for.
+struct Failure {
+    ExitCode exit = ExitCode::kFailed;
+    /// The library's or the web API's error code; the exit code for what this program found itself.
+    int code = 0;
+    std::string name;    ///< one word for scripts
+    std::string message; ///< one sentence: what was wrong
+    std::string hint;    ///< one sentence: what to do
+};
+
+/// A failure that this program found itself.
+Failure failure(ExitCode exit, const std::string &message, const std::string &hint);
+
+/// The failure that an error code of the library or of the web API stands for.
+/// \param detail  what came with the code; null when nothing did
+Failure failureOf(int code, const Json::Value &detail = Json::Value());
+
+/// A value, or why there is none.
+template <typename T>
+class Expected {
+public:
+    Expected(T value) // NOLINT(google-explicit-constructor)
+        : held_(std::move(value)) {}
+    Expected(Failure why) // NOLINT(google-explicit-constructor)
+        : held_(std::move(why)) {}
+
+    explicit operator bool() const { return std::holds_alternative<T>(held_); }
+    T &operator*() { return *std::get_if<T>(&held_); }
+    const T &operator*() const { return *std::get_if<T>(&held_); }
+    T *operator->() { return std::get_if<T>(&held_); }
+    const T *operator->() const { return std::get_if<T>(&held_); }
+    const Failure &failure() const { return *std::get_if<Failure>(&held_); }
+
+private:
+    std::variant<T, Failure> held_;
+};
+
+/// Nothing when it went well.
+using Trouble = std::optional<Failure>;
+
+/// What a command found or did, in both forms in which it can be told.
+struct Report {
+    Json::Value data; ///< for scripts
+    std::string text; ///< for people; whole lines, safe for a terminal
+};
+
+using Outcome = Expected<Report>;
+
+} // namespace Ovradr

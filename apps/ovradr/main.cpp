@@ -1,0 +1,127 @@
+// SPDX-License-Identifier: Apache-2.0
+// ovradr: the command line of an appliance. docs/ovradr.md describes it.
+#include "commands/commands.h"
+#include "output.h"
+
+#include <algorithm>
+#include <csignal>
+#include <cstdio>
+#include <cstring>
+#include <exception>
+#include <string>
+#include <string_view>
+#include <vector>
+
+namespace Ovradr {
+
+namespace {
+
+constexpr std::string_view kJsonFlag = "--json";
+constexpr std::string_view kOneTimeCodeOption = "--otp";
+
+/// Takes the arguments over and wipes a one-time code from where every process can see it.
+std::vector<std::string> takeArguments(int argc, char **argv) {
+    std::vector<std::string> arguments;
+    bool codeFollows = false;
+    for (int i = 1; i < argc; ++i) {
+        const std::string argument = argv[i];
+        const bool codeInside = argument.starts_with(std::string(kOneTimeCodeOption) + "=");
+        if (codeFollows || codeInside) {
+            const std::size_t kept = codeInside ? kOneTimeCodeOption.size() + 1 : 0;
+            std::memset(argv[i] + kept, '*', argument.size() - kept);
+        }
+        codeFollows = argument == kOneTimeCodeOption;
+        arguments.push_back(argument);
+    }
+    return arguments;
+}
+
+void describe(CLI::App &app, bool &json, Command &chosen) {
+    app.fallthrough();
+    app.require_subcommand(1);
+    app.set_version_flag("--version", "ovradr " OVRADR_VERSION);
+    app.add_flag(std::string(kJsonFlag), json,
+                 "One JSON document on standard output, also for an error");
+    app.footer("Exit codes: 0 ok, 1 failed, 2 usage, 3 not reachable, 4 log-in refused, 5 one-time "
+               "code,\n  6 key not trusted, 7 not found, 8 not permitted, 9 not set up\n"
+               "Examples:\n"
+               "  ovradr setup\n"
+               "  ovradr user add repl --admin\n"
+               "  ovradr cred create https://nas2 --account repl\n"
+               "  ovradr call 3f2a OVRA.DR.Node info");
+    addSetupCommand(app, chosen);
+    addNodeCommands(app, chosen);
+    addUserCommands(app, chosen);
+    addCredCommands(app, chosen);
+    addCallCommand(app, chosen);
+    addConnCommands(app, chosen);
+}
+
+constexpr const char *kHelpHint =
+    "`ovradr --help`, or --help behind a command, shows what there is.";
+
+/// What is wrong with a command line that has more than it should. Nothing of it but the names of
+/// options is repeated: it may be a password that stands in the wrong place.
+Failure surplusFailure(const CLI::App &app) {
+    std::string names;
+    for (const std::string &argument : app.remaining(true)) {
+        if (argument.starts_with("-")) {
+            names += (names.empty() ? "" : ", ") + argument.substr(0, argument.find('='));
+        }
+    }
+    if (names.find("--password") != std::string::npos) {
+        return failure(ExitCode::kUsage, "A password is never an argument.",
+                       "Use --password-file or --password-stdin, or have it asked for.");
+    }
+    return failure(ExitCode::kUsage,
+                   names.empty() ? "There are more arguments than the command takes."
+                                 : "The command has no option " + names + ".",
+                   kHelpHint);
+}
+
+Outcome runChosen(const Command &chosen) {
+    try {
+        return chosen();
+    } catch (const std::exception &error) {
+        return failure(ExitCode::kFailed,
+                       std::string("The command broke off: ") + error.what() + ".",
+                       "The system log may say more.");
+    }
+}
+
+int run(int argc, char **argv) {
+    std::vector<std::string> arguments = takeArguments(argc, argv);
+    // Also for a command line that cannot be parsed.
+    bool json = std::find(arguments.begin(), arguments.end(), kJsonFlag) != arguments.end();
+    CLI::App app("The command line of a replication node.", "ovradr");
+    Command chosen;
+    describe(app, json, chosen);
+    try {
+        std::reverse(arguments.begin(), arguments.end());
+        app.parse(arguments);
+    } catch (const CLI::ExtrasError &) {
+        return static_cast<int>(tell(surplusFailure(app), json));
+    } catch (const CLI::ParseError &error) {
+        if (error.get_exit_code() == 0) {
+            return app.exit(error); // the help or the version
+        }
+        const Failure wrong = failure(ExitCode::kUsage, std::string(error.what()) + ".", kHelpHint);
+        return static_cast<int>(tell(wrong, json));
+    }
+    return static_cast<int>(tell(runChosen(chosen), json));
+}
+
+} // namespace
+
+} // namespace Ovradr
+
+int main(int argc, char **argv) {
+    // A reader that goes away is told by the failed write.
+    std::signal(SIGPIPE, SIG_IGN);
+    try {
+        return Ovradr::run(argc, argv);
+    } catch (const std::exception &error) {
+        std::fprintf(stderr, "ovradr: %s\n", error.what());
+        return static_cast<int>(Ovradr::ExitCode::kFailed);
+    }
+}

@@ -1,0 +1,85 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "node_ref.h"
+
+#include "provision/node_database.h"
+
+#include <ovradrnode/node_db.h>
+
+#include <algorithm>
+#include <map>
+#include <set>
+#include <vector>
+
+namespace Ovradr {
+
+namespace {
+
+using OvraDRNode::DRNode;
+using OvraDRNode::DRNodeDB;
+
+constexpr const char *kLocalWord = "local";
+constexpr int kBothTables = DRNodeDB::CRED_TYPE_NODE | DRNodeDB::CRED_TYPE_TEMP;
+
+/// The one of `ids` that is `text` or begins with it.
+Expected<std::string> choose(const std::set<std::string> &ids, const std::string &text,
+                             const std::string &what, const std::string &hint) {
+    if (ids.count(text) != 0) {
+        return text;
+    }
+    std::vector<std::string> found;
+    std::copy_if(ids.begin(), ids.end(), std::back_inserter(found),
+                 [&text](const std::string &id) { return !text.empty() && id.starts_with(text); });
+    if (found.size() == 1) {
+        return found.front();
+    }
+    if (found.empty()) {
+        return failure(ExitCode::kNotFound, "There is no " + what + " \"" + text + "\".", hint);
+    }
+    return failure(ExitCode::kUsage,
+                   "\"" + text + "\" is the beginning of more than one " + what + ": " + found[0] +
+                       " and " + found[1] + ".",
+                   "Write more of it.");
+}
+
+} // namespace
+
+Expected<std::string> resolveNode(const std::string &text) {
+    const std::string local = DRNode::getLocalNodeId();
+    if (local.empty()) {
+        return failure(ExitCode::kNotSetUp, "This appliance has no node id, and none can be made.",
+                       "Run `ovradr setup` as root.");
+    }
+    if (text == kLocalWord || text == local) {
+        return local;
+    }
+    if (const Trouble trouble = checkNodeDatabase()) {
+        return *trouble;
+    }
+    std::vector<DRNode> nodes;
+    DRNodeDB::List(nodes, kBothTables);
+    std::set<std::string> ids{local};
+    std::transform(nodes.begin(), nodes.end(), std::inserter(ids, ids.end()),
+                   [](const DRNode &node) { return node.nodeId; });
+    return choose(ids, text, "node", "`ovradr cred list` shows the nodes that can be reached.");
+}
+
+Expected<FoundCred> resolveCred(const std::string &text) {
+    if (const Trouble trouble = checkNodeDatabase()) {
+        return *trouble;
+    }
+    std::map<std::string, FoundCred> creds;
+    std::set<std::string> ids;
+    for (const bool temporary : {false, true}) {
+        std::vector<DRNode> records;
+        DRNodeDB::List(records, temporary ? DRNodeDB::CRED_TYPE_TEMP : DRNodeDB::CRED_TYPE_NODE);
+        for (const DRNode &record : records) {
+            creds.try_emplace(record.credId, FoundCred{record, temporary});
+            ids.insert(record.credId);
+        }
+    }
+    const Expected<std::string> id =
+        choose(ids, text, "credential", "`ovradr cred list --temp` shows all that there are.");
+    return id ? Expected<FoundCred>(creds.at(*id)) : id.failure();
+}
+
+} // namespace Ovradr

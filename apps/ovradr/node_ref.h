@@ -1,0 +1,25 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include "failure.h"
+
+#include <ovradrnode/dr_node.h>
+
+#include <string>
+
+namespace Ovradr {
+
+/// The node id that a person means: "local", a node id, or the beginning of only one. Only nodes
+/// that a credential reaches are known, and this one.
+Expected<std::string> resolveNode(const std::string &text);
+
+struct FoundCred {
+    OvraDRNode::DRNode record;
+    bool temporary = false;
+};
+
+/// The credential, lasting or temporary, that a person means by its id or by the beginning of only
+/// one.
+Expected<FoundCred> resolveCred(const std::string &text);
+
+} // namespace Ovradr

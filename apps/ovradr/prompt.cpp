@@ -1,0 +1,198 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "prompt.h"
+
+#include "output.h"
+
+#include <core/unique_fd.h>
+#include <fcntl.h>
+#include <sodium.h>
+#include <sys/stat.h>
+#include <termios.h>
+#include <unistd.h>
+
+#include <array>
+#include <cerrno>
+#include <csignal>
+#include <cstdio>
+#include <system_error>
+
+namespace Ovradr {
+
+namespace {
+
+volatile std::sig_atomic_t pendingSignal = 0;
+
+void noteSignal(int number) {
+    pendingSignal = number;
+}
+
+/// Switches the echo of the terminal off. A signal that would end the program waits until the echo
+/// is back.
+class NoEcho {
+public:
+    NoEcho() {
+        pendingSignal = 0;
+        struct sigaction note {};
+        note.sa_handler = noteSignal; // without SA_RESTART: it ends the read
+        sigemptyset(&note.sa_mask);
+        for (std::size_t i = 0; i < kSignals.size(); ++i) {
+            sigaction(kSignals.at(i), &note, &before_.at(i));
+        }
+        termios silent{};
+        if (tcgetattr(STDIN_FILENO, &terminal_) == 0) {
+            silent = terminal_;
+            silent.c_lflag &= ~static_cast<tcflag_t>(ECHO);
+            silent.c_lflag |= ICANON | ISIG | ECHONL;
+            changed_ = tcsetattr(STDIN_FILENO, TCSAFLUSH, &silent) == 0;
+        }
+    }
+    NoEcho(const NoEcho &) = delete;
+    NoEcho &operator=(const NoEcho &) = delete;
+    ~NoEcho() {
+        if (changed_) {
+            tcsetattr(STDIN_FILENO, TCSAFLUSH, &terminal_);
+        }
+        for (std::size_t i = 0; i < kSignals.size(); ++i) {
+            sigaction(kSignals.at(i), &before_.at(i), nullptr);
+        }
+        if (pendingSignal != 0) {
+            std::fputc('\n', stderr);
+            std::raise(pendingSignal);
+        }
+    }
+    bool works() const { return changed_; }
+
+private:
+    static constexpr std::array kSignals = {SIGINT, SIGTERM, SIGHUP, SIGQUIT};
+
+    termios terminal_{};
+    bool changed_ = false;
+    std::array<struct sigaction, kSignals.size()> before_{};
+};
+
+Failure unreadable(const std::string &where, const std::string &why) {
+    return failure(ExitCode::kFailed, "No password can be read from " + where + ": " + why + ".",
+                   "Give a file whose first line is the password.");
+}
+
+/// Reads up to the end of the line. One byte at a time: what follows the line is not ours.
+Expected<Secret> readLine(int fd, const std::string &where) {
+    Secret secret;
+    char c = 0;
+    for (;;) {
+        const ssize_t count = read(fd, &c, 1);
+        if (count < 0 && errno == EINTR && pendingSignal == 0) {
+            continue;
+        }
+        if (count < 0) {
+            return unreadable(where, std::system_category().message(errno));
+        }
+        if (count == 0 || c == '\n') {
+            break;
+        }
+        if (!secret.append(c)) {
+            return unreadable(where, "its first line has more than " +
+                                         std::to_string(Secret::kMaxSize) + " bytes");
+        }
+    }
+    c = 0;
+    if (secret.get().ends_with('\r')) {
+        secret.removeLast();
+    }
+    if (secret.empty()) {
+        return unreadable(where, "its first line is empty");
+    }
+    return secret;
+}
+
+Expected<Secret> readFile(const std::string &path) {
+    const OvraPlatform::UniqueFd fd(open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NOCTTY));
+    struct stat status {};
+    if (!fd || fstat(fd.get(), &status) != 0) {
+        return unreadable(path, std::system_category().message(errno));
+    }
+    if (S_ISREG(status.st_mode) && (status.st_mode & S_IROTH) != 0) {
+        std::fprintf(stderr, "ovradr: everybody can read %s: chmod 600 it.\n",
+                     printable(path).c_str());
+    }
+    return readLine(fd.get(), path);
+}
+
+} // namespace
+
+Secret::Secret() {
+    text_.reserve(kMaxSize);
+}
+
+Secret::~Secret() {
+    text_.resize(text_.capacity());
+    sodium_memzero(text_.data(), text_.size());
+}
+
+bool Secret::append(char c) {
+    if (text_.size() == kMaxSize) {
+        return false;
+    }
+    text_.push_back(c);
+    return true;
+}
+
+void Secret::removeLast() {
+    text_.back() = '\0';
+    text_.pop_back();
+}
+
+bool isInteractive() {
+    return isatty(STDIN_FILENO) == 1 && isatty(STDERR_FILENO) == 1;
+}
+
+Expected<Secret> askSecret(const std::string &question) {
+    const NoEcho noEcho;
+    if (!noEcho.works()) {
+        return failure(ExitCode::kFailed, "The terminal cannot hide what is typed in.",
+                       "Use --password-file or --password-stdin.");
+    }
+    std::fprintf(stderr, "%s: ", printable(question).c_str());
+    std::fflush(stderr);
+    return readLine(STDIN_FILENO, "the terminal");
+}
+
+Expected<Secret> obtainPassword(const PasswordSource &source, const std::string &question,
+                                bool twice) {
+    if (source.fromStdin) {
+        return readLine(STDIN_FILENO, "standard input");
+    }
+    if (!source.file.empty()) {
+        return readFile(source.file);
+    }
+    if (!isInteractive()) {
+        return failure(ExitCode::kUsage,
+                       "There is no terminal on which the password could be asked for.",
+                       "Use --password-file or --password-stdin.");
+    }
+    Expected<Secret> password = askSecret(question);
+    if (!password || !twice) {
+        return password;
+    }
+    const Expected<Secret> again = askSecret("Again");
+    if (!again) {
+        return again.failure();
+    }
+    if (password->get() != again->get()) {
+        return failure(ExitCode::kFailed, "The two passwords differ.", "Try again.");
+    }
+    return password;
+}
+
+bool confirm(const std::string &question) {
+    std::fprintf(stderr, "%s [y/N] ", printable(question).c_str());
+    std::fflush(stderr);
+    // More than is looked at: the rest of the line must not answer the next question.
+    std::array<char, 256> line{};
+    const ssize_t size = read(STDIN_FILENO, line.data(), line.size());
+    std::string answer(line.data(), size > 0 ? static_cast<std::size_t>(size) : 0);
+    answer.erase(answer.find_last_not_of(" \t\r\n") + 1);
+    return answer == "y" || answer == "Y" || answer == "yes" || answer == "Yes";
+}
+
+} // namespace Ovradr

@@ -1,0 +1,215 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "provision/node_database.h"
+
+#include <ovradrnode/node_db.h>
+
+#include <core/appliance.h>
+#include <core/unique_fd.h>
+#include <fcntl.h>
+#include <sqlite3.h>
+#include <unistd.h>
+
+#include <array>
+#include <cerrno>
+#include <filesystem>
+#include <fstream>
+#include <memory>
+#include <sstream>
+
+namespace Ovradr {
+
+namespace {
+
+constexpr int kBusyMilliseconds = 20'000; // as long as the library waits
+constexpr const char *kSchemaName = "ovradrnode/node.sql";
+
+/// What the library selects and stores.
+constexpr std::array kQueries = {
+    "SELECT addr, protocol, port, cred_id, node_id, session FROM node_cred",
+    "SELECT addr, protocol, port, cred_id, node_id, session FROM temp_cred",
+    "SELECT node_id, app, attr, value FROM node_attr",
+};
+
+struct CloseDatabase {
+    void operator()(sqlite3 *database) const { sqlite3_close_v2(database); }
+};
+struct Finalize {
+    void operator()(sqlite3_stmt *statement) const { sqlite3_finalize(statement); }
+};
+using Database = std::unique_ptr<sqlite3, CloseDatabase>;
+using Statement = std::unique_ptr<sqlite3_stmt, Finalize>;
+
+Failure unusable(const std::string &path, const std::string &why, const std::string &hint) {
+    return failure(ExitCode::kNotSetUp,
+                   "The node database " + path + " cannot be used: " + why + ".", hint);
+}
+
+Failure sqliteFailure(const std::string &path, sqlite3 *database) {
+    return unusable(path, database == nullptr ? "out of memory" : sqlite3_errmsg(database),
+                    "Correct that, or restore the file from a backup; setup never replaces it.");
+}
+
+Failure newerSchema(const std::string &path, int version) {
+    return unusable(path,
+                    "its schema " + std::to_string(version) + " is newer than this program's " +
+                        std::to_string(kSchemaVersion),
+                    "Install the version of this program that made it, or a newer one.");
+}
+
+Failure foreignDatabase(const std::string &path) {
+    return unusable(path, "it is not one that `ovradr setup` made, or it is damaged",
+                    "Restore it from a backup, or move it away and run `ovradr setup`.");
+}
+
+/// The number that a query gives; nothing when it cannot be run or gives none.
+std::optional<int> numberOf(sqlite3 *database, const char *sql) {
+    sqlite3_stmt *prepared = nullptr;
+    const int result = sqlite3_prepare_v2(database, sql, -1, &prepared, nullptr);
+    const Statement statement(prepared);
+    if (result != SQLITE_OK || sqlite3_step(prepared) != SQLITE_ROW ||
+        sqlite3_column_type(prepared, 0) != SQLITE_INTEGER) {
+        return std::nullopt;
+    }
+    return sqlite3_column_int(prepared, 0);
+}
+
+bool canPrepare(sqlite3 *database, const char *sql) {
+    sqlite3_stmt *prepared = nullptr;
+    const int result = sqlite3_prepare_v2(database, sql, -1, &prepared, nullptr);
+    const Statement statement(prepared);
+    return result == SQLITE_OK;
+}
+
+bool execute(sqlite3 *database, const char *sql) {
+    return sqlite3_exec(database, sql, nullptr, nullptr, nullptr) == SQLITE_OK;
+}
+
+Trouble checkSchema(sqlite3 *database, const std::string &path) {
+    const auto version = numberOf(database, "SELECT version FROM ovradrcore_db_info");
+    if (!version) {
+        return foreignDatabase(path);
+    }
+    if (*version > kSchemaVersion) {
+        return newerSchema(path, *version);
+    }
+    for (const char *query : kQueries) {
+        if (*version != kSchemaVersion || !canPrepare(database, query)) {
+            return foreignDatabase(path);
+        }
+    }
+    return std::nullopt;
+}
+
+Expected<std::string> readSchema(const std::string &schemaFile) {
+    std::ifstream file(schemaFile);
+    std::ostringstream text;
+    text << file.rdbuf();
+    if (!file || text.str().empty()) {
+        return failure(ExitCode::kNotSetUp, schemaFile + " cannot be read.",
+                       "Install the program again.");
+    }
+    return text.str();
+}
+
+/// Fills an empty database; true when it was empty.
+Expected<bool> fill(sqlite3 *database, const std::string &path, const std::string &schema) {
+    if (!execute(database, "BEGIN IMMEDIATE")) {
+        return sqliteFailure(path, database);
+    }
+    const auto objects = numberOf(database, "SELECT count(*) FROM sqlite_schema");
+    if (!objects) {
+        return sqliteFailure(path, database);
+    }
+    const bool empty = *objects == 0;
+    if (empty && !execute(database, schema.c_str())) {
+        return sqliteFailure(path, database);
+    }
+    if (const Trouble trouble = checkSchema(database, path)) {
+        return *trouble; // closing the database takes everything back
+    }
+    return execute(database, "COMMIT") ? Expected<bool>(empty) : sqliteFailure(path, database);
+}
+
+/// SQLite would make a file that others can read.
+Trouble touchPrivate(const std::string &path) {
+    const OvraPlatform::UniqueFd fd(open(path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0600));
+    if (!fd) {
+        return fileFailure(path, errno);
+    }
+    const Expected<bool> changed = makePrivate(path);
+    return changed ? Trouble() : changed.failure();
+}
+
+} // namespace
+
+std::string nodeDatabasePath() {
+    return std::string(OvraPlatform::kConfigDir) + "/node.db";
+}
+
+Expected<std::string> findSchemaFile() {
+    std::error_code error;
+    const auto program = std::filesystem::read_symlink("/proc/self/exe", error);
+    const auto beside = program.parent_path().parent_path() / "share" / kSchemaName;
+    for (const std::filesystem::path &candidate :
+         {beside, std::filesystem::path(OVRADR_DATA_DIR) / kSchemaName}) {
+        if (access(candidate.c_str(), R_OK) == 0) {
+            return candidate.string();
+        }
+    }
+    return failure(ExitCode::kNotSetUp,
+                   "The schema of the node database is missing: " + beside.string() + ".",
+                   "Install the program again, with its data files.");
+}
+
+Expected<SetUpStep> provisionNodeDatabase(const std::string &path, const std::string &schemaFile) {
+    const Expected<std::string> schema = readSchema(schemaFile);
+    if (!schema) {
+        return schema.failure();
+    }
+    if (const Trouble trouble = touchPrivate(path)) {
+        return *trouble;
+    }
+    sqlite3 *opened = nullptr;
+    const int result = sqlite3_open_v2(path.c_str(), &opened,
+                                       SQLITE_OPEN_READWRITE | SQLITE_OPEN_NOMUTEX, nullptr);
+    const Database database(opened);
+    if (result != SQLITE_OK) {
+        return sqliteFailure(path, opened);
+    }
+    sqlite3_busy_timeout(opened, kBusyMilliseconds);
+    // A file that a stranger has put there gets no code to run.
+    sqlite3_db_config(opened, SQLITE_DBCONFIG_TRUSTED_SCHEMA, 0, nullptr);
+    // As the library reads it: a misspelt column is an error, not a text.
+    sqlite3_db_config(opened, SQLITE_DBCONFIG_DQS_DML, 0, nullptr);
+    const Expected<bool> filled = fill(opened, path, *schema);
+    if (!filled) {
+        return filled.failure();
+    }
+    return SetUpStep{"node database", *filled, path + ", schema " + std::to_string(kSchemaVersion)};
+}
+
+Trouble checkNodeDatabase() {
+    const std::string path = nodeDatabasePath();
+    if (access(path.c_str(), F_OK) != 0 && errno == ENOENT) {
+        return failure(ExitCode::kNotSetUp,
+                       "This appliance is not set up: it has no node database.",
+                       "Run `ovradr setup`.");
+    }
+    if (access(path.c_str(), R_OK | W_OK) != 0) {
+        return fileFailure(path, errno);
+    }
+    auto handler = OvraDRNode::NodeDBHandler::GetHandler();
+    const int version = handler.GetSchemaVersion();
+    if (version == kSchemaVersion) {
+        return std::nullopt;
+    }
+    if (version > kSchemaVersion) {
+        return newerSchema(path, version);
+    }
+    return unusable(path,
+                    handler.GetErrMsg().isString() ? handler.GetErrMsg().asString()
+                                                   : "it holds no schema version",
+                    "Run `ovradr setup`, which says what is wrong with it.");
+}
+
+} // namespace Ovradr

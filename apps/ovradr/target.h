@@ -1,0 +1,25 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include "failure.h"
+
+#include <ovradrnode/conn.h>
+
+#include <string>
+
+namespace Ovradr {
+
+inline constexpr int kDefaultHttpPort = 5000;
+inline constexpr int kDefaultHttpsPort = 5001;
+
+/// Reads an endpoint as people write it: https://HOST[:PORT], http://HOST[:PORT] or flk:ALIAS. HOST
+/// is a name in ASCII, an IPv4 address, or an IPv6 address in brackets, which the endpoint then
+/// holds without them; one endpoint gets one spelling. Anything more (a user, a path, a query) is
+/// refused: it would be lost unseen.
+Expected<OvraDRNode::Conn> parseTarget(const std::string &text);
+
+/// The endpoint as parseTarget() reads it, its port always shown; of a direct endpoint also the
+/// name under which its key is kept.
+std::string targetText(const OvraDRNode::Conn &conn);
+
+} // namespace Ovradr

@@ -1,0 +1,37 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include "failure.h"
+
+#include <ovradrnode/conn.h>
+
+#include <credential/peer_trust.h>
+
+#include <string>
+
+namespace Ovradr {
+
+/// How long to wait for an endpoint that shows its key, in seconds.
+inline constexpr long kMeetSeconds = 10;
+
+/// Whether the text is a fingerprint: "SHA256:" and 43 characters of base64, as setup and
+/// `conn local` show it.
+bool isFingerprint(const std::string &text);
+
+/// Why an endpoint could not be asked.
+/// \param error  a number of the credential request library
+Failure endpointFailure(const OvraDRNode::Conn &conn, OvraPlatform::CredError error);
+
+/// What is known about the key that the endpoint shows, for people.
+std::string trustText(const OvraPlatform::PeerIdentity &identity);
+/// The same as one word for scripts.
+std::string trustWord(const OvraPlatform::PeerIdentity &identity);
+
+/// Makes sure that the key of a direct endpoint is trusted before anything secret is sent to it. A
+/// key that is met for the first time is trusted when it is the expected one, or when the person at
+/// the terminal says so.
+/// \param expected  the fingerprint that the key must have, or ""
+/// \return what is in the way; nothing when the key is trusted.
+Trouble trustPeer(const OvraDRNode::Conn &conn, const std::string &expected);
+
+} // namespace Ovradr

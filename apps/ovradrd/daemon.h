@@ -1,0 +1,59 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include "http_server.h"
+
+#include <chrono>
+#include <memory>
+#include <string>
+#include <vector>
+
+namespace Ovradrd {
+
+/// The exit codes of ovradrd.
+enum class Outcome : int {
+    kOk = 0,
+    kFailed = 1,
+    kUsage = 2,
+    kPortInUse = 3,
+    kNotSetUp = 9, ///< the same number as ovradr has for it
+};
+
+/// What the daemon serves at.
+struct Settings {
+    std::vector<std::string> addresses; ///< numeric; empty: every address of the machine
+    int httpPort = 0;                   ///< 0: any that is free
+    int httpsPort = 0;
+    HttpLimits limits;
+};
+
+/// The whole daemon: web server, local socket, lanes and handlers. One a process.
+class Daemon {
+public:
+    /// How long calls under way may go on once the daemon is to stop.
+    static constexpr std::chrono::milliseconds kGrace{2500};
+
+    explicit Daemon(Settings settings);
+    Daemon(const Daemon &) = delete;
+    Daemon &operator=(const Daemon &) = delete;
+    /// Stops, and waits for the calls that are still under way.
+    ~Daemon();
+
+    /// Takes what `ovradr setup` made, binds the ports and begins to serve.
+    /// \param why  takes one sentence for people unless the result is kOk
+    Outcome start(std::string &why);
+    /// The ports that it serves at, once it has started.
+    int httpsPort() const;
+    int httpPort() const;
+
+    /// Ends serving: calls under way get kGrace, then their callers are told that the daemon stops.
+    /// \return false when calls still run (they wait for another appliance): the process may then
+    ///         only leave with _exit(2), at once.
+    bool stop();
+
+private:
+    struct Impl;
+    std::unique_ptr<Impl> impl_;
+};
+
+} // namespace Ovradrd

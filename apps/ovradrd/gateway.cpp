@@ -1,0 +1,242 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "gateway.h"
+
+#include "cgi/account_store.h"
+#include "cgi/client_context.h"
+#include "cgi/session_store.h"
+#include "webapi/api_errors.h"
+
+#include <ovradrcore/json.h>
+#include <ovradrcore/log.h>
+
+#include <sodium.h>
+
+#include <chrono>
+#include <future>
+#include <memory>
+#include <utility>
+
+namespace Ovradrd {
+
+namespace {
+
+namespace APIError = OvraPlatform::APIError;
+using OvraPlatform::APICaller;
+using OvraPlatform::apiError;
+using OvraPlatform::APILane;
+
+/// Of a reply; clients take 8 MiB, and sealing adds a third.
+constexpr std::size_t kMostReply = std::size_t{5} * 1024 * 1024;
+constexpr std::size_t kLongestName = 128;
+constexpr std::chrono::milliseconds kLocalPause{100};
+constexpr char kLoopback[] = "127.0.0.1";
+
+Json::Value busy() {
+    return apiError(APIError::kTooBusy,
+                    "the appliance has too much to do, nothing was done: try again later");
+}
+
+/// The refusal of a call that everybody on the way could read.
+Json::Value unsealed(OvraPlatform::UnixMillis now) {
+    Json::Value message(Json::objectValue);
+    message["reason"] = "unsealed";
+    message["time"] = Json::Int64{now};
+    message["text"] = "over plain http parameters and session have to travel sealed: seal the "
+                      "request, or use https; change a password that was sent like this";
+    return apiError(APIError::kSealRefused, message);
+}
+
+int codeOf(const Json::Value &reply) {
+    const Json::Value &code = reply["error"]["code"];
+    return code.isInt() ? code.asInt() : 0;
+}
+
+} // namespace
+
+/// A call on its way, and where its reply goes.
+struct Gateway::Call {
+    OvraPlatform::WireCall wire;
+    std::optional<OvraPlatform::ReplyKey> replyKey;
+    bool secure = false;
+    APICaller caller;
+    HttpServer::Answer answer;
+
+    /// Ends the call.
+    void reply(const Json::Value &document) const {
+        std::string text = OvraDRCore::toString(document);
+        if (text.size() > kMostReply) {
+            text = OvraDRCore::toString(
+                apiError(APIError::kTooLarge, "the reply is too large: ask for less at once"));
+        }
+        answer(replyKey ? OvraPlatform::sealReply(*replyKey, text) : std::move(text));
+    }
+};
+
+Gateway::Gateway(const OvraPlatform::APIRegistry &registry, const OvraPlatform::SealKeyPair &keys,
+                 OvraPlatform::ReplayGuard &guard, LoginDesk &desk, Lanes &lanes)
+    : registry_(registry)
+    , keys_(keys)
+    , guard_(guard)
+    , desk_(desk)
+    , lanes_(lanes) {}
+
+void Gateway::serve(HttpRequest request, const HttpServer::Answer &answer) {
+    // std::function has to be copyable.
+    const auto held = std::make_shared<HttpRequest>(std::move(request));
+    const bool taken = lanes_.quick.submit([this, held, answer] {
+        Call call;
+        call.secure = held->secure;
+        call.caller.address = held->address;
+        call.answer = answer;
+        open(call, held->body);
+    });
+    if (!taken) {
+        sodium_memzero(held->body.data(), held->body.size());
+        answer(OvraDRCore::toString(busy()));
+    }
+}
+
+/// Reads the call and brings it on its way.
+void Gateway::open(Call &call, std::string &body) {
+    std::string why;
+    std::optional<OvraPlatform::WireCall> wire = OvraPlatform::decodeForm(body, why);
+    sodium_memzero(body.data(), body.size());
+    if (!wire) {
+        call.reply(apiError(APIError::kBadRequest, why));
+        return;
+    }
+    if (wire->api.size() > kLongestName || wire->method.size() > kLongestName) {
+        call.reply(apiError(APIError::kBadRequest, "the name of the API or method is too long"));
+        return;
+    }
+    call.wire = std::move(*wire);
+    if (unseal(call) && admit(call)) {
+        route(std::move(call));
+    }
+}
+
+/// Puts the sealed call in the place of the visible one; false when it was refused.
+bool Gateway::unseal(Call &call) {
+    const bool sealed = !call.wire.sealed.empty();
+    if (!sealed) {
+        const bool hasSomething = !call.wire.sid.empty() || !call.wire.params.empty();
+        if (hasSomething && !call.secure) {
+            call.reply(unsealed(guard_.now()));
+            return false;
+        }
+        return true;
+    }
+    OvraPlatform::OpenedRequest opened;
+    const OvraPlatform::SealVerdict verdict =
+        OvraPlatform::openRequest(keys_, call.wire, guard_, opened);
+    if (verdict != OvraPlatform::SealVerdict::kUnreadable) {
+        call.replyKey = opened.replyKey;
+    }
+    if (verdict != OvraPlatform::SealVerdict::kOpened) {
+        call.reply(OvraPlatform::sealRefusal(verdict, guard_.now()));
+        return false;
+    }
+    call.wire = std::move(opened.call);
+    return true;
+}
+
+/// Finds out who calls; false when it was refused. A session that is not known is a caller without
+/// one.
+bool Gateway::admit(Call &call) {
+    if (call.wire.sid.empty()) {
+        return true;
+    }
+    OvraPlatform::SessionStore sessions;
+    const auto session = sessions.find(call.wire.sid);
+    OvraPlatform::AccountStore accounts;
+    const auto account = session ? accounts.find(session->user) : std::nullopt;
+    if (!sessions.error().empty() || !accounts.error().empty()) {
+        // Nothing is known about the session: a peer must not take it for expired.
+        call.reply(apiError(APIError::kInternal, "the sessions cannot be read now: see the log of "
+                                                 "the appliance"));
+        return false;
+    }
+    if (!account) {
+        return true;
+    }
+    if (account->disabled) {
+        call.reply(apiError(APIError::kNoPermission,
+                            "the account of the session is disabled: enable it, or use another"));
+        return false;
+    }
+    call.caller.user = account->name;
+    call.caller.administrator = account->administrator;
+    call.caller.session = call.wire.sid;
+    return true;
+}
+
+void Gateway::route(Call call) {
+    if (LoginDesk::isLogin(call.wire)) {
+        login(std::move(call));
+        return;
+    }
+    if (registry_.lane(call.wire) == APILane::kQuick) {
+        run(call);
+        return;
+    }
+    const auto held = std::make_shared<Call>(std::move(call));
+    if (!lanes_.slow.submit([this, held] { run(*held); })) {
+        held->reply(busy());
+    }
+}
+
+void Gateway::login(Call call) {
+    const auto held = std::make_shared<Call>(std::move(call));
+    const auto wait = desk_.admit(held->wire.params, held->caller.address);
+    if (!wait) {
+        held->reply(apiError(APIError::kTooBusy, "too many log-ins of this account or from this "
+                                                 "address failed: wait a minute"));
+        return;
+    }
+    if (!lanes_.login.submit([this, held] { run(*held); }, *wait)) {
+        desk_.forgive(held->wire.params, held->caller.address);
+        held->reply(busy());
+    }
+}
+
+void Gateway::run(const Call &call) const {
+    const OvraPlatform::ClientScope scope(call.caller.address);
+    const auto begun = std::chrono::steady_clock::now();
+    const Json::Value reply = registry_.dispatch(call.wire, call.caller);
+    const std::chrono::duration<double, std::milli> time = std::chrono::steady_clock::now() - begun;
+    OVRA_DEBUG("[%s] version [%d] method [%s] of user [%s] from [%s]: code [%d] in [%.1f]ms",
+               call.wire.api.c_str(), call.wire.version, call.wire.method.c_str(),
+               call.caller.user.c_str(), call.caller.address.c_str(), codeOf(reply), time.count());
+    call.reply(reply);
+}
+
+Json::Value Gateway::serveLocal(const OvraPlatform::LocalCall &call) {
+    const auto promise = std::make_shared<std::promise<Json::Value>>();
+    std::future<Json::Value> reply = promise->get_future();
+    APICaller caller;
+    caller.user = call.user;
+    caller.administrator = true;
+    caller.local = true;
+    Lane &lane = registry_.lane(call) == APILane::kQuick ? lanes_.quick : lanes_.slow;
+    const bool taken = lane.submit([this, call, caller, promise = promise] {
+        // Without a client the session library would note one in the environment, which threads
+        // must not change.
+        const OvraPlatform::ClientScope scope(kLoopback);
+        promise->set_value(registry_.dispatch(call, caller));
+    });
+    if (!taken) {
+        return busy();
+    }
+    while (reply.wait_for(kLocalPause) != std::future_status::ready) {
+        if (leaving_) {
+            return apiError(APIError::kTooBusy, "the daemon stops: try again later");
+        }
+    }
+    try {
+        return reply.get();
+    } catch (const std::future_error &) {
+        return busy(); // the lane stopped before the job's turn came
+    }
+}
+
+} // namespace Ovradrd

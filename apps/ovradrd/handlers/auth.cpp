@@ -1,0 +1,137 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "handlers/auth.h"
+
+#include "cgi/account_store.h"
+#include "cgi/session_store.h"
+#include "handlers/params.h"
+#include "webapi/api_errors.h"
+
+#include <ovradrcore/json.h>
+#include <ovradrcore/log.h>
+
+#include <sodium.h>
+
+namespace Ovradrd {
+
+namespace {
+
+using OvraPlatform::AccountStore;
+using OvraPlatform::APICaller;
+using OvraPlatform::apiError;
+using OvraPlatform::LoginResult;
+using OvraPlatform::SessionStore;
+
+constexpr char kApi[] = "OVRA.Core.Auth";
+constexpr char kLogin[] = "login";
+constexpr char kLogout[] = "logout";
+constexpr char kAccount[] = "account";
+
+const char *refusalText(LoginResult result) {
+    switch (result) {
+    case LoginResult::kWrong:
+        return "no such account, or the password is wrong: check both";
+    case LoginResult::kDisabled:
+        return "the account is disabled: enable it, or use another";
+    case LoginResult::kNotPermitted:
+        return "the account may not log in over the network: permit it, or use another";
+    case LoginResult::kCodeRequired:
+        return "the account needs a one-time code: log in with the one that is valid now";
+    case LoginResult::kCodeWrong:
+        return "the one-time code is wrong or was used before: wait for the next one";
+    default:
+        return "the accounts cannot be read now: see the log of the appliance";
+    }
+}
+
+/// What the throttle counts by: whatever was sent, it stays short.
+std::string countedAccount(const Json::Value &params) {
+    return OvraDRCore::memberString(params, kAccount).substr(0, Params::kLongestAccount);
+}
+
+/// What a log line shows: people sometimes type their password in the place of the account.
+std::string loggable(const std::string &account) {
+    return AccountStore::isName(account) ? account : "(no account name)";
+}
+
+Json::Value openSession(const std::string &account, const APICaller &caller) {
+    OvraPlatform::SessionRequest request;
+    request.user = account;
+    request.app = LoginDesk::kApplication;
+    request.remote = caller.address;
+    request.timeout = LoginDesk::kSessionTime;
+    request.keepOthers = true;
+    const auto sid = SessionStore().create(request);
+    if (!sid) {
+        return apiError(OvraPlatform::APIError::kInternal,
+                        "the session cannot be made: see the log of the appliance");
+    }
+    Json::Value data(Json::objectValue);
+    data["sid"] = *sid;
+    return OvraPlatform::apiSuccess(data);
+}
+
+Json::Value logout(const Json::Value & /*params*/, const APICaller &caller) {
+    if (caller.session.empty()) {
+        return apiError(OvraPlatform::APIError::kNoSession, "a local caller has no session to end");
+    }
+    if (!SessionStore().remove(caller.session)) {
+        return apiError(OvraPlatform::APIError::kInternal,
+                        "the session cannot be ended: see the log of the appliance");
+    }
+    return OvraPlatform::apiSuccess();
+}
+
+} // namespace
+
+bool LoginDesk::isLogin(const OvraPlatform::APICall &call) {
+    return call.api == kApi && call.method == kLogin;
+}
+
+std::optional<std::chrono::milliseconds> LoginDesk::admit(const Json::Value &params,
+                                                          const std::string &address) {
+    return throttle_.admit(countedAccount(params), address);
+}
+
+void LoginDesk::forgive(const Json::Value &params, const std::string &address) {
+    throttle_.forgive(countedAccount(params), address);
+}
+
+Json::Value LoginDesk::login(const Json::Value &params, const APICaller &caller) {
+    Params in(params);
+    const std::string account = in.text(kAccount, Params::kLongestAccount);
+    std::string password = in.secret("passwd", Params::kLongestPassword);
+    const std::string code = in.optionalSecret("otp_code", Params::kLongestCode);
+    if (!in.ok()) {
+        forgive(params, caller.address);
+        return in.error();
+    }
+    const LoginResult result = AccountStore().verify(account, password, code);
+    sodium_memzero(password.data(), password.size());
+    switch (result) {
+    case LoginResult::kOk:
+        throttle_.succeeded(account, caller.address);
+        OVRA_NOTICE("[%s] logged in from [%s]", account.c_str(), caller.address.c_str());
+        return openSession(account, caller);
+    case LoginResult::kWrong:
+    case LoginResult::kCodeWrong:
+        break;
+    default:
+        forgive(params, caller.address);
+        break;
+    }
+    OVRA_NOTICE("A log-in of [%s] from [%s] was refused with [%d]", loggable(account).c_str(),
+                caller.address.c_str(), static_cast<int>(result));
+    return apiError(static_cast<int>(result), refusalText(result));
+}
+
+void LoginDesk::addTo(OvraPlatform::APIRegistry &registry) {
+    using OvraPlatform::APILane;
+    using OvraPlatform::APIRight;
+    registry.add(kApi, 1, kLogin, APIRight::kNone, APILane::kQuick,
+                 [this](const Json::Value &params, const APICaller &caller) {
+                     return login(params, caller);
+                 });
+    registry.add(kApi, 1, kLogout, APIRight::kSession, APILane::kQuick, logout);
+}
+
+} // namespace Ovradrd

@@ -1,0 +1,321 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "handlers/credential_flows.h"
+#include "handlers/flow_error.h"
+#include "handlers/handlers.h"
+#include "handlers/params.h"
+#include "handlers/relay.h"
+#include "handlers/words.h"
+#include "ovradrnode/cred_reverse_create.h"
+#include "ovradrnode/cred_utils.h"
+#include "ovradrnode/dr_node.h"
+#include "ovradrnode/node_create.h"
+#include "ovradrnode/node_db.h"
+#include "ovradrnode/node_delete.h"
+#include "ovradrnode/node_set.h"
+#include "webapi/api_errors.h"
+
+#include <ovradrcore/log.h>
+
+#include <algorithm>
+#include <string>
+#include <vector>
+
+namespace Ovradrd {
+
+namespace {
+
+namespace ERR = OvraDRCore::ERR;
+using OvraDRNode::Conn;
+using OvraDRNode::CredReverseCreate;
+using OvraDRNode::DRNode;
+using OvraDRNode::DRNodeDB;
+using OvraPlatform::APICaller;
+using OvraPlatform::apiError;
+using OvraPlatform::apiSuccess;
+
+constexpr char kUnidirection[] = "unidirection";
+constexpr char kBidirection[] = "bidirection";
+
+Json::Value noSuchCredential() {
+    return apiError(ERR::kCredNotFound, "this node has no such credential: list those that it has");
+}
+
+/// Where other nodes reach this one; an error reply in `refusal` when there is no such place.
+std::vector<Conn> localConns(Json::Value &refusal) {
+    std::vector<Conn> conns = DRNode::getLocalConn();
+    if (conns.empty()) {
+        refusal =
+            apiError(ERR::kBadParameter,
+                     "this appliance has no address that others reach: bring an interface up, "
+                     "or set address in its settings");
+    }
+    return conns;
+}
+
+/// Has the node behind a credential make one back to this node.
+bool reverse(CredReverseCreate &flow, const std::string &credId, const std::string &account,
+             const std::vector<Conn> &conns) {
+    return flow.setCredId(credId) && flow.setLocalAccount(account) && flow.addLocalConns(conns) &&
+           flow.process() && flow.getCredInfo().isObject();
+}
+
+/// A credential in both directions is one whole: when the way back fails, the way there goes too.
+Json::Value addReverse(Json::Value data, const std::string &credId, const APICaller &caller,
+                       const std::vector<Conn> &conns) {
+    CredReverseCreate flow;
+    if (!reverse(flow, credId, caller.user, conns)) {
+        OVRA_NOTICE("The credential [%s] is deleted again: none could be made back to this node",
+                    credId.c_str());
+        if (!OvraDRNode::DRNodeCredDelete(credId).process()) {
+            OVRA_ERR("The credential [%s] could not be deleted: delete it by hand", credId.c_str());
+        }
+        return flowError(flow, ERR::kCredIncomplete);
+    }
+    data["dst_cred"] = flow.getCredInfo();
+    return apiSuccess(data);
+}
+
+Json::Value create(const Json::Value &params, const APICaller &caller) {
+    Params in(params);
+    const Proof proof(in, true);
+    const std::string direction = in.word("cred_direction", {kUnidirection, kBidirection});
+    if (!in.ok()) {
+        return in.error();
+    }
+    const bool bothWays = direction == kBidirection;
+    Json::Value refusal;
+    const std::vector<Conn> conns = bothWays ? localConns(refusal) : std::vector<Conn>();
+    if (!refusal.isNull()) {
+        return refusal;
+    }
+    OvraDRNode::DRNodeCredCreate flow;
+    if (!proof.giveTo(flow) || !flow.process()) {
+        return flowError(flow, ERR::kCredIncomplete);
+    }
+    Json::Value data(Json::objectValue);
+    data["src_cred"] = flow.getNode().toJson();
+    return bothWays ? addReverse(data, flow.getNode().credId, caller, conns) : apiSuccess(data);
+}
+
+Json::Value createTemporary(const Json::Value &params, const APICaller & /*caller*/) {
+    Params in(params);
+    const Proof proof(in, false);
+    if (!in.ok()) {
+        return in.error();
+    }
+    OvraDRNode::TempCredCreate flow;
+    if (!proof.giveTo(flow) || !flow.process()) {
+        return flowError(flow, ERR::kCredIncomplete);
+    }
+    return apiSuccess(flow.getNode().toJson());
+}
+
+/// Whether the proof works at the other node and the account is known there; creates nothing.
+Json::Value testCreate(const Json::Value &params, const APICaller & /*caller*/) {
+    Params in(params);
+    const Proof proof(in, true);
+    const std::string account = proof.kind == Proof::Kind::kCredId
+                                    ? std::string()
+                                    : in.text("account", Params::kLongestAccount);
+    if (!in.ok()) {
+        return in.error();
+    }
+    OvraDRNode::DRNodeCredCreate flow;
+    const bool works =
+        proof.giveTo(flow) && (account.empty() || flow.setCredAccount(account)) && flow.check();
+    return works ? apiSuccess() : flowError(flow, ERR::kCredCheckFailed);
+}
+
+Json::Value get(const Json::Value &params, const APICaller & /*caller*/) {
+    Params in(params);
+    const std::string credId = readCredId(in);
+    if (!in.ok()) {
+        return in.error();
+    }
+    DRNode record;
+    return DRNodeDB::GetCred(credId, record) ? apiSuccess(record.toJson()) : noSuchCredential();
+}
+
+void appendRecords(Json::Value &list, const std::string &nodeId, int type) {
+    std::vector<DRNode> records;
+    if (nodeId.empty()) {
+        DRNodeDB::List(records, type);
+    } else {
+        DRNodeDB::ListCred(nodeId, records, type);
+    }
+    for (const DRNode &record : records) {
+        Json::Value entry = record.toJson();
+        entry["temporary"] = type == DRNodeDB::CRED_TYPE_TEMP;
+        list.append(entry);
+    }
+}
+
+/// The credentials to one node, or to all; the lasting ones first.
+Json::Value list(const Json::Value &params, const APICaller & /*caller*/) {
+    Params in(params);
+    const std::string nodeId = in.optionalText("node_id", Params::kLongestId);
+    if (!in.ok()) {
+        return in.error();
+    }
+    Json::Value data(Json::objectValue);
+    data["creds"] = Json::Value(Json::arrayValue);
+    appendRecords(data["creds"], nodeId, DRNodeDB::CRED_TYPE_NODE);
+    appendRecords(data["creds"], nodeId, DRNodeDB::CRED_TYPE_TEMP);
+    return apiSuccess(data);
+}
+
+/// A new log-in, perhaps over another endpoint, for an existing credential.
+/// \param dryRun  whether it only has to be tried
+Json::Value set(const Json::Value &params, bool dryRun) {
+    Params in(params);
+    const std::string credId = readCredId(in);
+    const Conn conn = in.connHere();
+    const RemoteLogin login(in);
+    if (!in.ok()) {
+        return in.error();
+    }
+    OvraDRNode::DRNodeCredSet flow;
+    const bool armed =
+        flow.setCredId(credId) && flow.setCred(conn, login.account, login.password, login.otpCode);
+    if (!armed || !(dryRun ? flow.check() : flow.process())) {
+        return flowError(flow, ERR::kCredIncomplete);
+    }
+    DRNode record;
+    if (!DRNodeDB::GetCred(credId, record)) {
+        return noSuchCredential();
+    }
+    return apiSuccess(record.toJson());
+}
+
+bool isTemporary(const DRNode &record) {
+    std::vector<DRNode> temporary;
+    DRNodeDB::ListCred(record.nodeId, temporary, DRNodeDB::CRED_TYPE_TEMP);
+    return std::any_of(temporary.begin(), temporary.end(),
+                       [&record](const DRNode &other) { return other.credId == record.credId; });
+}
+
+/// The row first, then the session on the other node; a node that does not answer keeps it until it
+/// expires.
+bool deleteTemporary(const DRNode &record) {
+    const OvraDRCore::SqliteEqual condition("cred_id", record.credId);
+    if (!OvraDRNode::NodeDBHandler::GetHandler().DeleteRecord(condition.text,
+                                                              OvraDRNode::TempCredSqliteTable())) {
+        return false;
+    }
+    OvraDRNode::CredUtils::NotifyRemoteNodeDeleteSessionIfNotUsed(record.conn, record.session);
+    return true;
+}
+
+/// A credential that is not there is deleted too.
+Json::Value remove(const Json::Value &params, const APICaller & /*caller*/) {
+    Params in(params);
+    const std::string credId = readCredId(in);
+    if (!in.ok()) {
+        return in.error();
+    }
+    DRNode record;
+    const bool temporary = DRNodeDB::GetCred(credId, record) && isTemporary(record);
+    const bool gone =
+        temporary ? deleteTemporary(record) : OvraDRNode::DRNodeCredDelete(credId).process();
+    return gone ? apiSuccess()
+                : apiError(ERR::kFailed, "the credential cannot be deleted: see the log of the "
+                                         "appliance, and check that its disk is not full");
+}
+
+/// What the three reverse calls share.
+/// \param run  carries out the flow
+template <typename Flow, typename Run>
+Json::Value runReverse(const Json::Value &params, const APICaller &caller, Run run) {
+    Params in(params);
+    const std::string credId = readCredId(in);
+    std::vector<Conn> conns;
+    if (in.has("conn")) {
+        conns.push_back(in.conn("conn"));
+    }
+    if (!in.ok()) {
+        return in.error();
+    }
+    Flow flow;
+    if (!flow.setCredId(credId)) {
+        return noSuchCredential();
+    }
+    if (conns.empty()) {
+        Json::Value refusal;
+        conns = localConns(refusal);
+        if (!refusal.isNull()) {
+            return refusal;
+        }
+    }
+    if (!flow.setLocalAccount(caller.user) || !flow.addLocalConns(conns) || !run(flow)) {
+        return flowError(flow, ERR::kCredIncomplete);
+    }
+    Json::Value data(Json::objectValue);
+    if (flow.getCredInfo().isObject()) {
+        data["dst_cred"] = flow.getCredInfo();
+    }
+    return apiSuccess(data);
+}
+
+template <typename Flow>
+Json::Value createReverse(const Json::Value &params, const APICaller &caller) {
+    return runReverse<Flow>(
+        params, caller, [](Flow &flow) { return flow.process() && flow.getCredInfo().isObject(); });
+}
+
+Json::Value testReverse(const Json::Value &params, const APICaller &caller) {
+    return runReverse<CredReverseCreate>(params, caller,
+                                         [](CredReverseCreate &flow) { return flow.check(); });
+}
+
+Json::Value relay(const Json::Value &params, const APICaller & /*caller*/) {
+    Params in(params);
+    const std::string credId = readCredId(in);
+    const Json::Value request = in.object("webapi");
+    if (!in.ok()) {
+        return in.error();
+    }
+    DRNode record;
+    if (!DRNodeDB::GetCred(credId, record)) {
+        return noSuchCredential();
+    }
+    RelayOperation operation(record, OvraDRCore::Request(request));
+    if (!operation.IsValidParam()) {
+        return OvraPlatform::apiBadParameter(
+            "webapi", "webapi has to be a request (api, method, version, params), and no relay");
+    }
+    if (operation.Run()) {
+        return apiSuccess(operation.GetResult());
+    }
+    // The refusal of the node at the far end is the answer to the relayed request.
+    return operation.GetErrCode() == ERR::kNoPrivilege
+               ? apiError(OvraPlatform::APIError::kNoPermission,
+                          "the credential lacks the right at its node")
+               : apiError(operation.GetErrCode(), operation.GetErrMsg());
+}
+
+} // namespace
+
+void addCredentialAPI(OvraPlatform::APIRegistry &registry) {
+    using OvraPlatform::APILane;
+    const auto add = [&registry](const char *method, APILane lane,
+                                 const OvraPlatform::APIHandler &handler) {
+        registry.add(kCredentialApi, 1, method, OvraPlatform::APIRight::kAdministrator, lane,
+                     handler);
+    };
+    add("get", APILane::kQuick, get);
+    add("list", APILane::kQuick, list);
+    add("create", APILane::kSlow, create);
+    add("temp_create", APILane::kSlow, createTemporary);
+    add("test_create", APILane::kSlow, testCreate);
+    add("set", APILane::kSlow,
+        [](const Json::Value &params, const APICaller & /*caller*/) { return set(params, false); });
+    add("test_set", APILane::kSlow,
+        [](const Json::Value &params, const APICaller & /*caller*/) { return set(params, true); });
+    add("delete", APILane::kSlow, remove);
+    add("reverse_create", APILane::kSlow, createReverse<CredReverseCreate>);
+    add("temp_reverse_create", APILane::kSlow, createReverse<OvraDRNode::TempCredReverseCreate>);
+    add("test_reverse_create", APILane::kSlow, testReverse);
+    add(kRelay, APILane::kSlow, relay);
+}
+
+} // namespace Ovradrd

@@ -1,0 +1,26 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include "credential/sealed_box.h"
+#include "webapi/api_registry.h"
+
+/// What the daemon answers, one function a family of calls. docs/ovradrd.md lists parameters,
+/// rights and replies.
+namespace Ovradrd {
+
+/// "OVRA.Core.Encryption": the key that requests are sealed to. \param keys, guard  have to outlive
+/// the registry
+void addEncryptionAPI(OvraPlatform::APIRegistry &registry, const OvraPlatform::SealKeyPair &keys,
+                      OvraPlatform::ReplayGuard &guard);
+/// "OVRA.Core.User": accounts of the appliance.
+void addUserAPI(OvraPlatform::APIRegistry &registry);
+/// "OVRA.Core.Farlink": the relay service, which a stand-alone appliance does not have.
+void addFarlinkAPI(OvraPlatform::APIRegistry &registry);
+/// "OVRA.DR.Node": facts about this node, and tests.
+void addNodeAPI(OvraPlatform::APIRegistry &registry);
+/// "OVRA.DR.Node.Session": sessions on this node, granted to other nodes.
+void addNodeSessionAPI(OvraPlatform::APIRegistry &registry);
+/// "OVRA.DR.Node.Credential": credentials that this node holds for reaching other nodes.
+void addCredentialAPI(OvraPlatform::APIRegistry &registry);
+
+} // namespace Ovradrd

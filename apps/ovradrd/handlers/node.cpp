@@ -1,0 +1,107 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "handlers/handlers.h"
+#include "handlers/params.h"
+#include "ovradrnode/dr_node.h"
+#include "ovradrnode/sender.h"
+#include "timezone.h"
+#include "version.h"
+#include "webapi/api_errors.h"
+
+#include <ovradrcore/err_recorder.h>
+
+#include <chrono>
+#include <functional>
+#include <map>
+#include <string>
+
+namespace Ovradrd {
+
+namespace {
+
+using OvraDRNode::BaseSender;
+using OvraDRNode::Conn;
+using OvraDRNode::DRNode;
+using OvraPlatform::APICaller;
+using OvraPlatform::apiError;
+using OvraPlatform::apiSuccess;
+
+constexpr std::size_t kMostFacts = 32;
+constexpr std::size_t kLongestFact = 64;
+constexpr std::size_t kMostEndpoints = 32;
+/// After this time no further endpoint is probed, which may take 10 seconds each: who asks waits 60
+/// seconds for the answer.
+constexpr std::chrono::seconds kProbeTime{45};
+
+/// What a caller may ask for beside the facts that every answer has.
+const std::map<std::string, std::function<std::string()>> &furtherFacts() {
+    static const std::map<std::string, std::function<std::string()>> kFacts = {
+        {"timezone", [] { return localTimezone(); }},
+        {"version", [] { return std::string(kVersion); }},
+    };
+    return kFacts;
+}
+
+Json::Value info(const Json::Value &params, const APICaller & /*caller*/) {
+    Params in(params);
+    const std::vector<std::string> names = in.optionalTexts("additional", kMostFacts, kLongestFact);
+    if (!in.ok()) {
+        return in.error();
+    }
+    Json::Value data(Json::objectValue);
+    data["node_id"] = DRNode::getLocalNodeId();
+    data["serial"] = DRNode::getLocalSerial();
+    data["hostname"] = DRNode::getLocalHostName();
+    if (in.has("additional")) {
+        data["additional"] = Json::Value(Json::objectValue);
+    }
+    for (const std::string &name : names) {
+        const auto fact = furtherFacts().find(name);
+        if (fact != furtherFacts().end()) {
+            data["additional"][name] = fact->second();
+        }
+    }
+    return apiSuccess(data);
+}
+
+/// The right to this call is the answer.
+Json::Value testPrivilege(const Json::Value & /*params*/, const APICaller & /*caller*/) {
+    return apiSuccess();
+}
+
+/// The first of the endpoints that this node can reach.
+Json::Value testConnection(const Json::Value &params, const APICaller & /*caller*/) {
+    Params in(params);
+    const std::vector<Conn> conns = in.conns("conns", kMostEndpoints);
+    if (!in.ok()) {
+        return in.error();
+    }
+    const auto end = std::chrono::steady_clock::now() + kProbeTime;
+    for (const Conn &conn : conns) {
+        if (std::chrono::steady_clock::now() >= end) {
+            return apiError(OvraDRCore::ERR::kNotConnectable,
+                            "none of the first endpoints answered in time: name the reachable ones "
+                            "first");
+        }
+        if (BaseSender::IsConnectable(conn)) {
+            return apiSuccess(conn.toJson());
+        }
+    }
+    return apiError(
+        OvraDRCore::ERR::kNotConnectable,
+        "this node reaches none of the endpoints: check addresses, ports and firewalls");
+}
+
+} // namespace
+
+void addNodeAPI(OvraPlatform::APIRegistry &registry) {
+    using OvraPlatform::APILane;
+    using OvraPlatform::APIRight;
+    constexpr char kApi[] = "OVRA.DR.Node";
+    registry.add(kApi, 1, "info", APIRight::kSession, APILane::kQuick, info);
+    registry.add(kApi, 1, "test_privilege", APIRight::kAdministrator, APILane::kQuick,
+                 testPrivilege);
+    registry.add(kApi, 1, "test_connection", APIRight::kAdministrator, APILane::kSlow,
+                 testConnection);
+}
+
+} // namespace Ovradrd

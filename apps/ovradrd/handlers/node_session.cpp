@@ -1,0 +1,91 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "ovradrnode/node_session.h"
+
+#include "handlers/flow_error.h"
+#include "handlers/handlers.h"
+#include "handlers/params.h"
+#include "webapi/api_errors.h"
+
+namespace Ovradrd {
+
+namespace {
+
+using OvraDRNode::NodeSession;
+using OvraPlatform::APICaller;
+
+/// How long a session that is tied to no node lasts, in seconds: as long as a task that needs a
+/// temporary credential reasonably takes, because nobody gives it back when the task was killed.
+constexpr unsigned int kTemporaryTime = 3600;
+
+Json::Value granted(const NodeSession &sessions, const std::string &session) {
+    if (session.empty()) {
+        return flowError(sessions, OvraDRCore::ERR::kSessionNotCreated);
+    }
+    Json::Value data(Json::objectValue);
+    data["session"] = session;
+    return OvraPlatform::apiSuccess(data);
+}
+
+/// A session for the caller's account, tied to a node.
+Json::Value create(const Json::Value &params, const APICaller &caller) {
+    Params in(params);
+    const std::string nodeId = in.text("node_id", Params::kLongestId);
+    if (!in.ok()) {
+        return in.error();
+    }
+    NodeSession sessions;
+    const std::string session = sessions.CreateNodeSession(nodeId, caller.user);
+    return granted(sessions, session);
+}
+
+Json::Value createTemporary(const Json::Value & /*params*/, const APICaller &caller) {
+    NodeSession sessions;
+    const std::string session = sessions.CreateTempSession(caller.user, kTemporaryTime);
+    return granted(sessions, session);
+}
+
+/// Whose session it is.
+Json::Value get(const Json::Value &params, const APICaller & /*caller*/) {
+    Params in(params);
+    const std::string session = in.text("session", Params::kLongestSession);
+    if (!in.ok()) {
+        return in.error();
+    }
+    NodeSession sessions;
+    const std::string account = sessions.GetUserBySession(session);
+    if (account.empty()) {
+        return flowError(sessions, OvraDRCore::ERR::kSessionUserUnknown);
+    }
+    Json::Value data(Json::objectValue);
+    data["account"] = account;
+    return OvraPlatform::apiSuccess(data);
+}
+
+Json::Value remove(const Json::Value &params, const APICaller & /*caller*/) {
+    Params in(params);
+    const std::string session = in.text("session", Params::kLongestSession);
+    if (!in.ok()) {
+        return in.error();
+    }
+    NodeSession sessions;
+    sessions.DeleteBySessionId(session);
+    return sessions.GetErrCode() == OvraDRCore::ERR::kNone
+               ? OvraPlatform::apiSuccess()
+               : flowError(sessions, OvraDRCore::ERR::kSessionNotRemoved);
+}
+
+} // namespace
+
+void addNodeSessionAPI(OvraPlatform::APIRegistry &registry) {
+    using OvraPlatform::APILane;
+    using OvraPlatform::APIRight;
+    constexpr char kApi[] = "OVRA.DR.Node.Session";
+    registry.add(kApi, 2, "create", APIRight::kAdministrator, APILane::kQuick, create);
+    registry.add(kApi, 1, "temp_create", APIRight::kAdministrator, APILane::kQuick,
+                 createTemporary);
+    // Who knows a session id may act as its user anyway.
+    registry.add(kApi, 1, "get", APIRight::kSession, APILane::kQuick, get);
+    registry.add(kApi, 1, "delete", APIRight::kAdministrator, APILane::kQuick, remove);
+}
+
+} // namespace Ovradrd

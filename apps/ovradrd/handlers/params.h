@@ -1,0 +1,73 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include "ovradrnode/conn.h"
+
+#include <json/value.h>
+
+#include <cstddef>
+#include <string>
+#include <vector>
+
+namespace Ovradrd {
+
+/// Reads the parameters of a call, each by type and length. The first that is missing or cannot be
+/// used is remembered, and everything read after it counts for nothing:
+///
+///     Params in(params);
+///     const std::string node = in.text("node_id", kLongestId);
+///     if (!in.ok()) {
+///         return in.error();
+///     }
+class Params {
+public:
+    static constexpr std::size_t kLongestId = 127; ///< of a node id or a credential id
+    static constexpr std::size_t kLongestSession = 255;
+    static constexpr std::size_t kLongestAccount = 255;
+    static constexpr std::size_t kLongestPassword = 1024;
+    static constexpr std::size_t kLongestCode = 64; ///< of a one-time code
+
+    /// \param params  an object; has to outlive this
+    explicit Params(const Json::Value &params)
+        : params_(params) {}
+
+    bool has(const char *name) const { return params_.isMember(name); }
+
+    /// 1 to `longest` bytes without control characters.
+    std::string text(const char *name, std::size_t longest);
+    /// As text(), or "" when it is absent or empty.
+    std::string optionalText(const char *name, std::size_t longest);
+    /// One of `words`.
+    std::string word(const char *name, const std::vector<std::string> &words);
+    /// 1 to `longest` bytes, none of them NUL; error texts never repeat it.
+    std::string secret(const char *name, std::size_t longest);
+    /// As secret(), or "" when it is absent or empty.
+    std::string optionalSecret(const char *name, std::size_t longest);
+    /// An array of at most `most` texts; none when it is absent.
+    std::vector<std::string> optionalTexts(const char *name, std::size_t most, std::size_t longest);
+    /// An endpoint: an object with "addr", "protocol" and "port".
+    OvraDRNode::Conn conn(const char *name);
+    /// An endpoint whose members stand among the parameters themselves.
+    OvraDRNode::Conn connHere();
+    /// An array of 1 to `most` endpoints.
+    std::vector<OvraDRNode::Conn> conns(const char *name, std::size_t most);
+    /// An object.
+    Json::Value object(const char *name);
+
+    /// Remembers that a parameter which was read cannot be used after all.
+    /// \param text  what it has to be; never a value of it
+    void refuse(const std::string &name, const std::string &text);
+
+    bool ok() const { return error_.isNull(); }
+    /// The reply that names the parameter; null while all is well.
+    const Json::Value &error() const { return error_; }
+
+private:
+    std::string bytes(const char *name, std::size_t longest, bool control);
+    OvraDRNode::Conn endpoint(const Json::Value &value, const std::string &name);
+
+    const Json::Value &params_;
+    Json::Value error_;
+};
+
+} // namespace Ovradrd

@@ -1,0 +1,10 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+/// Names that more than one family of calls uses.
+namespace Ovradrd {
+
+inline constexpr char kCredentialApi[] = "OVRA.DR.Node.Credential";
+inline constexpr char kRelay[] = "relay";
+
+} // namespace Ovradrd

@@ -1,0 +1,495 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "http_server.h"
+
+#include "webapi/api_errors.h"
+
+#include <ovradrcore/json.h>
+#include <ovradrcore/log.h>
+
+#include <arpa/inet.h>
+#include <gnutls/gnutls.h>
+#include <microhttpd.h>
+#include <netinet/in.h>
+#include <sodium.h>
+
+#include <array>
+#include <atomic>
+#include <charconv>
+#include <condition_variable>
+#include <cstdarg>
+#include <cstdint>
+#include <cstdio>
+#include <cstring>
+#include <exception>
+#include <mutex>
+#include <string_view>
+#include <system_error>
+#include <unordered_map>
+#include <utility>
+
+namespace Ovradrd {
+
+namespace {
+
+namespace APIError = OvraPlatform::APIError;
+using OvraPlatform::UniqueFd;
+using Phase = Connections::Phase;
+
+constexpr std::string_view kEntryPoint = "/webapi/query.cgi";
+constexpr std::string_view kFormType = "application/x-www-form-urlencoded";
+
+constexpr unsigned int kThreadsPerListener = 2;
+/// Of one connection, for header and buffers: what does not fit is refused.
+constexpr std::size_t kConnectionMemory = std::size_t{32} * 1024;
+/// Seconds; closes idle connections in good order. A connection on which something stirs is bounded
+/// by the deadlines instead.
+constexpr unsigned int kInactivity = 40;
+constexpr std::chrono::milliseconds kFlushTime{500};
+/// A body up to this size is taken in and thrown away before it is refused: a client that is still
+/// sending when the connection ends would not see the answer.
+constexpr std::size_t kMostThrownAway = std::size_t{16} * 1024 * 1024;
+
+// TLS 1.2 or newer (RFC 8446, RFC 5246), ciphers of 128 bits or more.
+constexpr char kTlsPriorities[] = "SECURE128:-VERS-ALL:+VERS-TLS1.3:+VERS-TLS1.2";
+
+std::string errorText(int code, const std::string &message) {
+    return OvraDRCore::toString(OvraPlatform::apiError(code, message));
+}
+
+/// The numeric address; that of an IPv4 client on a socket for both families as IPv4.
+std::string addressText(const sockaddr *address) {
+    std::array<char, INET6_ADDRSTRLEN> text{};
+    if (address != nullptr && address->sa_family == AF_INET) {
+        const auto *ipv4 = reinterpret_cast<const sockaddr_in *>(address);
+        inet_ntop(AF_INET, &ipv4->sin_addr, text.data(), text.size());
+    } else if (address != nullptr && address->sa_family == AF_INET6) {
+        const in6_addr &ipv6 = reinterpret_cast<const sockaddr_in6 *>(address)->sin6_addr;
+        if (IN6_IS_ADDR_V4MAPPED(&ipv6)) {
+            inet_ntop(AF_INET, &ipv6.s6_addr[12], text.data(), text.size());
+        } else {
+            inet_ntop(AF_INET6, &ipv6, text.data(), text.size());
+        }
+    }
+    return text.data();
+}
+
+/// Who counts as one client: an address, or the network of 64 bits that an IPv6 client has.
+std::string clientOf(const sockaddr *address) {
+    if (address == nullptr || address->sa_family != AF_INET6) {
+        return addressText(address);
+    }
+    const in6_addr &ipv6 = reinterpret_cast<const sockaddr_in6 *>(address)->sin6_addr;
+    if (IN6_IS_ADDR_V4MAPPED(&ipv6)) {
+        return addressText(address);
+    }
+    return {reinterpret_cast<const char *>(ipv6.s6_addr), 8};
+}
+
+std::string_view headerOf(MHD_Connection *connection, const char *name) {
+    const char *value = MHD_lookup_connection_value(connection, MHD_HEADER_KIND, name);
+    return value == nullptr ? std::string_view() : std::string_view(value);
+}
+
+/// 0 when the length is not announced.
+std::uint64_t announcedLength(MHD_Connection *connection) {
+    const std::string_view text = headerOf(connection, MHD_HTTP_HEADER_CONTENT_LENGTH);
+    std::uint64_t length = 0;
+    const auto parsed = std::from_chars(text.data(), text.data() + text.size(), length);
+    return parsed.ec == std::errc::result_out_of_range ? UINT64_MAX : length;
+}
+
+bool isForm(MHD_Connection *connection) {
+    std::string_view type = headerOf(connection, MHD_HTTP_HEADER_CONTENT_TYPE);
+    type = type.substr(0, type.find(';'));
+    while (!type.empty() && type.back() == ' ') {
+        type.remove_suffix(1);
+    }
+    return type.size() == kFormType.size() &&
+           strncasecmp(type.data(), kFormType.data(), type.size()) == 0;
+}
+
+struct StopMhd {
+    void operator()(MHD_Daemon *daemon) const { MHD_stop_daemon(daemon); }
+};
+
+struct DestroyResponse {
+    void operator()(MHD_Response *response) const { MHD_destroy_response(response); }
+};
+
+void logLibrary(void * /*self*/, const char *format, va_list arguments) {
+    std::array<char, 512> line{};
+    std::vsnprintf(line.data(), line.size(), format, arguments);
+    OVRA_DEBUG("%s", line.data());
+}
+
+} // namespace
+
+/// One request, from its header to the end of its reply.
+struct Exchange {
+    enum class State { kArriving, kWorking, kAnswered };
+
+    MHD_Connection *connection = nullptr;
+    Connections::Connection *watched = nullptr;
+    Connections *watch = nullptr;
+    std::string address;
+    bool secure = false;
+
+    std::mutex mutex; ///< of the members below, once the request was handed over
+    State state = State::kArriving;
+    unsigned int status = MHD_HTTP_OK;
+    std::string document;
+    std::string body;
+    bool discard = false; ///< the body is thrown away: the document is there already
+
+    /// Refuses the request; takes effect when its body is through.
+    void refuse(unsigned int httpStatus, int code, const std::string &message) {
+        status = httpStatus;
+        document = errorText(code, message);
+        discard = true;
+    }
+
+    /// Wakes the sleeping connection with the reply; the first one counts.
+    void answer(std::string text) {
+        const std::lock_guard lock(mutex);
+        if (state != State::kWorking) {
+            return;
+        }
+        document = std::move(text);
+        state = State::kAnswered;
+        watch->enter(watched, Phase::kReplying);
+        MHD_resume_connection(connection);
+    }
+};
+
+struct HttpServer::Impl {
+    /// One listening socket.
+    struct Door {
+        Impl *server = nullptr;
+        bool secure = false;
+        UniqueFd quiesced; ///< the socket, once it takes no connections; outlives the daemon
+        std::unique_ptr<MHD_Daemon, StopMhd> daemon;
+    };
+
+    Impl(Handler requestHandler, const HttpLimits &httpLimits)
+        : handler(std::move(requestHandler))
+        , limits(httpLimits)
+        , connections(httpLimits.connections) {}
+    ~Impl() {
+        sodium_memzero(ticketKey.data, ticketKey.size);
+        gnutls_free(ticketKey.data);
+    }
+    Impl(const Impl &) = delete;
+    Impl &operator=(const Impl &) = delete;
+
+    bool open(Listener listener, bool secure, const TlsIdentity &identity);
+
+    // What the library calls.
+    static MHD_Result onAccept(void *door, const sockaddr *address, socklen_t size);
+    static void onConnection(void *door, MHD_Connection *connection, void **context,
+                             MHD_ConnectionNotificationCode what);
+    static MHD_Result onRequest(void *door, MHD_Connection *connection, const char *url,
+                                const char *method, const char *version, const char *data,
+                                size_t *size, void **context);
+    static void onCompleted(void *door, MHD_Connection *connection, void **context,
+                            MHD_RequestTerminationCode how);
+
+    MHD_Result begin(MHD_Connection *connection, bool secure, std::string_view url,
+                     std::string_view method, void **context);
+    void take(Exchange &exchange, const char *data, std::size_t size);
+    void handOver(Exchange &exchange);
+    MHD_Result reply(Exchange &exchange);
+    void end(Exchange *exchange);
+    void giveBack(Exchange &exchange);
+
+    const Handler handler;
+    const HttpLimits limits;
+    Connections connections;
+    gnutls_datum_t ticketKey{};
+    std::atomic<bool> closing = false;
+    std::atomic<std::size_t> buffered = 0;
+    std::mutex mutex;
+    std::condition_variable ended;
+    std::unordered_map<Exchange *, std::shared_ptr<Exchange>> exchanges;
+    // Last, so that they go first: a stopping daemon calls back.
+    std::vector<std::unique_ptr<Door>> doors;
+};
+
+MHD_Result HttpServer::Impl::onAccept(void *door, const sockaddr *address, socklen_t /*size*/) {
+    auto &server = *static_cast<Door *>(door)->server;
+    return server.connections.admit(clientOf(address)) ? MHD_YES : MHD_NO;
+}
+
+void HttpServer::Impl::onConnection(void *door, MHD_Connection *connection, void **context,
+                                    MHD_ConnectionNotificationCode what) {
+    auto &here = *static_cast<Door *>(door);
+    Connections &watch = here.server->connections;
+    if (what == MHD_CONNECTION_NOTIFY_CLOSED) {
+        watch.close(static_cast<Connections::Connection *>(*context));
+        return;
+    }
+    const MHD_ConnectionInfo *fd =
+        MHD_get_connection_info(connection, MHD_CONNECTION_INFO_CONNECTION_FD);
+    const MHD_ConnectionInfo *client =
+        MHD_get_connection_info(connection, MHD_CONNECTION_INFO_CLIENT_ADDRESS);
+    *context = watch.open(fd->connect_fd, clientOf(client->client_addr));
+    if (here.secure) {
+        const MHD_ConnectionInfo *tls =
+            MHD_get_connection_info(connection, MHD_CONNECTION_INFO_GNUTLS_SESSION);
+        gnutls_session_ticket_enable_server(static_cast<gnutls_session_t>(tls->tls_session),
+                                            &here.server->ticketKey);
+    }
+}
+
+MHD_Result HttpServer::Impl::onRequest(void *door, MHD_Connection *connection, const char *url,
+                                       const char *method, const char * /*version*/,
+                                       const char *data, size_t *size, void **context) {
+    auto &here = *static_cast<Door *>(door);
+    Impl &server = *here.server;
+    try {
+        if (*context == nullptr) {
+            return server.begin(connection, here.secure, url, method, context);
+        }
+        Exchange &exchange = *static_cast<Exchange *>(*context);
+        if (*size > 0) {
+            server.take(exchange, data, *size);
+            *size = 0;
+            return MHD_YES;
+        }
+        bool ready = false;
+        {
+            const std::lock_guard lock(exchange.mutex);
+            ready = exchange.discard || exchange.state == Exchange::State::kAnswered;
+        }
+        if (ready) {
+            return server.reply(exchange);
+        }
+        server.handOver(exchange);
+        return MHD_YES;
+    } catch (const std::exception &error) {
+        OVRA_ERR("A request could not be served: [%s]", error.what());
+        return MHD_NO;
+    }
+}
+
+void HttpServer::Impl::onCompleted(void *door, MHD_Connection * /*connection*/, void **context,
+                                   MHD_RequestTerminationCode /*how*/) {
+    if (*context != nullptr) {
+        static_cast<Door *>(door)->server->end(static_cast<Exchange *>(*context));
+        *context = nullptr;
+    }
+}
+
+/// The header is there.
+MHD_Result HttpServer::Impl::begin(MHD_Connection *connection, bool secure, std::string_view url,
+                                   std::string_view method, void **context) {
+    auto exchange = std::make_shared<Exchange>();
+    const MHD_ConnectionInfo *watched =
+        MHD_get_connection_info(connection, MHD_CONNECTION_INFO_SOCKET_CONTEXT);
+    const MHD_ConnectionInfo *client =
+        MHD_get_connection_info(connection, MHD_CONNECTION_INFO_CLIENT_ADDRESS);
+    exchange->connection = connection;
+    exchange->watch = &connections;
+    exchange->watched = static_cast<Connections::Connection *>(watched->socket_context);
+    exchange->address = addressText(client->client_addr);
+    exchange->secure = secure;
+    connections.beginRequest(exchange->watched);
+
+    const std::uint64_t length = announcedLength(connection);
+    if (url != kEntryPoint) {
+        exchange->refuse(MHD_HTTP_NOT_FOUND, APIError::kBadRequest,
+                         "there is nothing here: the web API is at /webapi/query.cgi");
+    } else if (method == MHD_HTTP_METHOD_GET || method == MHD_HTTP_METHOD_HEAD) {
+        exchange->refuse(MHD_HTTP_OK, APIError::kBadRequest, "a call is made with POST");
+    } else if (method != MHD_HTTP_METHOD_POST) {
+        exchange->refuse(MHD_HTTP_METHOD_NOT_ALLOWED, APIError::kBadRequest,
+                         "a call is made with POST");
+    } else if (!isForm(connection)) {
+        exchange->refuse(MHD_HTTP_OK, APIError::kBadRequest,
+                         "the body has to be of the type application/x-www-form-urlencoded: no "
+                         "call takes a file");
+    } else if (length > limits.body) {
+        exchange->refuse(MHD_HTTP_OK, APIError::kTooLarge,
+                         "the request is too large: send less at once");
+    }
+    Exchange *const handle = exchange.get();
+    {
+        const std::lock_guard lock(mutex);
+        exchanges.emplace(handle, std::move(exchange));
+    }
+    *context = handle;
+    // A reply before the body is through ends the connection.
+    return handle->discard && length > kMostThrownAway ? reply(*handle) : MHD_YES;
+}
+
+/// A part of the body.
+void HttpServer::Impl::take(Exchange &exchange, const char *data, std::size_t size) {
+    if (exchange.discard) {
+        return;
+    }
+    if (exchange.body.size() + size > limits.body) {
+        exchange.refuse(MHD_HTTP_OK, APIError::kTooLarge,
+                        "the request is too large: send less at once");
+    } else if (buffered + size > limits.bodies) {
+        exchange.refuse(MHD_HTTP_OK, APIError::kTooBusy,
+                        "too many large requests arrive at once: try again later");
+    } else {
+        buffered += size;
+        exchange.body.append(data, size);
+        return;
+    }
+    giveBack(exchange);
+}
+
+/// Wipes and frees the body of a request.
+void HttpServer::Impl::giveBack(Exchange &exchange) {
+    buffered -= exchange.body.size();
+    sodium_memzero(exchange.body.data(), exchange.body.size());
+    exchange.body = std::string();
+}
+
+/// The request is whole.
+void HttpServer::Impl::handOver(Exchange &exchange) {
+    std::shared_ptr<Exchange> shared;
+    {
+        const std::lock_guard lock(mutex);
+        shared = exchanges.at(&exchange);
+    }
+    HttpRequest request;
+    {
+        const std::lock_guard lock(exchange.mutex);
+        buffered -= exchange.body.size();
+        request = {std::move(exchange.body), exchange.address, exchange.secure};
+        exchange.body = std::string();
+        exchange.state = Exchange::State::kWorking;
+        connections.enter(exchange.watched, Phase::kWorking);
+        MHD_suspend_connection(exchange.connection);
+    }
+    // From here on the exchange may be answered, and even be gone, at any moment.
+    const Answer answer = [shared](std::string document) { shared->answer(std::move(document)); };
+    if (closing) {
+        answer(errorText(APIError::kTooBusy, "the daemon stops: try again later"));
+        return;
+    }
+    handler(std::move(request), answer);
+}
+
+MHD_Result HttpServer::Impl::reply(Exchange &exchange) {
+    connections.enter(exchange.watched, Phase::kReplying);
+    const std::unique_ptr<MHD_Response, DestroyResponse> response(MHD_create_response_from_buffer(
+        exchange.document.size(), exchange.document.data(), MHD_RESPMEM_MUST_COPY));
+    if (response == nullptr) {
+        return MHD_NO;
+    }
+    MHD_add_response_header(response.get(), MHD_HTTP_HEADER_CONTENT_TYPE, "application/json");
+    MHD_add_response_header(response.get(), MHD_HTTP_HEADER_CACHE_CONTROL, "no-store");
+    MHD_add_response_header(response.get(), "X-Content-Type-Options", "nosniff");
+    if (exchange.status == MHD_HTTP_METHOD_NOT_ALLOWED) {
+        MHD_add_response_header(response.get(), MHD_HTTP_HEADER_ALLOW, "GET, HEAD, POST");
+    }
+    return MHD_queue_response(exchange.connection, exchange.status, response.get());
+}
+
+/// The reply has left, or the connection is gone.
+void HttpServer::Impl::end(Exchange *exchange) {
+    giveBack(*exchange);
+    connections.enter(exchange->watched, Phase::kIdle);
+    const std::lock_guard lock(mutex);
+    exchanges.erase(exchange);
+    ended.notify_all();
+}
+
+bool HttpServer::Impl::open(Listener listener, bool secure, const TlsIdentity &identity) {
+    auto door = std::make_unique<Door>();
+    door->server = this;
+    door->secure = secure;
+    const unsigned int flags = MHD_USE_EPOLL_INTERNAL_THREAD | MHD_ALLOW_SUSPEND_RESUME |
+                               MHD_USE_ERROR_LOG | (secure ? unsigned{MHD_USE_TLS} : 0U);
+    // Our own limit acts first; the library divides its limit between its threads.
+    const auto mostConnections =
+        static_cast<unsigned int>(2 * limits.connections.total * kThreadsPerListener);
+    const std::array<MHD_OptionItem, 4> tlsOptions = {{
+        {MHD_OPTION_HTTPS_MEM_KEY, 0, const_cast<char *>(identity.key.c_str())},
+        {MHD_OPTION_HTTPS_MEM_CERT, 0, const_cast<char *>(identity.certificate.c_str())},
+        {MHD_OPTION_HTTPS_PRIORITIES, 0, const_cast<char *>(kTlsPriorities)},
+        {MHD_OPTION_END, 0, nullptr},
+    }};
+    const std::array<MHD_OptionItem, 1> noOptions = {{{MHD_OPTION_END, 0, nullptr}}};
+    const int socket = listener.socket.get();
+    // clang-format off
+    door->daemon.reset(MHD_start_daemon(
+        flags, 0, onAccept, door.get(), onRequest, door.get(),
+        MHD_OPTION_EXTERNAL_LOGGER, logLibrary, nullptr,
+        MHD_OPTION_LISTEN_SOCKET, socket,
+        MHD_OPTION_THREAD_POOL_SIZE, kThreadsPerListener,
+        MHD_OPTION_CONNECTION_LIMIT, mostConnections,
+        MHD_OPTION_CONNECTION_MEMORY_LIMIT, kConnectionMemory,
+        MHD_OPTION_CONNECTION_TIMEOUT, kInactivity,
+        MHD_OPTION_STRICT_FOR_CLIENT, 1,
+        MHD_OPTION_NOTIFY_CONNECTION, onConnection, door.get(),
+        MHD_OPTION_NOTIFY_COMPLETED, onCompleted, door.get(),
+        MHD_OPTION_ARRAY, secure ? tlsOptions.data() : noOptions.data(),
+        MHD_OPTION_END));
+    // clang-format on
+    if (door->daemon == nullptr) {
+        return false;
+    }
+    // The library closes the socket, unless it is told to quiesce.
+    listener.socket.release();
+    doors.push_back(std::move(door));
+    return true;
+}
+
+HttpServer::HttpServer(Handler handler, const HttpLimits &limits)
+    : impl_(std::make_unique<Impl>(std::move(handler), limits)) {}
+
+HttpServer::~HttpServer() {
+    stop();
+}
+
+bool HttpServer::start(std::vector<Listener> https, std::vector<Listener> http,
+                       const TlsIdentity &identity, std::string &why) {
+    if (gnutls_session_ticket_key_generate(&impl_->ticketKey) != GNUTLS_E_SUCCESS) {
+        why =
+            "the key for TLS session tickets cannot be made: is the kernel out of random numbers?";
+        return false;
+    }
+    for (const bool secure : {true, false}) {
+        for (Listener &listener : secure ? https : http) {
+            if (!impl_->open(std::move(listener), secure, identity)) {
+                why = "the HTTP server cannot start: the log says why";
+                return false;
+            }
+        }
+    }
+    return true;
+}
+
+void HttpServer::quiesce() {
+    impl_->closing = true;
+    for (const auto &door : impl_->doors) {
+        if (!door->quiesced) {
+            door->quiesced.reset(MHD_quiesce_daemon(door->daemon.get()));
+        }
+    }
+}
+
+void HttpServer::stop() {
+    quiesce();
+    std::vector<std::shared_ptr<Exchange>> underWay;
+    {
+        const std::lock_guard lock(impl_->mutex);
+        for (const auto &[handle, exchange] : impl_->exchanges) {
+            underWay.push_back(exchange);
+        }
+    }
+    for (const std::shared_ptr<Exchange> &exchange : underWay) {
+        exchange->answer(errorText(APIError::kTooBusy, "the daemon stops: try again later"));
+    }
+    {
+        std::unique_lock lock(impl_->mutex);
+        impl_->ended.wait_for(lock, kFlushTime, [this] { return impl_->exchanges.empty(); });
+    }
+    impl_->doors.clear();
+}
+
+} // namespace Ovradrd

@@ -1,0 +1,140 @@
+// SPDX-License-Identifier: Apache-2.0
+
+// ovradrd: the web-API daemon of an appliance.
+
+#include "cgi/session_store.h"
+#include "core/appliance.h"
+#include "daemon.h"
+#include "version.h"
+
+#include <ovradrcore/log.h>
+
+#include <CLI/CLI.hpp>
+#include <sys/resource.h>
+#include <syslog.h>
+#include <unistd.h>
+
+#include <csignal>
+#include <cstdio>
+#include <cstdlib>
+#include <ctime>
+#include <exception>
+#include <string>
+
+namespace {
+
+using Ovradrd::Daemon;
+using Ovradrd::Outcome;
+
+constexpr time_t kSweepSeconds = 300;
+/// Descriptors for the connections that it may have, and for everything else.
+constexpr rlim_t kDescriptors = 4096;
+
+constexpr char kFooter[] =
+    "Serves in the foreground until SIGTERM or SIGINT; prints one line when it is ready. Settings\n"
+    "are read from /usr/ovra/etc/ovradr/ovradrd.conf at the start; everything else goes to the\n"
+    "system log. `ovradr setup` makes what it needs.\n\n"
+    "Exit codes: 0 ended by a signal, 1 failed, 2 wrong usage, 3 a port is in use, 9 not set up.";
+
+Outcome fail(Outcome outcome, const std::string &why) {
+    OVRA_ERR("ovradrd does not start: %s", why.c_str());
+    std::fprintf(stderr, "ovradrd: %s\n", why.c_str());
+    return outcome;
+}
+
+bool readSettings(Ovradrd::Settings &settings, std::string &why) {
+    const OvraPlatform::ApplianceConfig config = OvraPlatform::readApplianceConfig();
+    if (!config.problems.empty()) {
+        why = std::string(OvraPlatform::kConfigFile) + ": " + config.problems.front() +
+              ": correct the file";
+        return false;
+    }
+    if (!config.servesAllAddresses && config.addresses.empty()) {
+        why = std::string(OvraPlatform::kConfigFile) + " names no address to serve at: correct it";
+        return false;
+    }
+    settings.addresses = config.addresses;
+    settings.httpPort = config.httpPort;
+    settings.httpsPort = config.httpsPort;
+    return true;
+}
+
+void raiseDescriptorLimit() {
+    rlimit limit{};
+    if (getrlimit(RLIMIT_NOFILE, &limit) != 0 || limit.rlim_cur >= kDescriptors) {
+        return;
+    }
+    limit.rlim_cur =
+        limit.rlim_max == RLIM_INFINITY ? kDescriptors : std::min(kDescriptors, limit.rlim_max);
+    if (setrlimit(RLIMIT_NOFILE, &limit) != 0 || limit.rlim_cur < kDescriptors) {
+        OVRA_WARN("Only [%llu] descriptors are allowed, fewer than all connections need: raise "
+                  "the limit of open files",
+                  static_cast<unsigned long long>(limit.rlim_cur));
+    }
+}
+
+/// The signals that end the daemon, kept from all threads so that the main one can wait for them.
+sigset_t blockEndSignals() {
+    sigset_t signals;
+    sigemptyset(&signals);
+    for (const int signal : {SIGTERM, SIGINT, SIGHUP}) {
+        sigaddset(&signals, signal);
+    }
+    pthread_sigmask(SIG_BLOCK, &signals, nullptr);
+    return signals;
+}
+
+/// Waits for the end, and sweeps the expired sessions now and then.
+void waitForEnd(const sigset_t &signals) {
+    const timespec period{kSweepSeconds, 0};
+    while (sigtimedwait(&signals, nullptr, &period) < 0) {
+        OvraPlatform::SessionStore().sweep();
+    }
+}
+
+Outcome serve() {
+    std::signal(SIGPIPE, SIG_IGN);
+    const sigset_t signals = blockEndSignals();
+    raiseDescriptorLimit();
+
+    std::string why;
+    Ovradrd::Settings settings;
+    if (!readSettings(settings, why)) {
+        return fail(Outcome::kFailed, why);
+    }
+    Daemon daemon(settings);
+    if (const Outcome outcome = daemon.start(why); outcome != Outcome::kOk) {
+        return fail(outcome, why);
+    }
+    OVRA_NOTICE("Serves at https port [%d] and http port [%d]", daemon.httpsPort(),
+                daemon.httpPort());
+    std::printf("ovradrd: ready, https %d, http %d\n", daemon.httpsPort(), daemon.httpPort());
+    std::fflush(stdout);
+
+    waitForEnd(signals);
+    OVRA_NOTICE("Stops");
+    if (!daemon.stop()) {
+        OVRA_NOTICE("Calls that wait for other appliances are left");
+        _exit(static_cast<int>(Outcome::kOk));
+    }
+    return Outcome::kOk;
+}
+
+} // namespace
+
+int main(int argc, char **argv) {
+    openlog("ovradrd", LOG_NDELAY, LOG_DAEMON);
+    try {
+        CLI::App app("The web-API daemon of an appliance", "ovradrd");
+        app.footer(kFooter);
+        app.set_version_flag("--version", std::string("ovradrd ") + Ovradrd::kVersion);
+        try {
+            app.parse(argc, argv);
+        } catch (const CLI::ParseError &error) {
+            return app.exit(error) == 0 ? EXIT_SUCCESS : static_cast<int>(Outcome::kUsage);
+        }
+        return static_cast<int>(serve());
+    } catch (const std::exception &error) {
+        return static_cast<int>(fail(Outcome::kFailed, error.what()));
+    }
+}

@@ -1,0 +1,62 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "timezone.h"
+
+#include <algorithm>
+#include <cctype>
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
+#include <system_error>
+
+namespace Ovradrd {
+
+namespace {
+
+constexpr char kUtc[] = "Etc/UTC";
+constexpr char kZoneFolder[] = "/zoneinfo/";
+constexpr std::size_t kLongestName = 64;
+
+/// The text when it has the form of a zone's name, otherwise "".
+std::string zoneName(std::string text) {
+    text.erase(std::min(text.find_first_of("\r\n"), text.size()));
+    const bool named =
+        !text.empty() && text.size() <= kLongestName && text.front() != '/' &&
+        std::all_of(text.begin(), text.end(), [](unsigned char c) {
+            return std::isalnum(c) != 0 || c == '/' || c == '_' || c == '-' || c == '+';
+        });
+    return named ? text : std::string();
+}
+
+std::string zoneOfPath(const std::string &path) {
+    const std::size_t folder = path.find(kZoneFolder);
+    return folder == std::string::npos ? std::string()
+                                       : zoneName(path.substr(folder + sizeof(kZoneFolder) - 1));
+}
+
+/// TZ may hold a name or a path, with or without a colon before it.
+std::string zoneOfVariable(std::string value) {
+    if (!value.empty() && value.front() == ':') {
+        value.erase(0, 1);
+    }
+    return value.find(kZoneFolder) == std::string::npos ? zoneName(value) : zoneOfPath(value);
+}
+
+} // namespace
+
+std::string localTimezone(const TimezoneFiles &files) {
+    const char *const variable = std::getenv("TZ"); // NOLINT(concurrency-mt-unsafe): nobody sets it
+    if (variable != nullptr && *variable != '\0') {
+        return zoneOfVariable(variable);
+    }
+    std::error_code error;
+    const auto target = std::filesystem::read_symlink(files.link, error);
+    if (!error) {
+        return zoneOfPath(target.string());
+    }
+    std::string line;
+    std::getline(std::ifstream(files.name), line);
+    const std::string name = zoneName(line);
+    return name.empty() && !std::filesystem::exists(files.link, error) ? kUtc : name;
+}
+
+} // namespace Ovradrd

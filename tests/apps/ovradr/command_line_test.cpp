@@ -1,0 +1,123 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "program.h"
+#include "support/misbehaving_server.h"
+
+#include <fcntl.h>
+#include <gtest/gtest.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <filesystem>
+
+namespace OvradrTest {
+
+TEST(CommandLine, EveryFailureIsOneSentenceForPeopleAndOneDocumentForScripts) {
+    const std::string dead = "https://127.0.0.1:" + std::to_string(OvraTest::unusedPort());
+    ASSERT_EQ(run({"setup"}).exit, 0);
+    const struct {
+        Arguments arguments;
+        int exit;
+        const char *name;
+    } cases[] = {
+        {{}, 2, "usage"},
+        {{"nonsense"}, 2, "usage"},
+        {{"user"}, 2, "usage"},
+        {{"user", "add"}, 2, "usage"},
+        {{"user", "add", "b\x1b[2Jb", "--password-stdin"}, 2, "usage"},
+        {{"cred", "list", "--bogus"}, 2, "usage"},
+        {{"cred", "create", "nas2", "--account", "bob", "--password-stdin"}, 2, "usage"},
+        {{"cred", "create", dead, "--account", "bob", "--fingerprint", "x"}, 2, "usage"},
+        {{"cred", "create", dead, "--account", "bob", "--password-stdin"}, 3, "not_reachable"},
+        {{"cred", "create", "flk:nowhere", "--account", "bob"}, 3, "not_reachable"},
+        {{"conn", "test", dead}, 3, "not_reachable"},
+        {{"conn", "test", "https://no-such-host.invalid"}, 3, "not_reachable"},
+        {{"conn", "forget", dead}, 7, "not_found"},
+        {{"cred", "show", "nothing"}, 7, "not_found"},
+        {{"user", "remove", "nobody"}, 7, "not_found"},
+        {{"call", "local", "A", "m", "--param", "x"}, 2, "usage"},
+        {{"call", "local", "A", "m", "--param", "x:=y"}, 2, "usage"},
+        {{"call", "local", "A", "m", "--param", "x=1", "--param", "x=2"}, 2, "usage"},
+        {{"call", "local", "A", "m", "--params-file", "/dev/null"}, 2, "usage"},
+        {{"call", "local", "A", "m", "--version", "0"}, 2, "usage"},
+        {{"call", "local", "A", "m"}, 1, "internal"},
+    };
+    for (const auto &each : cases) {
+        std::string shown;
+        for (const std::string &argument : each.arguments) {
+            shown += argument + " ";
+        }
+        const Result people = run(each.arguments, "correct horse\n");
+        EXPECT_EQ(people.exit, each.exit) << shown << people.err;
+        EXPECT_EQ(people.out, "") << shown;
+        EXPECT_EQ(people.err.rfind("ovradr: ", 0), 0U) << shown << people.err;
+        EXPECT_EQ(people.err.find('\x1B'), std::string::npos) << shown;
+
+        Arguments withJson = each.arguments;
+        withJson.emplace_back("--json");
+        const Result scripts = run(withJson, "correct horse\n");
+        EXPECT_EQ(scripts.exit, each.exit) << shown;
+        EXPECT_EQ(scripts.err, "") << shown;
+        const Json::Value document = scripts.json();
+        ASSERT_TRUE(document.isObject()) << shown << scripts.out;
+        EXPECT_FALSE(document["success"].asBool()) << shown;
+        EXPECT_EQ(document["error"]["name"], each.name) << shown << scripts.out;
+        EXPECT_FALSE(document["error"]["message"].asString().empty()) << shown;
+        EXPECT_TRUE(document["error"]["hint"].isString()) << shown;
+    }
+}
+
+TEST(CommandLine, WhatNeedsTheDatabaseSaysWhenItIsNotSetUp) {
+    for (const Arguments &arguments :
+         {Arguments{"cred", "list"},
+          {"cred", "show", "x"},
+          {"call", "x", "A", "m"},
+          {"cred", "create", "https://127.0.0.1:1", "--account", "bob", "--password-stdin"}}) {
+        const Result result = run(arguments, "correct horse\n");
+        EXPECT_EQ(result.exit, 9) << arguments[0] << arguments[1];
+        EXPECT_NE(result.err.find("ovradr setup"), std::string::npos) << result.err;
+    }
+    EXPECT_FALSE(std::filesystem::exists("/usr/ovra/etc/ovradr/node.db"));
+    std::filesystem::create_directories("/usr/ovra/etc/ovradr");
+    writeFile("/usr/ovra/etc/ovradr/node.db", std::string(4096, 'x'));
+    EXPECT_EQ(run({"cred", "list"}).exit, 9);
+}
+
+TEST(CommandLine, HelpAndVersionAreThereEverywhere) {
+    EXPECT_EQ(run({"--version"}).out, "ovradr " OVRADR_VERSION "\n");
+    for (const Arguments &command : {Arguments{},
+                                     {"setup"},
+                                     {"node", "id"},
+                                     {"user", "add"},
+                                     {"user", "list"},
+                                     {"user", "passwd"},
+                                     {"user", "totp"},
+                                     {"user", "disable"},
+                                     {"user", "remove"},
+                                     {"cred", "create"},
+                                     {"cred", "list"},
+                                     {"cred", "show"},
+                                     {"call"},
+                                     {"conn", "local"},
+                                     {"conn", "test"},
+                                     {"conn", "forget"}}) {
+        Arguments arguments = command;
+        arguments.emplace_back("--help");
+        const Result result = run(arguments);
+        EXPECT_EQ(result.exit, 0);
+        EXPECT_NE(result.out.find("Example"), std::string::npos) << result.out;
+    }
+}
+
+TEST(CommandLine, OutputThatCannotBeWrittenIsAFailure) {
+    const pid_t child = fork();
+    if (child == 0) {
+        dup2(open("/dev/full", O_WRONLY | O_CLOEXEC), STDOUT_FILENO);
+        execl(OVRADR_PROGRAM, OVRADR_PROGRAM, "node", "id", nullptr);
+        _exit(127);
+    }
+    int status = 0;
+    waitpid(child, &status, 0);
+    EXPECT_EQ(WEXITSTATUS(status), 1);
+}
+
+} // namespace OvradrTest

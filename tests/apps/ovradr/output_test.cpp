@@ -1,0 +1,69 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "failure.h"
+#include "output.h"
+#include "ovradrcore/err_recorder.h"
+
+#include <gtest/gtest.h>
+
+namespace Ovradr {
+
+TEST(Output, NothingThatATerminalObeysGetsThrough) {
+    const struct {
+        std::string raw;
+        const char *shown;
+    } cases[] = {
+        {"plain, \xC3\xA4\xE2\x82\xAC\xF0\x9F\x92\xBE",
+         "plain, \xC3\xA4\xE2\x82\xAC\xF0\x9F\x92\xBE"},
+        {"\x1B[2J\x07", "\\x1b[2J\\x07"},
+        {"a\nb\rc\td", "a\\nb\\rc\\td"},
+        {std::string("a\0b", 3), "a\\x00b"},
+        {"\x7F", "\\x7f"},
+        {"\xC2\x9B"
+         "31m",
+         "\\u009b31m"},                                              // the one-byte form of ESC [
+        {std::string("\xE2\x80") + "\xAEgpj.exe", "\\u202egpj.exe"}, // turns the rest around
+        {"a\xE2\x80\xA8"
+         "b",
+         "a\\u2028b"},                                         // a line break
+        {"\xFF\xC3(", "\\xff\\xc3("},                          // no UTF-8
+        {"\xC0\xAF\xED\xA0\x80", "\\xc0\\xaf\\xed\\xa0\\x80"}, // overlong, surrogate
+        {"cut \xE2\x82", "cut \\xe2\\x82"},
+    };
+    for (const auto &each : cases) {
+        EXPECT_EQ(printable(each.raw), each.shown);
+    }
+}
+
+TEST(Output, ColumnsLineUpWhateverTheCellsHold) {
+    EXPECT_EQ(table({"NAME", "ROLE", "LAST"}, {{"bob", "user", "1"},
+                                               {"\xC3\xA4", "\xE6\x97\xA5\xE6\x9C\xAC", "2"},
+                                               {"x\n", "", ""}}),
+              "NAME  ROLE  LAST\n"
+              "bob   user  1\n"
+              "\xC3\xA4     \xE6\x97\xA5\xE6\x9C\xAC  2\n"
+              "x\\n\n");
+    EXPECT_EQ(listing({{"node", "1"}, {"nothing", ""}, {"endpoint", "2"}}), "node:      1\n"
+                                                                            "endpoint:  2\n");
+}
+
+TEST(Output, EveryErrorOfTheLibraryHasItsSentence) {
+    for (int code = 1; code < 1000; ++code) {
+        const bool known = OvraDRCore::ERR::ToString(code) != "unknown error";
+        const Failure found = failureOf(code);
+        EXPECT_TRUE(!known || found.name.find("error_") == std::string::npos) << code;
+        EXPECT_EQ(found.code, code);
+        EXPECT_NE(found.exit, ExitCode::kOk) << code;
+        EXPECT_TRUE(found.message.ends_with(".") && !found.hint.empty()) << code;
+    }
+}
+
+TEST(Output, WhatComesWithAnErrorIsToldButNoSecretInIt) {
+    Json::Value detail;
+    detail["session"] = "s3cret";
+    detail["reason"] = "gone";
+    const std::string message = failureOf(105, detail).message;
+    EXPECT_NE(message.find("gone"), std::string::npos) << message;
+    EXPECT_EQ(message.find("s3cret"), std::string::npos) << message;
+}
+
+} // namespace Ovradr

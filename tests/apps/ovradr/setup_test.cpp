@@ -1,0 +1,237 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "program.h"
+#include "provision/server_certificate.h"
+#include "support/local_node.h"
+
+#include <gtest/gtest.h>
+#include <openssl/pem.h>
+#include <openssl/x509v3.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <array>
+#include <filesystem>
+#include <map>
+#include <memory>
+
+namespace OvradrTest {
+
+namespace {
+
+using OvraTest::executeSql;
+using OvraTest::kIdentityFile;
+using OvraTest::kNodeDatabase;
+using OvraTest::querySql;
+
+constexpr const char *kFolder = "/usr/ovra/etc/ovradr";
+constexpr const char *kSettings = "/usr/ovra/etc/ovradr/ovradrd.conf";
+constexpr const char *kKey = "/usr/ovra/etc/ovradr/ovradrd.key";
+constexpr const char *kCertificate = "/usr/ovra/etc/ovradr/ovradrd.crt";
+
+unsigned int modeOf(const std::string &path) {
+    struct stat status {};
+    return stat(path.c_str(), &status) == 0 ? status.st_mode & 07777U : 0;
+}
+
+std::map<std::string, std::string> filesOf(const std::string &folder) {
+    std::map<std::string, std::string> files;
+    for (const auto &entry : std::filesystem::directory_iterator(folder)) {
+        files[entry.path().string()] = readFile(entry.path().string());
+    }
+    return files;
+}
+
+/// A made-up step's "made" in a set-up's answer.
+bool made(const Json::Value &answer, const std::string &what) {
+    for (const Json::Value &step : answer["data"]["steps"]) {
+        if (step["what"] == what) {
+            return step["made"].asBool();
+        }
+    }
+    ADD_FAILURE() << "no step " << what;
+    return false;
+}
+
+struct Free {
+    void operator()(X509 *certificate) const { X509_free(certificate); }
+};
+
+std::unique_ptr<X509, Free> loadCertificate() {
+    FILE *file = std::fopen(kCertificate, "r");
+    std::unique_ptr<X509, Free> certificate(PEM_read_X509(file, nullptr, nullptr, nullptr));
+    std::fclose(file);
+    return certificate;
+}
+
+} // namespace
+
+TEST(Setup, MakesAWholeApplianceAndTheSecondTimeNothing) {
+    const Result first = run({"setup", "--json", "--hostname", "nas1"});
+    ASSERT_EQ(first.exit, 0) << first.out << first.err;
+    for (const char *what :
+         {"node database", "HTTPS key", "HTTPS certificate", "sealing key", "node id"}) {
+        EXPECT_TRUE(made(first.json(), what)) << what;
+    }
+    EXPECT_EQ(modeOf(kFolder), 0755U);
+    EXPECT_EQ(modeOf("/usr/ovra/var/ovradr"), 0700U);
+    EXPECT_EQ(modeOf(kNodeDatabase), 0600U);
+    EXPECT_EQ(modeOf(kKey), 0600U);
+    EXPECT_EQ(modeOf(kCertificate), 0644U);
+    EXPECT_EQ(modeOf("/usr/ovra/etc/ovradr/ovradrd.seal"), 0600U);
+    const auto before = filesOf(kFolder);
+
+    const Result second = run({"setup", "--json"});
+    ASSERT_EQ(second.exit, 0) << second.out;
+    for (const Json::Value &step : second.json()["data"]["steps"]) {
+        EXPECT_FALSE(step["made"].asBool()) << step["what"].asString();
+    }
+    EXPECT_EQ(second.json()["data"]["node_id"], first.json()["data"]["node_id"]);
+    EXPECT_EQ(second.json()["data"]["fingerprints"], first.json()["data"]["fingerprints"]);
+    EXPECT_EQ(filesOf(kFolder), before);
+}
+
+TEST(Setup, MakesACertificateForTheNamesOfTheAppliance) {
+    ASSERT_EQ(
+        run({"setup", "--hostname", "nas1.example", "--address", "127.0.1.1,2001:db8::7"}).exit, 0);
+    const auto certificate = loadCertificate();
+    ASSERT_TRUE(certificate);
+    EXPECT_EQ(X509_check_host(certificate.get(), "nas1.example", 0, 0, nullptr), 1);
+    EXPECT_EQ(X509_check_ip_asc(certificate.get(), "127.0.1.1", 0), 1);
+    EXPECT_EQ(X509_check_ip_asc(certificate.get(), "2001:db8::7", 0), 1);
+    EXPECT_EQ(X509_check_ip_asc(certificate.get(), "127.0.1.2", 0), 0);
+    std::time_t nineYears = std::time(nullptr) + 9L * 365 * 24 * 3600;
+    EXPECT_GT(X509_cmp_time(X509_get0_notAfter(certificate.get()), &nineYears), 0);
+    EXPECT_LT(X509_cmp_current_time(X509_get0_notBefore(certificate.get())), 0);
+}
+
+TEST(Setup, KeepsWhatTheDatabaseHolds) {
+    ASSERT_EQ(run({"setup"}).exit, 0);
+    OvraTest::addCred("node_cred", "node", "cred", "https", 5001, "session");
+    chmod(kNodeDatabase, 0644);
+    ASSERT_EQ(run({"setup"}).exit, 0);
+    EXPECT_EQ(querySql("SELECT cred_id FROM node_cred"), "cred\n");
+    EXPECT_EQ(modeOf(kNodeDatabase), 0600U) << "it holds sessions";
+}
+
+TEST(Setup, FillsAnEmptyDatabaseThatACrashLeft) {
+    std::filesystem::create_directories(kFolder);
+    writeFile(kNodeDatabase, "");
+    EXPECT_TRUE(made(run({"setup", "--json"}).json(), "node database"));
+    EXPECT_EQ(run({"cred", "list"}).exit, 0);
+}
+
+TEST(Setup, RefusesADatabaseThatIsNotItsOwnAndLeavesIt) {
+    const struct {
+        const char *what;
+        const char *sql;
+        const char *told;
+    } cases[] = {
+        {"newer", "UPDATE ovradrcore_db_info SET version = 2", "newer"},
+        {"without a version", "DELETE FROM ovradrcore_db_info", "not one that"},
+        {"without a table", "DROP TABLE temp_cred", "not one that"},
+        {"with other columns", "ALTER TABLE node_cred RENAME COLUMN session TO sid",
+         "not one that"},
+    };
+    for (const auto &each : cases) {
+        std::filesystem::remove(kNodeDatabase);
+        ASSERT_EQ(run({"setup"}).exit, 0);
+        executeSql(each.sql);
+        const std::string before = readFile(kNodeDatabase);
+        const Result result = run({"setup"});
+        EXPECT_EQ(result.exit, 9) << each.what;
+        EXPECT_NE(result.err.find(each.told), std::string::npos) << each.what << result.err;
+        EXPECT_EQ(readFile(kNodeDatabase), before) << each.what;
+    }
+    writeFile(kNodeDatabase, std::string(5000, 'x'));
+    EXPECT_EQ(run({"setup"}).exit, 9);
+    EXPECT_EQ(readFile(kNodeDatabase), std::string(5000, 'x'));
+}
+
+TEST(Setup, RefusesAKeyOrCertificateThatDoesNotFitAndLeavesIt) {
+    ASSERT_EQ(run({"setup"}).exit, 0);
+    const std::string certificate = readFile(kCertificate);
+    const std::string key = readFile(kKey);
+    std::filesystem::remove(kKey);
+    EXPECT_EQ(run({"setup"}).exit, 9) << "the new key is not the certificate's";
+    EXPECT_EQ(readFile(kCertificate), certificate);
+    writeFile(kKey, "rubbish");
+    EXPECT_EQ(run({"setup"}).exit, 9);
+    EXPECT_EQ(readFile(kKey), "rubbish");
+    writeFile(kKey, key);
+    EXPECT_EQ(run({"setup"}).exit, 0);
+}
+
+TEST(Setup, ManyAtOnceMakeOneAppliance) {
+    std::array<std::unique_ptr<Program>, 6> programs;
+    for (auto &program : programs) {
+        program = std::make_unique<Program>(Arguments{"setup", "--json"});
+    }
+    std::map<std::string, int> fingerprints;
+    for (const auto &program : programs) {
+        const Result result = program->finish();
+        ASSERT_EQ(result.exit, 0) << result.out;
+        ++fingerprints[result.json()["data"]["fingerprints"].toStyledString()];
+    }
+    EXPECT_EQ(fingerprints.size(), 1U);
+    EXPECT_EQ(querySql("SELECT count(*) FROM ovradrcore_db_info"), "1\n");
+}
+
+TEST(Setup, ChangesOnlyTheSettingsThatAreGiven) {
+    ASSERT_EQ(run({"setup", "--serial", "A1", "--http-port", "8080"}).exit, 0);
+    ASSERT_EQ(run({"setup", "--https-port", "8443"}).exit, 0);
+    EXPECT_EQ(readFile(kSettings), "serial=\"A1\"\nhttp_port=\"8080\"\nhttps_port=\"8443\"\n");
+}
+
+TEST(Setup, RefusesSettingsWithWhichItCouldNotServe) {
+    const Arguments refused[] = {
+        {"--http-port", "0"},
+        {"--https-port", "65536"},
+        {"--http-port", "5001"},
+        {"--hostname", "nas 1"},
+        {"--hostname", "nas\n1"},
+        {"--address", "nas1"},
+        {"--address", "127.0.0.1,,x"},
+        {"--serial", "a\"b"},
+        {"--serial", std::string(65, 'a')},
+    };
+    for (Arguments arguments : refused) {
+        arguments.insert(arguments.begin(), "setup");
+        EXPECT_EQ(run(arguments).exit, 2) << arguments[1] << arguments[2];
+        EXPECT_FALSE(std::filesystem::exists(kSettings));
+    }
+}
+
+TEST(Setup, SaysWhichLineOfTheSettingsIsBroken) {
+    std::filesystem::create_directories(kFolder);
+    writeFile(kSettings, "http_port=\"many\"\n");
+    const Result result = run({"setup"});
+    EXPECT_EQ(result.exit, 9);
+    EXPECT_NE(result.err.find("http_port is [many]"), std::string::npos) << result.err;
+}
+
+TEST(NodeDatabase, OfTwoWritersOfOneAttributeTheLaterStays) {
+    ASSERT_EQ(run({"setup"}).exit, 0);
+    executeSql(
+        "INSERT INTO node_attr VALUES ('n', 'app', 'a', 'first'), ('n', 'app', 'a', 'second')");
+    EXPECT_EQ(querySql("SELECT value FROM node_attr"), "second\n");
+}
+
+TEST(NodeId, IsMadeAnewOnlyWhenItIsMeant) {
+    const std::string id = run({"node", "id"}).out;
+    EXPECT_EQ(run({"node", "id"}).out, id);
+    EXPECT_EQ(run({"node", "id", "--reset"}).exit, 2) << "nobody can be asked";
+    EXPECT_EQ(run({"node", "id"}).out, id);
+
+    Terminal hesitant({"node", "id", "--reset"});
+    ASSERT_TRUE(hesitant.shows("[y/N]"));
+    hesitant.type("\n");
+    EXPECT_EQ(hesitant.finish(), 1);
+    EXPECT_EQ(run({"node", "id"}).out, id);
+
+    EXPECT_NE(run({"node", "id", "--reset", "--yes"}).out, id);
+    EXPECT_NE(readFile(kIdentityFile)
+                  .find(run({"node", "id", "--json"}).json()["data"]["node_id"].asString()),
+              std::string::npos);
+}
+
+} // namespace OvradrTest

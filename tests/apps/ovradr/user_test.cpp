@@ -1,0 +1,167 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "cgi/account_store.h"
+#include "cgi/session_store.h"
+#include "cgi/totp.h"
+#include "program.h"
+
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+
+#include <csignal>
+
+namespace OvradrTest {
+
+namespace {
+
+using OvraPlatform::AccountStore;
+using OvraPlatform::LoginResult;
+using OvraPlatform::SessionStore;
+
+constexpr const char *kPassword = "correct horse";
+
+LoginResult logIn(const std::string &password) {
+    return AccountStore().verify("bob", password, "");
+}
+
+void addBob() {
+    ASSERT_EQ(run({"user", "add", "bob", "--password-stdin"}, std::string(kPassword) + "\n").exit,
+              0);
+}
+
+} // namespace
+
+TEST(User, LivesFromAddToRemove) {
+    EXPECT_EQ(run({"user", "list", "--json"}).json()["data"]["users"].size(), 0U);
+    ASSERT_EQ(
+        run({"user", "add", "bob", "--admin", "--password-stdin"}, "correct horse\nmore").exit, 0);
+    EXPECT_EQ(logIn("correct horse"), LoginResult::kOk);
+    const Json::Value users = run({"user", "list", "--json"}).json()["data"]["users"];
+    ASSERT_EQ(users.size(), 1U);
+    EXPECT_EQ(users[0]["name"], "bob");
+    EXPECT_TRUE(users[0]["administrator"].asBool());
+
+    EXPECT_EQ(run({"user", "add", "bob", "--password-stdin"}, "another one").exit, 1);
+    EXPECT_EQ(logIn("another one"), LoginResult::kWrong);
+    ASSERT_EQ(run({"user", "passwd", "bob", "--password-stdin"}, "another one\r\n").exit, 0);
+    EXPECT_EQ(logIn("another one"), LoginResult::kOk);
+
+    ASSERT_EQ(run({"user", "disable", "bob"}).exit, 0);
+    EXPECT_EQ(logIn("another one"), LoginResult::kDisabled);
+    ASSERT_EQ(run({"user", "disable", "bob", "--off"}).exit, 0);
+    EXPECT_EQ(logIn("another one"), LoginResult::kOk);
+
+    ASSERT_EQ(run({"user", "remove", "bob"}).exit, 0);
+    EXPECT_EQ(logIn("another one"), LoginResult::kWrong);
+    for (const char *verb : {"passwd", "totp", "disable", "remove"}) {
+        EXPECT_EQ(run({"user", verb, "bob"}).exit, 7) << verb;
+    }
+}
+
+TEST(User, WhoIsRemovedLosesHisSessionsAndNobodyElseDoes) {
+    addBob();
+    SessionStore sessions;
+    const auto his = sessions.create({.user = "bob", .app = "Tidewater", .timeout = -1});
+    const auto hers = sessions.create({.user = "bobby", .app = "Tidewater", .timeout = -1});
+    ASSERT_TRUE(his && hers);
+    ASSERT_EQ(run({"user", "disable", "bob"}).exit, 0);
+    EXPECT_TRUE(sessions.find(*his)) << "pairings live on when the account is enabled again";
+    const Result result = run({"user", "remove", "bob"});
+    EXPECT_EQ(result.exit, 0) << result.err;
+    EXPECT_FALSE(sessions.find(*his));
+    EXPECT_TRUE(sessions.find(*hers));
+    EXPECT_EQ((result.out + result.err).find(*his), std::string::npos);
+}
+
+TEST(User, TheSecretOfOneTimeCodesIsShownOnlyWhereItIsAskedFor) {
+    addBob();
+    EXPECT_EQ(run({"user", "totp", "bob"}).exit, 2) << "the output is not a terminal";
+    EXPECT_EQ(logIn(kPassword), LoginResult::kOk) << "and nothing was switched on";
+
+    const Json::Value shown = run({"user", "totp", "bob", "--show", "--json"}).json()["data"];
+    EXPECT_EQ(logIn(kPassword), LoginResult::kCodeRequired);
+    const std::string secret = shown["secret"].asString();
+    EXPECT_EQ(OvraPlatform::normalizeTotpSecret(secret), secret);
+    EXPECT_NE(shown["uri"].asString().find("secret=" + secret + "&"), std::string::npos);
+
+    EXPECT_EQ(run({"user", "totp", "bob", "--show"}).exit, 1) << "a second one would lock bob out";
+    for (const Arguments &arguments : {Arguments{"user", "list"}, {"user", "list", "--json"}}) {
+        EXPECT_EQ(run(arguments).out.find(secret), std::string::npos);
+    }
+    ASSERT_EQ(run({"user", "totp", "bob", "--off"}).exit, 0);
+    EXPECT_EQ(logIn(kPassword), LoginResult::kOk);
+}
+
+TEST(Password, IsTypedTwiceAndNotEchoed) {
+    Terminal terminal({"user", "add", "bob"});
+    ASSERT_TRUE(terminal.shows("Password of bob: "));
+    EXPECT_FALSE(terminal.echoes());
+    terminal.type("correct horse\n");
+    ASSERT_TRUE(terminal.shows("Again: "));
+    terminal.type("correct horse\n");
+    EXPECT_EQ(terminal.finish(), 0) << terminal.screen();
+    EXPECT_TRUE(terminal.echoes());
+    EXPECT_EQ(terminal.screen().find("horse"), std::string::npos) << terminal.screen();
+    EXPECT_EQ(logIn(kPassword), LoginResult::kOk);
+}
+
+TEST(Password, ThatIsTypedDifferentlyTheSecondTimeIsRefused) {
+    Terminal terminal({"user", "add", "bob"});
+    ASSERT_TRUE(terminal.shows("Password of bob: "));
+    terminal.type("correct horse\n");
+    ASSERT_TRUE(terminal.shows("Again: "));
+    terminal.type("correct hors\n");
+    EXPECT_EQ(terminal.finish(), 1);
+    EXPECT_EQ(logIn(kPassword), LoginResult::kWrong);
+}
+
+TEST(Password, TheEchoComesBackWhenThePromptIsInterrupted) {
+    Terminal terminal({"user", "add", "bob"});
+    ASSERT_TRUE(terminal.shows("Password of bob: "));
+    EXPECT_FALSE(terminal.echoes());
+    terminal.type("corr\x03"); // Ctrl-C
+    EXPECT_EQ(terminal.finish(), -SIGINT);
+    EXPECT_TRUE(terminal.echoes());
+}
+
+TEST(Password, FromAFileIsItsFirstLine) {
+    writeFile("/tmp/ovradr_test_password", "correct horse\nnot this\n");
+    const Result warned =
+        run({"user", "add", "bob", "--password-file", "/tmp/ovradr_test_password"});
+    EXPECT_EQ(warned.exit, 0) << warned.err;
+    EXPECT_EQ(logIn(kPassword), LoginResult::kOk);
+    EXPECT_NE(warned.err.find("everybody can read"), std::string::npos);
+    chmod("/tmp/ovradr_test_password", 0600);
+    EXPECT_EQ(run({"user", "passwd", "bob", "--password-file", "/tmp/ovradr_test_password"}).err,
+              "");
+}
+
+TEST(Password, IsRefusedWhenItCannotBeRead) {
+    const struct {
+        const char *what;
+        Arguments arguments;
+        std::string input;
+        int exit;
+    } cases[] = {
+        {"empty", {"--password-stdin"}, "", 1},
+        {"an empty line", {"--password-stdin"}, "\ncorrect horse\n", 1},
+        {"too short", {"--password-stdin"}, "short\n", 1},
+        {"too long", {"--password-stdin"}, std::string(1025, 'x') + "\n", 1},
+        {"no such file", {"--password-file", "/nowhere/at/all"}, "", 1},
+        {"a folder", {"--password-file", "/"}, "", 1},
+        {"nobody to ask", {}, "correct horse\n", 2},
+        {"two sources", {"--password-stdin", "--password-file", "/dev/null"}, "correct horse\n", 2},
+        {"as an argument", {"--password", "correct horse"}, "", 2},
+        {"as an argument", {"--password=correct horse"}, "", 2},
+        {"as a further argument", {"correct horse"}, "", 2},
+    };
+    for (const auto &each : cases) {
+        Arguments arguments{"user", "add", "bob"};
+        arguments.insert(arguments.end(), each.arguments.begin(), each.arguments.end());
+        const Result result = run(arguments, each.input);
+        EXPECT_EQ(result.exit, each.exit) << each.what << ": " << result.err;
+        EXPECT_EQ((result.out + result.err).find("horse"), std::string::npos) << result.err;
+        EXPECT_EQ(logIn(kPassword), LoginResult::kWrong) << each.what;
+    }
+}
+
+} // namespace OvradrTest

@@ -1,0 +1,90 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include "daemon.h"
+
+#include <gtest/gtest.h>
+#include <json/json.h>
+
+#include <memory>
+#include <string>
+
+namespace OvraTest {
+
+/// What came back from the web server.
+struct Reply {
+    long status = 0; ///< of HTTP; 0: no answer
+    std::string text;
+    Json::Value document;
+
+    /// The error code; 0 for a success, -1 when it is no reply document.
+    int code() const;
+    const Json::Value &data() const { return document["data"]; }
+};
+
+/// What an HTTP client does; by default it posts a form over TLS on a connection of its own.
+struct HttpCall {
+    std::string path = "/webapi/query.cgi";
+    std::string body;
+    std::string method = "POST";
+    std::string type = "application/x-www-form-urlencoded";
+    bool tls = true;
+    bool chunked = false;
+};
+
+/// A scene with an appliance that is set up, in the file system view of the test, and a daemon in
+/// this process that serves it on 127.0.0.1 at ports of its own.
+class Appliance : public testing::Test {
+public:
+    static constexpr char kPassword[] = "correct horse";
+
+    /// Makes what set-up makes. For scenes that need no daemon.
+    static void provision();
+    static void addAccount(const std::string &name, bool administrator);
+    /// A session without a log-in.
+    static std::string session(const std::string &user, int timeout = 3600);
+
+    int port(bool tls) const { return tls ? daemon_->httpsPort() : daemon_->httpPort(); }
+    Reply http(const HttpCall &call) const;
+    /// \param sid  "": none
+    Reply call(const std::string &api, int version, const std::string &method,
+               const Json::Value &params = Json::Value(), const std::string &sid = "",
+               bool tls = true) const;
+    Reply login(const std::string &account, const std::string &password,
+                const std::string &code = "") const;
+
+protected:
+    void SetUp() override;
+    void TearDown() override { daemon_.reset(); }
+    /// Starts the daemon anew.
+    void restart(const Ovradrd::HttpLimits &limits);
+    Ovradrd::Daemon &daemon() { return *daemon_; }
+
+private:
+    std::unique_ptr<Ovradrd::Daemon> daemon_;
+};
+
+/// A JSON object from its text.
+Json::Value json(const std::string &text);
+
+/// A plain TCP connection to 127.0.0.1.
+class RawConnection {
+public:
+    explicit RawConnection(int port);
+    RawConnection(RawConnection &&other) noexcept;
+    RawConnection(const RawConnection &) = delete;
+    ~RawConnection();
+
+    bool isOpen() const { return fd_ >= 0; }
+    /// False when the other end is gone.
+    bool send(const std::string &bytes) const;
+    /// What comes until the other end closes, or until `seconds` have passed.
+    std::string readAll(int seconds) const;
+    /// Whether the other end closes within `seconds`.
+    bool closesWithin(int seconds) const;
+
+private:
+    int fd_;
+};
+
+} // namespace OvraTest

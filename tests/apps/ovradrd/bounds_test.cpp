@@ -1,0 +1,191 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "appliance.h"
+#include "core/appliance.h"
+#include "gateway.h"
+#include "webapi/api_errors.h"
+
+#include <sys/resource.h>
+
+#include <condition_variable>
+#include <list>
+#include <mutex>
+#include <thread>
+
+namespace {
+
+using OvraTest::Appliance;
+using OvraTest::RawConnection;
+using namespace std::chrono_literals;
+
+constexpr char kGetInfo[] = "api=OVRA.Core.Encryption&version=1&method=getinfo";
+
+class Bounds : public Appliance {
+protected:
+    void SetUp() override {
+        rlimit limit{};
+        getrlimit(RLIMIT_NOFILE, &limit);
+        limit.rlim_cur = limit.rlim_max;
+        setrlimit(RLIMIT_NOFILE, &limit);
+        Appliance::SetUp();
+    }
+    /// Whether a call is answered in good time.
+    void expectQuickAnswer() {
+        const auto begun = std::chrono::steady_clock::now();
+        EXPECT_EQ(http({.body = kGetInfo}).code(), 0);
+        EXPECT_EQ(http({.body = kGetInfo, .tls = false}).code(), 0);
+        EXPECT_LT(std::chrono::steady_clock::now() - begun, 2s);
+    }
+};
+
+struct SlowScene {
+    const char *name;
+    bool tls;
+    const char *begin; ///< sent at once
+    char drip;         ///< then every 200 ms; NUL: nothing
+};
+
+class SlowClient : public Bounds, public testing::WithParamInterface<SlowScene> {};
+
+TEST_P(SlowClient, isCutOffWhenItsRequestTakesTooLong) {
+    Ovradrd::HttpLimits limits;
+    limits.connections.arriving = 1s;
+    restart(limits);
+    const RawConnection connection(port(GetParam().tls));
+    const auto begun = std::chrono::steady_clock::now();
+    connection.send(GetParam().begin);
+    while (connection.readAll(0).empty() && std::chrono::steady_clock::now() - begun < 5s) {
+        if (connection.closesWithin(1)) {
+            break;
+        }
+        if (GetParam().drip != '\0' && !connection.send(std::string(1, GetParam().drip))) {
+            break;
+        }
+    }
+    const auto time = std::chrono::steady_clock::now() - begun;
+    EXPECT_GE(time, 900ms);
+    EXPECT_LT(time, 4s);
+}
+
+INSTANTIATE_TEST_SUITE_P(
+    , SlowClient,
+    testing::Values(SlowScene{"saysNothing", false, "", '\0'},
+                    SlowScene{"shakesNoHands", true, "", '\0'},
+                    SlowScene{"dripsItsHeader", false,
+                              "POST /webapi/query.cgi HTTP/1.1\r\nX: ", 'a'},
+                    SlowScene{"dripsItsBody", false,
+                              "POST /webapi/query.cgi HTTP/1.1\r\nHost: a\r\nContent-Type: "
+                              "application/x-www-form-urlencoded\r\nContent-Length: 1000\r\n\r\n",
+                              'a'}),
+    [](const auto &scene) { return std::string(scene.param.name); });
+
+TEST_F(Bounds, leave500SlowConnectionsNoInfluence) {
+    std::list<RawConnection> slow;
+    for (int i = 0; i < 500; ++i) {
+        slow.emplace_back(port(i % 2 == 0));
+        ASSERT_TRUE(slow.back().isOpen());
+        if (i % 2 != 0) {
+            slow.back().send("POST /webapi/query.cgi HTTP/1.1\r\nX: a");
+        }
+    }
+    for (int i = 0; i < 5; ++i) {
+        expectQuickAnswer();
+    }
+    for (const RawConnection &connection : slow) {
+        EXPECT_EQ(connection.readAll(0), "");
+        EXPECT_TRUE(connection.send("a"));
+    }
+}
+
+TEST_F(Bounds, holdWhenMoreConnectionsComeThanThereMayBe) {
+    std::list<RawConnection> flood;
+    for (int i = 0; i < 1500; ++i) {
+        flood.emplace_back(port(i % 2 == 0));
+    }
+    expectQuickAnswer();
+}
+
+/// A registry with one call that waits and one that does not.
+class FullLanes : public testing::Test {
+protected:
+    FullLanes() {
+        using OvraPlatform::APILane;
+        using OvraPlatform::APIRight;
+        registry.add("Test", 1, "wait", APIRight::kNone, APILane::kSlow,
+                     [this](const Json::Value &, const OvraPlatform::APICaller &) {
+                         std::unique_lock lock(mutex);
+                         changed.wait(lock, [this] { return open; });
+                         return OvraPlatform::apiSuccess();
+                     });
+        registry.add("Test", 1, "quick", APIRight::kNone, APILane::kQuick,
+                     [](const Json::Value &, const OvraPlatform::APICaller &) {
+                         return OvraPlatform::apiSuccess();
+                     });
+        std::string why;
+        Appliance::provision();
+        keys = OvraPlatform::SealKeyPair::load(OvraPlatform::kSealKeyFile, why);
+        gateway.emplace(registry, *keys, guard, desk, *lanes);
+    }
+    void serve(const std::string &method) {
+        gateway->serve({"api=Test&version=1&method=" + method, "127.0.0.1", true},
+                       [this](const std::string &document) {
+                           const std::lock_guard lock(mutex);
+                           ++replies[OvraTest::json(document)["error"]["code"].asInt()];
+                           changed.notify_all();
+                       });
+    }
+    /// Whether so many replies had this code within some seconds.
+    bool gets(int code, int count) {
+        std::unique_lock lock(mutex);
+        return changed.wait_for(lock, 5s, [&] { return replies[code] >= count; });
+    }
+
+    std::mutex mutex;
+    std::condition_variable changed;
+    bool open = false;
+    std::map<int, int> replies;
+    OvraPlatform::APIRegistry registry;
+    std::optional<OvraPlatform::SealKeyPair> keys;
+    OvraPlatform::ReplayGuard guard;
+    Ovradrd::LoginDesk desk;
+    std::optional<Ovradrd::Gateway> gateway;
+    std::optional<Ovradrd::Lanes> lanes{std::in_place};
+};
+
+TEST_F(FullLanes, refuseAtOnceAndDoNotHoldUpQuickCalls) {
+    for (int i = 0; i < 16 + 64 + 5; ++i) {
+        serve("wait");
+    }
+    EXPECT_TRUE(gets(107, 5));
+    serve("quick");
+    EXPECT_TRUE(gets(0, 1));
+    {
+        const std::lock_guard lock(mutex);
+        open = true;
+    }
+    changed.notify_all();
+    EXPECT_TRUE(gets(0, 16 + 64 + 1));
+    EXPECT_EQ(replies[107], 5);
+    lanes.reset();
+}
+
+TEST_F(FullLanes, letLocalCallersGoWhenTheDaemonStops) {
+    OvraPlatform::LocalCall call;
+    call.api = "Test";
+    call.version = 1;
+    call.method = "wait";
+    call.user = "admin";
+    std::thread stopper([this] {
+        std::this_thread::sleep_for(200ms);
+        gateway->leaveLocal();
+    });
+    EXPECT_EQ(gateway->serveLocal(call)["error"]["code"], 107);
+    stopper.join();
+    {
+        const std::lock_guard lock(mutex);
+        open = true;
+    }
+    changed.notify_all();
+    lanes.reset();
+}
+
+} // namespace

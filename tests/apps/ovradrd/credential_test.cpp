@@ -1,0 +1,251 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "appliance.h"
+#include "core/appliance.h"
+#include "platform/own_files.h"
+#include "support/local_node.h"
+#include "support/remote_node.h"
+
+namespace {
+
+using OvraTest::Appliance;
+using OvraTest::json;
+using OvraTest::querySql;
+using OvraTest::Reply;
+
+/// The appliance, and another node "n1" that grants what it is asked for.
+class Credential : public Appliance {
+protected:
+    void SetUp() override {
+        Appliance::SetUp();
+        OvraTest::writeFile(OvraPlatform::kConfigFile, "address=\"127.0.0.1\"\n");
+        addAccount("root", true);
+        sid = session("root");
+        remote.answer("login", R"({"success":true,"data":{"sid":"login-sid"}})");
+        remote.answer("info", R"({"success":true,"data":{"node_id":"n1","serial":"S1"}})");
+        remote.answer("login-sid create", R"({"success":true,"data":{"session":"granted"}})");
+        remote.answer("temp_create", R"({"success":true,"data":{"session":"temporary"}})");
+        remote.answer("get", R"({"success":true,"data":{"account":"joe"}})");
+        // What it answers over the credential to it.
+        remote.answer("granted create",
+                      R"({"success":true,"data":{"src_cred":{"cred_id":"back"}}})");
+        remote.answer("granted test_connection",
+                      R"({"success":true,"data":{"addr":"10.0.0.1","protocol":"https","port":1}})");
+    }
+    Reply ask(const std::string &method, const Json::Value &params) const {
+        return call("OVRA.DR.Node.Credential", 1, method, params, sid);
+    }
+    Json::Value conn() const {
+        Json::Value value = json(R"({"addr":"127.0.0.1","protocol":"https"})");
+        value["port"] = remote.port();
+        return value;
+    }
+    Json::Value byAccount() const {
+        Json::Value params =
+            json(R"({"auth":"account","account":"joe","password":"secret","otpcode":"123456"})");
+        params["conn"] = conn();
+        params["cred_direction"] = "unidirection";
+        return params;
+    }
+    /// Makes a credential and returns its id.
+    std::string make() const {
+        return ask("create", byAccount()).data()["src_cred"]["cred_id"].asString();
+    }
+    static Json::Value credId(const std::string &id) {
+        Json::Value params;
+        params["cred_id"] = id;
+        return params;
+    }
+    static std::string rows(const std::string &table) {
+        return querySql("SELECT node_id, session FROM " + table);
+    }
+
+    OvraTest::RemoteNode remote;
+    std::string sid;
+};
+
+TEST_F(Credential, isMadeByALogIn) {
+    const Reply reply = ask("create", byAccount());
+    ASSERT_EQ(reply.code(), 0) << reply.text;
+    EXPECT_EQ(reply.data()["src_cred"]["node_id"], "n1");
+    EXPECT_EQ(reply.data()["src_cred"]["port"], remote.port());
+    EXPECT_EQ(rows("node_cred"), "n1|granted\n");
+    EXPECT_EQ(json(remote.params("login")),
+              json(R"({"account":"joe","passwd":"secret","otp_code":"123456"})"));
+    EXPECT_EQ(reply.text.find("granted"), std::string::npos);
+}
+
+TEST_F(Credential, isMadeByASessionOrByAnotherCredential) {
+    Json::Value params = json(R"({"auth":"session","session":"login-sid"})");
+    params["conn"] = conn();
+    params["cred_direction"] = "unidirection";
+    const Reply first = ask("create", params);
+    ASSERT_EQ(first.code(), 0) << first.text;
+
+    remote.answer("granted create", R"({"success":true,"data":{"session":"granted"}})");
+    params = credId(first.data()["src_cred"]["cred_id"].asString());
+    params["auth"] = "cred_id";
+    params["cred_direction"] = "unidirection";
+    EXPECT_EQ(ask("create", params).code(), 0);
+    EXPECT_EQ(rows("node_cred"), "n1|granted\nn1|granted\n");
+}
+
+TEST_F(Credential, passesTheReasonOfARefusalOn) {
+    remote.answer("login", R"({"success":false,"error":{"code":403}})");
+    EXPECT_EQ(ask("create", byAccount()).code(), 504);
+    remote.server.refuse();
+    EXPECT_EQ(ask("create", byAccount()).code(), 500);
+    EXPECT_EQ(rows("node_cred"), "");
+}
+
+TEST_F(Credential, isAskedForWithEveryParameterItsProofNeeds) {
+    for (const char *missing : {"auth", "account", "password", "conn", "cred_direction"}) {
+        Json::Value params = byAccount();
+        params.removeMember(missing);
+        const Reply reply = ask("create", params);
+        EXPECT_EQ(reply.code(), 106) << missing;
+        EXPECT_EQ(reply.document["error"]["msg"]["param"], missing);
+    }
+    EXPECT_EQ(remote.calls(), "");
+}
+
+TEST_F(Credential, inBothDirectionsIsMadeThereAndBack) {
+    Json::Value params = byAccount();
+    params["cred_direction"] = "bidirection";
+    const Reply reply = ask("create", params);
+    ASSERT_EQ(reply.code(), 0) << reply.text;
+    EXPECT_EQ(reply.data()["src_cred"]["node_id"], "n1");
+    EXPECT_EQ(reply.data()["dst_cred"], json(R"({"cred_id":"back"})"));
+    const Json::Value asked = json(remote.params("create"));
+    EXPECT_EQ(asked["cred_direction"], "unidirection");
+    EXPECT_EQ(asked["conn"]["addr"], "10.0.0.1");
+}
+
+TEST_F(Credential, inBothDirectionsIsNotBegunWithoutAnAddressOfOnesOwn) {
+    OvraTest::writeFile(OvraPlatform::kConfigFile, "");
+    Json::Value params = byAccount();
+    params["cred_direction"] = "bidirection";
+    EXPECT_EQ(ask("create", params).code(), 401);
+    EXPECT_EQ(remote.calls(), "");
+}
+
+TEST_F(Credential, inBothDirectionsLeavesNothingWhenTheWayBackFails) {
+    remote.answer("granted create", R"({"success":false,"error":{"code":500,"msg":"m"}})");
+    Json::Value params = byAccount();
+    params["cred_direction"] = "bidirection";
+    EXPECT_EQ(ask("create", params).code(), 500);
+    EXPECT_EQ(rows("node_cred"), "");
+    EXPECT_NE(remote.calls().find("granted delete"), std::string::npos);
+}
+
+TEST_F(Credential, thatIsTemporaryStandsInATableOfItsOwn) {
+    Json::Value params = byAccount();
+    params.removeMember("cred_direction");
+    const Reply reply = ask("temp_create", params);
+    ASSERT_EQ(reply.code(), 0) << reply.text;
+    EXPECT_EQ(reply.data()["node_id"], "n1");
+    EXPECT_EQ(rows("temp_cred"), "n1|temporary\n");
+
+    EXPECT_EQ(ask("delete", credId(reply.data()["cred_id"].asString())).code(), 0);
+    EXPECT_EQ(rows("temp_cred"), "");
+    EXPECT_NE(remote.calls().find("temporary delete"), std::string::npos);
+}
+
+TEST_F(Credential, isOnlyTriedByATest) {
+    Json::Value params = byAccount();
+    EXPECT_EQ(ask("test_create", params).code(), 0);
+    remote.answer("login-sid get", R"({"success":false,"error":{"code":106}})");
+    EXPECT_EQ(ask("test_create", params).code(), 106);
+    EXPECT_EQ(rows("node_cred"), "");
+}
+
+TEST_F(Credential, isListedAndShownWithoutItsSession) {
+    const std::string id = make();
+    OvraTest::addCred("temp_cred", "n2", "c2", "https", 1, "s");
+    const Reply list = ask("list", {});
+    ASSERT_EQ(list.data()["creds"].size(), 2U);
+    EXPECT_EQ(list.data()["creds"][0]["cred_id"], id);
+    EXPECT_EQ(list.data()["creds"][0]["temporary"], false);
+    EXPECT_EQ(list.data()["creds"][1]["temporary"], true);
+    EXPECT_EQ(list.text.find("granted"), std::string::npos);
+    EXPECT_EQ(ask("list", json(R"({"node_id":"n1"})")).data()["creds"].size(), 1U);
+    EXPECT_EQ(ask("get", credId(id)).data()["node_id"], "n1");
+}
+
+TEST_F(Credential, isChangedByANewLogIn) {
+    Json::Value params = credId(make());
+    params["account"] = "joe";
+    params["password"] = "other";
+    for (const std::string &member : conn().getMemberNames()) {
+        params[member] = conn()[member];
+    }
+    remote.answer("login-sid create", R"({"success":true,"data":{"session":"renewed"}})");
+    EXPECT_EQ(ask("test_set", params).code(), 0);
+    EXPECT_EQ(rows("node_cred"), "n1|granted\n");
+    EXPECT_EQ(ask("set", params).code(), 0);
+    EXPECT_EQ(rows("node_cred"), "n1|renewed\n");
+    EXPECT_NE(remote.calls().find("granted delete"), std::string::npos);
+    params["cred_id"] = "none";
+    EXPECT_EQ(ask("set", params).code(), 404);
+}
+
+TEST_F(Credential, isDeletedAlsoWhenItsNodeIsGone) {
+    const std::string id = make();
+    remote.server.refuse();
+    EXPECT_EQ(ask("delete", credId(id)).code(), 0);
+    EXPECT_EQ(rows("node_cred"), "");
+    EXPECT_EQ(ask("delete", credId(id)).code(), 0);
+}
+
+TEST_F(Credential, isAskedBackFromItsNode) {
+    Json::Value params = credId(make());
+    EXPECT_EQ(ask("test_reverse_create", params).code(), 0);
+    EXPECT_EQ(ask("reverse_create", params).data()["dst_cred"], json(R"({"cred_id":"back"})"));
+    remote.answer("granted temp_create", R"({"success":true,"data":{"cred_id":"temp-back"}})");
+    params["conn"] = json(R"({"addr":"10.9.9.9","protocol":"https","port":7})");
+    EXPECT_EQ(ask("temp_reverse_create", params).data()["dst_cred"],
+              json(R"({"cred_id":"temp-back"})"));
+    EXPECT_EQ(json(remote.params("test_connection"))["conns"][0]["addr"], "10.9.9.9");
+}
+
+TEST_F(Credential, doesNotReachTheNodeItself) {
+    const std::string self = call("OVRA.DR.Node", 1, "info", {}, sid).data()["node_id"].asString();
+    for (const char *method : {"get", "delete", "reverse_create"}) {
+        EXPECT_EQ(ask(method, credId(self)).code(), 106) << method;
+    }
+}
+
+class Relay : public Credential {
+protected:
+    void SetUp() override {
+        Credential::SetUp();
+        params = credId(make());
+        params["webapi"] =
+            json(R"({"api":"OVRA.DR.Node","version":1,"method":"relayed","params":{"a":1}})");
+    }
+    Json::Value params;
+};
+
+TEST_F(Relay, carriesTheRequestAndItsAnswer) {
+    remote.answer("granted relayed", R"({"success":true,"data":{"b":2}})");
+    EXPECT_EQ(ask("relay", params).data(), json(R"({"b":2})"));
+    EXPECT_EQ(remote.params("relayed"), R"({"a":1})");
+}
+
+TEST_F(Relay, carriesTheRefusal) {
+    for (const int code : {105, 119, 404}) {
+        remote.answer("granted relayed", R"({"success":false,"error":{"code":)" +
+                                             std::to_string(code) + R"(,"msg":"m"}})");
+        EXPECT_EQ(ask("relay", params).code(), code);
+    }
+}
+
+TEST_F(Relay, goesNoFurtherThanOneNode) {
+    params["webapi"]["api"] = "OVRA.DR.Node.Credential";
+    params["webapi"]["method"] = "relay";
+    EXPECT_EQ(ask("relay", params).code(), 106);
+    params["webapi"] = json(R"({"api":"","version":1,"method":"m","params":{}})");
+    EXPECT_EQ(ask("relay", params).code(), 106);
+    EXPECT_EQ(remote.calls().find("relay"), std::string::npos);
+}
+
+} // namespace

@@ -1,0 +1,157 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "appliance.h"
+
+#include <arpa/inet.h>
+#include <openssl/ssl.h>
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include <memory>
+
+namespace {
+
+using OvraTest::Appliance;
+using OvraTest::HttpCall;
+using OvraTest::RawConnection;
+using OvraTest::Reply;
+
+constexpr char kGetInfo[] = "api=OVRA.Core.Encryption&version=1&method=getinfo";
+
+struct Scene {
+    const char *name;
+    HttpCall call;
+    long status;
+    int code;
+};
+
+const std::string kTwoMegabytes(2'000'000, 'x');
+
+const Scene kScenes[] = {
+
+    {"call", {.body = kGetInfo}, 200, 0},
+    {"callOverPlainHttp", {.body = kGetInfo, .tls = false}, 200, 0},
+    {"callInChunks", {.body = kGetInfo, .chunked = true}, 200, 0},
+    {"typeWithCharset",
+     {.body = kGetInfo, .type = "application/x-www-form-urlencoded; charset=utf-8"},
+     200,
+     0},
+    {"probe", {.method = "GET"}, 200, 101},
+    {"otherMethod", {.method = "PUT"}, 405, 101},
+    {"otherPath", {.path = "/", .method = "GET"}, 404, 101},
+    {"fileOnDisk", {.path = "/webapi/../../../etc/passwd", .method = "GET"}, 404, 101},
+    {"entryPointWithMore", {.path = "/webapi/query.cgi/x", .body = kGetInfo}, 404, 101},
+    {"upload", {.body = "--x--", .type = "multipart/form-data; boundary=x"}, 200, 101},
+    {"json", {.body = "{}", .type = "application/json"}, 200, 101},
+    {"emptyBody", {}, 200, 101},
+    {"noForm", {.body = "%%%"}, 200, 101},
+    {"tooLarge", {.body = kTwoMegabytes}, 200, 108},
+    {"tooLargeInChunks", {.body = kTwoMegabytes, .chunked = true}, 200, 108},
+    {"longName", {.body = "api=" + std::string(200, 'a') + "&version=1&method=m"}, 200, 101}};
+
+class Wire : public Appliance {};
+
+TEST_F(Wire, answersEverythingWithADocument) {
+    for (const Scene &scene : kScenes) {
+        const Reply reply = http(scene.call);
+        EXPECT_EQ(reply.status, scene.status) << scene.name;
+        EXPECT_EQ(reply.code(), scene.code) << scene.name << reply.text;
+    }
+}
+
+TEST_F(Wire, survivesRubbish) {
+    std::string rubbish;
+    for (int i = 0; i < 100'000; ++i) {
+        rubbish += static_cast<char>(i * 7919 % 256);
+    }
+    for (const bool tls : {true, false}) {
+        for (const std::string &bytes :
+             {rubbish, std::string(100'000, '\0'), std::string("GET / HTTP/9.9\r\n\r\n"),
+              "GET / HTTP/1.1\r\nX: " + std::string(100'000, 'a'),
+              std::string(
+                  "POST /webapi/query.cgi HTTP/1.1\r\nHost: a\r\nContent-Length: -5\r\n\r\n"),
+              std::string("POST /webapi/query.cgi HTTP/1.1\r\nHost: a\r\n"
+                          "Content-Type: application/x-www-form-urlencoded\r\n"
+                          "Transfer-Encoding: chunked\r\n\r\nzz\r\n")}) {
+            const RawConnection connection(port(tls));
+            connection.send(bytes);
+            EXPECT_TRUE(connection.closesWithin(5)) << bytes.substr(0, 60);
+        }
+    }
+    EXPECT_EQ(http({.body = kGetInfo}).code(), 0);
+}
+
+TEST_F(Wire, keepsAConnectionForFurtherRequests) {
+    const RawConnection connection(port(false));
+    const std::string request = "POST /webapi/query.cgi HTTP/1.1\r\nHost: a\r\n"
+                                "Content-Type: application/x-www-form-urlencoded\r\n"
+                                "Content-Length: " +
+                                std::to_string(sizeof(kGetInfo) - 1) + "\r\n\r\n" + kGetInfo;
+    connection.send(request + request);
+    const std::string replies = connection.readAll(1);
+    const std::size_t first = replies.find("public_key");
+    ASSERT_NE(first, std::string::npos);
+    EXPECT_NE(replies.find("public_key", first + 1), std::string::npos);
+}
+
+struct FreeContext {
+    void operator()(SSL_CTX *context) const { SSL_CTX_free(context); }
+};
+struct FreeSsl {
+    void operator()(SSL *ssl) const { SSL_free(ssl); }
+};
+struct FreeSession {
+    void operator()(SSL_SESSION *session) const { SSL_SESSION_free(session); }
+};
+using Session = std::unique_ptr<SSL_SESSION, FreeSession>;
+
+/// One request over TLS of exactly this version.
+struct TlsVisit {
+    TlsVisit(int port, int version, SSL_SESSION *offered) {
+        const std::unique_ptr<SSL_CTX, FreeContext> context(SSL_CTX_new(TLS_client_method()));
+        SSL_CTX_set_security_level(context.get(), 0);
+        SSL_CTX_set_min_proto_version(context.get(), version);
+        SSL_CTX_set_max_proto_version(context.get(), version);
+        const std::unique_ptr<SSL, FreeSsl> ssl(SSL_new(context.get()));
+        sockaddr_in address{};
+        address.sin_family = AF_INET;
+        address.sin_port = htons(static_cast<std::uint16_t>(port));
+        address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+        const int fd = socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0);
+        SSL_set_fd(ssl.get(), fd);
+        if (offered != nullptr) {
+            SSL_set_session(ssl.get(), offered);
+        }
+        connected = connect(fd, reinterpret_cast<sockaddr *>(&address), sizeof(address)) == 0 &&
+                    SSL_connect(ssl.get()) == 1;
+        if (connected) {
+            constexpr char kRequest[] = "GET /webapi/query.cgi HTTP/1.1\r\nHost: a\r\n\r\n";
+            char reply[512];
+            SSL_write(ssl.get(), kRequest, sizeof(kRequest) - 1);
+            SSL_read(ssl.get(), reply, sizeof(reply));
+            resumed = SSL_session_reused(ssl.get()) == 1;
+            session.reset(SSL_get1_session(ssl.get()));
+            SSL_shutdown(ssl.get());
+        }
+        close(fd);
+    }
+
+    bool connected = false;
+    bool resumed = false;
+    Session session;
+};
+
+TEST_F(Wire, resumesTlsSessions) {
+    for (const int version : {TLS1_2_VERSION, TLS1_3_VERSION}) {
+        const TlsVisit first(port(true), version, nullptr);
+        ASSERT_TRUE(first.connected);
+        EXPECT_FALSE(first.resumed);
+        EXPECT_TRUE(TlsVisit(port(true), version, first.session.get()).resumed) << version;
+    }
+}
+
+TEST_F(Wire, speaksNoOldTls) {
+    EXPECT_FALSE(TlsVisit(port(true), TLS1_1_VERSION, nullptr).connected);
+    EXPECT_TRUE(TlsVisit(port(true), TLS1_2_VERSION, nullptr).connected);
+}
+
+} // namespace

@@ -1,0 +1,128 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "appliance.h"
+#include "cgi/account_store.h"
+#include "cgi/session_store.h"
+#include "cgi/totp.h"
+#include "support/log_capture.h"
+
+#include <liboath/oath.h>
+
+#include <array>
+#include <chrono>
+#include <future>
+#include <thread>
+#include <vector>
+
+namespace {
+
+using OvraPlatform::AccountStore;
+using OvraTest::Appliance;
+using OvraTest::Reply;
+
+class Login : public Appliance {};
+
+/// What an authenticator shows now.
+std::string codeOf(const std::string &secret) {
+    char *key = nullptr;
+    std::size_t size = 0;
+    std::array<char, 7> code{};
+    if (oath_base32_decode(secret.data(), secret.size(), &key, &size) == OATH_OK) {
+        oath_totp_generate(key, size, std::time(nullptr), 30, 0, 6, code.data());
+        free(key);
+    }
+    return code.data();
+}
+
+TEST_F(Login, givesASessionOfHalfAnHourThatWorksUntilLogout) {
+    addAccount("alice", true);
+    const Reply granted = login("alice", kPassword);
+    ASSERT_EQ(granted.code(), 0) << granted.text;
+    const std::string sid = granted.data()["sid"].asString();
+    const auto record = OvraPlatform::SessionStore().find(sid);
+    ASSERT_TRUE(record);
+    EXPECT_EQ(record->user, "alice");
+    EXPECT_EQ(record->app, "ovradrd");
+    EXPECT_EQ(record->remote, "127.0.0.1");
+    EXPECT_EQ(record->expires.value_or(0) - record->created, 1800);
+
+    EXPECT_EQ(call("OVRA.DR.Node", 1, "test_privilege", {}, sid).code(), 0);
+    EXPECT_EQ(call("OVRA.Core.Auth", 1, "logout", {}, sid).code(), 0);
+    EXPECT_EQ(call("OVRA.DR.Node", 1, "test_privilege", {}, sid).code(), 119);
+    EXPECT_EQ(call("OVRA.Core.Auth", 1, "logout", {}, sid).code(), 119);
+}
+
+TEST_F(Login, tellsWhyItRefusesOnlyToWhoKnowsThePassword) {
+    for (const char *name : {"plain", "disabled", "local", "coded"}) {
+        addAccount(name, false);
+    }
+    AccountStore accounts;
+    ASSERT_TRUE(accounts.setDisabled("disabled", true));
+    ASSERT_TRUE(accounts.setRemoteLogin("local", false));
+    const std::string secret = OvraPlatform::newTotpSecret();
+    ASSERT_TRUE(accounts.setTotp("coded", secret));
+
+    EXPECT_EQ(login("nobody", kPassword).code(), 400);
+    EXPECT_EQ(login("plain", "wrong password").code(), 400);
+    EXPECT_EQ(login("disabled", "wrong password").code(), 400);
+    EXPECT_EQ(login("disabled", kPassword).code(), 401);
+    restart({}); // the throttle starts anew
+    EXPECT_EQ(login("local", kPassword).code(), 402);
+    EXPECT_EQ(login("coded", kPassword).code(), 403);
+    EXPECT_EQ(login("coded", kPassword, "000000").code(), 404);
+    const std::string code = codeOf(secret);
+    EXPECT_EQ(login("coded", kPassword, code).code(), 0);
+    EXPECT_EQ(login("coded", kPassword, code).code(), 404) << "a code counts once";
+}
+
+TEST_F(Login, refusesParametersThatAreNoLogIn) {
+    for (const char *params :
+         {R"({})", R"({"account":"a"})", R"({"account":7,"passwd":"x"})",
+          R"({"account":"a","passwd":"x","otp_code":7})", R"({"account":"a\n","passwd":"x"})"}) {
+        EXPECT_EQ(call("OVRA.Core.Auth", 1, "login", OvraTest::json(params)).code(), 106) << params;
+    }
+    Json::Value huge;
+    huge["account"] = std::string(500'000, 'a');
+    huge["passwd"] = "x";
+    EXPECT_EQ(call("OVRA.Core.Auth", 1, "login", huge).code(), 106);
+}
+
+TEST_F(Login, slowsGuessesDownWhileOthersAreServed) {
+    addAccount("alice", false);
+    for (int i = 0; i < 4; ++i) {
+        EXPECT_EQ(login("alice", "wrong password").code(), 400);
+    }
+    const std::string sid = session("alice");
+    const auto begun = std::chrono::steady_clock::now();
+    std::vector<std::future<Reply>> guesses;
+    for (int i = 0; i < 3; ++i) {
+        guesses.push_back(
+            std::async(std::launch::async, [this] { return login("alice", "wrong password"); }));
+    }
+    std::this_thread::sleep_for(std::chrono::milliseconds(50));
+    EXPECT_EQ(call("OVRA.DR.Node", 1, "info", {}, sid).code(), 0);
+    EXPECT_LT(std::chrono::steady_clock::now() - begun, std::chrono::milliseconds(500));
+    for (auto &guess : guesses) {
+        EXPECT_EQ(guess.get().code(), 400);
+    }
+    EXPECT_GT(std::chrono::steady_clock::now() - begun, std::chrono::milliseconds(1500));
+}
+
+TEST_F(Login, writesNoSecretToTheLog) {
+    const LogCapture log;
+    addAccount("alice", false);
+    AccountStore().setTotp("alice", OvraPlatform::newTotpSecret());
+    login("alice", kPassword, "135790");
+    login("alice", "another password");
+    login("my password\ttyped here", "x");
+    AccountStore().clearTotp("alice");
+    const Reply granted = login("alice", kPassword);
+    ASSERT_EQ(granted.code(), 0);
+    for (const std::string &secret :
+         {std::string(kPassword), std::string("135790"), std::string("another password"),
+          std::string("typed here"), granted.data()["sid"].asString()}) {
+        EXPECT_EQ(log.count(secret), 0) << secret;
+    }
+    EXPECT_EQ(log.count("[alice] logged in from [127.0.0.1]"), 1);
+}
+
+} // namespace

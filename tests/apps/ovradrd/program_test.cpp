@@ -1,0 +1,214 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "appliance.h"
+#include "core/appliance.h"
+#include "credential/wire_form.h"
+#include "ovrawebapi/api_runner.h"
+#include "platform/own_files.h"
+#include "support/local_node.h"
+#include "support/misbehaving_server.h"
+
+#include <fcntl.h>
+#include <sys/wait.h>
+
+#include <chrono>
+#include <csignal>
+#include <filesystem>
+#include <thread>
+
+namespace {
+
+using OvraTest::Appliance;
+using OvraTest::json;
+using namespace std::chrono_literals;
+
+/// The real program, in a process of its own.
+class Program {
+public:
+    explicit Program(std::vector<std::string> arguments = {}) {
+        int ends[2];
+        if (pipe2(ends, O_CLOEXEC) != 0) {
+            return;
+        }
+        pid_ = fork();
+        if (pid_ == 0) {
+            dup2(ends[1], STDOUT_FILENO);
+            dup2(ends[1], STDERR_FILENO);
+            // A daemon that is left by calls under way leaves their threads, on purpose.
+            setenv("TSAN_OPTIONS", "report_thread_leaks=0", 1);
+            arguments.insert(arguments.begin(), OVRADRD_PROGRAM);
+            std::vector<char *> argv;
+            for (std::string &argument : arguments) {
+                argv.push_back(argument.data());
+            }
+            argv.push_back(nullptr);
+            execv(OVRADRD_PROGRAM, argv.data());
+            _exit(127);
+        }
+        close(ends[1]);
+        output_ = fdopen(ends[0], "r");
+    }
+    Program(const Program &) = delete;
+    ~Program() {
+        if (pid_ > 0) {
+            kill(pid_, SIGKILL);
+            waitpid(pid_, nullptr, 0);
+        }
+        fclose(output_);
+    }
+
+    std::string line() {
+        char text[512] = "";
+        return fgets(text, sizeof(text), output_) != nullptr ? text : "";
+    }
+    void signal(int number) const { kill(pid_, number); }
+    /// The exit code; -1 when a signal ended it.
+    int wait() {
+        int status = 0;
+        waitpid(pid_, &status, 0);
+        pid_ = -1;
+        return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+    }
+
+private:
+    pid_t pid_ = -1;
+    FILE *output_ = nullptr;
+};
+
+class TheProgram : public testing::Test {
+protected:
+    static void configure(const std::string &more = "") {
+        OvraTest::writeFile(OvraPlatform::kConfigFile,
+                            "address=\"127.0.0.1\"\nhttp_port=\"" + std::to_string(httpPort()) +
+                                "\"\nhttps_port=\"" + std::to_string(httpsPort()) + "\"\n" + more);
+    }
+    static int httpPort() {
+        static const int port = OvraTest::unusedPort();
+        return port;
+    }
+    static int httpsPort() {
+        static const int port = OvraTest::unusedPort();
+        return port;
+    }
+    static std::string ready() {
+        return "ovradrd: ready, https " + std::to_string(httpsPort()) + ", http " +
+               std::to_string(httpPort()) + "\n";
+    }
+    /// What a process of the appliance is told through the Unix socket.
+    static Json::Value ask(const char *api, const char *method, const Json::Value &params = {}) {
+        Json::Value reply;
+        OVRA::APIRunner().Exec(reply, api, 1, method, params, "admin");
+        return reply;
+    }
+};
+
+TEST_F(TheProgram, doesNotStartWhereNothingIsSetUp) {
+    Program program;
+    EXPECT_NE(program.line().find("run ovradr setup"), std::string::npos);
+    EXPECT_EQ(program.wait(), 9);
+}
+
+TEST_F(TheProgram, doesNotStartWithoutANodeDatabase) {
+    Appliance::provision();
+    std::filesystem::remove(OvraTest::kNodeDatabase);
+    EXPECT_EQ(Program().wait(), 9);
+}
+
+TEST_F(TheProgram, doesNotStartWithSettingsThatItCannotTake) {
+    Appliance::provision();
+    configure("hostname=\"a b\"\n");
+    Program program;
+    EXPECT_NE(program.line().find("hostname"), std::string::npos);
+    EXPECT_EQ(program.wait(), 1);
+}
+
+TEST_F(TheProgram, doesNotStartWithAKeyThatOthersCanRead) {
+    Appliance::provision();
+    std::filesystem::permissions(OvraPlatform::kTlsKeyFile,
+                                 std::filesystem::perms::owner_read |
+                                     std::filesystem::perms::others_read);
+    Program program;
+    EXPECT_NE(program.line().find("0600"), std::string::npos);
+    EXPECT_EQ(program.wait(), 1);
+}
+
+TEST_F(TheProgram, doesNotStartWithTheCertificateOfAnotherKey) {
+    Appliance::provision();
+    const std::string certificate = OvraTest::readFile(OvraPlatform::kTlsCertificateFile);
+    std::filesystem::remove(OvraTest::kNodeDatabase);
+    Appliance::provision();
+    OvraTest::writeFile(OvraPlatform::kTlsCertificateFile, certificate);
+    Program program;
+    EXPECT_NE(program.line().find("not a key and its certificate"), std::string::npos);
+    EXPECT_EQ(program.wait(), 1);
+}
+
+TEST_F(TheProgram, saysThatAPortIsInUse) {
+    Appliance::provision();
+    configure();
+    Program first;
+    ASSERT_EQ(first.line(), ready());
+    Program second;
+    EXPECT_NE(second.line().find("in use"), std::string::npos);
+    EXPECT_EQ(second.wait(), 3);
+}
+
+TEST_F(TheProgram, knowsItsArguments) {
+    EXPECT_EQ(Program({"--version"}).wait(), 0);
+    EXPECT_EQ(Program({"--help"}).wait(), 0);
+    EXPECT_EQ(Program({"--unknown"}).wait(), 2);
+}
+
+TEST_F(TheProgram, servesUntilItIsToldToEnd) {
+    Appliance::provision();
+    configure();
+    for (const int signal : {SIGTERM, SIGINT}) {
+        Program program;
+        ASSERT_EQ(program.line(), ready());
+        EXPECT_EQ(ask("OVRA.DR.Node", "info")["success"], true);
+        EXPECT_EQ(ask("OVRA.Core.Farlink", "get")["data"]["enabled"], false);
+        program.signal(signal);
+        EXPECT_EQ(program.wait(), 0);
+        EXPECT_FALSE(std::filesystem::exists(OvraPlatform::kSocketFile));
+    }
+    EXPECT_EQ(ask("OVRA.DR.Node", "info")["error"]["code"], 100);
+}
+
+TEST_F(TheProgram, startsAgainAfterItWasKilled) {
+    Appliance::provision();
+    configure();
+    {
+        Program program;
+        ASSERT_EQ(program.line(), ready());
+    }
+    EXPECT_TRUE(std::filesystem::exists(OvraPlatform::kSocketFile));
+    Program program;
+    EXPECT_EQ(program.line(), ready());
+    EXPECT_EQ(ask("OVRA.DR.Node", "info")["success"], true);
+}
+
+TEST_F(TheProgram, endsInTimeWhileACallWaitsForAnotherAppliance) {
+    Appliance::provision();
+    configure();
+    OvraTest::MisbehavingServer silent;
+    silent.fallSilent();
+    Program program;
+    ASSERT_EQ(program.line(), ready());
+    Json::Value params;
+    params["conns"][0]["addr"] = "127.0.0.1";
+    params["conns"][0]["protocol"] = "http";
+    params["conns"][0]["port"] = silent.port();
+    Json::Value reply;
+    std::thread caller([&] { reply = ask("OVRA.DR.Node", "test_connection", params); });
+    while (silent.connections() == 0) {
+        std::this_thread::sleep_for(5ms);
+    }
+    const auto begun = std::chrono::steady_clock::now();
+    program.signal(SIGTERM);
+    EXPECT_EQ(program.wait(), 0);
+    EXPECT_LT(std::chrono::steady_clock::now() - begun, 5s);
+    caller.join();
+    EXPECT_EQ(reply["error"]["code"], 107);
+    EXPECT_FALSE(std::filesystem::exists(OvraPlatform::kSocketFile));
+}
+
+} // namespace

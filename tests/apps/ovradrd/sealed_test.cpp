@@ -1,0 +1,125 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "appliance.h"
+#include "core/appliance.h"
+#include "credential/sealed_box.h"
+#include "credential/wire_form.h"
+#include "ovracredential/cred_request.h"
+
+#include <ovradrcore/json.h>
+
+#include <optional>
+
+namespace {
+
+using namespace OvraPlatform;
+using OvraTest::Appliance;
+using OvraTest::json;
+using OvraTest::Reply;
+
+class Sealed : public Appliance {
+protected:
+    void SetUp() override {
+        Appliance::SetUp();
+        addAccount("alice", true);
+        std::string why;
+        keys = SealKeyPair::load(kSealKeyFile, why);
+        inner.api = "OVRA.DR.Node";
+        inner.version = 1;
+        inner.method = "test_privilege";
+        inner.sid = session("alice");
+    }
+
+    /// The call in its envelope.
+    WireCall seal(UnixMillis time) {
+        WireCall outer;
+        outer.api = inner.api;
+        outer.version = inner.version;
+        outer.method = inner.method;
+        outer.sealed = sealRequest(keys->publicKey(), inner, time, replyKey);
+        return outer;
+    }
+    Reply post(const WireCall &outer) const {
+        return http({.body = encodeForm(outer).value(), .tls = false});
+    }
+    /// The document inside a sealed reply; null when it is none.
+    Json::Value open(const Reply &reply) const {
+        const auto text = openReply(replyKey, reply.document);
+        return text ? json(*text) : Json::Value();
+    }
+
+    std::optional<SealKeyPair> keys;
+    WireCall inner;
+    ReplyKey replyKey;
+};
+
+TEST_F(Sealed, logInAndCallsWorkOverPlainHttp) {
+    OVRACred *cred = OVRACredAlloc();
+    OVRACredSess *sess = OVRACredSessAlloc();
+    OVRACredItemSetProtocol(cred, "http");
+    OVRACredItemSetHost(cred, "127.0.0.1");
+    OVRACredItemSetPort(cred, port(false));
+    OVRACredItemSetRemoteAccount(cred, "alice");
+    OVRACredItemSetRemotePasswd(cred, kPassword);
+    Json::Value granted;
+    EXPECT_NE(OVRA::CredRequestUtil::LoginWithOTP(cred, "", sess, &granted), 0);
+    EXPECT_EQ(granted["success"], true) << granted;
+    OVRA::CredRequest request;
+    OVRA::CredRequest::CreateWebAPIRequest(request, cred, sess, "OVRA.DR.Node", 1, "test_privilege",
+                                           Json::Value());
+    EXPECT_NE(request.Process(true, 0), 0) << request.GetError();
+    EXPECT_EQ(json(request.GetResponse())["success"], true);
+    EXPECT_NE(OVRA::CredRequestUtil::Logout(cred, sess), 0);
+    OVRACredSessFree(sess);
+    OVRACredFree(cred);
+}
+
+TEST_F(Sealed, isAnsweredSealed) {
+    const Reply reply = post(seal(wallClock()));
+    EXPECT_EQ(reply.document.getMemberNames(), std::vector<std::string>{"sealed_reply"});
+    EXPECT_EQ(open(reply)["success"], true);
+}
+
+TEST_F(Sealed, isRefusedTheSecondTime) {
+    const WireCall outer = seal(wallClock());
+    EXPECT_EQ(open(post(outer))["success"], true);
+    const Json::Value again = open(post(outer));
+    EXPECT_EQ(again["error"]["code"], 109);
+    EXPECT_EQ(again["error"]["msg"]["reason"], "replayed");
+}
+
+TEST_F(Sealed, isToldTheTimeWhenItIsStale) {
+    const Json::Value refusal = open(post(seal(wallClock() - 120'000)));
+    EXPECT_EQ(refusal["error"]["code"], 109);
+    EXPECT_EQ(refusal["error"]["msg"]["reason"], "stale");
+    EXPECT_NEAR(refusal["error"]["msg"]["time"].asDouble(), static_cast<double>(wallClock()), 5000);
+}
+
+TEST_F(Sealed, cannotBeMovedToAnotherCall) {
+    WireCall outer = seal(wallClock());
+    outer.method = "info";
+    EXPECT_EQ(open(post(outer))["error"]["msg"]["reason"], "call");
+}
+
+TEST_F(Sealed, thatCannotBeOpenedIsRefusedUnsealed) {
+    WireCall outer = seal(wallClock());
+    outer.sealed[10] = outer.sealed[10] == 'A' ? 'B' : 'A';
+    const Reply reply = post(outer);
+    EXPECT_EQ(reply.code(), 109);
+    EXPECT_EQ(reply.document["error"]["msg"]["reason"], "key");
+}
+
+TEST_F(Sealed, isWhatPlainHttpDemands) {
+    const auto code = [this](const char *api, const char *method, const char *params,
+                             const std::string &sid) {
+        const Reply reply = call(api, 1, method, json(params), sid, false);
+        EXPECT_TRUE(reply.code() != 109 || reply.document["error"]["msg"]["reason"] == "unsealed");
+        return reply.code();
+    };
+    const std::string login = R"({"account":"alice","passwd":")" + std::string(kPassword) + "\"}";
+    EXPECT_EQ(code("OVRA.Core.Auth", "login", login.c_str(), ""), 109);
+    EXPECT_EQ(code("OVRA.DR.Node", "test_privilege", "{}", inner.sid), 109);
+    EXPECT_EQ(code("OVRA.DR.Node.Credential", "create", R"({"password":"x"})", ""), 109);
+    EXPECT_EQ(code("OVRA.Core.Encryption", "getinfo", "{}", ""), 0);
+}
+
+} // namespace
