@@ -10,7 +10,6 @@
 #include <array>
 #include <cstdio>
 #include <cstring>
-#include <optional>
 #include <string>
 #include <thread>
 

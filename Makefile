@@ -1,0 +1,60 @@
+# SPDX-License-Identifier: Apache-2.0
+# The usual ways to build, test and show. Each installs what is missing, does only what is not done
+# yet, and says what it runs. Everything made lies in build/.
+
+JOBS ?= $(shell nproc)
+# The lab's programs for the tests are the development build's, for the demo the release build's.
+testStage := $(CURDIR)/build/stage-dev
+stage := $(CURDIR)/build/stage
+
+.DEFAULT_GOAL := help
+.PHONY: help build test demo bench format check clean stage stage-dev deps-build deps-test deps-lab \
+	deps-bench deps-check
+
+help: ## this list
+	@sed -n 's/^\([a-z-]*\):.*## /\1\t/p' $(MAKEFILE_LIST) | while IFS="$$(printf '\t')" read -r target text; do \
+		printf '  make %-8s %s\n' "$$target" "$$text"; done
+
+demo: deps-lab stage ## two appliances on this machine pair and talk, before your eyes
+	@OVRADR_LAB_PREFIX='$(stage)' lab/demo
+
+test: deps-test deps-lab stage-dev ## every test, each on a node of its own (TESTS=regex picks some)
+	@lab/lab way | sed 's/^/tests run by way of /'
+	OVRADR_LAB_PREFIX='$(testStage)' ctest --preset dev -j $(JOBS) $(if $(TESTS),-R '$(TESTS)')
+
+bench: deps-bench build/bench/build.ninja ## the benchmarks, side by side with the floor
+	@cmake --build build/bench -j $(JOBS) --target bench
+
+build: deps-build build/release/build.ninja ## the libraries and programs, optimised
+	@cmake --build build/release -j $(JOBS)
+
+stage: build
+	@cmake --install build/release --prefix '$(stage)' >build/stage.log || { cat build/stage.log; exit 1; }
+
+stage-dev: deps-test build/dev/build.ninja
+	@cmake --build build/dev -j $(JOBS)
+	@cmake --install build/dev --prefix '$(testStage)' >build/stage-dev.log || { cat build/stage-dev.log; exit 1; }
+
+# Ninja configures again by itself when a CMakeLists.txt changes, but not when the presets do.
+# The benchmarks have a tree of their own, so that the demo does not wait for them.
+build/dev/build.ninja: CMakePresets.json
+	cmake --preset dev
+	@touch $@
+build/release/build.ninja: CMakePresets.json
+	cmake --preset release -D OVRADRNODE_BUILD_BENCH=OFF
+	@touch $@
+build/bench/build.ninja: CMakePresets.json
+	cmake --preset release -B build/bench
+	@touch $@
+
+format: deps-check ## put every C++ file into the one layout
+	@tools/sources cpp | xargs -0 clang-format -i
+
+check: deps-check ## what CI asks of every change, without the builds
+	@tools/check-format && tools/check-scripts && tools/check-layers && tools/check-leftovers
+
+clean: ## remove everything that was made
+	rm -rf build
+
+deps-build deps-test deps-lab deps-bench deps-check: deps-%:
+	@scripts/install-deps $*

@@ -1,0 +1,45 @@
+# SPDX-License-Identifier: Apache-2.0
+# shellcheck shell=bash
+# What every script of the lab uses: where it stands, how it fails, how it names addresses.
+
+# The checkout, as the physical path that every file view shows as well.
+labRoot=$(cd "$(dirname "${BASH_SOURCE[0]}")/../.." && pwd -P)
+# shellcheck disable=SC2034 # read by who sources this
+labLib=$labRoot/lab/lib
+
+# fail MESSAGE...: one line on standard error that says what was wrong and what to do.
+fail() {
+    printf 'lab: %s\n' "$*" >&2
+    exit 1
+}
+
+# needProgram PROGRAM PACKAGE: stops with the Debian package to install when PROGRAM is missing.
+needProgram() {
+    command -v "$1" >/dev/null || fail "$1 is missing; install the Debian package $2 (make deps does it)"
+}
+
+# newId: 64 random bits as 16 hexadecimal digits. Every process of a lab carries its id in the
+# environment, so that none of them can be missed or mistaken when the lab is taken down.
+newId() { od -An -N8 -tx8 /dev/urandom | tr -d ' '; }
+
+# insidePath PREFIX: the PATH of a command inside a node; ip and nft are outside an ordinary user's.
+insidePath() { printf '%s/bin:%s/sbin:%s:/usr/sbin:/sbin' "$1" "$1" "$PATH"; }
+
+# nodeAddress WAY NODE LINK: the address of a node. In the proot way all nodes share the loopback
+# interface and have one address each.
+nodeAddress() {
+    if [[ $1 == proot ]]; then
+        printf '127.0.1.%d' "$2"
+    else
+        printf '10.77.%d.%d' "$3" "$2"
+    fi
+}
+
+# nodeAddresses WAY NODE: all of them, separated by commas.
+nodeAddresses() {
+    if [[ $1 == proot ]]; then
+        nodeAddress proot "$2" 0
+    else
+        printf '%s,%s' "$(nodeAddress "$1" "$2" 0)" "$(nodeAddress "$1" "$2" 1)"
+    fi
+}

@@ -1,0 +1,63 @@
+#!/bin/bash
+# SPDX-License-Identifier: Apache-2.0
+# keeper.sh FOLDER: holds one lab together. Starts it, waits for the end, and then leaves nothing of
+# it: no process, no folder. `lab up` writes "keep" to the standard input once all is well; when
+# that ends without the word (`lab up` failed, was interrupted, was killed), so does the lab.
+# SIGTERM ends it too; that is `lab down`.
+set -euo pipefail
+lib=$(dirname "${BASH_SOURCE[0]}")
+# shellcheck source=lab/lib/common.sh
+. "$lib/common.sh"
+# shellcheck source=lab/lib/processes.sh
+. "$lib/processes.sh"
+# shellcheck source=lab/lib/way.sh
+. "$lib/way.sh"
+# shellcheck source=lab/lib/view.sh
+. "$lib/view.sh"
+# shellcheck source=lab/lib/state.sh
+. "$lib/state.sh"
+
+lab=$1
+labWay=$(<"$lab/way") labPrefix=$(<"$lab/prefix") labCount=$(<"$lab/count") labId=$(<"$lab/id")
+
+cleanUp() {
+    trap '' INT TERM HUP
+    stopNodes "$lab" "$labCount"
+    killLab "$labId" || echo "processes of this lab survive SIGKILL" >&2
+    removeTree "$lab"
+}
+trap cleanUp EXIT
+trap exit INT TERM HUP
+
+startNamespaces() {
+    local users=()
+    [[ $labWay == root ]] || users=("${userNamespace[@]}")
+    exec {info}>"$lab/init.json"
+    bwrap --bind / / --dev-bind /dev /dev --unshare-pid --proc /proc --unshare-net --unshare-uts \
+        --hostname lab --die-with-parent "${users[@]}" --info-fd "$info" -- \
+        /bin/bash "$labLib/init.sh" "$lab" 9<&- </dev/null &
+    exec {info}>&-
+}
+
+startProots() {
+    local i
+    for ((i = 1; i <= labCount; i++)); do
+        mkdir "$lab/n$i/root"
+        prootView "$lab/n$i/root" "$labRoot" "$labPrefix" "$lab"
+        printf '%s\0' "${viewArgs[@]}" >"$lab/n$i/proot.args"
+        PROOT_TMP_DIR=$lab/n$i perl "$labLib/old-syscalls.pl" proot -v -1 "${viewArgs[@]}" -w / \
+            /bin/bash "$labLib/node.sh" "$lab" "$i" 9<&- </dev/null &
+        done
+}
+
+PATH=$(insidePath "$labPrefix")
+# The id is exported only now: this process itself is not to be found by it.
+export PATH OVRADR_LAB_WAY=$labWay OVRADR_LAB_ID=$labId
+if [[ $labWay == proot ]]; then startProots; else startNamespaces; fi
+echo "$$" >"$lab/keeper.pid"
+
+word=
+IFS= read -r word || true
+[[ $word == keep ]] || exit 0
+# Some node may end before the others; the lab is over when all have.
+wait

@@ -1,0 +1,39 @@
+# SPDX-License-Identifier: Apache-2.0
+# shellcheck shell=bash
+# The processes of one lab or sandbox, found by the id in their environment.
+
+# labProcesses ID: the pids that carry the id, and those that a proot among them traces (a program
+# that was started with an empty environment is still one of ours). Not the calling shell.
+labProcesses() {
+    local environ pid marked=" "
+    while IFS= read -r environ; do
+        pid=${environ#/proc/}
+        marked+="${pid%/environ} "
+    done < <(env -u OVRADR_LAB_ID grep -slzxF "OVRADR_LAB_ID=$1" /proc/[0-9]*/environ)
+    [[ $marked != " " ]] || return 0
+    env -u OVRADR_LAB_ID awk -v marked="$marked" -v self="$$" '
+        FNR == 1 { pid = FILENAME; gsub(/[^0-9]/, "", pid); zombie = 0 }
+        $1 == "State:" && $2 ~ /[ZX]/ { zombie = 1 }
+        $1 == "TracerPid:" && !zombie && pid != self &&
+            (index(marked, " " pid " ") || ($2 != 0 && index(marked, " " $2 " "))) { print pid }
+    ' /proc/[0-9]*/status 2>/dev/null || true
+}
+
+# killLab ID: kills them all and looks again until none is left; false when some survive 5 seconds.
+killLab() {
+    local pids round
+    for ((round = 0; round < 100; round++)); do
+        mapfile -t pids < <(labProcesses "$1")
+        ((${#pids[@]})) || return 0
+        kill -KILL "${pids[@]}" 2>/dev/null || true
+        sleep 0.05
+    done
+    return 1
+}
+
+# removeTree FOLDER: removes it with all it holds, folders without permissions included.
+removeTree() {
+    rm -rf -- "$1" 2>/dev/null && return 0
+    chmod -R u+rwX -- "$1" 2>/dev/null || true
+    rm -rf -- "$1"
+}

@@ -1,0 +1,48 @@
+# SPDX-License-Identifier: Apache-2.0
+# shellcheck shell=bash
+# Running a command under proot so that its end and its exit code are its own: proot by itself ends
+# with the last process that it traces, hands out that one's exit code, and ignores SIGTERM.
+
+# prootRun FOLDER COMMAND...: runs COMMAND in the view of viewArgs and returns its exit code (128 +
+# signal where one ended it). What it leaves running stays. FOLDER is private and gets a fifo for
+# the exit code. SIGINT, SIGTERM or SIGHUP kill the command and all that it started.
+prootRun() {
+    local folder=$1 fifo=$1/status.$BASHPID code="" status
+    shift
+    mkfifo -m 600 "$fifo"
+    # Open in both directions, so that neither side waits for the other.
+    exec {status}<>"$fifo"
+    rm -f "$fifo"
+    PROOT_TMP_DIR=$folder perl "$labLib/old-syscalls.pl" proot -v -1 "${viewArgs[@]}" -w / \
+        /bin/bash -c 'status=$1 folder=$2; shift 2
+            cd -- "$folder" 2>/dev/null || cd /
+            eval "\"\$@\" $status>&-" && code=0 || code=$?
+            echo "$code" >&"$status"' sandbox "$status" "$PWD" "$@" <&0 &
+    prootPid=$!
+    disown "$prootPid"
+    trap 'killTraced "$prootPid"; exit 130' INT
+    trap 'killTraced "$prootPid"; exit 143' TERM
+    trap 'killTraced "$prootPid"; exit 129' HUP
+    until IFS= read -r -t 1 -u "$status" code; do
+        kill -0 "$prootPid" 2>/dev/null && continue
+        # It may have ended between the two.
+        IFS= read -r -t 0.01 -u "$status" code || code=137
+        break
+    done
+    trap - INT TERM HUP
+    exec {status}>&-
+    return "$code"
+}
+
+# killTraced PID: kills a proot with all that it traces.
+killTraced() {
+    local pids round
+    for ((round = 0; round < 20; round++)); do
+        mapfile -t pids < <(awk -v proot="$1" '
+            FNR == 1 { pid = FILENAME; gsub(/[^0-9]/, "", pid) }
+            $1 == "TracerPid:" && $2 == proot { print pid }' /proc/[0-9]*/status 2>/dev/null)
+        ((${#pids[@]})) || break
+        kill -KILL "${pids[@]}" 2>/dev/null || true
+    done
+    kill -KILL "$1" 2>/dev/null || true
+}

@@ -1,0 +1,79 @@
+# SPDX-License-Identifier: Apache-2.0
+# shellcheck shell=bash
+# The folder of a lab and who owns it. In it:
+#   id way prefix count daemon      one line each, written by `lab up`
+#   keeper.pid keeper.log           the process that holds the lab together
+#   init.json                       bubblewrap's word on the first process inside (not with proot)
+#   nI/state                        starting, up, failed or stopped, and why
+#   nI/log nI/console nI/control    system log, output of the programs, fifo for orders
+#   nI/link0 nI/link1               up, cut or dropping
+# An exclusive flock on the folder itself says that the lab lives: the keeper holds it.
+
+# labFolder: where the lab of this user is.
+labFolder() {
+    local folder=${OVRADR_LAB_DIR:-/tmp/ovralab-$EUID}
+    [[ $folder == /* ]] || folder=$PWD/$folder
+    printf '%s' "$folder"
+}
+
+# checkFolder FOLDER: stops unless FOLDER is a folder of this user that nobody else may enter.
+checkFolder() {
+    [[ -d $1 && ! -L $1 && -O $1 && $(stat -c %a "$1") == 700 ]] ||
+        fail "$1 is not a private folder of this user: remove it, or set OVRADR_LAB_DIR to another place"
+}
+
+# needLab: sets lab, labWay, labPrefix, labCount and labId of the lab that is up, or stops.
+needLab() {
+    lab=$(labFolder)
+    [[ -d $lab ]] || fail "no lab is up; start one with: lab up N"
+    checkFolder "$lab"
+    if [[ ! -s $lab/keeper.pid ]] || flock -n "$lab" true; then
+        fail "the lab in $lab is gone or not up yet; clear it away with: lab down"
+    fi
+    # shellcheck disable=SC2034 # read by the callers
+    labWay=$(<"$lab/way") labPrefix=$(<"$lab/prefix") labCount=$(<"$lab/count") labId=$(<"$lab/id")
+}
+
+# needNode NODE: sets node to its number; both 2 and node-2 name the second.
+needNode() {
+    node=${1#node-}
+    [[ $node =~ ^[1-9][0-9]?$ && $node -le $labCount ]] ||
+        fail "there is no node \"$1\"; the nodes are 1 to $labCount"
+}
+
+# needLink LINK: sets link to 0 or 1; both 1 and eth1 name the second.
+needLink() {
+    link=${1#eth}
+    [[ $link == [01] ]] || fail "there is no link \"$1\"; the links are 0 (eth0) and 1 (eth1)"
+}
+
+# nodeState FOLDER NODE: the state that the node wrote.
+nodeState() {
+    local state=starting
+    [[ ! -s $1/n$2/state ]] || state=$(<"$1/n$2/state")
+    printf '%s' "$state"
+}
+
+# bwrapPid FILE: the pid that bubblewrap wrote with --info-fd.
+bwrapPid() {
+    local text
+    text=$(<"$1")
+    [[ $text =~ \"child-pid\":\ *([0-9]+) ]] && printf '%s' "${BASH_REMATCH[1]}"
+}
+
+# stopNodes FOLDER COUNT: orders every node's daemon to end, and waits up to 5 seconds for that.
+stopNodes() {
+    local i round waiting
+    for ((i = 1; i <= $2; i++)); do
+        # Opened in both directions: a node that is gone must not hold this up.
+        [[ ! -p $1/n$i/control ]] || echo stop 1<>"$1/n$i/control" || true
+    done
+    for ((round = 0; round < 50; round++)); do
+        waiting=0
+        for ((i = 1; i <= $2; i++)); do
+            [[ $(nodeState "$1" "$i") != up* ]] || waiting=1
+        done
+        ((waiting)) || return 0
+        sleep 0.1
+    done
+}

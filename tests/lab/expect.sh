@@ -1,0 +1,30 @@
+# SPDX-License-Identifier: Apache-2.0
+# shellcheck shell=bash
+# shellcheck disable=SC2034 # set for the scenes
+# What the scenes of this folder share: a scratch folder and a few ways to say what must hold.
+root=$(cd "$(dirname "${BASH_SOURCE[0]}")/../.." && pwd -P)
+# Under /tmp, and short, whatever TMPDIR says: the lab's proot way needs short paths.
+scratch=$(mktemp -d /tmp/ovt.XXXX)
+
+# broken WHAT: ends the scene.
+broken() {
+    printf 'FAILED: %s\n' "$*" >&2
+    exit 1
+}
+same() { [[ $2 == "$3" ]] || broken "$1: expected \"$3\", got \"$2\""; }
+holds() { [[ $2 == *"$3"* ]] || broken "$1: expected \"$3\" somewhere in: $2"; }
+absent() { [[ ! -e $1 ]] || broken "$1 is there"; }
+
+# exitCodeOf COMMAND...: sets code and output (both streams).
+exitCodeOf() { output=$("$@" 2>&1 </dev/null) && code=0 || code=$?; }
+
+# eventually WHAT COMMAND...: COMMAND succeeds within 10 seconds.
+eventually() {
+    local what=$1 i
+    shift
+    for ((i = 0; i < 200; i++)); do
+        ! "$@" || return 0
+        sleep 0.05
+    done
+    broken "$what"
+}

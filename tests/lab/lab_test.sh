@@ -1,0 +1,223 @@
+#!/bin/bash
+# SPDX-License-Identifier: Apache-2.0
+# lab_test.sh SCENE WAY: one scene of the lab or the sandbox, made in that way. Exit code 77 where
+# the machine does not allow the way, or the way has not what the scene is about.
+set -euo pipefail
+# shellcheck source=tests/lab/expect.sh
+. "$(dirname "$0")/expect.sh"
+scene=$1 way=$2
+export OVRADR_LAB_WAY=$way OVRADR_LAB_DIR=$scratch/lab
+# A word by which processes of this scene are known from outside.
+mark=31${RANDOM}${BASHPID}
+echo "$mark" >"$scratch/mark"
+
+finish() {
+    "$root/lab/lab" down >/dev/null 2>&1 || true
+    OVRADR_LAB_DIR=$scratch/lab2 "$root/lab/lab" down >/dev/null 2>&1 || true
+    chmod -R u+rwX "$scratch"
+    rm -rf "$scratch"
+}
+trap finish EXIT
+
+lab() { "$root/lab/lab" "$@"; }
+sandbox() { "$root/lab/sandbox" "$@"; }
+nothingRuns() { ! grep -sqzF -f "$scratch/mark" /proc/[0-9]*/cmdline; }
+# Of this scene only: other tests have sandboxes of their own at the same time.
+noFolderIsLeft() { ! compgen -G "/tmp/ovl.*/root/usr/ovra/$mark" >/dev/null; }
+requireLinks() { [[ $way != proot ]] || skip "nodes made by proot have no links of their own"; }
+skip() {
+    echo "skipped: $*"
+    exit 77
+}
+
+# programs SETUP DAEMON: stand-ins for the two programs, as scripts.
+programs() {
+    mkdir -p "$scratch/bin"
+    printf '#!/bin/bash\n%s\n' "$1" >"$scratch/bin/ovradr"
+    printf '#!/bin/bash\n%s\n' "$2" >"$scratch/bin/ovradrd"
+    chmod +x "$scratch/bin/ovradr" "$scratch/bin/ovradrd"
+    export OVRADR_LAB_PREFIX=$scratch
+}
+
+sandboxKeepsThePathsPrivate() {
+    local seen
+    local fill='for path in /usr/ovra/x /tmp/.ovradrcache /run/lock/x /dev/log; do
+        [[ ! -e $path ]] || echo "already there: $path"
+        echo mine >"$path"; stat -c %s "$path"; mv "$path" "$path.moved"; cat "$path.moved"
+    done; stat -c %a /usr/ovra; [[ -O /usr/ovra ]] && echo yes'
+    for _ in 1 2; do
+        seen=$(sandbox bash -c "$fill" | tr '\n' ' ')
+        same "own, empty, writable, owned by who runs it" "$seen" "5 mine 5 mine 5 mine 5 mine 755 yes "
+    done
+    absent /usr/ovra/x.moved
+    absent /tmp/.ovradrcache.moved
+    absent /run/lock/x.moved
+    absent /dev/log.moved
+}
+
+sandboxPassesExitCodes() {
+    local expected
+    for expected in 0 7 255; do
+        exitCodeOf sandbox bash -c "sleep $mark & exit $expected"
+        same "exit code" "$code" "$expected"
+        eventually "what the command left running is gone" nothingRuns
+    done
+    exitCodeOf sandbox "$scratch/no-such-program"
+    ((code)) || broken "a program that does not exist counts as success"
+}
+
+sandboxPassesFolderInputAndEnvironment() {
+    cd "$scratch"
+    output=$(echo input | GIVEN=given sandbox bash -c 'cat; echo "$PWD $GIVEN $OVRADR_LAB_WAY"; echo made >file')
+    same "standard input, folder, environment" "$output" "input"$'\n'"$scratch given $way"
+    same "a file of the working folder" "$(<file)" made
+}
+
+sandboxLeavesNothingAfterASignal() {
+    local signal
+    for signal in TERM INT HUP KILL; do
+        # A shell starts its background jobs with SIGINT ignored; this one must hear it.
+        perl -e '$SIG{INT} = "DEFAULT"; exec @ARGV' \
+            "$root/lab/sandbox" bash -c "touch '/usr/ovra/$mark' '$scratch/runs'; env -i sleep $mark & sleep $mark" &
+        eventually "the command runs" test -e "$scratch/runs"
+        kill -"$signal" $!
+        ! wait $! || broken "SIG$signal counts as success"
+        eventually "no process is left after SIG$signal" nothingRuns
+        eventually "no folder is left after SIG$signal" noFolderIsLeft
+        rm "$scratch/runs"
+    done
+}
+
+nodesAreApart() {
+    lab up 2 --no-daemon >/dev/null
+    lab run 1 -- bash -c 'echo one >/usr/ovra/x; echo one >/tmp/.ovradrcache; logger -p user.err "from one"'
+    exitCodeOf lab run 2 -- bash -c 'ls -d /usr/ovra/x /tmp/.ovradrcache; exit 5'
+    same "the other node has its own files" "$code" 5
+    holds "the other node has its own files" "$output" "cannot access '/usr/ovra/x'"
+    same "a node keeps its files from one command to the next" "$(lab run 1 -- cat /usr/ovra/x)" one
+    eventually "the node's log has the line" eval 'lab log 1 | grep -q "err .*from one"'
+    same "the other node's log" "$(lab log 2)" ""
+    exitCodeOf lab run 1 -- bash -c 'for ((i = 0; i < 700; i++)); do printf 0123456789; done | logger'
+    eventually "a long message is whole" eval '(($(lab log 1 | wc -c) > 7000))'
+    [[ $way == proot ]] || same "host name" "$(lab run 2 -- hostname)" node-2
+    same "standard input" "$(echo hello | lab run 2 -- cat)" hello
+    lab down >/dev/null
+    absent "$OVRADR_LAB_DIR"
+    same "down again" "$(lab down)" "lab: no lab is up"
+}
+
+# listen NODE ADDRESS: answers one connection with "hello".
+listen() {
+    lab run "$1" -- perl -MIO::Socket::INET -e '
+        my $listener = IO::Socket::INET->new(LocalAddr => $ARGV[0], LocalPort => 5999, Listen => 9,
+            ReuseAddr => 1) or die $!;
+        while (my $peer = $listener->accept) { print $peer "hello\n" }' "$2" &
+    eventually "node $1 listens on $2" reaches "$1" "$2"
+}
+# reaches NODE ADDRESS: whether NODE gets the answer from there within 2 seconds.
+reaches() {
+    [[ $(lab run "$1" -- timeout 2 bash -c 'cat <"/dev/tcp/$0/5999"' "$2" 2>/dev/null </dev/null) == hello ]]
+}
+
+nodesReachEachOther() {
+    lab up 2 --no-daemon >/dev/null
+    listen 2 "$(lab addr 2)"
+    reaches 1 "$(lab addr 2)" || broken "node 1 does not reach node 2"
+    if [[ $way == proot ]]; then
+        exitCodeOf lab cut 2 0
+        holds "cut says why it cannot" "$output" "needs links of the lab's own"
+    else
+        listen 2 "$(lab addr 2 1)"
+        reaches 1 "$(lab addr 2 1)" || broken "node 1 does not reach node 2 on the second link"
+        exitCodeOf grep -F 10.77. /proc/net/fib_trie
+        same "the machine has an address of the lab" "$output" ""
+    fi
+}
+
+linksAreCutDroppedAndRestored() {
+    local first second
+    requireLinks
+    lab up 2 --no-daemon >/dev/null
+    first=$(lab addr 2 0) second=$(lab addr 2 1)
+    listen 2 "$first"
+    listen 2 "$second"
+    while read -r how carrier; do
+        lab "$how" 2 0
+        holds "the node's own view of its link" "$(lab run 2 -- ip -o link show eth0 </dev/null)" "$carrier"
+        ! reaches 1 "$first" || broken "$how lets the first link through"
+        reaches 1 "$second" || broken "$how of the first link stops the second"
+        lab restore 2 eth0
+        eventually "the link works again after $how" reaches 1 "$first"
+    done <<-'END'
+	cut NO-CARRIER
+	drop LOWER_UP
+	END
+    exitCodeOf lab cut 2 7
+    holds "a link that is not there" "$output" "the links are 0 (eth0) and 1 (eth1)"
+}
+
+labsAreApart() {
+    lab up 1 --no-daemon >/dev/null
+    lab run 1 -- touch /usr/ovra/first
+    OVRADR_LAB_DIR=$scratch/lab2 lab up 1 --no-daemon >/dev/null
+    exitCodeOf env OVRADR_LAB_DIR="$scratch/lab2" "$root/lab/lab" run 1 -- test -e /usr/ovra/first
+    same "the second lab sees files of the first" "$code" 1
+    exitCodeOf lab up 1 --no-daemon
+    holds "a lab of the same name" "$output" "is up already"
+    OVRADR_LAB_DIR=$scratch/lab2 lab down >/dev/null
+    lab run 1 -- test -e /usr/ovra/first || broken "the first lab went down with the second"
+}
+
+# cleared WHAT: that nothing is left of the lab.
+cleared() {
+    eventually "the folder is gone $1" eval '[[ ! -e $OVRADR_LAB_DIR ]]'
+    eventually "the processes are gone $1" nothingRuns
+}
+
+failedStartIsShownAndCleared() {
+    programs 'echo "no room left"; exit 4' "exec sleep $mark"
+    exitCodeOf lab up 2
+    same "exit code" "$code" 1
+    holds "which step failed" "$output" "ovradr setup returned 4"
+    holds "what the program said" "$output" "no room left"
+    cleared "after setup failed"
+    programs 'exit 0' "logger -p daemon.err 'port taken'; exit 5"
+    exitCodeOf lab up 2
+    holds "which step failed" "$output" "ovradrd ended with exit code 5"
+    holds "what it logged" "$output" "port taken"
+    cleared "after the daemon failed"
+    rm "$scratch/bin/ovradrd"
+    exitCodeOf lab up 2
+    holds "a program that is not there" "$output" "ovradrd is not installed in $scratch"
+    cleared "after a program was missing"
+}
+
+interruptedStartIsCleared() {
+    local signal
+    programs 'exit 0' "touch '$scratch/runs'; exec sleep $mark"
+    for signal in INT TERM KILL; do
+        perl -e '$SIG{INT} = "DEFAULT"; exec @ARGV' "$root/lab/lab" up 2 >"$scratch/out" 2>&1 &
+        eventually "the daemon starts" test -e "$scratch/runs"
+        kill -"$signal" $!
+        ! wait $! || broken "SIG$signal counts as success"
+        cleared "after SIG$signal"
+        rm "$scratch/runs"
+    done
+}
+
+killedKeeperIsCleared() {
+    lab up 2 --no-daemon >/dev/null
+    lab run 1 -- bash -c "setsid -f sleep $mark >/dev/null 2>&1"
+    kill -KILL "$(<"$OVRADR_LAB_DIR/keeper.pid")"
+    exitCodeOf eventually "the lab counts as gone" eval '! lab run 1 -- true >/dev/null 2>&1'
+    same "a lab without its keeper" "$code" 0
+    lab down >/dev/null
+    cleared "after the keeper was killed"
+    lab up 1 --no-daemon >/dev/null
+    kill -KILL "$(<"$OVRADR_LAB_DIR/keeper.pid")"
+    lab up 1 --no-daemon >/dev/null
+    same "a new lab takes the place" "$(lab run 1 -- echo there)" there
+}
+
+lab way >/dev/null 2>&1 || skip "this machine does not allow the way $way"
+"$scene"
