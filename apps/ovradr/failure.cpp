@@ -9,6 +9,7 @@
 
 #include <algorithm>
 #include <array>
+#include <cctype>
 
 namespace Ovradr {
 
@@ -82,9 +83,9 @@ constexpr std::array kMeanings = {
             "The account may not log in to the other appliance over the network",
             "Use another account."},
     Meaning{ERR::kLoginOtpRequired, ExitCode::kOneTimeCode, "otp_required",
-            "The account needs a one-time code", "Give the code of now with --otp."},
+            "The account needs a one-time code", "Give the present code with --otp."},
     Meaning{ERR::kLoginOtpWrong, ExitCode::kOneTimeCode, "otp_wrong", "The one-time code is wrong",
-            "Use the code of now, each only once; check the clocks of both ends."},
+            "Use the present code, each only once; check the clocks of both ends."},
     Meaning{ERR::kCredItemRefused, ExitCode::kFailed, "item_refused",
             "The endpoint or the account cannot be used as it is written",
             "Check host, port and account name."},
@@ -144,6 +145,30 @@ std::string detailText(int code, const Json::Value &detail) {
     return detail.isNull() ? std::string() : OvraDRCore::toLogString(detail);
 }
 
+/// Codes that leave nothing to add: what comes with them says the same once more.
+bool saysItAll(int code) {
+    return code == APIError::kNoSuchAPI || code == APIError::kNoSuchMethod ||
+           code == APIError::kNoSuchVersion || code == APIError::kNoSession;
+}
+
+/// Our daemons and our credential library say what is wrong and, behind a colon, what to do.
+bool hasAdvice(int code) {
+    return code < ERR::kBadParameter || code == ERR::kCredLibrary;
+}
+
+std::string sentence(std::string text) {
+    text.front() = static_cast<char>(std::toupper(static_cast<unsigned char>(text.front())));
+    return text.ends_with('.') ? text : text + ".";
+}
+
+void addDetail(Failure &found, const std::string &detail) {
+    const std::size_t colon = hasAdvice(found.code) ? detail.rfind(": ") : std::string::npos;
+    if (colon != std::string::npos && colon + 2 < detail.size()) {
+        found.hint = sentence(detail.substr(colon + 2));
+    }
+    found.message += detail.empty() ? "." : " (" + detail.substr(0, colon) + ").";
+}
+
 } // namespace
 
 Failure failure(ExitCode exit, const std::string &message, const std::string &hint) {
@@ -160,8 +185,7 @@ Failure failureOf(int code, const Json::Value &detail) {
     if (meaning != kMeanings.end()) {
         found = {meaning->exit, code, meaning->name, meaning->message, meaning->hint};
     }
-    const std::string text = detailText(code, detail);
-    found.message += text.empty() ? "." : " (" + text + ").";
+    addDetail(found, saysItAll(code) ? "" : detailText(code, detail));
     return found;
 }
 

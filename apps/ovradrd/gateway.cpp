@@ -1,9 +1,8 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "gateway.h"
 
-#include "cgi/account_store.h"
+#include "callers.h"
 #include "cgi/client_context.h"
-#include "cgi/session_store.h"
 #include "webapi/api_errors.h"
 
 #include <ovradrcore/json.h>
@@ -146,26 +145,23 @@ bool Gateway::admit(Call &call) {
     if (call.wire.sid.empty()) {
         return true;
     }
-    OvraPlatform::SessionStore sessions;
-    const auto session = sessions.find(call.wire.sid);
-    OvraPlatform::AccountStore accounts;
-    const auto account = session ? accounts.find(session->user) : std::nullopt;
-    if (!sessions.error().empty() || !accounts.error().empty()) {
-        // Nothing is known about the session: a peer must not take it for expired.
+    const SessionOwner owner = findSessionOwner(call.wire.sid);
+    if (owner.outcome == SessionOwner::Outcome::kNotKnown) {
+        // A peer must not take the session for expired.
         call.reply(apiError(APIError::kInternal, "the sessions cannot be read now: see the log of "
                                                  "the appliance"));
         return false;
     }
-    if (!account) {
+    if (owner.outcome == SessionOwner::Outcome::kUnknown) {
         return true;
     }
-    if (account->disabled) {
+    if (owner.account.disabled) {
         call.reply(apiError(APIError::kNoPermission,
                             "the account of the session is disabled: enable it, or use another"));
         return false;
     }
-    call.caller.user = account->name;
-    call.caller.administrator = account->administrator;
+    call.caller.user = owner.account.name;
+    call.caller.administrator = owner.account.administrator;
     call.caller.session = call.wire.sid;
     return true;
 }

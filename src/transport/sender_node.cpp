@@ -81,8 +81,11 @@ Response NodeSender::process(const Request &request) {
         return {};
     }
     for (const DRNode &node : nodes) {
+        if (node.credId == remembered) {
+            continue; // tried already; its error stays unless another attempt follows
+        }
         SetErr(ERR::kNone);
-        if (node.credId != remembered && processByCred(node, request, response)) {
+        if (processByCred(node, request, response)) {
             break;
         }
     }

@@ -1,17 +1,18 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "support/log_capture.h"
 
+#include <unistd.h>
+
 #include <cstdarg>
 #include <cstdio>
 #include <mutex>
-#include <regex>
 
 namespace {
 
 std::mutex guard;
 std::vector<std::string> *captured = nullptr;
 
-void capture(int priority, const char *format, va_list args) {
+__attribute__((format(printf, 2, 0))) void capture(int priority, const char *format, va_list args) {
     const std::lock_guard<std::mutex> lock(guard);
     if (captured == nullptr) {
         return;
@@ -68,14 +69,17 @@ int LogCapture::count(const std::string &text) const {
 
 int LogCapture::count(const std::string &level, const std::string &file,
                       const std::string &function, const std::string &message) const {
-    const std::regex shape("([0-9]) ([^:]*):[0-9]+\\(([^)]*)\\)\\[([A-Z]+)\\]\\[[0-9]+\\]: (.*)");
+    // "PRIORITY file:line(function)[LEVEL][pid]: message"
+    const std::string middle =
+        "(" + function + ")[" + level + "][" + std::to_string(getpid()) + "]: ";
     int found = 0;
     for (const std::string &line : lines()) {
-        std::smatch parts;
-        if (std::regex_match(line, parts, shape) && parts[2] == file && parts[3] == function &&
-            parts[4] == level && parts[5] == message) {
-            ++found;
-        }
+        const std::size_t colon = line.find(':');
+        const std::size_t bracket = line.find('(');
+        found += line.substr(2, colon - 2) == file && bracket != std::string::npos &&
+                         line.substr(bracket) == middle + message
+                     ? 1
+                     : 0;
     }
     return found;
 }

@@ -118,9 +118,11 @@ TEST_F(NodeSend, ADeadEndpointIsPassedOver) {
     EXPECT_EQ(stored(), "c2");
     executeSql("UPDATE node_cred SET port = " + std::to_string(dead));
     executeSql("DELETE FROM temp_cred");
-    remember("c1");
-    EXPECT_FALSE(send().isValid());
-    EXPECT_EQ(sender.GetErrCode(), 500);
+    for (const char *last : {"c1", "c2"}) {
+        remember(last);
+        EXPECT_FALSE(send().isValid());
+        EXPECT_EQ(sender.GetErrCode(), 500) << "the error of the last attempt, whichever that was";
+    }
 }
 
 TEST_F(NodeSend, WithNothingRememberedTheFirstWithTheRightIsFoundAndThenUsed) {

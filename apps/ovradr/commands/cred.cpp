@@ -40,10 +40,11 @@ Json::Value toJson(const DRNode &record, bool temporary) {
     return json;
 }
 
-std::string toText(const DRNode &record, bool temporary) {
+std::string toText(const DRNode &record, bool temporary, const std::string &account = "") {
     return listing({{"credential", record.credId},
                     {"node", record.nodeId},
                     {"endpoint", targetText(record.conn)},
+                    {"account", account},
                     {"kind", temporary ? "temporary" : "lasting"}});
 }
 
@@ -78,7 +79,7 @@ Outcome runFlow(CredCreate &flow, const Conn &conn, const CredOptions &options) 
     Report report;
     report.data = toJson(record, options.temporary);
     report.data["account"] = options.account;
-    report.text = toText(record, options.temporary) + listing({{"account", options.account}});
+    report.text = toText(record, options.temporary, options.account);
     return report;
 }
 

@@ -113,8 +113,27 @@ TEST_F(Session, thatExpiredIsUnknown) {
 TEST_F(Session, isNotTakenForExpiredWhenTheStoreCannotBeRead) {
     addAccount("alice", true);
     const std::string sid = session("alice");
+    for (int i = 0; i < 20; ++i) {
+        ASSERT_EQ(call(kNode, 1, "info", {}, sid).code(), 0);
+    }
     std::filesystem::resize_file(OvraPlatform::kSessionsFile, 10);
-    EXPECT_EQ(call(kNode, 1, "info", {}, sid).code(), 100);
+    for (int i = 0; i < 20; ++i) {
+        EXPECT_EQ(call(kNode, 1, "info", {}, sid).code(), 100);
+    }
+}
+
+TEST_F(Session, isLookedUpInTheFileThatIsThereNow) {
+    addAccount("alice", true);
+    const std::string before = session("alice");
+    for (int i = 0; i < 20; ++i) {
+        ASSERT_EQ(call(kNode, 1, "info", {}, before).code(), 0);
+    }
+    std::filesystem::remove(OvraPlatform::kSessionsFile);
+    const std::string after = session("alice");
+    for (int i = 0; i < 20; ++i) {
+        EXPECT_EQ(call(kNode, 1, "info", {}, before).code(), 119);
+        EXPECT_EQ(call(kNode, 1, "info", {}, after).code(), 0);
+    }
 }
 
 TEST_F(Session, forANodeIsReusedAndTiedToTheCallersAccount) {

@@ -1,0 +1,197 @@
+#!/usr/bin/env bash
+# SPDX-License-Identifier: Apache-2.0
+# scenes.sh SCENE: one scene with two appliances, played with the installed programs
+# (OVRADR_LAB_PREFIX). Node 1 pairs with node 2, whose administrator is "replica".
+set -euo pipefail
+here=$(dirname "$(readlink -f "${BASH_SOURCE[0]}")")
+lab=$here/../../lab/lab
+work=$(mktemp -d /tmp/ove.XXXXXX)
+export OVRADR_LAB_DIR=$work/lab
+finish() {
+    "$lab" down >/dev/null 2>&1 || true
+    rm -rf "$work"
+}
+trap finish EXIT
+
+fail() {
+    printf 'FAILED: %s\n--- last output:\n%s\n' "$1" "${output-}"
+    for node in 1 2; do
+        printf -- '--- log of node %s:\n' "$node"
+        "$lab" log "$node" | tail -n 15 || true
+    done
+    exit 1
+}
+
+# on NODE CODE COMMAND...: runs a command on a node and expects its exit code; sets output.
+on() {
+    local node=$1 wanted=$2 code=0
+    shift 2
+    output=$("$lab" run "$node" -- timeout 60 "$@" 2>&1 </dev/null) || code=$?
+    ((code == wanted)) || fail "exit code $code instead of $wanted: $*"
+}
+says() { [[ $output == *"$1"* ]] || fail "the output does not say \"$1\""; }
+logSays() { "$lab" log "$1" | grep -qF -- "$2" || fail "the log of node $1 does not say \"$2\""; }
+
+password=correct-horse-battery
+up() {
+    "$lab" up 2 >/dev/null || fail "the lab does not come up"
+    url=https://$("$lab" addr 2):5001
+    on 1 0 sh -c "umask 077; printf %s '$password' >/usr/ovra/pw"
+    on 2 0 sh -c "umask 077; printf %s '$password' >/usr/ovra/pw"
+    on 2 0 ovradr user add replica --admin --password-file /usr/ovra/pw
+    on 2 0 ovradr node id
+    remote=$output
+    key=$(fingerprint)
+}
+# The fingerprint of node 2's key for HTTPS.
+fingerprint() {
+    "$lab" run 2 -- ovradr conn local | sed -n 's/^https.*\(SHA256:[^ ]*\).*/\1/p' | head -n 1
+}
+create() {
+    local code=$1
+    shift
+    on 1 "$code" ovradr cred create "$url" --account replica --password-file /usr/ovra/pw \
+        --fingerprint "$key" "$@"
+}
+info() { on 1 "$1" ovradr call "$remote" OVRA.DR.Node info; }
+
+pairAndTalk() {
+    create 0
+    info 0
+    says "$remote"
+    on 1 0 ovradr --json cred list --node "$remote"
+    says '"node_id"'
+    [[ $output != *'"session"'* ]] || fail "a session id is shown"
+    on 1 0 ovradr call local OVRA.DR.Node info
+    [[ $output != *"$remote"* ]] || fail "the local node answered as the remote one"
+    # Over plain HTTP everything secret travels sealed.
+    on 1 0 ovradr conn test "http://$("$lab" addr 2):5000"
+    key=$("$lab" run 2 -- ovradr conn local | sed -n 's/^http:.*\(SHA256:[^ ]*\).*/\1/p' | head -n 1)
+    url=http://$("$lab" addr 2):5000
+    create 0
+    info 0
+    for node in 1 2; do
+        ! "$lab" log "$node" | grep -qF "$password" || fail "the password is in a log"
+    done
+}
+
+oneTimeCodeAndPassword() {
+    on 2 0 ovradr user totp replica --show
+    local secret
+    secret=$(sed -n 's/^secret: *//p' <<<"$output" | tr -d ' ')
+    create 5
+    create 5 --otp 000000
+    says "one-time code"
+    create 0 --otp "$(oathtool --totp --base32 "$secret")"
+    info 0
+    on 1 0 sh -c "printf wrong-password >/usr/ovra/pw"
+    create 4 --otp "$(oathtool --totp --base32 "$secret")"
+    on 1 0 sh -c "printf %s '$password' >/usr/ovra/pw"
+    on 2 0 ovradr user disable replica
+    create 4
+    info 4
+    on 1 0 ovradr cred list
+    (($(wc -l <<<"$output") == 2)) || fail "a refused log-in left a credential"
+}
+
+changedCertificate() {
+    create 0
+    info 0
+    on 2 0 sh -c 'rm /usr/ovra/etc/ovradr/ovradrd.key /usr/ovra/etc/ovradr/ovradrd.crt; ovradr setup'
+    restartDaemon
+    info 6
+    says "key"
+    create 6
+    logSays 1 "cred error [6]"
+}
+
+deadEndpoint() {
+    on 1 3 ovradr conn test "https://$("$lab" addr 2):5999"
+    on 1 3 ovradr conn test "https://no-such-host.invalid:5001"
+    on 1 3 ovradr cred create "https://$("$lab" addr 2):5999" --account replica \
+        --password-file /usr/ovra/pw --fingerprint "$key"
+    create 0
+    stopDaemon
+    info 3
+    on 1 7 ovradr call 00000000-dead OVRA.DR.Node info
+    startDaemon
+    # The verdict lives five seconds.
+    for _ in 1 2 3 4 5 6 7 8; do
+        "$lab" run 1 -- ovradr call "$remote" OVRA.DR.Node info >/dev/null 2>&1 && return
+        sleep 1
+    done
+    fail "the node does not come back"
+}
+
+damagedDatabase() {
+    create 0
+    local db=/usr/ovra/etc/ovradr/node.db
+    on 1 0 ovradr user add someone --password-file /usr/ovra/pw # makes a database of another schema
+    on 1 0 cp "$db" /usr/ovra/keep.db
+    for damage in "rm $db" ": >$db" "printf rubbish-%5000d 0 >$db" \
+        "rm $db; cp /usr/ovra/var/ovradr/accounts.db $db"; do
+        on 1 0 sh -c "$damage"
+        on 1 9 ovradr cred list
+        output=$("$lab" run 1 -- ovradr call "$remote" OVRA.DR.Node info 2>&1) && fail "call without a database"
+        on 1 0 cp /usr/ovra/keep.db "$db"
+        info 0
+    done
+}
+
+damagedIdentityAndCaches() {
+    create 0
+    info 0
+    on 1 0 sh -c 'for f in /tmp/.ovradrcache/*; do head -c 200000 /dev/urandom >$f; done'
+    info 0
+    on 1 0 sh -c 'rm -r /tmp/.ovradrcache; ln -s /tmp /tmp/.ovradrcache'
+    info 0
+    logSays 1 "going on without a cache"
+    on 1 0 rm /tmp/.ovradrcache
+    on 1 0 sh -c "echo 'other=\"x\"' >/usr/ovra/etc/ovradr/node.info"
+    on 1 0 ovradr node id
+    local id=$output
+    on 1 0 ovradr node id
+    [[ $output == "$id" ]] || fail "the id does not stay"
+    on 1 0 cat /usr/ovra/etc/ovradr/node.info
+    says 'other="x"'
+}
+
+killedDaemon() {
+    create 0
+    for _ in 1 2 3; do
+        "$lab" run 2 -- pkill -KILL -x ovradrd || fail "no daemon to kill"
+        startDaemon
+        create 0
+    done
+    sleep 6
+    info 0
+    on 1 0 ovradr cred list
+    (($(wc -l <<<"$output") == 5)) || fail "a credential is missing"
+}
+
+stopDaemon() { "$lab" run 2 -- pkill -TERM -x ovradrd || fail "no daemon to stop"; waitGone; }
+waitGone() {
+    for _ in $(seq 50); do
+        "$lab" run 2 -- pgrep -x ovradrd >/dev/null || return 0
+        sleep 0.1
+    done
+    fail "ovradrd does not end"
+}
+# In the background of the node, as its init would; the lab ends it.
+startDaemon() {
+    waitGone
+    "$lab" run 2 -- sh -c 'ovradrd >/tmp/ovradrd.out 2>&1 &'
+    for _ in $(seq 100); do
+        "$lab" run 1 -- ovradr conn test "$url" >/dev/null 2>&1 && return
+        sleep 0.1
+    done
+    fail "ovradrd does not come back"
+}
+restartDaemon() {
+    stopDaemon
+    startDaemon
+}
+
+up
+"$1"
+echo "scene $1 as it should be"
