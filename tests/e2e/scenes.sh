@@ -89,7 +89,7 @@ oneTimeCodeAndPassword() {
     on 1 0 sh -c "printf %s '$password' >/usr/ovra/pw"
     on 2 0 ovradr user disable replica
     create 4
-    info 4
+    info 8
     on 1 0 ovradr cred list
     (($(wc -l <<<"$output") == 2)) || fail "a refused log-in left a credential"
 }
