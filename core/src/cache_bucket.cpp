@@ -78,6 +78,10 @@ CacheEntry toEntry(const EntryHeader &header, std::string_view name, std::string
 
 } // namespace
 
+std::uint64_t BucketImage::claimedSequence(const std::byte *copy) {
+    return headerOf(copy).sequence;
+}
+
 std::optional<std::uint64_t> BucketImage::check(const std::byte *copy, std::uint32_t bucketCount,
                                                 std::uint32_t bucketIndex) {
     const Header header = headerOf(copy);

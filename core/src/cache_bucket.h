@@ -26,6 +26,8 @@ class BucketImage {
 public:
     static constexpr std::size_t kSize = 4096;
 
+    /// What the copy says of its age, before anything of it is checked.
+    static std::uint64_t claimedSequence(const std::byte *copy);
     /// Checks the copy and its place in the file.
     /// \return the sequence number (0: never written), or nothing when the copy is damaged.
     static std::optional<std::uint64_t> check(const std::byte *copy, std::uint32_t bucketCount,

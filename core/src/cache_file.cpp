@@ -123,14 +123,18 @@ struct Choice {
     std::uint64_t sequence = 0;
 };
 
+/// The copy that claims to be newer is looked at first, and the other one only when that is
+/// damaged.
 Choice choose(const Pair &pair, std::uint32_t buckets, std::uint32_t index) {
-    const auto first = BucketImage::check(pair.data(), buckets, index);
-    const auto second = BucketImage::check(pair.data() + BucketImage::kSize, buckets, index);
-    if (first && (!second || *first >= *second)) {
-        return {true, 0, *first};
-    }
-    if (second) {
-        return {true, 1, *second};
+    const std::byte *second = pair.data() + BucketImage::kSize;
+    const bool secondIsNewer =
+        BucketImage::claimedSequence(second) > BucketImage::claimedSequence(pair.data());
+    const std::size_t likely = secondIsNewer ? 1 : 0;
+    for (const std::size_t which : {likely, 1 - likely}) {
+        const std::byte *copy = pair.data() + which * BucketImage::kSize;
+        if (const auto sequence = BucketImage::check(copy, buckets, index)) {
+            return {true, which, *sequence};
+        }
     }
     return {};
 }
