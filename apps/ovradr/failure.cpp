@@ -140,7 +140,7 @@ std::string detailText(int code, const Json::Value &detail) {
     const std::string text = OvraDRCore::memberString(detail, "text");
     const std::string parameter = OvraDRCore::memberString(detail, "param");
     if (!text.empty()) {
-        return parameter.empty() ? text : parameter + ": " + text;
+        return text.starts_with(parameter) ? text : parameter + ": " + text;
     }
     return detail.isNull() ? std::string() : OvraDRCore::toLogString(detail);
 }
@@ -151,9 +151,11 @@ bool saysItAll(int code) {
            code == APIError::kNoSuchVersion || code == APIError::kNoSession;
 }
 
-/// Our daemons and our credential library say what is wrong and, behind a colon, what to do.
+/// Our daemons and our credential library say what is wrong and, behind a colon, what to do. What
+/// they say about a parameter is one piece.
 bool hasAdvice(int code) {
-    return code < ERR::kBadParameter || code == ERR::kCredLibrary;
+    return (code < ERR::kBadParameter && code != APIError::kBadParameter) ||
+           code == ERR::kCredLibrary;
 }
 
 std::string sentence(std::string text) {

@@ -5,6 +5,7 @@
 
 #include <core/unique_fd.h>
 #include <fcntl.h>
+#include <poll.h>
 #include <sodium.h>
 #include <sys/stat.h>
 #include <termios.h>
@@ -27,17 +28,22 @@ void noteSignal(int number) {
 }
 
 /// Switches the echo of the terminal off. A signal that would end the program waits until the echo
-/// is back.
+/// is back; it ends the wait for input.
 class NoEcho {
 public:
     NoEcho() {
         pendingSignal = 0;
         struct sigaction note {};
-        note.sa_handler = noteSignal; // without SA_RESTART: it ends the read
+        note.sa_handler = noteSignal;
         sigemptyset(&note.sa_mask);
+        sigset_t blocked;
+        sigemptyset(&blocked);
         for (std::size_t i = 0; i < kSignals.size(); ++i) {
+            sigaddset(&blocked, kSignals.at(i));
             sigaction(kSignals.at(i), &note, &before_.at(i));
         }
+        // Let through only while waiting, so that none falls between a look and the wait.
+        pthread_sigmask(SIG_BLOCK, &blocked, &mask_);
         termios silent{};
         if (tcgetattr(STDIN_FILENO, &terminal_) == 0) {
             silent = terminal_;
@@ -55,18 +61,30 @@ public:
         for (std::size_t i = 0; i < kSignals.size(); ++i) {
             sigaction(kSignals.at(i), &before_.at(i), nullptr);
         }
+        pthread_sigmask(SIG_SETMASK, &mask_, nullptr);
         if (pendingSignal != 0) {
             std::fputc('\n', stderr);
             std::raise(pendingSignal);
         }
     }
     bool works() const { return changed_; }
+    /// False when a signal came instead.
+    bool waitForInput() const {
+        pollfd input{STDIN_FILENO, POLLIN, 0};
+        while (ppoll(&input, 1, nullptr, &mask_) < 0 && errno == EINTR) {
+            if (pendingSignal != 0) {
+                return false;
+            }
+        }
+        return true;
+    }
 
 private:
     static constexpr std::array kSignals = {SIGINT, SIGTERM, SIGHUP, SIGQUIT};
 
     termios terminal_{};
     bool changed_ = false;
+    sigset_t mask_{};
     std::array<struct sigaction, kSignals.size()> before_{};
 };
 
@@ -81,7 +99,7 @@ Expected<Secret> readLine(int fd, const std::string &where) {
     char c = 0;
     for (;;) {
         const ssize_t count = read(fd, &c, 1);
-        if (count < 0 && errno == EINTR && pendingSignal == 0) {
+        if (count < 0 && errno == EINTR) {
             continue;
         }
         if (count < 0) {
@@ -154,6 +172,10 @@ Expected<Secret> askSecret(const std::string &question) {
     }
     std::fprintf(stderr, "%s: ", printable(question).c_str());
     std::fflush(stderr);
+    if (!noEcho.waitForInput()) {
+        return failure(ExitCode::kFailed, "The question was interrupted.", "");
+    }
+    // A terminal gives a line at once, when it is complete.
     return readLine(STDIN_FILENO, "the terminal");
 }
 

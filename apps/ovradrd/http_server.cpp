@@ -116,7 +116,8 @@ struct DestroyResponse {
     void operator()(MHD_Response *response) const { MHD_destroy_response(response); }
 };
 
-void logLibrary(void * /*self*/, const char *format, va_list arguments) {
+__attribute__((format(printf, 2, 0))) void logLibrary(void * /*self*/, const char *format,
+                                                      va_list arguments) {
     std::array<char, 512> line{};
     std::vsnprintf(line.data(), line.size(), format, arguments);
     OVRA_DEBUG("%s", line.data());

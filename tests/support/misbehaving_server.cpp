@@ -198,12 +198,15 @@ Answer Answer::truncated(const std::string &document) {
 }
 
 Answer Answer::huge(std::size_t size, bool announced) {
+    Answer answer;
+    answer.bytes = "HTTP/1.1 200 OK\r\nContent-Type: application/json\r\n";
     if (announced) {
-        return json(std::string(size, ' '));
+        answer.bytes += "Content-Length: " + std::to_string(size) + "\r\n";
     }
-    return {"HTTP/1.1 200 OK\r\nContent-Type: application/json\r\n\r\n" + std::string(size, ' '),
-            {},
-            Ending::kClose};
+    answer.bytes += "\r\n";
+    answer.blanks = size;
+    answer.ending = Ending::kClose;
+    return answer;
 }
 
 Answer Answer::drip(std::chrono::milliseconds pausePerByte) {
@@ -318,9 +321,22 @@ struct MisbehavingServer::Impl {
         }
     }
 
+    static bool sendBlanks(Stream &stream, std::size_t count) {
+        static const std::string kBlanks(65536, ' ');
+        while (count > 0) {
+            const std::size_t chunk = std::min(count, kBlanks.size());
+            if (!stream.writeAll(kBlanks.data(), chunk)) {
+                return false;
+            }
+            count -= chunk;
+        }
+        return true;
+    }
+
     static bool sendAnswer(Stream &stream, const Answer &answer) {
         if (answer.pausePerByte.count() == 0) {
-            return stream.writeAll(answer.bytes.data(), answer.bytes.size());
+            return stream.writeAll(answer.bytes.data(), answer.bytes.size()) &&
+                   sendBlanks(stream, answer.blanks);
         }
         for (const char &byte : answer.bytes) {
             std::this_thread::sleep_for(answer.pausePerByte);

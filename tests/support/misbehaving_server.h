@@ -16,6 +16,7 @@ struct Answer {
     std::string bytes;
     std::chrono::milliseconds pausePerByte{0};
     Ending ending = Ending::kKeep;
+    std::size_t blanks = 0; ///< sent after `bytes`; a huge answer is never held in memory
 
     /// A whole HTTP answer; the connection stays open.
     static Answer http(int status, const std::string &type, const std::string &body,

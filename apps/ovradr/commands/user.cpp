@@ -39,7 +39,14 @@ Failure storeFailure(ExitCode exit, const std::string &sentences) {
 }
 
 Trouble checkOpen(const AccountStore &store) {
-    return store.isOpen() ? Trouble() : storeFailure(ExitCode::kNotSetUp, store.error());
+    if (store.isOpen()) {
+        return std::nullopt;
+    }
+    Failure why = storeFailure(ExitCode::kNotSetUp, store.error());
+    if (geteuid() != 0) {
+        why.hint = "Run the command as root.";
+    }
+    return why;
 }
 
 /// The account, or why it cannot be had.

@@ -57,6 +57,32 @@ TEST(Output, EveryErrorOfTheLibraryHasItsSentence) {
     }
 }
 
+TEST(Output, WhatComesWithAnErrorIsToldAndBecomesAdviceWhereItIsSome) {
+    Json::Value parameter;
+    parameter["param"] = "conns";
+    parameter["text"] = "has to be one of: a, b";
+    const struct {
+        int code;
+        Json::Value detail;
+        const char *message;
+        const char *hint;
+    } cases[] = {
+        {100, "no daemon on /x: start it",
+         "The appliance could not carry out the request (no daemon on /x).", "Start it."},
+        {103, "no such method: look", "The API has no such method.", nullptr},
+        {106, parameter, "The appliance refused a parameter (conns: has to be one of: a, b).",
+         nullptr},
+        {401, "conn", "An argument is empty or not valid (conn).", nullptr},
+        {524, 7, "The request failed (the reply is too large).", nullptr},
+        {9999, Json::Value(), "Error 9999.", nullptr},
+    };
+    for (const auto &each : cases) {
+        const Failure found = failureOf(each.code, each.detail);
+        EXPECT_EQ(found.message, each.message);
+        EXPECT_TRUE(each.hint == nullptr || found.hint == each.hint) << found.hint;
+    }
+}
+
 TEST(Output, WhatComesWithAnErrorIsToldButNoSecretInIt) {
     Json::Value detail;
     detail["session"] = "s3cret";

@@ -19,6 +19,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <cerrno>
 #include <chrono>
 #include <cstdio>
 #include <cstdlib>
@@ -182,6 +183,11 @@ RawConnection::~RawConnection() {
     if (fd_ >= 0) {
         close(fd_);
     }
+}
+
+bool RawConnection::isOpen() const {
+    char byte = 0;
+    return recv(fd_, &byte, 1, MSG_PEEK | MSG_DONTWAIT) < 0 && errno == EAGAIN;
 }
 
 bool RawConnection::send(const std::string &bytes) const {

@@ -75,7 +75,8 @@ public:
     RawConnection(const RawConnection &) = delete;
     ~RawConnection();
 
-    bool isOpen() const { return fd_ >= 0; }
+    /// Whether the other end has neither closed nor said anything.
+    bool isOpen() const;
     /// False when the other end is gone.
     bool send(const std::string &bytes) const;
     /// What comes until the other end closes, or until `seconds` have passed.
