@@ -32,7 +32,6 @@ namespace Ovradrd {
 namespace {
 
 namespace APIError = OvraPlatform::APIError;
-using OvraPlatform::UniqueFd;
 using Phase = Connections::Phase;
 
 constexpr std::string_view kEntryPoint = "/webapi/query.cgi";
@@ -167,7 +166,6 @@ struct HttpServer::Impl {
     struct Door {
         Impl *server = nullptr;
         bool secure = false;
-        UniqueFd quiesced; ///< the socket, once it takes no connections; outlives the daemon
         std::unique_ptr<MHD_Daemon, StopMhd> daemon;
     };
 
@@ -217,7 +215,7 @@ struct HttpServer::Impl {
 
 MHD_Result HttpServer::Impl::onAccept(void *door, const sockaddr *address, socklen_t /*size*/) {
     auto &server = *static_cast<Door *>(door)->server;
-    return server.connections.admit(clientOf(address)) ? MHD_YES : MHD_NO;
+    return !server.closing && server.connections.admit(clientOf(address)) ? MHD_YES : MHD_NO;
 }
 
 void HttpServer::Impl::onConnection(void *door, MHD_Connection *connection, void **context,
@@ -434,7 +432,7 @@ bool HttpServer::Impl::open(Listener listener, bool secure, const TlsIdentity &i
     if (door->daemon == nullptr) {
         return false;
     }
-    // The library closes the socket, unless it is told to quiesce.
+    // The library closes the socket.
     listener.socket.release();
     doors.push_back(std::move(door));
     return true;
@@ -466,12 +464,9 @@ bool HttpServer::start(std::vector<Listener> https, std::vector<Listener> http,
 }
 
 void HttpServer::quiesce() {
+    // Not by MHD_quiesce_daemon(): in 0.9.75 that aborts the process when a thread of the daemon
+    // wakes up at the same moment and takes the socket out of its epoll set first.
     impl_->closing = true;
-    for (const auto &door : impl_->doors) {
-        if (!door->quiesced) {
-            door->quiesced.reset(MHD_quiesce_daemon(door->daemon.get()));
-        }
-    }
 }
 
 void HttpServer::stop() {

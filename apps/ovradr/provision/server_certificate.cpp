@@ -135,7 +135,7 @@ Certificate makeCertificate(EVP_PKEY *key, const ServerNames &names) {
 } // namespace
 
 Expected<SetUpStep> provisionTlsKey(const std::string &path) {
-    const Key key(EVP_EC_gen("P-256"));
+    const Key key(EVP_PKEY_Q_keygen(nullptr, nullptr, "EC", "P-256"));
     const Bio text(BIO_new(BIO_s_secmem()));
     if (!key || !text ||
         PEM_write_bio_PKCS8PrivateKey(text.get(), key.get(), nullptr, nullptr, 0, nullptr,

@@ -22,6 +22,7 @@ using OvraPlatform::LoginResult;
 using OvraPlatform::SessionStore;
 
 constexpr char kApi[] = "OVRA.Core.Auth";
+constexpr int kApiVersion = 1;
 constexpr char kLogin[] = "login";
 constexpr char kLogout[] = "logout";
 constexpr char kAccount[] = "account";
@@ -84,7 +85,7 @@ Json::Value logout(const Json::Value & /*params*/, const APICaller &caller) {
 } // namespace
 
 bool LoginDesk::isLogin(const OvraPlatform::APICall &call) {
-    return call.api == kApi && call.method == kLogin;
+    return call.api == kApi && call.version == kApiVersion && call.method == kLogin;
 }
 
 std::optional<std::chrono::milliseconds> LoginDesk::admit(const Json::Value &params,
@@ -97,6 +98,10 @@ void LoginDesk::forgive(const Json::Value &params, const std::string &address) {
 }
 
 Json::Value LoginDesk::login(const Json::Value &params, const APICaller &caller) {
+    if (caller.local) {
+        // Nor was it admitted: it came in no lane of its own, and counts for nothing.
+        return apiError(OvraPlatform::APIError::kBadRequest, "a local caller needs no log-in");
+    }
     Params in(params);
     const std::string account = in.text(kAccount, Params::kLongestAccount);
     std::string password = in.secret("passwd", Params::kLongestPassword);
@@ -127,11 +132,11 @@ Json::Value LoginDesk::login(const Json::Value &params, const APICaller &caller)
 void LoginDesk::addTo(OvraPlatform::APIRegistry &registry) {
     using OvraPlatform::APILane;
     using OvraPlatform::APIRight;
-    registry.add(kApi, 1, kLogin, APIRight::kNone, APILane::kQuick,
+    registry.add(kApi, kApiVersion, kLogin, APIRight::kNone, APILane::kQuick,
                  [this](const Json::Value &params, const APICaller &caller) {
                      return login(params, caller);
                  });
-    registry.add(kApi, 1, kLogout, APIRight::kSession, APILane::kQuick, logout);
+    registry.add(kApi, kApiVersion, kLogout, APIRight::kSession, APILane::kQuick, logout);
 }
 
 } // namespace Ovradrd

@@ -47,8 +47,13 @@ Json::Value info(const Json::Value &params, const APICaller & /*caller*/) {
     if (!in.ok()) {
         return in.error();
     }
+    const std::string nodeId = DRNode::getLocalNodeId();
+    if (nodeId.empty()) {
+        return apiError(OvraPlatform::APIError::kInternal,
+                        "the node id cannot be read now: see the log of the appliance");
+    }
     Json::Value data(Json::objectValue);
-    data["node_id"] = DRNode::getLocalNodeId();
+    data["node_id"] = nodeId;
     data["serial"] = DRNode::getLocalSerial();
     data["hostname"] = DRNode::getLocalHostName();
     if (in.has("additional")) {

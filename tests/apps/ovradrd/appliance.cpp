@@ -195,29 +195,33 @@ bool RawConnection::send(const std::string &bytes) const {
            static_cast<ssize_t>(bytes.size());
 }
 
-std::string RawConnection::readAll(int seconds) const {
-    const auto end = std::chrono::steady_clock::now() + std::chrono::seconds(seconds);
-    std::string all;
+bool RawConnection::drain(std::chrono::milliseconds time, std::string &all) const {
+    const auto end = std::chrono::steady_clock::now() + time;
     for (;;) {
-        const auto left = std::chrono::duration_cast<std::chrono::milliseconds>(
-            end - std::chrono::steady_clock::now());
+        const auto left =
+            std::chrono::ceil<std::chrono::milliseconds>(end - std::chrono::steady_clock::now());
         pollfd waiting{fd_, POLLIN, 0};
         char part[4096];
         if (left.count() <= 0 || poll(&waiting, 1, static_cast<int>(left.count())) <= 0) {
-            return all;
+            return false;
         }
         const ssize_t got = recv(fd_, part, sizeof(part), 0);
         if (got <= 0) {
-            return all;
+            return true;
         }
         all.append(part, static_cast<std::size_t>(got));
     }
 }
 
-bool RawConnection::closesWithin(int seconds) const {
-    const auto begun = std::chrono::steady_clock::now();
-    readAll(seconds);
-    return std::chrono::steady_clock::now() - begun < std::chrono::seconds(seconds);
+std::string RawConnection::readAll(std::chrono::milliseconds time) const {
+    std::string all;
+    drain(time, all);
+    return all;
+}
+
+bool RawConnection::closesWithin(std::chrono::milliseconds time) const {
+    std::string all;
+    return drain(time, all);
 }
 
 } // namespace OvraTest

@@ -6,6 +6,7 @@
 #include <gtest/gtest.h>
 #include <json/json.h>
 
+#include <chrono>
 #include <memory>
 #include <string>
 
@@ -79,12 +80,15 @@ public:
     bool isOpen() const;
     /// False when the other end is gone.
     bool send(const std::string &bytes) const;
-    /// What comes until the other end closes, or until `seconds` have passed.
-    std::string readAll(int seconds) const;
-    /// Whether the other end closes within `seconds`.
-    bool closesWithin(int seconds) const;
+    /// What comes until the other end closes, or until the time is over.
+    std::string readAll(std::chrono::milliseconds time) const;
+    /// Whether the other end closes within the time.
+    bool closesWithin(std::chrono::milliseconds time) const;
 
 private:
+    /// Whether the other end closed.
+    bool drain(std::chrono::milliseconds time, std::string &all) const;
+
     int fd_;
 };
 

@@ -121,7 +121,7 @@ TEST_F(Credential, inBothDirectionsIsMadeThereAndBack) {
 }
 
 TEST_F(Credential, inBothDirectionsIsNotBegunWithoutAnAddressOfOnesOwn) {
-    OvraTest::writeFile(OvraPlatform::kConfigFile, "");
+    OvraTest::writeFile(OvraPlatform::kConfigFile, "address=\"192.0.2.1\"\n");
     Json::Value params = byAccount();
     params["cred_direction"] = "bidirection";
     EXPECT_EQ(ask("create", params).code(), 401);

@@ -6,7 +6,10 @@
 #include <sys/socket.h>
 #include <unistd.h>
 
-#include <vector>
+#include <chrono>
+#include <ostream>
+#include <string>
+#include <thread>
 
 namespace {
 
@@ -95,6 +98,10 @@ struct PhaseScene {
     const char *name;
     Phase phase;
     bool ends;
+
+    friend std::ostream &operator<<(std::ostream &out, const PhaseScene &scene) {
+        return out << scene.name;
+    }
 };
 
 class ConnectionPhase : public testing::TestWithParam<PhaseScene> {};

@@ -74,7 +74,7 @@ TEST_F(Wire, survivesRubbish) {
                           "Transfer-Encoding: chunked\r\n\r\nzz\r\n")}) {
             const RawConnection connection(port(tls));
             connection.send(bytes);
-            EXPECT_TRUE(connection.closesWithin(5)) << bytes.substr(0, 60);
+            EXPECT_TRUE(connection.closesWithin(std::chrono::seconds(5))) << bytes.substr(0, 60);
         }
     }
     EXPECT_EQ(http({.body = kGetInfo}).code(), 0);
@@ -87,7 +87,7 @@ TEST_F(Wire, keepsAConnectionForFurtherRequests) {
                                 "Content-Length: " +
                                 std::to_string(sizeof(kGetInfo) - 1) + "\r\n\r\n" + kGetInfo;
     connection.send(request + request);
-    const std::string replies = connection.readAll(1);
+    const std::string replies = connection.readAll(std::chrono::seconds(1));
     const std::size_t first = replies.find("public_key");
     ASSERT_NE(first, std::string::npos);
     EXPECT_NE(replies.find("public_key", first + 1), std::string::npos);

@@ -34,6 +34,7 @@ const Scene kScenes[] = {
     {"OVRA.None", 1, "get", "{}", 102, 102, 102},
     {kNode, 1, "none", "{}", 103, 103, 103},
     {kNode, 2, "info", "{}", 104, 104, 104},
+    {"OVRA.Core.Auth", 2, "login", "{}", 104, 104, 104},
     {"OVRA.Core.Encryption", 1, "getinfo", "{}", 0, 0, 0},
     {kUser, 1, "get", R"({"name":"user"})", 119, 0, 0},
     {kUser, 1, "get", R"({"name":"root"})", 119, 105, 0},
@@ -203,6 +204,8 @@ TEST_F(Node, servesItsOwnProcessesAsAdministrators) {
     EXPECT_EQ(askLocally("OVRA.Core.Farlink", "get")["data"], json(R"({"enabled":false})"));
     EXPECT_EQ(askLocally(kNode, "test_privilege")["success"], true);
     EXPECT_EQ(askLocally(kCredential, "create")["error"]["code"], 106);
+    EXPECT_EQ(askLocally("OVRA.Core.Auth", "login")["error"]["code"], 101);
+    EXPECT_EQ(askLocally("OVRA.Core.Auth", "logout")["error"]["code"], 119);
 }
 
 } // namespace
