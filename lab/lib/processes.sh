@@ -11,12 +11,17 @@ labProcesses() {
         marked+="${pid%/environ} "
     done < <(env -u OVRADR_LAB_ID grep -slzxF "OVRADR_LAB_ID=$1" /proc/[0-9]*/environ)
     [[ $marked != " " ]] || return 0
-    env -u OVRADR_LAB_ID awk -v marked="$marked" -v self="$$" '
-        FNR == 1 { pid = FILENAME; gsub(/[^0-9]/, "", pid); zombie = 0 }
-        $1 == "State:" && $2 ~ /[ZX]/ { zombie = 1 }
-        $1 == "TracerPid:" && !zombie && pid != self &&
-            (index(marked, " " pid " ") || ($2 != 0 && index(marked, " " $2 " "))) { print pid }
-    ' /proc/[0-9]*/status 2>/dev/null || true
+    tracedBy | env -u OVRADR_LAB_ID awk -v marked="$marked" -v self="$$" '
+        $1 != self && (index(marked, " " $1 " ") || ($2 != 0 && index(marked, " " $2 " "))) { print $1 }'
+}
+
+# tracedBy: a line for each living process, with its pid and that of who traces it (0 for nobody).
+# The files are read by grep, which goes on where a process ends meanwhile; awk stops there.
+tracedBy() {
+    env -u OVRADR_LAB_ID grep -sE '^(State|TracerPid):' /proc/[0-9]*/status |
+        env -u OVRADR_LAB_ID awk -F '[/:[:space:]]+' '
+            $5 == "State" { zombie = $6 ~ /[ZX]/ }
+            $5 == "TracerPid" && !zombie { print $3, $6 }' || true
 }
 
 # killLab ID: kills them all and looks again until none is left; false when some survive 5 seconds.

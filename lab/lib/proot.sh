@@ -38,9 +38,7 @@ prootRun() {
 killTraced() {
     local pids round
     for ((round = 0; round < 20; round++)); do
-        mapfile -t pids < <(awk -v proot="$1" '
-            FNR == 1 { pid = FILENAME; gsub(/[^0-9]/, "", pid) }
-            $1 == "TracerPid:" && $2 == proot { print pid }' /proc/[0-9]*/status 2>/dev/null)
+        mapfile -t pids < <(tracedBy | awk -v proot="$1" '$2 == proot { print $1 }')
         ((${#pids[@]})) || break
         kill -KILL "${pids[@]}" 2>/dev/null || true
     done
