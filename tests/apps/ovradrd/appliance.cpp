@@ -72,7 +72,8 @@ Json::Value json(const std::string &text) {
 }
 
 void Appliance::provision() {
-    require(std::getenv("OVRADR_LAB_WAY") != nullptr, "run this under lab/sandbox");
+    const char *const way = std::getenv("OVRADR_LAB_WAY"); // NOLINT(concurrency-mt-unsafe)
+    require(way != nullptr, "run this under lab/sandbox");
     provisionNode();
     require(OvraPlatform::ensureStateDir(), "no state folder");
     writeTlsFiles();

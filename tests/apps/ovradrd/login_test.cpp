@@ -93,10 +93,9 @@ TEST_F(Login, slowsGuessesDownWhileOthersAreServed) {
     }
     const std::string sid = session("alice");
     const auto begun = std::chrono::steady_clock::now();
-    std::vector<std::future<Reply>> guesses;
-    for (int i = 0; i < 3; ++i) {
-        guesses.push_back(
-            std::async(std::launch::async, [this] { return login("alice", "wrong password"); }));
+    std::array<std::future<Reply>, 3> guesses;
+    for (auto &guess : guesses) {
+        guess = std::async(std::launch::async, [this] { return login("alice", "wrong password"); });
     }
     std::this_thread::sleep_for(std::chrono::milliseconds(50));
     EXPECT_EQ(call("OVRA.DR.Node", 1, "info", {}, sid).code(), 0);

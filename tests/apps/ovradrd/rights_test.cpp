@@ -15,9 +15,9 @@ using OvraTest::Reply;
 
 struct Scene {
     const char *api;
-    int version;
     const char *method;
     const char *params;
+    int version;
     int nobody; ///< codes for a caller without a session, a user, and an administrator
     int user;
     int administrator;
@@ -30,41 +30,40 @@ constexpr char kCredential[] = "OVRA.DR.Node.Credential";
 constexpr char kOneEndpoint[] = R"({"conns":[{"addr":"127.0.0.1","protocol":"http","port":1}]})";
 
 const Scene kScenes[] = {
-
-    {"OVRA.None", 1, "get", "{}", 102, 102, 102},
-    {kNode, 1, "none", "{}", 103, 103, 103},
-    {kNode, 2, "info", "{}", 104, 104, 104},
-    {"OVRA.Core.Auth", 2, "login", "{}", 104, 104, 104},
-    {"OVRA.Core.Encryption", 1, "getinfo", "{}", 0, 0, 0},
-    {kUser, 1, "get", R"({"name":"user"})", 119, 0, 0},
-    {kUser, 1, "get", R"({"name":"root"})", 119, 105, 0},
-    {kUser, 1, "get", R"({"name":"none"})", 119, 105, 106},
-    {kUser, 1, "get", "{}", 119, 106, 106},
-    {"OVRA.Core.Farlink", 1, "get", "{}", 119, 105, 105},
-    {kNode, 1, "info", "{}", 119, 0, 0},
-    {kNode, 1, "info", R"({"additional":"timezone"})", 119, 106, 106},
-    {kNode, 1, "test_privilege", "{}", 119, 105, 0},
-    {kNode, 1, "test_connection", kOneEndpoint, 119, 105, 500},
-    {kNode, 1, "test_connection", "{}", 119, 105, 106},
-    {kSession, 1, "create", R"({"node_id":"n1"})", 104, 104, 104},
-    {kSession, 2, "create", R"({"node_id":"n1"})", 119, 105, 0},
-    {kSession, 2, "create", R"({"node_id":""})", 119, 105, 106},
-    {kSession, 1, "temp_create", "{}", 119, 105, 0},
-    {kSession, 1, "get", R"({"session":"none"})", 119, 528, 528},
-    {kSession, 1, "delete", R"({"session":"none"})", 119, 105, 0},
-    {kSession, 1, "delete", "{}", 119, 105, 106},
-    {kCredential, 1, "list", "{}", 119, 105, 0},
-    {kCredential, 1, "create", "{}", 119, 105, 106},
-    {kCredential, 1, "temp_create", "{}", 119, 105, 106},
-    {kCredential, 1, "test_create", "{}", 119, 105, 106},
-    {kCredential, 1, "set", "{}", 119, 105, 106},
-    {kCredential, 1, "test_set", "{}", 119, 105, 106},
-    {kCredential, 1, "get", R"({"cred_id":"none"})", 119, 105, 404},
-    {kCredential, 1, "delete", "{}", 119, 105, 106},
-    {kCredential, 1, "reverse_create", R"({"cred_id":"none"})", 119, 105, 404},
-    {kCredential, 1, "test_reverse_create", R"({"cred_id":"none"})", 119, 105, 404},
-    {kCredential, 1, "temp_reverse_create", R"({"cred_id":"none"})", 119, 105, 404},
-    {kCredential, 1, "relay", R"({"cred_id":"none","webapi":{}})", 119, 105, 404}};
+    {"OVRA.None", "get", "{}", 1, 102, 102, 102},
+    {kNode, "none", "{}", 1, 103, 103, 103},
+    {kNode, "info", "{}", 2, 104, 104, 104},
+    {"OVRA.Core.Auth", "login", "{}", 2, 104, 104, 104},
+    {"OVRA.Core.Encryption", "getinfo", "{}", 1, 0, 0, 0},
+    {kUser, "get", R"({"name":"user"})", 1, 119, 0, 0},
+    {kUser, "get", R"({"name":"root"})", 1, 119, 105, 0},
+    {kUser, "get", R"({"name":"none"})", 1, 119, 105, 106},
+    {kUser, "get", "{}", 1, 119, 106, 106},
+    {"OVRA.Core.Farlink", "get", "{}", 1, 119, 105, 105},
+    {kNode, "info", "{}", 1, 119, 0, 0},
+    {kNode, "info", R"({"additional":"timezone"})", 1, 119, 106, 106},
+    {kNode, "test_privilege", "{}", 1, 119, 105, 0},
+    {kNode, "test_connection", kOneEndpoint, 1, 119, 105, 500},
+    {kNode, "test_connection", "{}", 1, 119, 105, 106},
+    {kSession, "create", R"({"node_id":"n1"})", 1, 104, 104, 104},
+    {kSession, "create", R"({"node_id":"n1"})", 2, 119, 105, 0},
+    {kSession, "create", R"({"node_id":""})", 2, 119, 105, 106},
+    {kSession, "temp_create", "{}", 1, 119, 105, 0},
+    {kSession, "get", R"({"session":"none"})", 1, 119, 528, 528},
+    {kSession, "delete", R"({"session":"none"})", 1, 119, 105, 0},
+    {kSession, "delete", "{}", 1, 119, 105, 106},
+    {kCredential, "list", "{}", 1, 119, 105, 0},
+    {kCredential, "create", "{}", 1, 119, 105, 106},
+    {kCredential, "temp_create", "{}", 1, 119, 105, 106},
+    {kCredential, "test_create", "{}", 1, 119, 105, 106},
+    {kCredential, "set", "{}", 1, 119, 105, 106},
+    {kCredential, "test_set", "{}", 1, 119, 105, 106},
+    {kCredential, "get", R"({"cred_id":"none"})", 1, 119, 105, 404},
+    {kCredential, "delete", "{}", 1, 119, 105, 106},
+    {kCredential, "reverse_create", R"({"cred_id":"none"})", 1, 119, 105, 404},
+    {kCredential, "test_reverse_create", R"({"cred_id":"none"})", 1, 119, 105, 404},
+    {kCredential, "temp_reverse_create", R"({"cred_id":"none"})", 1, 119, 105, 404},
+    {kCredential, "relay", R"({"cred_id":"none","webapi":{}})", 1, 119, 105, 404}};
 
 class Rights : public Appliance {};
 
