@@ -55,6 +55,7 @@ void describe(CLI::App &app, bool &json, Command &chosen) {
     addCredCommands(app, chosen);
     addCallCommand(app, chosen);
     addConnCommands(app, chosen);
+    addAttrCommands(app, chosen);
 }
 
 constexpr const char *kHelpHint =

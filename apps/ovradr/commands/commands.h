@@ -21,6 +21,7 @@ void addUserCommands(CLI::App &app, Command &chosen);
 void addCredCommands(CLI::App &app, Command &chosen);
 void addCallCommand(CLI::App &app, Command &chosen);
 void addConnCommands(CLI::App &app, Command &chosen);
+void addAttrCommands(CLI::App &app, Command &chosen);
 
 /// --password-file and --password-stdin; `source` has to live as long as `command`.
 void addPasswordOptions(CLI::App &command, PasswordSource &source);

@@ -1,0 +1,150 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "commands/commands.h"
+#include "node_ref.h"
+#include "output.h"
+#include "provision/node_database.h"
+
+#include <ovradrnode/node_db.h>
+
+#include <algorithm>
+#include <memory>
+#include <vector>
+
+namespace Ovradr {
+
+namespace {
+
+using OvraDRNode::DRNodeAttr;
+using OvraDRNode::DRNodeDB;
+
+constexpr std::size_t kLongestName = 255;
+constexpr std::size_t kLongestValue = std::size_t{64} * 1024;
+
+struct AttrOptions {
+    std::string node;
+    std::string app;
+    std::string attr;
+    std::string value;
+};
+
+std::string checkName(const std::string &name) {
+    return name.empty() || name.size() > kLongestName ? "a name has 1 to 255 bytes" : "";
+}
+
+std::string checkValue(const std::string &value) {
+    return value.size() > kLongestValue ? "a value has at most 64 KiB" : "";
+}
+
+/// Every attribute that the application keeps about the node; `options.node` is a node id.
+Expected<std::vector<DRNodeAttr>> read(const AttrOptions &options) {
+    std::vector<DRNodeAttr> attrs;
+    if (const Trouble trouble = checkNodeDatabase()) {
+        return *trouble;
+    }
+    if (!DRNodeDB::ListAttr(options.node, options.app, attrs)) {
+        return failure(ExitCode::kNotSetUp, "The attributes cannot be read.",
+                       "The system log says why.");
+    }
+    return attrs;
+}
+
+Outcome set(const AttrOptions &options) {
+    if (const Trouble trouble = checkNodeDatabase()) {
+        return *trouble;
+    }
+    const DRNodeAttr attr(options.node, options.app, options.attr, options.value);
+    if (!DRNodeDB::SetAttr(attr)) {
+        return failure(ExitCode::kNotSetUp, "The attribute cannot be stored.",
+                       "Check that the disk is neither full nor read-only; the system log says "
+                       "more.");
+    }
+    Report report;
+    report.data = attr.toJson();
+    return report;
+}
+
+Outcome get(const AttrOptions &options) {
+    const Expected<std::vector<DRNodeAttr>> attrs = read(options);
+    if (!attrs) {
+        return attrs.failure();
+    }
+    const auto found =
+        std::find_if(attrs->begin(), attrs->end(),
+                     [&options](const DRNodeAttr &attr) { return attr.attr == options.attr; });
+    if (found == attrs->end()) {
+        return failure(ExitCode::kNotFound,
+                       "The application \"" + options.app + "\" keeps no attribute \"" +
+                           options.attr + "\" about this node.",
+                       "`ovradr attr list NODE APP` shows those that there are.");
+    }
+    Report report;
+    report.data = found->toJson();
+    report.text = printable(found->value) + "\n";
+    return report;
+}
+
+Outcome list(const AttrOptions &options) {
+    const Expected<std::vector<DRNodeAttr>> attrs = read(options);
+    if (!attrs) {
+        return attrs.failure();
+    }
+    Report report;
+    report.data["attrs"] = Json::Value(Json::arrayValue);
+    std::vector<std::vector<std::string>> rows;
+    for (const DRNodeAttr &attr : *attrs) {
+        report.data["attrs"].append(attr.toJson());
+        rows.push_back({attr.attr, attr.value});
+    }
+    report.text = rows.empty() ? "The application keeps no attributes about this node.\n"
+                               : table({"ATTRIBUTE", "VALUE"}, rows);
+    return report;
+}
+
+using Action = Outcome (*)(const AttrOptions &);
+
+CLI::App *addAction(CLI::App &family, const char *name, const char *description,
+                    const std::shared_ptr<AttrOptions> &options, Command &chosen, Action action) {
+    CLI::App *command = family.add_subcommand(name, description);
+    command->add_option("NODE", options->node, "\"local\", a node id, or the beginning of one")
+        ->required();
+    command->add_option("APP", options->app, "Name of the application that keeps it")
+        ->required()
+        ->check(checkName);
+    command->callback([&chosen, options, action] {
+        chosen = [options, action]() -> Outcome {
+            const Expected<std::string> nodeId = resolveNode(options->node);
+            if (!nodeId) {
+                return nodeId.failure();
+            }
+            options->node = *nodeId;
+            return action(*options);
+        };
+    });
+    return command;
+}
+
+} // namespace
+
+void addAttrCommands(CLI::App &app, Command &chosen) {
+    CLI::App *family = app.add_subcommand("attr", "Texts that applications keep about a node.");
+    family->require_subcommand(1);
+    const auto options = std::make_shared<AttrOptions>();
+    CLI::App *setCommand =
+        addAction(*family, "set", "Set an attribute, new or not.", options, chosen, set);
+    CLI::App *getCommand =
+        addAction(*family, "get", "Print the value of an attribute.", options, chosen, get);
+    for (CLI::App *command : {setCommand, getCommand}) {
+        command->add_option("ATTR", options->attr, "Name of the attribute")
+            ->required()
+            ->check(checkName);
+    }
+    setCommand->add_option("VALUE", options->value, "Its value, which may be empty; not a secret")
+        ->required()
+        ->check(checkValue);
+    setCommand->footer("Example:\n  ovradr attr set 3f2a backup site 'Rack 7, Zürich'");
+    getCommand->footer("Example:\n  ovradr attr get 3f2a backup site");
+    addAction(*family, "list", "List the attributes of a node.", options, chosen, list)
+        ->footer("Example:\n  ovradr attr list local backup");
+}
+
+} // namespace Ovradr
