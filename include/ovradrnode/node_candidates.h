@@ -20,7 +20,7 @@ struct CachedVerdict {
 };
 
 /// One credential of a node as a sender to that node would meet it now.
-struct NodeCandidate {
+struct OVRADRNODE_EXPORT NodeCandidate {
     /// What a request sent now would do with it, as far as the caches tell.
     enum class Outlook {
         kNext,        ///< tried next
@@ -43,8 +43,9 @@ struct NodeCandidate {
 
 /// Why a request to `nodeId` goes the way that it goes: the credentials in the order in which
 /// NodeSender would try them. Reads the database and the caches and sends nothing. The remembered
-/// credential stands first as long as it is remembered; what is stale is asked again by whoever
-/// sends, and may then turn out differently.
+/// credential stands first for 5 seconds, and longer while it may have the right; else the first
+/// lasting one that may. What is stale is asked again by whoever sends, and may then turn out
+/// differently.
 /// \return no candidate for a node that is not known, or is the local one.
 OVRADRNODE_EXPORT std::vector<NodeCandidate> listNodeCandidates(const std::string &nodeId);
 

@@ -63,6 +63,40 @@ void addCandidates(const std::string &nodeId, DRNodeDB::CredType type,
     }
 }
 
+bool isDenied(const CachedVerdict &verdict) {
+    return verdict.fresh && !verdict.value;
+}
+
+bool mayHaveRight(const NodeCandidate &candidate) {
+    return candidate.node.isValid() && !isDenied(candidate.reachable) &&
+           !isDenied(candidate.privilege);
+}
+
+/// The credential that a sender takes before it goes through the list; "" when there is none. One
+/// that is remembered for too long counts only if it may still have the right, as the sender tests
+/// that first; when it has not, the sender looks for the first of the lasting ones that has.
+std::string firstCredId(const NodeValidCredCache &cache,
+                        const std::vector<NodeCandidate> &candidates) {
+    const double age = cache.GetCachedAge();
+    const bool fresh = age >= 0 && age <= static_cast<double>(cache.GetLifetime());
+    const std::string stored = cache.getStoredCredId();
+    if (fresh) {
+        return stored;
+    }
+    const auto found =
+        std::find_if(candidates.begin(), candidates.end(), [](const NodeCandidate &candidate) {
+            return candidate.remembered && mayHaveRight(candidate);
+        });
+    if (found != candidates.end()) {
+        return stored;
+    }
+    const auto first =
+        std::find_if(candidates.begin(), candidates.end(), [](const NodeCandidate &candidate) {
+            return !candidate.temporary && mayHaveRight(candidate);
+        });
+    return first == candidates.end() ? std::string() : first->node.credId;
+}
+
 } // namespace
 
 Json::Value NodeCandidate::toJson() const {
@@ -82,16 +116,19 @@ std::vector<NodeCandidate> listNodeCandidates(const std::string &nodeId) {
     if (nodeId.empty() || DRNode::isLocalNodeId(nodeId)) {
         return candidates;
     }
-    const std::string remembered = NodeValidCredCache(nodeId).getStoredCredId();
+    const NodeValidCredCache cache(nodeId);
+    const std::string remembered = cache.getStoredCredId();
     addCandidates(nodeId, DRNodeDB::CRED_TYPE_NODE, remembered, candidates);
     addCandidates(nodeId, DRNodeDB::CRED_TYPE_TEMP, remembered, candidates);
-    std::stable_partition(candidates.begin(), candidates.end(),
-                          [](const NodeCandidate &candidate) { return candidate.remembered; });
+    const std::string first = firstCredId(cache, candidates);
+    std::stable_partition(
+        candidates.begin(), candidates.end(),
+        [&first](const NodeCandidate &candidate) { return candidate.node.credId == first; });
     bool nextFound = false;
     for (NodeCandidate &candidate : candidates) {
         if (!candidate.node.isValid()) {
             candidate.outlook = NodeCandidate::Outlook::kInvalid;
-        } else if (candidate.reachable.fresh && !candidate.reachable.value) {
+        } else if (isDenied(candidate.reachable)) {
             candidate.outlook = NodeCandidate::Outlook::kUnreachable;
         } else if (!nextFound) {
             candidate.outlook = NodeCandidate::Outlook::kNext;
