@@ -127,7 +127,8 @@ constexpr std::array kMeanings = {
 /// The names of what this program finds itself, in the order of the exit codes.
 constexpr std::array kExitNames = {
     "ok",          "failed",    "usage",         "not_reachable", "login_refused", "one_time_code",
-    "certificate", "not_found", "not_permitted", "not_set_up",
+    "certificate", "not_found", "not_permitted", "not_set_up",    "name_unknown",  "no_appliance",
+    "wrong_node",  "clock",
 };
 
 std::string detailText(int code, const Json::Value &detail) {

@@ -22,6 +22,11 @@ enum class ExitCode : int {
     kNotFound = 7,
     kNotPermitted = 8,
     kNotSetUp = 9, ///< not set up, or the files of this appliance cannot be used
+    // What only an examination tells apart.
+    kNameUnknown = 10, ///< the name of the host is not known
+    kNoAppliance = 11, ///< what answers is no appliance
+    kWrongNode = 12,   ///< another node answers than the one that was paired with
+    kClock = 13,       ///< the clocks differ too much
 };
 
 /// Why a command did not do what it was asked for.
@@ -32,6 +37,8 @@ struct Failure {
     std::string name;    ///< one word for scripts
     std::string message; ///< one sentence: what was wrong
     std::string hint;    ///< one sentence: what to do
+    Json::Value data;    ///< what was found nevertheless, for scripts; mostly null
+    std::string text;    ///< the same for people: whole lines, safe for a terminal
 };
 
 /// A failure that this program found itself.

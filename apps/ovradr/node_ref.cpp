@@ -43,24 +43,39 @@ Expected<std::string> choose(const std::set<std::string> &ids, const std::string
 
 } // namespace
 
-Expected<std::string> resolveNode(const std::string &text) {
-    const std::string local = DRNode::getLocalNodeId();
-    if (local.empty()) {
+Expected<std::string> localNode() {
+    const std::string id = DRNode::getLocalNodeId();
+    if (id.empty()) {
         return failure(ExitCode::kNotSetUp, "This appliance has no node id, and none can be made.",
                        "Run `ovradr setup` as root.");
     }
-    if (text == kLocalWord || text == local) {
-        return local;
+    return id;
+}
+
+Expected<std::set<std::string>> listNodes() {
+    const Expected<std::string> local = localNode();
+    if (!local) {
+        return local.failure();
     }
     if (const Trouble trouble = checkNodeDatabase()) {
         return *trouble;
     }
     std::vector<DRNode> nodes;
     DRNodeDB::List(nodes, kBothTables);
-    std::set<std::string> ids{local};
+    std::set<std::string> ids{*local};
     std::transform(nodes.begin(), nodes.end(), std::inserter(ids, ids.end()),
                    [](const DRNode &node) { return node.nodeId; });
-    return choose(ids, text, "node", "`ovradr cred list` shows the nodes that can be reached.");
+    return ids;
+}
+
+Expected<std::string> resolveNode(const std::string &text) {
+    const Expected<std::string> local = localNode();
+    if (!local || text == kLocalWord || text == *local) {
+        return local;
+    }
+    const Expected<std::set<std::string>> ids = listNodes();
+    return ids ? choose(*ids, text, "node", "`ovradr node list` shows the nodes that there are.")
+               : ids.failure();
 }
 
 Expected<FoundCred> resolveCred(const std::string &text) {

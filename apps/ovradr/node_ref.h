@@ -5,9 +5,16 @@
 
 #include <ovradrnode/dr_node.h>
 
+#include <set>
 #include <string>
 
 namespace Ovradr {
+
+/// The id of this node, made when there is none.
+Expected<std::string> localNode();
+
+/// The ids of all nodes that a credential reaches, and of this one.
+Expected<std::set<std::string>> listNodes();
 
 /// The node id that a person means: "local", a node id, or the beginning of only one. Only nodes
 /// that a credential reaches are known, and this one.

@@ -124,6 +124,9 @@ Json::Value documentOf(const Outcome &outcome) {
     document["error"]["name"] = failure.name;
     document["error"]["message"] = failure.message;
     document["error"]["hint"] = failure.hint;
+    if (!failure.data.isNull()) {
+        document["data"] = failure.data;
+    }
     return document;
 }
 
@@ -224,7 +227,8 @@ ExitCode tell(const Outcome &outcome, bool json) {
         told = put(outcome->text, stdout);
     } else {
         const Failure &failure = outcome.failure();
-        told = put("ovradr: " + printable(failure.message) + "\n" +
+        told = put(failure.text, stdout) &&
+               put("ovradr: " + printable(failure.message) + "\n" +
                        (failure.hint.empty() ? "" : printable(failure.hint) + "\n"),
                    stderr);
     }

@@ -85,6 +85,10 @@ bool isFingerprint(const std::string &text) {
                });
 }
 
+std::string checkFingerprint(const std::string &text) {
+    return isFingerprint(text) ? "" : "a fingerprint is SHA256: and 43 characters of base64";
+}
+
 Failure endpointFailure(const Conn &conn, CredError error) {
     // The sentence of the library says what is wrong and, behind a colon, what to do.
     const std::string text = OvraPlatform::credErrorText(static_cast<int>(error));

@@ -18,6 +18,9 @@ inline constexpr long kMeetSeconds = 10;
 /// `conn local` show it.
 bool isFingerprint(const std::string &text);
 
+/// For command lines: "" when the text is a fingerprint, otherwise what it lacks.
+std::string checkFingerprint(const std::string &text);
+
 /// Why an endpoint could not be asked.
 /// \param error  a number of the credential request library
 Failure endpointFailure(const OvraDRNode::Conn &conn, OvraPlatform::CredError error);

@@ -34,10 +34,15 @@ RemoteNode::Prepared RemoteNode::prepared(const std::string &sid, const std::str
     return {R"({"success":true})", {}, true};
 }
 
+bool RemoteNode::isPrepared(const std::string &call) const {
+    const std::lock_guard<std::mutex> lock(guard_);
+    return answers_.count(call) != 0;
+}
+
 Answer RemoteNode::respond(const Received &received) {
     std::string why;
     auto call = OvraPlatform::decodeForm(received.body, why);
-    if (call && call->method == "getinfo") {
+    if (call && call->method == "getinfo" && !isPrepared("getinfo")) {
         return Answer::success(R"({"public_key":")" +
                                OvraPlatform::publicKeyText(keys_.publicKey()) + R"(","time":)" +
                                std::to_string(replays_.now()) + "}");

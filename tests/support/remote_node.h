@@ -14,7 +14,8 @@ namespace OvraTest {
 
 /// A remote node over HTTPS whose answers a test writes down, by session and call or by call alone.
 /// A call without an answer of its own is a success without data. Sealed requests are opened and
-/// their answers sealed; asking for the key to seal with does not count as a call.
+/// their answers sealed; asking for the key to seal with does not count as a call, unless a test
+/// answers it.
 class RemoteNode {
 public:
     RemoteNode();
@@ -46,6 +47,7 @@ private:
     };
 
     Answer respond(const Received &received);
+    bool isPrepared(const std::string &call) const;
     Prepared prepared(const std::string &sid, const std::string &method) const;
 
     mutable std::mutex guard_;

@@ -22,6 +22,8 @@ void addCredCommands(CLI::App &app, Command &chosen);
 void addCallCommand(CLI::App &app, Command &chosen);
 void addConnCommands(CLI::App &app, Command &chosen);
 void addAttrCommands(CLI::App &app, Command &chosen);
+void addWhyCommand(CLI::App &app, Command &chosen);
+void addDoctorCommand(CLI::App &app, Command &chosen);
 
 /// --password-file and --password-stdin; `source` has to live as long as `command`.
 void addPasswordOptions(CLI::App &command, PasswordSource &source);

@@ -1,15 +1,10 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "commands/commands.h"
+#include "endpoint.h"
 #include "output.h"
-#include "provision/server_certificate.h"
 #include "target.h"
 #include "trust.h"
 
-#include <ovracredential/cred_request.h>
-#include <ovradrnode/sender.h>
-
-#include <core/appliance.h>
-#include <credential/sealed_box.h>
 #include <credential/trust_store.h>
 
 #include <algorithm>
@@ -26,21 +21,6 @@ using OvraPlatform::CredError;
 using OvraPlatform::PeerIdentity;
 using OvraPlatform::TrustStore;
 
-constexpr long kReasonSeconds = 5;
-constexpr int kProbe = 2;
-
-/// What those who connect are shown; "" where the key cannot be read.
-std::string ownFingerprint(const Conn &conn) {
-    if (conn.protocol == "https") {
-        return certificateFingerprint(OvraPlatform::kTlsCertificateFile);
-    }
-    std::string why;
-    const auto keys = conn.protocol == "http"
-                          ? OvraPlatform::SealKeyPair::load(OvraPlatform::kSealKeyFile, why)
-                          : std::nullopt;
-    return keys ? OvraPlatform::fingerprintOf(keys->publicKey()) : "";
-}
-
 Outcome local() {
     Report report;
     report.data["conns"] = Json::Value(Json::arrayValue);
@@ -56,49 +36,34 @@ Outcome local() {
     return report;
 }
 
-/// Asks once more, to learn what the probe of the library leaves out.
-Failure whyNotReachable(const Conn &conn) {
-    OVRA::CredRequest request;
-    const bool answered =
-        request.SetURL(conn.protocol, conn.addr, conn.port, "webapi/query.cgi") != 0 &&
-        request.SetDefaultTimeout(kReasonSeconds) != 0 && request.Process(false, kProbe) != 0;
-    if (answered) {
-        return failure(ExitCode::kNotReachable,
-                       targetText(conn) + " did not answer at first, but does now.", "Try again.");
-    }
-    return endpointFailure(conn, static_cast<CredError>(request.GetError()));
-}
-
 Outcome test(const std::string &url) {
     const Expected<Conn> conn = parseTarget(url);
     if (!conn) {
         return conn.failure();
     }
-    const Conn direct = Conn::translateFarlink(*conn);
-    if (!direct.isValid()) {
-        return failure(ExitCode::kNotReachable,
-                       "The relay service does not know " + targetText(*conn) + ".",
-                       "Check the alias, and that the relay service is set up here.");
+    const Expected<Conn> direct = directEndpoint(*conn);
+    if (!direct) {
+        return direct.failure();
     }
     const auto start = std::chrono::steady_clock::now();
-    if (!OvraDRNode::BaseSender::IsConnectable(direct)) {
-        return whyNotReachable(direct);
+    if (const Trouble trouble = probeEndpoint(*direct)) {
+        return *trouble;
     }
     const auto took = std::chrono::duration_cast<std::chrono::milliseconds>(
                           std::chrono::steady_clock::now() - start)
                           .count();
     const PeerIdentity identity =
-        OvraPlatform::peerFingerprint(direct.protocol, direct.addr, direct.port, kMeetSeconds);
+        OvraPlatform::peerFingerprint(direct->protocol, direct->addr, direct->port, kMeetSeconds);
     const bool shown = identity.error == CredError::kNone;
     Report report;
-    report.data["endpoint"] = targetText(direct);
+    report.data["endpoint"] = targetText(*direct);
     report.data["connectable"] = true;
     report.data["milliseconds"] = Json::Int64(took);
     if (shown) {
         report.data["fingerprint"] = identity.fingerprint;
         report.data["trust"] = trustWord(identity);
     }
-    report.text = listing({{"endpoint", targetText(direct)},
+    report.text = listing({{"endpoint", targetText(*direct)},
                            {"connectable", "yes, in " + std::to_string(took) + " ms"},
                            {"key", shown ? identity.fingerprint : "none shown"},
                            {"trusted", shown ? trustText(identity) : ""}});

@@ -1,5 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "commands/commands.h"
+#include "endpoint.h"
 #include "node_ref.h"
 #include "output.h"
 #include "provision/node_database.h"
@@ -46,10 +47,6 @@ std::string toText(const DRNode &record, bool temporary, const std::string &acco
                     {"endpoint", targetText(record.conn)},
                     {"account", account},
                     {"kind", temporary ? "temporary" : "lasting"}});
-}
-
-std::string checkFingerprint(const std::string &text) {
-    return isFingerprint(text) ? "" : "a fingerprint is SHA256: and 43 characters of base64";
 }
 
 std::unique_ptr<CredCreate> newFlow(bool temporary) {
@@ -126,17 +123,15 @@ Outcome create(const CredOptions &options) {
     if (const Trouble trouble = checkNodeDatabase()) {
         return *trouble;
     }
-    const Conn direct = Conn::translateFarlink(*conn);
-    if (!direct.isValid()) {
-        return failure(ExitCode::kNotReachable,
-                       "The relay service does not know " + targetText(*conn) + ".",
-                       "Check the alias, and that the relay service is set up here.");
+    const Expected<Conn> direct = directEndpoint(*conn);
+    if (!direct) {
+        return direct.failure();
     }
-    if (const Trouble trouble = trustPeer(direct, options.fingerprint)) {
+    if (const Trouble trouble = trustPeer(*direct, options.fingerprint)) {
         return *trouble;
     }
     const Expected<Secret> password = obtainPassword(
-        options.password, "Password of " + options.account + " on " + direct.addr, false);
+        options.password, "Password of " + options.account + " on " + direct->addr, false);
     return password ? createWith(options, *conn, *password) : password.failure();
 }
 

@@ -1,8 +1,14 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "commands/commands.h"
+#include "node_ref.h"
+#include "node_view.h"
 #include "output.h"
+#include "target.h"
 
-#include <ovradrnode/dr_node.h>
+#include <ovradrcore/json.h>
+#include <ovradrnode/node_api.h>
+#include <ovradrnode/node_cache.h>
+#include <ovradrnode/sender.h>
 
 #include <memory>
 
@@ -10,12 +16,24 @@ namespace Ovradr {
 
 namespace {
 
+using OvraDRNode::CachedVerdict;
 using OvraDRNode::DRNode;
+using OvraDRNode::NodeCache;
+using OvraDRNode::NodeCandidate;
 
 struct NodeIdOptions {
     bool reset = false;
     bool yes = false;
 };
+
+struct NodeInfoOptions {
+    std::string node;
+    bool refresh = false;
+};
+
+Json::Value toJson(const CachedVerdict &verdict) {
+    return verdict.known ? Json::Value(verdict.value) : Json::Value();
+}
 
 Trouble reset(bool yes) {
     if (!yes && !isInteractive()) {
@@ -39,21 +57,125 @@ Outcome nodeId(const NodeIdOptions &options) {
             return *trouble;
         }
     }
-    const std::string id = DRNode::getLocalNodeId();
-    if (id.empty()) {
-        return failure(ExitCode::kNotSetUp, "This appliance has no node id, and none can be made.",
-                       "Run `ovradr setup` as root.");
+    const Expected<std::string> id = localNode();
+    if (!id) {
+        return id.failure();
     }
     Report report;
-    report.data["node_id"] = id;
-    report.text = printable(id) + "\n";
+    report.data["node_id"] = *id;
+    report.text = printable(*id) + "\n";
     return report;
+}
+
+/// What a node says about itself, asked now.
+Expected<Json::Value> askNode(const std::string &nodeId) {
+    OvraDRNode::NodeSender sender(nodeId);
+    const OvraDRCore::Response answer =
+        sender.process(OvraDRNode::WebAPI::getDRNodeInfoAPI({"timezone"}));
+    if (answer.isSuccess()) {
+        return answer.getData();
+    }
+    return answer.isValid() ? failureOf(answer.getErrCode(), answer.getErrMsg())
+                            : failureOf(sender.GetErrCode(), sender.GetErrMsg());
+}
+
+Outcome nodeInfo(const NodeInfoOptions &options) {
+    const Expected<std::string> nodeId = resolveNode(options.node);
+    if (!nodeId) {
+        return nodeId.failure();
+    }
+    const NodeCache cache(*nodeId, true);
+    Json::Value info;
+    if (!options.refresh) {
+        info = cache.Read();
+    }
+    if (!info.isObject()) {
+        const Expected<Json::Value> asked = askNode(*nodeId);
+        if (!asked) {
+            return asked.failure();
+        }
+        info = *asked;
+        cache.UpdateWithData(info);
+    }
+    const bool local = DRNode::isLocalNodeId(*nodeId);
+    const CachedVerdict reachable = reachability(OvraDRNode::listNodeCandidates(*nodeId));
+    const double age = cache.GetCachedAge();
+    Report report;
+    report.data["node_id"] = *nodeId;
+    report.data["local"] = local;
+    report.data["info"] = info;
+    report.data["age"] = age;
+    report.data["reachable"] = local ? Json::Value(true) : toJson(reachable);
+    report.text =
+        listing({{"node", *nodeId},
+                 {"host name", OvraDRCore::memberString(info, "hostname")},
+                 {"serial number", OvraDRCore::memberString(info, "serial")},
+                 {"time zone", OvraDRCore::memberString(info.get("additional", {}), "timezone")},
+                 {"asked", age < 0 ? "" : ageText(age) + " ago"},
+                 {"answers", local ? "this node" : verdictText(reachable)}});
+    return report;
+}
+
+void addRow(const std::string &nodeId, Report &report,
+            std::vector<std::vector<std::string>> &rows) {
+    const bool local = DRNode::isLocalNodeId(nodeId);
+    const auto candidates = OvraDRNode::listNodeCandidates(nodeId);
+    const NodeCandidate *const next = winner(candidates);
+    const CachedVerdict reachable = reachability(candidates);
+    const std::string name =
+        local ? DRNode::getLocalHostName()
+              : OvraDRCore::memberString(NodeCache(nodeId, false).GetCachedData(), "hostname");
+    Json::Value json;
+    json["node_id"] = nodeId;
+    json["hostname"] = name;
+    json["local"] = local;
+    json["reachable"] = local ? Json::Value(true) : toJson(reachable);
+    json["creds"] = Json::UInt64(candidates.size());
+    json["cred_id"] = next == nullptr ? Json::Value() : Json::Value(next->node.credId);
+    json["endpoint"] = next == nullptr ? Json::Value() : Json::Value(targetText(next->node.conn));
+    report.data["nodes"].append(json);
+    rows.push_back({nodeId, name, local ? "this node" : verdictText(reachable),
+                    std::to_string(candidates.size()),
+                    next == nullptr ? "" : shortId(next->node.credId),
+                    next == nullptr ? "" : targetText(next->node.conn)});
+}
+
+/// From the caches alone; this node first.
+Outcome nodeList() {
+    const Expected<std::set<std::string>> nodes = listNodes();
+    if (!nodes) {
+        return nodes.failure();
+    }
+    Report report;
+    report.data["nodes"] = Json::Value(Json::arrayValue);
+    std::vector<std::vector<std::string>> rows;
+    addRow(DRNode::getLocalNodeId(), report, rows);
+    for (const std::string &nodeId : *nodes) {
+        if (!DRNode::isLocalNodeId(nodeId)) {
+            addRow(nodeId, report, rows);
+        }
+    }
+    report.text = table({"NODE", "NAME", "ANSWERS", "CREDS", "NEXT", "OVER"}, rows);
+    return report;
+}
+
+void addInfo(CLI::App &family, Command &chosen) {
+    CLI::App *info = family.add_subcommand("info", "Show what a node says about itself.");
+    const auto options = std::make_shared<NodeInfoOptions>();
+    info->add_option("NODE", options->node, "\"local\", a node id, or the beginning of one")
+        ->required();
+    info->add_flag("--refresh", options->refresh, "Ask it now, and fail when it does not answer");
+    info->footer("Without --refresh a node is asked when its last answer is older than a minute, "
+                 "and\nshown as it was when it does not answer.\n"
+                 "Example:\n  ovradr node info 3f2a --refresh");
+    info->callback([&chosen, options] { chosen = [options] { return nodeInfo(*options); }; });
 }
 
 } // namespace
 
 void addNodeCommands(CLI::App &app, Command &chosen) {
-    CLI::App *family = app.add_subcommand("node", "This appliance as a node.");
+    CLI::App *family =
+        app.add_subcommand("node", "The nodes: this appliance and those it reaches.");
     family->require_subcommand(1);
     CLI::App *id = family->add_subcommand("id", "Print the id of this node.");
     const auto options = std::make_shared<NodeIdOptions>();
@@ -61,6 +183,12 @@ void addNodeCommands(CLI::App &app, Command &chosen) {
     id->add_flag("--yes", options->yes, "Do not ask")->needs(resetFlag);
     id->footer("Example:\n  ovradr node id");
     id->callback([&chosen, options] { chosen = [options] { return nodeId(*options); }; });
+
+    addInfo(*family, chosen);
+    CLI::App *list = family->add_subcommand("list", "List the nodes and how they are reached.");
+    list->footer("It tells what the processes of this appliance know and sends nothing.\n"
+                 "Example:\n  ovradr node list");
+    list->callback([&chosen] { chosen = nodeList; });
 }
 
 } // namespace Ovradr

@@ -1,0 +1,150 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "commands/commands.h"
+#include "endpoint.h"
+#include "examination.h"
+#include "node_ref.h"
+#include "node_view.h"
+#include "output.h"
+#include "target.h"
+#include "trust.h"
+
+#include <ovradrnode/node_db.h>
+
+#include <algorithm>
+#include <memory>
+#include <vector>
+
+namespace Ovradr {
+
+namespace {
+
+using OvraDRNode::Conn;
+using OvraDRNode::DRNode;
+using OvraDRNode::DRNodeDB;
+
+struct DoctorOptions {
+    std::string subject = "local";
+    std::string account;
+    PasswordSource password;
+    std::string oneTimeCode;
+    std::string fingerprint;
+};
+
+/// The outcome of all examinations: the first failure, with everything that was found.
+Outcome conclude(const std::vector<Examination> &examinations) {
+    Report report;
+    report.data["examinations"] = Json::Value(Json::arrayValue);
+    Trouble trouble;
+    for (const Examination &examination : examinations) {
+        report.data["examinations"].append(examination.toJson());
+        report.text += (report.text.empty() ? "" : "\n") + examination.toText();
+        trouble = trouble ? trouble : examination.trouble();
+    }
+    if (!trouble) {
+        report.text += "\nNothing is wrong.\n";
+        return report;
+    }
+    trouble->data = report.data;
+    trouble->text = report.text + "\n";
+    return *trouble;
+}
+
+Outcome examineLocal() {
+    std::vector<Examination> examinations;
+    examinations.emplace_back("This appliance");
+    examineAppliance(examinations.back());
+    for (const Conn &conn : Conn::listLocal()) {
+        examinations.emplace_back("Own endpoint " + targetText(conn));
+        examineEndpoint({conn, {}, {}, ownFingerprint(conn), true}, examinations.back());
+    }
+    return conclude(examinations);
+}
+
+Outcome examineNode(const std::string &nodeId) {
+    std::vector<Examination> examinations;
+    for (const auto &candidate : OvraDRNode::listNodeCandidates(nodeId)) {
+        examinations.emplace_back("Credential " + shortId(candidate.node.credId) + ", " +
+                                  targetText(candidate.node.conn));
+        examineEndpoint({candidate.node.conn, candidate.node, {}, ""}, examinations.back());
+    }
+    return conclude(examinations);
+}
+
+/// A credential with this endpoint, the lasting ones first.
+std::optional<DRNode> credentialAt(const Conn &conn) {
+    std::vector<DRNode> records;
+    DRNodeDB::List(records, DRNodeDB::CRED_TYPE_NODE | DRNodeDB::CRED_TYPE_TEMP);
+    const auto found = std::find_if(records.begin(), records.end(),
+                                    [&conn](const DRNode &record) { return record.conn == conn; });
+    return found == records.end() ? std::optional<DRNode>() : *found;
+}
+
+Outcome examineUrl(const DoctorOptions &options) {
+    const Expected<Conn> conn = parseTarget(options.subject);
+    if (!conn) {
+        return conn.failure();
+    }
+    std::vector<Examination> examinations;
+    examinations.emplace_back("Endpoint " + targetText(*conn));
+    if (options.account.empty()) {
+        examineEndpoint({*conn, credentialAt(*conn), {}, ""}, examinations.back());
+        return conclude(examinations);
+    }
+    const Expected<Secret> password = obtainPassword(
+        options.password, "Password of " + options.account + " on " + conn->addr, false);
+    if (!password) {
+        return password.failure();
+    }
+    const LoginTrial login{options.account, *password, options.oneTimeCode};
+    examineEndpoint({*conn, {}, login, options.fingerprint}, examinations.back());
+    return conclude(examinations);
+}
+
+bool isUrl(const std::string &text) {
+    return text.find("://") != std::string::npos || text.starts_with("flk:");
+}
+
+Outcome doctor(const DoctorOptions &options) {
+    if (isUrl(options.subject)) {
+        return examineUrl(options);
+    }
+    if (!options.account.empty()) {
+        return failure(ExitCode::kUsage, "An account belongs to one endpoint.",
+                       "Give its URL instead of a node.");
+    }
+    if (options.subject == "local") {
+        return examineLocal();
+    }
+    const Expected<std::string> nodeId = resolveNode(options.subject);
+    if (!nodeId) {
+        return nodeId.failure();
+    }
+    return DRNode::isLocalNodeId(*nodeId) ? examineLocal() : examineNode(*nodeId);
+}
+
+} // namespace
+
+void addDoctorCommand(CLI::App &app, Command &chosen) {
+    CLI::App *command =
+        app.add_subcommand("doctor", "Find out, step by step, what is in the way to a node.");
+    const auto options = std::make_shared<DoctorOptions>();
+    command->add_option("SUBJECT", options->subject,
+                        "A node id or the beginning of one, a URL, or \"local\" (the default)");
+    CLI::Option *account =
+        command->add_option("--account", options->account, "Try a log-in with this account");
+    addPasswordOptions(*command, options->password);
+    command->add_option("--otp", options->oneTimeCode, "One-time code of the account")
+        ->needs(account);
+    command
+        ->add_option("--fingerprint", options->fingerprint, "The key that the endpoint must have")
+        ->needs(account)
+        ->check(checkFingerprint);
+    command->footer("Each step that can fail has an exit code of its own.\n"
+                    "Examples:\n"
+                    "  ovradr doctor\n"
+                    "  ovradr doctor 3f2a\n"
+                    "  ovradr doctor https://nas2 --account repl");
+    command->callback([&chosen, options] { chosen = [options] { return doctor(*options); }; });
+}
+
+} // namespace Ovradr

@@ -1,0 +1,386 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "examination.h"
+
+#include "endpoint.h"
+#include "node_ref.h"
+#include "output.h"
+#include "provision/node_database.h"
+#include "target.h"
+#include "tcp_reach.h"
+#include "trust.h"
+
+#include <ovracredential/cred_request.h>
+#include <ovradrcore/json.h>
+#include <ovradrnode/node_api.h>
+#include <ovradrnode/sender.h>
+
+#include <webapi/api_errors.h>
+
+#include <array>
+#include <chrono>
+#include <cmath>
+#include <cstdio>
+#include <memory>
+
+namespace Ovradr {
+
+namespace {
+
+using OvraDRCore::Request;
+using OvraDRCore::Response;
+using OvraDRNode::BaseSender;
+using OvraDRNode::Conn;
+using OvraDRNode::DRNode;
+using OvraPlatform::CredError;
+using OvraPlatform::PeerIdentity;
+using OvraPlatform::TrustVerdict;
+namespace ERR = OvraDRCore::ERR;
+namespace WebAPI = OvraDRNode::WebAPI;
+
+/// One-time codes are accepted one step of 30 seconds early or late.
+constexpr double kMostClockSeconds = 30;
+constexpr long kClockTimeout = 10; // seconds
+
+const char *stateText(Examination::Step::State state) {
+    switch (state) {
+    case Examination::Step::State::kOk:
+        return "ok";
+    case Examination::Step::State::kFailed:
+        return "FAILED";
+    default:
+        return "-";
+    }
+}
+
+const char *stateWord(Examination::Step::State state) {
+    switch (state) {
+    case Examination::Step::State::kOk:
+        return "ok";
+    case Examination::Step::State::kFailed:
+        return "failed";
+    default:
+        return "skipped";
+    }
+}
+
+Failure withExit(Failure found, ExitCode exit) {
+    const Failure named = failure(exit, found.message, found.hint);
+    found.exit = exit;
+    found.code = named.code;
+    found.name = named.name;
+    return found;
+}
+
+/// With one digit behind the point.
+std::string decimal(double number) {
+    std::array<char, 64> text{};
+    std::snprintf(text.data(), text.size(), "%.1f", number);
+    return text.data();
+}
+
+double wallClock() {
+    return std::chrono::duration<double>(std::chrono::system_clock::now().time_since_epoch())
+        .count();
+}
+
+/// The steps that examine one endpoint; each uses what those before it have found.
+class EndpointSteps {
+public:
+    EndpointSteps(const ExaminationSubject &subject, Examination &examination)
+        : subject_(subject)
+        , examination_(examination) {}
+
+    void run() {
+        const bool reached = examination_.run("resolve", [this] { return resolve(); }) &&
+                             examination_.run("connect", [this] { return connect(); }) &&
+                             examination_.run("key", [this] { return key(); }) &&
+                             examination_.run("answer", [this] { return answer(); });
+        if (!reached || subject_.own) {
+            return;
+        }
+        runSession();
+        if (trusted_) {
+            examination_.run("clock", [this] { return clock(); });
+        } else {
+            examination_.skip("clock", "its key is not trusted yet");
+        }
+    }
+
+private:
+    bool sendsSecrets() const { return subject_.cred || subject_.login; }
+
+    void runSession() {
+        if (!sendsSecrets()) {
+            examination_.skip("session", "no credential has this endpoint; --account tries a "
+                                         "log-in");
+            return;
+        }
+        const bool granted = subject_.login
+                                 ? examination_.run("log-in", [this] { return logIn(); })
+                                 : examination_.run("session", [this] { return session(); });
+        if (!granted) {
+            return;
+        }
+        if (info_.isSuccess()) {
+            examination_.run("identity", [this] { return identity(); });
+        } else {
+            examination_.skip("identity", "it does not say who it is");
+        }
+        examination_.run("right", [this] { return right(); });
+    }
+
+    Expected<std::string> resolve() {
+        const Expected<Conn> direct = directEndpoint(subject_.conn);
+        if (!direct) {
+            return withExit(direct.failure(), ExitCode::kNameUnknown);
+        }
+        conn_ = *direct;
+        const Expected<std::vector<HostAddress>> found = resolveHost(conn_.addr, conn_.port);
+        if (!found) {
+            return found.failure();
+        }
+        addresses_ = *found;
+        std::string text = subject_.conn.isFarlink() ? targetText(conn_) + ": " : "";
+        for (const HostAddress &address : addresses_) {
+            text += (&address == addresses_.data() ? "" : ", ") + address.text;
+        }
+        return text;
+    }
+
+    Expected<std::string> connect() { return connectAny(addresses_, conn_); }
+
+    Expected<std::string> key() {
+        const PeerIdentity peer =
+            OvraPlatform::peerFingerprint(conn_.protocol, conn_.addr, conn_.port, kMeetSeconds);
+        if (peer.error == CredError::kTrustUnavailable || peer.error == CredError::kOutOfMemory) {
+            return endpointFailure(conn_, peer.error);
+        }
+        if (peer.error != CredError::kNone) {
+            return failure(ExitCode::kNoAppliance,
+                           targetText(conn_) + ": what answers there shows no key.",
+                           "Check protocol and port: HTTPS is 5001, HTTP 5000 as a rule.");
+        }
+        if (subject_.own) {
+            return expectedKey(peer);
+        }
+        const bool judged = sendsSecrets() || peer.pinned == TrustVerdict::kDifferent;
+        if (judged && !peer.acceptedBySystem) {
+            if (const Trouble trouble = trustPeer(conn_, subject_.fingerprint)) {
+                return *trouble;
+            }
+        }
+        trusted_ = sendsSecrets() || peer.acceptedBySystem || peer.pinned == TrustVerdict::kTrusted;
+        return peer.fingerprint + "; trusted: " +
+               (sendsSecrets() && !peer.acceptedBySystem ? "yes, it is the known key"
+                                                         : trustText(peer));
+    }
+
+    /// An endpoint of this appliance has to show the key that is in its file.
+    Expected<std::string> expectedKey(const PeerIdentity &peer) {
+        if (peer.fingerprint != subject_.fingerprint) {
+            return failure(ExitCode::kCertificate,
+                           targetText(conn_) + " shows " + peer.fingerprint +
+                               ", which is not the key that is expected.",
+                           "After the key was changed ovradrd has to be started again; if it was "
+                           "not changed, something else answers there.");
+        }
+        return peer.fingerprint + ", as expected";
+    }
+
+    Expected<std::string> answer() const {
+        if (const Trouble trouble = probeEndpoint(conn_)) {
+            return withExit(*trouble, ExitCode::kNoAppliance);
+        }
+        return std::string("a web API");
+    }
+
+    Failure senderFailure(const Response &response) const {
+        Failure found = response.isValid() ? failureOf(response.getErrCode(), response.getErrMsg())
+                                           : failureOf(sender_->GetErrCode(), sender_->GetErrMsg());
+        found.message = targetText(conn_) + ": " + found.message;
+        return found;
+    }
+
+    Expected<std::string> logIn() {
+        auto sender = std::make_unique<OvraDRNode::CredAccountSender>(
+            conn_, subject_.login->account, subject_.login->password.get(),
+            subject_.login->oneTimeCode);
+        const bool loggedIn = sender->init();
+        sender_ = std::move(sender);
+        if (!loggedIn) {
+            return senderFailure(Response());
+        }
+        info_ = sender_->process(WebAPI::getDRNodeInfoAPI({}));
+        return "as " + subject_.login->account;
+    }
+
+    /// Any answer but that the session is unknown shows that it is known.
+    Expected<std::string> session() {
+        sender_ = std::make_unique<OvraDRNode::CredNodeSender>(*subject_.cred);
+        info_ = sender_->process(WebAPI::getDRNodeInfoAPI({}));
+        if (!info_.isValid() || info_.getErrCode() == OvraPlatform::APIError::kNoSession) {
+            return senderFailure(info_);
+        }
+        return std::string("the session of the credential is known");
+    }
+
+    Expected<std::string> identity() const {
+        const std::string nodeId = info_.getDataFieldtoStr("node_id");
+        const bool expected = subject_.cred ? nodeId == subject_.cred->nodeId : !nodeId.empty();
+        if (!expected) {
+            return failure(ExitCode::kWrongNode,
+                           targetText(conn_) + " is the node \"" + nodeId + "\"" +
+                               (subject_.cred ? ", not " + subject_.cred->nodeId : "") + ".",
+                           "Its address went to another appliance, or its node id was reset: pair "
+                           "with it again.");
+        }
+        return "node " + nodeId + ", " + info_.getDataFieldtoStr("hostname");
+    }
+
+    Expected<std::string> right() const {
+        const Response response = sender_->process(WebAPI::getDRNodeTestPrivilegeAPI());
+        if (response.isSuccess()) {
+            return std::string("may operate on the node");
+        }
+        return senderFailure(response);
+    }
+
+    Expected<std::string> clock() const {
+        OVRA::CredRequest request;
+        const std::unique_ptr<OVRACred, decltype(&OVRACredFree)> cred(OVRACredAlloc(),
+                                                                      &OVRACredFree);
+        const bool ready = cred &&
+                           OVRACredItemSetProtocol(cred.get(), conn_.protocol.c_str()) == 0 &&
+                           OVRACredItemSetHost(cred.get(), conn_.addr.c_str()) == 0 &&
+                           OVRACredItemSetPort(cred.get(), conn_.port) == 0 &&
+                           OVRA::CredRequest::CreateWebAPIRequest(request, cred.get(), nullptr,
+                                                                  "OVRA.Core.Encryption", 1,
+                                                                  "getinfo", Json::Value()) != 0 &&
+                           request.SetResponseTimeout(kClockTimeout) != 0;
+        const double start = wallClock();
+        if (!ready || request.Process(true, 0) == 0) {
+            return endpointFailure(conn_, static_cast<CredError>(request.GetError()));
+        }
+        const double middle = (start + wallClock()) / 2;
+        Response response;
+        response.setResp(request.GetResponse());
+        const Json::Value time = response.getDataField("time");
+        if (!time.isInt64()) {
+            return failure(ExitCode::kNoAppliance, targetText(conn_) + " does not tell its time.",
+                           "Check that both appliances run versions that fit together.");
+        }
+        return judgeClock(static_cast<double>(time.asInt64()) / 1000 - middle);
+    }
+
+    Expected<std::string> judgeClock(double ahead) const {
+        const std::string text =
+            decimal(std::abs(ahead)) + " s " + (ahead < 0 ? "behind" : "ahead of") + " this one";
+        if (std::abs(ahead) > kMostClockSeconds) {
+            return failure(ExitCode::kClock,
+                           "The clock of " + targetText(conn_) + " is " + text + ".",
+                           "Set both by NTP: one-time codes need clocks that agree.");
+        }
+        return text;
+    }
+
+    const ExaminationSubject &subject_;
+    Examination &examination_;
+    Conn conn_; ///< the direct endpoint
+    std::vector<HostAddress> addresses_;
+    bool trusted_ = false;
+    std::unique_ptr<BaseSender> sender_;
+    Response info_;
+};
+
+} // namespace
+
+Examination::Examination(std::string subject)
+    : subject_(std::move(subject)) {}
+
+bool Examination::run(const std::string &name, const Action &action) {
+    const auto start = std::chrono::steady_clock::now();
+    const Expected<std::string> found = action();
+    Step step;
+    step.name = name;
+    step.milliseconds =
+        std::chrono::duration<double, std::milli>(std::chrono::steady_clock::now() - start).count();
+    step.state = found ? Step::State::kOk : Step::State::kFailed;
+    step.detail = found ? *found : found.failure().message;
+    step.hint = found ? "" : found.failure().hint;
+    steps_.push_back(step);
+    if (!found && !trouble_) {
+        trouble_ = found.failure();
+    }
+    return static_cast<bool>(found);
+}
+
+void Examination::skip(const std::string &name, const std::string &why) {
+    Step step;
+    step.name = name;
+    step.detail = why;
+    steps_.push_back(step);
+}
+
+Json::Value Examination::toJson() const {
+    Json::Value json;
+    json["subject"] = subject_;
+    json["steps"] = Json::Value(Json::arrayValue);
+    for (const Step &step : steps_) {
+        Json::Value entry;
+        entry["step"] = step.name;
+        entry["state"] = stateWord(step.state);
+        entry["milliseconds"] = step.milliseconds;
+        entry["detail"] = step.detail;
+        entry["hint"] = step.hint;
+        json["steps"].append(entry);
+    }
+    return json;
+}
+
+std::string Examination::toText() const {
+    std::vector<std::vector<std::string>> rows;
+    for (const Step &step : steps_) {
+        const bool skipped = step.state == Step::State::kSkipped;
+        rows.push_back({step.name, stateText(step.state),
+                        skipped ? "" : decimal(step.milliseconds) + " ms", step.detail});
+        if (!step.hint.empty()) {
+            rows.push_back({"", "", "", step.hint});
+        }
+    }
+    return printable(subject_) + "\n" + table({"STEP", "", "TIME", "FOUND"}, rows);
+}
+
+void examineEndpoint(const ExaminationSubject &subject, Examination &examination) {
+    EndpointSteps(subject, examination).run();
+}
+
+void examineAppliance(Examination &examination) {
+    std::string nodeId;
+    examination.run("files", [&nodeId]() -> Expected<std::string> {
+        const Expected<std::string> id = localNode();
+        if (!id) {
+            return id.failure();
+        }
+        if (const Trouble trouble = checkNodeDatabase()) {
+            return *trouble;
+        }
+        nodeId = *id;
+        return "node " + nodeId;
+    });
+    examination.run("daemon", [&nodeId]() -> Expected<std::string> {
+        const Response info = BaseSender::run(WebAPI::getDRNodeInfoAPI({}));
+        if (!info.isSuccess()) {
+            return failure(ExitCode::kNotReachable, "The daemon of this appliance does not answer.",
+                           "Start ovradrd, and read what it says in the system log.");
+        }
+        if (!nodeId.empty() && info.getDataFieldtoStr("node_id") != nodeId) {
+            return failure(ExitCode::kWrongNode,
+                           "The daemon still answers as the node " +
+                               info.getDataFieldtoStr("node_id") + ".",
+                           "The node id was changed while it ran: start ovradrd again.");
+        }
+        return "answers as " + info.getDataFieldtoStr("hostname");
+    });
+}
+
+} // namespace Ovradr

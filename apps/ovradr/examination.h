@@ -1,0 +1,76 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include "failure.h"
+#include "prompt.h"
+
+#include <ovradrnode/conn.h>
+#include <ovradrnode/dr_node.h>
+
+#include <functional>
+#include <optional>
+#include <string>
+#include <vector>
+
+namespace Ovradr {
+
+/// The log-in that an examination tries.
+struct LoginTrial {
+    std::string account;
+    const Secret &password;
+    std::string oneTimeCode;
+};
+
+/// What is known about an endpoint beforehand.
+struct ExaminationSubject {
+    OvraDRNode::Conn conn;
+    std::optional<OvraDRNode::DRNode> cred; ///< its session is used
+    std::optional<LoginTrial> login;        ///< tried instead of a session
+    std::string fingerprint;                ///< the key that it must have, or ""
+    bool own = false;                       ///< of this appliance: only the steps up to "answer"
+};
+
+/// Examines things step by step. A step that fails has the steps that need it skipped; the first
+/// failure is the outcome of the whole.
+class Examination {
+public:
+    struct Step {
+        enum class State { kOk, kFailed, kSkipped };
+        std::string name;
+        State state = State::kSkipped;
+        double milliseconds = 0;
+        std::string detail; ///< what was found, what was wrong, or why it was skipped
+        std::string hint;   ///< what to do
+    };
+    /// What a step finds out, or why it fails.
+    using Action = std::function<Expected<std::string>()>;
+
+    /// \param subject  what is examined, for people
+    explicit Examination(std::string subject);
+
+    /// Runs and times a step. \return whether it went well.
+    bool run(const std::string &name, const Action &action);
+    void skip(const std::string &name, const std::string &why);
+
+    const std::string &subject() const { return subject_; }
+    /// The first failure; nothing when every step that was run went well.
+    const Trouble &trouble() const { return trouble_; }
+    /// Members "subject" and "steps".
+    Json::Value toJson() const;
+    std::string toText() const;
+
+private:
+    std::string subject_;
+    std::vector<Step> steps_;
+    Trouble trouble_;
+};
+
+/// Examines an endpoint: the steps "resolve", "connect", "key", "answer", "session" or "log-in",
+/// "identity", "right" and "clock". Nothing secret is sent before the key is trusted, and nothing
+/// is trusted that nobody has asked for. Takes at most 10 seconds a step, and 60 for a request.
+void examineEndpoint(const ExaminationSubject &subject, Examination &examination);
+
+/// Examines what this appliance itself needs: the steps "files" and "daemon".
+void examineAppliance(Examination &examination);
+
+} // namespace Ovradr

@@ -1,0 +1,88 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "node_view.h"
+
+#include <algorithm>
+#include <array>
+#include <cmath>
+
+namespace Ovradr {
+
+namespace {
+
+using OvraDRNode::CachedVerdict;
+using OvraDRNode::NodeCandidate;
+using Outlook = NodeCandidate::Outlook;
+
+constexpr std::size_t kShortId = 8;
+
+} // namespace
+
+std::string ageText(double seconds) {
+    struct Unit {
+        double seconds;
+        const char *name;
+    };
+    constexpr std::array kUnits = {Unit{86400, "d"}, Unit{3600, "h"}, Unit{60, "min"}};
+    if (seconds < 0) {
+        return "";
+    }
+    const auto *const unit =
+        std::find_if(kUnits.begin(), kUnits.end(),
+                     [seconds](const Unit &each) { return seconds >= 2 * each.seconds; });
+    const bool large = unit != kUnits.end();
+    return std::to_string(std::lround(large ? seconds / unit->seconds : seconds)) + " " +
+           (large ? unit->name : "s");
+}
+
+std::string verdictText(const CachedVerdict &verdict) {
+    if (!verdict.known) {
+        return "unknown";
+    }
+    const std::string age = ageText(verdict.age);
+    return std::string(verdict.fresh ? "" : "was ") + (verdict.value ? "yes" : "no") +
+           (age.empty() ? "" : ", " + age + " ago");
+}
+
+std::string shortId(const std::string &id) {
+    return id.substr(0, kShortId);
+}
+
+const NodeCandidate *winner(const std::vector<NodeCandidate> &candidates) {
+    const auto found =
+        std::find_if(candidates.begin(), candidates.end(), [](const NodeCandidate &candidate) {
+            return candidate.outlook == Outlook::kNext;
+        });
+    return found == candidates.end() ? nullptr : &*found;
+}
+
+std::string reasonText(const std::vector<NodeCandidate> &candidates, std::size_t position) {
+    const NodeCandidate &candidate = candidates[position];
+    switch (candidate.outlook) {
+    case Outlook::kUnreachable:
+        return "its endpoint did not answer";
+    case Outlook::kInvalid:
+        return "its record is not complete; pair again";
+    case Outlook::kNext:
+        if (candidate.remembered) {
+            return "it worked last";
+        }
+        return position == 0 ? "the first that may have the right"
+                             : "those before it are passed over";
+    case Outlook::kLater:
+        break;
+    }
+    if (candidate.privilege.known && !candidate.privilege.value) {
+        return "it was refused for lack of the right";
+    }
+    return "if those before it do not get through";
+}
+
+CachedVerdict reachability(const std::vector<NodeCandidate> &candidates) {
+    const NodeCandidate *const next = winner(candidates);
+    if (next != nullptr) {
+        return next->reachable;
+    }
+    return candidates.empty() ? CachedVerdict() : candidates.front().reachable;
+}
+
+} // namespace Ovradr

@@ -1,0 +1,31 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include "failure.h"
+
+#include <ovradrnode/conn.h>
+
+#include <sys/socket.h>
+
+#include <string>
+#include <vector>
+
+namespace Ovradr {
+
+struct HostAddress {
+    sockaddr_storage address{};
+    socklen_t size = 0;
+    std::string text; ///< as a number
+};
+
+/// The addresses of a host, each once. Waits as long as the system's resolver does.
+Expected<std::vector<HostAddress>> resolveHost(const std::string &host, int port);
+
+/// Makes a bare TCP connection to the first of the addresses that takes one, and ends it again; 10
+/// seconds at most for all of them.
+/// \param conn  whose addresses they are, for the message
+/// \return the address that was reached.
+Expected<std::string> connectAny(const std::vector<HostAddress> &addresses,
+                                 const OvraDRNode::Conn &conn);
+
+} // namespace Ovradr
