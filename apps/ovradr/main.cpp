@@ -60,6 +60,7 @@ void describe(CLI::App &app, bool &json, Command &chosen) {
     addAttrCommands(app, chosen);
     addWhyCommand(app, chosen);
     addDoctorCommand(app, chosen);
+    addSpeedCommand(app, chosen);
 }
 
 constexpr const char *kHelpHint =

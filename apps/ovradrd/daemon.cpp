@@ -86,6 +86,7 @@ void Daemon::Impl::addHandlers() {
     addUserAPI(registry);
     addFarlinkAPI(registry);
     addNodeAPI(registry);
+    addSpeedAPI(registry);
     addNodeSessionAPI(registry);
     addCredentialAPI(registry);
     // From here on what the library asks of its own appliance is answered in this process.

@@ -89,6 +89,8 @@ std::optional<std::chrono::milliseconds> Connections::limitOf(Phase phase) const
         return limits_.idle;
     case Phase::kReplying:
         return limits_.replying;
+    case Phase::kSending:
+        return limits_.sending;
     case Phase::kWorking:
         break;
     }

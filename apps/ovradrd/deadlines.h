@@ -22,6 +22,7 @@ struct ConnectionLimits {
     /// this system keep an idle connection, so that it is they who close it.
     std::chrono::milliseconds idle{60'000};
     std::chrono::milliseconds replying{30'000}; ///< from the reply's first byte to its last
+    std::chrono::milliseconds sending{600'000}; ///< the same of a test file
     std::size_t total = 1024;
     std::size_t perClient = 768;
 };
@@ -38,6 +39,7 @@ public:
         kIdle,     ///< waits for the client's next request
         kWorking,  ///< waits for us, without a deadline: the lanes bound it
         kReplying, ///< waits for the client to take the reply
+        kSending,  ///< the same for a test file
     };
     struct Connection;
 

@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "http_server.h"
 
+#include "test_files.h"
 #include "webapi/api_errors.h"
 
 #include <ovradrcore/json.h>
@@ -22,6 +23,7 @@
 #include <cstring>
 #include <exception>
 #include <mutex>
+#include <optional>
 #include <string_view>
 #include <system_error>
 #include <unordered_map>
@@ -139,7 +141,9 @@ struct Exchange {
     unsigned int status = MHD_HTTP_OK;
     std::string document;
     std::string body;
-    bool discard = false; ///< the body is thrown away: the document is there already
+    bool discard = false;         ///< the body is thrown away: the reply is there already
+    std::optional<TestFile> file; ///< what is replied instead of the document
+    FilePart part;
 
     /// Refuses the request; takes effect when its body is through.
     void refuse(unsigned int httpStatus, int code, const std::string &message) {
@@ -194,9 +198,11 @@ struct HttpServer::Impl {
 
     MHD_Result begin(MHD_Connection *connection, bool secure, std::string_view url,
                      std::string_view method, void **context);
+    void offerFile(Exchange &exchange, std::string_view url);
     void take(Exchange &exchange, const char *data, std::size_t size);
     void handOver(Exchange &exchange);
     MHD_Result reply(Exchange &exchange);
+    MHD_Result sendFile(Exchange &exchange);
     void end(Exchange *exchange);
     void giveBack(Exchange &exchange);
 
@@ -206,6 +212,7 @@ struct HttpServer::Impl {
     gnutls_datum_t ticketKey{};
     std::atomic<bool> closing = false;
     std::atomic<std::size_t> buffered = 0;
+    std::atomic<std::size_t> files = 0; ///< that are being sent
     std::mutex mutex;
     std::condition_variable ended;
     std::unordered_map<Exchange *, std::shared_ptr<Exchange>> exchanges;
@@ -294,10 +301,13 @@ MHD_Result HttpServer::Impl::begin(MHD_Connection *connection, bool secure, std:
     connections.beginRequest(exchange->watched);
 
     const std::uint64_t length = announcedLength(connection);
-    if (url != kEntryPoint) {
+    const bool reads = method == MHD_HTTP_METHOD_GET || method == MHD_HTTP_METHOD_HEAD;
+    if (reads && url.starts_with(kTestFilesUrl)) {
+        offerFile(*exchange, url);
+    } else if (url != kEntryPoint) {
         exchange->refuse(MHD_HTTP_NOT_FOUND, APIError::kBadRequest,
                          "there is nothing here: the web API is at /webapi/query.cgi");
-    } else if (method == MHD_HTTP_METHOD_GET || method == MHD_HTTP_METHOD_HEAD) {
+    } else if (reads) {
         exchange->refuse(MHD_HTTP_OK, APIError::kBadRequest, "a call is made with POST");
     } else if (method != MHD_HTTP_METHOD_POST) {
         exchange->refuse(MHD_HTTP_METHOD_NOT_ALLOWED, APIError::kBadRequest,
@@ -372,7 +382,61 @@ void HttpServer::Impl::handOver(Exchange &exchange) {
     handler(std::move(request), answer);
 }
 
+/// Makes a test file the reply, or refuses.
+void HttpServer::Impl::offerFile(Exchange &exchange, std::string_view url) {
+    std::optional<TestFile> file = openTestFile(url);
+    if (!file) {
+        exchange.refuse(MHD_HTTP_NOT_FOUND, APIError::kBadRequest,
+                        "there is no such test file: start the test anew");
+        return;
+    }
+    // A range that holds only for one version of a file: ours have none.
+    const bool conditional = !headerOf(exchange.connection, MHD_HTTP_HEADER_IF_RANGE).empty();
+    exchange.part =
+        partOf(conditional ? "" : headerOf(exchange.connection, MHD_HTTP_HEADER_RANGE), file->size);
+    if (exchange.part.kind == FilePart::Kind::kUnsatisfiable) {
+        exchange.refuse(MHD_HTTP_RANGE_NOT_SATISFIABLE, APIError::kBadRequest,
+                        "the file ends before this range: ask for less");
+        return;
+    }
+    if (files.fetch_add(1) >= limits.files) {
+        --files;
+        exchange.refuse(MHD_HTTP_SERVICE_UNAVAILABLE, APIError::kTooBusy,
+                        "too many tests run at once: try again later");
+        return;
+    }
+    exchange.file = std::move(file);
+    exchange.discard = true;
+}
+
+MHD_Result HttpServer::Impl::sendFile(Exchange &exchange) {
+    connections.enter(exchange.watched, Phase::kSending);
+    const FilePart &part = exchange.part;
+    const std::unique_ptr<MHD_Response, DestroyResponse> response(
+        MHD_create_response_from_fd_at_offset64(part.length, exchange.file->fd.get(), part.first));
+    if (response == nullptr) {
+        return MHD_NO;
+    }
+    // The response closes it.
+    exchange.file->fd.release();
+    MHD_add_response_header(response.get(), MHD_HTTP_HEADER_CONTENT_TYPE,
+                            "application/octet-stream");
+    MHD_add_response_header(response.get(), MHD_HTTP_HEADER_CACHE_CONTROL, "no-store");
+    MHD_add_response_header(response.get(), MHD_HTTP_HEADER_ACCEPT_RANGES, "bytes");
+    if (part.kind == FilePart::Kind::kWhole) {
+        return MHD_queue_response(exchange.connection, MHD_HTTP_OK, response.get());
+    }
+    const std::string range = "bytes " + std::to_string(part.first) + "-" +
+                              std::to_string(part.first + part.length - 1) + "/" +
+                              std::to_string(exchange.file->size);
+    MHD_add_response_header(response.get(), MHD_HTTP_HEADER_CONTENT_RANGE, range.c_str());
+    return MHD_queue_response(exchange.connection, MHD_HTTP_PARTIAL_CONTENT, response.get());
+}
+
 MHD_Result HttpServer::Impl::reply(Exchange &exchange) {
+    if (exchange.file) {
+        return sendFile(exchange);
+    }
     connections.enter(exchange.watched, Phase::kReplying);
     const std::unique_ptr<MHD_Response, DestroyResponse> response(MHD_create_response_from_buffer(
         exchange.document.size(), exchange.document.data(), MHD_RESPMEM_MUST_COPY));
@@ -391,6 +455,7 @@ MHD_Result HttpServer::Impl::reply(Exchange &exchange) {
 /// The reply has left, or the connection is gone.
 void HttpServer::Impl::end(Exchange *exchange) {
     giveBack(*exchange);
+    files -= exchange->file ? 1 : 0;
     connections.enter(exchange->watched, Phase::kIdle);
     const std::lock_guard lock(mutex);
     exchanges.erase(exchange);

@@ -19,6 +19,7 @@ struct HttpLimits {
     std::size_t body = std::size_t{1} * 1024 * 1024;
     /// Of all bodies together that have not been handed over yet.
     std::size_t bodies = std::size_t{64} * 1024 * 1024;
+    std::size_t files = 16; ///< test files that are sent at the same time
 };
 
 /// A request to the entry point of the web API.
@@ -28,8 +29,9 @@ struct HttpRequest {
     bool secure = false; ///< came over TLS
 };
 
-/// The HTTP side of the daemon: POST of a form to /webapi/query.cgi, answered with a JSON document.
-/// Everything else is refused here, also with a JSON document; no file can be reached.
+/// The HTTP side of the daemon: POST of a form to /webapi/query.cgi, answered with a JSON document,
+/// and GET of the files for measuring the link (test_files.h). Everything else is refused here,
+/// also with a JSON document; no other file can be reached.
 ///
 /// A few threads wait for the network, none for a handler. While a request is being worked on its
 /// connection sleeps.

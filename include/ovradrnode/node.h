@@ -2,8 +2,11 @@
 #pragma once
 
 #include "ovradrcore/err_recorder.h"
+#include "ovradrcore/response.h"
+#include "ovradrnode/conn.h"
 #include "ovradrnode/export.h"
 
+#include <functional>
 #include <string>
 
 namespace OvraDRNode {
@@ -21,6 +24,14 @@ public:
     /// How fast the remote node downloads from this one, over the first local endpoint at which
     /// that works, as the remote words it; "" on failure (401, 407). \param timeout  seconds
     std::string TestSyncSpeed(const std::string &nodeId, int retries, int timeout);
+
+    /// Is told of each endpoint that is tried: before (`answer` null) and after. \param sender  why
+    /// there is no valid answer
+    using EndpointWatcher = std::function<void(const Conn &conn, const OvraDRCore::Response *answer,
+                                               const OvraDRCore::ErrRecorder &sender)>;
+    /// The same test for somebody who watches it.
+    std::string TestSyncSpeed(const std::string &nodeId, int retries, int timeout,
+                              const EndpointWatcher &watcher);
 };
 
 } // namespace OvraDRNode

@@ -75,6 +75,12 @@ std::string Node::TestDownloadSpeed(const std::string &url, int retries, int tim
 }
 
 std::string Node::TestSyncSpeed(const std::string &nodeId, int retries, int timeout) {
+    return TestSyncSpeed(nodeId, retries, timeout,
+                         [](const Conn &, const Response *, const OvraDRCore::ErrRecorder &) {});
+}
+
+std::string Node::TestSyncSpeed(const std::string &nodeId, int retries, int timeout,
+                                const EndpointWatcher &watcher) {
     SetErr(ERR::kFailed);
     const std::string testFile = TestSyncSpeedMakeTestFile();
     if (testFile.empty()) {
@@ -91,8 +97,10 @@ std::string Node::TestSyncSpeed(const std::string &nodeId, int retries, int time
     for (const Conn &conn : Conn::listLocal()) {
         const std::string url = downloadUrl(conn, testFile);
         OVRA_INFO("Download url: %s", url.c_str());
-        response = NodeSender(nodeId).process(
-            WebAPI::getDRNodeTestDownloadSpeedAPI(url, retries, timeout));
+        NodeSender sender(nodeId);
+        watcher(conn, nullptr, sender);
+        response = sender.process(WebAPI::getDRNodeTestDownloadSpeedAPI(url, retries, timeout));
+        watcher(conn, &response, sender);
         if (response.isSuccess()) {
             break;
         }

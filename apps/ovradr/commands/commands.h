@@ -24,6 +24,7 @@ void addConnCommands(CLI::App &app, Command &chosen);
 void addAttrCommands(CLI::App &app, Command &chosen);
 void addWhyCommand(CLI::App &app, Command &chosen);
 void addDoctorCommand(CLI::App &app, Command &chosen);
+void addSpeedCommand(CLI::App &app, Command &chosen);
 
 /// --password-file and --password-stdin; `source` has to live as long as `command`.
 void addPasswordOptions(CLI::App &command, PasswordSource &source);

@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "commands/commands.h"
 #include "output.h"
+#include "provision/data_files.h"
 #include "provision/node_database.h"
 #include "provision/server_certificate.h"
 
@@ -211,7 +212,7 @@ Outcome setUp(const Settings &settings) {
     if (!config) {
         return config.failure();
     }
-    const Expected<std::string> schema = findSchemaFile();
+    const Expected<std::string> schema = findDataFile("node.sql");
     if (!schema) {
         return schema.failure();
     }
@@ -228,6 +229,7 @@ Outcome setUp(const Settings &settings) {
         [] { return provisionCertificate(kTlsCertificateFile, kTlsKeyFile, serverNames()); },
         [&done] { return provisionSealKey(done.httpFingerprint); },
         [&done] { return provisionNodeId(done.nodeId); },
+        [] { return provisionScripts(); },
     };
     for (const auto &step : steps) {
         const Expected<SetUpStep> result = step();
@@ -247,7 +249,7 @@ Outcome setUp(const Settings &settings) {
 
 void addSetupCommand(CLI::App &app, Command &chosen) {
     CLI::App *command = app.add_subcommand(
-        "setup", "Make what a fresh machine needs: folders, database, keys, node id.");
+        "setup", "Make what a fresh machine needs: folders, database, keys, node id, scripts.");
     const auto settings = std::make_shared<Settings>();
     command->add_option("--hostname", settings->hostname, "Name of this appliance")
         ->check(checkHostname);

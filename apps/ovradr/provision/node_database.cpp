@@ -11,7 +11,6 @@
 
 #include <array>
 #include <cerrno>
-#include <filesystem>
 #include <fstream>
 #include <memory>
 #include <sstream>
@@ -21,7 +20,6 @@ namespace Ovradr {
 namespace {
 
 constexpr int kBusyMilliseconds = 20'000; // as long as the library waits
-constexpr const char *kSchemaName = "ovradrnode/node.sql";
 
 /// What the library selects and stores.
 constexpr std::array kQueries = {
@@ -144,21 +142,6 @@ Trouble touchPrivate(const std::string &path) {
 
 std::string nodeDatabasePath() {
     return std::string(OvraPlatform::kConfigDir) + "/node.db";
-}
-
-Expected<std::string> findSchemaFile() {
-    std::error_code error;
-    const auto program = std::filesystem::read_symlink("/proc/self/exe", error);
-    const auto beside = program.parent_path().parent_path() / "share" / kSchemaName;
-    for (const std::filesystem::path &candidate :
-         {beside, std::filesystem::path(OVRADR_DATA_DIR) / kSchemaName}) {
-        if (access(candidate.c_str(), R_OK) == 0) {
-            return candidate.string();
-        }
-    }
-    return failure(ExitCode::kNotSetUp,
-                   "The schema of the node database is missing: " + beside.string() + ".",
-                   "Install the program again, with its data files.");
 }
 
 Expected<SetUpStep> provisionNodeDatabase(const std::string &path, const std::string &schemaFile) {

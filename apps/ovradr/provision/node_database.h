@@ -14,9 +14,6 @@ inline constexpr int kSchemaVersion = 1;
 /// The node database of this appliance.
 std::string nodeDatabasePath();
 
-/// Finds node.sql: beside the program (../share/ovradrnode), else where it was installed.
-Expected<std::string> findSchemaFile();
-
 /// Makes the node database, mode 0600, or checks the one that is there. The schema is applied in
 /// one transaction, so that a crash leaves an empty file, which the next call fills; what holds
 /// anything is never changed. Refused: another program's file, and a schema that is newer than this

@@ -18,6 +18,8 @@ void addUserAPI(OvraPlatform::APIRegistry &registry);
 void addFarlinkAPI(OvraPlatform::APIRegistry &registry);
 /// "OVRA.DR.Node": facts about this node, and tests.
 void addNodeAPI(OvraPlatform::APIRegistry &registry);
+/// "OVRA.DR.Node": how fast data moves to this node, and from it to others.
+void addSpeedAPI(OvraPlatform::APIRegistry &registry);
 /// "OVRA.DR.Node.Session": sessions on this node, granted to other nodes.
 void addNodeSessionAPI(OvraPlatform::APIRegistry &registry);
 /// "OVRA.DR.Node.Credential": credentials that this node holds for reaching other nodes.

@@ -64,6 +64,15 @@ std::string Params::optionalSecret(const char *name, std::size_t longest) {
     return isUnset(value) ? std::string() : bytes(name, longest, true);
 }
 
+int Params::number(const char *name) {
+    const Json::Value &value = params_[name];
+    if (!value.isInt() || value.asInt() < 0) {
+        refuse(name, std::string(name) + " has to be a whole number, not below 0");
+        return 0;
+    }
+    return value.asInt();
+}
+
 std::string Params::word(const char *name, const std::vector<std::string> &words) {
     const Json::Value &value = params_[name];
     std::string text = value.isString() ? value.asString() : std::string();

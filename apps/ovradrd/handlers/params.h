@@ -37,6 +37,8 @@ public:
     std::string text(const char *name, std::size_t longest);
     /// As text(), or "" when it is absent or empty.
     std::string optionalText(const char *name, std::size_t longest);
+    /// A whole number from 0.
+    int number(const char *name);
     /// One of `words`.
     std::string word(const char *name, const std::vector<std::string> &words);
     /// 1 to `longest` bytes, none of them NUL; error texts never repeat it.

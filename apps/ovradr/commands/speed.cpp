@@ -1,0 +1,211 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "commands/commands.h"
+#include "node_ref.h"
+#include "output.h"
+#include "progress.h"
+#include "provision/node_database.h"
+#include "rate.h"
+#include "target.h"
+
+#include <ovradrnode/node.h>
+
+#include <memory>
+#include <vector>
+
+namespace Ovradr {
+
+namespace {
+
+namespace ERR = OvraDRCore::ERR;
+using OvraDRCore::ErrRecorder;
+using OvraDRCore::Response;
+using OvraDRNode::Conn;
+
+constexpr int kMostRetries = 10;
+constexpr int kMostSeconds = 45; // the other appliance has a minute for its answer
+constexpr int kMostUrlSeconds = 600;
+
+struct SpeedOptions {
+    std::string node;
+    std::string url;
+    int retries = 1;
+    int seconds = 15;
+};
+
+/// One endpoint of this appliance, as it went.
+struct Tried {
+    std::string endpoint;
+    std::string speed; ///< "" when it failed
+    Failure why;       ///< then
+};
+
+/// What a script said before it gave up, without its own name; with `fallback` when it said
+/// nothing.
+std::string reasonOf(const std::string &said, const std::string &fallback) {
+    const std::size_t colon = said.find(".sh: ");
+    const std::string reason = colon == std::string::npos ? said : said.substr(colon + 5);
+    return reason.empty() ? fallback : reason;
+}
+
+void addSpeed(Report &report, const std::string &speed) {
+    report.data["speed"] = speed;
+    if (const auto bits = bitsPerSecond(speed)) {
+        report.data["bits_per_second"] = *bits;
+    }
+}
+
+Outcome measureUrl(const SpeedOptions &options) {
+    OvraDRNode::Node test;
+    std::string speed;
+    std::string said;
+    {
+        Progress progress;
+        progress.say(options.url + ": measuring");
+        speed = test.TestDownloadSpeed(options.url, options.retries, options.seconds);
+        said = progress.caught();
+    }
+    if (speed.empty() && test.GetErrCode() == ERR::kBadParameter) {
+        return failure(ExitCode::kNotSetUp, "The script that measures cannot be run.",
+                       "Run `ovradr setup`; the system log says more.");
+    }
+    if (speed.empty()) {
+        return failure(ExitCode::kNotReachable,
+                       options.url + " cannot be measured: " + reasonOf(said, "nothing came") + ".",
+                       "Check the address, and that it offers a file of some MiB.");
+    }
+    Report report;
+    report.data["url"] = options.url;
+    addSpeed(report, speed);
+    report.text = listing({{"url", options.url}, {"speed", rateText(speed)}});
+    return report;
+}
+
+Failure noneWorked(const std::vector<Tried> &tried) {
+    if (tried.empty()) {
+        return failure(ExitCode::kNotSetUp, "This appliance serves at no address.",
+                       "`ovradr conn local` shows its endpoints.");
+    }
+    const Failure &last = tried.back().why;
+    // The other appliance was not even asked.
+    if (last.exit != ExitCode::kFailed) {
+        return last;
+    }
+    std::string all;
+    for (const Tried &one : tried) {
+        all += (all.empty() ? "" : ", ") + one.endpoint;
+    }
+    Failure none = last;
+    none.message = "The other appliance downloads from none of the endpoints of this one, tried " +
+                   all + ": " + last.message;
+    return none;
+}
+
+Failure whyNot(const Response &answer, const ErrRecorder &sender) {
+    if (answer.isValid() && !answer.isSuccess()) {
+        return failureOf(answer.getErrCode(), answer.getErrMsg());
+    }
+    const int code = sender.GetErrCode();
+    return code == ERR::kNone ? failureOf(ERR::kFailed) : failureOf(code, sender.GetErrMsg());
+}
+
+Outcome reportOf(const std::string &nodeId, const std::string &speed,
+                 const std::vector<Tried> &tried) {
+    Report report;
+    report.data["node_id"] = nodeId;
+    addSpeed(report, speed);
+    std::vector<std::vector<std::string>> rows;
+    for (const Tried &one : tried) {
+        const bool worked = !one.speed.empty();
+        Json::Value item;
+        item["endpoint"] = one.endpoint;
+        item["success"] = worked;
+        if (worked) {
+            item["speed"] = one.speed;
+        } else {
+            item["code"] = one.why.code;
+            item["message"] = one.why.message;
+        }
+        report.data["endpoints"].append(item);
+        rows.push_back({one.endpoint, worked ? rateText(one.speed) : one.why.message});
+    }
+    report.text = table({"ENDPOINT OF THIS APPLIANCE", "OUTCOME"}, rows) + "\n" +
+                  listing({{"node", nodeId}, {"downloads at", rateText(speed)}});
+    return report;
+}
+
+Outcome measureNode(const SpeedOptions &options) {
+    const Expected<std::string> nodeId = resolveNode(options.node);
+    if (!nodeId) {
+        return nodeId.failure();
+    }
+    if (const Trouble trouble = checkNodeDatabase()) {
+        return *trouble;
+    }
+    OvraDRNode::Node test;
+    std::vector<Tried> tried;
+    std::string speed;
+    std::string said;
+    {
+        Progress progress;
+        progress.say("making the test file");
+        speed = test.TestSyncSpeed(
+            *nodeId, options.retries, options.seconds,
+            [&](const Conn &conn, const Response *answer, const ErrRecorder &sender) {
+                if (answer == nullptr) {
+                    progress.say(targetText(conn) + ": measuring");
+                    return;
+                }
+                const bool worked = answer->isSuccess();
+                tried.push_back({targetText(conn), worked ? answer->getDataFieldtoStr("speed") : "",
+                                 worked ? Failure() : whyNot(*answer, sender)});
+            });
+        said = progress.caught();
+    }
+    if (speed.empty() && tried.empty() && test.GetErrCode() == ERR::kBadParameter) {
+        return failure(ExitCode::kNotSetUp,
+                       "No test file can be made: " + reasonOf(said, "the script cannot be run") +
+                           ".",
+                       "Run `ovradr setup` as root, on a disk with room for 128 MiB.");
+    }
+    return speed.empty() ? Outcome(noneWorked(tried)) : reportOf(*nodeId, speed, tried);
+}
+
+Outcome measure(const SpeedOptions &options) {
+    if (options.node.empty() == options.url.empty()) {
+        return failure(ExitCode::kUsage, "Either a node or --url has to be given.",
+                       "`ovradr speed --help` shows examples.");
+    }
+    if (!options.url.empty()) {
+        return measureUrl(options);
+    }
+    if (options.seconds > kMostSeconds) {
+        return failure(ExitCode::kUsage, "A node gets 45 seconds at most.",
+                       "Give a smaller --timeout.");
+    }
+    return measureNode(options);
+}
+
+} // namespace
+
+void addSpeedCommand(CLI::App &app, Command &chosen) {
+    CLI::App *command =
+        app.add_subcommand("speed", "Measure how fast data moves to a node, or from a URL.");
+    const auto options = std::make_shared<SpeedOptions>();
+    command->add_option("NODE", options->node,
+                        "The node that downloads from this one: a node id, or the beginning of it");
+    command->add_option("--url", options->url, "Download from this URL to here instead");
+    command->add_option("--retries", options->retries, "Further attempts at each endpoint (1)")
+        ->check(CLI::Range(0, kMostRetries));
+    command
+        ->add_option("--timeout", options->seconds,
+                     "Seconds for each endpoint (15), at most 45; 600 with --url")
+        ->check(CLI::Range(1, kMostUrlSeconds));
+    command->footer(
+        "The endpoints of this appliance are tried one after the other until one works.\n"
+        "Examples:\n"
+        "  ovradr speed 3f2a\n"
+        "  ovradr speed --url https://nas2.example/some/file");
+    command->callback([&chosen, options] { chosen = [options] { return measure(*options); }; });
+}
+
+} // namespace Ovradr

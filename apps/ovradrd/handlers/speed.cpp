@@ -1,0 +1,123 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "handlers/handlers.h"
+#include "handlers/params.h"
+#include "ovradrnode/node.h"
+#include "webapi/api_errors.h"
+
+#include <ovradrcore/err_recorder.h>
+
+#include <algorithm>
+#include <string>
+
+namespace Ovradrd {
+
+namespace {
+
+namespace ERR = OvraDRCore::ERR;
+using OvraDRNode::Conn;
+using OvraPlatform::APICaller;
+using OvraPlatform::apiError;
+
+constexpr std::size_t kLongestUrl = 2048;
+constexpr int kMostRetries = 10;
+/// Who asks waits 60 seconds for the answer.
+constexpr int kMostSeconds = 45;
+constexpr int kUsualSeconds = 15;
+constexpr char kSchemeEnd[] = "://";
+
+struct Bounds {
+    int retries = 0;
+    int seconds = 0;
+};
+
+/// What exceeds a bound counts as the bound, because callers do not know them.
+Bounds boundsIn(Params &in) {
+    Bounds bounds;
+    bounds.retries = std::min(in.number("retries"), kMostRetries);
+    bounds.seconds = std::min(in.number("timeout"), kMostSeconds);
+    bounds.seconds = bounds.seconds == 0 ? kUsualSeconds : bounds.seconds;
+    return bounds;
+}
+
+/// The URL as a download takes it: an alias of the relay service is replaced by where it is reached
+/// now, and a bare IPv6 address gets its brackets. "" when it is no URL of a test.
+std::string downloadableUrl(const std::string &url) {
+    const std::size_t host = url.find(kSchemeEnd);
+    const std::size_t path = host == std::string::npos ? host : url.find('/', host + 3);
+    const std::size_t colon = path == std::string::npos ? path : url.rfind(':', path);
+    if (colon == std::string::npos || colon <= host + 3) {
+        return {};
+    }
+    Conn conn(url.substr(host + 3, colon - host - 3), url.substr(0, host), 0);
+    std::string port = url.substr(colon + 1, path - colon - 1);
+    if (conn.isFarlink()) {
+        conn = Conn::translateFarlink(conn);
+        port = std::to_string(conn.port);
+    }
+    if (conn.protocol != "http" && conn.protocol != "https") {
+        return {};
+    }
+    const bool bare = conn.addr.find(':') != std::string::npos && conn.addr.front() != '[';
+    return conn.protocol + kSchemeEnd + (bare ? "[" + conn.addr + "]" : conn.addr) + ":" + port +
+           url.substr(path);
+}
+
+Json::Value speedReply(const OvraDRNode::Node &test, const std::string &speed, const char *why) {
+    if (test.GetErrCode() != ERR::kNone || speed.empty()) {
+        return apiError(test.GetErrCode() != ERR::kNone ? test.GetErrCode() : int{ERR::kFailed},
+                        why);
+    }
+    Json::Value data(Json::objectValue);
+    data["speed"] = speed;
+    return OvraPlatform::apiSuccess(data);
+}
+
+/// How fast this node downloads what another one offers.
+Json::Value testDownloadSpeed(const Json::Value &params, const APICaller & /*caller*/) {
+    Params in(params);
+    const std::string url = in.text("url", kLongestUrl);
+    const Bounds bounds = boundsIn(in);
+    const std::string direct = in.ok() ? downloadableUrl(url) : std::string();
+    if (in.ok() && direct.empty()) {
+        in.refuse("url", "url has to be http://, https:// or flk:// with host, port and path, and "
+                         "an alias has to be known to the relay service");
+    }
+    if (!in.ok()) {
+        return in.error();
+    }
+    OvraDRNode::Node test;
+    const std::string speed = test.TestDownloadSpeed(direct, bounds.retries, bounds.seconds);
+    return speedReply(
+        test, speed,
+        "the file cannot be downloaded by this node: check the way between the nodes, "
+        "and that the test scripts are installed");
+}
+
+/// How fast another node downloads from this one.
+Json::Value testSyncSpeed(const Json::Value &params, const APICaller & /*caller*/) {
+    Params in(params);
+    const std::string nodeId = in.text("node_id", Params::kLongestId);
+    const Bounds bounds = boundsIn(in);
+    if (!in.ok()) {
+        return in.error();
+    }
+    OvraDRNode::Node test;
+    const std::string speed = test.TestSyncSpeed(nodeId, bounds.retries, bounds.seconds);
+    return speedReply(test, speed,
+                      "the other node downloads from none of the endpoints of this one: check the "
+                      "node id and the way between the nodes");
+}
+
+} // namespace
+
+void addSpeedAPI(OvraPlatform::APIRegistry &registry) {
+    using OvraPlatform::APILane;
+    using OvraPlatform::APIRight;
+    constexpr char kApi[] = "OVRA.DR.Node";
+    registry.add(kApi, 1, "test_download_speed", APIRight::kAdministrator, APILane::kSlow,
+                 testDownloadSpeed);
+    registry.add(kApi, 1, "test_sync_speed", APIRight::kAdministrator, APILane::kSlow,
+                 testSyncSpeed);
+}
+
+} // namespace Ovradrd
