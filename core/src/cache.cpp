@@ -127,9 +127,12 @@ bool Cache::UpdateWithData(const Json::Value &value) const {
 }
 
 bool Cache::UpdateWithData(const Json::Value &value, long start, long end) const {
+    const std::int64_t now = systemMilliseconds();
+    // A measurement that ended in this very second ended now: whole seconds would take up to one
+    // second off its lifetime.
+    const std::int64_t ended = end == now / kSecond ? now : end * kSecond;
     return CacheFile(path_).write(
-        {name_, toString(value), start * kSecond, end * kSecond, lifetime_ * kSecond},
-        systemMilliseconds());
+        {name_, toString(value), start * kSecond, ended, lifetime_ * kSecond}, now);
 }
 
 bool Cache::Remove() {

@@ -30,24 +30,19 @@ bool isSecret(std::string_view name) {
     return false;
 }
 
-void mask(Json::Value &value) {
+/// \param secret  whether the value stands under a secret name, alone or in an array; an object
+///                there is not login material itself, but may hold some
+void mask(Json::Value &value, bool secret) {
     if (value.isArray()) {
         for (Json::Value &item : value) {
-            mask(item);
+            mask(item, secret);
         }
-        return;
-    }
-    if (!value.isObject()) {
-        return;
-    }
-    for (const std::string &name : value.getMemberNames()) {
-        Json::Value &member = value[name];
-        // A non-scalar under such a name is not login material itself, but may hold some.
-        if (isSecret(name) && !member.isNull() && !member.isObject() && !member.isArray()) {
-            member = kMask;
-        } else {
-            mask(member);
+    } else if (value.isObject()) {
+        for (const std::string &name : value.getMemberNames()) {
+            mask(value[name], isSecret(name));
         }
+    } else if (secret && !value.isNull()) {
+        value = kMask;
     }
 }
 
@@ -83,7 +78,7 @@ std::string toString(const Json::Value &value) {
 
 Json::Value maskSecrets(const Json::Value &value) {
     Json::Value masked = value;
-    mask(masked);
+    mask(masked, false);
     return masked;
 }
 

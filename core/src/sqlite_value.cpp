@@ -53,8 +53,11 @@ std::string SqliteValue::ToLiteral() const {
     if (const int *number = std::get_if<int>(&value_)) {
         return std::to_string(*number);
     }
-    const auto &text = std::get<std::string>(value_);
-    return text.find('\0') == std::string::npos ? quoted(text) : quotedBytes(text);
+    const std::string *text = std::get_if<std::string>(&value_);
+    if (text == nullptr) {
+        return "NULL";
+    }
+    return text->find('\0') == std::string::npos ? quoted(*text) : quotedBytes(*text);
 }
 
 void SqliteValueList::AddValue(const std::string &name, const SqliteValue &value) {

@@ -34,6 +34,9 @@ Json::Value CredPermissionCache::GetInfo() const {
 }
 
 bool CredPermissionCache::GetUpdatedData(Json::Value &value) const {
+    if (credId.empty()) {
+        return false;
+    }
     CredNodeSender sender(credId);
     value = sender.process(WebAPI::getDRNodeTestPrivilegeAPI()).isSuccess();
     return true;
@@ -60,6 +63,9 @@ bool CredPermissionCache::GetCachedHasPrivilege() const {
 }
 
 bool CredPermissionCache::SetCacheData(bool has) const {
+    if (credId.empty()) {
+        return false;
+    }
     const bool old = GetCachedHasPrivilege();
     if (old != has) {
         OVRA_NOTICE("Set cred [%s] permission cache from [%s] to [%s]", credId.c_str(), word(old),
@@ -69,7 +75,7 @@ bool CredPermissionCache::SetCacheData(bool has) const {
 }
 
 bool CredPermissionCache::SetHasPrivilege() const {
-    return !credId.empty() && SetCacheData(true);
+    return SetCacheData(true);
 }
 
 bool CredPermissionCache::SetNoPrivilege(const OvraDRCore::Request &request) const {
@@ -90,11 +96,11 @@ bool CredPermissionCache::SetPrivilege(const OvraDRCore::Request &request, bool 
 }
 
 bool CredPermissionCache::UpdateWithData(const Json::Value &value) const {
-    return Cache::UpdateWithData(value);
+    return !credId.empty() && Cache::UpdateWithData(value);
 }
 
 bool CredPermissionCache::UpdateWithData(const Json::Value &value, long start, long end) const {
-    return Cache::UpdateWithData(value, start, end);
+    return !credId.empty() && Cache::UpdateWithData(value, start, end);
 }
 
 } // namespace OvraDRNode

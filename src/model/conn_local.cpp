@@ -105,14 +105,15 @@ Conn Conn::translateFarlink(const Conn &conn) {
     }
     Json::Value info;
     OVRA::CredRequestFarlink::GetConnInfo(conn.addr, info, nullptr);
-    const bool wellFormed = info.isObject() && info["host"].isString() &&
-                            info["protocol"].isString() && info["port"].isInt();
+    const Json::Value &found = info; // looking for a member adds it where that is allowed
+    const bool wellFormed = found.isObject() && found["host"].isString() &&
+                            found["protocol"].isString() && found["port"].isInt();
     if (!wellFormed) {
-        OVRA_ERR("Failed to find info[%s] of farlink[%s]", OvraDRCore::toLogString(info).c_str(),
+        OVRA_ERR("Failed to find info[%s] of farlink[%s]", OvraDRCore::toLogString(found).c_str(),
                  conn.addr.c_str());
         return {};
     }
-    return {info["host"].asString(), info["protocol"].asString(), info["port"].asInt()};
+    return {found["host"].asString(), found["protocol"].asString(), found["port"].asInt()};
 }
 
 } // namespace OvraDRNode

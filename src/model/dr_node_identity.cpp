@@ -46,6 +46,7 @@ std::string ReadNodeIdFromConf() {
         OVRA_ERR("Failed to get nodeId");
         return {};
     }
+    buffer.back() = '\0';
     std::string id = buffer.data();
     if (id.empty()) {
         OVRA_WARN("Invalid nodeId [%s]", id.c_str());
@@ -93,6 +94,7 @@ std::string DRNode::getLocalHostName() {
     if (OVRALnxGetHostname(buffer.data(), kTextSize) < 0) {
         OVRA_ERR("Failed to get hostname.");
     }
+    buffer.back() = '\0';
     return buffer.data();
 }
 
@@ -101,6 +103,7 @@ std::string DRNode::getLocalSerial() {
     if (OLIBGetSerialNumber(buffer.data(), kTextSize) < 0) {
         OVRA_ERR("Failed to get serial number.");
     }
+    buffer.back() = '\0';
     return buffer.data();
 }
 

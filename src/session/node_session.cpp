@@ -59,6 +59,7 @@ bool readField(json_object *record, int field, std::string &value) {
     if (OvraCgiJsonRecordGet(record, field, buffer.data(), buffer.size()) == 0) {
         return false;
     }
+    buffer.back() = '\0';
     value = buffer.data();
     return true;
 }
@@ -155,6 +156,7 @@ bool isUserExist(const std::string &userName) {
 void SetRemoteIP() {
     std::array<char, kFieldSize> client{};
     if (OvraCgiGetRemoteIP(client.data(), client.size()) != -1) {
+        client.back() = '\0';
         OVRA_INFO("create session for [%s]", client.data());
         return;
     }
@@ -168,7 +170,8 @@ void SetRemoteIP() {
 
 std::string hiddenUi() {
     Json::Value ui;
-    OvraDRCore::fromString(ui, OvraCgiLoginUIJsonConfigTemplate());
+    const char *const ours = OvraCgiLoginUIJsonConfigTemplate();
+    OvraDRCore::fromString(ui, ours != nullptr ? ours : "");
     if (!ui.isObject()) {
         ui = Json::Value(Json::objectValue);
     }
@@ -323,10 +326,11 @@ std::string NodeSession::GetUserBySession(const std::string &sessionId) {
         SetErr(ERR::kBadParameter);
         return {};
     }
+    Record record; // released after the handle
     CgiHandle handle;
     json_object *found = nullptr;
     const bool known = OvraCgiGetSessionBySID(handle.get(), sessionId.c_str(), &found) == 1;
-    const Record record(found);
+    record.reset(found);
     std::string user;
     if (!known) {
         SetErr(ERR::kSessionUserUnknown);

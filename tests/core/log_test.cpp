@@ -37,10 +37,12 @@ TEST(Log, HugeMessageIsCutAndSaysSo) {
 TEST(Log, LoginMaterialIsMaskedAtAnyDepthAndNothingElse) {
     Json::Value value;
     ASSERT_TRUE(fromString(value, R"({"webapi":{"params":{"password":"p1","otpcode":"123456",
-        "account":"joe","conn":{"addr":"h"}}},"session":"s1","list":[{"_sid":"s2"}],"n":1})"));
-    EXPECT_EQ(toLogString(value),
-              R"({"list":[{"_sid":"***"}],"n":1,"session":"***","webapi":{"params":)"
-              R"({"account":"joe","conn":{"addr":"h"},"otpcode":"***","password":"***"}}})");
+        "account":"joe","conn":{"addr":"h"}}},"session":"s1","list":[{"_sid":"s2"}],"n":1,
+        "token":["t1",2,null]})"));
+    EXPECT_EQ(
+        toLogString(value),
+        R"({"list":[{"_sid":"***"}],"n":1,"session":"***","token":["***","***",null],"webapi":{"params":)"
+        R"({"account":"joe","conn":{"addr":"h"},"otpcode":"***","password":"***"}}})");
     EXPECT_NE(toString(value).find("p1"), std::string::npos);
 }
 

@@ -97,6 +97,7 @@ TEST_F(Sqlite, KindsOfValuesReadBackAsTheyAre) {
     EXPECT_TRUE(value("int").GetValue("v", text));
     EXPECT_EQ(text, "-5");
     EXPECT_FALSE(value("int").GetValue("v").GetValue(text)) << "it does not hold text";
+    EXPECT_FALSE(value("int").GetValue("absent").GetValue(text));
     EXPECT_TRUE(value("text").GetValue("v", number));
     EXPECT_EQ(number, 17);
     number = 99;

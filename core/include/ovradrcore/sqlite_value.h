@@ -11,10 +11,9 @@
 
 namespace OvraDRCore {
 
-/// One cell: text (any bytes, NUL included) or a signed 32-bit integer.
+/// One cell: text (any bytes, NUL included) or a signed 32-bit integer; or, made by default, none.
 class OVRADRCORE_EXPORT SqliteValue {
 public:
-    /// The empty text.
     SqliteValue() = default;
     SqliteValue(const std::string &text)
         : value_(text) {} // NOLINT(google-explicit-constructor)
@@ -27,11 +26,11 @@ public:
     bool GetValue(std::string &text) const;
     /// True, and sets `number`, when the value holds an integer.
     bool GetValue(int &number) const;
-    /// The value as an SQL literal; text with a NUL in it as the text of its bytes.
+    /// The value as an SQL literal; text with a NUL in it as the text of its bytes; none as NULL.
     std::string ToLiteral() const;
 
 private:
-    std::variant<std::string, int> value_;
+    std::variant<std::monostate, std::string, int> value_;
 };
 
 /// One row: named values in the order in which they were added. Empty means that there is no row.
@@ -41,7 +40,7 @@ public:
 
     /// Adds a column; a name that is already there gets the new value.
     void AddValue(const std::string &name, const SqliteValue &value);
-    /// The column's value; an absent column gives the empty text.
+    /// The column's value; none for an absent column.
     SqliteValue GetValue(const std::string &name) const;
     /// True, and sets the target, when the column is there and convertible; an integer reads as its
     /// decimal text, and decimal text that fits reads as an integer.
