@@ -18,7 +18,7 @@ using OvraDRNode::DRNode;
 using OvraDRNode::DRNodeDB;
 
 constexpr const char *kLocalWord = "local";
-constexpr int kBothTables = DRNodeDB::CRED_TYPE_NODE | DRNodeDB::CRED_TYPE_TEMP;
+constexpr DRNodeDB::CredType kBothTables = DRNodeDB::CRED_TYPE_NODE | DRNodeDB::CRED_TYPE_TEMP;
 
 /// The one of `ids` that is `text` or begins with it.
 Expected<std::string> choose(const std::set<std::string> &ids, const std::string &text,

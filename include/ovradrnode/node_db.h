@@ -52,16 +52,18 @@ public:
 /// answered with DRNode::getLocalNode().
 class OVRADRNODE_EXPORT DRNodeDB {
 public:
-    /// Which credential tables are read; both bits: node credentials first.
+    /// Which credential tables are read, a set of bits; both: node credentials first.
     enum CredType { CRED_TYPE_NODE = 1, CRED_TYPE_TEMP = 2 };
+    friend constexpr CredType operator|(CredType left, CredType right) {
+        return static_cast<CredType>(static_cast<int>(left) | static_cast<int>(right));
+    }
 
     /// Deletes every node credential of the node; its temporary ones stay.
     static bool Delete(const std::string &nodeId);
     /// Appends every credential. True even when a table could not be read (which is logged).
-    /// \param type  a CredType, or both bits
-    static bool List(std::vector<DRNode> &nodes, int type);
+    static bool List(std::vector<DRNode> &nodes, CredType type);
     /// Appends the credentials of one node, like List(); false for an empty id.
-    static bool ListCred(const std::string &nodeId, std::vector<DRNode> &nodes, int type);
+    static bool ListCred(const std::string &nodeId, std::vector<DRNode> &nodes, CredType type);
     /// The first node credential of the node. A node without any gives true and a record that holds
     /// the node id alone, which is not valid.
     static bool Get(const std::string &nodeId, DRNode &node);

@@ -32,7 +32,7 @@ bool ListRecords(const SqliteTableHandler &table, const std::string &nodeId,
 
 /// A table that cannot be read yields fewer records, not a failure: one half of the credentials is
 /// better than none.
-void listNodes(const std::string &nodeId, std::vector<DRNode> &nodes, int type) {
+void listNodes(const std::string &nodeId, std::vector<DRNode> &nodes, DRNodeDB::CredType type) {
     std::vector<SqliteValueList> rows;
     if ((type & DRNodeDB::CRED_TYPE_NODE) != 0) {
         ListRecords(NodeCredSqliteTable(), nodeId, rows);
@@ -87,12 +87,12 @@ int GetNodeRecordNum(const std::string &nodeId, const SqliteTableHandler &table)
 
 } // namespace
 
-bool DRNodeDB::List(std::vector<DRNode> &nodes, int type) {
+bool DRNodeDB::List(std::vector<DRNode> &nodes, CredType type) {
     listNodes("", nodes, type);
     return true;
 }
 
-bool DRNodeDB::ListCred(const std::string &nodeId, std::vector<DRNode> &nodes, int type) {
+bool DRNodeDB::ListCred(const std::string &nodeId, std::vector<DRNode> &nodes, CredType type) {
     if (nodeId.empty()) {
         OVRA_ERR("Invalid nodeId [%s]", nodeId.c_str());
         return false;

@@ -38,13 +38,13 @@ std::string ids(const std::vector<DRNode> &nodes) {
 
 std::string list(int type) {
     std::vector<DRNode> nodes;
-    EXPECT_TRUE(DRNodeDB::List(nodes, type));
+    EXPECT_TRUE(DRNodeDB::List(nodes, static_cast<DRNodeDB::CredType>(type)));
     return ids(nodes);
 }
 
 std::string listCred(const std::string &nodeId, int type) {
     std::vector<DRNode> nodes;
-    EXPECT_TRUE(DRNodeDB::ListCred(nodeId, nodes, type));
+    EXPECT_TRUE(DRNodeDB::ListCred(nodeId, nodes, static_cast<DRNodeDB::CredType>(type)));
     return ids(nodes);
 }
 
@@ -58,9 +58,9 @@ TEST_F(NodeDb, ListsTheTablesAskedForNodeCredentialsFirst) {
     EXPECT_EQ(listCred("n3", 1), "");
     EXPECT_EQ(listCred("n1' OR '1'='1", 3), "") << "an id is never SQL";
     std::vector<DRNode> nodes(1);
-    EXPECT_FALSE(DRNodeDB::ListCred("", nodes, 3));
+    EXPECT_FALSE(DRNodeDB::ListCred("", nodes, DRNodeDB::CRED_TYPE_NODE));
     EXPECT_EQ(log.count("ERR", "node_db", "ListCred", "Invalid nodeId []"), 1);
-    EXPECT_TRUE(DRNodeDB::ListCred("n2", nodes, 1));
+    EXPECT_TRUE(DRNodeDB::ListCred("n2", nodes, DRNodeDB::CRED_TYPE_NODE));
     EXPECT_EQ(nodes.size(), 2U) << "appended, never cleared";
 }
 

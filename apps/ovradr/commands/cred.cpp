@@ -151,7 +151,8 @@ Outcome list(const CredOptions &options) {
     report.data["creds"] = Json::Value(Json::arrayValue);
     std::vector<std::vector<std::string>> rows;
     const auto add = [&](bool temporary) {
-        const int table = temporary ? DRNodeDB::CRED_TYPE_TEMP : DRNodeDB::CRED_TYPE_NODE;
+        const DRNodeDB::CredType table =
+            temporary ? DRNodeDB::CRED_TYPE_TEMP : DRNodeDB::CRED_TYPE_NODE;
         std::vector<DRNode> records;
         nodeId.empty() ? DRNodeDB::List(records, table)
                        : DRNodeDB::ListCred(nodeId, records, table);

@@ -136,7 +136,7 @@ Json::Value get(const Json::Value &params, const APICaller & /*caller*/) {
     return DRNodeDB::GetCred(credId, record) ? apiSuccess(record.toJson()) : noSuchCredential();
 }
 
-void appendRecords(Json::Value &list, const std::string &nodeId, int type) {
+void appendRecords(Json::Value &list, const std::string &nodeId, DRNodeDB::CredType type) {
     std::vector<DRNode> records;
     if (nodeId.empty()) {
         DRNodeDB::List(records, type);
