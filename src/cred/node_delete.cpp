@@ -30,6 +30,7 @@ bool DRNodeCredDelete::process() {
     DRNode record;
     if (!DRNodeDB::GetCred(credId, record)) {
         OVRA_WARN("Failed to get cred[%s] from db", credId.c_str());
+        record = DRNode(); // nothing of a row that is not a valid one
     }
     if (!DeleteRecord()) {
         OVRA_ERR("Failed to delete record of cred[%s]", credId.c_str());

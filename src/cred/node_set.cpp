@@ -3,8 +3,10 @@
 
 #include "ovradrcore/json.h"
 #include "ovradrcore/log.h"
+#include "ovradrnode/cred_permission_cache.h"
 #include "ovradrnode/cred_utils.h"
 #include "ovradrnode/node_api.h"
+#include "ovradrnode/node_cache.h"
 #include "ovradrnode/node_db.h"
 #include "words.h"
 
@@ -207,6 +209,9 @@ bool DRNodeCredSet::process() {
         !CredUtils::NotifyRemoteNodeDeleteSessionIfNotUsed(conn, record.session)) {
         OVRA_WARN("Failed to notify remote [%s] to delete not used session", text(conn).c_str());
     }
+    // What was known of the node and of the right came over the old endpoint and session.
+    CredPermissionCache(record.credId).Update();
+    NodeCache(record.nodeId, true).Update();
     SetErr(ERR::kNone);
     return true;
 }

@@ -21,7 +21,7 @@ using OvraDRCore::Response;
 namespace {
 
 constexpr int kRemoteNoPermission = 105;
-constexpr int kAllCreds = DRNodeDB::CRED_TYPE_NODE | DRNodeDB::CRED_TYPE_TEMP;
+constexpr DRNodeDB::CredType kAllCreds = DRNodeDB::CRED_TYPE_NODE | DRNodeDB::CRED_TYPE_TEMP;
 
 bool isNoPermission(const Response &response) {
     return response.isValid() && !response.isSuccess() &&
@@ -69,7 +69,7 @@ Response NodeSender::process(const Request &request) {
         SetErr(ERR::kBadParameter);
         return response;
     }
-    if (nodeId == DRNode::getLocalNodeId()) {
+    if (!nodeId.empty() && nodeId == DRNode::getLocalNodeId()) {
         return run(request);
     }
     const std::string remembered = getCachedCredId();

@@ -1,6 +1,8 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "cred/flow_fixture.h"
 #include "ovradrcore/json.h"
+#include "ovradrnode/cred_permission_cache.h"
+#include "ovradrnode/node_cache.h"
 #include "ovradrnode/node_set.h"
 
 using namespace OvraDRNode;
@@ -37,6 +39,8 @@ TEST_F(CredUpdate, TheRowIsRewrittenAndThenTheOldSessionReleasedOverTheNewEndpoi
     EXPECT_EQ(seen, granted("granted"));
     EXPECT_EQ(remote.params("delete"), R"({"session":"old"})");
     EXPECT_EQ(sent("old delete"), 1);
+    EXPECT_EQ(NodeCache("n1", false).GetCachedData()["hostname"], "b");
+    EXPECT_TRUE(CredPermissionCache("c1").GetCachedData().isBool());
 }
 
 TEST_F(CredUpdate, ASessionThatAnotherCredentialUsesStays) {
