@@ -106,8 +106,14 @@ linkWords() {
     if [[ $labWay == proot ]]; then
         echo "loopback"
     else
-        echo "eth0 $(<"$lab/n$1/link0"), eth1 $(<"$lab/n$1/link1")"
+        echo "eth0 $(linkWord "$1" 0), eth1 $(linkWord "$1" 1)"
     fi
+}
+
+linkWord() {
+    local shape=""
+    [[ ! -s $lab/n$1/shape$2 ]] || shape=" ($(<"$lab/n$1/shape$2"))"
+    echo "$(<"$lab/n$1/link$2")$shape"
 }
 
 # daemonWord NODE YES-OR-NO: whether the node's daemon answers now, asked from inside.

@@ -169,6 +169,25 @@ killedDaemon() {
     (($(wc -l <<<"$output") == 5)) || fail "a credential is missing"
 }
 
+speedOfAShapedLink() {
+    local bits
+    [[ $("$lab" addr 2) != 127.* ]] || exit 77 # proot gives nodes no links of their own
+    url=https://$("$lab" addr 2 1):5001
+    create 0
+    "$lab" shape 1 --rate 100mbit --delay 20ms >/dev/null 2>&1 || "$lab" shape 1 --rate 100mbit >/dev/null
+    on 1 0 ovradr --json speed "$remote"
+    bits=$(sed -n 's/.*"bits_per_second":\([0-9]*\).*/\1/p' <<<"$output")
+    ((bits > 90000000 && bits < 110000000)) || fail "100 Mbit/s were measured as $bits bit/s"
+    # The first two of node 1's four endpoints cannot be reached any more, and the third can.
+    "$lab" drop 1 0 >/dev/null
+    on 1 0 ovradr speed "$remote" --timeout 4 --retries 0
+    says "https://$("$lab" addr 1 0):5001"
+    says "http://$("$lab" addr 1 0):5000"
+    says "downloads at"
+    on 1 0 sh -c 'ls /usr/ovra/var/ovradr/speedtest | wc -l'
+    [[ $output == 0 ]] || fail "a test file is left"
+}
+
 stopDaemon() { "$lab" run 2 -- pkill -TERM -x ovradrd || fail "no daemon to stop"; waitGone; }
 waitGone() {
     for _ in $(seq 50); do

@@ -156,6 +156,41 @@ linksAreCutDroppedAndRestored() {
     holds "a link that is not there" "$output" "the links are 0 (eth0) and 1 (eth1)"
 }
 
+# lostPackets ADDRESS: how many of 1,000 datagrams from node 1 do not reach node 2.
+lostPackets() {
+    lab run 2 -- perl -MIO::Socket::INET -e '
+        my $in = IO::Socket::INET->new(LocalAddr => $ARGV[0], LocalPort => 9, Proto => "udp") or die;
+        $in->setsockopt(SOL_SOCKET, SO_RCVBUF, 4 << 20);
+        print "ready\n"; STDOUT->flush; my $lost = 1000;
+        while (1) { my $ready = ""; vec($ready, fileno $in, 1) = 1;
+            select($ready, undef, undef, 2) or last; recv $in, my $one, 9, 0; $lost-- }
+        print "$lost\n"' "$1" </dev/null >"$scratch/lost" &
+    eventually "the receiver listens" grep -q ready "$scratch/lost"
+    lab run 1 -- perl -MIO::Socket::INET -e '
+        my $out = IO::Socket::INET->new(PeerAddr => $ARGV[0], PeerPort => 9, Proto => "udp") or die;
+        for (1 .. 1000) { send $out, "x", 0; select undef, undef, undef, 0.01 unless $_ % 20 }' "$1"
+    wait $!
+    tail -n 1 "$scratch/lost"
+}
+
+linksAreShaped() {
+    local address lost
+    requireLinks
+    lab up 2 --no-daemon >/dev/null
+    address=$(lab addr 2 0)
+    same "datagrams lost on a plain link" "$(lostPackets "$address")" 0
+    lab shape 2 0 --loss 20% --rate 100mbit
+    lost=$(lostPackets "$address")
+    ((lost > 130 && lost < 300)) || broken "of 1000 datagrams $lost were lost instead of about 200"
+    holds "the status" "$(lab status)" "eth0 up (rate 100000 kbit/s loss 20.00 %)"
+    lab shape 2 --off
+    same "datagrams lost afterwards" "$(lostPackets "$address")" 0
+    exitCodeOf lab shape 2 0 --delay 20ms
+    [[ $code == 0 ]] || holds "why packets cannot be delayed" "$output" "this kernel has no netem"
+    exitCodeOf lab shape 2 0 --rate fast
+    holds "a rate that is none" "$output" "write for example"
+}
+
 labsAreApart() {
     lab up 1 --no-daemon >/dev/null
     lab run 1 -- touch /usr/ovra/first

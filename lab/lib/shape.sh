@@ -1,0 +1,135 @@
+# SPDX-License-Identifier: Apache-2.0
+# shellcheck shell=bash
+# lab shape: makes a node's links slow, long or lossy, with the kernel's queues (tc) at both ends of
+# the link and the firewall of the switch.
+#   rate    both ways, by a token bucket
+#   delay   added to the round trip, on the way to the node
+#   loss    of the IPv4 packets in each direction
+
+labShape() {
+    local action=shape rate="" delay="" loss="" off=no shaped=(0 1)
+    needLab
+    needNode "${1-}"
+    shift
+    [[ $labWay != proot ]] ||
+        fail "shape needs links of the lab's own; with proot all nodes share the loopback interface"
+    if [[ ${1-} != --* && $# -gt 0 ]]; then
+        needLink "$1"
+        shaped=("$link")
+        shift
+    fi
+    (($#)) || fail "say how: lab shape NODE [LINK] --rate 100mbit --delay 20ms --loss 5% --cut, or --off"
+    while (($#)); do
+        case $1 in
+        --off) off=yes ;;
+        --cut) action="cut" ;;
+        --rate | --delay | --loss)
+            (($# > 1)) || fail "$1 needs a value"
+            readShape "$1" "$2"
+            shift
+            ;;
+        *) fail "there is no \"$1\" in a shape; there are --rate, --delay, --loss, --cut and --off" ;;
+        esac
+        shift
+    done
+    [[ $off == no || $action$rate$delay$loss == shape ]] || fail "--off stands alone"
+    [[ -z $delay ]] || needNetem
+    for link in "${shaped[@]}"; do
+        shapeLink
+    done
+}
+
+# readShape OPTION VALUE: sets rate (bits a second), delay (ms) or loss (per 10,000).
+readShape() {
+    local -A units=([kbit]=1000 [mbit]=1000000 [gbit]=1000000000)
+    case $1 in
+    --rate)
+        [[ $2 =~ ^([1-9][0-9]{0,5})(kbit|mbit|gbit)$ ]] ||
+            fail "\"$2\" is no rate; write for example 512kbit, 100mbit or 1gbit"
+        rate=$((BASH_REMATCH[1] * units[${BASH_REMATCH[2]}]))
+        ;;
+    --delay)
+        [[ $2 =~ ^([1-9][0-9]{0,3})ms$ ]] || fail "\"$2\" is no delay; write for example 20ms"
+        delay=${BASH_REMATCH[1]}
+        ;;
+    --loss)
+        [[ $2 =~ ^([0-9]{1,2})(\.([0-9]{1,2}))?%$ ]] || fail "\"$2\" is no loss; write for example 0.5% or 5%"
+        loss=${BASH_REMATCH[3]-}00
+        loss=$((10#${BASH_REMATCH[1]} * 100 + 10#${loss:0:2}))
+        ;;
+    esac
+}
+
+# needNetem: stops where the kernel has no queue that holds packets back for a time.
+needNetem() {
+    local why
+    if why=$( (enterLab tc qdisc add dev lo root netem delay 1ms) 2>&1); then
+        (enterLab tc qdisc del dev lo root)
+        return
+    fi
+    fail "this kernel has no netem, so packets cannot be delayed (${why%.}); leave --delay out, or use a kernel with sch_netem"
+}
+
+# shapeLink: gives one link of the node its shape, from scratch.
+shapeLink() {
+    local port=n${node}e$link told=""
+    clearShape "$port"
+    if [[ $off == yes ]]; then
+        rm -f "$lab/n$node/shape$link"
+        echo "lab: eth$link of node-$node has no shape"
+        return
+    fi
+    if [[ -n $delay ]]; then
+        (enterLab tc qdisc add dev "$port" root handle 1: netem delay "${delay}ms" limit 20000) ||
+            fail "the queue of eth$link of node-$node could not be set"
+        told+=" delay ${delay} ms"
+    fi
+    if [[ -n $rate ]]; then
+        setRate
+        told+=" rate $((rate / 1000)) kbit/s"
+    fi
+    if [[ -n $loss ]]; then
+        dropSome "$port"
+        told+=" loss $((loss / 100)).$(printf %02d $((loss % 100))) %"
+    fi
+    if [[ $action == cut ]]; then
+        labLink cut "$node" "$link" >/dev/null
+        told+=" cut"
+    fi
+    echo "${told# }" >"$lab/n$node/shape$link"
+    echo "lab: eth$link of node-$node:$told"
+}
+
+# setRate: both ways. The bucket holds what passes in 10 ms, because the kernel's clock may tick no
+# more than 100 times a second.
+setRate() {
+    local burst=$((rate / 8 / 100)) bucket place=(root)
+    ((burst >= 16384)) || burst=16384
+    [[ -z $delay ]] || place=(parent 1:1)
+    bucket=(tbf rate "${rate}bit" burst "$burst" latency 50ms)
+    if ! (enterLab tc qdisc add dev "n${node}e$link" "${place[@]}" "${bucket[@]}") ||
+        ! (enterNode "$node" tc qdisc add dev "eth$link" root "${bucket[@]}"); then
+        fail "the rate of eth$link of node-$node could not be set"
+    fi
+}
+
+# dropSome PORT
+dropSome() {
+    (enterLab nft -f - || fail "the loss of eth$link of node-$node could not be set") <<-END
+	table bridge loss_$1 {
+	    chain forward {
+	        type filter hook forward priority 1; policy accept;
+	        iifname "$1" ether type ip numgen random mod 10000 < $loss drop
+	        oifname "$1" ether type ip numgen random mod 10000 < $loss drop
+	    }
+	}
+	END
+}
+
+# clearShape PORT
+clearShape() {
+    (enterLab tc qdisc del dev "$1" root) 2>/dev/null || true
+    (enterNode "$node" tc qdisc del dev "eth$link" root) 2>/dev/null || true
+    (enterLab nft delete table bridge "loss_$1") 2>/dev/null || true
+    [[ $off == no || $(<"$lab/n$node/link$link") != cut ]] || labLink restore "$node" "$link" >/dev/null
+}
