@@ -46,7 +46,5 @@ inline constexpr const char *kWebApi = "webapi";
 
 /// The user whose rights local calls have.
 inline constexpr const char *kLocalUser = "admin";
-/// The application that our sessions belong to.
-inline constexpr const char *kApplication = "Tidewater";
 
 } // namespace OvraDRNode::Word

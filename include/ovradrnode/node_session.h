@@ -13,6 +13,9 @@ namespace OvraDRNode {
 /// operation leaves its outcome as the error code.
 class OVRADRNODE_EXPORT NodeSession : public OvraDRCore::ErrRecorder {
 public:
+    /// The application that they are marked with in the store.
+    static constexpr char kApplication[] = "Tidewater";
+
     NodeSession() = default;
     ~NodeSession() override;
 

@@ -76,7 +76,8 @@ std::string nodeIdOf(json_object *record) {
 /// Removes every session of ours, whoever's it is.
 int isOtherApplication(json_object *record, void * /*argument*/) {
     std::string app;
-    const bool ours = readField(record, OVRA_CGI_FIELD_APP, app) && app == Word::kApplication;
+    const bool ours =
+        readField(record, OVRA_CGI_FIELD_APP, app) && app == NodeSession::kApplication;
     return ours ? kRemove : kKeep;
 }
 
@@ -120,7 +121,7 @@ int GetSessionIDByNodeUser(json_object *record, void *argument) {
         OVRA_WARN("Failed to get app of cgi");
         return kKeep;
     }
-    if (app != Word::kApplication) {
+    if (app != NodeSession::kApplication) {
         return kKeep;
     }
     std::string owner;
@@ -184,7 +185,7 @@ bool setLoginOptions(OvraCgi *handle, int timeout) {
     constexpr int kOn = 1;
     return OvraCgiSetOption(handle, OVRA_CGI_OPT_SKIP_PASSWORD, &kOn) != 0 &&
            OvraCgiSetOption(handle, OVRA_CGI_OPT_MULTIPLE, &kOn) != 0 &&
-           OvraCgiSetOption(handle, OVRA_CGI_OPT_APP, Word::kApplication) != 0 &&
+           OvraCgiSetOption(handle, OVRA_CGI_OPT_APP, NodeSession::kApplication) != 0 &&
            OvraCgiSetOption(handle, OVRA_CGI_OPT_TIMEOUT, &timeout) != 0;
 }
 
@@ -219,7 +220,7 @@ std::string CgiLogin(const std::string &userName, int timeout, const std::string
     }
     std::array<char, kSessionIdSize + 1> sessionId{};
     if (OvraCgiLoginNoAuth(handle.get(), sessionId.data(), kSessionIdSize, nullptr) != 1) {
-        OVRA_ERR("Failed to login session of [%s] with user[%s]", Word::kApplication,
+        OVRA_ERR("Failed to login session of [%s] with user[%s]", NodeSession::kApplication,
                  userName.c_str());
         return {};
     }

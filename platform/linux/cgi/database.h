@@ -23,7 +23,7 @@ struct DatabaseLayout {
 };
 
 /// A prepared statement. Text and blobs are bound, never pasted.
-class Statement {
+class OVRAPLATFORM_EXPORT Statement {
 public:
     Statement &bind(int index, std::string_view text);
     Statement &bind(int index, std::int64_t number);
@@ -57,7 +57,7 @@ private:
 /// One connection to a store's SQLite file. Not shared between threads, nor kept across a fork.
 /// Everything fails, harmlessly, when the file could not be opened. A failure is remembered as one
 /// sentence that says what was wrong and what to do, and is logged once at ERR.
-class Database {
+class OVRAPLATFORM_EXPORT Database {
 public:
     /// Opens the file; makes it, mode 0600, and its folder (ensureStateDir()) when missing.
     Database(std::string path, const DatabaseLayout &layout);
@@ -83,8 +83,7 @@ private:
     friend class Statement;
     friend class Transaction;
     struct Close {
-        // Called where an object of a store is destroyed, by whoever owns it.
-        OVRAPLATFORM_EXPORT void operator()(sqlite3 *database) const;
+        void operator()(sqlite3 *database) const;
     };
 
     bool makeFile();
@@ -102,7 +101,7 @@ private:
 };
 
 /// A write transaction: nothing is written unless commit() says so.
-class Transaction {
+class OVRAPLATFORM_EXPORT Transaction {
 public:
     /// Waits for another process's transaction as long as the connection's busy time-out.
     explicit Transaction(Database &database);

@@ -1,0 +1,78 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include "cgi/database.h"
+#include "ovradrnode/conn.h"
+
+#include <cstdint>
+#include <ctime>
+#include <functional>
+#include <string>
+#include <vector>
+
+namespace OvraApps {
+
+/// Mode 0600: it holds sessions. docs/files.md describes it.
+inline constexpr char kPendingReleasesFile[] = "/usr/ovra/var/ovradr/releases.db";
+
+/// A session on another node that nothing needs any more and that perhaps is still there.
+struct PendingRelease {
+    std::string session; ///< a secret
+    OvraDRNode::Conn conn;
+    std::string nodeId;
+    std::string credId;       ///< the credential that it came from
+    std::int64_t noted = 0;   ///< seconds of the system clock
+    int attempts = 0;         ///< how often the release was tried in vain
+    std::int64_t nextTry = 0; ///< seconds of the system clock
+    int code = 0;             ///< why the last attempt failed; 0: there was none
+
+    /// Names it to people: 16 hexadecimal digits of the session's SHA-256, the same ones by which
+    /// the other node names the session.
+    std::string reference() const;
+};
+
+/// The releases that could not be done, in a SQLite file that all processes share. An object holds
+/// one connection: short-lived, for one thread. Every change is one transaction.
+class PendingReleases {
+public:
+    /// How many are remembered. More are not: they are found by an audit at the other node.
+    static constexpr int kMost = 4096;
+    /// How long a release that has just been noted is left to the process that noted it, in
+    /// seconds: longer than a flow takes.
+    static constexpr int kHold = 600;
+    /// The pause after the first failed attempt, in seconds; each further one is twice as long.
+    static constexpr int kFirstPause = 30;
+    static constexpr int kLongestPause = 6 * 3600;
+
+    using Clock = std::function<std::time_t()>;
+
+    /// Opens the store; makes file and folder when missing.
+    explicit PendingReleases(const std::string &path = kPendingReleasesFile, Clock clock = {});
+
+    bool isOpen() const { return database_.isOpen(); }
+    /// Why the last operation failed, in sentences; "" when it did not.
+    const std::string &error() const { return database_.error(); }
+
+    /// Remembers a release before its flow begins, so that a flow that is killed leaves it noted.
+    /// One that is known already gets the new endpoint. \return false on failure, and when there
+    /// are kMost already.
+    bool note(const PendingRelease &release);
+    /// The release failed once more: it is due again after a pause. \return false on failure.
+    bool postpone(const std::string &reference, int code);
+    /// Forgets the release; one that is not there is forgotten. \return false on failure.
+    bool remove(const std::string &reference);
+    /// All, the oldest first. \return false on failure.
+    bool list(std::vector<PendingRelease> &releases);
+    /// At most `most` of those that are due, the longest due first. Also those whose time lies
+    /// further ahead than any pause reaches: the clock was set back. \return false on failure.
+    bool listDue(std::vector<PendingRelease> &releases, int most);
+
+private:
+    std::int64_t now() const;
+    bool collect(OvraPlatform::Statement &rows, std::vector<PendingRelease> &releases);
+
+    OvraPlatform::Database database_;
+    Clock clock_;
+};
+
+} // namespace OvraApps

@@ -1,0 +1,39 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include "ovradrnode/conn.h"
+
+#include <json/value.h>
+
+#include <optional>
+#include <string>
+
+namespace OvraApps {
+
+/// What the other node says about a session that it granted to this one.
+enum class SessionState {
+    kLive,    ///< it is accepted, and may change things there
+    kGone,    ///< the node does not know it, or not any more
+    kRefused, ///< the node knows it but does not let it do anything
+    kSilent,  ///< no answer, or none that can be trusted
+};
+
+struct SessionAnswer {
+    SessionState state = SessionState::kSilent;
+    /// Why it is neither live nor gone: a code of the library or of the web API, and what came
+    /// with it.
+    int code = 0;
+    Json::Value detail;
+};
+
+/// Asks the node at `conn` about the session, under that session. Takes as long as a request, and
+/// at most 10 seconds where nobody answers; an endpoint that was found dead in the last 5 seconds
+/// is not asked.
+SessionAnswer askSession(const OvraDRNode::Conn &conn, const std::string &session);
+
+/// How many lasting credentials of this node hold the session: only these keep a session alive.
+/// \param exceptCredId  a credential that does not count, or ""
+/// \return nothing when the node database cannot be read.
+std::optional<int> countUsers(const std::string &session, const std::string &exceptCredId = "");
+
+} // namespace OvraApps

@@ -1,0 +1,150 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "shared/session_release.h"
+
+#include "ovradrnode/cred_utils.h"
+#include "ovradrnode/node_cache.h"
+#include "ovradrnode/node_db.h"
+#include "ovradrnode/node_delete.h"
+#include "shared/remote_session.h"
+
+#include <ovradrcore/err_recorder.h>
+#include <ovradrcore/log.h>
+
+#include <optional>
+
+namespace OvraApps {
+
+using OvraDRNode::Conn;
+using OvraDRNode::DRNode;
+using OvraDRNode::DRNodeDB;
+
+namespace {
+
+Release left(int code, const Json::Value &detail = Json::Value()) {
+    return {ReleaseOutcome::kLeft, code, detail, false};
+}
+
+/// What is the case now; nothing when the session is accepted and no credential uses it.
+/// \param whenGone  how a session that is gone counts
+std::optional<Release> look(const Conn &conn, const std::string &session,
+                            const std::string &exceptCredId, ReleaseOutcome whenGone) {
+    if (session.empty()) {
+        return Release{ReleaseOutcome::kEndedAlready, 0, {}, false};
+    }
+    const std::optional<int> users = countUsers(session, exceptCredId);
+    if (!users) {
+        return left(OvraDRCore::ERR::kFailed);
+    }
+    if (*users > 0) {
+        return Release{ReleaseOutcome::kKept, 0, {}, false};
+    }
+    const SessionAnswer answer = askSession(conn, session);
+    switch (answer.state) {
+    case SessionState::kLive:
+        return std::nullopt;
+    case SessionState::kGone:
+        return Release{whenGone, 0, {}, false};
+    default:
+        return left(answer.code, answer.detail);
+    }
+}
+
+/// After it was to be released.
+Release lookAfter(const Conn &conn, const std::string &session, ReleaseOutcome whenGone) {
+    return look(conn, session, "", whenGone).value_or(left(OvraDRCore::ERR::kSessionNotRemoved));
+}
+
+/// Brings the memory in line with what became of the session.
+void settle(PendingReleases &store, const PendingRelease &pending, Release &release) {
+    release.remembered = release.outcome == ReleaseOutcome::kLeft &&
+                         store.postpone(pending.reference(), release.code);
+    if (release.outcome != ReleaseOutcome::kLeft) {
+        store.remove(pending.reference());
+    }
+}
+
+/// As the deletion of a lasting credential; only the table is another one.
+bool deleteTemporary(const DRNode &record) {
+    const OvraDRCore::SqliteEqual condition("cred_id", record.credId);
+    if (!OvraDRNode::NodeDBHandler::GetHandler().DeleteRecord(condition.text,
+                                                              OvraDRNode::TempCredSqliteTable())) {
+        return false;
+    }
+    OvraDRNode::CredUtils::NotifyRemoteNodeDeleteSessionIfNotUsed(record.conn, record.session);
+    if (DRNodeDB::IsNodeIdExist(record.nodeId) <= 0) {
+        OvraDRNode::NodeCache(record.nodeId, false).Remove();
+    }
+    return true;
+}
+
+} // namespace
+
+const char *releaseWord(ReleaseOutcome outcome) {
+    switch (outcome) {
+    case ReleaseOutcome::kReleased:
+        return "released";
+    case ReleaseOutcome::kEndedAlready:
+        return "ended_already";
+    case ReleaseOutcome::kKept:
+        return "kept";
+    case ReleaseOutcome::kLeft:
+        break;
+    }
+    return "left_behind";
+}
+
+Release foreseeRelease(const DRNode &record) {
+    return look(record.conn, record.session, record.credId, ReleaseOutcome::kEndedAlready)
+        .value_or(Release{ReleaseOutcome::kReleased, 0, {}, false});
+}
+
+ReleasingFlow runReleasing(const DRNode &record, const Conn &conn,
+                           const std::function<bool()> &flow) {
+    DRNode superfluous = record;
+    superfluous.conn = conn;
+    const bool wasGone = foreseeRelease(superfluous).outcome == ReleaseOutcome::kEndedAlready;
+    const PendingRelease pending{record.session, conn, record.nodeId, record.credId};
+    PendingReleases store;
+    const bool noted = !record.session.empty() && conn.isValid() && store.note(pending);
+    ReleasingFlow result;
+    result.done = flow();
+    if (!result.done) {
+        // The credential is as it was, and needs its session.
+        store.remove(pending.reference());
+        return {false, {ReleaseOutcome::kKept, 0, {}, false}};
+    }
+    result.release = lookAfter(conn, record.session,
+                               wasGone ? ReleaseOutcome::kEndedAlready : ReleaseOutcome::kReleased);
+    if (noted) {
+        settle(store, pending, result.release);
+    }
+    return result;
+}
+
+ReleasingFlow deleteCredential(const DRNode &record, bool temporary) {
+    return runReleasing(record, record.conn, [&record, temporary] {
+        return temporary ? deleteTemporary(record)
+                         : OvraDRNode::DRNodeCredDelete(record.credId).process();
+    });
+}
+
+Release retryRelease(const PendingRelease &pending, PendingReleases &store) {
+    DRNode record;
+    const bool inUse = DRNodeDB::GetCred(pending.credId, record) &&
+                       record.session == pending.session; // its flow was killed before it changed
+    Release result{ReleaseOutcome::kKept, 0, {}, false};
+    if (!inUse) {
+        const auto now = look(pending.conn, pending.session, "", ReleaseOutcome::kReleased);
+        if (!now) {
+            OvraDRNode::CredUtils::NotifyRemoteNodeDeleteSessionIfNotUsed(pending.conn,
+                                                                          pending.session);
+        }
+        result = now ? *now : lookAfter(pending.conn, pending.session, ReleaseOutcome::kReleased);
+    }
+    settle(store, pending, result);
+    OVRA_NOTICE("The session [%s] at node [%s] is [%s], attempt [%d]", pending.reference().c_str(),
+                pending.nodeId.c_str(), releaseWord(result.outcome), pending.attempts + 1);
+    return result;
+}
+
+} // namespace OvraApps

@@ -1,0 +1,55 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include "ovradrnode/dr_node.h"
+#include "shared/pending_releases.h"
+
+#include <functional>
+#include <string>
+
+namespace OvraApps {
+
+/// What became of a session on another node once this one needed it no more.
+enum class ReleaseOutcome {
+    kReleased,     ///< it is gone over there
+    kEndedAlready, ///< it was gone before
+    kKept,         ///< another lasting credential of this node uses it
+    kLeft,         ///< it may still be there: the node did not answer, or refused
+};
+
+struct Release {
+    ReleaseOutcome outcome = ReleaseOutcome::kLeft;
+    int code = 0;            ///< with kLeft: why, a code of the library or of the web API
+    Json::Value detail;      ///< with kLeft: what came with it
+    bool remembered = false; ///< with kLeft: whether ovradrd will try again
+};
+
+/// "released", "ended_already", "kept" or "left_behind".
+const char *releaseWord(ReleaseOutcome outcome);
+
+/// What would become of the session if the credential went now; nothing is changed. kReleased:
+/// the node would be told.
+Release foreseeRelease(const OvraDRNode::DRNode &record);
+
+struct ReleasingFlow {
+    bool done = false; ///< what the flow answered
+    Release release;
+};
+
+/// Runs a flow of the library that makes the session of `record` superfluous, releasing it where
+/// it can, and finds out what became of the session, which the flow itself does not tell. The
+/// release is noted before the flow and stays noted when it did not come about, also when this
+/// process is killed on the way; memory that cannot be written stops nothing.
+///
+/// \param conn  the endpoint over which the flow releases
+ReleasingFlow runReleasing(const OvraDRNode::DRNode &record, const OvraDRNode::Conn &conn,
+                           const std::function<bool()> &flow);
+
+/// Deletes a credential, lasting or temporary: its row, then its session on the other node unless
+/// a lasting credential still uses it. `done`: the row is gone, whatever the other node says.
+ReleasingFlow deleteCredential(const OvraDRNode::DRNode &record, bool temporary);
+
+/// Tries a release that is pending, and forgets or postpones it in the store.
+Release retryRelease(const PendingRelease &pending, PendingReleases &store);
+
+} // namespace OvraApps
