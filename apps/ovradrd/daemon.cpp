@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "daemon.h"
 
+#include "cgi/session_store.h"
 #include "core/appliance.h"
 #include "credential/sealed_box.h"
 #include "gateway.h"
@@ -10,6 +11,7 @@
 #include "listener.h"
 #include "ovradrnode/dr_node.h"
 #include "ovradrnode/node_db.h"
+#include "release_retries.h"
 #include "tls_identity.h"
 #include "webapi/api_registry.h"
 #include "webapi/local_server.h"
@@ -66,6 +68,7 @@ struct Daemon::Impl {
     OvraPlatform::APIRegistry registry;
     std::optional<Gateway> gateway;
     // Their threads use everything above.
+    std::optional<ReleaseRetries> retries;
     std::optional<Lanes> lanes;
     std::optional<HttpServer> http;
     std::optional<OvraPlatform::LocalServer> local;
@@ -145,6 +148,7 @@ Outcome Daemon::start(std::string &why) {
     }
     self.addHandlers();
     self.lanes.emplace();
+    self.retries.emplace(self.lanes->slow);
     self.gateway.emplace(self.registry, *self.keys, self.guard, self.desk, *self.lanes);
     self.local.emplace(OvraPlatform::kSocketFile,
                        [&self](const LocalCall &call) { return self.gateway->serveLocal(call); });
@@ -167,6 +171,11 @@ int Daemon::httpsPort() const {
 
 int Daemon::httpPort() const {
     return impl_->httpPort;
+}
+
+void Daemon::tend() {
+    OvraPlatform::SessionStore().sweep();
+    impl_->retries->begin();
 }
 
 bool Daemon::stop() {

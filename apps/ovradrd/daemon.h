@@ -46,6 +46,10 @@ public:
     int httpsPort() const;
     int httpPort() const;
 
+    /// What has to be done every few seconds: sweeps expired sessions and has pending releases
+    /// tried. Returns at once.
+    void tend();
+
     /// Ends serving: calls under way get kGrace, then their callers are told that the daemon stops.
     /// \return false when calls still run (they wait for another appliance): the process may then
     ///         only leave with _exit(2), at once.

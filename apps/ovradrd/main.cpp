@@ -2,7 +2,6 @@
 
 // ovradrd: the web-API daemon of an appliance.
 
-#include "cgi/session_store.h"
 #include "core/appliance.h"
 #include "daemon.h"
 #include "version.h"
@@ -26,7 +25,7 @@ namespace {
 using Ovradrd::Daemon;
 using Ovradrd::Outcome;
 
-constexpr time_t kSweepSeconds = 300;
+constexpr time_t kTendSeconds = 20;
 /// Descriptors for the connections that it may have, and for everything else.
 constexpr rlim_t kDescriptors = 4096;
 
@@ -84,11 +83,11 @@ sigset_t blockEndSignals() {
     return signals;
 }
 
-/// Waits for the end, and sweeps the expired sessions now and then.
-void waitForEnd(const sigset_t &signals) {
-    const timespec period{kSweepSeconds, 0};
+/// Waits for the end, and has the daemon tend what it has to now and then.
+void waitForEnd(Daemon &daemon, const sigset_t &signals) {
+    const timespec period{kTendSeconds, 0};
     while (sigtimedwait(&signals, nullptr, &period) < 0) {
-        OvraPlatform::SessionStore().sweep();
+        daemon.tend();
     }
 }
 
@@ -111,7 +110,7 @@ Outcome serve() {
     std::printf("ovradrd: ready, https %d, http %d\n", daemon.httpsPort(), daemon.httpPort());
     std::fflush(stdout);
 
-    waitForEnd(signals);
+    waitForEnd(daemon, signals);
     OVRA_NOTICE("Stops");
     if (!daemon.stop()) {
         OVRA_NOTICE("Calls that wait for other appliances are left");

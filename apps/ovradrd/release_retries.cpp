@@ -1,0 +1,44 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "release_retries.h"
+
+#include "shared/session_release.h"
+
+#include <vector>
+
+namespace Ovradrd {
+
+namespace {
+
+/// A node that lets packets vanish takes 10 seconds.
+constexpr int kMostInARound = 8;
+
+} // namespace
+
+void ReleaseRetries::begin() {
+    if (underWay_.exchange(true)) {
+        return;
+    }
+    const auto job = [this] {
+        try {
+            round();
+        } catch (...) {
+            underWay_ = false;
+            throw;
+        }
+        underWay_ = false;
+    };
+    if (!lane_.submit(job)) {
+        underWay_ = false;
+    }
+}
+
+void ReleaseRetries::round() {
+    OvraApps::PendingReleases store;
+    std::vector<OvraApps::PendingRelease> due;
+    store.listDue(due, kMostInARound);
+    for (const OvraApps::PendingRelease &pending : due) {
+        OvraApps::retryRelease(pending, store);
+    }
+}
+
+} // namespace Ovradrd

@@ -1,0 +1,27 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include "lanes.h"
+
+#include <atomic>
+
+namespace Ovradrd {
+
+/// Tries again to release sessions on other nodes that could not be released before.
+class ReleaseRetries {
+public:
+    /// \param lane  where the tries run; has to end before this object does
+    explicit ReleaseRetries(Lane &lane)
+        : lane_(lane) {}
+
+    /// Has what is due tried, unless the last round is still under way. Returns at once.
+    void begin();
+
+private:
+    void round();
+
+    Lane &lane_;
+    std::atomic<bool> underWay_ = false;
+};
+
+} // namespace Ovradrd
