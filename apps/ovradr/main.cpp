@@ -55,6 +55,7 @@ void describe(CLI::App &app, bool &json, Command &chosen) {
     addNodeCommands(app, chosen);
     addUserCommands(app, chosen);
     addCredCommands(app, chosen);
+    addSessionCommands(app, chosen);
     addCallCommand(app, chosen);
     addConnCommands(app, chosen);
     addAttrCommands(app, chosen);

@@ -7,7 +7,6 @@
 
 #include <algorithm>
 #include <map>
-#include <set>
 #include <vector>
 
 namespace Ovradr {
@@ -20,9 +19,10 @@ using OvraDRNode::DRNodeDB;
 constexpr const char *kLocalWord = "local";
 constexpr DRNodeDB::CredType kBothTables = DRNodeDB::CRED_TYPE_NODE | DRNodeDB::CRED_TYPE_TEMP;
 
-/// The one of `ids` that is `text` or begins with it.
-Expected<std::string> choose(const std::set<std::string> &ids, const std::string &text,
-                             const std::string &what, const std::string &hint) {
+} // namespace
+
+Expected<std::string> chooseId(const std::set<std::string> &ids, const std::string &text,
+                               const std::string &what, const std::string &hint) {
     if (ids.count(text) != 0) {
         return text;
     }
@@ -40,8 +40,6 @@ Expected<std::string> choose(const std::set<std::string> &ids, const std::string
                        " and " + found[1] + ".",
                    "Write more of it.");
 }
-
-} // namespace
 
 Expected<std::string> localNode() {
     const std::string id = DRNode::getLocalNodeId();
@@ -74,7 +72,7 @@ Expected<std::string> resolveNode(const std::string &text) {
         return local;
     }
     const Expected<std::set<std::string>> ids = listNodes();
-    return ids ? choose(*ids, text, "node", "`ovradr node list` shows the nodes that there are.")
+    return ids ? chooseId(*ids, text, "node", "`ovradr node list` shows the nodes that there are.")
                : ids.failure();
 }
 
@@ -93,7 +91,7 @@ Expected<FoundCred> resolveCred(const std::string &text) {
         }
     }
     const Expected<std::string> id =
-        choose(ids, text, "credential", "`ovradr cred list --temp` shows all that there are.");
+        chooseId(ids, text, "credential", "`ovradr cred list --temp` shows all that there are.");
     return id ? Expected<FoundCred>(creds.at(*id)) : id.failure();
 }
 

@@ -19,6 +19,7 @@ void addSetupCommand(CLI::App &app, Command &chosen);
 void addNodeCommands(CLI::App &app, Command &chosen);
 void addUserCommands(CLI::App &app, Command &chosen);
 void addCredCommands(CLI::App &app, Command &chosen);
+void addSessionCommands(CLI::App &app, Command &chosen);
 void addCallCommand(CLI::App &app, Command &chosen);
 void addConnCommands(CLI::App &app, Command &chosen);
 void addAttrCommands(CLI::App &app, Command &chosen);

@@ -1,0 +1,184 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "commands/cred_commands.h"
+#include "cred_report.h"
+#include "node_ref.h"
+#include "output.h"
+#include "remote_login.h"
+#include "target.h"
+
+#include <ovradrnode/node_db.h>
+#include <ovradrnode/node_set.h>
+
+#include <memory>
+
+namespace Ovradr {
+
+namespace {
+
+using OvraApps::ReleasingFlow;
+using OvraDRNode::Conn;
+using OvraDRNode::DRNode;
+using OvraDRNode::DRNodeCredSet;
+namespace ERR = OvraDRCore::ERR;
+
+struct SetOptions {
+    std::string credId;
+    std::string url;
+    RemoteLogin login;
+    std::string fingerprint;
+    bool dryRun = false;
+};
+
+struct DeleteOptions {
+    std::string credId;
+    bool dryRun = false;
+};
+
+Failure setFailure(const DRNodeCredSet &flow, const Conn &conn) {
+    // The one code with which writing the row fails: the credential was found before.
+    if (flow.GetErrCode() == ERR::kCredNotFound) {
+        return failure(ExitCode::kNotSetUp,
+                       "The other appliance granted a session, but it could not be stored.",
+                       "The credential is as it was. The system log says why; correct that and "
+                       "try again.");
+    }
+    Failure found = failureOf(flow.GetErrCode(), flow.GetErrMsg());
+    if (flow.GetErrCode() == ERR::kOtherNode) {
+        found.message = "This is another node than the one that the credential is for.";
+        found.hint = "Check the URL, or make a new credential with `ovradr cred create`.";
+    }
+    found.message = targetText(conn) + ": " + found.message;
+    return found;
+}
+
+/// What an update did, by the row as it stands now.
+Outcome reportUpdate(const DRNode &before, const std::string &account,
+                     const ReleasingFlow &result) {
+    DRNode now;
+    if (!OvraDRNode::DRNodeDB::GetCred(before.credId, now)) {
+        return failureOf(ERR::kCredNotFound);
+    }
+    Report report;
+    report.data = credJson(now, false);
+    report.data["account"] = account;
+    report.data["endpoint_changed"] = now.conn != before.conn;
+    report.text = credText(now, false, account);
+    if (now.session == before.session) {
+        report.data["session"] = "unchanged";
+        report.text += "The other appliance granted the same session as before.\n";
+    } else {
+        addRelease(report.data, result.release);
+        report.text += "The session of before: " + printable(releaseText(result.release, false)) +
+                       (result.release.outcome == OvraApps::ReleaseOutcome::kLeft ? "\n" : ".\n");
+    }
+    return report;
+}
+
+Outcome runUpdate(DRNodeCredSet &flow, const DRNode &record, const Conn &conn,
+                  const SetOptions &options) {
+    if (!options.dryRun) {
+        const ReleasingFlow result =
+            OvraApps::runReleasing(record, conn, [&flow] { return flow.process(); });
+        return result.done ? reportUpdate(record, options.login.account, result)
+                           : setFailure(flow, conn);
+    }
+    if (!flow.check()) {
+        return setFailure(flow, conn);
+    }
+    Report report;
+    report.data["would_work"] = true;
+    report.text = "It would work; nothing was changed.\n";
+    return report;
+}
+
+Outcome set(const SetOptions &options) {
+    const Expected<FoundCred> cred = resolveCred(options.credId);
+    if (!cred) {
+        return cred.failure();
+    }
+    const DRNode &record = cred->record;
+    if (cred->temporary) {
+        return failure(ExitCode::kUsage, "A temporary credential cannot be changed.",
+                       "Delete it, and make a new one with `ovradr cred create --temp`.");
+    }
+    const Expected<Conn> conn =
+        options.url.empty() ? Expected<Conn>(record.conn) : parseTarget(options.url);
+    if (!conn) {
+        return conn.failure();
+    }
+    const Expected<Conn> direct = meet(*conn, options.fingerprint);
+    if (!direct) {
+        return direct.failure();
+    }
+    DRNodeCredSet flow(record.credId);
+    bool proved = false;
+    const auto attempt = [&](const std::string &password, const std::string &code) {
+        proved = flow.setCred(*conn, options.login.account, password, code);
+        return proved ? 0 : flow.GetErrCode();
+    };
+    if (const Trouble trouble = logIn(options.login, direct->addr, attempt)) {
+        return *trouble;
+    }
+    return proved ? runUpdate(flow, record, *direct, options) : setFailure(flow, *conn);
+}
+
+/// What a deletion did to the row and to the session, or would do.
+Report reportDeletion(const DRNode &record, const OvraApps::Release &release, bool foreseen) {
+    Report report;
+    report.data["cred_id"] = record.credId;
+    report.data["node_id"] = record.nodeId;
+    report.data["row"] = foreseen ? "present" : "removed";
+    addRelease(report.data, release);
+    report.text = listing({{"credential", record.credId},
+                           {"node", record.nodeId},
+                           {"row", foreseen ? "would be removed" : "removed"},
+                           {"session", releaseText(release, foreseen)}});
+    return report;
+}
+
+Outcome remove(const DeleteOptions &options) {
+    const Expected<FoundCred> cred = resolveCred(options.credId);
+    if (!cred) {
+        return cred.failure();
+    }
+    if (options.dryRun) {
+        return reportDeletion(cred->record, OvraApps::foreseeRelease(cred->record), true);
+    }
+    const ReleasingFlow result = OvraApps::deleteCredential(cred->record, cred->temporary);
+    if (!result.done) {
+        return failure(ExitCode::kNotSetUp,
+                       "The credential could not be deleted from the node database.",
+                       "It is as it was. The system log says why; look for a full or read-only "
+                       "disk.");
+    }
+    return reportDeletion(cred->record, result.release, false);
+}
+
+} // namespace
+
+void addCredSetCommand(CLI::App &family, Command &chosen) {
+    CLI::App *command = family.add_subcommand(
+        "set", "Log in anew for a credential, perhaps at another endpoint of the same node.");
+    const auto options = std::make_shared<SetOptions>();
+    command->add_option("CRED_ID", options->credId, "Its id, or the beginning of it")->required();
+    command->add_option("--url", options->url, "The new endpoint; without it the present one");
+    addRemoteLoginOptions(*command, options->login)->required();
+    addFingerprintOption(*command, options->fingerprint);
+    command->add_flag("--dry-run", options->dryRun, "Only try whether it would work");
+    command->footer("Examples:\n"
+                    "  ovradr cred set 81c0 --account repl\n"
+                    "  ovradr cred set 81c0 --url https://192.0.2.21 --account repl --dry-run");
+    command->callback([&chosen, options] { chosen = [options] { return set(*options); }; });
+}
+
+void addCredDeleteCommand(CLI::App &family, Command &chosen) {
+    CLI::App *command = family.add_subcommand(
+        "delete", "Delete a credential, and release its session when nothing else uses it.");
+    const auto options = std::make_shared<DeleteOptions>();
+    command->add_option("CRED_ID", options->credId, "Its id, or the beginning of it")->required();
+    command->add_flag("--dry-run", options->dryRun, "Only tell what would become of the session");
+    command->footer("The other appliance need not answer.\nExample:\n  ovradr cred delete 81c0");
+    command->callback([&chosen, options] { chosen = [options] { return remove(*options); }; });
+}
+
+} // namespace Ovradr

@@ -1,0 +1,158 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "commands/cred_commands.h"
+#include "node_ref.h"
+#include "output.h"
+#include "target.h"
+
+#include <ovradrcore/json.h>
+#include <ovradrnode/cred_reverse_create.h>
+#include <ovradrnode/node_api.h>
+#include <ovradrnode/sender.h>
+
+#include <webapi/api_errors.h>
+
+#include <memory>
+#include <vector>
+
+namespace Ovradr {
+
+namespace {
+
+using OvraDRCore::memberString;
+using OvraDRNode::Conn;
+using OvraDRNode::CredReverseCreate;
+using OvraDRNode::DRNode;
+namespace ERR = OvraDRCore::ERR;
+
+struct ReverseOptions {
+    std::string credId;
+    std::string account;
+    std::vector<std::string> endpoints;
+    bool temporary = false;
+    bool dryRun = false;
+};
+
+/// The daemon of this appliance has to run, and the account has to be one that may grant sessions.
+Trouble checkAccount(const std::string &account) {
+    const OvraDRCore::Response answer =
+        OvraDRNode::BaseSender::run(OvraDRNode::WebAPI::OvraCoreUserGetAPI(account));
+    if (answer.getErrCode() == OvraPlatform::APIError::kBadParameter) {
+        return failure(ExitCode::kNotFound, "This appliance has no account \"" + account + "\".",
+                       "`ovradr user list` shows those that it has.");
+    }
+    if (!answer.isSuccess()) {
+        Failure found = failureOf(answer.getErrCode(), answer.getErrMsg());
+        found.message = "The account " + account + " of this appliance: " + found.message;
+        return found;
+    }
+    const Json::Value data = answer.getData();
+    if (data["administrator"].isBool() && data["administrator"].asBool()) {
+        return std::nullopt;
+    }
+    return failure(ExitCode::kNotPermitted,
+                   "The account " + account + " of this appliance is not an administrator.",
+                   "The other appliance would get no session with it; use another account.");
+}
+
+/// The endpoints to offer: those that were named, or all of this appliance.
+Expected<std::vector<Conn>> offeredConns(const std::vector<std::string> &endpoints) {
+    std::vector<Conn> conns;
+    for (const std::string &text : endpoints) {
+        const Expected<Conn> conn = parseTarget(text);
+        if (!conn) {
+            return conn.failure();
+        }
+        conns.push_back(*conn);
+    }
+    if (conns.empty()) {
+        conns = DRNode::getLocalConn();
+    }
+    if (conns.empty()) {
+        return failure(ExitCode::kFailed, "This appliance has no address that others reach.",
+                       "Bring an interface up, or name an endpoint with --endpoint.");
+    }
+    return conns;
+}
+
+Failure reverseFailure(const CredReverseCreate &flow) {
+    // With words it is what the other appliance said about the endpoints of this one.
+    const bool unreachable =
+        flow.GetErrCode() == ERR::kNotConnectable && !flow.GetErrMsg().isNull();
+    Failure found = unreachable ? failureOf(ERR::kRemoteConnInvalid)
+                                : failureOf(flow.GetErrCode() == ERR::kNone ? ERR::kCredIncomplete
+                                                                            : flow.GetErrCode(),
+                                            flow.GetErrMsg());
+    found.message = "No credential back to this appliance: " + found.message;
+    return found;
+}
+
+Outcome report(const ReverseOptions &options, const DRNode &via, const CredReverseCreate &flow) {
+    Report report;
+    if (options.dryRun) {
+        report.data["would_work"] = true;
+        report.text = "It would work; nothing was made.\n";
+        return report;
+    }
+    const Json::Value &made = flow.getCredInfo();
+    if (!made.isObject()) {
+        return reverseFailure(flow);
+    }
+    report.data["made"] = OvraDRCore::maskSecrets(made);
+    report.data["node_id"] = via.nodeId;
+    report.data["temporary"] = options.temporary;
+    report.text = listing({{"credential", memberString(made, "cred_id")},
+                           {"held by", via.nodeId},
+                           {"endpoint", targetText(Conn::fromJson(made))},
+                           {"account", options.account},
+                           {"kind", options.temporary ? "temporary" : "lasting"}});
+    return report;
+}
+
+Outcome reverse(const ReverseOptions &options) {
+    const Expected<FoundCred> cred = resolveCred(options.credId);
+    if (!cred) {
+        return cred.failure();
+    }
+    const Expected<std::vector<Conn>> conns = offeredConns(options.endpoints);
+    if (!conns) {
+        return conns.failure();
+    }
+    if (const Trouble trouble = checkAccount(options.account)) {
+        return *trouble;
+    }
+    const std::unique_ptr<CredReverseCreate> flow =
+        options.temporary ? std::make_unique<OvraDRNode::TempCredReverseCreate>()
+                          : std::make_unique<CredReverseCreate>();
+    if (!flow->setCredId(cred->record.credId)) {
+        return failureOf(ERR::kCredInvalid);
+    }
+    const bool armed = flow->setLocalAccount(options.account) && flow->addLocalConns(*conns);
+    const bool done = armed && (options.dryRun ? flow->check() : flow->process());
+    return done ? report(options, cred->record, *flow) : reverseFailure(*flow);
+}
+
+} // namespace
+
+void addCredReverseCommand(CLI::App &family, Command &chosen) {
+    CLI::App *command = family.add_subcommand(
+        "reverse", "Have the node of a credential make a credential back to this appliance.");
+    const auto options = std::make_shared<ReverseOptions>();
+    command->add_option("CRED_ID", options->credId, "Its id, or the beginning of it")->required();
+    command
+        ->add_option("--account", options->account,
+                     "Account of this appliance, an administrator, with whose rights the other "
+                     "one comes")
+        ->required();
+    command
+        ->add_option("--endpoint", options->endpoints,
+                     "Offer this endpoint; may be repeated; without it all of this appliance")
+        ->allow_extra_args(false);
+    command->add_flag("--temp", options->temporary, "A temporary credential");
+    command->add_flag("--dry-run", options->dryRun, "Only try whether it would work");
+    command->footer("Examples:\n"
+                    "  ovradr cred reverse 81c0 --account repl\n"
+                    "  ovradr cred reverse 81c0 --account repl --endpoint https://192.0.2.10");
+    command->callback([&chosen, options] { chosen = [options] { return reverse(*options); }; });
+}
+
+} // namespace Ovradr

@@ -1,0 +1,11 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include "commands/commands.h"
+
+namespace Ovradr {
+
+// Each adds a command to the family `session`, in the way of addSessionCommands().
+void addSessionPendingCommand(CLI::App &family, Command &chosen);
+
+} // namespace Ovradr

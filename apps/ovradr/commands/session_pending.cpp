@@ -1,0 +1,137 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "commands/session_commands.h"
+#include "cred_report.h"
+#include "node_ref.h"
+#include "output.h"
+#include "target.h"
+
+#include <unistd.h>
+
+#include <algorithm>
+#include <memory>
+#include <set>
+#include <vector>
+
+namespace Ovradr {
+
+namespace {
+
+using OvraApps::PendingRelease;
+using OvraApps::PendingReleases;
+
+struct PendingOptions {
+    bool retry = false;
+    std::string forget;
+};
+
+Failure storeFailure(const PendingReleases &store) {
+    return failure(ExitCode::kNotSetUp, store.error(),
+                   geteuid() == 0 ? "The system log says more." : "Run the command as root.");
+}
+
+Json::Value toJson(const PendingRelease &release) {
+    Json::Value json;
+    json["reference"] = release.reference();
+    json["node_id"] = release.nodeId;
+    json["cred_id"] = release.credId;
+    json["conn"] = release.conn.toJson();
+    json["noted"] = Json::Int64(release.noted);
+    json["attempts"] = release.attempts;
+    json["next_try"] = Json::Int64(release.nextTry);
+    json["code"] = release.code;
+    return json;
+}
+
+std::vector<std::string> toRow(const PendingRelease &release) {
+    // Noted by a command that is still under way, or was killed.
+    const bool fresh = release.attempts == 0;
+    return {release.reference(),
+            release.nodeId,
+            targetText(release.conn),
+            timeText(release.noted),
+            std::to_string(release.attempts),
+            timeText(release.nextTry),
+            fresh ? "not tried yet" : failureOf(release.code).message};
+}
+
+Report reportOf(const std::vector<PendingRelease> &releases) {
+    Report report;
+    report.data["pending"] = Json::Value(Json::arrayValue);
+    std::vector<std::vector<std::string>> rows;
+    for (const PendingRelease &release : releases) {
+        report.data["pending"].append(toJson(release));
+        rows.push_back(toRow(release));
+    }
+    report.text =
+        rows.empty()
+            ? "No session waits to be released on another node.\n"
+            : table({"SESSION", "NODE", "ENDPOINT", "SINCE", "TRIES", "NEXT TRY", "WHY"}, rows);
+    return report;
+}
+
+Outcome forget(PendingReleases &store, const std::vector<PendingRelease> &releases,
+               const std::string &text) {
+    std::set<std::string> references;
+    std::transform(releases.begin(), releases.end(), std::inserter(references, references.end()),
+                   [](const PendingRelease &release) { return release.reference(); });
+    const Expected<std::string> reference =
+        chooseId(references, text, "pending session", "`ovradr session pending` shows all.");
+    if (!reference) {
+        return reference.failure();
+    }
+    if (!store.remove(*reference)) {
+        return storeFailure(store);
+    }
+    Report report;
+    report.data["forgotten"] = *reference;
+    report.text = "Forgotten; nobody tries to release " + *reference + " any more.\n";
+    return report;
+}
+
+/// Tries each once, whatever its next time is, and tells what became of it.
+Report retry(PendingReleases &store, const std::vector<PendingRelease> &releases) {
+    Report report;
+    report.data["tried"] = Json::Value(Json::arrayValue);
+    for (const PendingRelease &release : releases) {
+        const OvraApps::Release outcome = OvraApps::retryRelease(release, store);
+        Json::Value json = toJson(release);
+        addRelease(json, outcome);
+        report.data["tried"].append(json);
+        report.text += release.reference() + " at " + printable(targetText(release.conn)) + ": " +
+                       printable(releaseText(outcome, false)) + "\n";
+    }
+    if (releases.empty()) {
+        report.text = reportOf(releases).text;
+    }
+    return report;
+}
+
+Outcome pending(const PendingOptions &options) {
+    PendingReleases store;
+    std::vector<PendingRelease> releases;
+    if (!store.isOpen() || !store.list(releases)) {
+        return storeFailure(store);
+    }
+    if (!options.forget.empty()) {
+        return forget(store, releases, options.forget);
+    }
+    return options.retry ? retry(store, releases) : reportOf(releases);
+}
+
+} // namespace
+
+void addSessionPendingCommand(CLI::App &family, Command &chosen) {
+    CLI::App *command = family.add_subcommand(
+        "pending", "The sessions on other nodes that could not be released yet.");
+    const auto options = std::make_shared<PendingOptions>();
+    CLI::Option *now = command->add_flag("--retry", options->retry, "Try all of them now");
+    command
+        ->add_option("--forget", options->forget,
+                     "Give this SESSION up, e.g. because its node is gone for good")
+        ->excludes(now);
+    command->footer("ovradrd tries them again by itself, with growing pauses.\n"
+                    "Example:\n  ovradr session pending --retry");
+    command->callback([&chosen, options] { chosen = [options] { return pending(*options); }; });
+}
+
+} // namespace Ovradr

@@ -1,0 +1,61 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "cred_report.h"
+
+#include "output.h"
+#include "target.h"
+
+namespace Ovradr {
+
+using OvraApps::Release;
+using OvraApps::ReleaseOutcome;
+using OvraDRNode::DRNode;
+
+Json::Value credJson(const DRNode &record, bool temporary) {
+    Json::Value json = record.toJson();
+    json["temporary"] = temporary;
+    return json;
+}
+
+std::string credText(const DRNode &record, bool temporary, const std::string &account) {
+    return listing({{"credential", record.credId},
+                    {"node", record.nodeId},
+                    {"endpoint", targetText(record.conn)},
+                    {"account", account},
+                    {"kind", temporary ? "temporary" : "lasting"}});
+}
+
+std::string releaseText(const Release &release, bool foreseen) {
+    switch (release.outcome) {
+    case ReleaseOutcome::kReleased:
+        return foreseen ? "would be released on the other appliance"
+                        : "released on the other appliance";
+    case ReleaseOutcome::kEndedAlready:
+        return "had ended on the other appliance already";
+    case ReleaseOutcome::kKept:
+        return foreseen ? "would be kept, because another credential uses it"
+                        : "kept, because another credential uses it";
+    case ReleaseOutcome::kLeft:
+        break;
+    }
+    const std::string why = failureOf(release.code, release.detail).message;
+    if (foreseen) {
+        return "would be left behind: " + why;
+    }
+    return "left behind: " + why +
+           (release.remembered ? " ovradrd tries again; see `ovradr session pending`."
+                               : " Nobody tries again: revoke it on the other appliance.");
+}
+
+void addRelease(Json::Value &data, const Release &release) {
+    data["session"] = OvraApps::releaseWord(release.outcome);
+    if (release.outcome != ReleaseOutcome::kLeft) {
+        return;
+    }
+    const Failure why = failureOf(release.code, release.detail);
+    data["reason"]["code"] = why.code;
+    data["reason"]["name"] = why.name;
+    data["reason"]["message"] = why.message;
+    data["retried"] = release.remembered;
+}
+
+} // namespace Ovradr

@@ -1,0 +1,30 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include "failure.h"
+
+#include <ovradrnode/dr_node.h>
+
+#include <shared/session_release.h>
+
+#include <string>
+
+namespace Ovradr {
+
+/// A credential as scripts see it; never its session.
+Json::Value credJson(const OvraDRNode::DRNode &record, bool temporary);
+
+/// A credential as people see it.
+/// \param account  on the other appliance, or "" when it is not known
+std::string credText(const OvraDRNode::DRNode &record, bool temporary,
+                     const std::string &account = "");
+
+/// What became of the session of a credential, in one sentence for people.
+/// \param foreseen  nothing was done yet; the sentence says what would become of it
+std::string releaseText(const OvraApps::Release &release, bool foreseen);
+
+/// The same for scripts: "session", and with a session that was left behind "reason" (code, name,
+/// message) and "retried".
+void addRelease(Json::Value &data, const OvraApps::Release &release);
+
+} // namespace Ovradr

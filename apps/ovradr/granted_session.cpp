@@ -1,0 +1,83 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "granted_session.h"
+
+#include "output.h"
+
+#include <ovradrcore/json.h>
+#include <ovradrnode/node_session.h>
+
+#include <unistd.h>
+
+namespace Ovradr {
+
+using OvraDRNode::NodeSession;
+using OvraPlatform::SessionRecord;
+
+namespace {
+
+std::string nodeIdOf(const SessionRecord &record) {
+    Json::Value extra;
+    OvraDRCore::fromString(extra, record.extra);
+    return OvraDRCore::memberString(extra, "node_id");
+}
+
+Failure storeFailure(const std::string &text) {
+    return failure(ExitCode::kNotSetUp, text.empty() ? "The sessions cannot be read." : text,
+                   geteuid() == 0 ? "The system log says more." : "Run the command as root.");
+}
+
+} // namespace
+
+Expected<std::vector<GrantedSession>> grantedSessions() {
+    OvraPlatform::SessionStore store;
+    std::vector<SessionRecord> records;
+    if (!store.isOpen() || !store.list(records)) {
+        return storeFailure(store.error());
+    }
+    std::vector<GrantedSession> sessions;
+    for (const SessionRecord &record : records) {
+        if (record.app == NodeSession::kApplication) {
+            sessions.push_back({record, nodeIdOf(record)});
+        }
+    }
+    return sessions;
+}
+
+Json::Value sessionJson(const GrantedSession &session) {
+    Json::Value json;
+    json["reference"] = session.reference();
+    json["account"] = session.record.user;
+    json["node_id"] = session.nodeId;
+    json["client"] = session.record.remote;
+    json["created"] = Json::Int64(session.record.created);
+    json["expires"] =
+        session.record.expires ? Json::Value(Json::Int64(*session.record.expires)) : Json::Value();
+    return json;
+}
+
+std::string sessionTable(const std::vector<GrantedSession> &sessions) {
+    std::vector<std::vector<std::string>> rows;
+    for (const GrantedSession &session : sessions) {
+        const SessionRecord &record = session.record;
+        rows.push_back({session.reference(), record.user,
+                        session.nodeId.empty() ? "(none)" : session.nodeId,
+                        timeText(record.created),
+                        record.expires ? timeText(*record.expires) : "never", record.remote});
+    }
+    return table({"SESSION", "ACCOUNT", "GRANTED TO NODE", "SINCE", "ENDS", "CLIENT"}, rows);
+}
+
+Trouble endSessions(const std::vector<GrantedSession> &sessions) {
+    NodeSession store;
+    for (const GrantedSession &session : sessions) {
+        store.DeleteBySessionId(session.record.id);
+        if (store.GetErrCode() != OvraDRCore::ERR::kNone) {
+            Failure found = failureOf(store.GetErrCode(), store.GetErrMsg());
+            found.message = "The session " + session.reference() + ": " + found.message;
+            return found;
+        }
+    }
+    return std::nullopt;
+}
+
+} // namespace Ovradr

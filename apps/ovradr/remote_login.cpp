@@ -1,0 +1,79 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "remote_login.h"
+
+#include "commands/commands.h"
+#include "endpoint.h"
+#include "trust.h"
+
+#include <ovradrcore/err_recorder.h>
+
+namespace Ovradr {
+
+namespace {
+
+using OvraDRNode::Conn;
+
+Expected<std::string> askOneTimeCode() {
+    if (!isInteractive()) {
+        return failure(ExitCode::kUsage,
+                       "There is no terminal on which the one-time code could be asked for.",
+                       "Give it with --otp.");
+    }
+    const Expected<Secret> code = askSecret("One-time code");
+    return code ? Expected<std::string>(code->get()) : code.failure();
+}
+
+} // namespace
+
+CLI::Option *addRemoteLoginOptions(CLI::App &command, RemoteLogin &login) {
+    CLI::Option *account =
+        command.add_option("--account", login.account, "Account on the other appliance");
+    addPasswordOptions(command, login.password);
+    CLI::Option *code =
+        command.add_option("--otp", login.oneTimeCode, "One-time code of the account");
+    command.add_flag("--otp-prompt", login.askOneTimeCode, "Ask for the one-time code")
+        ->excludes(code);
+    return account;
+}
+
+void addFingerprintOption(CLI::App &command, std::string &fingerprint) {
+    command.add_option("--fingerprint", fingerprint, "The key that the other end must have")
+        ->check(checkFingerprint);
+}
+
+Expected<Conn> meet(const Conn &conn, const std::string &fingerprint) {
+    const Expected<Conn> direct = directEndpoint(conn);
+    if (!direct) {
+        return direct;
+    }
+    const Trouble trouble = trustPeer(*direct, fingerprint);
+    return trouble ? Expected<Conn>(*trouble) : direct;
+}
+
+Trouble logIn(const RemoteLogin &login, const std::string &host, const LoginAttempt &attempt) {
+    const Expected<Secret> password =
+        obtainPassword(login.password, "Password of " + login.account + " on " + host, false);
+    if (!password) {
+        return password.failure();
+    }
+    std::string code = login.oneTimeCode;
+    bool mayAsk = code.empty() && isInteractive();
+    if (login.askOneTimeCode) {
+        const Expected<std::string> asked = askOneTimeCode();
+        if (!asked) {
+            return asked.failure();
+        }
+        code = *asked;
+        mayAsk = false;
+    }
+    if (attempt(password->get(), code) == OvraDRCore::ERR::kLoginOtpRequired && mayAsk) {
+        const Expected<std::string> asked = askOneTimeCode();
+        if (!asked) {
+            return asked.failure();
+        }
+        attempt(password->get(), *asked);
+    }
+    return std::nullopt;
+}
+
+} // namespace Ovradr
