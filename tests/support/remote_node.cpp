@@ -7,61 +7,42 @@
 
 namespace OvraTest {
 
-namespace {
-
-OvraPlatform::SealKeyPair makeKeys() {
-    const std::string path = "/tmp/remote_node.seal";
-    std::string why;
-    const auto keys = OvraPlatform::SealKeyPair::loadOrCreate(path, why);
-    unlink(path.c_str());
-    return *keys;
-}
-
-} // namespace
-
 RemoteNode::RemoteNode()
     : server({.tls = true})
-    , keys_(makeKeys()) {
+    , daemon_("/tmp/remote_node.seal", [this](const OvraPlatform::WireCall &call) {
+        return record(call.sid + " " + call.method, call.sid, call.method, call.params);
+    }) {
+    unlink("/tmp/remote_node.seal");
     server.answerWith([this](const Received &received) { return respond(received); });
 }
 
-RemoteNode::Prepared RemoteNode::prepared(const std::string &sid, const std::string &method) const {
-    for (const std::string &key : {sid + " " + method, method}) {
-        if (const auto found = answers_.find(key); found != answers_.end()) {
-            return found->second;
-        }
-    }
-    return {R"({"success":true})", {}, true};
-}
-
-bool RemoteNode::isPrepared(const std::string &call) const {
+std::optional<SealingDaemon::Reply> RemoteNode::prepared(const std::string &call) const {
     const std::lock_guard<std::mutex> lock(guard_);
-    return answers_.count(call) != 0;
+    const auto found = answers_.find(call);
+    return found == answers_.end() ? std::nullopt : std::optional(found->second);
 }
 
 Answer RemoteNode::respond(const Received &received) {
     std::string why;
-    auto call = OvraPlatform::decodeForm(received.body, why);
-    if (call && call->method == "getinfo" && !isPrepared("getinfo")) {
-        return Answer::success(R"({"public_key":")" +
-                               OvraPlatform::publicKeyText(keys_.publicKey()) + R"(","time":)" +
-                               std::to_string(replays_.now()) + "}");
+    const auto call = OvraPlatform::decodeForm(received.body, why);
+    const bool ownKey = call && call->method == "getinfo" && prepared("getinfo");
+    if (call && !ownKey) {
+        return daemon_.answer(received);
     }
-    OvraPlatform::OpenedRequest opened;
-    const bool sealed = call && !call->sealed.empty();
-    if (sealed) {
-        if (openRequest(keys_, *call, replays_, opened) != OvraPlatform::SealVerdict::kOpened) {
-            return Answer::status(500);
-        }
-        *call = opened.call;
-    }
-    const std::string sid = call ? call->sid : "";
-    const std::string method = call ? call->method : "probe";
+    const SealingDaemon::Reply reply =
+        ownKey ? *prepared("getinfo") : record("probe", "", "probe", Json::Value());
+    const auto *document = std::get_if<std::string>(&reply);
+    return document != nullptr ? Answer::json(*document) : std::get<Answer>(reply);
+}
+
+/// Notes the call down and finds its answer.
+SealingDaemon::Reply RemoteNode::record(const std::string &call, const std::string &sid,
+                                        const std::string &method, const Json::Value &params) {
     std::function<void()> action;
     {
         const std::lock_guard<std::mutex> lock(guard_);
-        calls_.push_back(call ? sid + " " + method : method);
-        params_[method] = call ? OvraDRCore::toString(call->params) : "";
+        calls_.push_back(call);
+        params_[method] = params.isNull() ? "" : OvraDRCore::toString(params);
         if (const auto found = actions_.find(method); found != actions_.end()) {
             action = found->second;
         }
@@ -69,22 +50,19 @@ Answer RemoteNode::respond(const Received &received) {
     if (action) {
         action();
     }
-    const std::lock_guard<std::mutex> lock(guard_);
-    const Prepared reply = prepared(sid, method);
-    if (!reply.isDocument) {
-        return reply.bytes;
-    }
-    return Answer::json(sealed ? sealReply(opened.replyKey, reply.document) : reply.document);
+    const auto ofSession = prepared(sid + " " + method);
+    const auto ofAll = prepared(method);
+    return ofSession ? *ofSession : ofAll.value_or(R"({"success":true})");
 }
 
 void RemoteNode::answer(const std::string &call, const std::string &document) {
     const std::lock_guard<std::mutex> lock(guard_);
-    answers_[call] = {document, {}, true};
+    answers_[call] = document;
 }
 
 void RemoteNode::answer(const std::string &call, const Answer &answer) {
     const std::lock_guard<std::mutex> lock(guard_);
-    answers_[call] = {{}, answer, false};
+    answers_[call] = answer;
 }
 
 void RemoteNode::before(const std::string &method, std::function<void()> action) {

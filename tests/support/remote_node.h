@@ -1,8 +1,8 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
-#include "credential/sealed_box.h"
 #include "support/misbehaving_server.h"
+#include "support/sealing_daemon.h"
 
 #include <functional>
 #include <map>
@@ -39,24 +39,17 @@ public:
     MisbehavingServer server;
 
 private:
-    /// Either a reply document or bytes.
-    struct Prepared {
-        std::string document;
-        Answer bytes;
-        bool isDocument = true;
-    };
-
     Answer respond(const Received &received);
-    bool isPrepared(const std::string &call) const;
-    Prepared prepared(const std::string &sid, const std::string &method) const;
+    SealingDaemon::Reply record(const std::string &call, const std::string &sid,
+                                const std::string &method, const Json::Value &params);
+    std::optional<SealingDaemon::Reply> prepared(const std::string &call) const;
 
     mutable std::mutex guard_;
-    std::map<std::string, Prepared> answers_;
+    std::map<std::string, SealingDaemon::Reply> answers_;
     std::map<std::string, std::function<void()>> actions_;
     std::vector<std::string> calls_;
     std::map<std::string, std::string> params_;
-    OvraPlatform::SealKeyPair keys_;
-    OvraPlatform::ReplayGuard replays_;
+    SealingDaemon daemon_;
 };
 
 } // namespace OvraTest

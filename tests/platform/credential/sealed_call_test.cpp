@@ -1,9 +1,9 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "credential/cred_errors.h"
 #include "credential/peer_trust.h"
-#include "platform/credential/sealing_daemon.h"
 #include "platform/own_files.h"
 #include "support/log_capture.h"
+#include "support/sealing_daemon.h"
 
 #include <ovracredential/cred_request.h>
 
@@ -25,17 +25,16 @@ struct FreeObjects {
 
 /// A daemon that grants "granted-sid" to ann with the password hunter2, and answers with what it
 /// was asked.
-Json::Value serve(const WireCall &call) {
+std::string serve(const WireCall &call) {
+    Json::Value data;
     if (call.method == "login") {
-        Json::Value data;
         data["sid"] = "granted-sid";
         const bool good = call.params["account"] == "ann" && call.params["passwd"] == "hunter2";
-        return good ? apiSuccess(data) : apiError(APIError::kLoginFailed);
+        return OvraDRCore::toString(good ? apiSuccess(data) : apiError(APIError::kLoginFailed));
     }
-    Json::Value data;
     data["sid"] = call.sid;
     data["params"] = call.params;
-    return apiSuccess(data);
+    return OvraDRCore::toString(apiSuccess(data));
 }
 
 class SealedCallScene : public OwnFiles {

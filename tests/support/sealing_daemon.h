@@ -12,15 +12,21 @@
 #include <mutex>
 #include <string>
 #include <utility>
-#include <vector>
+#include <variant>
 
 namespace OvraTest {
 
 /// The receiving side of the sealed envelope, as a daemon has it, behind a MisbehavingServer.
 class SealingDaemon {
 public:
-    using Handler = std::function<Json::Value(const OvraPlatform::WireCall &)>;
+    /// A document, sealed where the call was, or bytes that are sent as they are.
+    using Reply = std::variant<std::string, Answer>;
+    using Handler = std::function<Reply(const OvraPlatform::WireCall &)>;
 
+    SealingDaemon(const std::string &keyFile, Handler handler)
+        : handler_(std::move(handler)) {
+        newKey(keyFile);
+    }
     SealingDaemon(const std::string &keyFile, Handler handler,
                   OvraPlatform::ReplayGuard::Clocks clocks)
         : handler_(std::move(handler))
@@ -42,29 +48,34 @@ public:
 
     Answer answer(const Received &request) {
         using namespace OvraPlatform;
-        const std::lock_guard<std::mutex> lock(mutex_);
         std::string why;
         const auto visible = decodeForm(request.body, why);
         if (!visible) {
             return document(apiError(APIError::kBadRequest, why));
         }
-        if (visible->method == "getinfo") {
-            Json::Value data;
-            data["public_key"] = publicKeyText(keys_->publicKey());
-            return document(apiSuccess(data));
-        }
-        if (visible->sealed.empty()) {
-            return document(handler_(*visible));
-        }
         OpenedRequest opened;
-        const SealVerdict verdict = openRequest(*keys_, *visible, guard_, opened);
-        if (verdict == SealVerdict::kUnreadable) {
-            return document(sealRefusal(verdict, guard_.now()));
+        SealVerdict verdict = SealVerdict::kOpened;
+        {
+            const std::lock_guard<std::mutex> lock(mutex_);
+            if (visible->method == "getinfo") {
+                Json::Value data;
+                data["public_key"] = publicKeyText(keys_->publicKey());
+                data["time"] = Json::Int64{guard_.now()};
+                return document(apiSuccess(data));
+            }
+            if (!visible->sealed.empty()) {
+                verdict = openRequest(*keys_, *visible, guard_, opened);
+            }
         }
-        const Json::Value reply = verdict == SealVerdict::kOpened
-                                      ? handler_(opened.call)
-                                      : sealRefusal(verdict, guard_.now());
-        return Answer::json(sealReply(opened.replyKey, OvraDRCore::toString(reply)));
+        const bool sealed = !visible->sealed.empty() && verdict != SealVerdict::kUnreadable;
+        const Reply reply = verdict == SealVerdict::kOpened
+                                ? handler_(visible->sealed.empty() ? *visible : opened.call)
+                                : OvraDRCore::toString(sealRefusal(verdict, guard_.now()));
+        if (const Answer *bytes = std::get_if<Answer>(&reply)) {
+            return *bytes;
+        }
+        const auto &text = std::get<std::string>(reply);
+        return Answer::json(sealed ? sealReply(opened.replyKey, text) : text);
     }
 
 private:
