@@ -79,7 +79,7 @@ std::string firstCredId(const NodeValidCredCache &cache,
                         const std::vector<NodeCandidate> &candidates) {
     const double age = cache.GetCachedAge();
     const bool fresh = age >= 0 && age <= static_cast<double>(cache.GetLifetime());
-    const std::string stored = cache.getStoredCredId();
+    std::string stored = cache.getStoredCredId();
     if (fresh) {
         return stored;
     }

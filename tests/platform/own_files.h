@@ -37,7 +37,7 @@ inline unsigned int modeOf(const std::string &path) {
 
 /// How the sandbox around this program works: root, user or proot; "" when there is none.
 inline std::string labWay() {
-    const char *const way = std::getenv("OVRADR_LAB_WAY"); // NOLINT(concurrency-mt-unsafe)
+    const char *const way = std::getenv("OVRADR_LAB_WAY");
     return way != nullptr ? way : "";
 }
 

@@ -34,7 +34,7 @@ public:
             dup2(ends[1], STDOUT_FILENO);
             dup2(ends[1], STDERR_FILENO);
             // A daemon that is left by calls under way leaves their threads, on purpose.
-            setenv("TSAN_OPTIONS", "report_thread_leaks=0", 1); // NOLINT(concurrency-mt-unsafe)
+            setenv("TSAN_OPTIONS", "report_thread_leaks=0", 1);
             char program[] = OVRADRD_PROGRAM;
             std::array<char *, 3> argv{program, argument.empty() ? nullptr : argument.data()};
             execv(program, argv.data());

@@ -33,9 +33,9 @@ TEST(Timezone, isFoundWhereTheMachineSaysIt) {
         std::string folder = "/tmp/ovrat.XXXXXX";
         ASSERT_NE(mkdtemp(folder.data()), nullptr);
         const Ovradrd::TimezoneFiles files{folder + "/link", folder + "/name"};
-        unsetenv("TZ"); // NOLINT(concurrency-mt-unsafe)
+        unsetenv("TZ");
         if (scene.variable != nullptr) {
-            setenv("TZ", scene.variable, 1); // NOLINT(concurrency-mt-unsafe)
+            setenv("TZ", scene.variable, 1);
         }
         if (scene.target != nullptr && *scene.target == '\0') {
             std::ofstream(files.link) << "TZif2";

@@ -66,9 +66,9 @@ struct Cgi : OvraTest::OwnFiles {
     }
     static void setEnvironment(const char *address) {
         if (address == nullptr) {
-            unsetenv("REMOTE_ADDR"); // NOLINT(concurrency-mt-unsafe)
+            unsetenv("REMOTE_ADDR");
         } else {
-            setenv("REMOTE_ADDR", address, 1); // NOLINT(concurrency-mt-unsafe)
+            setenv("REMOTE_ADDR", address, 1);
         }
     }
     static std::string remoteIp() {
