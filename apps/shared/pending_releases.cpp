@@ -50,7 +50,7 @@ PendingRelease readRelease(const Statement &row) {
 
 } // namespace
 
-std::string PendingRelease::reference() const {
+std::string referenceOf(const std::string &session) {
     OvraPlatform::SessionRecord record;
     record.id = session;
     return record.reference();

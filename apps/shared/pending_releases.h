@@ -15,6 +15,10 @@ namespace OvraApps {
 /// Mode 0600: it holds sessions. docs/files.md describes it.
 inline constexpr char kPendingReleasesFile[] = "/usr/ovra/var/ovradr/releases.db";
 
+/// By which both nodes name a session to people: 16 hexadecimal digits of its SHA-256. It opens
+/// nothing.
+std::string referenceOf(const std::string &session);
+
 /// A session on another node that nothing needs any more and that perhaps is still there.
 struct PendingRelease {
     std::string session; ///< a secret
@@ -26,9 +30,7 @@ struct PendingRelease {
     std::int64_t nextTry = 0; ///< seconds of the system clock
     int code = 0;             ///< why the last attempt failed; 0: there was none
 
-    /// Names it to people: 16 hexadecimal digits of the session's SHA-256, the same ones by which
-    /// the other node names the session.
-    std::string reference() const;
+    std::string reference() const { return referenceOf(session); }
 };
 
 /// The releases that could not be done, in a SQLite file that all processes share. An object holds

@@ -62,6 +62,13 @@ Outcome checkOnly(const CredCreate &flow, const Conn &conn) {
 
 /// Carries out a flow that has proved itself.
 Outcome runFlow(CredCreate &flow, const Conn &conn, const CreateOptions &options) {
+    if (!flow.getRemoteNodeInfo()) {
+        return flowFailure(flow, conn);
+    }
+    if (DRNode::isLocalNodeId(flow.getNode().nodeId)) {
+        return failure(ExitCode::kUsage, targetText(conn) + " is this appliance itself.",
+                       "Give the URL of another one.");
+    }
     if (options.dryRun) {
         return checkOnly(flow, conn);
     }

@@ -6,17 +6,17 @@
 #include "handlers/relay.h"
 #include "handlers/words.h"
 #include "ovradrnode/cred_reverse_create.h"
-#include "ovradrnode/cred_utils.h"
 #include "ovradrnode/dr_node.h"
 #include "ovradrnode/node_create.h"
 #include "ovradrnode/node_db.h"
-#include "ovradrnode/node_delete.h"
 #include "ovradrnode/node_set.h"
+#include "shared/session_release.h"
 #include "webapi/api_errors.h"
 
 #include <ovradrcore/log.h>
 
 #include <algorithm>
+#include <optional>
 #include <string>
 #include <vector>
 
@@ -66,13 +66,26 @@ Json::Value addReverse(Json::Value data, const std::string &credId, const APICal
     if (!reverse(flow, credId, caller.user, conns)) {
         OVRA_NOTICE("The credential [%s] is deleted again: none could be made back to this node",
                     credId.c_str());
-        if (!OvraDRNode::DRNodeCredDelete(credId).process()) {
+        DRNode record;
+        if (!DRNodeDB::GetCred(credId, record) || !OvraApps::deleteCredential(record, false).done) {
             OVRA_ERR("The credential [%s] could not be deleted: delete it by hand", credId.c_str());
         }
         return flowError(flow, ERR::kCredIncomplete);
     }
     data["dst_cred"] = flow.getCredInfo();
     return apiSuccess(data);
+}
+
+/// Makes the credential, unless it would be one to this node itself.
+/// \return an error reply; null when it was made
+Json::Value carryOut(OvraDRNode::CredCreate &flow, const Proof &proof) {
+    if (!proof.giveTo(flow) || !flow.getRemoteNodeInfo()) {
+        return flowError(flow, ERR::kCredIncomplete);
+    }
+    if (DRNode::isLocalNodeId(flow.getNode().nodeId)) {
+        return OvraPlatform::apiBadParameter("conn", "conn is this node itself: name another one");
+    }
+    return flow.process() ? Json::Value() : flowError(flow, ERR::kCredIncomplete);
 }
 
 Json::Value create(const Json::Value &params, const APICaller &caller) {
@@ -89,8 +102,9 @@ Json::Value create(const Json::Value &params, const APICaller &caller) {
         return refusal;
     }
     OvraDRNode::DRNodeCredCreate flow;
-    if (!proof.giveTo(flow) || !flow.process()) {
-        return flowError(flow, ERR::kCredIncomplete);
+    refusal = carryOut(flow, proof);
+    if (!refusal.isNull()) {
+        return refusal;
     }
     Json::Value data(Json::objectValue);
     data["src_cred"] = flow.getNode().toJson();
@@ -104,10 +118,8 @@ Json::Value createTemporary(const Json::Value &params, const APICaller & /*calle
         return in.error();
     }
     OvraDRNode::TempCredCreate flow;
-    if (!proof.giveTo(flow) || !flow.process()) {
-        return flowError(flow, ERR::kCredIncomplete);
-    }
-    return apiSuccess(flow.getNode().toJson());
+    const Json::Value refusal = carryOut(flow, proof);
+    return refusal.isNull() ? apiSuccess(flow.getNode().toJson()) : refusal;
 }
 
 /// Whether the proof works at the other node and the account is known there; creates nothing.
@@ -145,6 +157,8 @@ void appendRecords(Json::Value &list, const std::string &nodeId, DRNodeDB::CredT
     }
     for (const DRNode &record : records) {
         Json::Value entry = record.toJson();
+        // By which the node that granted it names the session; it opens nothing.
+        entry["session_reference"] = OvraApps::referenceOf(record.session);
         entry["temporary"] = type == DRNodeDB::CRED_TYPE_TEMP;
         list.append(entry);
     }
@@ -164,6 +178,16 @@ Json::Value list(const Json::Value &params, const APICaller & /*caller*/) {
     return apiSuccess(data);
 }
 
+/// A temporary credential, also one that lacks something.
+std::optional<DRNode> findTemporary(const std::string &credId) {
+    std::vector<DRNode> records;
+    DRNodeDB::List(records, DRNodeDB::CRED_TYPE_TEMP);
+    const auto found =
+        std::find_if(records.begin(), records.end(),
+                     [&credId](const DRNode &record) { return record.credId == credId; });
+    return found == records.end() ? std::nullopt : std::optional(*found);
+}
+
 /// A new log-in, perhaps over another endpoint, for an existing credential.
 /// \param dryRun  whether it only has to be tried
 Json::Value set(const Json::Value &params, bool dryRun) {
@@ -174,36 +198,25 @@ Json::Value set(const Json::Value &params, bool dryRun) {
     if (!in.ok()) {
         return in.error();
     }
-    OvraDRNode::DRNodeCredSet flow;
-    const bool armed =
-        flow.setCredId(credId) && flow.setCred(conn, login.account, login.password, login.otpCode);
-    if (!armed || !(dryRun ? flow.check() : flow.process())) {
-        return flowError(flow, ERR::kCredIncomplete);
+    if (findTemporary(credId)) {
+        return OvraPlatform::apiBadParameter(
+            "cred_id", "cred_id is a temporary credential: delete it and make a new one");
     }
     DRNode record;
     if (!DRNodeDB::GetCred(credId, record)) {
         return noSuchCredential();
     }
-    return apiSuccess(record.toJson());
-}
-
-bool isTemporary(const DRNode &record) {
-    std::vector<DRNode> temporary;
-    DRNodeDB::ListCred(record.nodeId, temporary, DRNodeDB::CRED_TYPE_TEMP);
-    return std::any_of(temporary.begin(), temporary.end(),
-                       [&record](const DRNode &other) { return other.credId == record.credId; });
-}
-
-/// The row first, then the session on the other node; a node that does not answer keeps it until it
-/// expires.
-bool deleteTemporary(const DRNode &record) {
-    const OvraDRCore::SqliteEqual condition("cred_id", record.credId);
-    if (!OvraDRNode::NodeDBHandler::GetHandler().DeleteRecord(condition.text,
-                                                              OvraDRNode::TempCredSqliteTable())) {
-        return false;
+    OvraDRNode::DRNodeCredSet flow;
+    const bool armed =
+        flow.setCredId(credId) && flow.setCred(conn, login.account, login.password, login.otpCode);
+    const auto change = [&flow] { return flow.process(); };
+    if (!armed || !(dryRun ? flow.check() : OvraApps::runReleasing(record, conn, change).done)) {
+        return flowError(flow, ERR::kCredIncomplete);
     }
-    OvraDRNode::CredUtils::NotifyRemoteNodeDeleteSessionIfNotUsed(record.conn, record.session);
-    return true;
+    if (!DRNodeDB::GetCred(credId, record)) {
+        return noSuchCredential();
+    }
+    return apiSuccess(record.toJson());
 }
 
 /// A credential that is not there is deleted too.
@@ -213,13 +226,22 @@ Json::Value remove(const Json::Value &params, const APICaller & /*caller*/) {
     if (!in.ok()) {
         return in.error();
     }
-    DRNode record;
-    const bool temporary = DRNodeDB::GetCred(credId, record) && isTemporary(record);
-    const bool gone =
-        temporary ? deleteTemporary(record) : OvraDRNode::DRNodeCredDelete(credId).process();
-    return gone ? apiSuccess()
-                : apiError(ERR::kFailed, "the credential cannot be deleted: see the log of the "
-                                         "appliance, and check that its disk is not full");
+    const std::optional<DRNode> temporary = findTemporary(credId);
+    DRNode record = temporary.value_or(DRNode());
+    if (!temporary && !DRNodeDB::GetCred(credId, record)) {
+        record.credId = credId;
+    }
+    const OvraApps::ReleasingFlow result =
+        OvraApps::deleteCredential(record, temporary.has_value());
+    if (!result.done) {
+        return apiError(ERR::kFailed, "the credential cannot be deleted: see the log of the "
+                                      "appliance, and check that its disk is not full");
+    }
+    Json::Value data;
+    if (!record.session.empty()) {
+        data["release"] = OvraApps::releaseWord(result.release.outcome);
+    }
+    return apiSuccess(data);
 }
 
 /// What the three reverse calls share.

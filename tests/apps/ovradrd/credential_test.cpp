@@ -145,6 +145,11 @@ TEST_F(Credential, thatIsTemporaryStandsInATableOfItsOwn) {
     EXPECT_EQ(reply.data()["node_id"], "n1");
     EXPECT_EQ(rows("temp_cred"), "n1|temporary\n");
 
+    Json::Value change = conn();
+    change["cred_id"] = reply.data()["cred_id"];
+    change["account"] = change["password"] = "joe";
+    EXPECT_EQ(ask("set", change).code(), 106) << "its row would stay as it is";
+    EXPECT_EQ(rows("temp_cred"), "n1|temporary\n");
     EXPECT_EQ(ask("delete", credId(reply.data()["cred_id"].asString())).code(), 0);
     EXPECT_EQ(rows("temp_cred"), "");
     EXPECT_NE(remote.calls().find("temporary delete"), std::string::npos);
@@ -167,6 +172,8 @@ TEST_F(Credential, isListedAndShownWithoutItsSession) {
     EXPECT_EQ(list.data()["creds"][0]["temporary"], false);
     EXPECT_EQ(list.data()["creds"][1]["temporary"], true);
     EXPECT_EQ(list.text.find("granted"), std::string::npos);
+    // printf %s s | sha256sum
+    EXPECT_EQ(list.data()["creds"][1]["session_reference"], "043a718774c572bd");
     EXPECT_EQ(ask("list", json(R"({"node_id":"n1"})")).data()["creds"].size(), 1U);
     EXPECT_EQ(ask("get", credId(id)).data()["node_id"], "n1");
 }
@@ -190,8 +197,9 @@ TEST_F(Credential, isChangedByANewLogIn) {
 
 TEST_F(Credential, isDeletedAlsoWhenItsNodeIsGone) {
     const std::string id = make();
+    EXPECT_EQ(ask("delete", credId(make())).data()["release"], "kept");
     remote.server.refuse();
-    EXPECT_EQ(ask("delete", credId(id)).code(), 0);
+    EXPECT_EQ(ask("delete", credId(id)).data()["release"], "left_behind");
     EXPECT_EQ(rows("node_cred"), "");
     EXPECT_EQ(ask("delete", credId(id)).code(), 0);
 }
@@ -212,6 +220,9 @@ TEST_F(Credential, doesNotReachTheNodeItself) {
     for (const char *method : {"get", "delete", "reverse_create"}) {
         EXPECT_EQ(ask(method, credId(self)).code(), 106) << method;
     }
+    remote.answer("info", R"({"success":true,"data":{"serial":"S1","node_id":")" + self + R"("}})");
+    EXPECT_EQ(ask("create", byAccount()).code(), 106);
+    EXPECT_EQ(rows("node_cred"), "");
 }
 
 class Relay : public Credential {
