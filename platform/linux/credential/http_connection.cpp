@@ -23,6 +23,9 @@ namespace {
 /// connection.
 constexpr char kCertificateDir[] = "/etc/ssl/certs";
 constexpr long kConnectMillis = 10'000;
+/// A peer whose kernel says nothing for so long is gone, however long the answer may take.
+constexpr unsigned kSilenceMillis = 10'000;
+constexpr int kKeepAliveSeconds = 3;
 constexpr std::size_t kMaxHeader = std::size_t{64} * 1024;
 constexpr std::size_t kMaxProbeReply = std::size_t{64} * 1024;
 constexpr int kMostAttempts = 2;
@@ -65,6 +68,30 @@ std::optional<std::uint64_t> deliveredBytes(int socket) {
         return std::nullopt;
     }
     return info.tcpi_bytes_acked;
+}
+
+/// Has the kernel end the connection when the peer's does not acknowledge what is sent, nor answer
+/// when it is asked whether it is still there (tcp(7), RFC 5482).
+void endWhenSilent(int socket) {
+    const auto set = [socket](int level, int option, int value) {
+        setsockopt(socket, level, option, &value, sizeof value);
+    };
+    set(IPPROTO_TCP, TCP_USER_TIMEOUT, static_cast<int>(kSilenceMillis));
+    set(IPPROTO_TCP, TCP_KEEPIDLE, kKeepAliveSeconds);
+    set(IPPROTO_TCP, TCP_KEEPINTVL, kKeepAliveSeconds);
+    set(SOL_SOCKET, SO_KEEPALIVE, 1);
+}
+
+/// Whether the connection ended because nothing came from the peer any more; the kernel's clocks
+/// are a little apart.
+bool endedInSilence(int socket) {
+    constexpr unsigned kTolerance = 500; // milliseconds
+    constexpr unsigned kClosed = 7;      // TCP_CLOSE of a header that excludes linux/tcp.h
+    tcp_info info{};
+    socklen_t size = sizeof info;
+    return getsockopt(socket, IPPROTO_TCP, TCP_INFO, &info, &size) == 0 &&
+           size >= offsetof(tcp_info, tcpi_last_ack_recv) + sizeof info.tcpi_last_ack_recv &&
+           info.tcpi_state == kClosed && info.tcpi_last_ack_recv + kTolerance >= kSilenceMillis;
 }
 
 long millisecondsUntil(Deadline deadline) {
@@ -257,6 +284,9 @@ CredError HttpConnection::errorOf(CURLcode code) const {
     if (verdict == CertificateJudge::Verdict::kUnavailable) {
         return CredError::kTrustUnavailable;
     }
+    if (attempt_.endedInSilence) {
+        return CredError::kTimedOut;
+    }
     switch (code) {
     case CURLE_OPERATION_TIMEDOUT:
         return CredError::kTimedOut;
@@ -320,7 +350,7 @@ CURLcode HttpConnection::onTlsContext(CURL *, void *context, void *self) {
 ///
 /// libcurl repeats a request by itself when a kept connection ends without an answer, also when the
 /// peer may have carried it out. Here it is repeated only when the peer's kernel had acknowledged
-/// none of its bytes.
+/// none of its bytes, and not when the peer fell silent.
 int HttpConnection::onRequest(void *self, char *, char *, int, int) {
     auto *connection = static_cast<HttpConnection *>(self);
     Attempt &attempt = connection->attempt_;
@@ -334,11 +364,17 @@ int HttpConnection::onRequest(void *self, char *, char *, int, int) {
     attempt.mayHaveArrived = true;
     attempt.socket = connection->sockets_.size() == 1 ? connection->sockets_.front() : -1;
     attempt.delivered = deliveredBytes(attempt.socket);
+    if (attempt.socket >= 0) {
+        endWhenSilent(attempt.socket);
+    }
     return CURL_PREREQFUNC_OK;
 }
 
 curl_socket_t HttpConnection::onOpenSocket(void *self, curlsocktype, curl_sockaddr *address) {
     auto *connection = static_cast<HttpConnection *>(self);
+    if (connection->attempt_.endedInSilence) {
+        return CURL_SOCKET_BAD; // it would be waited for once more
+    }
     const int fd = ConnectionPool::instance().openSocket(address->family, address->socktype,
                                                          address->protocol);
     if (fd < 0) {
@@ -354,6 +390,7 @@ int HttpConnection::onCloseSocket(void *self, curl_socket_t socket) {
     if (socket == attempt.socket) {
         const std::optional<std::uint64_t> delivered = deliveredBytes(socket);
         attempt.mayHaveArrived = !delivered || delivered != attempt.delivered;
+        attempt.endedInSilence = endedInSilence(socket);
         attempt.socket = -1;
     }
     std::vector<int> &sockets = connection->sockets_;
