@@ -1,0 +1,79 @@
+# SPDX-License-Identifier: Apache-2.0
+# shellcheck shell=bash
+# What scenes with two appliances are played with: a lab of their own, taken down at the end, in which
+# node 1 pairs with node 2, whose administrator is "replica". What is run is said and judged here.
+
+lab=$(dirname "$(readlink -f "${BASH_SOURCE[0]}")")/../lab
+work=$(mktemp -d /tmp/ove.XXXXXX)
+export OVRADR_LAB_DIR=$work/lab
+finish() {
+    "$lab" down >/dev/null 2>&1 || true
+    rm -rf "$work"
+}
+trap finish EXIT
+
+fail() {
+    printf 'FAILED: %s\n--- last output:\n%s\n' "$1" "${output-}"
+    for node in 1 2; do
+        printf -- '--- log of node %s:\n' "$node"
+        "$lab" log "$node" | tail -n 15 || true
+    done
+    exit 1
+}
+
+# on NODE CODE COMMAND...: runs a command on a node and expects its exit code; sets output.
+on() {
+    local node=$1 wanted=$2 code=0
+    shift 2
+    output=$("$lab" run "$node" -- timeout 60 "$@" 2>&1 </dev/null) || code=$?
+    ((code == wanted)) || fail "exit code $code instead of $wanted: $*"
+}
+says() { [[ $output == *"$1"* ]] || fail "the output does not say \"$1\""; }
+logSays() { "$lab" log "$1" | grep -qF -- "$2" || fail "the log of node $1 does not say \"$2\""; }
+
+password=correct-horse-battery
+account=replica
+up() {
+    "$lab" up 2 >/dev/null || fail "the lab does not come up"
+    url=https://$("$lab" addr 2):5001
+    on 1 0 sh -c "umask 077; printf %s '$password' >/usr/ovra/pw"
+    on 2 0 sh -c "umask 077; printf %s '$password' >/usr/ovra/pw"
+    on 2 0 ovradr user add replica --admin --password-file /usr/ovra/pw
+    on 2 0 ovradr node id
+    remote=$output
+    key=$(fingerprint)
+}
+# The fingerprint of node 2's key for HTTPS.
+fingerprint() {
+    "$lab" run 2 -- ovradr conn local | sed -n 's/^https.*\(SHA256:[^ ]*\).*/\1/p' | head -n 1
+}
+create() {
+    local code=$1
+    shift
+    on 1 "$code" ovradr cred create "$url" --account "$account" --password-file /usr/ovra/pw \
+        --fingerprint "$key" "$@"
+}
+info() { on 1 "$1" ovradr call "$remote" OVRA.DR.Node info; }
+
+stopDaemon() { "$lab" run 2 -- pkill -TERM -x ovradrd || fail "no daemon to stop"; waitGone; }
+waitGone() {
+    for _ in $(seq 50); do
+        "$lab" run 2 -- pgrep -x ovradrd >/dev/null || return 0
+        sleep 0.1
+    done
+    fail "ovradrd does not end"
+}
+# In the background of the node, as its init would; the lab ends it. Node 1 learns nothing of it.
+startDaemon() {
+    waitGone
+    "$lab" run 2 -- sh -c 'ovradrd >/tmp/ovradrd.out 2>&1 &'
+    for _ in $(seq 100); do
+        "$lab" run 2 -- ovradr conn test "$url" >/dev/null 2>&1 && return
+        sleep 0.1
+    done
+    fail "ovradrd does not come back"
+}
+restartDaemon() {
+    stopDaemon
+    startDaemon
+}
