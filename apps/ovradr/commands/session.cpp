@@ -168,6 +168,7 @@ void addSessionCommands(CLI::App &app, Command &chosen) {
                      "  ovradr session revoke --node 3f2a --dry-run");
     revoking->callback([&chosen, options] { chosen = [options] { return revoke(*options); }; });
 
+    addSessionAuditCommand(*family, chosen);
     addSessionPendingCommand(*family, chosen);
 }
 

@@ -6,6 +6,7 @@
 namespace Ovradr {
 
 // Each adds a command to the family `session`, in the way of addSessionCommands().
+void addSessionAuditCommand(CLI::App &family, Command &chosen);
 void addSessionPendingCommand(CLI::App &family, Command &chosen);
 
 } // namespace Ovradr

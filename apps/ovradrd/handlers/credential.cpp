@@ -171,6 +171,11 @@ Json::Value list(const Json::Value &params, const APICaller & /*caller*/) {
     if (!in.ok()) {
         return in.error();
     }
+    // Unreadable tables read as empty ones, and who audits sessions would end those in use.
+    if (OvraDRNode::NodeDBHandler::GetHandler().GetSchemaVersion() < 0) {
+        return apiError(OvraPlatform::APIError::kInternal,
+                        "the node database cannot be read now: see the log of the appliance");
+    }
     Json::Value data(Json::objectValue);
     data["creds"] = Json::Value(Json::arrayValue);
     appendRecords(data["creds"], nodeId, DRNodeDB::CRED_TYPE_NODE);
