@@ -111,7 +111,7 @@ Terminal::Terminal(const Arguments &arguments) {
     pid_ = fork();
     if (pid_ == 0) {
         close(master_);
-        login_tty(slave_);: a process of its own
+        login_tty(slave_);
         execute(arguments);
     }
 }
