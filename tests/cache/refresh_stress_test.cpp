@@ -1,0 +1,191 @@
+// SPDX-License-Identifier: Apache-2.0
+// Many processes refresh everything that they share, over endpoints that live, are slow and are
+// dead, while others of them are killed. None may wait for another one that waits for it: a refresh
+// that somebody hinders is waited for up to 30 seconds, so whoever takes longer than kBound was
+// hindered.
+#include "clock.h"
+#include "ovradrnode/cred_permission_cache.h"
+#include "ovradrnode/node_api.h"
+#include "ovradrnode/node_cache.h"
+#include "ovradrnode/sender.h"
+#include "support/local_node.h"
+#include "support/log_capture.h"
+#include "support/misbehaving_server.h"
+#include "support/remote_node.h"
+
+#include <gtest/gtest.h>
+#include <sys/mman.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <array>
+#include <atomic>
+#include <chrono>
+#include <csignal>
+#include <functional>
+#include <random>
+#include <thread>
+
+using namespace OvraDRNode;
+using namespace OvraTest;
+
+namespace {
+
+using Millis = std::int64_t;
+
+constexpr int kWorkers = 16;
+/// The first of them are killed; two others that waited for each other would do so for long.
+constexpr int kMortals = 4;
+constexpr Millis kBound = 10'000;
+constexpr Millis kDefaultDuration = 8'000;
+constexpr int kClockRate = 500; // the lifetimes of 3 to 60 seconds pass in 6 to 120 milliseconds
+constexpr std::array kNodes = {"n1", "n2", "n3"};
+
+Millis uptime() {
+    return std::chrono::duration_cast<std::chrono::milliseconds>(
+               std::chrono::steady_clock::now().time_since_epoch())
+        .count();
+}
+
+/// An operation that refreshes, on one of the nodes.
+const std::array<std::function<void(const std::string &node, const Conn &conn)>, 7> kOperations = {
+    [](const std::string &node, const Conn &) { NodeCache(node, true).Read(); },
+    [](const std::string &node, const Conn &) { NodeCache(node, false).Update(); },
+    [](const std::string &node, const Conn &) { NodeSender(node).getCachedCredId(); },
+    [](const std::string &node, const Conn &) {
+        CredPermissionCache("live-" + node).HasPrivilege();
+    },
+    [](const std::string &node, const Conn &) { CredNodeSender("slow-" + node).testPrivilege(); },
+    [](const std::string &, const Conn &conn) { BaseSender::GetCachedConnectable(conn); },
+    [](const std::string &node, const Conn &) {
+        NodeSender(node).process(WebAPI::getDRNodeInfoAPI({}));
+    },
+};
+
+/// What the processes tell each other.
+struct Board {
+    std::atomic<bool> stop{false};
+    std::array<std::atomic<Millis>, kWorkers> busySince{}; ///< 0: between two operations
+    std::array<std::atomic<int>, kOperations.size()> done{};
+    std::atomic<Millis> longest{0};
+    std::atomic<int> hindered{0};
+    std::atomic<int> killed{0};
+};
+
+void keepLargest(std::atomic<Millis> &most, Millis value) {
+    Millis seen = most;
+    while (seen < value && !most.compare_exchange_weak(seen, value)) {
+    }
+}
+
+[[noreturn]] void work(Board &board, std::size_t place, unsigned seed,
+                       const std::vector<Conn> &conns) {
+    std::mt19937 random(seed);
+    LogCapture log;
+    while (!board.stop) {
+        const std::size_t operation = random() % kOperations.size();
+        const Millis start = uptime();
+        board.busySince[place] = start;
+        kOperations[operation](kNodes[random() % kNodes.size()], conns[random() % conns.size()]);
+        board.busySince[place] = 0;
+        keepLargest(board.longest, uptime() - start);
+        ++board.done[operation];
+        board.hindered += log.count("Waited too long");
+        log.clear();
+    }
+    _exit(0);
+}
+
+/// Keeps the workers at work and kills one of the mortal ones every 20 ms; then waits until the rest is done.
+void playStorm(Board &board, Millis duration, const std::vector<Conn> &conns) {
+    std::mt19937 random(1);
+    std::array<pid_t, kWorkers> workers{};
+    const auto start = [&](std::size_t place) {
+        workers[place] = fork();
+        if (workers[place] == 0) {
+            work(board, place, static_cast<unsigned>(random()), conns);
+        }
+    };
+    for (std::size_t place = 0; place < kWorkers; ++place) {
+        start(place);
+        random();
+    }
+    for (const Millis end = uptime() + duration; uptime() < end; ++board.killed) {
+        std::this_thread::sleep_for(std::chrono::milliseconds(20));
+        const std::size_t place = random() % kMortals;
+        kill(workers[place], SIGKILL);
+        waitpid(workers[place], nullptr, 0);
+        board.busySince[place] = 0;
+        start(place);
+    }
+    board.stop = true;
+    for (std::size_t place = 0; place < kWorkers; ++place) {
+        while (waitpid(workers[place], nullptr, WNOHANG) == 0) {
+            const Millis since = board.busySince[place];
+            if (since != 0 && uptime() - since > kBound) {
+                keepLargest(board.longest, uptime() - since);
+                kill(workers[place], SIGKILL);
+            }
+            std::this_thread::sleep_for(std::chrono::milliseconds(5));
+        }
+    }
+}
+
+} // namespace
+
+TEST(RefreshStress, NoTwoProcessesWaitForEachOther) {
+    const char *const seconds = std::getenv("OVRADR_STRESS_SECONDS");
+    const Millis duration = seconds != nullptr ? std::atol(seconds) * 1000 : kDefaultDuration;
+    auto *const memory =
+        mmap(nullptr, sizeof(Board), PROT_READ | PROT_WRITE, MAP_SHARED | MAP_ANONYMOUS, -1, 0);
+    ASSERT_NE(memory, MAP_FAILED);
+    Board &board = *new (memory) Board;
+    int gate[2];
+    ASSERT_EQ(pipe(gate), 0);
+    OvraDRCore::setSystemClock([] { return uptime() * kClockRate; });
+    provisionNode();
+    DRNode::getLocalNodeId();
+
+    // Forked before the servers' threads are there; it begins when it is told their ports.
+    std::array<int, 3> ports{};
+    const pid_t storm = fork();
+    if (storm == 0) {
+        if (read(gate[0], ports.data(), sizeof ports) == sizeof ports) {
+            std::vector<Conn> conns;
+            for (const int port : ports) {
+                conns.push_back(Conn::https("127.0.0.1", port));
+            }
+            playStorm(board, duration, conns);
+        }
+        _exit(0);
+    }
+    RemoteNode live;
+    RemoteNode slow;
+    for (const char *method : {"probe", "info", "test_privilege"}) {
+        slow.before(method, [] { std::this_thread::sleep_for(std::chrono::milliseconds(100)); });
+    }
+    slow.answer("test_privilege", R"({"success":false,"error":{"code":105}})");
+    live.answer("info", R"({"success":true,"data":{"hostname":"far"}})");
+    ports = {live.port(), slow.port(), unusedPort()};
+    for (const std::string node : kNodes) {
+        addCred("node_cred", node, "dead-" + node, "https", ports[2], "s");
+        addCred("node_cred", node, "slow-" + node, "https", ports[1], "s");
+        addCred("node_cred", node, "live-" + node, "https", ports[0], "s");
+    }
+    ASSERT_EQ(write(gate[1], ports.data(), sizeof ports), static_cast<ssize_t>(sizeof ports));
+    waitpid(storm, nullptr, 0);
+
+    EXPECT_LT(board.longest, kBound) << "milliseconds of the longest operation";
+    EXPECT_EQ(board.hindered, 0);
+    for (std::size_t i = 0; i < kOperations.size(); ++i) {
+        EXPECT_GT(board.done[i], 0) << "operation " << i;
+    }
+    for (const std::atomic<int> &done : board.done) {
+        std::cout << done << " ";
+    }
+    std::cout << board.killed << " killed, longest operation " << board.longest << " ms\n";
+    EXPECT_TRUE(NodeSender("n1").process(WebAPI::getDRNodeInfoAPI({})).isSuccess());
+    EXPECT_EQ(NodeCache("n1", true).GetHostName(), "far");
+    OvraDRCore::setSystemClock(nullptr);
+    munmap(memory, sizeof(Board));
+}
