@@ -96,7 +96,8 @@ void keepLargest(std::atomic<Millis> &most, Millis value) {
     _exit(0);
 }
 
-/// Keeps the workers at work and kills one of the mortal ones every 20 ms; then waits until the rest is done.
+/// Keeps the workers at work and kills one of the mortal ones every 20 ms; then waits until the
+/// rest is done.
 void playStorm(Board &board, Millis duration, const std::vector<Conn> &conns) {
     std::mt19937 random(1);
     std::array<pid_t, kWorkers> workers{};
