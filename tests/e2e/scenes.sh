@@ -140,6 +140,41 @@ speedOfAShapedLink() {
     [[ $output == 0 ]] || fail "a test file is left"
 }
 
+operationHereAndThere() {
+    local there answers dead=https:127.0.0.1:1 example
+    create 0 --json
+    [[ $output =~ \"cred_id\":\"([^\"]+)\" ]] || fail "there is no credential"
+    there=${BASH_REMATCH[1]}
+    cmake -S "$here/../../examples" -B "$work/examples" -DCMAKE_PREFIX_PATH="$OVRADR_LAB_PREFIX" >/dev/null
+    cmake --build "$work/examples" --target reachable_from >/dev/null
+    example=$work/examples/reachable_from answers=https:$("$lab" addr 2):5001
+    for node in local "$remote"; do
+        on 1 0 "$example" "$node" "$dead" "$answers"
+        says '"port":5001'
+        on 1 1 "$example" "$node" "$dead"
+        says '"err_code":500'
+        on 1 1 "$example" "$node"
+        says '"err_code":401'
+    done
+    logSays 2 "method [test_connection]"
+    on 1 0 env OVRADR_CRED="$there" "$example" "$remote" "$answers"
+    on 1 1 env OVRADR_CRED=none "$example" "$remote" "$answers"
+    says '"err_code":519'
+    on 1 1 "$example" stranger "$answers"
+    says '"err_code":507'
+    # Node 2 sends a request on to the node of its own credential.
+    on 1 0 ovradr user add back --admin --password-file /usr/ovra/pw
+    on 2 0 ovradr --json cred create "https://$("$lab" addr 1):5001" --account back \
+        --password-file /usr/ovra/pw \
+        --fingerprint "$("$lab" run 1 -- ovradr conn local | sed -n 's/^https.*\(SHA256:[^ ]*\).*/\1/p' | head -n 1)"
+    [[ $output =~ \"cred_id\":\"([^\"]+)\" ]] || fail "there is no credential"
+    on 1 0 ovradr call "$remote" OVRA.DR.Node.Credential relay --param "cred_id=${BASH_REMATCH[1]}" \
+        --param 'webapi={"api":"OVRA.DR.Node","method":"info","version":1,"params":{}}'
+    says '"hostname" : "node-1"'
+    on 1 7 ovradr call "$remote" OVRA.DR.Node.Credential relay --param cred_id=none \
+        --param 'webapi={"api":"OVRA.DR.Node","method":"info","version":1}'
+}
+
 up
 "$1"
 echo "scene $1 as it should be"
