@@ -1,0 +1,230 @@
+// SPDX-License-Identifier: Apache-2.0
+// What becomes of rows and sessions when a credential is changed, deleted, or half so.
+#include "program.h"
+#include "shared/pending_releases.h"
+#include "support/local_node.h"
+#include "support/remote_node.h"
+
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+
+#include <atomic>
+#include <csignal>
+#include <filesystem>
+
+namespace OvradrTest {
+
+namespace {
+
+using OvraApps::PendingRelease;
+using OvraApps::PendingReleases;
+using OvraTest::addCred;
+using OvraTest::executeSql;
+using OvraTest::querySql;
+using OvraTest::RemoteNode;
+
+constexpr const char *kDead = R"({"success":false,"error":{"code":119}})";
+
+/// A credential "c1" with the session "old"; the remote grants "granted" and forgets what it is
+/// told to delete.
+class Life : public testing::Test {
+protected:
+    Life() {
+        EXPECT_EQ(run({"setup"}).exit, 0);
+        begin();
+    }
+
+    void begin() {
+        std::filesystem::remove(OvraApps::kPendingReleasesFile);
+        executeSql("DELETE FROM node_cred");
+        addCred("node_cred", "n1", "c1", "https", remote.port(), "old");
+        remote.answer("login", R"({"success":true,"data":{"sid":"login-session"}})");
+        remote.answer("info", R"({"success":true,"data":{"node_id":"n1","serial":"S1"}})");
+        remote.answer("create", R"({"success":true,"data":{"session":"granted"}})");
+        remote.answer("old test_privilege", R"({"success":true})");
+        remote.before("delete", [this] { forgetDeleted(); });
+    }
+
+    void forgetDeleted() {
+        if (remote.params("delete") == R"({"session":"old"})") {
+            remote.answer("old test_privilege", kDead);
+        }
+    }
+
+    /// Kills the program at the call that is to be its last one.
+    void count() {
+        if (++calls == fatal) {
+            while (victim == 0) {
+            }
+            kill(victim, SIGKILL);
+        }
+    }
+
+    Arguments change(const Arguments &command) const {
+        Arguments all{"cred"};
+        all.insert(all.end(), command.begin(), command.end());
+        for (const char *word : {"--account", "bob", "--password-stdin", "--fingerprint"}) {
+            all.emplace_back(word);
+        }
+        all.push_back(remote.server.fingerprint());
+        return all;
+    }
+    Arguments create() const {
+        return change({"create", "https://127.0.0.1:" + std::to_string(remote.port())});
+    }
+
+    /// Runs the program and kills it when the remote gets the call with that number, before it is
+    /// answered; 0: never.
+    void runUntil(const Arguments &arguments, int call) {
+        for (const char *method :
+             {"probe", "login", "info", "create", "test_privilege", "logout"}) {
+            remote.before(method, [this] { count(); });
+        }
+        remote.before("delete", [this] {
+            forgetDeleted();
+            count();
+        });
+        victim = 0;
+        calls = 0;
+        fatal = call;
+        Program program(arguments, "secret word\n");
+        victim = program.pid();
+        program.finish();
+        fatal = 0;
+    }
+
+    static std::string sessions() {
+        return querySql("SELECT session FROM node_cred ORDER BY session DESC");
+    }
+    static std::vector<PendingRelease> pending() {
+        std::vector<PendingRelease> releases;
+        EXPECT_TRUE(PendingReleases().list(releases));
+        return releases;
+    }
+
+    std::atomic<int> calls = 0;
+    std::atomic<int> fatal = 0;
+    std::atomic<pid_t> victim = 0;
+    RemoteNode remote;
+};
+
+} // namespace
+
+TEST_F(Life, ADeletionSaysWhatBecameOfTheSession) {
+    const struct {
+        const char *word;
+        std::function<void()> arrange;
+        int pending;
+    } cases[] = {
+        {"released", [] {}, 0},
+        {"ended_already", [this] { remote.answer("old test_privilege", kDead); }, 0},
+        {"kept", [this] { addCred("node_cred", "n1", "c2", "https", remote.port(), "old"); }, 0},
+        {"left_behind",
+         [this] {
+             remote.answer("old test_privilege", R"({"success":false,"error":{"code":105}})");
+         },
+         1},
+        {"left_behind", [this] { remote.before("delete", [] {}); }, 1},
+        {"left_behind", [this] { remote.die(); }, 1},
+    };
+    for (const auto &each : cases) {
+        begin();
+        each.arrange();
+        const Json::Value foreseen = run({"cred", "delete", "c1", "--dry-run", "--json"}).json();
+        EXPECT_EQ(foreseen["data"]["row"], "present");
+        const Result result = run({"cred", "delete", "c1", "--json"});
+        EXPECT_EQ(result.exit, 0);
+        EXPECT_EQ(result.json()["data"]["session"], each.word) << result.out;
+        EXPECT_EQ(querySql("SELECT 1 FROM node_cred WHERE cred_id = 'c1'"), "");
+        EXPECT_EQ(pending().size(), static_cast<std::size_t>(each.pending)) << result.out;
+    }
+}
+
+TEST_F(Life, ACommandThatIsKilledAnywhereLeavesTheOldOrTheNewStateAndNoSessionUnseen) {
+    const struct {
+        Arguments command;
+        std::string after; ///< the sessions in the rows
+    } cases[] = {{create(), "old\ngranted\n"},
+                 {change({"set", "c1"}), "granted\n"},
+                 {{"cred", "delete", "c1"}, ""}};
+    for (const auto &each : cases) {
+        begin();
+        runUntil(each.command, 0);
+        const int last = calls;
+        EXPECT_EQ(sessions(), each.after);
+        EXPECT_GE(last, 3);
+        for (int call = 1; call <= last; ++call) {
+            SCOPED_TRACE(each.command[1] + " killed at call " + std::to_string(call));
+            begin();
+            remote.forgetCalls();
+            runUntil(each.command, call);
+            const std::string rows = sessions();
+            EXPECT_TRUE(rows == "old\n" || rows == each.after) << rows;
+            EXPECT_EQ(run({"session", "pending", "--retry"}).exit, 0);
+            EXPECT_TRUE(pending().empty());
+            const bool needed = rows.find("old") != std::string::npos;
+            EXPECT_EQ(remote.calls().find("old delete") == std::string::npos, needed);
+        }
+    }
+}
+
+TEST_F(Life, ARemoteThatDiesBetweenTheGrantAndTheRowChangesNothing) {
+    for (const bool update : {true, false}) {
+        // Before an update the session of before is looked at; then comes the one that was granted.
+        std::atomic<int> looks = update ? 2 : 1;
+        RemoteNode dying;
+        dying.answer("login", R"({"success":true,"data":{"sid":"login-session"}})");
+        dying.answer("info", R"({"success":true,"data":{"node_id":"n1","serial":"S1"}})");
+        dying.answer("create", R"({"success":true,"data":{"session":"granted"}})");
+        dying.before("test_privilege", [&] { --looks == 0 ? dying.die() : void(); });
+        const std::string url = "https://127.0.0.1:" + std::to_string(dying.port());
+        Arguments command = update ? change({"set", "c1", "--url", url}) : change({"create", url});
+        command.back() = dying.server.fingerprint();
+        command.emplace_back("--json");
+        const Result result = run(command, "secret word\n");
+        EXPECT_EQ(result.json()["error"]["code"], 509) << result.out;
+        EXPECT_EQ(looks, 0);
+        EXPECT_EQ(sessions(), "old\n");
+        EXPECT_TRUE(pending().empty());
+    }
+}
+
+TEST_F(Life, WhatIsStillNeededIsNotReleased) {
+    // As a deletion leaves it that was killed before the row.
+    PendingRelease note{"old", OvraDRNode::Conn::https("127.0.0.1", remote.port()), "n1", "c1"};
+    ASSERT_TRUE(PendingReleases().note(note));
+    EXPECT_EQ(
+        run({"session", "pending", "--retry", "--json"}).json()["data"]["tried"][0]["session"],
+        "kept");
+    EXPECT_TRUE(pending().empty());
+    EXPECT_EQ(remote.calls().find("delete"), std::string::npos);
+}
+
+TEST(PendingRelease, isDueAgainAfterPausesThatGrow) {
+    std::time_t now = 1000;
+    PendingReleases store("/usr/ovra/var/ovradr/releases.db", [&now] { return now; });
+    const auto due = [&store, &now](std::time_t time) {
+        std::vector<PendingRelease> releases;
+        now = time;
+        EXPECT_TRUE(store.listDue(releases, 8));
+        return !releases.empty();
+    };
+    const PendingRelease note{"session", OvraDRNode::Conn::https("h", 1), "n", "c"};
+    ASSERT_TRUE(store.note(note));
+    EXPECT_FALSE(due(1000 + PendingReleases::kHold - 1)) << "the command is still at work";
+    EXPECT_TRUE(due(1000 + PendingReleases::kHold));
+    for (const int pause : {30, 60, 120, 240, 480, 960, 1920, 3840, 7680, 15360, 21600, 21600}) {
+        const std::time_t failed = now;
+        ASSERT_TRUE(store.postpone(note.reference(), 500));
+        EXPECT_FALSE(due(failed + pause - 1)) << pause;
+        EXPECT_TRUE(due(failed + pause)) << pause;
+    }
+    EXPECT_TRUE(due(0)) << "the clock was set back";
+    struct stat status {};
+    ASSERT_EQ(stat(OvraApps::kPendingReleasesFile, &status), 0);
+    EXPECT_EQ(status.st_mode & 0777U, 0600U);
+    EXPECT_TRUE(store.remove(note.reference()));
+    EXPECT_FALSE(due(1 << 30));
+}
+
+} // namespace OvradrTest
