@@ -41,11 +41,11 @@ up() {
     on 2 0 ovradr user add replica --admin --password-file /usr/ovra/pw
     on 2 0 ovradr node id
     remote=$output
-    key=$(fingerprint)
+    key=$(fingerprint 2)
 }
-# The fingerprint of node 2's key for HTTPS.
+# fingerprint NODE: the fingerprint of the node's key for HTTPS.
 fingerprint() {
-    "$lab" run 2 -- ovradr conn local | sed -n 's/^https.*\(SHA256:[^ ]*\).*/\1/p' | head -n 1
+    "$lab" run "$1" -- ovradr conn local | sed -n 's/^https.*\(SHA256:[^ ]*\).*/\1/p' | head -n 1
 }
 create() {
     local code=$1

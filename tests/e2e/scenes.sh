@@ -166,13 +166,117 @@ operationHereAndThere() {
     on 1 0 ovradr user add back --admin --password-file /usr/ovra/pw
     on 2 0 ovradr --json cred create "https://$("$lab" addr 1):5001" --account back \
         --password-file /usr/ovra/pw \
-        --fingerprint "$("$lab" run 1 -- ovradr conn local | sed -n 's/^https.*\(SHA256:[^ ]*\).*/\1/p' | head -n 1)"
+        --fingerprint "$(fingerprint 1)"
     [[ $output =~ \"cred_id\":\"([^\"]+)\" ]] || fail "there is no credential"
     on 1 0 ovradr call "$remote" OVRA.DR.Node.Credential relay --param "cred_id=${BASH_REMATCH[1]}" \
         --param 'webapi={"api":"OVRA.DR.Node","method":"info","version":1,"params":{}}'
     says '"hostname" : "node-1"'
     on 1 7 ovradr call "$remote" OVRA.DR.Node.Credential relay --param cred_id=none \
         --param 'webapi={"api":"OVRA.DR.Node","method":"info","version":1}'
+}
+
+nodeDb=/usr/ovra/etc/ovradr/node.db
+# The credential that the last command made.
+made() { sed -n 's/^credential: *//p' <<<"$output"; }
+# holds NODE CREDENTIALS SESSIONS: how many credentials, temporary ones too, the node holds, and how many
+# sessions it granted.
+holds() {
+    on "$1" 0 ovradr --json cred list --temp
+    (($(grep -o '"cred_id"' <<<"$output" | wc -l) == $2)) || fail "node $1 does not hold $2 credentials"
+    on "$1" 0 ovradr --json session list
+    (($(grep -o '"reference"' <<<"$output" | wc -l) == $3)) || fail "node $1 did not grant $3 sessions"
+}
+addAdministrators() {
+    on 2 0 ovradr user add other --admin --password-file /usr/ovra/pw
+    on 1 0 ovradr user add back --admin --password-file /usr/ovra/pw
+}
+
+sharedSessions() {
+    local which word left
+    local -A cred
+    addAdministrators
+    create 0 && cred[a]=$(made)
+    on 1 0 ovradr cred create --from-cred "${cred[a]}" && cred[b]=$(made)
+    on 1 0 sh -c "sqlite3 $nodeDb 'SELECT session FROM node_cred LIMIT 1' |
+        ovradr cred create $url --from-session -" && cred[c]=$(made)
+    on 1 0 ovradr cred create --from-cred "${cred[a]}" --temp && cred[temp]=$(made)
+    account=other create 0 && cred[other]=$(made)
+    holds 1 5 0
+    holds 2 0 3
+    # Which is deleted, what becomes of its session, how many sessions are left.
+    while read -r which word left; do
+        on 1 0 ovradr --json cred delete "${cred[$which]}"
+        says "\"session\":\"$word\""
+        holds 2 0 "$left"
+    done <<-'END'
+	a kept 3
+	temp released 2
+	b kept 2
+	other released 1
+	c released 0
+	END
+}
+
+failuresSeenFromBothSides() {
+    local cred
+    addAdministrators
+    on 2 0 ovradr user add plain --password-file /usr/ovra/pw
+    create 0 && cred=$(made)
+    on 1 0 ovradr cred reverse "$cred" --account back
+    account=plain create 1
+    says "granted no session"
+    holds 1 1 1
+    holds 2 1 1
+    # The endpoint is another node's: this very one.
+    on 1 1 ovradr cred set "$cred" --url "https://$("$lab" addr 1):5001" --account back \
+        --password-file /usr/ovra/pw --fingerprint "$(fingerprint 1)"
+    says "another node"
+    # An update that cannot be written gives the new session back, a creation leaves it.
+    on 1 0 sqlite3 $nodeDb "CREATE TRIGGER up BEFORE UPDATE ON node_cred BEGIN SELECT RAISE(FAIL, 'full'); END;
+        CREATE TRIGGER ins BEFORE INSERT ON node_cred BEGIN SELECT RAISE(FAIL, 'full'); END"
+    on 1 9 ovradr cred set "$cred" --account other --password-file /usr/ovra/pw
+    holds 2 1 1
+    account=other create 9
+    holds 1 1 1
+    holds 2 1 2
+    on 1 0 sqlite3 $nodeDb "DROP TRIGGER up; DROP TRIGGER ins"
+    on 1 0 ovradr cred test "$cred"
+    on 1 0 ovradr node id
+    on 2 0 ovradr session audit "$output" --revoke --yes
+    says "1 session here"
+    holds 2 1 1
+    # A session that was ended over there makes an orphan of its credential.
+    on 1 0 ovradr session revoke --all --yes
+    on 1 0 ovradr session audit "$remote" --revoke --yes
+    says "1 credential over there"
+    holds 2 0 1
+    info 0
+    on 2 0 ovradr session revoke --account replica --yes
+    on 1 4 ovradr cred test "$cred"
+    on 1 0 ovradr --json cred delete "$cred"
+    says ended_already
+}
+
+leftBehind() {
+    local cred=""
+    create 0 && cred=$(made)
+    stopDaemon
+    on 1 0 ovradr --json cred delete "$cred"
+    says left_behind
+    holds 1 0 0
+    on 1 0 ovradr session pending
+    says "does not answer"
+    startDaemon
+    holds 2 0 1
+    # ovradrd looks every 20 seconds; only the pause after the first failure is cut short.
+    on 1 0 sqlite3 /usr/ovra/var/ovradr/releases.db "UPDATE release SET next_try = 0"
+    for _ in $(seq 60); do
+        on 1 0 ovradr --json session pending
+        [[ $output == *reference* ]] || break
+        sleep 0.5
+    done
+    [[ $output != *reference* ]] || fail "ovradrd does not try again"
+    holds 2 0 0
 }
 
 up
