@@ -26,15 +26,12 @@ namespace Ovradr {
 
 namespace {
 
-using OvraDRCore::Request;
 using OvraDRCore::Response;
 using OvraDRNode::BaseSender;
 using OvraDRNode::Conn;
-using OvraDRNode::DRNode;
 using OvraPlatform::CredError;
 using OvraPlatform::PeerIdentity;
 using OvraPlatform::TrustVerdict;
-namespace ERR = OvraDRCore::ERR;
 namespace WebAPI = OvraDRNode::WebAPI;
 
 /// One-time codes are accepted one step of 30 seconds early or late.

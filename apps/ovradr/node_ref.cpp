@@ -67,7 +67,7 @@ Expected<std::set<std::string>> listNodes() {
 }
 
 Expected<std::string> resolveNode(const std::string &text) {
-    const Expected<std::string> local = localNode();
+    Expected<std::string> local = localNode();
     if (!local || text == kLocalWord || text == *local) {
         return local;
     }

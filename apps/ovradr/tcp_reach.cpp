@@ -13,6 +13,7 @@
 #include <chrono>
 #include <cstring>
 #include <memory>
+#include <system_error>
 
 namespace Ovradr {
 
@@ -57,7 +58,7 @@ Failure connectFailure(const std::string &where, int error) {
                        "Check that the appliance is on, the cables, and firewalls in between.");
     }
     return failure(ExitCode::kNotReachable,
-                   where + " cannot be reached: " + std::strerror(error) + ".",
+                   where + " cannot be reached: " + std::generic_category().message(error) + ".",
                    "Check the address, the routes and the cables.");
 }
 

@@ -136,7 +136,8 @@ void playStorm(Board &board, Millis duration, const std::vector<Conn> &conns) {
 
 TEST(RefreshStress, NoTwoProcessesWaitForEachOther) {
     const char *const seconds = std::getenv("OVRADR_STRESS_SECONDS");
-    const Millis duration = seconds != nullptr ? std::atol(seconds) * 1000 : kDefaultDuration;
+    const Millis duration =
+        seconds != nullptr ? std::strtol(seconds, nullptr, 10) * 1000 : kDefaultDuration;
     auto *const memory =
         mmap(nullptr, sizeof(Board), PROT_READ | PROT_WRITE, MAP_SHARED | MAP_ANONYMOUS, -1, 0);
     ASSERT_NE(memory, MAP_FAILED);

@@ -64,7 +64,7 @@ TEST(NodeCandidates, AreListedAsTheSenderThenTriesThem) {
     }
     for (const auto &each : cases) {
         now += 1'000'000'000;
-        const auto store = [](const OvraDRCore::Cache &cache, const Json::Value &value, int age) {
+        const auto store = [](const OvraDRCore::Cache &cache, const Json::Value &value, long age) {
             now -= age * 1000;
             cache.UpdateWithData(value);
             now += age * 1000;
