@@ -15,7 +15,7 @@ help: ## this list
 	@sed -n 's/^\([a-z-]*\):.*## /\1\t/p' $(MAKEFILE_LIST) | while IFS="$$(printf '\t')" read -r target text; do \
 		printf '  make %-8s %s\n' "$$target" "$$text"; done
 
-demo: deps-lab stage ## two appliances on this machine pair and talk, before your eyes
+demo: deps-lab stage ## two appliances on this machine pair, talk and part, before your eyes
 	@OVRADR_LAB_PREFIX='$(stage)' lab/demo
 
 test: deps-test deps-lab stage-dev ## every test, each on a node of its own (TESTS=regex picks some)
