@@ -1,6 +1,8 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "failure.h"
 
+#include "target.h"
+
 #include <ovradrcore/err_recorder.h>
 #include <ovradrcore/json.h>
 
@@ -72,7 +74,8 @@ constexpr std::array kMeanings = {
     Meaning{ERR::kFailed, ExitCode::kFailed, "failed",
             "The operation failed, or its answer makes no sense", kSystemLog},
     Meaning{ERR::kNotConnectable, ExitCode::kNotReachable, "not_connectable",
-            "The other end does not answer", "`ovradr conn test URL` says what is in the way."},
+            "The other end does not answer",
+            "`ovradr doctor`, with the node or its URL, says what is in the way."},
     Meaning{ERR::kLoginFailed, ExitCode::kLoginRefused, "login_failed",
             "The log-in failed: the account or the password is wrong",
             "Check both; if they are right, the system log says what the other end answered."},
@@ -110,7 +113,7 @@ constexpr std::array kMeanings = {
             "The other appliance reaches none of the endpoints of this one",
             "`ovradr conn local` shows them; test one from there."},
     Meaning{ERR::kLoginCallFailed, ExitCode::kNotReachable, "login_call_failed",
-            "The log-in got no answer", "`ovradr conn test URL` says what is in the way."},
+            "The log-in got no answer", "`ovradr doctor URL` says what is in the way."},
     Meaning{ERR::kCredLibrary, ExitCode::kFailed, "request_failed", "The request failed",
             kSystemLog},
     Meaning{ERR::kNoPrivilege, ExitCode::kNotPermitted, "no_privilege",
@@ -137,6 +140,9 @@ std::string detailText(int code, const Json::Value &detail) {
     }
     if (detail.isString()) {
         return detail.asString();
+    }
+    if (code == ERR::kNotConnectable && detail.isObject() && detail.isMember("addr")) {
+        return targetText(OvraDRNode::Conn::fromJson(detail));
     }
     const std::string text = OvraDRCore::memberString(detail, "text");
     const std::string parameter = OvraDRCore::memberString(detail, "param");
