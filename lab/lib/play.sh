@@ -55,10 +55,24 @@ create() {
 }
 info() { on 1 "$1" ovradr call "$remote" OVRA.DR.Node info; }
 
-stopDaemon() { "$lab" run 2 -- pkill -TERM -x ovradrd || fail "no daemon to stop"; waitGone; }
+# signalDaemon SIGNAL: to the daemon of node 2 and to no other: with proot every process of the machine
+# can be seen, those of other labs and a real appliance's among them. False when there is none.
+signalDaemon() {
+    # shellcheck disable=SC2016 # expanded in the node
+    "$lab" run 2 -- bash -c '
+        found=1
+        for pid in $(pgrep -x ovradrd); do
+            for mark in "OVRADR_LAB_ID=$OVRADR_LAB_ID" "OVRADR_LAB_NODE=$OVRADR_LAB_NODE"; do
+                grep -qzxF "$mark" "/proc/$pid/environ" || continue 2
+            done
+            kill -s "$1" "$pid" && found=0
+        done
+        exit "$found"' signal "$1"
+}
+stopDaemon() { signalDaemon TERM || fail "no daemon to stop"; waitGone; }
 waitGone() {
     for _ in $(seq 50); do
-        "$lab" run 2 -- pgrep -x ovradrd >/dev/null || return 0
+        signalDaemon 0 || return 0
         sleep 0.1
     done
     fail "ovradrd does not end"

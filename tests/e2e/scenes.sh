@@ -111,7 +111,7 @@ damagedIdentityAndCaches() {
 killedDaemon() {
     create 0
     for _ in 1 2 3; do
-        "$lab" run 2 -- pkill -KILL -x ovradrd || fail "no daemon to kill"
+        signalDaemon KILL || fail "no daemon to kill"
         startDaemon
         create 0
     done
