@@ -63,7 +63,7 @@ signalDaemon() {
         found=1
         for pid in $(pgrep -x ovradrd); do
             for mark in "OVRADR_LAB_ID=$OVRADR_LAB_ID" "OVRADR_LAB_NODE=$OVRADR_LAB_NODE"; do
-                grep -qzxF "$mark" "/proc/$pid/environ" || continue 2
+                grep -sqzxF "$mark" "/proc/$pid/environ" || continue 2
             done
             kill -s "$1" "$pid" && found=0
         done
