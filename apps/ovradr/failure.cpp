@@ -7,6 +7,7 @@
 #include <ovradrcore/json.h>
 
 #include <credential/cred_errors.h>
+#include <unistd.h>
 #include <webapi/api_errors.h>
 
 #include <algorithm>
@@ -183,6 +184,14 @@ void addDetail(Failure &found, const std::string &detail) {
 Failure failure(ExitCode exit, const std::string &message, const std::string &hint) {
     const int number = static_cast<int>(exit);
     return {exit, number, kExitNames.at(static_cast<std::size_t>(number)), message, hint};
+}
+
+Failure storeFailure(ExitCode exit, const std::string &sentences) {
+    const std::size_t end = sentences.find(". ");
+    return failure(exit, sentences.substr(0, end == std::string::npos ? end : end + 1),
+                   geteuid() != 0             ? "Run the command as root."
+                   : end == std::string::npos ? ""
+                                              : sentences.substr(end + 2));
 }
 
 Failure failureOf(int code, const Json::Value &detail) {

@@ -44,6 +44,10 @@ struct Failure {
 /// A failure that this program found itself.
 Failure failure(ExitCode exit, const std::string &message, const std::string &hint);
 
+/// Why a store of this appliance cannot be used.
+/// \param sentences  the first one says what is wrong, the others what to do
+Failure storeFailure(ExitCode exit, const std::string &sentences);
+
 /// The failure that an error code of the library or of the web API stands for.
 /// \param detail  what came with the code; null when nothing did
 Failure failureOf(int code, const Json::Value &detail = Json::Value());

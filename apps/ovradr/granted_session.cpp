@@ -6,8 +6,6 @@
 #include <ovradrcore/json.h>
 #include <ovradrnode/node_session.h>
 
-#include <unistd.h>
-
 namespace Ovradr {
 
 using OvraDRNode::NodeSession;
@@ -21,18 +19,13 @@ std::string nodeIdOf(const SessionRecord &record) {
     return OvraDRCore::memberString(extra, "node_id");
 }
 
-Failure storeFailure(const std::string &text) {
-    return failure(ExitCode::kNotSetUp, text.empty() ? "The sessions cannot be read." : text,
-                   geteuid() == 0 ? "The system log says more." : "Run the command as root.");
-}
-
 } // namespace
 
 Expected<std::vector<GrantedSession>> grantedSessions() {
     OvraPlatform::SessionStore store;
     std::vector<SessionRecord> records;
     if (!store.isOpen() || !store.list(records)) {
-        return storeFailure(store.error());
+        return storeFailure(ExitCode::kNotSetUp, store.error());
     }
     std::vector<GrantedSession> sessions;
     for (const SessionRecord &record : records) {

@@ -6,6 +6,7 @@
 #include "ovradrnode/node_db.h"
 #include "ovradrnode/node_delete.h"
 #include "shared/remote_session.h"
+#include "shared/session_lock.h"
 
 #include <ovradrcore/err_recorder.h>
 #include <ovradrcore/log.h>
@@ -107,7 +108,10 @@ ReleasingFlow runReleasing(const DRNode &record, const Conn &conn,
     PendingReleases store;
     const bool noted = !record.session.empty() && conn.isValid() && store.note(pending);
     ReleasingFlow result;
-    result.done = flow();
+    {
+        const SessionLock lock(SessionLock::Purpose::kRelease);
+        result.done = flow();
+    }
     if (!result.done) {
         // The credential is as it was, and needs its session.
         store.remove(pending.reference());
@@ -136,6 +140,7 @@ Release retryRelease(const PendingRelease &pending, PendingReleases &store) {
     if (!inUse) {
         const auto now = look(pending.conn, pending.session, "", ReleaseOutcome::kReleased);
         if (!now) {
+            const SessionLock lock(SessionLock::Purpose::kRelease);
             OvraDRNode::CredUtils::NotifyRemoteNodeDeleteSessionIfNotUsed(pending.conn,
                                                                           pending.session);
         }

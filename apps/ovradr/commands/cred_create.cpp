@@ -8,6 +8,8 @@
 
 #include <ovradrnode/node_create.h>
 
+#include <shared/session_lock.h>
+
 #include <memory>
 
 namespace Ovradr {
@@ -72,6 +74,7 @@ Outcome runFlow(CredCreate &flow, const Conn &conn, const CreateOptions &options
     if (options.dryRun) {
         return checkOnly(flow, conn);
     }
+    const OvraApps::SessionLock lock(OvraApps::SessionLock::Purpose::kObtain);
     if (!flow.process()) {
         return flowFailure(flow, conn);
     }

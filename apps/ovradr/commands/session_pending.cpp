@@ -5,8 +5,6 @@
 #include "output.h"
 #include "target.h"
 
-#include <unistd.h>
-
 #include <algorithm>
 #include <memory>
 #include <set>
@@ -23,11 +21,6 @@ struct PendingOptions {
     bool retry = false;
     std::string forget;
 };
-
-Failure storeFailure(const PendingReleases &store) {
-    return failure(ExitCode::kNotSetUp, store.error(),
-                   geteuid() == 0 ? "The system log says more." : "Run the command as root.");
-}
 
 Json::Value toJson(const PendingRelease &release) {
     Json::Value json;
@@ -80,7 +73,7 @@ Outcome forget(PendingReleases &store, const std::vector<PendingRelease> &releas
         return reference.failure();
     }
     if (!store.remove(*reference)) {
-        return storeFailure(store);
+        return storeFailure(ExitCode::kNotSetUp, store.error());
     }
     Report report;
     report.data["forgotten"] = *reference;
@@ -110,7 +103,7 @@ Outcome pending(const PendingOptions &options) {
     PendingReleases store;
     std::vector<PendingRelease> releases;
     if (!store.isOpen() || !store.list(releases)) {
-        return storeFailure(store);
+        return storeFailure(ExitCode::kNotSetUp, store.error());
     }
     if (!options.forget.empty()) {
         return forget(store, releases, options.forget);

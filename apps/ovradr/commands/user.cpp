@@ -31,22 +31,8 @@ struct UserOptions {
     PasswordSource password;
 };
 
-/// The stores say what was wrong in one sentence and what to do in the next.
-Failure storeFailure(ExitCode exit, const std::string &sentences) {
-    const std::size_t end = sentences.find(". ");
-    return failure(exit, sentences.substr(0, end == std::string::npos ? end : end + 1),
-                   end == std::string::npos ? "" : sentences.substr(end + 2));
-}
-
 Trouble checkOpen(const AccountStore &store) {
-    if (store.isOpen()) {
-        return std::nullopt;
-    }
-    Failure why = storeFailure(ExitCode::kNotSetUp, store.error());
-    if (geteuid() != 0) {
-        why.hint = "Run the command as root.";
-    }
-    return why;
+    return store.isOpen() ? Trouble() : storeFailure(ExitCode::kNotSetUp, store.error());
 }
 
 /// The account, or why it cannot be had.

@@ -10,6 +10,7 @@
 #include "ovradrnode/node_create.h"
 #include "ovradrnode/node_db.h"
 #include "ovradrnode/node_set.h"
+#include "shared/session_lock.h"
 #include "shared/session_release.h"
 #include "webapi/api_errors.h"
 
@@ -85,6 +86,7 @@ Json::Value carryOut(OvraDRNode::CredCreate &flow, const Proof &proof) {
     if (DRNode::isLocalNodeId(flow.getNode().nodeId)) {
         return OvraPlatform::apiBadParameter("conn", "conn is this node itself: name another one");
     }
+    const OvraApps::SessionLock lock(OvraApps::SessionLock::Purpose::kObtain);
     return flow.process() ? Json::Value() : flowError(flow, ERR::kCredIncomplete);
 }
 

@@ -11,6 +11,7 @@
 #include <atomic>
 #include <csignal>
 #include <filesystem>
+#include <thread>
 
 namespace OvradrTest {
 
@@ -198,6 +199,20 @@ TEST_F(Life, WhatIsStillNeededIsNotReleased) {
         "kept");
     EXPECT_TRUE(pending().empty());
     EXPECT_EQ(remote.calls().find("delete"), std::string::npos);
+}
+
+TEST_F(Life, ASessionIsNotReleasedWhileACredentialIsMadeWithIt) {
+    // The remote grants the session again that is still to be released there.
+    ASSERT_TRUE(PendingReleases().note(
+        {"granted", OvraDRNode::Conn::https("127.0.0.1", remote.port()), "n1", "c0"}));
+    std::optional<Program> releasing;
+    remote.before("create", [&] {
+        releasing.emplace(Arguments{"session", "pending", "--retry", "--json"});
+        std::this_thread::sleep_for(std::chrono::milliseconds(500));
+    });
+    EXPECT_EQ(run(create(), "secret word\n").exit, 0);
+    EXPECT_EQ(releasing->finish().json()["data"]["tried"][0]["session"], "kept");
+    EXPECT_EQ(remote.calls().find("granted delete"), std::string::npos);
 }
 
 TEST(PendingRelease, isDueAgainAfterPausesThatGrow) {
