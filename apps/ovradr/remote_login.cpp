@@ -42,12 +42,14 @@ void addFingerprintOption(CLI::App &command, std::string &fingerprint) {
 }
 
 Expected<Conn> meet(const Conn &conn, const std::string &fingerprint) {
-    const Expected<Conn> direct = directEndpoint(conn);
+    Expected<Conn> direct = directEndpoint(conn);
     if (!direct) {
         return direct;
     }
-    const Trouble trouble = trustPeer(*direct, fingerprint);
-    return trouble ? Expected<Conn>(*trouble) : direct;
+    if (const Trouble trouble = trustPeer(*direct, fingerprint)) {
+        return *trouble;
+    }
+    return direct;
 }
 
 Trouble logIn(const RemoteLogin &login, const std::string &host, const LoginAttempt &attempt) {

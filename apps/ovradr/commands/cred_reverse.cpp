@@ -45,7 +45,7 @@ Trouble checkAccount(const std::string &account) {
         found.message = "The account " + account + " of this appliance: " + found.message;
         return found;
     }
-    const Json::Value data = answer.getData();
+    const Json::Value &data = answer.getData();
     if (data["administrator"].isBool() && data["administrator"].asBool()) {
         return std::nullopt;
     }
@@ -100,9 +100,10 @@ Outcome report(const ReverseOptions &options, const DRNode &via, const CredRever
     report.data["made"] = OvraDRCore::maskSecrets(made);
     report.data["node_id"] = via.nodeId;
     report.data["temporary"] = options.temporary;
+    const Conn conn = Conn::fromJson(made);
     report.text = listing({{"credential", memberString(made, "cred_id")},
                            {"held by", via.nodeId},
-                           {"endpoint", targetText(Conn::fromJson(made))},
+                           {"endpoint", conn.isValid() ? targetText(conn) : ""},
                            {"account", options.account},
                            {"kind", options.temporary ? "temporary" : "lasting"}});
     return report;
