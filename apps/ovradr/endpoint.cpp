@@ -9,6 +9,7 @@
 #include <ovradrnode/sender.h>
 
 #include <core/appliance.h>
+#include <credential/farlink.h>
 #include <credential/sealed_box.h>
 
 namespace Ovradr {
@@ -33,16 +34,26 @@ Failure whyNotReachable(const Conn &conn) {
     return endpointFailure(conn, static_cast<OvraPlatform::CredError>(request.GetError()));
 }
 
+/// Asks the relay service once more, to learn why it named no endpoint.
+Failure relayFailure(const Conn &conn) {
+    const OvraPlatform::FarlinkSettings settings = OvraPlatform::readFarlinkSettings();
+    if (settings.host.empty()) {
+        return failure(ExitCode::kNotReachable, "No relay service is set up on this appliance.",
+                       "Run `ovradr farlink enable --server URL`.");
+    }
+    const OvraPlatform::FarlinkReply reply =
+        OvraPlatform::FarlinkClient(settings).lookUp(conn.addr);
+    return failure(ExitCode::kNotReachable,
+                   targetText(conn) + " is not reached through " + settings.host +
+                       (reply.isSuccess() ? "" : ": " + reply.why()) + ".",
+                   "`ovradr farlink status`, here and over there, says more.");
+}
+
 } // namespace
 
 Expected<Conn> directEndpoint(const Conn &conn) {
     const Conn direct = Conn::translateFarlink(conn);
-    if (!direct.isValid()) {
-        return failure(ExitCode::kNotReachable,
-                       "The relay service does not know " + targetText(conn) + ".",
-                       "Check the alias, and that the relay service is set up here.");
-    }
-    return direct;
+    return direct.isValid() ? Expected<Conn>(direct) : relayFailure(conn);
 }
 
 Trouble probeEndpoint(const Conn &conn) {
@@ -50,7 +61,7 @@ Trouble probeEndpoint(const Conn &conn) {
 }
 
 std::string ownFingerprint(const Conn &conn) {
-    if (conn.protocol == "https") {
+    if (conn.protocol == "https" || conn.isFarlink()) { // the relay service only passes it on
         return certificateFingerprint(OvraPlatform::kTlsCertificateFile);
     }
     std::string why;

@@ -128,13 +128,6 @@ constexpr std::array kMeanings = {
             "The account of the session is not known", kPairAgain},
 };
 
-/// The names of what this program finds itself, in the order of the exit codes.
-constexpr std::array kExitNames = {
-    "ok",          "failed",    "usage",         "not_reachable", "login_refused", "one_time_code",
-    "certificate", "not_found", "not_permitted", "not_set_up",    "name_unknown",  "no_appliance",
-    "wrong_node",  "clock",
-};
-
 std::string detailText(int code, const Json::Value &detail) {
     if (code == ERR::kCredLibrary && detail.isInt()) {
         return OvraPlatform::credErrorText(detail.asInt());
@@ -180,11 +173,6 @@ void addDetail(Failure &found, const std::string &detail) {
 }
 
 } // namespace
-
-Failure failure(ExitCode exit, const std::string &message, const std::string &hint) {
-    const int number = static_cast<int>(exit);
-    return {exit, number, kExitNames.at(static_cast<std::size_t>(number)), message, hint};
-}
 
 Failure storeFailure(ExitCode exit, const std::string &sentences) {
     const std::size_t end = sentences.find(". ");

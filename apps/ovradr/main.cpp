@@ -62,6 +62,7 @@ void describe(CLI::App &app, bool &json, Command &chosen) {
     addWhyCommand(app, chosen);
     addDoctorCommand(app, chosen);
     addSpeedCommand(app, chosen);
+    addFarlinkCommands(app, chosen);
 }
 
 constexpr const char *kHelpHint =

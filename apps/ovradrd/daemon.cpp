@@ -4,6 +4,7 @@
 #include "cgi/session_store.h"
 #include "core/appliance.h"
 #include "credential/sealed_box.h"
+#include "farlink_agent.h"
 #include "gateway.h"
 #include "handlers/auth.h"
 #include "handlers/handlers.h"
@@ -67,6 +68,7 @@ struct Daemon::Impl {
     LoginDesk desk;
     OvraPlatform::APIRegistry registry;
     std::optional<Gateway> gateway;
+    std::optional<FarlinkAgent> farlink;
     // Their threads use everything above.
     std::optional<ReleaseRetries> retries;
     std::optional<Lanes> lanes;
@@ -87,7 +89,7 @@ void Daemon::Impl::addHandlers() {
     desk.addTo(registry);
     addEncryptionAPI(registry, *keys, guard);
     addUserAPI(registry);
-    addFarlinkAPI(registry);
+    addFarlinkAPI(registry, *farlink);
     addNodeAPI(registry);
     addSpeedAPI(registry);
     addNodeSessionAPI(registry);
@@ -146,6 +148,7 @@ Outcome Daemon::start(std::string &why) {
             return outcome;
         }
     }
+    self.farlink.emplace([&self](ConnectedClient client) { self.http->adopt(std::move(client)); });
     self.addHandlers();
     self.lanes.emplace();
     self.retries.emplace(self.lanes->slow);
@@ -160,9 +163,11 @@ Outcome Daemon::start(std::string &why) {
             self.gateway->serve(std::move(request), answer);
         },
         self.settings.limits);
-    return self.http->start(std::move(https), std::move(http), *self.identity, why)
-               ? Outcome::kOk
-               : Outcome::kFailed;
+    if (!self.http->start(std::move(https), std::move(http), *self.identity, why)) {
+        return Outcome::kFailed;
+    }
+    self.farlink->start();
+    return Outcome::kOk;
 }
 
 int Daemon::httpsPort() const {
@@ -183,9 +188,13 @@ bool Daemon::stop() {
     if (self.http) {
         self.http->quiesce();
     }
+    const auto deadline = std::chrono::steady_clock::now() + kGrace;
     bool ended = true;
+    if (self.farlink) {
+        // It may be waiting for callers for some time yet.
+        ended = self.farlink->stop(std::chrono::steady_clock::now());
+    }
     if (self.lanes) {
-        const auto deadline = std::chrono::steady_clock::now() + kGrace;
         for (Lane *lane : {&self.lanes->login, &self.lanes->slow, &self.lanes->quick}) {
             ended = lane->stop(deadline) && ended;
         }

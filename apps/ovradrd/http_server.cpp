@@ -302,7 +302,7 @@ MHD_Result HttpServer::Impl::begin(MHD_Connection *connection, bool secure, std:
 
     const std::uint64_t length = announcedLength(connection);
     const bool reads = method == MHD_HTTP_METHOD_GET || method == MHD_HTTP_METHOD_HEAD;
-    if (reads && url.starts_with(kTestFilesUrl)) {
+    if (reads && limits.files > 0 && url.starts_with(kTestFilesUrl)) {
         offerFile(*exchange, url);
     } else if (url != kEntryPoint) {
         exchange->refuse(MHD_HTTP_NOT_FOUND, APIError::kBadRequest,
@@ -526,6 +526,17 @@ bool HttpServer::start(std::vector<Listener> https, std::vector<Listener> http,
         }
     }
     return true;
+}
+
+void HttpServer::adopt(ConnectedClient client) {
+    for (const auto &door : impl_->doors) {
+        if (door->secure) {
+            // The library closes it, also when it does not take it.
+            MHD_add_connection(door->daemon.get(), client.fd.release(),
+                               reinterpret_cast<const sockaddr *>(&client.address), client.size);
+            return;
+        }
+    }
 }
 
 void HttpServer::quiesce() {

@@ -5,6 +5,8 @@
 #include "listener.h"
 #include "tls_identity.h"
 
+#include <sys/socket.h>
+
 #include <chrono>
 #include <cstddef>
 #include <functional>
@@ -19,7 +21,7 @@ struct HttpLimits {
     std::size_t body = std::size_t{1} * 1024 * 1024;
     /// Of all bodies together that have not been handed over yet.
     std::size_t bodies = std::size_t{64} * 1024 * 1024;
-    std::size_t files = 16; ///< test files that are sent at the same time
+    std::size_t files = 16; ///< test files sent at the same time; 0: none is served
 };
 
 /// A request to the entry point of the web API.
@@ -27,6 +29,13 @@ struct HttpRequest {
     std::string body;
     std::string address; ///< numeric address of the client
     bool secure = false; ///< came over TLS
+};
+
+/// A client whose connection came another way than through a listening socket.
+struct ConnectedClient {
+    OvraPlatform::UniqueFd fd;
+    sockaddr_storage address{};
+    socklen_t size = 0;
 };
 
 /// The HTTP side of the daemon: POST of a form to /webapi/query.cgi, answered with a JSON document,
@@ -54,6 +63,9 @@ public:
     /// \param why       takes one sentence when it cannot start
     bool start(std::vector<Listener> https, std::vector<Listener> http, const TlsIdentity &identity,
                std::string &why);
+    /// Serves a client that is connected already, as one of the https sockets. In any thread while
+    /// the server is started and not stopped.
+    void adopt(ConnectedClient client);
     /// Takes no further connections and refuses further requests; those under way go on.
     void quiesce();
     /// Ends every request still under way with a refusal, gives the replies half a second to leave,

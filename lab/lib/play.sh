@@ -33,8 +33,9 @@ logSays() { "$lab" log "$1" | grep -qF -- "$2" || fail "the log of node $1 does 
 
 password=correct-horse-battery
 account=replica
+# up: with as many nodes as $nodes says, two if it says nothing.
 up() {
-    "$lab" up 2 >/dev/null || fail "the lab does not come up"
+    "$lab" up "${nodes-2}" >/dev/null || fail "the lab does not come up"
     url=https://$("$lab" addr 2):5001
     on 1 0 sh -c "umask 077; printf %s '$password' >/usr/ovra/pw"
     on 2 0 sh -c "umask 077; printf %s '$password' >/usr/ovra/pw"

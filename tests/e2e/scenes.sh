@@ -279,6 +279,82 @@ leftBehind() {
     holds 2 0 0
 }
 
+# Node 2 is the relay, and node 3 an appliance that nobody can connect to.
+startRelay() {
+    "$lab" run 2 -- sh -c "farlinkd --address $("$lab" addr 2) $* >/usr/ovra/relay.out 2>&1 &
+        echo \$! >/usr/ovra/relay.pid"
+    for _ in $(seq 50); do
+        key=$("$lab" run 2 -- sed -n 's/.*key //p' /usr/ovra/relay.out)
+        [[ -z $key ]] || return 0
+        sleep 0.1
+    done
+    fail "farlinkd does not start"
+}
+killRelay() { on 2 0 sh -c 'kill -KILL "$(cat /usr/ovra/relay.pid)" && sleep 0.2'; }
+# soon COMMAND...: succeeds on node 1 within 20 seconds.
+soon() {
+    for _ in $(seq 40); do
+        ! output=$("$lab" run 1 -- "$@" 2>&1) || return 0
+        sleep 0.5
+    done
+    fail "not within 20 seconds: $*"
+}
+callsThroughTheRelay() {
+    local server begun thirdKey call
+    server=https://$("$lab" addr 2)
+    startRelay
+    if [[ $server != */127.* ]]; then # proot has no firewall
+        printf 'table ip hidden {\n chain in {\n type filter hook input priority 0\n iif != lo tcp %s\n}\n}\n' \
+            'flags & (syn | ack) == syn drop' | "$lab" run 3 -- nft -f -
+        on 1 3 ovradr conn test "https://$("$lab" addr 3):5001"
+    fi
+    on 3 0 sh -c "umask 077; printf %s '$password' >/usr/ovra/pw"
+    on 3 0 ovradr user add replica --admin --password-file /usr/ovra/pw
+    on 3 0 ovradr farlink enable --server "$server" --alias nas-3 --fingerprint "$key"
+    on 1 8 ovradr farlink enable --server "$server" --alias nas-3 --fingerprint "$key"
+    on 1 0 ovradr farlink enable --server "$server"
+    on 3 0 ovradr conn local
+    says "flk:nas-3"
+    thirdKey=$(sed -n 's/^https.*\(SHA256:[^ ]*\).*/\1/p' <<<"$output" | head -n 1)
+    soon ovradr conn test flk:nas-3
+    says "$thirdKey" # TLS ends at the appliance, not at the relay
+    url=flk:nas-3 key=$thirdKey
+    create 0
+    on 3 0 ovradr node id
+    remote=$output
+    info 0
+    says node-3
+
+    # A request that takes 20 seconds: it measures a server that says nothing.
+    "$lab" run 1 -- perl -MIO::Socket::INET -e '
+        my $door = IO::Socket::INET->new(Listen => 9, LocalAddr => $ARGV[0], LocalPort => 5998) or die;
+        print "ready\n"; STDOUT->flush; my @kept; while (my $one = $door->accept) { push @kept, $one }' "$("$lab" addr 1)" </dev/null >"$work/silent" &
+    disown
+    until grep -qs ready "$work/silent"; do sleep 0.1; done
+    begun=$SECONDS
+    "$lab" run 1 -- ovradr call "$remote" OVRA.DR.Node test_download_speed --param retries=0 \
+        --param timeout=20 --param "url=http://$("$lab" addr 1):5998/x" >"$work/call" 2>&1 </dev/null &
+    call=$!
+    sleep 2
+    kill -0 $call || fail "the request ends before the relay does: $(cat "$work/call")"
+    killRelay
+    ! wait $call || fail "a request succeeds without the relay"
+    ((SECONDS - begun < 10)) || fail "a request waits for a relay that is dead"
+    on 1 3 ovradr call "$remote" OVRA.DR.Node info
+    startRelay
+    soon ovradr call "$remote" OVRA.DR.Node info
+
+    # An alias whose owner does not come back is free again.
+    killRelay
+    startRelay --lease 4
+    soon ovradr conn test flk:nas-3
+    on 3 0 ovradr farlink disable
+    sleep 6
+    on 1 0 ovradr farlink enable --server "$server" --alias nas-3
+}
+
+# shellcheck disable=SC2034 # read by up
+[[ $1 != callsThroughTheRelay ]] || nodes=3
 up
 "$1"
 echo "scene $1 as it should be"

@@ -4,10 +4,12 @@
 #include "output.h"
 
 #include <ovradrcore/json.h>
+#include <ovradrnode/node_db.h>
 #include <ovradrnode/sender.h>
 
 #include <unistd.h>
 
+#include <algorithm>
 #include <fstream>
 #include <iostream>
 #include <memory>
@@ -150,6 +152,15 @@ Outcome report(const Answer &answer) {
                                         : failureOf(ERR::kFailed);
 }
 
+/// Whether a credential of the node goes through the relay service.
+bool isRelayed(const std::string &nodeId) {
+    std::vector<OvraDRNode::DRNode> creds;
+    OvraDRNode::DRNodeDB::ListCred(
+        nodeId, creds, OvraDRNode::DRNodeDB::CRED_TYPE_NODE | OvraDRNode::DRNodeDB::CRED_TYPE_TEMP);
+    return std::any_of(creds.begin(), creds.end(),
+                       [](const OvraDRNode::DRNode &cred) { return cred.conn.isFarlink(); });
+}
+
 Outcome call(const CallOptions &options) {
     const Expected<Json::Value> params = collectParameters(options);
     if (!params) {
@@ -169,7 +180,16 @@ Outcome call(const CallOptions &options) {
         return nodeId.failure();
     }
     const Expected<Answer> answer = send(*nodeId, options.credId, request);
-    return answer ? report(*answer) : answer.failure();
+    if (!answer) {
+        return answer.failure();
+    }
+    if (!answer->response.isValid() && answer->errCode == ERR::kBadParameter &&
+        isRelayed(*nodeId)) {
+        return failure(ExitCode::kNotReachable,
+                       "The relay service does not tell where the node is reached now.",
+                       "`ovradr farlink status`, here and over there, says more.");
+    }
+    return report(*answer);
 }
 
 } // namespace

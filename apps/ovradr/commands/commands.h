@@ -26,6 +26,7 @@ void addAttrCommands(CLI::App &app, Command &chosen);
 void addWhyCommand(CLI::App &app, Command &chosen);
 void addDoctorCommand(CLI::App &app, Command &chosen);
 void addSpeedCommand(CLI::App &app, Command &chosen);
+void addFarlinkCommands(CLI::App &app, Command &chosen);
 
 /// --password-file and --password-stdin; `source` has to live as long as `command`.
 void addPasswordOptions(CLI::App &command, PasswordSource &source);

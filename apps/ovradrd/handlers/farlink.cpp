@@ -1,4 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
+#include "credential/farlink.h"
+
 #include "handlers/handlers.h"
 #include "webapi/api_errors.h"
 
@@ -6,21 +8,37 @@ namespace Ovradrd {
 
 namespace {
 
-Json::Value getFarlink(const Json::Value & /*params*/, const OvraPlatform::APICaller &caller) {
+Json::Value getFarlink(const FarlinkAgent &agent, const OvraPlatform::APICaller &caller) {
     if (!caller.local) {
         return OvraPlatform::apiError(OvraPlatform::APIError::kNoPermission,
                                       "the relay service is asked about on the appliance itself");
     }
+    const OvraPlatform::FarlinkSettings settings = OvraPlatform::readFarlinkSettings();
     Json::Value data(Json::objectValue);
-    data["enabled"] = false;
+    data["enabled"] = !settings.host.empty() && !settings.alias.empty();
+    if (!data["enabled"].asBool()) {
+        return OvraPlatform::apiSuccess(data);
+    }
+    const FarlinkAgent::Status status = agent.status();
+    data["server_alias"] = settings.alias;
+    data["connected"] = status.connected;
+    if (status.connected) {
+        data["port"] = status.port;
+        data["expires"] = Json::Int64{status.expires};
+    } else if (!status.problem.empty()) {
+        data["problem"] = status.problem;
+    }
     return OvraPlatform::apiSuccess(data);
 }
 
 } // namespace
 
-void addFarlinkAPI(OvraPlatform::APIRegistry &registry) {
+void addFarlinkAPI(OvraPlatform::APIRegistry &registry, const FarlinkAgent &agent) {
     registry.add("OVRA.Core.Farlink", 1, "get", OvraPlatform::APIRight::kAdministrator,
-                 OvraPlatform::APILane::kQuick, getFarlink);
+                 OvraPlatform::APILane::kQuick,
+                 [&agent](const Json::Value & /*params*/, const OvraPlatform::APICaller &caller) {
+                     return getFarlink(agent, caller);
+                 });
 }
 
 } // namespace Ovradrd

@@ -2,6 +2,7 @@
 #pragma once
 
 #include "credential/sealed_box.h"
+#include "farlink_agent.h"
 #include "webapi/api_registry.h"
 
 /// What the daemon answers, one function a family of calls. docs/ovradrd.md lists parameters,
@@ -14,8 +15,9 @@ void addEncryptionAPI(OvraPlatform::APIRegistry &registry, const OvraPlatform::S
                       OvraPlatform::ReplayGuard &guard);
 /// "OVRA.Core.User": accounts of the appliance.
 void addUserAPI(OvraPlatform::APIRegistry &registry);
-/// "OVRA.Core.Farlink": the relay service, which a stand-alone appliance does not have.
-void addFarlinkAPI(OvraPlatform::APIRegistry &registry);
+/// "OVRA.Core.Farlink": how this appliance is reached through the relay service. \param agent  has
+/// to outlive the registry
+void addFarlinkAPI(OvraPlatform::APIRegistry &registry, const FarlinkAgent &agent);
 /// "OVRA.DR.Node": facts about this node, and tests.
 void addNodeAPI(OvraPlatform::APIRegistry &registry);
 /// "OVRA.DR.Node": how fast data moves to this node, and from it to others.

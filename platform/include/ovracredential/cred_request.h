@@ -44,8 +44,9 @@ public:
     CredRequest(const CredRequest &) = delete;
     CredRequest &operator=(const CredRequest &) = delete;
 
-    /// \param protocol  "http" or "https"
-    /// \param address   a host name in ASCII, an IPv4 or an IPv6 address
+    /// \param protocol  "http", "https", or "flk" for an alias of the relay service, which is asked
+    ///                  when the request is sent
+    /// \param address   a host name in ASCII, an IPv4 or an IPv6 address, or the alias
     /// \param path      relative to the root of the host: letters, digits and "-._/"
     int SetURL(const std::string &protocol, const std::string &address, int port,
                const std::string &path);

@@ -17,9 +17,11 @@ inline constexpr char kConfigFile[] = "/usr/ovra/etc/ovradr/ovradrd.conf";
 inline constexpr char kTlsKeyFile[] = "/usr/ovra/etc/ovradr/ovradrd.key";         ///< mode 0600
 inline constexpr char kTlsCertificateFile[] = "/usr/ovra/etc/ovradr/ovradrd.crt"; ///< mode 0644
 inline constexpr char kSealKeyFile[] = "/usr/ovra/etc/ovradr/ovradrd.seal";       ///< mode 0600
+inline constexpr char kFarlinkFile[] = "/usr/ovra/etc/ovradr/farlink.conf";
 
 /// What the platform writes while it runs. Mode 0700.
 inline constexpr char kStateDir[] = "/usr/ovra/var/ovradr";
+inline constexpr char kFarlinkKeyFile[] = "/usr/ovra/var/ovradr/farlink.key"; ///< mode 0600
 inline constexpr char kSocketFile[] = "/usr/ovra/var/ovradr/webapi.sock";
 inline constexpr char kAccountsFile[] = "/usr/ovra/var/ovradr/accounts.db";
 inline constexpr char kSessionsFile[] = "/usr/ovra/var/ovradr/sessions.db";

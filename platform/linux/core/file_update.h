@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
+#include "core/export.h"
 #include "core/unique_fd.h"
 
 #include <sys/types.h>
@@ -17,13 +18,13 @@ inline constexpr std::size_t kMaxTextFile = 1UL << 20U;
 /// Reads a small regular file whole.
 /// \return 0, or the errno that tells why not (EFBIG: larger than kMaxTextFile, EINVAL: not a
 ///         regular file); `text` is then unchanged.
-int readTextFile(const std::string &path, std::string &text);
+OVRAPLATFORM_EXPORT int readTextFile(const std::string &path, std::string &text);
 
 /// One read-modify-write of a small file, alone among all processes and threads that use this class
 /// for files of the same directory: the lock is flock(2) on the directory and goes with the
 /// process. Readers take no lock, they see the old file or the new one. A process that dies in
 /// between leaves at most PATH.new behind, which the next change overwrites.
-class FileUpdate {
+class OVRAPLATFORM_EXPORT FileUpdate {
 public:
     /// Takes the lock; waits at most 5 seconds for it. A symbolic link at `path` is followed.
     explicit FileUpdate(const std::string &path);
@@ -51,6 +52,6 @@ private:
 };
 
 /// The system's words for an errno.
-std::string errnoText(int error);
+OVRAPLATFORM_EXPORT std::string errnoText(int error);
 
 } // namespace OvraPlatform

@@ -122,12 +122,4 @@ int CredRequestUtil::Logout(OVRACred *cred, OVRACredSess *sess) {
     return confirmed ? 1 : 0;
 }
 
-int CredRequestFarlink::GetConnInfo(const std::string &alias, Json::Value &info, const void *) {
-    OVRA_NOTICE("The relay service is not set up on this appliance: [%s] cannot be looked up, use "
-                "a direct endpoint",
-                alias.c_str());
-    info = Json::Value();
-    return 0;
-}
-
 } // namespace OVRA

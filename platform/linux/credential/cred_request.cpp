@@ -26,12 +26,16 @@ constexpr int kModeRequest = 0;
 constexpr int kModeProbe = 2;
 constexpr int kPlain = 0;
 constexpr int kSealed = 2;
+constexpr char kRelayWord[] = "flk";
+constexpr int kHttps = 443; // until the alias is looked up
 
 } // namespace
 
 struct CredRequest::Impl {
     std::optional<Endpoint> endpoint;
     std::string url;
+    std::string path;
+    std::string alias; ///< to be looked up; then `endpoint` and `url` are of the last look-up
     std::optional<WireCall> call;
     long seconds = kDefaultSeconds;
     int encryptMode = kPlain;
@@ -76,7 +80,28 @@ struct CredRequest::Impl {
         return reply.error;
     }
 
+    bool setEndpoint(const std::string &protocol, const std::string &address, int port) {
+        auto made = Endpoint::make(protocol, address, port);
+        auto where = made ? made->url(path) : std::nullopt;
+        if (!where) {
+            return false;
+        }
+        endpoint = std::move(made);
+        url = std::move(*where);
+        return true;
+    }
+
+    bool findAlias() {
+        Json::Value info;
+        return CredRequestFarlink::GetConnInfo(alias, info, nullptr) != 0 &&
+               setEndpoint(info["protocol"].asString(), info["host"].asString(),
+                           info["port"].asInt());
+    }
+
     CredError process(bool reuse, int mode) {
+        if (!alias.empty() && !findAlias()) {
+            return CredError::kCannotConnect;
+        }
         switch (mode) {
         case kModeRequest:
             return send(reuse);
@@ -97,13 +122,12 @@ CredRequest::~CredRequest() = default;
 int CredRequest::SetURL(const std::string &protocol, const std::string &address, int port,
                         const std::string &path) {
     try {
-        auto endpoint = Endpoint::make(protocol, address, port);
-        auto url = endpoint ? endpoint->url(path) : std::nullopt;
-        if (!url) {
+        const bool relayed = protocol == kRelayWord;
+        impl_->path = path;
+        if (!impl_->setEndpoint(relayed ? "https" : protocol, address, relayed ? kHttps : port)) {
             return impl_->refuse(CredError::kBadArgument);
         }
-        impl_->endpoint = std::move(endpoint);
-        impl_->url = std::move(*url);
+        impl_->alias = relayed ? address : "";
         return 1;
     } catch (const std::exception &) {
         return impl_->refuse(CredError::kOutOfMemory);

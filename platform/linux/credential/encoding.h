@@ -1,6 +1,8 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
+#include "core/export.h"
+
 #include <sodium.h>
 
 #include <array>
@@ -47,12 +49,13 @@ private:
 };
 
 /// libsodium is ready; safe to ask from any thread, any number of times.
-bool sodiumReady();
+OVRAPLATFORM_EXPORT bool sodiumReady();
 
 /// Base64 with the alphabet that is safe in URLs, unpadded (RFC 4648, section 5).
-std::string toBase64Url(const unsigned char *data, std::size_t size);
+OVRAPLATFORM_EXPORT std::string toBase64Url(const unsigned char *data, std::size_t size);
 /// Nothing when the text is anything else.
-std::optional<std::vector<unsigned char>> fromBase64Url(const std::string &text);
+OVRAPLATFORM_EXPORT std::optional<std::vector<unsigned char>>
+fromBase64Url(const std::string &text);
 
 /// "SHA256:" and the unpadded base64 (RFC 4648, section 4) of the SHA-256 of the bytes, the form in
 /// which people know fingerprints from ssh-keygen(1).

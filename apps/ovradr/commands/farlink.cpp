@@ -1,0 +1,239 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "commands/commands.h"
+#include "output.h"
+#include "target.h"
+#include "trust.h"
+
+#include <ovradrcore/json.h>
+#include <ovradrcore/response.h>
+#include <ovradrnode/sender.h>
+
+#include <credential/farlink.h>
+#include <webapi/api_errors.h>
+
+#include <cctype>
+#include <memory>
+
+namespace Ovradr {
+
+namespace {
+
+using OvraDRCore::Response;
+using OvraDRNode::Conn;
+using OvraPlatform::CredError;
+using OvraPlatform::FarlinkClient;
+using OvraPlatform::FarlinkKey;
+using OvraPlatform::FarlinkReply;
+using OvraPlatform::FarlinkSettings;
+namespace APIError = OvraPlatform::APIError;
+
+struct FarlinkOptions {
+    std::string server;
+    std::string alias;
+    std::string fingerprint;
+    bool release = false;
+};
+
+std::string checkAlias(const std::string &text) {
+    return OvraPlatform::isFarlinkAlias(text)
+               ? ""
+               : "an alias has 3 to 63 lower-case letters, digits and inner hyphens";
+}
+
+Conn serverOf(const FarlinkSettings &settings) {
+    return Conn::https(settings.host, settings.port);
+}
+
+/// The service that a person means: https://HOST[:5443].
+Expected<FarlinkSettings> parseServer(const std::string &text) {
+    const std::size_t host = text.find("://");
+    const bool hasPort =
+        host != std::string::npos &&
+        text.find(':', text.find(']', host) != std::string::npos ? text.find(']', host)
+                                                                 : host + 3) != std::string::npos;
+    const Expected<Conn> conn =
+        parseTarget(hasPort ? text
+                            : (text.ends_with('/') ? text.substr(0, text.size() - 1) : text) + ":" +
+                                  std::to_string(OvraPlatform::kFarlinkPort));
+    if (!conn || conn->protocol != "https") {
+        return failure(ExitCode::kUsage, "\"" + text + "\" is no relay service.",
+                       "Write https://HOST or https://HOST:PORT.");
+    }
+    return FarlinkSettings{conn->addr, conn->port, ""};
+}
+
+Failure serviceFailure(const FarlinkSettings &settings, const FarlinkReply &reply) {
+    if (reply.error != CredError::kNone) {
+        return endpointFailure(serverOf(settings), reply.error);
+    }
+    // Behind the last colon it says what to do.
+    const std::string why = reply.why();
+    const std::size_t colon = why.rfind(": ");
+    const int code = reply.response.getErrCode();
+    Failure found =
+        failure(code == APIError::kNoPermission ? ExitCode::kNotPermitted : ExitCode::kFailed,
+                "The relay service refuses: " + why.substr(0, colon) + ".",
+                colon == std::string::npos ? "Its log says more." : why.substr(colon + 2) + ".");
+    found.code = code;
+    found.hint.front() = static_cast<char>(std::toupper(found.hint.front()));
+    return found;
+}
+
+Expected<FarlinkKey> ownKey() {
+    std::string why;
+    const auto key = FarlinkKey::loadOrCreate(why);
+    if (!key) {
+        return failure(ExitCode::kNotSetUp, "No key for the relay service: " + why + ".",
+                       "Run `ovradr setup` as root first.");
+    }
+    return *key;
+}
+
+/// What the daemon says about the relay service; invalid when no daemon runs.
+Response askDaemon() {
+    return OvraDRNode::BaseSender::run(
+        OvraDRCore::Request("OVRA.Core.Farlink", 1, "get", Json::Value(Json::objectValue)));
+}
+
+Failure notWritten() {
+    return failure(ExitCode::kNotSetUp,
+                   std::string(OvraPlatform::kFarlinkFile) + " cannot be written.",
+                   "Run the command as root, on a disk that is not full.");
+}
+
+Outcome enable(const FarlinkOptions &options) {
+    const Expected<FarlinkSettings> server = parseServer(options.server);
+    if (!server) {
+        return server.failure();
+    }
+    FarlinkSettings settings = *server;
+    settings.alias = options.alias;
+    if (const Trouble trouble = trustPeer(serverOf(settings), options.fingerprint)) {
+        return *trouble;
+    }
+    Report report;
+    report.data["server"] = targetText(serverOf(settings));
+    if (!settings.alias.empty()) {
+        // Whether it can be had is told now, and not in the log of the daemon.
+        const Expected<FarlinkKey> key = ownKey();
+        if (!key) {
+            return key.failure();
+        }
+        const FarlinkReply reply = FarlinkClient(settings).enrol(*key);
+        if (!reply.isSuccess()) {
+            return serviceFailure(settings, reply);
+        }
+        report.data["alias"] = settings.alias;
+        report.data["port"] = reply.response.getDataField("port");
+    }
+    if (!OvraPlatform::writeFarlinkSettings(settings)) {
+        return notWritten();
+    }
+    report.text = listing(
+        {{"server", report.data["server"].asString()},
+         {"alias", settings.alias.empty() ? "none: only others are looked up" : settings.alias},
+         {"callers at", settings.alias.empty() ? "" : "port " + report.data["port"].asString()}});
+    return report;
+}
+
+Outcome disable(const FarlinkOptions &options) {
+    const FarlinkSettings settings = OvraPlatform::readFarlinkSettings();
+    // First, so that the daemon does not come back.
+    if (!OvraPlatform::writeFarlinkSettings({})) {
+        return notWritten();
+    }
+    if (options.release && !settings.alias.empty()) {
+        const Expected<FarlinkKey> key = ownKey();
+        if (!key) {
+            return key.failure();
+        }
+        const FarlinkClient client(settings);
+        FarlinkReply reply = client.enrol(*key);
+        if (reply.isSuccess()) {
+            reply = client.release(reply.response.getDataFieldtoStr("token"));
+        }
+        if (!reply.isSuccess()) {
+            Failure found = serviceFailure(settings, reply);
+            found.message = "The relay service is off, but still keeps the alias \"" +
+                            settings.alias + "\": " + found.message;
+            return found;
+        }
+    }
+    Report report;
+    report.data["alias"] = settings.alias;
+    report.data["released"] = options.release && !settings.alias.empty();
+    report.text = report.data["released"].asBool()
+                      ? "The relay service is off, and the alias is free for others.\n"
+                      : "The relay service is off. An alias stays reserved for this appliance "
+                        "until it expires.\n";
+    return report;
+}
+
+Outcome status() {
+    const FarlinkSettings settings = OvraPlatform::readFarlinkSettings();
+    Report report;
+    report.data["server"] = settings.host.empty() ? "" : targetText(serverOf(settings));
+    report.data["alias"] = settings.alias;
+    if (settings.host.empty()) {
+        report.text = "No relay service is used; `ovradr farlink enable` sets one up.\n";
+        return report;
+    }
+    const Response daemon = askDaemon();
+    const bool connected =
+        OvraDRCore::memberString(daemon.getData(), "server_alias") == settings.alias &&
+        daemon.getDataField("connected").isBool() && daemon.getDataField("connected").asBool();
+    std::string state = "not needed: only others are looked up";
+    if (!settings.alias.empty()) {
+        report.data["connected"] = connected;
+        const std::string problem = OvraDRCore::memberString(daemon.getData(), "problem");
+        state = connected             ? "yes, callers at port " + daemon.getDataFieldtoStr("port")
+                : !daemon.isSuccess() ? "no: ovradrd does not run"
+                                      : "no: " + (problem.empty() ? "not yet" : problem);
+        report.data["problem"] = connected ? "" : state.substr(4);
+    }
+    std::string expires;
+    if (connected && daemon.getDataField("expires").isInt64()) {
+        report.data["port"] = daemon.getDataField("port");
+        report.data["expires"] = daemon.getDataField("expires");
+        expires = timeText(daemon.getDataField("expires").asInt64()) + ", unless renewed";
+    }
+    report.text = listing({{"server", report.data["server"].asString()},
+                           {"alias", settings.alias},
+                           {"connected", state},
+                           {"expires", expires}});
+    return report;
+}
+
+} // namespace
+
+void addFarlinkCommands(CLI::App &app, Command &chosen) {
+    CLI::App *family = app.add_subcommand(
+        "farlink", "The relay service, through which appliances without a way in are reached.");
+    family->require_subcommand(1);
+    const auto options = std::make_shared<FarlinkOptions>();
+    CLI::App *enableCommand =
+        family->add_subcommand("enable", "Use a relay service, and be reached there.");
+    enableCommand->add_option("--server", options->server, "https://HOST[:5443]")->required();
+    enableCommand
+        ->add_option("--alias", options->alias,
+                     "Name of this appliance there; without one it only reaches others")
+        ->check(checkAlias);
+    enableCommand
+        ->add_option("--fingerprint", options->fingerprint, "The key that the service must have")
+        ->check(checkFingerprint);
+    enableCommand->footer("Example:\n"
+                          "  ovradr farlink enable --server https://relay.example --alias nas1");
+    enableCommand->callback(
+        [&chosen, options] { chosen = [options] { return enable(*options); }; });
+    CLI::App *disableCommand = family->add_subcommand("disable", "Use no relay service any more.");
+    disableCommand->add_flag("--release", options->release, "Give the alias up, for anybody");
+    disableCommand->footer("Example:\n  ovradr farlink disable");
+    disableCommand->callback(
+        [&chosen, options] { chosen = [options] { return disable(*options); }; });
+    CLI::App *statusCommand = family->add_subcommand(
+        "status", "Show which service is used, and whether this appliance is reached there.");
+    statusCommand->footer("Example:\n  ovradr farlink status");
+    statusCommand->callback([&chosen] { chosen = status; });
+}
+
+} // namespace Ovradr

@@ -1,0 +1,241 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "farlink_agent.h"
+
+#include "credential/farlink.h"
+#include "webapi/api_errors.h"
+
+#include <ovradrcore/log.h>
+
+#include <fcntl.h>
+#include <netdb.h>
+
+#include <algorithm>
+#include <condition_variable>
+#include <cstring>
+#include <exception>
+#include <mutex>
+#include <optional>
+#include <thread>
+#include <utility>
+
+namespace Ovradrd {
+
+namespace {
+
+using OvraPlatform::FarlinkClient;
+using OvraPlatform::FarlinkKey;
+using OvraPlatform::FarlinkReply;
+using OvraPlatform::FarlinkSettings;
+using OvraPlatform::UniqueFd;
+
+/// Between two looks at the settings while there is no alias.
+constexpr std::chrono::seconds kLook{2};
+constexpr std::chrono::seconds kShortestPause{1};
+constexpr std::chrono::seconds kLongestPause{60};
+constexpr timeval kDialTime{5, 0};
+
+/// Connects to the tunnel port and says which caller is meant; without a descriptor when that
+/// fails.
+ConnectedClient dial(const std::string &host, int port, const std::string &caller) {
+    ConnectedClient call;
+    addrinfo hints{};
+    hints.ai_socktype = SOCK_STREAM;
+    addrinfo *list = nullptr;
+    if (getaddrinfo(host.c_str(), std::to_string(port).c_str(), &hints, &list) != 0) {
+        return call;
+    }
+    const std::unique_ptr<addrinfo, decltype(&freeaddrinfo)> owner(list, &freeaddrinfo);
+    const std::string line = "FARLINK1 " + caller + "\n";
+    for (const addrinfo *entry = list; entry != nullptr; entry = entry->ai_next) {
+        UniqueFd fd(socket(entry->ai_family, SOCK_STREAM | SOCK_CLOEXEC, 0));
+        // Bounds connect(2) as well, see socket(7).
+        setsockopt(fd.get(), SOL_SOCKET, SO_SNDTIMEO, &kDialTime, sizeof kDialTime);
+        if (fd && connect(fd.get(), entry->ai_addr, entry->ai_addrlen) == 0 &&
+            send(fd.get(), line.data(), line.size(), MSG_NOSIGNAL) ==
+                static_cast<ssize_t>(line.size()) &&
+            fcntl(fd.get(), F_SETFL, O_NONBLOCK) == 0) {
+            std::memcpy(&call.address, entry->ai_addr, entry->ai_addrlen);
+            call.size = entry->ai_addrlen;
+            call.fd = std::move(fd);
+            break;
+        }
+    }
+    return call;
+}
+
+} // namespace
+
+struct FarlinkAgent::State {
+    std::mutex mutex;
+    std::condition_variable changed;
+    bool stopping = false;
+    bool ended = true;
+    Status status;
+    std::function<void(ConnectedClient)> take; ///< empty once it stops
+
+    /// Waits; false when the agent is to stop.
+    bool pause(std::chrono::seconds time) {
+        std::unique_lock lock(mutex);
+        return !changed.wait_for(lock, time, [this] { return stopping; });
+    }
+    void tell(const Status &now) {
+        const std::lock_guard lock(mutex);
+        if (now.connected != status.connected || now.problem != status.problem) {
+            if (now.connected) {
+                OVRA_NOTICE("Connected to the relay service");
+            } else if (!now.problem.empty()) {
+                OVRA_WARN("Not connected to the relay service: %s", now.problem.c_str());
+            }
+        }
+        status = now;
+    }
+    void hand(ConnectedClient client) {
+        const std::lock_guard lock(mutex);
+        if (take && client.fd) {
+            take(std::move(client));
+        }
+    }
+};
+
+namespace {
+
+/// One stay at the relay service, under one alias.
+class Stay {
+public:
+    explicit Stay(FarlinkSettings settings)
+        : settings_(std::move(settings))
+        , client_(settings_) {}
+
+    bool isFor(const FarlinkSettings &settings) const { return settings_ == settings; }
+
+    /// Proves who we are. \return what is in the way, "" when nothing
+    std::string begin() {
+        std::string why;
+        const auto key = FarlinkKey::loadOrCreate(why);
+        if (!key) {
+            return why;
+        }
+        const FarlinkReply reply = client_.enrol(*key);
+        if (!reply.isSuccess()) {
+            return reply.why();
+        }
+        token_ = reply.response.getDataFieldtoStr("token");
+        const Json::Value port = reply.response.getDataField("port");
+        const Json::Value tunnel = reply.response.getDataField("tunnel_port");
+        const Json::Value expires = reply.response.getDataField("expires");
+        if (token_.empty() || !port.isInt() || !tunnel.isInt() || !expires.isInt64()) {
+            return "the relay service gave an answer that is none: check that the versions fit";
+        }
+        tunnelPort_ = tunnel.asInt();
+        renewAt_ = std::chrono::steady_clock::now() + std::chrono::hours(1);
+        status_.connected = true;
+        status_.port = port.asInt();
+        status_.expires = expires.asInt64();
+        return {};
+    }
+
+    const FarlinkAgent::Status &status() const { return status_; }
+    /// The lease of the alias has to be renewed now and then.
+    bool isOver() const { return std::chrono::steady_clock::now() >= renewAt_; }
+
+    /// Waits for callers and connects to each of them.
+    /// \param mayDial  asked before, because the settings may have changed while it waited
+    /// \return what is in the way, "" when nothing; `over` when it has to begin anew
+    template <typename Dialled, typename MayDial>
+    std::string serve(const MayDial &mayDial, const Dialled &dialled, bool &over) {
+        const FarlinkReply reply = client_.wait(token_);
+        over = reply.response.getErrCode() == OvraPlatform::APIError::kNoSession;
+        if (!reply.isSuccess()) {
+            return reply.why();
+        }
+        for (const Json::Value &caller : reply.response.getDataField("callers")) {
+            if (caller.isString() && mayDial()) {
+                dialled(dial(settings_.host, tunnelPort_, caller.asString()));
+            }
+        }
+        return {};
+    }
+
+private:
+    FarlinkSettings settings_;
+    FarlinkClient client_;
+    std::string token_;
+    int tunnelPort_ = 0;
+    std::chrono::steady_clock::time_point renewAt_;
+    FarlinkAgent::Status status_;
+};
+
+} // namespace
+
+void FarlinkAgent::run(const std::shared_ptr<State> &state) {
+    std::optional<Stay> stay;
+    std::chrono::seconds pause{0};
+    while (state->pause(pause)) {
+        const FarlinkSettings settings = OvraPlatform::readFarlinkSettings();
+        if (settings.host.empty() || settings.alias.empty()) {
+            stay.reset();
+            state->tell({});
+            pause = kLook;
+            continue;
+        }
+        std::string problem;
+        if (!stay || !stay->isFor(settings) || stay->isOver()) {
+            stay.emplace(settings);
+            problem = stay->begin();
+        }
+        bool over = false;
+        if (problem.empty()) {
+            state->tell(stay->status());
+            problem = stay->serve(
+                [&settings] { return OvraPlatform::readFarlinkSettings() == settings; },
+                [&state](ConnectedClient client) { state->hand(std::move(client)); }, over);
+        }
+        if (problem.empty()) {
+            pause = std::chrono::seconds(0);
+            continue;
+        }
+        // Where it was only forgotten, it comes back at once.
+        state->tell({false, 0, 0, problem});
+        stay.reset();
+        pause = over && pause.count() == 0 ? kShortestPause
+                                           : std::clamp(pause * 2, kShortestPause, kLongestPause);
+    }
+}
+
+FarlinkAgent::FarlinkAgent(std::function<void(ConnectedClient)> take)
+    : state_(std::make_shared<State>()) {
+    state_->take = std::move(take);
+}
+
+void FarlinkAgent::start() {
+    state_->ended = false;
+    std::thread([state = state_] {
+        try {
+            run(state);
+        } catch (const std::exception &error) {
+            OVRA_ERR("The way to the relay service broke off: [%s]", error.what());
+        }
+        const std::lock_guard lock(state->mutex);
+        state->ended = true;
+        state->changed.notify_all();
+    }).detach();
+}
+
+FarlinkAgent::~FarlinkAgent() {
+    stop(std::chrono::steady_clock::now());
+}
+
+FarlinkAgent::Status FarlinkAgent::status() const {
+    const std::lock_guard lock(state_->mutex);
+    return state_->status;
+}
+
+bool FarlinkAgent::stop(std::chrono::steady_clock::time_point deadline) {
+    std::unique_lock lock(state_->mutex);
+    state_->stopping = true;
+    state_->take = nullptr;
+    state_->changed.notify_all();
+    return state_->changed.wait_until(lock, deadline, [this] { return state_->ended; });
+}
+
+} // namespace Ovradrd

@@ -1,0 +1,46 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include "http_server.h"
+
+#include <chrono>
+#include <cstdint>
+#include <functional>
+#include <memory>
+#include <string>
+
+namespace Ovradrd {
+
+/// Keeps the appliance reachable under its alias, for as long as the settings name one: a thread of
+/// its own asks the relay service for callers, and connects to it once for each. A change of the
+/// settings takes effect by itself, within 20 seconds.
+class FarlinkAgent {
+public:
+    struct Status {
+        bool connected = false;
+        int port = 0; ///< where callers of the alias connect
+        std::int64_t expires = 0;
+        std::string problem; ///< why it is not connected; "" while it is
+    };
+
+    /// \param take  gets every caller, in the thread of the agent
+    explicit FarlinkAgent(std::function<void(ConnectedClient)> take);
+    FarlinkAgent(const FarlinkAgent &) = delete;
+    FarlinkAgent &operator=(const FarlinkAgent &) = delete;
+    /// The thread may end later: it then touches nothing but its own.
+    ~FarlinkAgent();
+
+    /// Begins.
+    void start();
+    Status status() const;
+    /// Takes no more callers. \return whether the thread ended by `deadline`, or never began
+    bool stop(std::chrono::steady_clock::time_point deadline);
+
+private:
+    struct State;
+    static void run(const std::shared_ptr<State> &state);
+
+    std::shared_ptr<State> state_;
+};
+
+} // namespace Ovradrd
