@@ -223,6 +223,8 @@ failuresSeenFromBothSides() {
     on 2 0 ovradr user add plain --password-file /usr/ovra/pw
     create 0 && cred=$(made)
     on 1 0 ovradr cred reverse "$cred" --account back
+    on 1 3 ovradr cred reverse "$cred" --account back --endpoint "https://$("$lab" addr 1):5999"
+    on 1 7 ovradr cred reverse "$cred" --account nobody
     account=plain create 1
     says "granted no session"
     holds 1 1 1
