@@ -1,10 +1,10 @@
 # SPDX-License-Identifier: Apache-2.0
 # shellcheck shell=bash
-# lab shape: makes a node's links slow, long or lossy, with the kernel's queues (tc) at both ends of
-# the link and the firewall of the switch.
-#   rate    both ways, by a token bucket
-#   delay   added to the round trip, on the way to the node
-#   loss    of the IPv4 packets in each direction
+# lab shape: makes a node's links slow, long or lossy.
+#   rate    both ways, by a token bucket (tc) at both ends of the link
+#   delay   added to the round trip: between node and switch a program of ours carries every frame
+#           and takes half of it each way. Not tc's netem, which kernels for containers leave out.
+#   loss    of the IPv4 packets in each direction, by the firewall of the switch
 
 labShape() {
     local action=shape rate="" delay="" loss="" off=no shaped=(0 1)
@@ -33,7 +33,7 @@ labShape() {
         shift
     done
     [[ $off == no || $action$rate$delay$loss == shape ]] || fail "--off stands alone"
-    [[ -z $delay ]] || needNetem
+    [[ -z $delay ]] || needTaps
     for link in "${shaped[@]}"; do
         shapeLink
     done
@@ -60,14 +60,11 @@ readShape() {
     esac
 }
 
-# needNetem: stops where the kernel has no queue that holds packets back for a time.
-needNetem() {
+# needTaps: stops where a program cannot carry frames.
+needTaps() {
     local why
-    if why=$( (enterLab tc qdisc add dev lo root netem delay 1ms) 2>&1); then
-        (enterLab tc qdisc del dev lo root)
-        return
-    fi
-    fail "this kernel has no netem, so packets cannot be delayed (${why%.}); leave --delay out, or use a kernel with sch_netem"
+    why=$( (enterLab perl "$labLib/delay.pl" --probe) 2>&1) ||
+        fail "packets cannot be delayed here: ${why%.}; a delay needs a kernel with tun and a /dev/net/tun that this user may open, so leave --delay out"
 }
 
 # shapeLink: gives one link of the node its shape, from scratch.
@@ -80,8 +77,7 @@ shapeLink() {
         return
     fi
     if [[ -n $delay ]]; then
-        (enterLab tc qdisc add dev "$port" root handle 1: netem delay "${delay}ms" limit 20000) ||
-            fail "the queue of eth$link of node-$node could not be set"
+        setDelay "$port"
         told+=" delay ${delay} ms"
     fi
     if [[ -n $rate ]]; then
@@ -103,14 +99,33 @@ shapeLink() {
 # setRate: both ways. The bucket holds what passes in 10 ms, because the kernel's clock may tick no
 # more than 100 times a second.
 setRate() {
-    local burst=$((rate / 8 / 100)) bucket place=(root)
+    local burst=$((rate / 8 / 100)) bucket
     ((burst >= 16384)) || burst=16384
-    [[ -z $delay ]] || place=(parent 1:1)
     bucket=(tbf rate "${rate}bit" burst "$burst" latency 50ms)
-    if ! (enterLab tc qdisc add dev "n${node}e$link" "${place[@]}" "${bucket[@]}") ||
+    if ! (enterLab tc qdisc add dev "n${node}e$link" root "${bucket[@]}") ||
         ! (enterNode "$node" tc qdisc add dev "eth$link" root "${bucket[@]}"); then
         fail "the rate of eth$link of node-$node could not be set"
     fi
+}
+
+# setDelay PORT: takes the port from the switch, and puts two taps with a program between them.
+setDelay() {
+    local carrier=$lab/n$node/carrier$link
+    rm -f "$carrier"
+    (enterLab perl "$labLib/delay.pl" "$1a" "$1b" "$delay" >"$carrier" 2>&1 </dev/null) &
+    disown
+    for _ in {1..100}; do
+        ! grep -sq . "$carrier" || break
+        sleep 0.05
+    done
+    [[ $(cat "$carrier") == ready ]] || fail "eth$link of node-$node cannot be delayed: $(cat "$carrier")"
+    (enterLab ip -batch - || fail "the delay of eth$link of node-$node could not be set") <<-END
+	link add $1d type bridge forward_delay 0 mcast_snooping 0
+	link set $1d up
+	link set $1a master sw$link up
+	link set $1b master $1d up
+	link set $1 master $1d
+	END
 }
 
 # dropSome PORT
@@ -128,6 +143,10 @@ dropSome() {
 
 # clearShape PORT
 clearShape() {
+    # Without its tap the program ends.
+    (enterLab ip link del "$1a") 2>/dev/null || true
+    (enterLab ip link del "$1d") 2>/dev/null || true
+    (enterLab ip link set "$1" master "sw$link")
     (enterLab tc qdisc del dev "$1" root) 2>/dev/null || true
     (enterNode "$node" tc qdisc del dev "eth$link" root) 2>/dev/null || true
     (enterLab nft delete table bridge "loss_$1") 2>/dev/null || true
