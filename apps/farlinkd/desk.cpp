@@ -244,6 +244,7 @@ Json::Value Desk::enrol(const Json::Value &params, const std::string &address) {
     data["tunnel_port"] = settings_.tunnelPort;
     data["token"] = agent.token;
     data["expires"] = Json::Int64{alias.expires};
+    data["lease"] = Json::Int64{alias.expires - std::time(nullptr)};
     return apiSuccess(data);
 }
 

@@ -33,6 +33,11 @@ constexpr std::chrono::seconds kLook{2};
 constexpr std::chrono::seconds kShortestPause{1};
 constexpr std::chrono::seconds kLongestPause{60};
 constexpr timeval kDialTime{5, 0};
+/// Between two enrolments.
+constexpr std::chrono::hours kLongestStay{1};
+/// Callers taken from one answer; a service that keeps to docs/wire.md never tells more at once.
+constexpr Json::ArrayIndex kMostCallers = 64;
+constexpr std::size_t kCallerSize = 32;
 
 /// Connects to the tunnel port and says which caller is meant; without a descriptor when that
 /// fails.
@@ -61,6 +66,13 @@ ConnectedClient dial(const std::string &host, int port, const std::string &calle
         }
     }
     return call;
+}
+
+/// Hexadecimal digits and nothing else: it becomes part of a line.
+bool isCaller(const Json::Value &value) {
+    const std::string text = value.isString() ? value.asString() : std::string();
+    return text.size() == kCallerSize &&
+           text.find_first_not_of("0123456789abcdef") == std::string::npos;
 }
 
 } // namespace
@@ -127,7 +139,10 @@ public:
             return "the relay service gave an answer that is none: check that the versions fit";
         }
         tunnelPort_ = tunnel.asInt();
-        renewAt_ = std::chrono::steady_clock::now() + std::chrono::hours(1);
+        const Json::Value lease = reply.response.getDataField("lease");
+        const std::chrono::seconds third(lease.isInt64() ? lease.asInt64() / 3 : 0);
+        renewAt_ = std::chrono::steady_clock::now() +
+                   std::clamp<std::chrono::seconds>(third, kShortestPause, kLongestStay);
         status_.connected = true;
         status_.port = port.asInt();
         status_.expires = expires.asInt64();
@@ -148,9 +163,11 @@ public:
         if (!reply.isSuccess()) {
             return reply.why();
         }
-        for (const Json::Value &caller : reply.response.getDataField("callers")) {
-            if (caller.isString() && mayDial()) {
-                dialled(dial(settings_.host, tunnelPort_, caller.asString()));
+        const Json::Value callers = reply.response.getDataField("callers");
+        for (Json::ArrayIndex i = 0;
+             callers.isArray() && i < std::min(callers.size(), kMostCallers); ++i) {
+            if (isCaller(callers[i]) && mayDial()) {
+                dialled(dial(settings_.host, tunnelPort_, callers[i].asString()));
             }
         }
         return {};

@@ -3,6 +3,8 @@
 # lab cut, lab drop, lab restore: done at the switch, so that a node sees what a real one would.
 #   cut    the cable is out: no carrier, and neighbours are no longer found
 #   drop   the carrier stays and every IPv4 packet vanishes: nobody is ever told
+# lab hide: a node that others cannot connect to and that can connect to them, as behind a router
+# that translates addresses.
 
 labLink() {
     local action=$1 port file element
@@ -23,4 +25,26 @@ labLink() {
     *) fail "eth$link of node-$node is $(<"$file"); restore it first" ;;
     esac
     echo "lab: eth$link of node-$node is $(<"$file")"
+}
+
+labHide() {
+    needLab
+    needNode "${1-}"
+    [[ $labWay != proot ]] ||
+        fail "hide needs a firewall of the node's own; with proot all nodes share this machine's"
+    (enterNode "$node" nft delete table ip hidden) 2>/dev/null || true
+    if [[ ${2-} == --off ]]; then
+        echo "lab: node-$node can be connected to"
+        return
+    fi
+    (($# == 1)) || fail "lab hide NODE [--off]"
+    (enterNode "$node" nft -f - || fail "node-$node could not be hidden") <<-'END'
+	table ip hidden {
+	    chain in {
+	        type filter hook input priority 0; policy accept;
+	        iif != lo tcp flags & (syn | ack) == syn drop
+	    }
+	}
+	END
+    echo "lab: node-$node cannot be connected to"
 }

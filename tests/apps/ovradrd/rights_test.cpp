@@ -28,6 +28,8 @@ constexpr char kSession[] = "OVRA.DR.Node.Session";
 constexpr char kUser[] = "OVRA.Core.User";
 constexpr char kCredential[] = "OVRA.DR.Node.Credential";
 constexpr char kOneEndpoint[] = R"({"conns":[{"addr":"127.0.0.1","protocol":"http","port":1}]})";
+constexpr char kFileUrl[] = R"({"url":"file:///etc/passwd","retries":0,"timeout":1})";
+constexpr char kAliasUrl[] = R"({"url":"flk://nas3:443/x","retries":0,"timeout":1})";
 
 const Scene kScenes[] = {
     {"OVRA.None", "get", "{}", 1, 102, 102, 102},
@@ -43,6 +45,10 @@ const Scene kScenes[] = {
     {kNode, "info", "{}", 1, 119, 0, 0},
     {kNode, "info", R"({"additional":"timezone"})", 1, 119, 106, 106},
     {kNode, "test_privilege", "{}", 1, 119, 105, 0},
+    {kNode, "test_download_speed", "{}", 1, 119, 105, 106},
+    {kNode, "test_download_speed", kFileUrl, 1, 119, 105, 106},
+    {kNode, "test_download_speed", kAliasUrl, 1, 119, 105, 106},
+    {kNode, "test_sync_speed", R"({"node_id":"n","retries":-1,"timeout":0})", 1, 119, 105, 106},
     {kNode, "test_connection", kOneEndpoint, 1, 119, 105, 500},
     {kNode, "test_connection", "{}", 1, 119, 105, 106},
     {kSession, "create", R"({"node_id":"n1"})", 1, 104, 104, 104},
