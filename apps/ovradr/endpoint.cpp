@@ -36,7 +36,8 @@ Failure whyNotReachable(const Conn &conn) {
 
 /// Asks the relay service once more, to learn why it named no endpoint.
 Failure relayFailure(const Conn &conn) {
-    const OvraPlatform::FarlinkSettings settings = OvraPlatform::readFarlinkSettings();
+    std::string problem;
+    const OvraPlatform::FarlinkSettings settings = OvraPlatform::readFarlinkSettings(problem);
     if (settings.host.empty()) {
         return failure(ExitCode::kNotReachable, "No relay service is set up on this appliance.",
                        "Run `ovradr farlink enable --server URL`.");

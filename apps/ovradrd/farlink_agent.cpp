@@ -188,14 +188,14 @@ void FarlinkAgent::run(const std::shared_ptr<State> &state) {
     std::optional<Stay> stay;
     std::chrono::seconds pause{0};
     while (state->pause(pause)) {
-        const FarlinkSettings settings = OvraPlatform::readFarlinkSettings();
+        std::string problem;
+        const FarlinkSettings settings = OvraPlatform::readFarlinkSettings(problem);
         if (settings.host.empty() || settings.alias.empty()) {
             stay.reset();
-            state->tell({});
+            state->tell({false, 0, 0, problem});
             pause = kLook;
             continue;
         }
-        std::string problem;
         if (!stay || !stay->isFor(settings) || stay->isOver()) {
             stay.emplace(settings);
             problem = stay->begin();
@@ -204,7 +204,10 @@ void FarlinkAgent::run(const std::shared_ptr<State> &state) {
         if (problem.empty()) {
             state->tell(stay->status());
             problem = stay->serve(
-                [&settings] { return OvraPlatform::readFarlinkSettings() == settings; },
+                [&settings] {
+                    std::string ignored;
+                    return OvraPlatform::readFarlinkSettings(ignored) == settings;
+                },
                 [&state](ConnectedClient client) { state->hand(std::move(client)); }, over);
         }
         if (problem.empty()) {
@@ -219,6 +222,17 @@ void FarlinkAgent::run(const std::shared_ptr<State> &state) {
     }
 }
 
+void FarlinkAgent::runToTheEnd(const std::shared_ptr<State> &state) {
+    try {
+        run(state);
+    } catch (const std::exception &error) {
+        OVRA_ERR("The way to the relay service broke off: [%s]", error.what());
+    }
+    const std::lock_guard lock(state->mutex);
+    state->ended = true;
+    state->changed.notify_all();
+}
+
 FarlinkAgent::FarlinkAgent(std::function<void(ConnectedClient)> take)
     : state_(std::make_shared<State>()) {
     state_->take = std::move(take);
@@ -226,16 +240,7 @@ FarlinkAgent::FarlinkAgent(std::function<void(ConnectedClient)> take)
 
 void FarlinkAgent::start() {
     state_->ended = false;
-    std::thread([state = state_] {
-        try {
-            run(state);
-        } catch (const std::exception &error) {
-            OVRA_ERR("The way to the relay service broke off: [%s]", error.what());
-        }
-        const std::lock_guard lock(state->mutex);
-        state->ended = true;
-        state->changed.notify_all();
-    }).detach();
+    std::thread([state = state_] { runToTheEnd(state); }).detach();
 }
 
 FarlinkAgent::~FarlinkAgent() {

@@ -39,6 +39,7 @@ public:
 private:
     struct State;
     static void run(const std::shared_ptr<State> &state);
+    static void runToTheEnd(const std::shared_ptr<State> &state);
 
     std::shared_ptr<State> state_;
 };

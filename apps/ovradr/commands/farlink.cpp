@@ -137,7 +137,8 @@ Outcome enable(const FarlinkOptions &options) {
 }
 
 Outcome disable(const FarlinkOptions &options) {
-    const FarlinkSettings settings = OvraPlatform::readFarlinkSettings();
+    std::string ignored;
+    const FarlinkSettings settings = OvraPlatform::readFarlinkSettings(ignored);
     // First, so that the daemon does not come back.
     if (!OvraPlatform::writeFarlinkSettings({})) {
         return notWritten();
@@ -170,7 +171,12 @@ Outcome disable(const FarlinkOptions &options) {
 }
 
 Outcome status() {
-    const FarlinkSettings settings = OvraPlatform::readFarlinkSettings();
+    std::string problem;
+    const FarlinkSettings settings = OvraPlatform::readFarlinkSettings(problem);
+    if (!problem.empty()) {
+        return failure(ExitCode::kNotSetUp, problem.substr(0, problem.rfind(": ")) + ".",
+                       "Run `ovradr farlink enable` again.");
+    }
     Report report;
     report.data["server"] = settings.host.empty() ? "" : targetText(serverOf(settings));
     report.data["alias"] = settings.alias;
@@ -185,7 +191,7 @@ Outcome status() {
     std::string state = "not needed: only others are looked up";
     if (!settings.alias.empty()) {
         report.data["connected"] = connected;
-        const std::string problem = OvraDRCore::memberString(daemon.getData(), "problem");
+        problem = OvraDRCore::memberString(daemon.getData(), "problem");
         state = connected             ? "yes, callers at port " + daemon.getDataFieldtoStr("port")
                 : !daemon.isSuccess() ? "no: ovradrd does not run"
                                       : "no: " + (problem.empty() ? "not yet" : problem);

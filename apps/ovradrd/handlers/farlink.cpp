@@ -13,7 +13,8 @@ Json::Value getFarlink(const FarlinkAgent &agent, const OvraPlatform::APICaller 
         return OvraPlatform::apiError(OvraPlatform::APIError::kNoPermission,
                                       "the relay service is asked about on the appliance itself");
     }
-    const OvraPlatform::FarlinkSettings settings = OvraPlatform::readFarlinkSettings();
+    std::string problem;
+    const OvraPlatform::FarlinkSettings settings = OvraPlatform::readFarlinkSettings(problem);
     Json::Value data(Json::objectValue);
     data["enabled"] = !settings.host.empty() && !settings.alias.empty();
     if (!data["enabled"].asBool()) {

@@ -43,7 +43,8 @@ bool isFarlinkAlias(const std::string &text) {
            });
 }
 
-FarlinkSettings readFarlinkSettings() {
+FarlinkSettings readFarlinkSettings(std::string &problem) {
+    problem.clear();
     FarlinkSettings settings;
     settings.host = setting("host");
     settings.alias = setting("alias");
@@ -55,8 +56,8 @@ FarlinkSettings readFarlinkSettings() {
         (settings.host.empty() || Endpoint::make("https", settings.host, settings.port)) &&
         (settings.alias.empty() || isFarlinkAlias(settings.alias));
     if (!usable) {
-        OVRA_ERR("[%s] names no relay service that could be used: run `ovradr farlink enable`",
-                 kFarlinkFile);
+        problem = std::string(kFarlinkFile) +
+                  " names no relay service that could be used: run ovradr farlink enable";
         return {};
     }
     return settings;
@@ -141,11 +142,13 @@ namespace OVRA {
 int CredRequestFarlink::GetConnInfo(const std::string &alias, Json::Value &info, const void *) {
     info = Json::Value();
     try {
-        const OvraPlatform::FarlinkSettings settings = OvraPlatform::readFarlinkSettings();
+        std::string problem;
+        const OvraPlatform::FarlinkSettings settings = OvraPlatform::readFarlinkSettings(problem);
         if (settings.host.empty()) {
-            OVRA_NOTICE("No relay service is set up on this appliance: [%s] cannot be looked up; "
-                        "run `ovradr farlink enable`, or use a direct endpoint",
-                        alias.c_str());
+            OVRA_NOTICE("[%s] cannot be looked up: %s", alias.c_str(),
+                        problem.empty() ? "no relay service is set up on this appliance; run "
+                                          "ovradr farlink enable, or use a direct endpoint"
+                                        : problem.c_str());
             return 0;
         }
         std::string name = alias;

@@ -34,8 +34,9 @@ struct FarlinkSettings {
 };
 
 /// The lines host="...", port="..." and alias="..." of kFarlinkFile. A file that is missing or
-/// cannot be used is an appliance without relay service; the latter is one ERR line.
-OVRAPLATFORM_EXPORT FarlinkSettings readFarlinkSettings();
+/// cannot be used is an appliance without relay service.
+/// \param problem  takes one sentence when the file cannot be used, otherwise ""
+OVRAPLATFORM_EXPORT FarlinkSettings readFarlinkSettings(std::string &problem);
 /// \return false when the file cannot be written.
 OVRAPLATFORM_EXPORT bool writeFarlinkSettings(const FarlinkSettings &settings);
 
