@@ -4,6 +4,8 @@
 # node 1 pairs with node 2, whose administrator is "replica". What is run is said and judged here.
 
 lab=$(dirname "$(readlink -f "${BASH_SOURCE[0]}")")/../lab
+# shellcheck source=lab/lib/ports.sh
+. "${lab%/lab}/lib/ports.sh"
 work=$(mktemp -d /tmp/ove.XXXXXX)
 export OVRADR_LAB_DIR=$work/lab
 finish() {
@@ -35,6 +37,9 @@ password=correct-horse-battery
 account=replica
 # up: with as many nodes as $nodes says, two if it says nothing.
 up() {
+    local way
+    way=$("$lab" way)
+    takePorts "${way%%:*}"
     "$lab" up "${nodes-2}" >/dev/null || fail "the lab does not come up"
     url=https://$("$lab" addr 2):5001
     on 1 0 sh -c "umask 077; printf %s '$password' >/usr/ovra/pw"

@@ -5,6 +5,8 @@
 set -euo pipefail
 # shellcheck source=tests/lab/expect.sh
 . "$(dirname "$0")/expect.sh"
+# shellcheck source=lab/lib/ports.sh
+. "$root/lab/lib/ports.sh"
 scene=$1 way=$2
 export OVRADR_LAB_WAY=$way OVRADR_LAB_DIR=$scratch/lab
 # A word by which processes of this scene are known from outside.
@@ -269,4 +271,5 @@ killedKeeperIsCleared() {
 }
 
 lab way >/dev/null 2>&1 || skip "this machine does not allow the way $way"
+takePorts "$way"
 "$scene"
