@@ -364,8 +364,9 @@ int HttpConnection::onRequest(void *self, char *, char *, int, int) {
     attempt.mayHaveArrived = true;
     attempt.socket = connection->sockets_.size() == 1 ? connection->sockets_.front() : -1;
     attempt.delivered = deliveredBytes(attempt.socket);
-    if (attempt.socket >= 0) {
+    if (attempt.socket >= 0 && !connection->endsWhenSilent_) {
         endWhenSilent(attempt.socket);
+        connection->endsWhenSilent_ = true;
     }
     return CURL_PREREQFUNC_OK;
 }
@@ -381,6 +382,7 @@ curl_socket_t HttpConnection::onOpenSocket(void *self, curlsocktype, curl_sockad
         return CURL_SOCKET_BAD;
     }
     connection->sockets_.push_back(fd);
+    connection->endsWhenSilent_ = false;
     return fd;
 }
 

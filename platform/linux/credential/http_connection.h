@@ -101,6 +101,7 @@ private:
     Attempt attempt_;
     std::vector<int> sockets_; ///< more than one only while several addresses are tried
     bool replyTooLarge_ = false;
+    bool endsWhenSilent_ = false; ///< the present socket has been told to
     // Last, so that it goes first: closing a connection calls back.
     std::unique_ptr<CURL, FreeHandle> handle_;
 };
