@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "measure.h"
-#include "ovradrcore/cache.h"
+
+#include <ovradrcore/cache.h>
 
 #include <fcntl.h>
 #include <sys/file.h>

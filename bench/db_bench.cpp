@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "measure.h"
-#include "ovradrnode/node_db.h"
+
+#include <ovradrnode/node_db.h>
 
 #include <sqlite3.h>
 

@@ -1,9 +1,10 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "measure.h"
-#include "ovradrnode/node_api.h"
-#include "ovradrnode/node_db.h"
-#include "ovradrnode/node_session.h"
-#include "ovradrnode/sender.h"
+
+#include <ovradrnode/node_api.h>
+#include <ovradrnode/node_db.h>
+#include <ovradrnode/node_session.h>
+#include <ovradrnode/sender.h>
 
 #include <curl/curl.h>
 

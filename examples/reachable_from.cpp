@@ -28,8 +28,8 @@ public:
 
     /// Asked first, also when the node is another one: nothing is sent that it would refuse.
     bool IsValidParam() override {
-        constexpr std::size_t kMost = 32;
-        return !conns_.empty() && conns_.size() <= kMost &&
+        constexpr std::size_t kMaxConns = 32;
+        return !conns_.empty() && conns_.size() <= kMaxConns &&
                std::all_of(conns_.begin(), conns_.end(),
                            [](const Conn &conn) { return conn.isValid(); });
     }

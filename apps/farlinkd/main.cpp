@@ -2,40 +2,46 @@
 
 // farlinkd: the relay service, by which appliances without a way in are reached under an alias.
 
-#include "alias_book.h"
-#include "desk.h"
-#include "http_server.h"
-#include "listener.h"
-#include "provision/server_certificate.h"
-#include "switchboard.h"
-#include "tls_identity.h"
+#include "alias_registry.h"
+#include "relay_api.h"
+#include "service/certificate.h"
+#include "service/exit_code.h"
+#include "service/http_server.h"
+#include "service/listener.h"
+#include "service/tls_identity.h"
+#include "tunnel_server.h"
 
+#include <ovrabase/number.h>
 #include <ovracore/ovracore.h>
 #include <ovradrcore/log.h>
+#include <ovraplatform/appliance.h>
+#include <ovraplatform/farlink.h>
 
 #include <CLI/CLI.hpp>
-#include <core/appliance.h>
-#include <credential/farlink.h>
 #include <sys/resource.h>
 #include <syslog.h>
 
 #include <array>
+#include <cerrno>
 #include <csignal>
 #include <cstdio>
 #include <exception>
-#include <optional>
 #include <string>
 
 namespace Farlinkd {
 
 namespace {
 
-constexpr rlim_t kDescriptors = 16384;
-constexpr int kHighestPort = 65535;
-constexpr int kMostAliases = 4000; // what fits into the file of aliases, with room to spare
-constexpr timespec kTick{1, 0};
+using OvraBase::Expected;
+using OvraService::ExitCode;
+using OvraService::HttpServer;
+using OvraService::Listener;
+using OvraService::StartError;
+using OvraService::TlsIdentity;
 
-enum class Outcome : int { kOk = 0, kFailed = 1, kUsage = 2, kPortInUse = 3 };
+constexpr rlim_t kDescriptors = 16384;
+constexpr int kMaxAliases = 4000; // what fits into the file of aliases, with room to spare
+constexpr timespec kTick{1, 0};
 
 struct Options {
     std::string address;
@@ -54,10 +60,10 @@ constexpr char kFooter[] =
     "key and certificate at the first start. Everything else goes to the system log.\n\n"
     "Exit codes: 0 ended by a signal, 1 failed, 2 wrong usage, 3 a port is in use.";
 
-Outcome fail(Outcome outcome, const std::string &why) {
-    OVRA_ERR("farlinkd does not start: %s", why.c_str());
-    std::fprintf(stderr, "farlinkd: %s\n", why.c_str());
-    return outcome;
+int fail(const StartError &why) {
+    OVRA_ERR("farlinkd does not start: %s", why.text.c_str());
+    std::fprintf(stderr, "farlinkd: %s\n", why.text.c_str());
+    return static_cast<int>(why.exit);
 }
 
 void raiseDescriptorLimit() {
@@ -76,35 +82,31 @@ std::string ownName() {
 }
 
 /// The key and certificate of the service, made when there are none.
-/// \param why  takes one sentence when nothing is returned
-std::optional<Ovradrd::TlsIdentity> identityIn(const Options &options, std::string &fingerprint,
-                                               std::string &why) {
+Expected<TlsIdentity> identityIn(const Options &options, std::string &fingerprint) {
     const std::string key = options.state + "/farlinkd.key";
     const std::string certificate = options.state + "/farlinkd.crt";
     if (!OvraPlatform::ensureStateDir(options.state)) {
-        why = options.state + " cannot be made or is not this user's alone: name another folder "
-                              "with --state";
-        return std::nullopt;
+        return OvraBase::Unexpected({options.state + " cannot be made or is not this user's alone: "
+                                                     "name another folder with --state"});
     }
-    const Ovradr::ServerNames names{options.host.empty() ? ownName() : options.host, {}};
-    for (const auto &step :
-         {Ovradr::provisionTlsKey(key), Ovradr::provisionCertificate(certificate, key, names)}) {
-        if (!step) {
-            why = step.failure().message;
-            return std::nullopt;
+    const OvraService::ServerNames names{options.host.empty() ? ownName() : options.host, {}};
+    for (const auto &made : {OvraService::createTlsKey(key),
+                             OvraService::createCertificate(certificate, key, names)}) {
+        if (!made) {
+            return OvraBase::Unexpected(made.error());
         }
     }
-    fingerprint = Ovradr::certificateFingerprint(certificate);
-    return Ovradrd::TlsIdentity::load(key, certificate, why);
+    fingerprint = OvraService::certificateFingerprint(certificate);
+    return TlsIdentity::load(key, certificate);
 }
 
-void waitForEnd(const sigset_t &signals, Desk &desk) {
+void waitForEnd(const sigset_t &signals, RelayApi &api) {
     while (sigtimedwait(&signals, nullptr, &kTick) < 0) {
-        desk.tick();
+        api.endOverdue();
     }
 }
 
-Outcome serve(const Options &options) {
+int serve(const Options &options) {
     std::signal(SIGPIPE, SIG_IGN);
     sigset_t signals;
     sigemptyset(&signals);
@@ -114,46 +116,49 @@ Outcome serve(const Options &options) {
     pthread_sigmask(SIG_BLOCK, &signals, nullptr);
     raiseDescriptorLimit();
 
-    std::string why;
     std::string fingerprint;
-    const auto identity = identityIn(options, fingerprint, why);
-    AliasBook book(options.state + "/aliases", {options.firstPort, options.lastPort,
-                                                std::chrono::seconds(options.leaseSeconds)});
-    if (!identity || !book.load(why)) {
-        return fail(Outcome::kFailed, why);
+    const auto identity = identityIn(options, fingerprint);
+    if (!identity) {
+        return fail(identity.error());
     }
-    std::vector<Ovradrd::Listener> https;
-    https.push_back(Ovradrd::Listener::listen(options.address, options.port));
-    Ovradrd::Listener tunnel = Ovradrd::Listener::listen(options.address, options.tunnelPort);
-    for (const Ovradrd::Listener *listener : {&https.front(), &tunnel}) {
-        if (listener->problem != Ovradrd::Listener::Problem::kNone) {
-            return fail(listener->problem == Ovradrd::Listener::Problem::kPortInUse
-                            ? Outcome::kPortInUse
-                            : Outcome::kFailed,
-                        listener->why);
+    AliasRegistry aliases(options.state + "/aliases", {options.firstPort, options.lastPort,
+                                                       std::chrono::seconds(options.leaseSeconds)});
+    if (const auto loaded = aliases.load(); !loaded) {
+        return fail(loaded.error());
+    }
+    auto https = Listener::listen(options.address, options.port);
+    auto tunnel = Listener::listen(options.address, options.tunnelPort);
+    for (const auto *listener : {&https, &tunnel}) {
+        if (!*listener) {
+            const OvraBase::Error &why = listener->error();
+            return fail(
+                {why.number == EADDRINUSE ? ExitCode::kPortInUse : ExitCode::kFailed, why.text});
         }
     }
-    const int port = https.front().port;
-    const int tunnelPort = tunnel.port;
+    const int port = https->port;
+    const int tunnelPort = tunnel->port;
 
-    Desk desk(std::move(book), {options.address, options.host, tunnelPort});
-    Switchboard switchboard([&desk](const std::string &alias,
-                                    const std::string &caller) { return desk.ring(alias, caller); },
-                            {});
-    Ovradrd::HttpLimits limits;
+    RelayApi api(std::move(aliases), {options.address, options.host, tunnelPort});
+    TunnelServer tunnelServer(
+        [&api](const std::string &alias, const std::string &caller) {
+            return api.announce(alias, caller);
+        },
+        {});
+    OvraService::HttpLimits limits;
     limits.connections.total = 4096;
-    limits.files = 0;
-    Ovradrd::HttpServer http(
-        [&desk](Ovradrd::HttpRequest request, const Ovradrd::HttpServer::Answer &answer) {
-            desk.serve(std::move(request), answer);
+    HttpServer http(
+        [&api](OvraService::HttpRequest request, const HttpServer::Answer &answer) {
+            api.serve(std::move(request), answer);
         },
         limits);
-    if (!switchboard.start(std::move(tunnel), why)) {
-        return fail(Outcome::kFailed, why);
+    if (const auto started = tunnelServer.start(std::move(*tunnel)); !started) {
+        return fail(started.error());
     }
-    desk.connect(switchboard);
-    if (!http.start(std::move(https), {}, *identity, why)) {
-        return fail(Outcome::kFailed, why);
+    api.connect(tunnelServer);
+    std::vector<Listener> listeners;
+    listeners.push_back(std::move(*https));
+    if (const auto started = http.start(std::move(listeners), {}, *identity); !started) {
+        return fail(started.error());
     }
     OVRA_NOTICE("Serves at port [%d], for appliances at port [%d], for callers at ports [%d-%d]",
                 port, tunnelPort, options.firstPort, options.lastPort);
@@ -161,12 +166,12 @@ Outcome serve(const Options &options) {
                 tunnelPort, options.firstPort, options.lastPort, fingerprint.c_str());
     std::fflush(stdout);
 
-    waitForEnd(signals, desk);
+    waitForEnd(signals, api);
     OVRA_NOTICE("Stops");
     http.quiesce();
-    desk.stop();
+    api.stop();
     http.stop();
-    return Outcome::kOk;
+    return static_cast<int>(ExitCode::kOk);
 }
 
 int run(int argc, char **argv) {
@@ -179,14 +184,14 @@ int run(int argc, char **argv) {
     app.add_option("--host", options.host,
                    "Name or address that callers are told (the one they know the service by)");
     app.add_option("--port", options.port, "Port of the service (5443)")
-        ->check(CLI::Range(0, kHighestPort));
+        ->check(CLI::Range(0, OvraBase::kMaxPort));
     app.add_option("--tunnel-port", options.tunnelPort, "Port for the appliances (5444)")
-        ->check(CLI::Range(0, kHighestPort));
+        ->check(CLI::Range(0, OvraBase::kMaxPort));
     app.add_option("--first-port", options.firstPort,
                    "First port for callers, one an alias (20000)")
-        ->check(CLI::Range(1, kHighestPort));
+        ->check(CLI::Range(1, OvraBase::kMaxPort));
     app.add_option("--last-port", options.lastPort, "Last one (20999)")
-        ->check(CLI::Range(1, kHighestPort));
+        ->check(CLI::Range(1, OvraBase::kMaxPort));
     app.add_option("--lease", options.leaseSeconds,
                    "Seconds for which an alias stays its owner's when that is gone (30 days)")
         ->check(CLI::PositiveNumber);
@@ -194,15 +199,14 @@ int run(int argc, char **argv) {
     try {
         app.parse(argc, argv);
     } catch (const CLI::ParseError &error) {
-        return app.exit(error) == 0 ? 0 : static_cast<int>(Outcome::kUsage);
+        return app.exit(error) == 0 ? 0 : static_cast<int>(ExitCode::kUsage);
     }
     const int aliases = options.lastPort - options.firstPort + 1;
-    if (aliases < 1 || aliases > kMostAliases) {
-        return static_cast<int>(fail(Outcome::kUsage,
-                                     "there have to be 1 to 4000 ports for callers: correct "
-                                     "--first-port and --last-port"));
+    if (aliases < 1 || aliases > kMaxAliases) {
+        return fail({ExitCode::kUsage, "there have to be 1 to 4000 ports for callers: correct "
+                                       "--first-port and --last-port"});
     }
-    return static_cast<int>(serve(options));
+    return serve(options);
 }
 
 } // namespace
@@ -214,6 +218,6 @@ int main(int argc, char **argv) {
     try {
         return Farlinkd::run(argc, argv);
     } catch (const std::exception &error) {
-        return static_cast<int>(Farlinkd::fail(Farlinkd::Outcome::kFailed, error.what()));
+        return Farlinkd::fail({OvraService::ExitCode::kFailed, error.what()});
     }
 }

@@ -1,16 +1,15 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "endpoint.h"
 
-#include "provision/server_certificate.h"
+#include "service/certificate.h"
 #include "target.h"
 #include "trust.h"
 
 #include <ovracredential/cred_request.h>
 #include <ovradrnode/sender.h>
-
-#include <core/appliance.h>
-#include <credential/farlink.h>
-#include <credential/sealed_box.h>
+#include <ovraplatform/appliance.h>
+#include <ovraplatform/farlink.h>
+#include <ovraplatform/sealed_box.h>
 
 namespace Ovradr {
 
@@ -63,12 +62,12 @@ Trouble probeEndpoint(const Conn &conn) {
 
 std::string ownFingerprint(const Conn &conn) {
     if (conn.protocol == "https" || conn.isFarlink()) { // the relay service only passes it on
-        return certificateFingerprint(OvraPlatform::kTlsCertificateFile);
+        return OvraService::certificateFingerprint(OvraPlatform::kTlsCertificateFile);
     }
-    std::string why;
-    const auto keys = conn.protocol == "http"
-                          ? OvraPlatform::SealKeyPair::load(OvraPlatform::kSealKeyFile, why)
-                          : std::nullopt;
+    if (conn.protocol != "http") {
+        return "";
+    }
+    const auto keys = OvraPlatform::SealKeyPair::load(OvraPlatform::kSealKeyFile);
     return keys ? OvraPlatform::fingerprintOf(keys->publicKey()) : "";
 }
 

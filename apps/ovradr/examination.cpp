@@ -13,8 +13,7 @@
 #include <ovradrcore/json.h>
 #include <ovradrnode/node_api.h>
 #include <ovradrnode/sender.h>
-
-#include <webapi/api_errors.h>
+#include <ovraplatform/api_errors.h>
 
 #include <array>
 #include <chrono>
@@ -35,7 +34,7 @@ using OvraPlatform::TrustVerdict;
 namespace WebAPI = OvraDRNode::WebAPI;
 
 /// One-time codes are accepted one step of 30 seconds early or late.
-constexpr double kMostClockSeconds = 30;
+constexpr double kMaxClockSeconds = 30;
 constexpr long kClockTimeout = 10; // seconds
 
 const char *stateText(Examination::Step::State state) {
@@ -272,7 +271,7 @@ private:
     Expected<std::string> judgeClock(double ahead) const {
         const std::string text =
             decimal(std::abs(ahead)) + " s " + (ahead < 0 ? "behind" : "ahead of") + " this one";
-        if (std::abs(ahead) > kMostClockSeconds) {
+        if (std::abs(ahead) > kMaxClockSeconds) {
             return failure(ExitCode::kClock,
                            "The clock of " + targetText(conn_) + " is " + text + ".",
                            "Set both by NTP: one-time codes need clocks that agree.");

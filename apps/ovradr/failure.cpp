@@ -5,10 +5,10 @@
 
 #include <ovradrcore/err_recorder.h>
 #include <ovradrcore/json.h>
+#include <ovraplatform/api_errors.h>
+#include <ovraplatform/cred_errors.h>
 
-#include <credential/cred_errors.h>
 #include <unistd.h>
-#include <webapi/api_errors.h>
 
 #include <algorithm>
 #include <array>

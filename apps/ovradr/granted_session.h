@@ -3,7 +3,7 @@
 
 #include "failure.h"
 
-#include <cgi/session_store.h>
+#include <ovraplatform/session_store.h>
 
 #include <string>
 #include <vector>

@@ -3,10 +3,11 @@
 
 #include "output.h"
 
-#include <core/unique_fd.h>
+#include <ovrabase/expected.h>
+#include <ovrabase/unique_fd.h>
+
 #include <fcntl.h>
 #include <poll.h>
-#include <sodium.h>
 #include <sys/stat.h>
 #include <termios.h>
 #include <unistd.h>
@@ -15,7 +16,6 @@
 #include <cerrno>
 #include <csignal>
 #include <cstdio>
-#include <system_error>
 
 namespace Ovradr {
 
@@ -103,7 +103,7 @@ Expected<Secret> readLine(int fd, const std::string &where) {
             continue;
         }
         if (count < 0) {
-            return unreadable(where, std::system_category().message(errno));
+            return unreadable(where, OvraBase::errnoText(errno));
         }
         if (count == 0 || c == '\n') {
             break;
@@ -123,11 +123,11 @@ Expected<Secret> readLine(int fd, const std::string &where) {
     return secret;
 }
 
-Expected<Secret> readFile(const std::string &path) {
-    const OvraPlatform::UniqueFd fd(open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NOCTTY));
+Expected<Secret> readPasswordFile(const std::string &path) {
+    const OvraBase::UniqueFd fd(open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NOCTTY));
     struct stat status {};
     if (!fd || fstat(fd.get(), &status) != 0) {
-        return unreadable(path, std::system_category().message(errno));
+        return unreadable(path, OvraBase::errnoText(errno));
     }
     if (S_ISREG(status.st_mode) && (status.st_mode & S_IROTH) != 0) {
         std::fprintf(stderr, "ovradr: everybody can read %s: chmod 600 it.\n",
@@ -137,28 +137,6 @@ Expected<Secret> readFile(const std::string &path) {
 }
 
 } // namespace
-
-Secret::Secret() {
-    text_.reserve(kMaxSize);
-}
-
-Secret::~Secret() {
-    text_.resize(text_.capacity());
-    sodium_memzero(text_.data(), text_.size());
-}
-
-bool Secret::append(char c) {
-    if (text_.size() == kMaxSize) {
-        return false;
-    }
-    text_.push_back(c);
-    return true;
-}
-
-void Secret::removeLast() {
-    text_.back() = '\0';
-    text_.pop_back();
-}
 
 bool isInteractive() {
     return isatty(STDIN_FILENO) == 1 && isatty(STDERR_FILENO) == 1;
@@ -185,7 +163,7 @@ Expected<Secret> obtainPassword(const PasswordSource &source, const std::string 
         return readLine(STDIN_FILENO, "standard input");
     }
     if (!source.file.empty()) {
-        return readFile(source.file);
+        return readPasswordFile(source.file);
     }
     if (!isInteractive()) {
         return failure(ExitCode::kUsage,

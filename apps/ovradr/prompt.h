@@ -3,34 +3,13 @@
 
 #include "failure.h"
 
-#include <cstddef>
+#include <ovrabase/secret.h>
+
 #include <string>
-#include <string_view>
 
 namespace Ovradr {
 
-/// A text that is wiped when it goes. It never grows, so that no copy of it stays behind.
-class Secret {
-public:
-    static constexpr std::size_t kMaxSize = 1024;
-
-    Secret();
-    Secret(Secret &&) noexcept = default;
-    Secret &operator=(Secret &&) = delete;
-    Secret(const Secret &) = delete;
-    Secret &operator=(const Secret &) = delete;
-    ~Secret();
-
-    /// False when there is no room for it.
-    bool append(char c);
-    void removeLast();
-    /// Valid as long as this object.
-    const std::string &get() const { return text_; }
-    bool empty() const { return text_.empty(); }
-
-private:
-    std::string text_;
-};
+using OvraBase::Secret;
 
 /// Where a password comes from. Neither: it is asked for on the terminal.
 struct PasswordSource {

@@ -3,7 +3,9 @@
 
 #include "target.h"
 
-#include <core/unique_fd.h>
+#include <ovrabase/expected.h>
+#include <ovrabase/unique_fd.h>
+
 #include <netdb.h>
 #include <poll.h>
 
@@ -13,7 +15,6 @@
 #include <chrono>
 #include <cstring>
 #include <memory>
-#include <system_error>
 
 namespace Ovradr {
 
@@ -25,7 +26,7 @@ constexpr std::chrono::seconds kConnectTime{10};
 
 /// 0, or the errno of the attempt.
 int tryConnect(const HostAddress &address, Clock::time_point end) {
-    const OvraPlatform::UniqueFd socketFd(
+    const OvraBase::UniqueFd socketFd(
         socket(address.address.ss_family, SOCK_STREAM | SOCK_NONBLOCK | SOCK_CLOEXEC, 0));
     if (!socketFd) {
         return errno;
@@ -58,7 +59,7 @@ Failure connectFailure(const std::string &where, int error) {
                        "Check that the appliance is on, the cables, and firewalls in between.");
     }
     return failure(ExitCode::kNotReachable,
-                   where + " cannot be reached: " + std::generic_category().message(error) + ".",
+                   where + " cannot be reached: " + OvraBase::errnoText(error) + ".",
                    "Check the address, the routes and the cables.");
 }
 

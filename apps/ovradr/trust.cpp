@@ -5,6 +5,8 @@
 #include "prompt.h"
 #include "target.h"
 
+#include <ovrabase/encoding.h>
+
 #include <algorithm>
 #include <cctype>
 #include <cstdio>
@@ -17,9 +19,6 @@ using OvraDRNode::Conn;
 using OvraPlatform::CredError;
 using OvraPlatform::PeerIdentity;
 using OvraPlatform::TrustVerdict;
-
-constexpr std::string_view kPrefix = "SHA256:";
-constexpr std::size_t kDigits = 43; // 256 bits in base64, without padding
 
 ExitCode exitOf(CredError error) {
     switch (error) {
@@ -77,16 +76,9 @@ Trouble pin(const Conn &conn, const PeerIdentity &identity) {
 
 } // namespace
 
-bool isFingerprint(const std::string &text) {
-    return text.size() == kPrefix.size() + kDigits && text.starts_with(kPrefix) &&
-           std::all_of(
-               text.begin() + static_cast<std::ptrdiff_t>(kPrefix.size()), text.end(), [](char c) {
-                   return std::isalnum(static_cast<unsigned char>(c)) != 0 || c == '+' || c == '/';
-               });
-}
-
 std::string checkFingerprint(const std::string &text) {
-    return isFingerprint(text) ? "" : "a fingerprint is SHA256: and 43 characters of base64";
+    return OvraBase::isFingerprint(text) ? ""
+                                         : "a fingerprint is SHA256: and 43 characters of base64";
 }
 
 Failure endpointFailure(const Conn &conn, CredError error) {

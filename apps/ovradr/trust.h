@@ -4,8 +4,7 @@
 #include "failure.h"
 
 #include <ovradrnode/conn.h>
-
-#include <credential/peer_trust.h>
+#include <ovraplatform/peer_trust.h>
 
 #include <string>
 
@@ -14,11 +13,8 @@ namespace Ovradr {
 /// How long to wait for an endpoint that shows its key, in seconds.
 inline constexpr long kMeetSeconds = 10;
 
-/// Whether the text is a fingerprint: "SHA256:" and 43 characters of base64, as setup and
-/// `conn local` show it.
-bool isFingerprint(const std::string &text);
-
-/// For command lines: "" when the text is a fingerprint, otherwise what it lacks.
+/// For command lines: "" when the text is a fingerprint ("SHA256:" and 43 characters of base64, as
+/// setup and `conn local` show it), otherwise what it lacks.
 std::string checkFingerprint(const std::string &text);
 
 /// Why an endpoint could not be asked.

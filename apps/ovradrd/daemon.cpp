@@ -1,24 +1,27 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "daemon.h"
 
-#include "cgi/session_store.h"
-#include "core/appliance.h"
-#include "credential/sealed_box.h"
 #include "farlink_agent.h"
 #include "gateway.h"
 #include "handlers/auth.h"
 #include "handlers/handlers.h"
-#include "lanes.h"
-#include "listener.h"
-#include "ovradrnode/dr_node.h"
-#include "ovradrnode/node_db.h"
 #include "release_retries.h"
-#include "tls_identity.h"
-#include "webapi/api_registry.h"
-#include "webapi/local_server.h"
+#include "service/listener.h"
+#include "service/tls_identity.h"
+#include "service/work_queue.h"
+#include "test_files.h"
+
+#include <ovradrnode/dr_node.h>
+#include <ovradrnode/node_db.h>
+#include <ovraplatform/api_registry.h>
+#include <ovraplatform/appliance.h>
+#include <ovraplatform/local_server.h>
+#include <ovraplatform/sealed_box.h>
+#include <ovraplatform/session_store.h>
 
 #include <unistd.h>
 
+#include <cerrno>
 #include <optional>
 #include <utility>
 
@@ -26,27 +29,46 @@ namespace Ovradrd {
 
 namespace {
 
+using OvraBase::Expected;
 using OvraPlatform::LocalCall;
+using OvraService::ConnectedClient;
+using OvraService::ExitCode;
+using OvraService::HttpRequest;
+using OvraService::HttpServer;
+using OvraService::Listener;
+using OvraService::StartError;
+using OvraService::TlsIdentity;
+using OvraService::WorkQueue;
 
 bool exists(const char *path) {
     return access(path, F_OK) == 0;
 }
 
+tl::unexpected<StartError> failed(const OvraBase::Error &why) {
+    StartError error(why);
+    if (why.number == EADDRINUSE) {
+        error.exit = ExitCode::kPortInUse;
+    }
+    return tl::unexpected(error);
+}
+
+tl::unexpected<StartError> notSetUp(const std::string &what) {
+    return tl::unexpected(StartError(ExitCode::kNotSetUp, "this appliance is not set up (" + what +
+                                                              "): run ovradr setup"));
+}
+
 /// Whether `ovradr setup` has been here.
-bool isSetUp(std::string &why) {
+tl::expected<void, StartError> checkSetUp() {
     for (const char *path : {OvraPlatform::kTlsKeyFile, OvraPlatform::kTlsCertificateFile,
                              OvraPlatform::kSealKeyFile}) {
         if (!exists(path)) {
-            why = std::string("this appliance is not set up (") + path +
-                  " is missing): run ovradr setup";
-            return false;
+            return notSetUp(std::string(path) + " is missing");
         }
     }
     if (OvraDRNode::NodeDBHandler::GetHandler().GetSchemaVersion() < 0) {
-        why = "this appliance is not set up (the node database cannot be read): run ovradr setup";
-        return false;
+        return notSetUp("the node database cannot be read");
     }
-    return true;
+    return {};
 }
 
 } // namespace
@@ -55,9 +77,9 @@ struct Daemon::Impl {
     explicit Impl(Settings chosen)
         : settings(std::move(chosen)) {}
 
-    bool loadKeys(std::string &why);
+    Expected<void> loadKeys();
     void addHandlers();
-    Outcome openPorts(std::vector<Listener> &listeners, int &port, std::string &why) const;
+    Expected<std::vector<Listener>> openPorts(int &port) const;
 
     Settings settings;
     int httpsPort = 0;
@@ -65,28 +87,33 @@ struct Daemon::Impl {
     std::optional<TlsIdentity> identity;
     std::optional<OvraPlatform::SealKeyPair> keys;
     OvraPlatform::ReplayGuard guard;
-    LoginDesk desk;
+    LoginApi loginApi;
     OvraPlatform::APIRegistry registry;
     std::optional<Gateway> gateway;
     std::optional<FarlinkAgent> farlink;
     // Their threads use everything above.
     std::optional<ReleaseRetries> retries;
-    std::optional<Lanes> lanes;
+    std::optional<WorkQueues> queues;
     std::optional<HttpServer> http;
     std::optional<OvraPlatform::LocalServer> local;
 };
 
-bool Daemon::Impl::loadKeys(std::string &why) {
-    identity = TlsIdentity::load(OvraPlatform::kTlsKeyFile, OvraPlatform::kTlsCertificateFile, why);
-    if (!identity) {
-        return false;
+Expected<void> Daemon::Impl::loadKeys() {
+    auto tls = TlsIdentity::load(OvraPlatform::kTlsKeyFile, OvraPlatform::kTlsCertificateFile);
+    if (!tls) {
+        return OvraBase::Unexpected(tls.error());
     }
-    keys = OvraPlatform::SealKeyPair::load(OvraPlatform::kSealKeyFile, why);
-    return keys.has_value();
+    identity = std::move(*tls);
+    auto pair = OvraPlatform::SealKeyPair::load(OvraPlatform::kSealKeyFile);
+    if (!pair) {
+        return OvraBase::Unexpected({pair.error()});
+    }
+    keys = std::move(*pair);
+    return {};
 }
 
 void Daemon::Impl::addHandlers() {
-    desk.addTo(registry);
+    loginApi.addTo(registry);
     addEncryptionAPI(registry, *keys, guard);
     addUserAPI(registry);
     addFarlinkAPI(registry, *farlink);
@@ -100,21 +127,19 @@ void Daemon::Impl::addHandlers() {
 
 /// One socket for each address, all at the same port.
 /// \param port  0: takes the port that was free
-Outcome Daemon::Impl::openPorts(std::vector<Listener> &listeners, int &port,
-                                std::string &why) const {
+Expected<std::vector<Listener>> Daemon::Impl::openPorts(int &port) const {
     const std::vector<std::string> everywhere = {""};
+    std::vector<Listener> listeners;
     for (const std::string &address :
          settings.addresses.empty() ? everywhere : settings.addresses) {
-        Listener listener = Listener::listen(address, port);
-        if (listener.problem != Listener::Problem::kNone) {
-            why = listener.why;
-            return listener.problem == Listener::Problem::kPortInUse ? Outcome::kPortInUse
-                                                                     : Outcome::kFailed;
+        Expected<Listener> listener = Listener::listen(address, port);
+        if (!listener) {
+            return OvraBase::Unexpected(listener.error());
         }
-        port = listener.port;
-        listeners.push_back(std::move(listener));
+        port = listener->port;
+        listeners.push_back(std::move(*listener));
     }
-    return Outcome::kOk;
+    return listeners;
 }
 
 Daemon::Daemon(Settings settings)
@@ -124,50 +149,49 @@ Daemon::~Daemon() {
     stop();
 }
 
-Outcome Daemon::start(std::string &why) {
+tl::expected<void, StartError> Daemon::start() {
     Impl &self = *impl_;
-    if (!isSetUp(why)) {
-        return Outcome::kNotSetUp;
+    if (auto ready = checkSetUp(); !ready) {
+        return ready;
     }
     if (OvraDRNode::DRNode::getLocalNodeId().empty()) {
-        why = "the node id can be neither read nor made: see the log, and check that the disk is "
-              "neither full nor read-only";
-        return Outcome::kFailed;
+        return failed({"the node id can be neither read nor made: see the log, and check that the "
+                       "disk is neither full nor read-only"});
     }
-    if (!self.loadKeys(why)) {
-        return Outcome::kFailed;
+    if (const Expected<void> loaded = self.loadKeys(); !loaded) {
+        return failed(loaded.error());
     }
-    std::vector<Listener> https;
-    std::vector<Listener> http;
     self.httpsPort = self.settings.httpsPort;
     self.httpPort = self.settings.httpPort;
-    for (const auto &[listeners, port] :
-         {std::pair{&https, &self.httpsPort}, {&http, &self.httpPort}}) {
-        if (const Outcome outcome = self.openPorts(*listeners, *port, why);
-            outcome != Outcome::kOk) {
-            return outcome;
-        }
+    Expected<std::vector<Listener>> https = self.openPorts(self.httpsPort);
+    if (!https) {
+        return failed(https.error());
+    }
+    Expected<std::vector<Listener>> http = self.openPorts(self.httpPort);
+    if (!http) {
+        return failed(http.error());
     }
     self.farlink.emplace([&self](ConnectedClient client) { self.http->adopt(std::move(client)); });
     self.addHandlers();
-    self.lanes.emplace();
-    self.retries.emplace(self.lanes->slow);
-    self.gateway.emplace(self.registry, *self.keys, self.guard, self.desk, *self.lanes);
+    self.queues.emplace();
+    self.retries.emplace(self.queues->slow);
+    self.gateway.emplace(self.registry, *self.keys, self.guard, self.loginApi, *self.queues);
     self.local.emplace(OvraPlatform::kSocketFile,
                        [&self](const LocalCall &call) { return self.gateway->serveLocal(call); });
-    if (!self.local->start(why)) {
-        return Outcome::kFailed;
+    if (const auto started = self.local->start(); !started) {
+        return failed({started.error()});
     }
     self.http.emplace(
         [&self](HttpRequest request, const HttpServer::Answer &answer) {
             self.gateway->serve(std::move(request), answer);
         },
-        self.settings.limits);
-    if (!self.http->start(std::move(https), std::move(http), *self.identity, why)) {
-        return Outcome::kFailed;
+        self.settings.limits, testFiles(self.settings.testFiles));
+    if (const auto started = self.http->start(std::move(*https), std::move(*http), *self.identity);
+        !started) {
+        return failed(started.error());
     }
     self.farlink->start();
-    return Outcome::kOk;
+    return {};
 }
 
 int Daemon::httpsPort() const {
@@ -178,7 +202,7 @@ int Daemon::httpPort() const {
     return impl_->httpPort;
 }
 
-void Daemon::tend() {
+void Daemon::doPeriodicWork() {
     OvraPlatform::SessionStore().sweep();
     impl_->retries->begin();
 }
@@ -194,9 +218,9 @@ bool Daemon::stop() {
         // It may be waiting for callers for some time yet.
         ended = self.farlink->stop(std::chrono::steady_clock::now());
     }
-    if (self.lanes) {
-        for (Lane *lane : {&self.lanes->login, &self.lanes->slow, &self.lanes->quick}) {
-            ended = lane->stop(deadline) && ended;
+    if (self.queues) {
+        for (WorkQueue *queue : {&self.queues->login, &self.queues->slow, &self.queues->quick}) {
+            ended = queue->stop(deadline) && ended;
         }
     }
     if (self.gateway) {

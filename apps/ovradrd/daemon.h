@@ -1,33 +1,27 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
-#include "http_server.h"
+#include "service/exit_code.h"
+#include "service/http_server.h"
 
 #include <chrono>
+#include <cstddef>
 #include <memory>
 #include <string>
 #include <vector>
 
 namespace Ovradrd {
 
-/// The exit codes of ovradrd.
-enum class Outcome : int {
-    kOk = 0,
-    kFailed = 1,
-    kUsage = 2,
-    kPortInUse = 3,
-    kNotSetUp = 9, ///< the same number as ovradr has for it
-};
-
 /// What the daemon serves at.
 struct Settings {
     std::vector<std::string> addresses; ///< numeric; empty: every address of the machine
     int httpPort = 0;                   ///< 0: any that is free
     int httpsPort = 0;
-    HttpLimits limits;
+    OvraService::HttpLimits limits;
+    std::size_t testFiles = 16; ///< sent at the same time
 };
 
-/// The whole daemon: web server, local socket, lanes and handlers. One a process.
+/// The whole daemon: web server, local socket, queues and handlers. One a process.
 class Daemon {
 public:
     /// How long calls under way may go on once the daemon is to stop.
@@ -40,15 +34,14 @@ public:
     ~Daemon();
 
     /// Takes what `ovradr setup` made, binds the ports and begins to serve.
-    /// \param why  takes one sentence for people unless the result is kOk
-    Outcome start(std::string &why);
+    [[nodiscard]] tl::expected<void, OvraService::StartError> start();
     /// The ports that it serves at, once it has started.
     int httpsPort() const;
     int httpPort() const;
 
     /// What has to be done every few seconds: sweeps expired sessions and has pending releases
     /// tried. Returns at once.
-    void tend();
+    void doPeriodicWork();
 
     /// Ends serving: calls under way get kGrace, then their callers are told that the daemon stops.
     /// \return false when calls still run (they wait for another appliance): the process may then

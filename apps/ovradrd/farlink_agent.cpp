@@ -1,10 +1,9 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "farlink_agent.h"
 
-#include "credential/farlink.h"
-#include "webapi/api_errors.h"
-
 #include <ovradrcore/log.h>
+#include <ovraplatform/api_errors.h>
+#include <ovraplatform/farlink.h>
 
 #include <fcntl.h>
 #include <netdb.h>
@@ -22,27 +21,27 @@ namespace Ovradrd {
 
 namespace {
 
+using OvraBase::UniqueFd;
 using OvraPlatform::FarlinkClient;
 using OvraPlatform::FarlinkKey;
 using OvraPlatform::FarlinkReply;
 using OvraPlatform::FarlinkSettings;
-using OvraPlatform::UniqueFd;
 
 /// Between two looks at the settings while there is no alias.
 constexpr std::chrono::seconds kLook{2};
-constexpr std::chrono::seconds kShortestPause{1};
-constexpr std::chrono::seconds kLongestPause{60};
+constexpr std::chrono::seconds kMinPause{1};
+constexpr std::chrono::seconds kMaxPause{60};
 constexpr timeval kDialTime{5, 0};
 /// Between two enrolments.
-constexpr std::chrono::hours kLongestStay{1};
+constexpr std::chrono::hours kMaxStay{1};
 /// Callers taken from one answer; a service that keeps to docs/wire.md never tells more at once.
-constexpr Json::ArrayIndex kMostCallers = 64;
+constexpr Json::ArrayIndex kMaxCallers = 64;
 constexpr std::size_t kCallerSize = 32;
 
 /// Connects to the tunnel port and says which caller is meant; without a descriptor when that
 /// fails.
-ConnectedClient dial(const std::string &host, int port, const std::string &caller) {
-    ConnectedClient call;
+OvraService::ConnectedClient dial(const std::string &host, int port, const std::string &caller) {
+    OvraService::ConnectedClient call;
     addrinfo hints{};
     hints.ai_socktype = SOCK_STREAM;
     addrinfo *list = nullptr;
@@ -83,7 +82,7 @@ struct FarlinkAgent::State {
     bool stopping = false;
     bool ended = true;
     Status status;
-    std::function<void(ConnectedClient)> take; ///< empty once it stops
+    std::function<void(OvraService::ConnectedClient)> take; ///< empty once it stops
 
     /// Waits; false when the agent is to stop.
     bool pause(std::chrono::seconds time) {
@@ -101,7 +100,7 @@ struct FarlinkAgent::State {
         }
         status = now;
     }
-    void hand(ConnectedClient client) {
+    void hand(OvraService::ConnectedClient client) {
         const std::lock_guard lock(mutex);
         if (take && client.fd) {
             take(std::move(client));
@@ -122,10 +121,9 @@ public:
 
     /// Proves who we are. \return what is in the way, "" when nothing
     std::string begin() {
-        std::string why;
-        const auto key = FarlinkKey::loadOrCreate(why);
+        const auto key = FarlinkKey::loadOrCreate();
         if (!key) {
-            return why;
+            return key.error();
         }
         const FarlinkReply reply = client_.enrol(*key);
         if (!reply.isSuccess()) {
@@ -142,7 +140,7 @@ public:
         const Json::Value lease = reply.response.getDataField("lease");
         const std::chrono::seconds third(lease.isInt64() ? lease.asInt64() / 3 : 0);
         renewAt_ = std::chrono::steady_clock::now() +
-                   std::clamp<std::chrono::seconds>(third, kShortestPause, kLongestStay);
+                   std::clamp<std::chrono::seconds>(third, kMinPause, kMaxStay);
         status_.connected = true;
         status_.port = port.asInt();
         status_.expires = expires.asInt64();
@@ -164,8 +162,8 @@ public:
             return reply.why();
         }
         const Json::Value callers = reply.response.getDataField("callers");
-        for (Json::ArrayIndex i = 0;
-             callers.isArray() && i < std::min(callers.size(), kMostCallers); ++i) {
+        for (Json::ArrayIndex i = 0; callers.isArray() && i < std::min(callers.size(), kMaxCallers);
+             ++i) {
             if (isCaller(callers[i]) && mayDial()) {
                 dialled(dial(settings_.host, tunnelPort_, callers[i].asString()));
             }
@@ -208,7 +206,8 @@ void FarlinkAgent::run(const std::shared_ptr<State> &state) {
                     std::string ignored;
                     return OvraPlatform::readFarlinkSettings(ignored) == settings;
                 },
-                [&state](ConnectedClient client) { state->hand(std::move(client)); }, over);
+                [&state](OvraService::ConnectedClient client) { state->hand(std::move(client)); },
+                over);
         }
         if (problem.empty()) {
             pause = std::chrono::seconds(0);
@@ -217,8 +216,8 @@ void FarlinkAgent::run(const std::shared_ptr<State> &state) {
         // Where it was only forgotten, it comes back at once.
         state->tell({false, 0, 0, problem});
         stay.reset();
-        pause = over && pause.count() == 0 ? kShortestPause
-                                           : std::clamp(pause * 2, kShortestPause, kLongestPause);
+        pause =
+            over && pause.count() == 0 ? kMinPause : std::clamp(pause * 2, kMinPause, kMaxPause);
     }
 }
 
@@ -233,7 +232,7 @@ void FarlinkAgent::runToTheEnd(const std::shared_ptr<State> &state) {
     state->changed.notify_all();
 }
 
-FarlinkAgent::FarlinkAgent(std::function<void(ConnectedClient)> take)
+FarlinkAgent::FarlinkAgent(std::function<void(OvraService::ConnectedClient)> take)
     : state_(std::make_shared<State>()) {
     state_->take = std::move(take);
 }

@@ -1,7 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
-#include "http_server.h"
+#include "service/http_server.h"
 
 #include <chrono>
 #include <cstdint>
@@ -24,7 +24,7 @@ public:
     };
 
     /// \param take  gets every caller, in the thread of the agent
-    explicit FarlinkAgent(std::function<void(ConnectedClient)> take);
+    explicit FarlinkAgent(std::function<void(OvraService::ConnectedClient)> take);
     FarlinkAgent(const FarlinkAgent &) = delete;
     FarlinkAgent &operator=(const FarlinkAgent &) = delete;
     /// The thread may end later: it then touches nothing but its own.

@@ -1,14 +1,13 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "gateway.h"
 
-#include "callers.h"
-#include "cgi/client_context.h"
-#include "webapi/api_errors.h"
+#include "session_owner.h"
 
+#include <ovrabase/secret.h>
 #include <ovradrcore/json.h>
 #include <ovradrcore/log.h>
-
-#include <sodium.h>
+#include <ovraplatform/api_errors.h>
+#include <ovraplatform/client_scope.h>
 
 #include <chrono>
 #include <future>
@@ -22,11 +21,11 @@ namespace {
 namespace APIError = OvraPlatform::APIError;
 using OvraPlatform::APICaller;
 using OvraPlatform::apiError;
-using OvraPlatform::APILane;
+using OvraPlatform::APIQueue;
 
 /// Of a reply; clients take 8 MiB, and sealing adds a third.
-constexpr std::size_t kMostReply = std::size_t{5} * 1024 * 1024;
-constexpr std::size_t kLongestName = 128;
+constexpr std::size_t kMaxReply = std::size_t{5} * 1024 * 1024;
+constexpr std::size_t kMaxName = 128;
 constexpr std::chrono::milliseconds kLocalPause{100};
 constexpr char kLoopback[] = "127.0.0.1";
 
@@ -58,12 +57,12 @@ struct Gateway::Call {
     std::optional<OvraPlatform::ReplyKey> replyKey;
     bool secure = false;
     APICaller caller;
-    HttpServer::Answer answer;
+    OvraService::HttpServer::Answer answer;
 
     /// Ends the call.
     void reply(const Json::Value &document) const {
         std::string text = OvraDRCore::toString(document);
-        if (text.size() > kMostReply) {
+        if (text.size() > kMaxReply) {
             text = OvraDRCore::toString(
                 apiError(APIError::kTooLarge, "the reply is too large: ask for less at once"));
         }
@@ -72,17 +71,18 @@ struct Gateway::Call {
 };
 
 Gateway::Gateway(const OvraPlatform::APIRegistry &registry, const OvraPlatform::SealKeyPair &keys,
-                 OvraPlatform::ReplayGuard &guard, LoginDesk &desk, Lanes &lanes)
+                 OvraPlatform::ReplayGuard &guard, LoginApi &api, WorkQueues &queues)
     : registry_(registry)
     , keys_(keys)
     , guard_(guard)
-    , desk_(desk)
-    , lanes_(lanes) {}
+    , loginApi_(api)
+    , queues_(queues) {}
 
-void Gateway::serve(HttpRequest request, const HttpServer::Answer &answer) {
+void Gateway::serve(OvraService::HttpRequest request,
+                    const OvraService::HttpServer::Answer &answer) {
     // std::function has to be copyable.
-    const auto held = std::make_shared<HttpRequest>(std::move(request));
-    const bool taken = lanes_.quick.submit([this, held, answer] {
+    const auto held = std::make_shared<OvraService::HttpRequest>(std::move(request));
+    const bool taken = queues_.quick.submit([this, held, answer] {
         Call call;
         call.secure = held->secure;
         call.caller.address = held->address;
@@ -90,21 +90,20 @@ void Gateway::serve(HttpRequest request, const HttpServer::Answer &answer) {
         open(call, held->body);
     });
     if (!taken) {
-        sodium_memzero(held->body.data(), held->body.size());
+        OvraBase::wipe(held->body);
         answer(OvraDRCore::toString(busy()));
     }
 }
 
 /// Reads the call and brings it on its way.
 void Gateway::open(Call &call, std::string &body) {
-    std::string why;
-    std::optional<OvraPlatform::WireCall> wire = OvraPlatform::decodeForm(body, why);
-    sodium_memzero(body.data(), body.size());
+    auto wire = OvraPlatform::decodeForm(body);
+    OvraBase::wipe(body);
     if (!wire) {
-        call.reply(apiError(APIError::kBadRequest, why));
+        call.reply(apiError(APIError::kBadRequest, wire.error()));
         return;
     }
-    if (wire->api.size() > kLongestName || wire->method.size() > kLongestName) {
+    if (wire->api.size() > kMaxName || wire->method.size() > kMaxName) {
         call.reply(apiError(APIError::kBadRequest, "the name of the API or method is too long"));
         return;
     }
@@ -146,13 +145,13 @@ bool Gateway::admit(Call &call) {
         return true;
     }
     const SessionOwner owner = findSessionOwner(call.wire.sid);
-    if (owner.outcome == SessionOwner::Outcome::kNotKnown) {
+    if (owner.state == SessionOwner::State::kNotKnown) {
         // A peer must not take the session for expired.
         call.reply(apiError(APIError::kInternal, "the sessions cannot be read now: see the log of "
                                                  "the appliance"));
         return false;
     }
-    if (owner.outcome == SessionOwner::Outcome::kUnknown) {
+    if (owner.state == SessionOwner::State::kUnknown) {
         return true;
     }
     if (owner.account.disabled) {
@@ -167,30 +166,30 @@ bool Gateway::admit(Call &call) {
 }
 
 void Gateway::route(Call call) {
-    if (LoginDesk::isLogin(call.wire)) {
+    if (LoginApi::isLogin(call.wire)) {
         login(std::move(call));
         return;
     }
-    if (registry_.lane(call.wire) == APILane::kQuick) {
+    if (registry_.queue(call.wire) == APIQueue::kQuick) {
         run(call);
         return;
     }
     const auto held = std::make_shared<Call>(std::move(call));
-    if (!lanes_.slow.submit([this, held] { run(*held); })) {
+    if (!queues_.slow.submit([this, held] { run(*held); })) {
         held->reply(busy());
     }
 }
 
 void Gateway::login(Call call) {
     const auto held = std::make_shared<Call>(std::move(call));
-    const auto wait = desk_.admit(held->wire.params, held->caller.address);
+    const auto wait = loginApi_.admit(held->wire.params, held->caller.address);
     if (!wait) {
         held->reply(apiError(APIError::kTooBusy, "too many log-ins of this account or from this "
                                                  "address failed: wait a minute"));
         return;
     }
-    if (!lanes_.login.submit([this, held] { run(*held); }, *wait)) {
-        desk_.forgive(held->wire.params, held->caller.address);
+    if (!queues_.login.submit([this, held] { run(*held); }, *wait)) {
+        loginApi_.forgive(held->wire.params, held->caller.address);
         held->reply(busy());
     }
 }
@@ -213,8 +212,9 @@ Json::Value Gateway::serveLocal(const OvraPlatform::LocalCall &call) {
     caller.user = call.user;
     caller.administrator = true;
     caller.local = true;
-    Lane &lane = registry_.lane(call) == APILane::kQuick ? lanes_.quick : lanes_.slow;
-    const bool taken = lane.submit([this, call, caller, promise = promise] {
+    OvraService::WorkQueue &queue =
+        registry_.queue(call) == APIQueue::kQuick ? queues_.quick : queues_.slow;
+    const bool taken = queue.submit([this, call, caller, promise = promise] {
         // Without a client the session library would note one in the environment, which threads
         // must not change.
         const OvraPlatform::ClientScope scope(kLoopback);
@@ -231,7 +231,7 @@ Json::Value Gateway::serveLocal(const OvraPlatform::LocalCall &call) {
     try {
         return reply.get();
     } catch (const std::future_error &) {
-        return busy(); // the lane stopped before the job's turn came
+        return busy(); // the queue stopped before the job's turn came
     }
 }
 

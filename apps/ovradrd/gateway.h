@@ -1,13 +1,13 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
-#include "credential/sealed_box.h"
-#include "credential/wire_form.h"
 #include "handlers/auth.h"
-#include "http_server.h"
-#include "lanes.h"
-#include "webapi/api_registry.h"
-#include "webapi/local_wire.h"
+#include "service/http_server.h"
+#include "service/work_queue.h"
+
+#include <ovraplatform/api_registry.h>
+#include <ovraplatform/sealed_box.h>
+#include <ovraplatform/wire_form.h>
 
 #include <json/value.h>
 
@@ -17,25 +17,27 @@
 
 namespace Ovradrd {
 
-/// The lanes that calls run in.
-struct Lanes {
-    Lane quick{4, 512}; ///< reads calls, and runs those that answer from this machine alone
-    Lane slow{16, 64};  ///< calls that may wait on the network
-    Lane login{2, 64};  ///< log-ins: each hashes a password, with 64 MiB and a tenth of a second
+/// The queues that calls run in.
+struct WorkQueues {
+    OvraService::WorkQueue quick{
+        4, 512}; ///< reads calls, and runs those that answer from this machine alone
+    OvraService::WorkQueue slow{16, 64}; ///< calls that may wait on the network
+    OvraService::WorkQueue login{
+        2, 64}; ///< log-ins: each hashes a password, with 64 MiB and a tenth of a second
 };
 
 /// The way of a call from its arrival to its reply: read, unseal, find the session and its rights,
-/// choose the lane, run the handler, seal the reply.
+/// choose the queue, run the handler, seal the reply.
 class Gateway {
 public:
-    /// Everything has to outlive the gateway and the jobs in the lanes.
+    /// Everything has to outlive the gateway and the jobs in the queues.
     Gateway(const OvraPlatform::APIRegistry &registry, const OvraPlatform::SealKeyPair &keys,
-            OvraPlatform::ReplayGuard &guard, LoginDesk &desk, Lanes &lanes);
+            OvraPlatform::ReplayGuard &guard, LoginApi &api, WorkQueues &queues);
     Gateway(const Gateway &) = delete;
     Gateway &operator=(const Gateway &) = delete;
 
     /// Carries out the call in `request`. Does not wait; safe for threads.
-    void serve(HttpRequest request, const HttpServer::Answer &answer);
+    void serve(OvraService::HttpRequest request, const OvraService::HttpServer::Answer &answer);
 
     /// Carries out the call of a local process, with an administrator's rights, and waits for its
     /// reply. Safe for threads.
@@ -57,8 +59,8 @@ private:
     const OvraPlatform::APIRegistry &registry_;
     const OvraPlatform::SealKeyPair &keys_;
     OvraPlatform::ReplayGuard &guard_;
-    LoginDesk &desk_;
-    Lanes &lanes_;
+    LoginApi &loginApi_;
+    WorkQueues &queues_;
     std::atomic<bool> leaving_ = false;
 };
 

@@ -2,11 +2,11 @@
 
 // ovradrd: the web-API daemon of an appliance.
 
-#include "core/appliance.h"
 #include "daemon.h"
 #include "version.h"
 
 #include <ovradrcore/log.h>
+#include <ovraplatform/appliance.h>
 
 #include <CLI/CLI.hpp>
 #include <sys/resource.h>
@@ -23,9 +23,10 @@
 namespace {
 
 using Ovradrd::Daemon;
-using Ovradrd::Outcome;
+using OvraService::ExitCode;
+using OvraService::StartError;
 
-constexpr time_t kTendSeconds = 20;
+constexpr time_t kWorkPeriodSeconds = 20;
 /// Descriptors for the connections that it may have, and for everything else.
 constexpr rlim_t kDescriptors = 4096;
 
@@ -35,27 +36,29 @@ constexpr char kFooter[] =
     "system log. `ovradr setup` makes what it needs.\n\n"
     "Exit codes: 0 ended by a signal, 1 failed, 2 wrong usage, 3 a port is in use, 9 not set up.";
 
-Outcome fail(Outcome outcome, const std::string &why) {
-    OVRA_ERR("ovradrd does not start: %s", why.c_str());
-    std::fprintf(stderr, "ovradrd: %s\n", why.c_str());
-    return outcome;
+int fail(const StartError &why) {
+    OVRA_ERR("ovradrd does not start: %s", why.text.c_str());
+    std::fprintf(stderr, "ovradrd: %s\n", why.text.c_str());
+    return static_cast<int>(why.exit);
 }
 
-bool readSettings(Ovradrd::Settings &settings, std::string &why) {
+tl::expected<Ovradrd::Settings, StartError> readSettings() {
+    const auto refused = [](const std::string &what) {
+        return tl::unexpected(
+            StartError(ExitCode::kFailed, std::string(OvraPlatform::kConfigFile) + what));
+    };
     const OvraPlatform::ApplianceConfig config = OvraPlatform::readApplianceConfig();
     if (!config.problems.empty()) {
-        why = std::string(OvraPlatform::kConfigFile) + ": " + config.problems.front() +
-              ": correct the file";
-        return false;
+        return refused(": " + config.problems.front() + ": correct the file");
     }
     if (!config.servesAllAddresses && config.addresses.empty()) {
-        why = std::string(OvraPlatform::kConfigFile) + " names no address to serve at: correct it";
-        return false;
+        return refused(" names no address to serve at: correct it");
     }
+    Ovradrd::Settings settings;
     settings.addresses = config.addresses;
     settings.httpPort = config.httpPort;
     settings.httpsPort = config.httpsPort;
-    return true;
+    return settings;
 }
 
 void raiseDescriptorLimit() {
@@ -83,27 +86,26 @@ sigset_t blockEndSignals() {
     return signals;
 }
 
-/// Waits for the end, and has the daemon tend what it has to now and then.
+/// Waits for the end, and has the daemon do its periodic work meanwhile.
 void waitForEnd(Daemon &daemon, const sigset_t &signals) {
-    const timespec period{kTendSeconds, 0};
+    const timespec period{kWorkPeriodSeconds, 0};
     while (sigtimedwait(&signals, nullptr, &period) < 0) {
-        daemon.tend();
+        daemon.doPeriodicWork();
     }
 }
 
-Outcome serve() {
+int serve() {
     std::signal(SIGPIPE, SIG_IGN);
     const sigset_t signals = blockEndSignals();
     raiseDescriptorLimit();
 
-    std::string why;
-    Ovradrd::Settings settings;
-    if (!readSettings(settings, why)) {
-        return fail(Outcome::kFailed, why);
+    const auto settings = readSettings();
+    if (!settings) {
+        return fail(settings.error());
     }
-    Daemon daemon(settings);
-    if (const Outcome outcome = daemon.start(why); outcome != Outcome::kOk) {
-        return fail(outcome, why);
+    Daemon daemon(*settings);
+    if (const auto started = daemon.start(); !started) {
+        return fail(started.error());
     }
     OVRA_NOTICE("Serves at https port [%d] and http port [%d]", daemon.httpsPort(),
                 daemon.httpPort());
@@ -114,9 +116,9 @@ Outcome serve() {
     OVRA_NOTICE("Stops");
     if (!daemon.stop()) {
         OVRA_NOTICE("Calls that wait for other appliances are left");
-        _exit(static_cast<int>(Outcome::kOk));
+        _exit(static_cast<int>(ExitCode::kOk));
     }
-    return Outcome::kOk;
+    return static_cast<int>(ExitCode::kOk);
 }
 
 } // namespace
@@ -130,10 +132,10 @@ int main(int argc, char **argv) {
         try {
             app.parse(argc, argv);
         } catch (const CLI::ParseError &error) {
-            return app.exit(error) == 0 ? EXIT_SUCCESS : static_cast<int>(Outcome::kUsage);
+            return app.exit(error) == 0 ? EXIT_SUCCESS : static_cast<int>(ExitCode::kUsage);
         }
-        return static_cast<int>(serve());
+        return serve();
     } catch (const std::exception &error) {
-        return static_cast<int>(fail(Outcome::kFailed, error.what()));
+        return fail({ExitCode::kFailed, error.what()});
     }
 }

@@ -10,7 +10,7 @@ namespace Ovradrd {
 namespace {
 
 /// A node that lets packets vanish takes 10 seconds.
-constexpr int kMostInARound = 8;
+constexpr int kMaxInARound = 8;
 
 } // namespace
 
@@ -27,7 +27,7 @@ void ReleaseRetries::begin() {
         }
         underWay_ = false;
     };
-    if (!lane_.submit(job)) {
+    if (!queue_.submit(job)) {
         underWay_ = false;
     }
 }
@@ -35,7 +35,7 @@ void ReleaseRetries::begin() {
 void ReleaseRetries::round() {
     OvraApps::PendingReleases store;
     std::vector<OvraApps::PendingRelease> due;
-    store.listDue(due, kMostInARound);
+    store.listDue(due, kMaxInARound);
     for (const OvraApps::PendingRelease &pending : due) {
         OvraApps::retryRelease(pending, store);
     }

@@ -1,7 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
-#include "lanes.h"
+#include "service/work_queue.h"
 
 #include <atomic>
 
@@ -10,9 +10,9 @@ namespace Ovradrd {
 /// Tries again to release sessions on other nodes that could not be released before.
 class ReleaseRetries {
 public:
-    /// \param lane  where the tries run; has to end before this object does
-    explicit ReleaseRetries(Lane &lane)
-        : lane_(lane) {}
+    /// \param queue  where the tries run; has to end before this object does
+    explicit ReleaseRetries(OvraService::WorkQueue &queue)
+        : queue_(queue) {}
 
     /// Has what is due tried, unless the last round is still under way. Returns at once.
     void begin();
@@ -20,7 +20,7 @@ public:
 private:
     void round();
 
-    Lane &lane_;
+    OvraService::WorkQueue &queue_;
     std::atomic<bool> underWay_ = false;
 };
 

@@ -14,13 +14,13 @@ namespace {
 
 constexpr char kUtc[] = "Etc/UTC";
 constexpr char kZoneFolder[] = "/zoneinfo/";
-constexpr std::size_t kLongestName = 64;
+constexpr std::size_t kMaxName = 64;
 
 /// The text when it has the form of a zone's name, otherwise "".
 std::string zoneName(std::string text) {
     text.erase(std::min(text.find_first_of("\r\n"), text.size()));
     const bool named =
-        !text.empty() && text.size() <= kLongestName && text.front() != '/' &&
+        !text.empty() && text.size() <= kMaxName && text.front() != '/' &&
         std::all_of(text.begin(), text.end(), [](unsigned char c) {
             return std::isalnum(c) != 0 || c == '/' || c == '_' || c == '-' || c == '+';
         });

@@ -1,7 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "shared/pending_releases.h"
 
-#include "cgi/session_store.h"
+#include <ovraplatform/session_store.h>
 
 #include <algorithm>
 #include <utility>
@@ -75,7 +75,7 @@ bool PendingReleases::note(const PendingRelease &release) {
     if (!transaction.isOpen() || !count.step()) {
         return false;
     }
-    if (count.number(0) >= kMost) {
+    if (count.number(0) >= kMaxReleases) {
         return database_.fail("As many releases are pending as may be. Look at `ovradr session "
                               "pending` and forget those whose node is gone.");
     }
@@ -107,7 +107,7 @@ bool PendingReleases::postpone(const std::string &reference, int code) {
     update.bind(1, reference)
         .bind(2, std::int64_t{code})
         .bind(3, now())
-        .bind(4, std::int64_t{kLongestPause})
+        .bind(4, std::int64_t{kMaxPause})
         .bind(5, std::int64_t{kFirstPause});
     return update.run();
 }
@@ -145,7 +145,7 @@ bool PendingReleases::listDue(std::vector<PendingRelease> &releases, int most) {
     Statement rows = database_.prepare("SELECT " OVRA_RELEASE_COLUMNS
                                        " FROM release WHERE next_try <= ?1 OR next_try > ?1 + ?2 "
                                        "ORDER BY next_try LIMIT ?3");
-    rows.bind(1, now()).bind(2, std::int64_t{kLongestPause}).bind(3, std::int64_t{most});
+    rows.bind(1, now()).bind(2, std::int64_t{kMaxPause}).bind(3, std::int64_t{most});
     return collect(rows, releases);
 }
 

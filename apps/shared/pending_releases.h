@@ -1,8 +1,8 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
-#include "cgi/database.h"
-#include "ovradrnode/conn.h"
+#include <ovradrnode/conn.h>
+#include <ovraplatform/database.h>
 
 #include <cstdint>
 #include <ctime>
@@ -38,13 +38,13 @@ struct PendingRelease {
 class PendingReleases {
 public:
     /// How many are remembered. More are not: they are found by an audit at the other node.
-    static constexpr int kMost = 4096;
+    static constexpr int kMaxReleases = 4096;
     /// How long a release that has just been noted is left to the process that noted it, in
     /// seconds: longer than a flow takes.
     static constexpr int kHold = 600;
     /// The pause after the first failed attempt, in seconds; each further one is twice as long.
     static constexpr int kFirstPause = 30;
-    static constexpr int kLongestPause = 6 * 3600;
+    static constexpr int kMaxPause = 6 * 3600;
 
     using Clock = std::function<std::time_t()>;
 
@@ -57,7 +57,7 @@ public:
 
     /// Remembers a release before its flow begins, so that a flow that is killed leaves it noted.
     /// One that is known already gets the new endpoint. \return false on failure, and when there
-    /// are kMost already.
+    /// are kMaxReleases already.
     bool note(const PendingRelease &release);
     /// The release failed once more: it is due again after a pause. \return false on failure.
     bool postpone(const std::string &reference, int code);

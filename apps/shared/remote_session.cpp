@@ -1,14 +1,13 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "shared/remote_session.h"
 
-#include "ovradrnode/node_api.h"
-#include "ovradrnode/node_db.h"
-#include "ovradrnode/sender.h"
-#include "webapi/api_errors.h"
-
 #include <ovradrcore/err_recorder.h>
 #include <ovradrcore/response.h>
 #include <ovradrcore/sqlite_command.h>
+#include <ovradrnode/node_api.h>
+#include <ovradrnode/node_db.h>
+#include <ovradrnode/sender.h>
+#include <ovraplatform/api_errors.h>
 
 #include <algorithm>
 #include <vector>

@@ -1,7 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
-#include "ovradrnode/conn.h"
+#include <ovradrnode/conn.h>
 
 #include <json/value.h>
 

@@ -1,15 +1,15 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "shared/session_release.h"
 
-#include "ovradrnode/cred_utils.h"
-#include "ovradrnode/node_cache.h"
-#include "ovradrnode/node_db.h"
-#include "ovradrnode/node_delete.h"
 #include "shared/remote_session.h"
 #include "shared/session_lock.h"
 
 #include <ovradrcore/err_recorder.h>
 #include <ovradrcore/log.h>
+#include <ovradrnode/cred_utils.h>
+#include <ovradrnode/node_cache.h>
+#include <ovradrnode/node_db.h>
+#include <ovradrnode/node_delete.h>
 
 #include <optional>
 

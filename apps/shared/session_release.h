@@ -1,8 +1,9 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
-#include "ovradrnode/dr_node.h"
 #include "shared/pending_releases.h"
+
+#include <ovradrnode/dr_node.h>
 
 #include <functional>
 #include <string>

@@ -3,6 +3,10 @@
 
 #include "ovradrcore/log.h"
 
+#include <ovrabase/expected.h>
+#include <ovrabase/file.h>
+#include <ovrabase/lock.h>
+
 #include <fcntl.h>
 #include <sys/file.h>
 #include <sys/stat.h>
@@ -13,15 +17,13 @@
 #include <bit>
 #include <cerrno>
 #include <chrono>
-#include <cstring>
-#include <thread>
 
 namespace OvraDRCore {
 
 namespace {
 
-using std::chrono::milliseconds;
-using std::chrono::steady_clock;
+using OvraBase::LockedFd;
+using OvraBase::UniqueFd;
 
 constexpr std::size_t kPair = 2 * BucketImage::kSize;
 constexpr std::uint32_t kMinBuckets = 16;
@@ -29,15 +31,9 @@ constexpr std::uint32_t kMaxBuckets = 65536;
 /// A bucket that overflows in a file emptier than this share holds names made to collide, or huge
 /// values: its oldest entries go, and the file does not grow.
 constexpr std::uint64_t kMinLoadToGrow = 64;
-constexpr milliseconds kLockWait{2000};
-constexpr milliseconds kLongestPause{20};
+constexpr std::chrono::milliseconds kLockWait{2000};
 
 using Pair = std::array<std::byte, kPair>;
-
-std::string directoryOf(const std::string &path) {
-    const std::size_t end = path.find_last_not_of('/', path.find_last_of('/'));
-    return end == std::string::npos ? "/" : path.substr(0, end + 1);
-}
 
 bool isOursAlone(const struct stat &status) {
     return status.st_uid == geteuid() && (status.st_mode & (S_IWGRP | S_IWOTH)) == 0;
@@ -53,7 +49,7 @@ bool checkDirectory(const std::string &directory, bool create) {
         }
         if (mkdir(directory.c_str(), 0700) != 0 && errno != EEXIST) {
             OVRA_WARN("Failed to create cache directory [%s]: %s", directory.c_str(),
-                      strerrordesc_np(errno));
+                      OvraBase::errnoText(errno).c_str());
             return false;
         }
         if (lstat(directory.c_str(), &status) != 0) {
@@ -84,27 +80,6 @@ std::uint32_t bucketsOf(const struct stat &status) {
 
 UniqueFd openFile(const std::string &path, int flags) {
     return UniqueFd(open(path.c_str(), flags | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK, 0600));
-}
-
-/// Calls attempt() with growing pauses until it is true or the wait is over.
-template <typename Attempt>
-bool retry(milliseconds wait, Attempt attempt) {
-    const auto deadline = steady_clock::now() + wait;
-    for (auto pause = std::chrono::microseconds(50);;
-         pause = std::min(pause * 2, {kLongestPause})) {
-        if (attempt()) {
-            return true;
-        }
-        if (steady_clock::now() + pause > deadline) {
-            return false;
-        }
-        std::this_thread::sleep_for(pause);
-    }
-}
-
-bool lockFile(int fd, int operation) {
-    return flock(fd, operation | LOCK_NB) == 0 ||
-           retry(kLockWait, [&] { return flock(fd, operation | LOCK_NB) == 0; });
 }
 
 bool readPair(int fd, std::uint32_t index, Pair &pair) {
@@ -157,8 +132,8 @@ public:
         // The name may come to mean another file between opening and locking: a file that grew.
         for (int attempt = 0; attempt < 100; ++attempt) {
             LockedFile file;
-            file.fd_ = openFile(path, create ? O_RDWR | O_CREAT : O_RDWR);
-            if (!file.fd_) {
+            UniqueFd fd = openFile(path, create ? O_RDWR | O_CREAT : O_RDWR);
+            if (!fd) {
                 const bool hostile = errno == ELOOP || errno == EISDIR || errno == ENXIO ||
                                      errno == EACCES || errno == EPERM;
                 if (create && hostile && discard(path)) {
@@ -166,10 +141,12 @@ public:
                 }
                 return std::nullopt;
             }
-            if (!lockFile(file.fd_.get(), LOCK_EX)) {
+            auto locked = LockedFd::lock(std::move(fd), LOCK_EX, kLockWait);
+            if (!locked) {
                 OVRA_WARN("Cache file [%s] is locked for too long", path.c_str());
                 return std::nullopt;
             }
+            file.fd_ = std::move(*locked);
             struct stat status {};
             if (fstat(file.fd_.get(), &status) != 0) {
                 return std::nullopt;
@@ -226,19 +203,18 @@ public:
         // Only the holder of the lock gets here, so a left-over of the same name is dead.
         const std::string temporary = path + ".new";
         unlink(temporary.c_str());
-        UniqueFd grown = openFile(temporary, O_RDWR | O_CREAT | O_EXCL);
-        bool written = grown && flock(grown.get(), LOCK_EX | LOCK_NB) == 0 &&
-                       ftruncate(grown.get(), static_cast<off_t>(buckets * kPair)) == 0;
+        auto grown = LockedFd::lock(openFile(temporary, O_RDWR | O_CREAT | O_EXCL), LOCK_EX, {});
+        bool written = grown && ftruncate(grown->get(), static_cast<off_t>(buckets * kPair)) == 0;
         std::uint64_t total = 0;
         for (std::uint32_t index = 0; written && index < buckets_; ++index) {
-            written = split(grown.get(), index, oldest, total);
+            written = split(grown->get(), index, oldest, total);
         }
         const bool worthIt = total * kMinLoadToGrow >= std::uint64_t{buckets_} * BucketImage::kSize;
         if (!written || !worthIt || rename(temporary.c_str(), path.c_str()) != 0) {
             unlink(temporary.c_str());
             return false;
         }
-        fd_ = std::move(grown);
+        fd_ = std::move(*grown);
         buckets_ = buckets;
         return true;
     }
@@ -272,7 +248,7 @@ private:
         return unlink(path.c_str()) == 0;
     }
 
-    UniqueFd fd_;
+    LockedFd fd_;
     std::uint32_t buckets_ = 0;
     std::uint32_t index_ = 0;
     Choice choice_;
@@ -306,7 +282,7 @@ std::size_t CacheFile::maxEntrySize() {
 }
 
 std::optional<CacheEntry> CacheFile::read(std::string_view name, int attempts) const {
-    if (!checkDirectory(directoryOf(path_), false)) {
+    if (!checkDirectory(OvraBase::folderOf(path_), false)) {
         return std::nullopt;
     }
     const UniqueFd fd = openFile(path_, O_RDONLY);
@@ -322,10 +298,15 @@ std::optional<CacheEntry> CacheFile::read(std::string_view name, int attempts) c
     Pair pair;
     for (int attempt = 0; attempt <= attempts; ++attempt) {
         // Two writes during one read can spoil both copies of it. The last attempt keeps them away.
-        if (attempt == attempts && !lockFile(fd.get(), LOCK_SH)) {
+        const bool lastAttempt = attempt == attempts;
+        if (lastAttempt && !OvraBase::lockFile(fd.get(), LOCK_SH, kLockWait)) {
             return std::nullopt;
         }
-        if (!readPair(fd.get(), index, pair)) {
+        const bool whole = readPair(fd.get(), index, pair);
+        if (lastAttempt) {
+            OvraBase::unlockFile(fd.get());
+        }
+        if (!whole) {
             return std::nullopt;
         }
         const Choice choice = choose(pair, buckets, index);
@@ -343,7 +324,7 @@ bool CacheFile::write(const CacheEntry &entry, std::int64_t now) const {
                   maxEntrySize() - std::min(maxEntrySize(), entry.name.size()));
         return false;
     }
-    if (!checkDirectory(directoryOf(path_), true)) {
+    if (!checkDirectory(OvraBase::folderOf(path_), true)) {
         return false;
     }
     std::optional<LockedFile> file = LockedFile::open(path_, true);
@@ -368,14 +349,15 @@ bool CacheFile::write(const CacheEntry &entry, std::int64_t now) const {
         }
     }
     if (!file->store(image)) {
-        OVRA_WARN("Failed to write cache file [%s]: %s", path_.c_str(), strerrordesc_np(errno));
+        OVRA_WARN("Failed to write cache file [%s]: %s", path_.c_str(),
+                  OvraBase::errnoText(errno).c_str());
         return false;
     }
     return true;
 }
 
 bool CacheFile::remove(std::string_view name) const {
-    if (!checkDirectory(directoryOf(path_), false)) {
+    if (!checkDirectory(OvraBase::folderOf(path_), false)) {
         return true;
     }
     std::optional<LockedFile> file = LockedFile::open(path_, false);
@@ -402,7 +384,7 @@ thread_local std::vector<std::string> refreshing;
 RefreshLock::RefreshLock(const std::string &path, const std::string &name)
     : key_(path + '\0' + name)
     , offset_(cacheNameHash(name) >> 2) { // an offset has to be positive, with room behind it
-    if (checkDirectory(directoryOf(path), true)) {
+    if (checkDirectory(OvraBase::folderOf(path), true)) {
         file_ = openFile(path + ".lock", O_RDWR | O_CREAT);
     }
 }
@@ -410,6 +392,7 @@ RefreshLock::RefreshLock(const std::string &path, const std::string &name)
 RefreshLock::~RefreshLock() {
     if (held_) {
         refreshing.pop_back();
+        OvraBase::unlockByte(file_.get(), static_cast<off_t>(offset_));
     }
 }
 
@@ -418,21 +401,17 @@ bool RefreshLock::isHeldHere() const {
 }
 
 bool RefreshLock::tryAcquire() {
-    struct flock range {};
-    range.l_type = F_WRLCK;
-    range.l_whence = SEEK_SET;
-    range.l_start = static_cast<off_t>(offset_);
-    range.l_len = 1;
-    if (!file_ || fcntl(file_.get(), F_OFD_SETLK, &range) != 0) {
+    return acquire(0);
+}
+
+bool RefreshLock::acquire(long seconds) {
+    if (!file_ || !OvraBase::lockByte(file_.get(), static_cast<off_t>(offset_),
+                                      std::chrono::seconds(seconds))) {
         return false;
     }
     held_ = true;
     refreshing.push_back(key_);
     return true;
-}
-
-bool RefreshLock::acquire(long seconds) {
-    return retry(std::chrono::seconds(seconds), [this] { return tryAcquire(); });
 }
 
 } // namespace OvraDRCore

@@ -2,7 +2,8 @@
 #pragma once
 
 #include "cache_bucket.h"
-#include "unique_fd.h"
+
+#include <ovrabase/unique_fd.h>
 
 #include <cstdint>
 #include <optional>
@@ -55,7 +56,7 @@ public:
 private:
     std::string key_;
     std::uint64_t offset_;
-    UniqueFd file_;
+    OvraBase::UniqueFd file_;
     bool held_ = false;
 };
 

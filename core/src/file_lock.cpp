@@ -1,20 +1,19 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "ovradrcore/file_lock.h"
 
+#include <ovrabase/lock.h>
+
 #include <fcntl.h>
-#include <sys/file.h>
 #include <unistd.h>
 
 #include <cerrno>
 #include <chrono>
-#include <thread>
 
 namespace OvraDRCore {
 
 namespace {
 
 constexpr const char *kLockDir = "/run/lock/";
-constexpr std::chrono::milliseconds kRetryPause{20};
 
 /// An existing file is opened without O_CREAT: in a sticky folder the kernel may refuse O_CREAT on
 /// a file of another user (fs.protected_regular).
@@ -37,27 +36,23 @@ FileLock::~FileLock() {
 }
 
 bool FileLock::lock(int operation, unsigned int wait) {
-    const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(wait);
     if (fd_ < 0) {
         fd_ = openLockFile(path_);
     }
     if (fd_ < 0) {
         return false;
     }
-    while (flock(fd_, operation | LOCK_NB) != 0) {
-        const bool busy = errno == EWOULDBLOCK || errno == EINTR;
-        if (!busy || std::chrono::steady_clock::now() >= deadline) {
-            unlock();
-            return false;
-        }
-        std::this_thread::sleep_for(kRetryPause);
+    const bool locked =
+        static_cast<bool>(OvraBase::lockFile(fd_, operation, std::chrono::seconds(wait)));
+    if (!locked) {
+        unlock();
     }
-    return true;
+    return locked;
 }
 
 void FileLock::unlock() const {
     if (fd_ >= 0) {
-        flock(fd_, LOCK_UN); // a child forked meanwhile may hold the same open file
+        OvraBase::unlockFile(fd_);
         close(fd_);
         fd_ = -1;
     }

@@ -3,6 +3,8 @@
 
 #include "ovradrcore/log.h"
 
+#include <ovrabase/sqlite.h>
+
 #include <sqlite3.h>
 
 #include <algorithm>
@@ -13,11 +15,6 @@
 namespace OvraDRCore {
 
 namespace {
-
-struct Finalize {
-    void operator()(sqlite3_stmt *statement) const { sqlite3_finalize(statement); }
-};
-using Statement = std::unique_ptr<sqlite3_stmt, Finalize>;
 
 /// The row as named values. A NULL, a floating-point number and an integer over 32 bits have no
 /// place in a record: such a column reads as absent.
@@ -52,28 +49,19 @@ bool isBlank(const char *tail, const char *end) {
 } // namespace
 
 void SqliteDB::Close::operator()(sqlite3 *db) const {
-    sqlite3_close_v2(db);
+    OvraBase::CloseSqlite()(db);
 }
 
 SqliteDB::SqliteDB(const std::string &path, unsigned int busyTime, const std::string &infoTable)
     : path_(path)
     , infoTable_(infoTable) {
-    sqlite3 *db = nullptr;
-    // NOMUTEX: an object serves one thread.
-    const int result = sqlite3_open_v2(
-        path.c_str(), &db, SQLITE_OPEN_READWRITE | SQLITE_OPEN_NOMUTEX | SQLITE_OPEN_EXRESCODE,
-        nullptr);
-    db_.reset(db);
-    if (result != SQLITE_OK) {
-        return;
-    }
     constexpr unsigned int kMilliseconds = 1000;
     const unsigned int limit = INT_MAX / kMilliseconds;
-    sqlite3_busy_timeout(db, static_cast<int>(std::min(busyTime, limit) * kMilliseconds));
-    // A misspelt column is an error, not a text: a query has to fail on another schema.
-    sqlite3_db_config(db, SQLITE_DBCONFIG_DQS_DML, 0, nullptr);
-    // A file that a stranger has put there gets no code to run.
-    sqlite3_db_config(db, SQLITE_DBCONFIG_TRUSTED_SCHEMA, 0, nullptr);
+    OvraBase::SqliteHandle database;
+    // A failure to open is found out by the first statement.
+    OvraBase::openSqlite(path, static_cast<int>(std::min(busyTime, limit) * kMilliseconds),
+                         database);
+    db_.reset(database.release());
 }
 
 SqliteDB::SqliteDB(SqliteDB &&) noexcept = default;
@@ -97,17 +85,15 @@ bool SqliteDB::run(const std::string &sql, std::vector<SqliteValueList> *rows, b
     if (sql.size() > INT_MAX) {
         return fail("the statement is too large");
     }
-    sqlite3_stmt *prepared = nullptr;
     const char *tail = nullptr;
-    int result =
-        sqlite3_prepare_v2(db_.get(), sql.data(), static_cast<int>(sql.size()), &prepared, &tail);
-    const Statement statement(prepared);
-    if (result != SQLITE_OK) {
+    const OvraBase::SqliteStatement statement = OvraBase::prepareSqlite(db_.get(), sql, &tail);
+    if (!statement && sqlite3_errcode(db_.get()) != SQLITE_OK) {
         return fail(sqlite3_errmsg(db_.get()));
     }
     if (!statement || !isBlank(tail, sql.data() + sql.size())) {
         return fail("the condition holds more than a condition");
     }
+    int result = SQLITE_OK;
     while ((result = sqlite3_step(statement.get())) == SQLITE_ROW) {
         if (rows == nullptr) {
             continue;

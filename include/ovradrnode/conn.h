@@ -1,8 +1,9 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
-#include "ovradrcore/sqlite_value.h"
 #include "ovradrnode/export.h"
+
+#include <ovradrcore/sqlite_value.h>
 
 #include <json/value.h>
 

@@ -1,12 +1,13 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
-#include "ovradrcore/err_recorder.h"
-#include "ovradrcore/request.h"
-#include "ovradrcore/response.h"
 #include "ovradrnode/conn.h"
 #include "ovradrnode/dr_node.h"
 #include "ovradrnode/export.h"
+
+#include <ovradrcore/err_recorder.h>
+#include <ovradrcore/request.h>
+#include <ovradrcore/response.h>
 
 #include <json/value.h>
 

@@ -1,9 +1,10 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
-#include "ovradrcore/sqlite_value.h"
 #include "ovradrnode/conn.h"
 #include "ovradrnode/export.h"
+
+#include <ovradrcore/sqlite_value.h>
 
 #include <json/value.h>
 

@@ -1,10 +1,11 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
-#include "ovradrcore/err_recorder.h"
-#include "ovradrcore/response.h"
 #include "ovradrnode/conn.h"
 #include "ovradrnode/export.h"
+
+#include <ovradrcore/err_recorder.h>
+#include <ovradrcore/response.h>
 
 #include <functional>
 #include <string>

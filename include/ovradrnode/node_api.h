@@ -1,9 +1,10 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
-#include "ovradrcore/request.h"
 #include "ovradrnode/conn.h"
 #include "ovradrnode/export.h"
+
+#include <ovradrcore/request.h>
 
 #include <string>
 #include <vector>

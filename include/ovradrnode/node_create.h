@@ -1,14 +1,15 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
-#include "ovradrcore/err_recorder.h"
-#include "ovradrcore/request.h"
-#include "ovradrcore/response.h"
-#include "ovradrcore/sqlite_command.h"
 #include "ovradrnode/conn.h"
 #include "ovradrnode/dr_node.h"
 #include "ovradrnode/export.h"
 #include "ovradrnode/sender.h"
+
+#include <ovradrcore/err_recorder.h>
+#include <ovradrcore/request.h>
+#include <ovradrcore/response.h>
+#include <ovradrcore/sqlite_command.h>
 
 #include <string>
 

@@ -1,11 +1,12 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
-#include "ovradrcore/sqlite_db.h"
 #include "ovradrnode/conn.h"
 #include "ovradrnode/dr_node.h"
 #include "ovradrnode/dr_node_attr.h"
 #include "ovradrnode/export.h"
+
+#include <ovradrcore/sqlite_db.h>
 
 #include <string>
 #include <vector>

@@ -1,8 +1,9 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
-#include "ovradrcore/err_recorder.h"
 #include "ovradrnode/export.h"
+
+#include <ovradrcore/err_recorder.h>
 
 #include <string>
 

@@ -1,11 +1,12 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
-#include "ovradrcore/err_recorder.h"
 #include "ovradrnode/conn.h"
 #include "ovradrnode/dr_node.h"
 #include "ovradrnode/export.h"
 #include "ovradrnode/sender.h"
+
+#include <ovradrcore/err_recorder.h>
 
 #include <string>
 

@@ -1,9 +1,10 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
-#include "ovradrcore/err_recorder.h"
-#include "ovradrcore/request.h"
 #include "ovradrnode/export.h"
+
+#include <ovradrcore/err_recorder.h>
+#include <ovradrcore/request.h>
 
 #include <json/value.h>
 

@@ -1,9 +1,10 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "ovradrnode/node_api.h"
 
-#include "ovradrcore/json.h"
-#include "ovradrcore/log.h"
 #include "words.h"
+
+#include <ovradrcore/json.h>
+#include <ovradrcore/log.h>
 
 namespace OvraDRNode::WebAPI {
 

@@ -1,11 +1,12 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "ovradrnode/cred_permission_cache.h"
 
-#include "ovradrcore/log.h"
 #include "ovradrnode/node_api.h"
 #include "ovradrnode/sender.h"
 #include "paths.h"
 #include "words.h"
+
+#include <ovradrcore/log.h>
 
 namespace OvraDRNode {
 

@@ -1,12 +1,13 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "ovradrnode/node_cache.h"
 
-#include "ovradrcore/json.h"
 #include "ovradrnode/dr_node.h"
 #include "ovradrnode/node_api.h"
 #include "ovradrnode/sender.h"
 #include "paths.h"
 #include "words.h"
+
+#include <ovradrcore/json.h>
 
 namespace OvraDRNode {
 

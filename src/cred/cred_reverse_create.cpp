@@ -1,12 +1,13 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "ovradrnode/cred_reverse_create.h"
 
-#include "ovradrcore/json.h"
-#include "ovradrcore/log.h"
 #include "ovradrnode/node_api.h"
 #include "ovradrnode/node_db.h"
 #include "ovradrnode/node_session.h"
 #include "ovradrnode/sender.h"
+
+#include <ovradrcore/json.h>
+#include <ovradrcore/log.h>
 
 namespace OvraDRNode {
 

@@ -1,12 +1,13 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "ovradrnode/cred_utils.h"
 
-#include "ovradrcore/json.h"
-#include "ovradrcore/log.h"
 #include "ovradrnode/node_api.h"
 #include "ovradrnode/node_db.h"
 #include "ovradrnode/sender.h"
 #include "words.h"
+
+#include <ovradrcore/json.h>
+#include <ovradrcore/log.h>
 
 #include <vector>
 

@@ -1,12 +1,13 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "ovradrnode/node_delete.h"
 
-#include "ovradrcore/json.h"
-#include "ovradrcore/log.h"
 #include "ovradrnode/cred_utils.h"
 #include "ovradrnode/node_cache.h"
 #include "ovradrnode/node_db.h"
 #include "words.h"
+
+#include <ovradrcore/json.h>
+#include <ovradrcore/log.h>
 
 namespace OvraDRNode {
 

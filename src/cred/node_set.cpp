@@ -1,14 +1,15 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "ovradrnode/node_set.h"
 
-#include "ovradrcore/json.h"
-#include "ovradrcore/log.h"
 #include "ovradrnode/cred_permission_cache.h"
 #include "ovradrnode/cred_utils.h"
 #include "ovradrnode/node_api.h"
 #include "ovradrnode/node_cache.h"
 #include "ovradrnode/node_db.h"
 #include "words.h"
+
+#include <ovradrcore/json.h>
+#include <ovradrcore/log.h>
 
 namespace OvraDRNode {
 

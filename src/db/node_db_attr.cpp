@@ -3,10 +3,11 @@
 
 // The attributes in the node database.
 
-#include "ovradrcore/json.h"
-#include "ovradrcore/log.h"
 #include "ovradrnode/node_db.h"
 #include "words.h"
+
+#include <ovradrcore/json.h>
+#include <ovradrcore/log.h>
 
 namespace OvraDRNode {
 

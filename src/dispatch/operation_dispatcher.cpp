@@ -1,9 +1,10 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "ovradrnode/operation_dispatcher.h"
 
-#include "ovradrcore/log.h"
 #include "ovradrnode/node_db.h"
 #include "ovradrnode/sender.h"
+
+#include <ovradrcore/log.h>
 
 namespace OvraDRNode {
 

@@ -1,9 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "ovradrnode/node.h"
 
-#include "ovradrcore/log.h"
-#include "ovradrcore/response.h"
-#include "ovradrcore/util.h"
 #include "ovradrnode/conn.h"
 #include "ovradrnode/node_api.h"
 #include "ovradrnode/node_db.h"
@@ -12,6 +9,9 @@
 #include "words.h"
 
 #include <ovracore/ovracore.h>
+#include <ovradrcore/log.h>
+#include <ovradrcore/response.h>
+#include <ovradrcore/util.h>
 
 #include <cstdio>
 #include <cstdlib>

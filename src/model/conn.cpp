@@ -1,10 +1,10 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "ovradrnode/conn.h"
 
-#include "ovradrcore/json.h"
-#include "ovradrcore/log.h"
 #include "words.h"
 
+#include <ovradrcore/json.h>
+#include <ovradrcore/log.h>
 #include <ovrawebapi/api_runner.h>
 
 namespace OvraDRNode {

@@ -3,13 +3,13 @@
 
 // The endpoints of the local appliance, and the relay.
 
-#include "ovradrcore/json.h"
-#include "ovradrcore/log.h"
-#include "ovradrcore/response.h"
 #include "ovradrnode/conn.h"
 #include "words.h"
 
 #include <ovracredential/cred_request.h>
+#include <ovradrcore/json.h>
+#include <ovradrcore/log.h>
+#include <ovradrcore/response.h>
 #include <ovranet/ovranet.h>
 #include <ovraw3/talo.h>
 #include <ovrawebapi/api_runner.h>

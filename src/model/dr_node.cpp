@@ -1,8 +1,9 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "ovradrnode/dr_node.h"
 
-#include "ovradrcore/log.h"
 #include "words.h"
+
+#include <ovradrcore/log.h>
 
 namespace OvraDRNode {
 

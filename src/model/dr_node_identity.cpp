@@ -3,14 +3,14 @@
 
 // Who the local node is.
 
-#include "ovradrcore/file_lock.h"
-#include "ovradrcore/log.h"
-#include "ovradrcore/util.h"
 #include "ovradrnode/dr_node.h"
 #include "paths.h"
 #include "words.h"
 
 #include <ovracore/ovracore.h>
+#include <ovradrcore/file_lock.h>
+#include <ovradrcore/log.h>
+#include <ovradrcore/util.h>
 
 #include <sys/file.h>
 #include <unistd.h>

@@ -1,15 +1,15 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "ovradrnode/node_session.h"
 
-#include "ovradrcore/json.h"
-#include "ovradrcore/log.h"
-#include "ovradrcore/util.h"
 #include "ovradrnode/conn.h"
 #include "ovradrnode/node_api.h"
 #include "ovradrnode/sender.h"
 #include "words.h"
 
 #include <ovracgi/ovracgi.h>
+#include <ovradrcore/json.h>
+#include <ovradrcore/log.h>
+#include <ovradrcore/util.h>
 
 #include <json-c/json_object.h>
 

@@ -2,12 +2,12 @@
 #define OVRA_LOG_FILE "sender"
 #include "transport/conn_cache.h"
 
-#include "ovradrcore/json.h"
-#include "ovradrcore/log.h"
 #include "paths.h"
 #include "words.h"
 
 #include <ovracredential/cred_request.h>
+#include <ovradrcore/json.h>
+#include <ovradrcore/log.h>
 
 #include <ctime>
 

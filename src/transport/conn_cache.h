@@ -1,8 +1,9 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
-#include "ovradrcore/cache.h"
 #include "ovradrnode/conn.h"
+
+#include <ovradrcore/cache.h>
 
 #include <json/value.h>
 

@@ -1,7 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
-#include "ovradrcore/cache.h"
+#include <ovradrcore/cache.h>
 
 #include <json/value.h>
 

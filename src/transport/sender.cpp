@@ -1,11 +1,11 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "ovradrnode/sender.h"
 
-#include "ovradrcore/json.h"
-#include "ovradrcore/log.h"
 #include "transport/conn_cache.h"
 #include "words.h"
 
+#include <ovradrcore/json.h>
+#include <ovradrcore/log.h>
 #include <ovrawebapi/api_runner.h>
 
 #include <ctime>

@@ -3,12 +3,12 @@
 
 // Senders over one endpoint and one credential.
 
-#include "ovradrcore/json.h"
-#include "ovradrcore/log.h"
 #include "ovradrnode/sender.h"
 #include "transport/conn_cache.h"
 
 #include <ovracredential/cred_request.h>
+#include <ovradrcore/json.h>
+#include <ovradrcore/log.h>
 
 #include <cstring>
 

@@ -3,12 +3,13 @@
 
 // Senders to a node: which credential is used, and what is learnt from the answer.
 
-#include "ovradrcore/json.h"
-#include "ovradrcore/log.h"
 #include "ovradrnode/cred_permission_cache.h"
 #include "ovradrnode/node_db.h"
 #include "ovradrnode/sender.h"
 #include "transport/node_valid_cred_cache.h"
+
+#include <ovradrcore/json.h>
+#include <ovradrcore/log.h>
 
 #include <vector>
 

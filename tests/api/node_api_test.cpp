@@ -1,7 +1,8 @@
 // SPDX-License-Identifier: Apache-2.0
-#include "ovradrcore/json.h"
-#include "ovradrnode/node_api.h"
 #include "support/log_capture.h"
+
+#include <ovradrcore/json.h>
+#include <ovradrnode/node_api.h>
 
 #include <gtest/gtest.h>
 

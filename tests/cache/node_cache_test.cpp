@@ -1,13 +1,14 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "clock.h"
-#include "ovradrcore/json.h"
-#include "ovradrnode/dr_node.h"
-#include "ovradrnode/node_cache.h"
 #include "support/local_node.h"
 #include "support/log_capture.h"
 #include "support/remote_node.h"
-#include "webapi/api_errors.h"
-#include "webapi/api_registry.h"
+
+#include <ovradrcore/json.h>
+#include <ovradrnode/dr_node.h>
+#include <ovradrnode/node_cache.h>
+#include <ovraplatform/api_errors.h>
+#include <ovraplatform/api_registry.h>
 
 #include <gtest/gtest.h>
 
@@ -73,7 +74,7 @@ TEST_F(NodeInfo, TheLocalNodeNeedsAWholeAnswer) {
     ASSERT_TRUE(OvraDRCore::fromString(
         data, R"({"hostname":"here","serial":"L","additional":{"timezone":"UTC"}})"));
     registry.add("OVRA.DR.Node", 1, "info", OvraPlatform::APIRight::kAdministrator,
-                 OvraPlatform::APILane::kQuick,
+                 OvraPlatform::APIQueue::kQuick,
                  [&](const Json::Value &, const OvraPlatform::APICaller &) {
                      return OvraPlatform::apiSuccess(data);
                  });

@@ -4,14 +4,15 @@
 // that somebody hinders is waited for up to 30 seconds, so whoever takes longer than kBound was
 // hindered.
 #include "clock.h"
-#include "ovradrnode/cred_permission_cache.h"
-#include "ovradrnode/node_api.h"
-#include "ovradrnode/node_cache.h"
-#include "ovradrnode/sender.h"
 #include "support/local_node.h"
 #include "support/log_capture.h"
 #include "support/misbehaving_server.h"
 #include "support/remote_node.h"
+
+#include <ovradrnode/cred_permission_cache.h>
+#include <ovradrnode/node_api.h>
+#include <ovradrnode/node_cache.h>
+#include <ovradrnode/sender.h>
 
 #include <gtest/gtest.h>
 #include <sys/mman.h>

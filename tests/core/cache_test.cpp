@@ -1,9 +1,10 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "cache_bucket.h"
 #include "clock.h"
-#include "ovradrcore/cache.h"
-#include "ovradrcore/json.h"
 #include "support/log_capture.h"
+
+#include <ovradrcore/cache.h>
+#include <ovradrcore/json.h>
 
 #include <fcntl.h>
 #include <gtest/gtest.h>

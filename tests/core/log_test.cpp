@@ -1,8 +1,9 @@
 // SPDX-License-Identifier: Apache-2.0
-#include "ovradrcore/err_recorder.h"
-#include "ovradrcore/json.h"
-#include "ovradrcore/log.h"
 #include "support/log_capture.h"
+
+#include <ovradrcore/err_recorder.h>
+#include <ovradrcore/json.h>
+#include <ovradrcore/log.h>
 
 #include <gtest/gtest.h>
 #include <unistd.h>

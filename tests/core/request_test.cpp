@@ -1,7 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
-#include "ovradrcore/json.h"
-#include "ovradrcore/request.h"
-#include "ovradrcore/response.h"
+#include <ovradrcore/json.h>
+#include <ovradrcore/request.h>
+#include <ovradrcore/response.h>
 
 #include <gtest/gtest.h>
 

@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
-#include "ovradrcore/sqlite_db.h"
 #include "support/log_capture.h"
+
+#include <ovradrcore/sqlite_db.h>
 
 #include <fcntl.h>
 #include <gtest/gtest.h>

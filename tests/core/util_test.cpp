@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-#include "ovradrcore/file_lock.h"
-#include "ovradrcore/util.h"
+#include <ovradrcore/file_lock.h>
+#include <ovradrcore/util.h>
 
 #include <gtest/gtest.h>
 #include <sys/file.h>

@@ -1,11 +1,12 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
-#include "ovradrnode/conn.h"
-#include "ovradrnode/dr_node.h"
 #include "support/local_node.h"
 #include "support/log_capture.h"
 #include "support/remote_node.h"
+
+#include <ovradrnode/conn.h>
+#include <ovradrnode/dr_node.h>
 
 #include <gtest/gtest.h>
 

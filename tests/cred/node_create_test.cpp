@@ -1,8 +1,9 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "cred/flow_fixture.h"
-#include "ovradrcore/json.h"
-#include "ovradrnode/node_cache.h"
-#include "ovradrnode/node_create.h"
+
+#include <ovradrcore/json.h>
+#include <ovradrnode/node_cache.h>
+#include <ovradrnode/node_create.h>
 
 #include <unistd.h>
 

@@ -1,8 +1,9 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "cred/flow_fixture.h"
-#include "ovradrnode/cred_utils.h"
-#include "ovradrnode/node_cache.h"
-#include "ovradrnode/node_delete.h"
+
+#include <ovradrnode/cred_utils.h>
+#include <ovradrnode/node_cache.h>
+#include <ovradrnode/node_delete.h>
 
 using namespace OvraDRNode;
 using namespace OvraTest;

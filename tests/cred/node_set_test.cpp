@@ -1,9 +1,10 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "cred/flow_fixture.h"
-#include "ovradrcore/json.h"
-#include "ovradrnode/cred_permission_cache.h"
-#include "ovradrnode/node_cache.h"
-#include "ovradrnode/node_set.h"
+
+#include <ovradrcore/json.h>
+#include <ovradrnode/cred_permission_cache.h>
+#include <ovradrnode/node_cache.h>
+#include <ovradrnode/node_set.h>
 
 using namespace OvraDRNode;
 using namespace OvraTest;

@@ -1,10 +1,11 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "cred/flow_fixture.h"
-#include "ovradrcore/json.h"
-#include "ovradrnode/cred_reverse_create.h"
-#include "ovradrnode/node_session.h"
-#include "webapi/api_errors.h"
-#include "webapi/api_registry.h"
+
+#include <ovradrcore/json.h>
+#include <ovradrnode/cred_reverse_create.h>
+#include <ovradrnode/node_session.h>
+#include <ovraplatform/api_errors.h>
+#include <ovraplatform/api_registry.h>
 
 using namespace OvraDRNode;
 using namespace OvraTest;
@@ -26,7 +27,7 @@ protected:
             remote.before(call, [this, call] { noteSession(call); });
         }
         users.add("OVRA.Core.User", 1, "get", OvraPlatform::APIRight::kAdministrator,
-                  OvraPlatform::APILane::kQuick,
+                  OvraPlatform::APIQueue::kQuick,
                   [](const Json::Value &params, const OvraPlatform::APICaller &) {
                       return params["name"] == "joe" ? OvraPlatform::apiSuccess()
                                                      : OvraPlatform::apiError(1);

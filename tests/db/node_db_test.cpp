@@ -1,7 +1,8 @@
 // SPDX-License-Identifier: Apache-2.0
-#include "ovradrnode/node_db.h"
 #include "support/local_node.h"
 #include "support/log_capture.h"
+
+#include <ovradrnode/node_db.h>
 
 #include <gtest/gtest.h>
 #include <unistd.h>

@@ -1,10 +1,11 @@
 // SPDX-License-Identifier: Apache-2.0
-#include "ovradrnode/dr_node.h"
-#include "ovradrnode/node_api.h"
-#include "ovradrnode/operation_dispatcher.h"
 #include "support/local_node.h"
 #include "support/log_capture.h"
 #include "support/remote_node.h"
+
+#include <ovradrnode/dr_node.h>
+#include <ovradrnode/node_api.h>
+#include <ovradrnode/operation_dispatcher.h>
 
 #include <gtest/gtest.h>
 

@@ -6,31 +6,46 @@ set -euo pipefail
 . "$(dirname "$0")/expect.sh"
 trap 'rm -rf "$scratch"' EXIT
 
-layersRefuseAnUpwardInclude() {
-    mkdir -p "$scratch"/{core/src,src/{model,transport,cache},platform/linux/net,apps/x}
+layersRefuseWhatIsAbovePrivateOrASibling() {
+    mkdir -p "$scratch"/{base/src,core/src,src/{model,transport,cache,cred},platform/linux/{trust,include/ovraplatform},apps/{one,two,service,shared}}
     put() { printf '#include %s\n' "$2" >"$scratch/$1"; }
     put src/transport/sender.cpp '"ovradrnode/node_cache.h"'
+    put src/transport/conn_cache.h '<ovradrcore/cache.h>'
     put src/cache/node_cache.cpp '"ovradrnode/sender.h"'
-    put platform/linux/net/link_addresses.h '<ovradrcore/log.h>'
     put src/words.h '<string>'
-    put apps/x/main.cpp '<ovradrnode/ovradrnode.h>'
+    put core/src/cache_file.h '<ovrabase/file.h>'
+    put platform/linux/trust/verifier.h '<ovradrcore/log.h>'
+    put platform/linux/trust/verifier.cpp '"ovraplatform/trust.h"'
+    put apps/one/main.cpp '<ovradrnode/ovradrnode.h>'
+    put apps/one/only_one.h '"service/http_server.h"'
+    put apps/service/http_server.h '<ovraplatform/trust.h>'
+    put apps/shared/session.h '<ovradrnode/sender.h>'
     exitCodeOf "$root/tools/check-layers" "$scratch"
-    same "two layers that belong together" "$code" 0
+    same "front doors and ways down: $output" "$code" 0
 
-    local file include
-    while read -r file include; do
+    local file include reason
+    while read -r file include reason; do
         put "$file" "$include"
         exitCodeOf "$root/tools/check-layers" "$scratch"
         same "$file includes $include" "$code" 1
         holds "$file includes $include" "$output" "$file:1:"
+        holds "$file includes $include" "$output" "$reason"
         rm "$scratch/$file"
     done <<-'END'
-	core/src/cache.cpp "ovradrnode/conn.h"
-	src/model/conn.cpp "ovradrnode/node_db.h"
-	src/model/dr_node.cpp "net/link_addresses.h"
-	src/transport/x.cpp <ovradrnode/operation_dispatcher.h>
-	platform/linux/net/x.cpp "ovradrnode/conn.h"
-	apps/x/x.cpp "words.h"
+	base/src/x.cpp <ovradrcore/log.h> not below
+	core/src/x.cpp "ovradrnode/conn.h" not below
+	src/model/x.cpp "ovradrnode/node_db.h" not below
+	src/model/y.cpp <ovraplatform/trust.h> not below
+	src/transport/x.cpp <ovradrnode/operation_dispatcher.h> not below
+	platform/linux/trust/x.cpp "ovradrnode/conn.h" not below
+	apps/service/x.cpp <ovradrnode/sender.h> not below
+	apps/one/x.cpp "words.h" private to src
+	apps/one/y.cpp "trust/verifier.h" private to platform/linux
+	src/cred/x.cpp "transport/conn_cache.h" private to src/transport
+	platform/linux/trust/y.cpp "cache_file.h" private to core
+	apps/two/x.cpp "only_one.h" sibling
+	apps/two/y.cpp "one/only_one.h" sibling
+	apps/shared/x.cpp "service/http_server.h" sibling
 	END
 }
 

@@ -1,8 +1,9 @@
 // SPDX-License-Identifier: Apache-2.0
-#include "ovradrnode/node.h"
 #include "support/local_node.h"
 #include "support/log_capture.h"
 #include "support/remote_node.h"
+
+#include <ovradrnode/node.h>
 
 #include <gtest/gtest.h>
 #include <sys/stat.h>

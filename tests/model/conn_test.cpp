@@ -1,9 +1,10 @@
 // SPDX-License-Identifier: Apache-2.0
-#include "ovradrcore/json.h"
-#include "ovradrnode/conn.h"
 #include "support/log_capture.h"
-#include "webapi/api_errors.h"
-#include "webapi/api_registry.h"
+
+#include <ovradrcore/json.h>
+#include <ovradrnode/conn.h>
+#include <ovraplatform/api_errors.h>
+#include <ovraplatform/api_registry.h>
 
 #include <gtest/gtest.h>
 
@@ -106,7 +107,7 @@ TEST(LocalConn, EveryAddressIsListedWithBothPortsThenTheRelay) {
     OvraPlatform::APIRegistry registry;
     Json::Value farlink;
     registry.add("OVRA.Core.Farlink", 1, "get", OvraPlatform::APIRight::kAdministrator,
-                 OvraPlatform::APILane::kQuick,
+                 OvraPlatform::APIQueue::kQuick,
                  [&](const Json::Value &, const OvraPlatform::APICaller &caller) {
                      EXPECT_EQ(caller.user, "admin");
                      return OvraPlatform::apiSuccess(farlink);

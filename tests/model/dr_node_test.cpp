@@ -1,10 +1,11 @@
 // SPDX-License-Identifier: Apache-2.0
-#include "ovradrcore/file_lock.h"
-#include "ovradrcore/json.h"
-#include "ovradrnode/dr_node.h"
-#include "ovradrnode/dr_node_attr.h"
 #include "support/local_node.h"
 #include "support/log_capture.h"
+
+#include <ovradrcore/file_lock.h>
+#include <ovradrcore/json.h>
+#include <ovradrnode/dr_node.h>
+#include <ovradrnode/dr_node_attr.h>
 
 #include <gtest/gtest.h>
 #include <sys/file.h>

@@ -1,7 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
-#include "core/appliance.h"
+#include <ovraplatform/appliance.h>
 
 #include <gtest/gtest.h>
 #include <sys/resource.h>

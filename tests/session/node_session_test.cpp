@@ -1,11 +1,11 @@
 // SPDX-License-Identifier: Apache-2.0
-#include "ovradrnode/node_session.h"
 #include "support/local_node.h"
 #include "support/log_capture.h"
-#include "webapi/api_errors.h"
-#include "webapi/api_registry.h"
 
 #include <ovracgi/ovracgi.h>
+#include <ovradrnode/node_session.h>
+#include <ovraplatform/api_errors.h>
+#include <ovraplatform/api_registry.h>
 
 #include <gtest/gtest.h>
 #include <json-c/json_object.h>
@@ -43,7 +43,7 @@ protected:
     void SetUp() override {
         OvraTest::provisionNode();
         users.add("OVRA.Core.User", 1, "get", OvraPlatform::APIRight::kAdministrator,
-                  OvraPlatform::APILane::kQuick,
+                  OvraPlatform::APIQueue::kQuick,
                   [](const Json::Value &params, const OvraPlatform::APICaller &) {
                       const std::string name = params["name"].asString();
                       return name == "joe" || name == "ann" ? apiSuccess() : apiError(1);

@@ -1,7 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "support/remote_node.h"
 
-#include "ovradrcore/json.h"
+#include <ovradrcore/json.h>
 
 #include <unistd.h>
 
@@ -23,8 +23,7 @@ std::optional<SealingDaemon::Reply> RemoteNode::prepared(const std::string &call
 }
 
 Answer RemoteNode::respond(const Received &received) {
-    std::string why;
-    const auto call = OvraPlatform::decodeForm(received.body, why);
+    const auto call = OvraPlatform::decodeForm(received.body);
     const bool ownKey = call && call->method == "getinfo" && prepared("getinfo");
     if (call && !ownKey) {
         return daemon_.answer(received);

@@ -1,12 +1,12 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
-#include "credential/sealed_box.h"
-#include "credential/wire_form.h"
 #include "support/misbehaving_server.h"
-#include "webapi/api_errors.h"
 
 #include <ovradrcore/json.h>
+#include <ovraplatform/api_errors.h>
+#include <ovraplatform/sealed_box.h>
+#include <ovraplatform/wire_form.h>
 
 #include <functional>
 #include <mutex>
@@ -36,9 +36,8 @@ public:
 
     /// Has another key from now on.
     void newKey(const std::string &keyFile) {
-        std::string why;
         const std::lock_guard<std::mutex> lock(mutex_);
-        keys_ = OvraPlatform::SealKeyPair::loadOrCreate(keyFile, why);
+        keys_ = OvraPlatform::SealKeyPair::loadOrCreate(keyFile).value();
     }
 
     std::string fingerprint() {
@@ -48,10 +47,9 @@ public:
 
     Answer answer(const Received &request) {
         using namespace OvraPlatform;
-        std::string why;
-        const auto visible = decodeForm(request.body, why);
+        const auto visible = decodeForm(request.body);
         if (!visible) {
-            return document(apiError(APIError::kBadRequest, why));
+            return document(apiError(APIError::kBadRequest, visible.error()));
         }
         OpenedRequest opened;
         SealVerdict verdict = SealVerdict::kOpened;

@@ -3,13 +3,13 @@
 // How every error number of the credential library is taken, with a double of that library that
 // fails where it is told to: the real one cannot be made to give them all.
 
-#include "ovradrcore/json.h"
-#include "ovradrnode/node_api.h"
-#include "ovradrnode/sender.h"
 #include "support/log_capture.h"
 #include "transport/conn_cache.h"
 
 #include <ovracredential/cred_request.h>
+#include <ovradrcore/json.h>
+#include <ovradrnode/node_api.h>
+#include <ovradrnode/sender.h>
 
 #include <gtest/gtest.h>
 

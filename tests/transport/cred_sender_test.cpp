@@ -1,11 +1,12 @@
 // SPDX-License-Identifier: Apache-2.0
-#include "ovradrcore/json.h"
-#include "ovradrnode/node_api.h"
-#include "ovradrnode/sender.h"
 #include "support/local_node.h"
 #include "support/log_capture.h"
 #include "support/remote_node.h"
 #include "transport/conn_cache.h"
+
+#include <ovradrcore/json.h>
+#include <ovradrnode/node_api.h>
+#include <ovradrnode/sender.h>
 
 #include <gtest/gtest.h>
 

@@ -1,14 +1,15 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "clock.h"
-#include "ovradrcore/json.h"
-#include "ovradrnode/cred_permission_cache.h"
-#include "ovradrnode/node_api.h"
-#include "ovradrnode/node_candidates.h"
-#include "ovradrnode/sender.h"
 #include "support/local_node.h"
 #include "support/remote_node.h"
 #include "transport/conn_cache.h"
 #include "transport/node_valid_cred_cache.h"
+
+#include <ovradrcore/json.h>
+#include <ovradrnode/cred_permission_cache.h>
+#include <ovradrnode/node_api.h>
+#include <ovradrnode/node_candidates.h>
+#include <ovradrnode/sender.h>
 
 #include <gtest/gtest.h>
 

@@ -1,16 +1,17 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "clock.h"
-#include "ovradrcore/json.h"
-#include "ovradrnode/cred_permission_cache.h"
-#include "ovradrnode/node_api.h"
-#include "ovradrnode/sender.h"
 #include "support/local_node.h"
 #include "support/log_capture.h"
 #include "support/remote_node.h"
 #include "transport/conn_cache.h"
 #include "transport/node_valid_cred_cache.h"
-#include "webapi/api_errors.h"
-#include "webapi/api_registry.h"
+
+#include <ovradrcore/json.h>
+#include <ovradrnode/cred_permission_cache.h>
+#include <ovradrnode/node_api.h>
+#include <ovradrnode/sender.h>
+#include <ovraplatform/api_errors.h>
+#include <ovraplatform/api_registry.h>
 
 #include <gtest/gtest.h>
 #include <unistd.h>
@@ -155,7 +156,7 @@ TEST_F(NodeSend, TheLocalNodeNeedsNeitherDatabaseNorCache) {
     unlink(kNodeDatabase);
     OvraPlatform::APIRegistry registry;
     registry.add("OVRA.DR.Node", 1, "info", OvraPlatform::APIRight::kAdministrator,
-                 OvraPlatform::APILane::kQuick,
+                 OvraPlatform::APIQueue::kQuick,
                  [](const Json::Value &, const OvraPlatform::APICaller &) {
                      Json::Value data;
                      data["hostname"] = "here";

@@ -1,13 +1,14 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "clock.h"
-#include "ovradrcore/json.h"
-#include "ovradrnode/sender.h"
 #include "support/local_node.h"
 #include "support/log_capture.h"
 #include "support/remote_node.h"
 #include "transport/conn_cache.h"
-#include "webapi/api_errors.h"
-#include "webapi/api_registry.h"
+
+#include <ovradrcore/json.h>
+#include <ovradrnode/sender.h>
+#include <ovraplatform/api_errors.h>
+#include <ovraplatform/api_registry.h>
 
 #include <gtest/gtest.h>
 #include <sys/wait.h>
@@ -132,7 +133,8 @@ TEST_F(Probe, AStoredValueThatIsNoVerdictReadsAsConnectableAndIsAskedAgain) {
 
 TEST(LocalRun, ReachesTheHandlerAsTheAdministratorAndWrapsWhatItSays) {
     OvraPlatform::APIRegistry registry;
-    registry.add("A", 1, "m", OvraPlatform::APIRight::kAdministrator, OvraPlatform::APILane::kQuick,
+    registry.add("A", 1, "m", OvraPlatform::APIRight::kAdministrator,
+                 OvraPlatform::APIQueue::kQuick,
                  [](const Json::Value &params, const OvraPlatform::APICaller &caller) {
                      EXPECT_EQ(caller.user, "admin");
                      return OvraPlatform::apiError(777, params["x"]);

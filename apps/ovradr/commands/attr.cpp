@@ -17,8 +17,8 @@ namespace {
 using OvraDRNode::DRNodeAttr;
 using OvraDRNode::DRNodeDB;
 
-constexpr std::size_t kLongestName = 255;
-constexpr std::size_t kLongestValue = std::size_t{64} * 1024;
+constexpr std::size_t kMaxName = 255;
+constexpr std::size_t kMaxValue = std::size_t{64} * 1024;
 
 struct AttrOptions {
     std::string node;
@@ -28,11 +28,11 @@ struct AttrOptions {
 };
 
 std::string checkName(const std::string &name) {
-    return name.empty() || name.size() > kLongestName ? "a name has 1 to 255 bytes" : "";
+    return name.empty() || name.size() > kMaxName ? "a name has 1 to 255 bytes" : "";
 }
 
 std::string checkValue(const std::string &value) {
-    return value.size() > kLongestValue ? "a value has at most 64 KiB" : "";
+    return value.size() > kMaxValue ? "a value has at most 64 KiB" : "";
 }
 
 /// Every attribute that the application keeps about the node; `options.node` is a node id.

@@ -23,8 +23,8 @@ using OvraDRCore::Request;
 using OvraDRCore::Response;
 namespace ERR = OvraDRCore::ERR;
 
-constexpr long kLongestTimeout = 24L * 60 * 60;
-constexpr std::size_t kLongestParams = std::size_t{8} * 1024 * 1024; // as large as a reply may be
+constexpr long kMaxTimeout = 24L * 60 * 60;
+constexpr std::size_t kMaxParams = std::size_t{8} * 1024 * 1024; // as large as a reply may be
 
 struct CallOptions {
     std::string node;
@@ -75,11 +75,11 @@ Expected<Json::Value> readParameters(const std::string &path) {
         file.open(path);
     }
     std::istream &input = path == "-" ? std::cin : file;
-    std::string text(kLongestParams + 1, '\0');
+    std::string text(kMaxParams + 1, '\0');
     input.read(text.data(), static_cast<std::streamsize>(text.size()));
     text.resize(static_cast<std::size_t>(input.gcount()));
     Json::Value params;
-    if (input.bad() || text.size() > kLongestParams || !OvraDRCore::fromString(params, text) ||
+    if (input.bad() || text.size() > kMaxParams || !OvraDRCore::fromString(params, text) ||
         !params.isObject()) {
         return failure(ExitCode::kUsage, path + " cannot be read, or holds no JSON object.",
                        "Give a file that holds one object with all parameters.");
@@ -212,7 +212,7 @@ void addCallCommand(CLI::App &app, Command &chosen) {
     command->add_option("--cred", options->credId, "Over this credential and no other");
     command->add_flag("--encrypt", options->encrypt, "Seal the parameters to the receiver");
     command->add_option("--timeout", options->timeout, "Seconds to wait for the answer")
-        ->check(CLI::Range(1L, kLongestTimeout));
+        ->check(CLI::Range(1L, kMaxTimeout));
     command->footer("Secrets in the answer show as ***. A parameter that is a secret belongs into "
                     "--params-file.\n"
                     "Examples:\n"

@@ -5,7 +5,7 @@
 #include "target.h"
 #include "trust.h"
 
-#include <credential/trust_store.h>
+#include <ovraplatform/trust_store.h>
 
 #include <algorithm>
 #include <chrono>

@@ -8,8 +8,7 @@
 #include <ovradrnode/cred_reverse_create.h>
 #include <ovradrnode/node_api.h>
 #include <ovradrnode/sender.h>
-
-#include <webapi/api_errors.h>
+#include <ovraplatform/api_errors.h>
 
 #include <memory>
 #include <vector>

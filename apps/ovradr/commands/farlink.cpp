@@ -7,9 +7,8 @@
 #include <ovradrcore/json.h>
 #include <ovradrcore/response.h>
 #include <ovradrnode/sender.h>
-
-#include <credential/farlink.h>
-#include <webapi/api_errors.h>
+#include <ovraplatform/api_errors.h>
+#include <ovraplatform/farlink.h>
 
 #include <cctype>
 #include <memory>
@@ -80,10 +79,9 @@ Failure serviceFailure(const FarlinkSettings &settings, const FarlinkReply &repl
 }
 
 Expected<FarlinkKey> ownKey() {
-    std::string why;
-    const auto key = FarlinkKey::loadOrCreate(why);
+    const auto key = FarlinkKey::loadOrCreate();
     if (!key) {
-        return failure(ExitCode::kNotSetUp, "No key for the relay service: " + why + ".",
+        return failure(ExitCode::kNotSetUp, "No key for the relay service: " + key.error() + ".",
                        "Run `ovradr setup` as root first.");
     }
     return *key;

@@ -3,17 +3,17 @@
 #include "output.h"
 #include "provision/data_files.h"
 #include "provision/node_database.h"
-#include "provision/server_certificate.h"
+#include "service/certificate.h"
 
+#include <ovrabase/address.h>
+#include <ovrabase/number.h>
 #include <ovracore/ovracore.h>
 #include <ovradrcore/util.h>
 #include <ovradrnode/dr_node.h>
 #include <ovranet/ovranet.h>
+#include <ovraplatform/appliance.h>
+#include <ovraplatform/sealed_box.h>
 
-#include <arpa/inet.h>
-#include <core/appliance.h>
-#include <credential/sealed_box.h>
-#include <netinet/in.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -30,7 +30,6 @@ using OvraPlatform::ApplianceConfig;
 
 constexpr std::size_t kMaxHostname = 253; // RFC 1035, 2.3.4, as text
 constexpr std::size_t kMaxSerial = 64;
-constexpr int kHighestPort = 65535;
 constexpr int kMaxInterfaces = 32;
 
 /// The settings that were given; those that were not stay as they are.
@@ -67,9 +66,7 @@ std::string checkAddresses(const std::string &text) {
     for (std::size_t begin = 0; begin < text.size();) {
         const std::size_t comma = std::min(text.find(',', begin), text.size());
         const std::string address = text.substr(begin, comma - begin);
-        in6_addr parsed{};
-        if (inet_pton(AF_INET, address.c_str(), &parsed) != 1 &&
-            inet_pton(AF_INET6, address.c_str(), &parsed) != 1) {
+        if (!OvraBase::isNumericAddress(address)) {
             return "\"" + address + "\" is not a numeric IPv4 or IPv6 address";
         }
         begin = comma + 1;
@@ -144,11 +141,11 @@ Trouble checkFile() {
                    "Correct the file and run `ovradr setup` again.");
 }
 
-ServerNames serverNames() {
+OvraService::ServerNames serverNames() {
     std::array<OLIBNetInterface, kMaxInterfaces> interfaces{};
     const int count = OLIBNetGetInterfaceInfo(interfaces.data(), kMaxInterfaces,
                                               OLIB_NET_SELECT_IPV4 | OLIB_NET_SELECT_IPV6);
-    ServerNames names{OvraDRNode::DRNode::getLocalHostName(), {}};
+    OvraService::ServerNames names{OvraDRNode::DRNode::getLocalHostName(), {}};
     for (int i = 0; i < count; ++i) {
         names.addresses.emplace_back(interfaces.at(static_cast<std::size_t>(i)).address);
     }
@@ -157,14 +154,46 @@ ServerNames serverNames() {
 
 Expected<SetUpStep> provisionSealKey(std::string &fingerprint) {
     const bool there = access(OvraPlatform::kSealKeyFile, F_OK) == 0;
-    std::string why;
-    const auto keys = OvraPlatform::SealKeyPair::loadOrCreate(OvraPlatform::kSealKeyFile, why);
+    const auto keys = OvraPlatform::SealKeyPair::loadOrCreate(OvraPlatform::kSealKeyFile);
     if (!keys) {
-        return failure(ExitCode::kNotSetUp, "No sealing key: " + why + ".",
+        return failure(ExitCode::kNotSetUp, "No sealing key: " + keys.error() + ".",
                        "Correct that and run `ovradr setup` again.");
     }
     fingerprint = OvraPlatform::fingerprintOf(keys->publicKey());
     return SetUpStep{"sealing key", !there, OvraPlatform::kSealKeyFile};
+}
+
+Failure keyFailure(const std::string &path, const OvraBase::Error &why) {
+    if (why.number != 0) {
+        return fileFailure(path, why.number);
+    }
+    return failure(ExitCode::kNotSetUp, why.text + ".",
+                   "Restore the file from a backup, or move it away and run `ovradr setup` again; "
+                   "who has trusted the old key will be warned.");
+}
+
+Expected<SetUpStep> provisionTlsKey() {
+    using OvraPlatform::kTlsKeyFile;
+    const OvraBase::Expected<bool> made = OvraService::createTlsKey(kTlsKeyFile);
+    if (!made) {
+        return keyFailure(kTlsKeyFile, made.error());
+    }
+    const Expected<bool> tightened = makePrivate(kTlsKeyFile);
+    if (!tightened) {
+        return tightened.failure();
+    }
+    return SetUpStep{"HTTPS key", *made,
+                     std::string(kTlsKeyFile) + (*tightened ? ", now closed to other users" : "")};
+}
+
+Expected<SetUpStep> provisionCertificate() {
+    using OvraPlatform::kTlsCertificateFile;
+    const OvraBase::Expected<bool> made = OvraService::createCertificate(
+        kTlsCertificateFile, OvraPlatform::kTlsKeyFile, serverNames());
+    if (!made) {
+        return keyFailure(kTlsCertificateFile, made.error());
+    }
+    return SetUpStep{"HTTPS certificate", *made, kTlsCertificateFile};
 }
 
 Expected<SetUpStep> provisionNodeId(std::string &nodeId) {
@@ -220,13 +249,11 @@ Outcome setUp(const Settings &settings) {
         return *trouble;
     }
     SetUp done;
-    using OvraPlatform::kTlsCertificateFile;
-    using OvraPlatform::kTlsKeyFile;
     const std::vector<std::function<Expected<SetUpStep>()>> steps = {
         [&settings] { return writeSettings(settings); },
         [&schema] { return provisionNodeDatabase(nodeDatabasePath(), *schema); },
-        [] { return provisionTlsKey(kTlsKeyFile); },
-        [] { return provisionCertificate(kTlsCertificateFile, kTlsKeyFile, serverNames()); },
+        provisionTlsKey,
+        provisionCertificate,
         [&done] { return provisionSealKey(done.httpFingerprint); },
         [&done] { return provisionNodeId(done.nodeId); },
         [] { return provisionScripts(); },
@@ -241,7 +268,7 @@ Outcome setUp(const Settings &settings) {
     if (const Trouble trouble = checkFile()) {
         return *trouble;
     }
-    done.httpsFingerprint = certificateFingerprint(kTlsCertificateFile);
+    done.httpsFingerprint = OvraService::certificateFingerprint(OvraPlatform::kTlsCertificateFile);
     return report(done);
 }
 
@@ -261,9 +288,9 @@ void addSetupCommand(CLI::App &app, Command &chosen) {
                      "Numeric addresses to serve at, separated by commas; \"\" for all")
         ->check(checkAddresses);
     command->add_option("--http-port", settings->httpPort, "Port for HTTP (5000)")
-        ->check(CLI::Range(1, kHighestPort));
+        ->check(CLI::Range(1, OvraBase::kMaxPort));
     command->add_option("--https-port", settings->httpsPort, "Port for HTTPS (5001)")
-        ->check(CLI::Range(1, kHighestPort));
+        ->check(CLI::Range(1, OvraBase::kMaxPort));
     command->footer("What is there already stays as it is.\n"
                     "Examples:\n"
                     "  ovradr setup\n"

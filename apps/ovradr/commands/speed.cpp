@@ -21,9 +21,9 @@ using OvraDRCore::ErrRecorder;
 using OvraDRCore::Response;
 using OvraDRNode::Conn;
 
-constexpr int kMostRetries = 10;
-constexpr int kMostSeconds = 45; // the other appliance has a minute for its answer
-constexpr int kMostUrlSeconds = 600;
+constexpr int kMaxRetries = 10;
+constexpr int kMaxSeconds = 45; // the other appliance has a minute for its answer
+constexpr int kMaxUrlSeconds = 600;
 
 struct SpeedOptions {
     std::string node;
@@ -178,7 +178,7 @@ Outcome measure(const SpeedOptions &options) {
     if (!options.url.empty()) {
         return measureUrl(options);
     }
-    if (options.seconds > kMostSeconds) {
+    if (options.seconds > kMaxSeconds) {
         return failure(ExitCode::kUsage, "A node gets 45 seconds at most.",
                        "Give a smaller --timeout.");
     }
@@ -195,11 +195,11 @@ void addSpeedCommand(CLI::App &app, Command &chosen) {
                         "The node that downloads from this one: a node id, or the beginning of it");
     command->add_option("--url", options->url, "Download from this URL to here instead");
     command->add_option("--retries", options->retries, "Further attempts at each endpoint (1)")
-        ->check(CLI::Range(0, kMostRetries));
+        ->check(CLI::Range(0, kMaxRetries));
     command
         ->add_option("--timeout", options->seconds,
                      "Seconds for each endpoint (15), at most 45; 600 with --url")
-        ->check(CLI::Range(1, kMostUrlSeconds));
+        ->check(CLI::Range(1, kMaxUrlSeconds));
     command->footer(
         "The endpoints of this appliance are tried one after the other until one works.\n"
         "Examples:\n"

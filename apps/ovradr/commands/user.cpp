@@ -3,11 +3,10 @@
 #include "output.h"
 
 #include <ovradrnode/dr_node.h>
+#include <ovraplatform/account_store.h>
+#include <ovraplatform/session_store.h>
+#include <ovraplatform/totp.h>
 
-#include <cgi/account_store.h>
-#include <cgi/session_store.h>
-#include <cgi/totp.h>
-#include <sodium.h>
 #include <unistd.h>
 
 #include <cctype>
@@ -183,7 +182,7 @@ Outcome switchTotpOn(AccountStore &store, const std::string &name) {
                   " needs a one-time code from now on. Give this to its authenticator; it is not "
                   "shown again.\n" +
                   listing({{"URI", uri}, {"secret", secret}});
-    sodium_memzero(secret.data(), secret.size());
+    OvraBase::wipe(secret);
     return report;
 }
 

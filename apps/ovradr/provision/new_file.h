@@ -3,10 +3,7 @@
 
 #include "failure.h"
 
-#include <sys/types.h>
-
 #include <string>
-#include <string_view>
 
 namespace Ovradr {
 
@@ -16,10 +13,6 @@ struct SetUpStep {
     bool made = false;  ///< otherwise it was there, and stays as it was
     std::string detail; ///< where it is, and what else is worth knowing
 };
-
-/// Makes a file, whole and durable, unless it is there: an existing one is never replaced, also
-/// when another process makes it at the same time. \return whether this call made it
-Expected<bool> writeNewFile(const std::string &path, std::string_view content, mode_t mode);
 
 /// Takes away what others may do with a file that is only ours.
 /// \return whether they could do something

@@ -1,19 +1,18 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "provision/node_database.h"
 
+#include <ovrabase/file.h>
+#include <ovrabase/sqlite.h>
+#include <ovrabase/unique_fd.h>
 #include <ovradrnode/node_db.h>
+#include <ovraplatform/appliance.h>
 
-#include <core/appliance.h>
-#include <core/unique_fd.h>
 #include <fcntl.h>
 #include <sqlite3.h>
 #include <unistd.h>
 
 #include <array>
 #include <cerrno>
-#include <fstream>
-#include <memory>
-#include <sstream>
 
 namespace Ovradr {
 
@@ -28,22 +27,13 @@ constexpr std::array kQueries = {
     "SELECT node_id, app, attr, value FROM node_attr",
 };
 
-struct CloseDatabase {
-    void operator()(sqlite3 *database) const { sqlite3_close_v2(database); }
-};
-struct Finalize {
-    void operator()(sqlite3_stmt *statement) const { sqlite3_finalize(statement); }
-};
-using Database = std::unique_ptr<sqlite3, CloseDatabase>;
-using Statement = std::unique_ptr<sqlite3_stmt, Finalize>;
-
 Failure unusable(const std::string &path, const std::string &why, const std::string &hint) {
     return failure(ExitCode::kNotSetUp,
                    "The node database " + path + " cannot be used: " + why + ".", hint);
 }
 
 Failure sqliteFailure(const std::string &path, sqlite3 *database) {
-    return unusable(path, database == nullptr ? "out of memory" : sqlite3_errmsg(database),
+    return unusable(path, OvraBase::sqliteText(database, SQLITE_NOMEM),
                     "Correct that, or restore the file from a backup; setup never replaces it.");
 }
 
@@ -61,21 +51,16 @@ Failure foreignDatabase(const std::string &path) {
 
 /// The number that a query gives; nothing when it cannot be run or gives none.
 std::optional<int> numberOf(sqlite3 *database, const char *sql) {
-    sqlite3_stmt *prepared = nullptr;
-    const int result = sqlite3_prepare_v2(database, sql, -1, &prepared, nullptr);
-    const Statement statement(prepared);
-    if (result != SQLITE_OK || sqlite3_step(prepared) != SQLITE_ROW ||
-        sqlite3_column_type(prepared, 0) != SQLITE_INTEGER) {
+    const OvraBase::SqliteStatement statement = OvraBase::prepareSqlite(database, sql);
+    if (!statement || sqlite3_step(statement.get()) != SQLITE_ROW ||
+        sqlite3_column_type(statement.get(), 0) != SQLITE_INTEGER) {
         return std::nullopt;
     }
-    return sqlite3_column_int(prepared, 0);
+    return sqlite3_column_int(statement.get(), 0);
 }
 
 bool canPrepare(sqlite3 *database, const char *sql) {
-    sqlite3_stmt *prepared = nullptr;
-    const int result = sqlite3_prepare_v2(database, sql, -1, &prepared, nullptr);
-    const Statement statement(prepared);
-    return result == SQLITE_OK;
+    return OvraBase::prepareSqlite(database, sql) != nullptr;
 }
 
 bool execute(sqlite3 *database, const char *sql) {
@@ -99,14 +84,12 @@ Trouble checkSchema(sqlite3 *database, const std::string &path) {
 }
 
 Expected<std::string> readSchema(const std::string &schemaFile) {
-    std::ifstream file(schemaFile);
-    std::ostringstream text;
-    text << file.rdbuf();
-    if (!file || text.str().empty()) {
+    const OvraBase::Expected<std::string> text = OvraBase::readFile(schemaFile);
+    if (!text || text->empty()) {
         return failure(ExitCode::kNotSetUp, schemaFile + " cannot be read.",
                        "Install the program again.");
     }
-    return text.str();
+    return *text;
 }
 
 /// Fills an empty database; true when it was empty.
@@ -130,7 +113,7 @@ Expected<bool> fill(sqlite3 *database, const std::string &path, const std::strin
 
 /// SQLite would make a file that others can read.
 Trouble touchPrivate(const std::string &path) {
-    const OvraPlatform::UniqueFd fd(open(path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0600));
+    const OvraBase::UniqueFd fd(open(path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0600));
     if (!fd) {
         return fileFailure(path, errno);
     }
@@ -152,19 +135,11 @@ Expected<SetUpStep> provisionNodeDatabase(const std::string &path, const std::st
     if (const Trouble trouble = touchPrivate(path)) {
         return *trouble;
     }
-    sqlite3 *opened = nullptr;
-    const int result = sqlite3_open_v2(path.c_str(), &opened,
-                                       SQLITE_OPEN_READWRITE | SQLITE_OPEN_NOMUTEX, nullptr);
-    const Database database(opened);
-    if (result != SQLITE_OK) {
-        return sqliteFailure(path, opened);
+    OvraBase::SqliteHandle database;
+    if (OvraBase::openSqlite(path, kBusyMilliseconds, database) != SQLITE_OK) {
+        return sqliteFailure(path, database.get());
     }
-    sqlite3_busy_timeout(opened, kBusyMilliseconds);
-    // A file that a stranger has put there gets no code to run.
-    sqlite3_db_config(opened, SQLITE_DBCONFIG_TRUSTED_SCHEMA, 0, nullptr);
-    // As the library reads it: a misspelt column is an error, not a text.
-    sqlite3_db_config(opened, SQLITE_DBCONFIG_DQS_DML, 0, nullptr);
-    const Expected<bool> filled = fill(opened, path, *schema);
+    const Expected<bool> filled = fill(database.get(), path, *schema);
     if (!filled) {
         return filled.failure();
     }

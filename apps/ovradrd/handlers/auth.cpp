@@ -1,15 +1,13 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "handlers/auth.h"
 
-#include "cgi/account_store.h"
-#include "cgi/session_store.h"
 #include "handlers/params.h"
-#include "webapi/api_errors.h"
 
 #include <ovradrcore/json.h>
 #include <ovradrcore/log.h>
-
-#include <sodium.h>
+#include <ovraplatform/account_store.h>
+#include <ovraplatform/api_errors.h>
+#include <ovraplatform/session_store.h>
 
 namespace Ovradrd {
 
@@ -46,7 +44,7 @@ const char *refusalText(LoginResult result) {
 
 /// What the throttle counts by: whatever was sent, it stays short.
 std::string countedAccount(const Json::Value &params) {
-    return OvraDRCore::memberString(params, kAccount).substr(0, Params::kLongestAccount);
+    return OvraDRCore::memberString(params, kAccount).substr(0, Params::kMaxAccount);
 }
 
 /// What a log line shows: people sometimes type their password in the place of the account.
@@ -57,9 +55,9 @@ std::string loggable(const std::string &account) {
 Json::Value openSession(const std::string &account, const APICaller &caller) {
     OvraPlatform::SessionRequest request;
     request.user = account;
-    request.app = LoginDesk::kApplication;
+    request.app = LoginApi::kApplication;
     request.remote = caller.address;
-    request.timeout = LoginDesk::kSessionTime;
+    request.timeout = LoginApi::kSessionTime;
     request.keepOthers = true;
     const auto sid = SessionStore().create(request);
     if (!sid) {
@@ -84,34 +82,33 @@ Json::Value logout(const Json::Value & /*params*/, const APICaller &caller) {
 
 } // namespace
 
-bool LoginDesk::isLogin(const OvraPlatform::APICall &call) {
+bool LoginApi::isLogin(const OvraPlatform::APICall &call) {
     return call.api == kApi && call.version == kApiVersion && call.method == kLogin;
 }
 
-std::optional<std::chrono::milliseconds> LoginDesk::admit(const Json::Value &params,
-                                                          const std::string &address) {
+std::optional<std::chrono::milliseconds> LoginApi::admit(const Json::Value &params,
+                                                         const std::string &address) {
     return throttle_.admit(countedAccount(params), address);
 }
 
-void LoginDesk::forgive(const Json::Value &params, const std::string &address) {
+void LoginApi::forgive(const Json::Value &params, const std::string &address) {
     throttle_.forgive(countedAccount(params), address);
 }
 
-Json::Value LoginDesk::login(const Json::Value &params, const APICaller &caller) {
+Json::Value LoginApi::login(const Json::Value &params, const APICaller &caller) {
     if (caller.local) {
-        // Nor was it admitted: it came in no lane of its own, and counts for nothing.
+        // Nor was it admitted: it came in no queue of its own, and counts for nothing.
         return apiError(OvraPlatform::APIError::kBadRequest, "a local caller needs no log-in");
     }
     Params in(params);
-    const std::string account = in.text(kAccount, Params::kLongestAccount);
-    std::string password = in.secret("passwd", Params::kLongestPassword);
-    const std::string code = in.optionalSecret("otp_code", Params::kLongestCode);
+    const std::string account = in.text(kAccount, Params::kMaxAccount);
+    const OvraBase::Secret password = in.secret("passwd", Params::kMaxPassword);
+    const std::string code = in.optionalSecret("otp_code", Params::kMaxCode);
     if (!in.ok()) {
         forgive(params, caller.address);
         return in.error();
     }
-    const LoginResult result = AccountStore().verify(account, password, code);
-    sodium_memzero(password.data(), password.size());
+    const LoginResult result = AccountStore().verify(account, password.get(), code);
     switch (result) {
     case LoginResult::kOk:
         throttle_.succeeded(account, caller.address);
@@ -129,14 +126,14 @@ Json::Value LoginDesk::login(const Json::Value &params, const APICaller &caller)
     return apiError(static_cast<int>(result), refusalText(result));
 }
 
-void LoginDesk::addTo(OvraPlatform::APIRegistry &registry) {
-    using OvraPlatform::APILane;
+void LoginApi::addTo(OvraPlatform::APIRegistry &registry) {
+    using OvraPlatform::APIQueue;
     using OvraPlatform::APIRight;
-    registry.add(kApi, kApiVersion, kLogin, APIRight::kNone, APILane::kQuick,
+    registry.add(kApi, kApiVersion, kLogin, APIRight::kNone, APIQueue::kQuick,
                  [this](const Json::Value &params, const APICaller &caller) {
                      return login(params, caller);
                  });
-    registry.add(kApi, kApiVersion, kLogout, APIRight::kSession, APILane::kQuick, logout);
+    registry.add(kApi, kApiVersion, kLogout, APIRight::kSession, APIQueue::kQuick, logout);
 }
 
 } // namespace Ovradrd

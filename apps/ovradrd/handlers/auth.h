@@ -1,9 +1,10 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
-#include "cgi/login_throttle.h"
-#include "webapi/api_call.h"
-#include "webapi/api_registry.h"
+#include "login_throttle.h"
+
+#include <ovraplatform/api_call.h>
+#include <ovraplatform/api_registry.h>
 
 #include <json/value.h>
 
@@ -14,14 +15,14 @@
 namespace Ovradrd {
 
 /// "OVRA.Core.Auth": log-in and log-out. Keeps count of the failed log-ins.
-class LoginDesk {
+class LoginApi {
 public:
     /// How long a session of a log-in lasts, in seconds.
     static constexpr int kSessionTime = 1800;
     /// The application that its sessions belong to.
     static constexpr char kApplication[] = "ovradrd";
 
-    /// Whether the call is a log-in: it hashes a password, so it has a lane of its own.
+    /// Whether the call is a log-in: it hashes a password, so it has a queue of its own.
     static bool isLogin(const OvraPlatform::APICall &call);
 
     /// Asks for a log-in with these parameters from this address.
@@ -31,13 +32,13 @@ public:
     /// The log-in that was admitted is not carried out after all.
     void forgive(const Json::Value &params, const std::string &address);
 
-    /// Registers the methods; the desk has to outlive the registry.
+    /// Registers the methods; the api has to outlive the registry.
     void addTo(OvraPlatform::APIRegistry &registry);
 
 private:
     Json::Value login(const Json::Value &params, const OvraPlatform::APICaller &caller);
 
-    OvraPlatform::LoginThrottle throttle_;
+    LoginThrottle throttle_;
 };
 
 } // namespace Ovradrd

@@ -5,16 +5,16 @@
 #include "handlers/params.h"
 #include "handlers/relay.h"
 #include "handlers/words.h"
-#include "ovradrnode/cred_reverse_create.h"
-#include "ovradrnode/dr_node.h"
-#include "ovradrnode/node_create.h"
-#include "ovradrnode/node_db.h"
-#include "ovradrnode/node_set.h"
 #include "shared/session_lock.h"
 #include "shared/session_release.h"
-#include "webapi/api_errors.h"
 
 #include <ovradrcore/log.h>
+#include <ovradrnode/cred_reverse_create.h>
+#include <ovradrnode/dr_node.h>
+#include <ovradrnode/node_create.h>
+#include <ovradrnode/node_db.h>
+#include <ovradrnode/node_set.h>
+#include <ovraplatform/api_errors.h>
 
 #include <algorithm>
 #include <optional>
@@ -130,7 +130,7 @@ Json::Value testCreate(const Json::Value &params, const APICaller & /*caller*/) 
     const Proof proof(in, true);
     const std::string account = proof.kind == Proof::Kind::kCredId
                                     ? std::string()
-                                    : in.text("account", Params::kLongestAccount);
+                                    : in.text("account", Params::kMaxAccount);
     if (!in.ok()) {
         return in.error();
     }
@@ -169,7 +169,7 @@ void appendRecords(Json::Value &list, const std::string &nodeId, DRNodeDB::CredT
 /// The credentials to one node, or to all; the lasting ones first.
 Json::Value list(const Json::Value &params, const APICaller & /*caller*/) {
     Params in(params);
-    const std::string nodeId = in.optionalText("node_id", Params::kLongestId);
+    const std::string nodeId = in.optionalText("node_id", Params::kMaxId);
     if (!in.ok()) {
         return in.error();
     }
@@ -214,8 +214,8 @@ Json::Value set(const Json::Value &params, bool dryRun) {
         return noSuchCredential();
     }
     OvraDRNode::DRNodeCredSet flow;
-    const bool armed =
-        flow.setCredId(credId) && flow.setCred(conn, login.account, login.password, login.otpCode);
+    const bool armed = flow.setCredId(credId) &&
+                       flow.setCred(conn, login.account, login.password.get(), login.otpCode);
     const auto change = [&flow] { return flow.process(); };
     if (!armed || !(dryRun ? flow.check() : OvraApps::runReleasing(record, conn, change).done)) {
         return flowError(flow, ERR::kCredIncomplete);
@@ -325,26 +325,26 @@ Json::Value relay(const Json::Value &params, const APICaller & /*caller*/) {
 } // namespace
 
 void addCredentialAPI(OvraPlatform::APIRegistry &registry) {
-    using OvraPlatform::APILane;
-    const auto add = [&registry](const char *method, APILane lane,
+    using OvraPlatform::APIQueue;
+    const auto add = [&registry](const char *method, APIQueue queue,
                                  const OvraPlatform::APIHandler &handler) {
-        registry.add(kCredentialApi, 1, method, OvraPlatform::APIRight::kAdministrator, lane,
+        registry.add(kCredentialApi, 1, method, OvraPlatform::APIRight::kAdministrator, queue,
                      handler);
     };
-    add("get", APILane::kQuick, get);
-    add("list", APILane::kQuick, list);
-    add("create", APILane::kSlow, create);
-    add("temp_create", APILane::kSlow, createTemporary);
-    add("test_create", APILane::kSlow, testCreate);
-    add("set", APILane::kSlow,
+    add("get", APIQueue::kQuick, get);
+    add("list", APIQueue::kQuick, list);
+    add("create", APIQueue::kSlow, create);
+    add("temp_create", APIQueue::kSlow, createTemporary);
+    add("test_create", APIQueue::kSlow, testCreate);
+    add("set", APIQueue::kSlow,
         [](const Json::Value &params, const APICaller & /*caller*/) { return set(params, false); });
-    add("test_set", APILane::kSlow,
+    add("test_set", APIQueue::kSlow,
         [](const Json::Value &params, const APICaller & /*caller*/) { return set(params, true); });
-    add("delete", APILane::kSlow, remove);
-    add("reverse_create", APILane::kSlow, createReverse<CredReverseCreate>);
-    add("temp_reverse_create", APILane::kSlow, createReverse<OvraDRNode::TempCredReverseCreate>);
-    add("test_reverse_create", APILane::kSlow, testReverse);
-    add(kRelay, APILane::kSlow, relay);
+    add("delete", APIQueue::kSlow, remove);
+    add("reverse_create", APIQueue::kSlow, createReverse<CredReverseCreate>);
+    add("temp_reverse_create", APIQueue::kSlow, createReverse<OvraDRNode::TempCredReverseCreate>);
+    add("test_reverse_create", APIQueue::kSlow, testReverse);
+    add(kRelay, APIQueue::kSlow, relay);
 }
 
 } // namespace Ovradrd

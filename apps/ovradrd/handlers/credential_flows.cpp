@@ -1,14 +1,12 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "handlers/credential_flows.h"
 
-#include "ovradrnode/dr_node.h"
-
-#include <sodium.h>
+#include <ovradrnode/dr_node.h>
 
 namespace Ovradrd {
 
 std::string readCredId(Params &in) {
-    std::string credId = in.text("cred_id", Params::kLongestId);
+    std::string credId = in.text("cred_id", Params::kMaxId);
     if (OvraDRNode::DRNode::isLocalNodeId(credId)) {
         in.refuse("cred_id", "this is the node itself: name a credential to another node");
         return {};
@@ -17,13 +15,9 @@ std::string readCredId(Params &in) {
 }
 
 RemoteLogin::RemoteLogin(Params &in)
-    : account(in.text("account", Params::kLongestAccount))
-    , password(in.secret("password", Params::kLongestPassword))
-    , otpCode(in.optionalSecret("otpcode", Params::kLongestCode)) {}
-
-RemoteLogin::~RemoteLogin() {
-    sodium_memzero(password.data(), password.size());
-}
+    : account(in.text("account", Params::kMaxAccount))
+    , password(in.secret("password", Params::kMaxPassword))
+    , otpCode(in.optionalSecret("otpcode", Params::kMaxCode)) {}
 
 Proof::Proof(Params &in, bool withCredId) {
     std::vector<std::string> words = {"account", "session"};
@@ -39,7 +33,7 @@ Proof::Proof(Params &in, bool withCredId) {
     conn = in.conn("conn");
     if (auth == "session") {
         kind = Kind::kSession;
-        session = in.text("session", Params::kLongestSession);
+        session = in.text("session", Params::kMaxSession);
         return;
     }
     login.emplace(in);
@@ -48,7 +42,7 @@ Proof::Proof(Params &in, bool withCredId) {
 bool Proof::giveTo(OvraDRNode::CredCreate &flow) const {
     switch (kind) {
     case Kind::kAccount:
-        return flow.setCred(conn, login->account, login->password, login->otpCode);
+        return flow.setCred(conn, login->account, login->password.get(), login->otpCode);
     case Kind::kSession:
         return flow.setCred(conn, session);
     case Kind::kCredId:

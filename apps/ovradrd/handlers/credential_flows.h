@@ -2,8 +2,10 @@
 #pragma once
 
 #include "handlers/params.h"
-#include "ovradrnode/conn.h"
-#include "ovradrnode/node_create.h"
+
+#include <ovrabase/secret.h>
+#include <ovradrnode/conn.h>
+#include <ovradrnode/node_create.h>
 
 #include <optional>
 #include <string>
@@ -13,18 +15,14 @@ namespace Ovradrd {
 /// The id of a credential that reaches another node; the local node's own record is refused.
 std::string readCredId(Params &in);
 
-/// Account, password and one-time code of a log-in at another node. The password is wiped when it
-/// goes.
+/// Account, password and one-time code of a log-in at another node.
 struct RemoteLogin {
     std::string account;
-    std::string password;
+    OvraBase::Secret password;
     std::string otpCode;
 
     /// Parameters "account", "password" and, where needed, "otpcode".
     explicit RemoteLogin(Params &in);
-    RemoteLogin(const RemoteLogin &) = delete;
-    RemoteLogin &operator=(const RemoteLogin &) = delete;
-    ~RemoteLogin();
 };
 
 /// How a new credential is proved to the other node: the parameter "auth" names which of the other

@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "handlers/handlers.h"
-#include "webapi/api_errors.h"
+
+#include <ovraplatform/api_errors.h>
 
 namespace Ovradrd {
 
@@ -9,7 +10,7 @@ using OvraPlatform::APICaller;
 void addEncryptionAPI(OvraPlatform::APIRegistry &registry, const OvraPlatform::SealKeyPair &keys,
                       OvraPlatform::ReplayGuard &guard) {
     registry.add("OVRA.Core.Encryption", 1, "getinfo", OvraPlatform::APIRight::kNone,
-                 OvraPlatform::APILane::kQuick,
+                 OvraPlatform::APIQueue::kQuick,
                  [&keys, &guard](const Json::Value & /*params*/, const APICaller & /*caller*/) {
                      Json::Value data(Json::objectValue);
                      data["public_key"] = OvraPlatform::publicKeyText(keys.publicKey());

@@ -1,8 +1,8 @@
 // SPDX-License-Identifier: Apache-2.0
-#include "credential/farlink.h"
-
 #include "handlers/handlers.h"
-#include "webapi/api_errors.h"
+
+#include <ovraplatform/api_errors.h>
+#include <ovraplatform/farlink.h>
 
 namespace Ovradrd {
 
@@ -36,7 +36,7 @@ Json::Value getFarlink(const FarlinkAgent &agent, const OvraPlatform::APICaller 
 
 void addFarlinkAPI(OvraPlatform::APIRegistry &registry, const FarlinkAgent &agent) {
     registry.add("OVRA.Core.Farlink", 1, "get", OvraPlatform::APIRight::kAdministrator,
-                 OvraPlatform::APILane::kQuick,
+                 OvraPlatform::APIQueue::kQuick,
                  [&agent](const Json::Value & /*params*/, const OvraPlatform::APICaller &caller) {
                      return getFarlink(agent, caller);
                  });

@@ -1,7 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "handlers/flow_error.h"
 
-#include "webapi/api_errors.h"
+#include <ovraplatform/api_errors.h>
 
 namespace Ovradrd {
 

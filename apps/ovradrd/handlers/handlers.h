@@ -1,9 +1,10 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
-#include "credential/sealed_box.h"
 #include "farlink_agent.h"
-#include "webapi/api_registry.h"
+
+#include <ovraplatform/api_registry.h>
+#include <ovraplatform/sealed_box.h>
 
 /// What the daemon answers, one function a family of calls. docs/ovradrd.md lists parameters,
 /// rights and replies.

@@ -1,13 +1,13 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "handlers/handlers.h"
 #include "handlers/params.h"
-#include "ovradrnode/dr_node.h"
-#include "ovradrnode/sender.h"
 #include "timezone.h"
 #include "version.h"
-#include "webapi/api_errors.h"
 
 #include <ovradrcore/err_recorder.h>
+#include <ovradrnode/dr_node.h>
+#include <ovradrnode/sender.h>
+#include <ovraplatform/api_errors.h>
 
 #include <chrono>
 #include <functional>
@@ -25,9 +25,9 @@ using OvraPlatform::APICaller;
 using OvraPlatform::apiError;
 using OvraPlatform::apiSuccess;
 
-constexpr std::size_t kMostFacts = 32;
-constexpr std::size_t kLongestFact = 64;
-constexpr std::size_t kMostEndpoints = 32;
+constexpr std::size_t kMaxFacts = 32;
+constexpr std::size_t kMaxFact = 64;
+constexpr std::size_t kMaxEndpoints = 32;
 /// After this time no further endpoint is probed, which may take 10 seconds each: who asks waits 60
 /// seconds for the answer.
 constexpr std::chrono::seconds kProbeTime{45};
@@ -43,7 +43,7 @@ const std::map<std::string, std::function<std::string()>> &furtherFacts() {
 
 Json::Value info(const Json::Value &params, const APICaller & /*caller*/) {
     Params in(params);
-    const std::vector<std::string> names = in.optionalTexts("additional", kMostFacts, kLongestFact);
+    const std::vector<std::string> names = in.optionalTexts("additional", kMaxFacts, kMaxFact);
     if (!in.ok()) {
         return in.error();
     }
@@ -76,7 +76,7 @@ Json::Value testPrivilege(const Json::Value & /*params*/, const APICaller & /*ca
 /// The first of the endpoints that this node can reach.
 Json::Value testConnection(const Json::Value &params, const APICaller & /*caller*/) {
     Params in(params);
-    const std::vector<Conn> conns = in.conns("conns", kMostEndpoints);
+    const std::vector<Conn> conns = in.conns("conns", kMaxEndpoints);
     if (!in.ok()) {
         return in.error();
     }
@@ -99,13 +99,13 @@ Json::Value testConnection(const Json::Value &params, const APICaller & /*caller
 } // namespace
 
 void addNodeAPI(OvraPlatform::APIRegistry &registry) {
-    using OvraPlatform::APILane;
+    using OvraPlatform::APIQueue;
     using OvraPlatform::APIRight;
     constexpr char kApi[] = "OVRA.DR.Node";
-    registry.add(kApi, 1, "info", APIRight::kSession, APILane::kQuick, info);
-    registry.add(kApi, 1, "test_privilege", APIRight::kAdministrator, APILane::kQuick,
+    registry.add(kApi, 1, "info", APIRight::kSession, APIQueue::kQuick, info);
+    registry.add(kApi, 1, "test_privilege", APIRight::kAdministrator, APIQueue::kQuick,
                  testPrivilege);
-    registry.add(kApi, 1, "test_connection", APIRight::kAdministrator, APILane::kSlow,
+    registry.add(kApi, 1, "test_connection", APIRight::kAdministrator, APIQueue::kSlow,
                  testConnection);
 }
 

@@ -1,10 +1,10 @@
 // SPDX-License-Identifier: Apache-2.0
-#include "ovradrnode/node_session.h"
-
 #include "handlers/flow_error.h"
 #include "handlers/handlers.h"
 #include "handlers/params.h"
-#include "webapi/api_errors.h"
+
+#include <ovradrnode/node_session.h>
+#include <ovraplatform/api_errors.h>
 
 namespace Ovradrd {
 
@@ -29,7 +29,7 @@ Json::Value granted(const NodeSession &sessions, const std::string &session) {
 /// A session for the caller's account, tied to a node.
 Json::Value create(const Json::Value &params, const APICaller &caller) {
     Params in(params);
-    const std::string nodeId = in.text("node_id", Params::kLongestId);
+    const std::string nodeId = in.text("node_id", Params::kMaxId);
     if (!in.ok()) {
         return in.error();
     }
@@ -47,7 +47,7 @@ Json::Value createTemporary(const Json::Value & /*params*/, const APICaller &cal
 /// Whose session it is.
 Json::Value get(const Json::Value &params, const APICaller & /*caller*/) {
     Params in(params);
-    const std::string session = in.text("session", Params::kLongestSession);
+    const std::string session = in.text("session", Params::kMaxSession);
     if (!in.ok()) {
         return in.error();
     }
@@ -63,7 +63,7 @@ Json::Value get(const Json::Value &params, const APICaller & /*caller*/) {
 
 Json::Value remove(const Json::Value &params, const APICaller & /*caller*/) {
     Params in(params);
-    const std::string session = in.text("session", Params::kLongestSession);
+    const std::string session = in.text("session", Params::kMaxSession);
     if (!in.ok()) {
         return in.error();
     }
@@ -77,15 +77,15 @@ Json::Value remove(const Json::Value &params, const APICaller & /*caller*/) {
 } // namespace
 
 void addNodeSessionAPI(OvraPlatform::APIRegistry &registry) {
-    using OvraPlatform::APILane;
+    using OvraPlatform::APIQueue;
     using OvraPlatform::APIRight;
     constexpr char kApi[] = "OVRA.DR.Node.Session";
-    registry.add(kApi, 2, "create", APIRight::kAdministrator, APILane::kQuick, create);
-    registry.add(kApi, 1, "temp_create", APIRight::kAdministrator, APILane::kQuick,
+    registry.add(kApi, 2, "create", APIRight::kAdministrator, APIQueue::kQuick, create);
+    registry.add(kApi, 1, "temp_create", APIRight::kAdministrator, APIQueue::kQuick,
                  createTemporary);
     // Who knows a session id may act as its user anyway.
-    registry.add(kApi, 1, "get", APIRight::kSession, APILane::kQuick, get);
-    registry.add(kApi, 1, "delete", APIRight::kAdministrator, APILane::kQuick, remove);
+    registry.add(kApi, 1, "get", APIRight::kSession, APIQueue::kQuick, get);
+    registry.add(kApi, 1, "delete", APIRight::kAdministrator, APIQueue::kQuick, remove);
 }
 
 } // namespace Ovradrd

@@ -1,7 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "handlers/params.h"
 
-#include "webapi/api_errors.h"
+#include <ovraplatform/api_errors.h>
 
 #include <algorithm>
 
@@ -11,7 +11,7 @@ using OvraDRNode::Conn;
 
 namespace {
 
-constexpr std::size_t kLongestAddress = 255;
+constexpr std::size_t kMaxAddress = 255;
 
 bool isControl(char c) {
     return (c >= '\0' && c < ' ') || c == '\x7f';
@@ -55,8 +55,9 @@ std::string Params::optionalText(const char *name, std::size_t longest) {
     return isUnset(value) ? std::string() : bytes(name, longest, false);
 }
 
-std::string Params::secret(const char *name, std::size_t longest) {
-    return bytes(name, longest, true);
+OvraBase::Secret Params::secret(const char *name, std::size_t longest) {
+    std::string text = bytes(name, longest, true);
+    return OvraBase::Secret::take(text);
 }
 
 std::string Params::optionalSecret(const char *name, std::size_t longest) {
@@ -115,7 +116,7 @@ Conn Params::endpoint(const Json::Value &value, const std::string &name) {
         value["port"].isInt()) {
         conn = Conn::fromJson(value);
     }
-    if (!conn.isValid() || conn.addr.size() > kLongestAddress || hasControl(conn.addr)) {
+    if (!conn.isValid() || conn.addr.size() > kMaxAddress || hasControl(conn.addr)) {
         refuse(name, name +
                          " has to hold \"addr\" (a host name or an address), \"protocol\" (http, "
                          "https or flk) and \"port\" (1 to 65535)");

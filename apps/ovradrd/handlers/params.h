@@ -1,7 +1,8 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
-#include "ovradrnode/conn.h"
+#include <ovrabase/secret.h>
+#include <ovradrnode/conn.h>
 
 #include <json/value.h>
 
@@ -15,17 +16,17 @@ namespace Ovradrd {
 /// used is remembered, and everything read after it counts for nothing:
 ///
 ///     Params in(params);
-///     const std::string node = in.text("node_id", kLongestId);
+///     const std::string node = in.text("node_id", kMaxId);
 ///     if (!in.ok()) {
 ///         return in.error();
 ///     }
 class Params {
 public:
-    static constexpr std::size_t kLongestId = 127; ///< of a node id or a credential id
-    static constexpr std::size_t kLongestSession = 255;
-    static constexpr std::size_t kLongestAccount = 255;
-    static constexpr std::size_t kLongestPassword = 1024;
-    static constexpr std::size_t kLongestCode = 64; ///< of a one-time code
+    static constexpr std::size_t kMaxId = 127; ///< of a node id or a credential id
+    static constexpr std::size_t kMaxSession = 255;
+    static constexpr std::size_t kMaxAccount = 255;
+    static constexpr std::size_t kMaxPassword = 1024;
+    static constexpr std::size_t kMaxCode = 64; ///< of a one-time code
 
     /// \param params  an object; has to outlive this
     explicit Params(const Json::Value &params)
@@ -42,7 +43,7 @@ public:
     /// One of `words`.
     std::string word(const char *name, const std::vector<std::string> &words);
     /// 1 to `longest` bytes, none of them NUL; error texts never repeat it.
-    std::string secret(const char *name, std::size_t longest);
+    OvraBase::Secret secret(const char *name, std::size_t longest);
     /// As secret(), or "" when it is absent or empty.
     std::string optionalSecret(const char *name, std::size_t longest);
     /// An array of at most `most` texts; none when it is absent.

@@ -2,9 +2,9 @@
 #include "handlers/relay.h"
 
 #include "handlers/words.h"
-#include "ovradrnode/sender.h"
 
 #include <ovradrcore/response.h>
+#include <ovradrnode/sender.h>
 
 namespace Ovradrd {
 

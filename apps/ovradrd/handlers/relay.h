@@ -1,10 +1,9 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
-#include "ovradrnode/dr_node.h"
-#include "ovradrnode/operation_dispatcher.h"
-
 #include <ovradrcore/request.h>
+#include <ovradrnode/dr_node.h>
+#include <ovradrnode/operation_dispatcher.h>
 
 #include <string>
 

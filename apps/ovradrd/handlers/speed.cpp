@@ -1,10 +1,10 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "handlers/handlers.h"
 #include "handlers/params.h"
-#include "ovradrnode/node.h"
-#include "webapi/api_errors.h"
 
 #include <ovradrcore/err_recorder.h>
+#include <ovradrnode/node.h>
+#include <ovraplatform/api_errors.h>
 
 #include <algorithm>
 #include <string>
@@ -18,10 +18,10 @@ using OvraDRNode::Conn;
 using OvraPlatform::APICaller;
 using OvraPlatform::apiError;
 
-constexpr std::size_t kLongestUrl = 2048;
-constexpr int kMostRetries = 10;
+constexpr std::size_t kMaxUrl = 2048;
+constexpr int kMaxRetries = 10;
 /// Who asks waits 60 seconds for the answer.
-constexpr int kMostSeconds = 45;
+constexpr int kMaxSeconds = 45;
 constexpr int kUsualSeconds = 15;
 constexpr char kSchemeEnd[] = "://";
 
@@ -33,8 +33,8 @@ struct Bounds {
 /// What exceeds a bound counts as the bound, because callers do not know them.
 Bounds boundsIn(Params &in) {
     Bounds bounds;
-    bounds.retries = std::min(in.number("retries"), kMostRetries);
-    bounds.seconds = std::min(in.number("timeout"), kMostSeconds);
+    bounds.retries = std::min(in.number("retries"), kMaxRetries);
+    bounds.seconds = std::min(in.number("timeout"), kMaxSeconds);
     bounds.seconds = bounds.seconds == 0 ? kUsualSeconds : bounds.seconds;
     return bounds;
 }
@@ -75,7 +75,7 @@ Json::Value speedReply(const OvraDRNode::Node &test, const std::string &speed, c
 /// How fast this node downloads what another one offers.
 Json::Value testDownloadSpeed(const Json::Value &params, const APICaller & /*caller*/) {
     Params in(params);
-    const std::string url = in.text("url", kLongestUrl);
+    const std::string url = in.text("url", kMaxUrl);
     const Bounds bounds = boundsIn(in);
     const std::string direct = in.ok() ? downloadableUrl(url) : std::string();
     if (in.ok() && direct.empty()) {
@@ -96,7 +96,7 @@ Json::Value testDownloadSpeed(const Json::Value &params, const APICaller & /*cal
 /// How fast another node downloads from this one.
 Json::Value testSyncSpeed(const Json::Value &params, const APICaller & /*caller*/) {
     Params in(params);
-    const std::string nodeId = in.text("node_id", Params::kLongestId);
+    const std::string nodeId = in.text("node_id", Params::kMaxId);
     const Bounds bounds = boundsIn(in);
     if (!in.ok()) {
         return in.error();
@@ -111,12 +111,12 @@ Json::Value testSyncSpeed(const Json::Value &params, const APICaller & /*caller*
 } // namespace
 
 void addSpeedAPI(OvraPlatform::APIRegistry &registry) {
-    using OvraPlatform::APILane;
+    using OvraPlatform::APIQueue;
     using OvraPlatform::APIRight;
     constexpr char kApi[] = "OVRA.DR.Node";
-    registry.add(kApi, 1, "test_download_speed", APIRight::kAdministrator, APILane::kSlow,
+    registry.add(kApi, 1, "test_download_speed", APIRight::kAdministrator, APIQueue::kSlow,
                  testDownloadSpeed);
-    registry.add(kApi, 1, "test_sync_speed", APIRight::kAdministrator, APILane::kSlow,
+    registry.add(kApi, 1, "test_sync_speed", APIRight::kAdministrator, APIQueue::kSlow,
                  testSyncSpeed);
 }
 

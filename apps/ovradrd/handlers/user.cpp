@@ -1,8 +1,9 @@
 // SPDX-License-Identifier: Apache-2.0
-#include "cgi/account_store.h"
 #include "handlers/handlers.h"
 #include "handlers/params.h"
-#include "webapi/api_errors.h"
+
+#include <ovraplatform/account_store.h>
+#include <ovraplatform/api_errors.h>
 
 namespace Ovradrd {
 
@@ -15,7 +16,7 @@ using OvraPlatform::apiError;
 /// One's own account; any account for an administrator.
 Json::Value getUser(const Json::Value &params, const APICaller &caller) {
     Params in(params);
-    const std::string name = in.text("name", Params::kLongestAccount);
+    const std::string name = in.text("name", Params::kMaxAccount);
     if (!in.ok()) {
         return in.error();
     }
@@ -44,7 +45,7 @@ Json::Value getUser(const Json::Value &params, const APICaller &caller) {
 
 void addUserAPI(OvraPlatform::APIRegistry &registry) {
     registry.add("OVRA.Core.User", 1, "get", OvraPlatform::APIRight::kSession,
-                 OvraPlatform::APILane::kQuick, getUser);
+                 OvraPlatform::APIQueue::kQuick, getUser);
 }
 
 } // namespace Ovradrd

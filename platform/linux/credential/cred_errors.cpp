@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-#include "credential/cred_errors.h"
+#include "ovraplatform/cred_errors.h"
 
 namespace OvraPlatform {
 

@@ -1,7 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "credential/cred_objects.h"
-#include "credential/web_call.h"
-#include "webapi/api_errors.h"
+#include "http/web_call.h"
+#include "ovraplatform/api_errors.h"
 
 #include <ovradrcore/json.h>
 #include <ovradrcore/log.h>
@@ -118,7 +118,7 @@ int CredRequestUtil::Logout(OVRACred *cred, OVRACredSess *sess) {
     } catch (const std::exception &failure) {
         OVRA_ERR("A log-out failed: [%s]", failure.what());
     }
-    sess->token = OvraPlatform::SecretText();
+    sess->token = OvraBase::Secret();
     return confirmed ? 1 : 0;
 }
 

@@ -8,14 +8,13 @@
 namespace {
 
 using OvraPlatform::Endpoint;
-using OvraPlatform::SecretText;
 
-constexpr std::size_t kLongestItem = 4096;
+constexpr std::size_t kMaxItem = 4096;
 constexpr int kTaken = 0;
 constexpr int kRefused = -1;
 
 bool isUsable(const char *text) {
-    return text != nullptr && *text != '\0' && std::strlen(text) <= kLongestItem;
+    return text != nullptr && *text != '\0' && std::strlen(text) <= kMaxItem;
 }
 
 /// Assigns a usable text to an item of an object.

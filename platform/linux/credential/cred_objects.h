@@ -1,9 +1,10 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
-#include "credential/encoding.h"
-#include "credential/endpoint.h"
+#include "http/endpoint.h"
 #include "ovracredential/cred_request.h"
+
+#include <ovrabase/secret.h>
 
 #include <optional>
 #include <string>
@@ -13,7 +14,7 @@ struct _tag_ovra_cred_ {
     std::string host;
     int port = 0;
     std::string account;
-    OvraPlatform::SecretText passwd;
+    OvraBase::Secret passwd;
 
     std::optional<OvraPlatform::Endpoint> endpoint() const {
         return OvraPlatform::Endpoint::make(protocol, host, port);
@@ -21,5 +22,5 @@ struct _tag_ovra_cred_ {
 };
 
 struct _tag_ovra_cred_sess_ {
-    OvraPlatform::SecretText token;
+    OvraBase::Secret token;
 };

@@ -2,8 +2,9 @@
 #include "ovracredential/cred_request.h"
 
 #include "credential/cred_objects.h"
-#include "credential/web_call.h"
+#include "http/web_call.h"
 
+#include <ovrabase/secret.h>
 #include <ovradrcore/log.h>
 
 #include <chrono>
@@ -21,7 +22,7 @@ using OvraPlatform::WireCall;
 namespace {
 
 constexpr long kDefaultSeconds = 60;
-constexpr long kMostSeconds = 24L * 60 * 60;
+constexpr long kMaxSeconds = 24L * 60 * 60;
 constexpr int kModeRequest = 0;
 constexpr int kModeProbe = 2;
 constexpr int kPlain = 0;
@@ -47,7 +48,7 @@ struct CredRequest::Impl {
 
     void forgetCall() {
         if (call) {
-            sodium_memzero(call->sid.data(), call->sid.size());
+            OvraBase::wipe(call->sid);
         }
         call.reset();
     }
@@ -59,7 +60,7 @@ struct CredRequest::Impl {
     }
 
     int setTimeout(long wanted) {
-        if (wanted < 1 || wanted > kMostSeconds) {
+        if (wanted < 1 || wanted > kMaxSeconds) {
             return refuse(CredError::kBadArgument);
         }
         seconds = wanted;

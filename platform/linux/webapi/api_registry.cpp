@@ -1,7 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
-#include "webapi/api_registry.h"
+#include "ovraplatform/api_registry.h"
 
-#include "webapi/api_errors.h"
+#include "ovraplatform/api_errors.h"
 
 #include <ovradrcore/log.h>
 
@@ -56,8 +56,8 @@ APIRegistry::~APIRegistry() {
 }
 
 void APIRegistry::add(const std::string &api, int version, const std::string &method,
-                      APIRight right, APILane lane, APIHandler handler) {
-    apis_[api][method].insert_or_assign(version, Entry{right, lane, std::move(handler)});
+                      APIRight right, APIQueue queue, APIHandler handler) {
+    apis_[api][method].insert_or_assign(version, Entry{right, queue, std::move(handler)});
 }
 
 const APIRegistry::Entry *APIRegistry::find(const APICall &call, int &error) const {
@@ -79,10 +79,10 @@ const APIRegistry::Entry *APIRegistry::find(const APICall &call, int &error) con
     return &entry->second;
 }
 
-APILane APIRegistry::lane(const APICall &call) const {
+APIQueue APIRegistry::queue(const APICall &call) const {
     int error = 0;
     const Entry *entry = find(call, error);
-    return entry == nullptr ? APILane::kQuick : entry->lane;
+    return entry == nullptr ? APIQueue::kQuick : entry->queue;
 }
 
 Json::Value APIRegistry::dispatch(const APICall &call, const APICaller &caller) const {

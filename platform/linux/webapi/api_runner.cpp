@@ -1,14 +1,14 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "ovrawebapi/api_runner.h"
 
-#include "core/appliance.h"
-#include "core/file_update.h"
-#include "core/unique_fd.h"
-#include "webapi/api_errors.h"
-#include "webapi/api_registry.h"
+#include "ovraplatform/api_errors.h"
+#include "ovraplatform/api_registry.h"
+#include "ovraplatform/appliance.h"
 #include "webapi/local_address.h"
 #include "webapi/local_wire.h"
 
+#include <ovrabase/file.h>
+#include <ovrabase/unique_fd.h>
 #include <ovradrcore/json.h>
 
 #include <sys/socket.h>
@@ -23,8 +23,8 @@
 
 namespace {
 
+using OvraBase::UniqueFd;
 using OvraPlatform::apiError;
-using OvraPlatform::UniqueFd;
 namespace APIError = OvraPlatform::APIError;
 
 /// Bound on a call, whatever it waits for on the network.
@@ -41,7 +41,7 @@ UniqueFd connectToDaemon(OvraPlatform::Deadline deadline, std::string &why) {
     const std::optional<sockaddr_un> address = OvraPlatform::localAddress(path);
     UniqueFd fd(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
     if (!address || !fd) {
-        why = "no socket for asking the daemon: " + OvraPlatform::errnoText(errno);
+        why = "no socket for asking the daemon: " + OvraBase::errnoText(errno);
         return {};
     }
     while (!OvraPlatform::connectLocal(fd.get(), *address)) {
@@ -53,7 +53,7 @@ UniqueFd connectToDaemon(OvraPlatform::Deadline deadline, std::string &why) {
         if (errno == EACCES || errno == EPERM) {
             why = "ovradrd may not be asked by this user: run the command as root";
         } else {
-            why = "ovradrd does not answer on " + path + " (" + OvraPlatform::errnoText(errno) +
+            why = "ovradrd does not answer on " + path + " (" + OvraBase::errnoText(errno) +
                   "): start it";
         }
         return {};

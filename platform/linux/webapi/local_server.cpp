@@ -1,12 +1,13 @@
 // SPDX-License-Identifier: Apache-2.0
-#include "webapi/local_server.h"
+#include "ovraplatform/local_server.h"
 
-#include "core/appliance.h"
-#include "core/file_update.h"
-#include "core/unique_fd.h"
-#include "webapi/api_errors.h"
+#include "ovraplatform/api_errors.h"
+#include "ovraplatform/appliance.h"
 #include "webapi/local_address.h"
+#include "webapi/local_wire.h"
 
+#include <ovrabase/file.h>
+#include <ovrabase/unique_fd.h>
 #include <ovradrcore/file_lock.h>
 #include <ovradrcore/json.h>
 #include <ovradrcore/log.h>
@@ -34,38 +35,35 @@ namespace OvraPlatform {
 
 namespace {
 
+using OvraBase::UniqueFd;
+/// Success, or why it cannot start.
+using Started = tl::expected<void, std::string>;
+
 constexpr std::chrono::seconds kReadTime{10};
 constexpr std::chrono::seconds kWriteTime{10};
 constexpr std::chrono::milliseconds kPauseWithoutDescriptors{50};
 constexpr int kQueue = 128;
 
-std::string folderOf(const std::string &path) {
-    const std::size_t slash = path.find_last_of('/');
-    return slash == std::string::npos ? "." : path.substr(0, slash);
-}
-
 /// Removes a socket file that nobody serves any more.
-/// \return false, with the reason, when the place is taken by something else.
-bool clearPlace(const std::string &path, const sockaddr_un &address, std::string &why) {
+/// \return why not: the place is taken by something else.
+Started clearPlace(const std::string &path, const sockaddr_un &address) {
     struct stat status {};
     if (lstat(path.c_str(), &status) != 0) {
-        return true;
+        return {};
     }
     if (!S_ISSOCK(status.st_mode)) {
-        why = path + " is not a socket: move it away";
-        return false;
+        return tl::unexpected(path + " is not a socket: move it away");
     }
     const UniqueFd probe(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
     const bool answered = probe && (connectLocal(probe.get(), address) || errno != ECONNREFUSED);
     if (answered) {
-        why = "another process already answers on " + path + ": stop it first";
-        return false;
+        return tl::unexpected("another process already answers on " + path + ": stop it first");
     }
     if (unlink(path.c_str()) != 0) {
-        why = "cannot remove the old socket " + path + ": " + errnoText(errno);
-        return false;
+        return tl::unexpected("cannot remove the old socket " + path + ": " +
+                              OvraBase::errnoText(errno));
     }
-    return true;
+    return {};
 }
 
 } // namespace
@@ -77,7 +75,7 @@ struct LocalServer::Impl {
         , threadCount(count)
         , lock(path + ".lock") {}
 
-    bool listenOn(std::string &why);
+    Started takePlace();
     void serveConnections();
     void serve(int peer);
     Json::Value answer(const std::string &request);
@@ -91,34 +89,32 @@ struct LocalServer::Impl {
     std::vector<std::thread> threads;
 };
 
-bool LocalServer::Impl::listenOn(std::string &why) {
+Started LocalServer::Impl::takePlace() {
     const std::optional<sockaddr_un> address = localAddress(path);
     if (!address) {
-        why = "the path " + path + " is too long for a socket: use a shorter folder";
-        return false;
+        return tl::unexpected("the path " + path +
+                              " is too long for a socket: use a shorter folder");
     }
-    if (!ensureStateDir(folderOf(path))) {
-        why = "the folder of " + path + " cannot be used: the log says why";
-        return false;
+    if (!ensureStateDir(OvraBase::folderOf(path))) {
+        return tl::unexpected("the folder of " + path + " cannot be used: the log says why");
     }
     // Held as long as the server lives, so that two that start at once cannot take the place of
     // each other.
     if (!lock.lock(LOCK_EX | LOCK_NB, 0)) {
-        why = "another process holds " + path + ".lock: stop the daemon that runs already";
-        return false;
+        return tl::unexpected("another process holds " + path +
+                              ".lock: stop the daemon that runs already");
     }
-    if (!clearPlace(path, *address, why)) {
-        return false;
+    if (Started cleared = clearPlace(path, *address); !cleared) {
+        return cleared;
     }
     UniqueFd fd(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
     // The mode that the file gets from bind(2) is the socket's own, so that it is never open wider.
     if (!fd || fchmod(fd.get(), 0600) != 0 || !bindLocal(fd.get(), *address) ||
         listen(fd.get(), kQueue) != 0) {
-        why = "cannot listen on " + path + ": " + errnoText(errno);
-        return false;
+        return tl::unexpected("cannot listen on " + path + ": " + OvraBase::errnoText(errno));
     }
     listener = std::move(fd);
-    return true;
+    return {};
 }
 
 void LocalServer::Impl::serveConnections() {
@@ -189,30 +185,27 @@ LocalServer::~LocalServer() {
     stop();
 }
 
-bool LocalServer::start(std::string &why) {
+tl::expected<void, std::string> LocalServer::start() {
     if (impl_->listener) {
-        why = "it has been started already";
-        return false;
+        return tl::unexpected(std::string("it has been started already"));
     }
     impl_->stopEvent.reset(eventfd(0, EFD_CLOEXEC));
     if (!impl_->stopEvent) {
-        why = "cannot start: " + errnoText(errno);
-        return false;
+        return tl::unexpected("cannot start: " + OvraBase::errnoText(errno));
     }
-    if (!impl_->listenOn(why)) {
+    if (Started placed = impl_->takePlace(); !placed) {
         impl_->lock.unlock();
-        return false;
+        return placed;
     }
     try {
         for (unsigned int i = 0; i < impl_->threadCount; ++i) {
             impl_->threads.emplace_back([impl = impl_.get()] { impl->serveConnections(); });
         }
     } catch (const std::system_error &error) {
-        why = std::string("cannot start a thread: ") + error.what();
         stop();
-        return false;
+        return tl::unexpected(std::string("cannot start a thread: ") + error.what());
     }
-    return true;
+    return {};
 }
 
 void LocalServer::stop() {
@@ -221,7 +214,8 @@ void LocalServer::stop() {
     }
     const std::uint64_t one = 1;
     if (write(impl_->stopEvent.get(), &one, sizeof(one)) != sizeof(one)) {
-        OVRA_ERR("The local server cannot be told to stop: [%s]", errnoText(errno).c_str());
+        OVRA_ERR("The local server cannot be told to stop: [%s]",
+                 OvraBase::errnoText(errno).c_str());
     }
     for (std::thread &thread : impl_->threads) {
         thread.join();

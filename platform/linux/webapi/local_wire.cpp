@@ -22,8 +22,8 @@ int millisecondsUntil(Deadline deadline) {
     using std::chrono::milliseconds;
     const auto left =
         std::chrono::ceil<milliseconds>(deadline - std::chrono::steady_clock::now()).count();
-    constexpr std::int64_t kLongest = std::int64_t{24} * 60 * 60 * 1000;
-    return static_cast<int>(std::clamp<std::int64_t>(left, 0, kLongest));
+    constexpr std::int64_t kMaxMilliseconds = std::int64_t{24} * 60 * 60 * 1000;
+    return static_cast<int>(std::clamp<std::int64_t>(left, 0, kMaxMilliseconds));
 }
 
 /// Waits until `fd` is ready for `events`; false when the time is over or `stop` is readable.

@@ -1,7 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
-#include "webapi/api_call.h"
+#include "ovraplatform/api_call.h"
 
 #include <json/value.h>
 
@@ -18,11 +18,6 @@ namespace OvraPlatform {
 inline constexpr std::size_t kMaxFrame = std::size_t{8} * 1024 * 1024;
 
 using Deadline = std::chrono::steady_clock::time_point;
-
-/// A call of a local process, with the rights of `user`.
-struct LocalCall : APICall {
-    std::string user;
-};
 
 /// Sends one frame.
 /// \param fd    a non-blocking stream socket

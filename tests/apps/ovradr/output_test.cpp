@@ -1,7 +1,8 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "failure.h"
 #include "output.h"
-#include "ovradrcore/err_recorder.h"
+
+#include <ovradrcore/err_recorder.h>
 
 #include <gtest/gtest.h>
 

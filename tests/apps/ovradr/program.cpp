@@ -1,7 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "program.h"
 
-#include "ovradrcore/json.h"
+#include <ovradrcore/json.h>
 
 #include <fcntl.h>
 #include <gtest/gtest.h>

@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "program.h"
-#include "provision/server_certificate.h"
+#include "service/certificate.h"
 #include "support/local_node.h"
 
 #include <gtest/gtest.h>

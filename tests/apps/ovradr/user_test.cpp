@@ -1,8 +1,9 @@
 // SPDX-License-Identifier: Apache-2.0
-#include "cgi/account_store.h"
-#include "cgi/session_store.h"
-#include "cgi/totp.h"
 #include "program.h"
+
+#include <ovraplatform/account_store.h>
+#include <ovraplatform/session_store.h>
+#include <ovraplatform/totp.h>
 
 #include <gtest/gtest.h>
 #include <sys/stat.h>

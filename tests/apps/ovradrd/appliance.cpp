@@ -1,15 +1,15 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "appliance.h"
 
-#include "cgi/account_store.h"
-#include "cgi/session_store.h"
-#include "core/appliance.h"
-#include "credential/sealed_box.h"
-#include "credential/wire_form.h"
 #include "support/local_node.h"
 #include "support/test_certificate.h"
 
 #include <ovradrcore/json.h>
+#include <ovraplatform/account_store.h>
+#include <ovraplatform/appliance.h>
+#include <ovraplatform/sealed_box.h>
+#include <ovraplatform/session_store.h>
+#include <ovraplatform/wire_form.h>
 
 #include <arpa/inet.h>
 #include <curl/curl.h>
@@ -77,9 +77,8 @@ void Appliance::provision() {
     provisionNode();
     require(OvraPlatform::ensureStateDir(), "no state folder");
     writeTlsFiles();
-    std::string why;
-    require(OvraPlatform::SealKeyPair::loadOrCreate(OvraPlatform::kSealKeyFile, why).has_value(),
-            why.c_str());
+    require(OvraPlatform::SealKeyPair::loadOrCreate(OvraPlatform::kSealKeyFile).has_value(),
+            "no sealing key");
 }
 
 void Appliance::addAccount(const std::string &name, bool administrator) {
@@ -100,14 +99,15 @@ void Appliance::SetUp() {
     restart({});
 }
 
-void Appliance::restart(const Ovradrd::HttpLimits &limits) {
+void Appliance::restart(const OvraService::HttpLimits &limits, std::size_t testFiles) {
     daemon_.reset();
     Ovradrd::Settings settings;
     settings.addresses = {"127.0.0.1"};
     settings.limits = limits;
+    settings.testFiles = testFiles;
     daemon_ = std::make_unique<Ovradrd::Daemon>(settings);
-    std::string why;
-    ASSERT_EQ(daemon_->start(why), Ovradrd::Outcome::kOk) << why;
+    const auto started = daemon_->start();
+    ASSERT_TRUE(started) << started.error().text;
 }
 
 Reply Appliance::http(const HttpCall &call) const {

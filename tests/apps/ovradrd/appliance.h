@@ -58,7 +58,7 @@ protected:
     void SetUp() override;
     void TearDown() override { daemon_.reset(); }
     /// Starts the daemon anew.
-    void restart(const Ovradrd::HttpLimits &limits);
+    void restart(const OvraService::HttpLimits &limits, std::size_t testFiles = 16);
     Ovradrd::Daemon &daemon() { return *daemon_; }
 
 private:

@@ -1,8 +1,9 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "appliance.h"
-#include "core/appliance.h"
 #include "gateway.h"
-#include "webapi/api_errors.h"
+
+#include <ovraplatform/api_errors.h>
+#include <ovraplatform/appliance.h>
 
 #include <sys/resource.h>
 
@@ -53,7 +54,7 @@ struct SlowScene {
 class SlowClient : public Bounds, public testing::WithParamInterface<SlowScene> {};
 
 TEST_P(SlowClient, isCutOffWhenItsRequestTakesTooLong) {
-    Ovradrd::HttpLimits limits;
+    OvraService::HttpLimits limits;
     limits.connections.arriving = 1s;
     restart(limits);
     const RawConnection connection(port(GetParam().tls));
@@ -110,9 +111,9 @@ TEST_F(Bounds, holdWhenMoreConnectionsComeThanThereMayBe) {
 class FullLanes : public testing::Test {
 protected:
     FullLanes() {
-        using OvraPlatform::APILane;
+        using OvraPlatform::APIQueue;
         using OvraPlatform::APIRight;
-        registry.add("Test", 1, "wait", APIRight::kNone, APILane::kSlow,
+        registry.add("Test", 1, "wait", APIRight::kNone, APIQueue::kSlow,
                      [this](const Json::Value &, const OvraPlatform::APICaller &) {
                          std::unique_lock lock(mutex);
                          ++inside;
@@ -120,14 +121,13 @@ protected:
                          changed.wait(lock, [this] { return open; });
                          return OvraPlatform::apiSuccess();
                      });
-        registry.add("Test", 1, "quick", APIRight::kNone, APILane::kQuick,
+        registry.add("Test", 1, "quick", APIRight::kNone, APIQueue::kQuick,
                      [](const Json::Value &, const OvraPlatform::APICaller &) {
                          return OvraPlatform::apiSuccess();
                      });
-        std::string why;
         Appliance::provision();
-        keys = OvraPlatform::SealKeyPair::load(OvraPlatform::kSealKeyFile, why);
-        gateway.emplace(registry, *keys, guard, desk, *lanes);
+        keys = OvraPlatform::SealKeyPair::load(OvraPlatform::kSealKeyFile).value();
+        gateway.emplace(registry, *keys, guard, api, *queues);
     }
     void serve(const std::string &method) {
         gateway->serve({"api=Test&version=1&method=" + method, "127.0.0.1", true},
@@ -151,9 +151,9 @@ protected:
     OvraPlatform::APIRegistry registry;
     std::optional<OvraPlatform::SealKeyPair> keys;
     OvraPlatform::ReplayGuard guard;
-    Ovradrd::LoginDesk desk;
+    Ovradrd::LoginApi api;
     std::optional<Ovradrd::Gateway> gateway;
-    std::optional<Ovradrd::Lanes> lanes{std::in_place};
+    std::optional<Ovradrd::WorkQueues> queues{std::in_place};
 };
 
 TEST_F(FullLanes, refuseAtOnceAndDoNotHoldUpQuickCalls) {
@@ -177,7 +177,7 @@ TEST_F(FullLanes, refuseAtOnceAndDoNotHoldUpQuickCalls) {
     changed.notify_all();
     EXPECT_TRUE(gets(0, 16 + 64 + 1));
     EXPECT_EQ(replies[107], 5);
-    lanes.reset();
+    queues.reset();
 }
 
 TEST_F(FullLanes, letLocalCallersGoWhenTheDaemonStops) {
@@ -197,7 +197,7 @@ TEST_F(FullLanes, letLocalCallersGoWhenTheDaemonStops) {
         open = true;
     }
     changed.notify_all();
-    lanes.reset();
+    queues.reset();
 }
 
 } // namespace

@@ -1,9 +1,10 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "appliance.h"
-#include "core/appliance.h"
 #include "platform/own_files.h"
 #include "support/local_node.h"
 #include "support/remote_node.h"
+
+#include <ovraplatform/appliance.h>
 
 namespace {
 

@@ -1,11 +1,12 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "appliance.h"
-#include "core/appliance.h"
-#include "credential/wire_form.h"
-#include "ovrawebapi/api_runner.h"
 #include "platform/own_files.h"
 #include "support/local_node.h"
 #include "support/misbehaving_server.h"
+
+#include <ovraplatform/appliance.h>
+#include <ovraplatform/wire_form.h>
+#include <ovrawebapi/api_runner.h>
 
 #include <fcntl.h>
 #include <sys/wait.h>

@@ -1,9 +1,10 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "appliance.h"
-#include "cgi/account_store.h"
-#include "cgi/session_store.h"
-#include "ovrawebapi/api_runner.h"
 #include "support/local_node.h"
+
+#include <ovraplatform/account_store.h>
+#include <ovraplatform/session_store.h>
+#include <ovrawebapi/api_runner.h>
 
 #include <filesystem>
 

@@ -1,11 +1,11 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "appliance.h"
-#include "core/appliance.h"
-#include "credential/sealed_box.h"
-#include "credential/wire_form.h"
-#include "ovracredential/cred_request.h"
 
+#include <ovracredential/cred_request.h>
 #include <ovradrcore/json.h>
+#include <ovraplatform/appliance.h>
+#include <ovraplatform/sealed_box.h>
+#include <ovraplatform/wire_form.h>
 
 #include <optional>
 
@@ -21,8 +21,7 @@ protected:
     void SetUp() override {
         Appliance::SetUp();
         addAccount("alice", true);
-        std::string why;
-        keys = SealKeyPair::load(kSealKeyFile, why);
+        keys = SealKeyPair::load(kSealKeyFile).value();
         inner.api = "OVRA.DR.Node";
         inner.version = 1;
         inner.method = "test_privilege";

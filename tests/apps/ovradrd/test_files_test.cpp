@@ -120,9 +120,7 @@ TEST_F(TestFiles, NothingElseIsReached) {
 
 TEST_F(TestFiles, OnlySoManyAreSentAtOnce) {
     std::filesystem::resize_file(named('0'), 64 << 20);
-    Ovradrd::HttpLimits limits;
-    limits.files = 1;
-    restart(limits);
+    restart({}, 1);
     const std::string request = "GET " + kUrl + named('0') + " HTTP/1.1\r\nHost: a\r\n\r\n";
     const RawConnection slow(port(false));
     slow.send(request);

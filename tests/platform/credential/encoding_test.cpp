@@ -1,8 +1,8 @@
 // SPDX-License-Identifier: Apache-2.0
-#include "credential/endpoint.h"
-#include "credential/wire_form.h"
+#include "http/endpoint.h"
 
 #include <ovradrcore/json.h>
+#include <ovraplatform/wire_form.h>
 
 #include <gtest/gtest.h>
 
@@ -27,9 +27,8 @@ TEST(WireForm, bringsEveryValueBackAsItWas) {
     const auto body = encodeForm(call);
     ASSERT_TRUE(body);
     EXPECT_TRUE(body->starts_with("api=OVRA.DR.Node&version=2&method=info&_sid=")) << *body;
-    std::string why;
-    const auto read = decodeForm(*body, why);
-    ASSERT_TRUE(read) << why;
+    const auto read = decodeForm(*body);
+    ASSERT_TRUE(read);
     EXPECT_EQ(read->api, call.api);
     EXPECT_EQ(read->version, call.version);
     EXPECT_EQ(read->method, call.method);
@@ -38,9 +37,8 @@ TEST(WireForm, bringsEveryValueBackAsItWas) {
 }
 
 TEST(WireForm, readsWhatOtherClientsWrite) {
-    std::string why;
-    const auto call = decodeForm("method=get&&x=%22a+b%2f%2F%22&version=1&api=A&", why);
-    ASSERT_TRUE(call) << why;
+    const auto call = decodeForm("method=get&&x=%22a+b%2f%2F%22&version=1&api=A&");
+    ASSERT_TRUE(call);
     EXPECT_EQ(call->params["x"], "a b//");
 }
 
@@ -52,16 +50,15 @@ TEST(WireForm, refusesWhatIsNoCall) {
           "api=A&version=1&method=%zz", "api=A&version=1&method=m&x=text",
           "api=A&version=1&method=m&x=1&x=2", "api=A&version=1&method=m&api=B",
           "api=A&version=1&method=m&sealed=s&x=1", "api=A&version=1&method=m&sealed=s&_sid=t"}) {
-        std::string why;
-        EXPECT_FALSE(decodeForm(body, why)) << body;
-        EXPECT_FALSE(why.empty()) << body;
+        const auto call = decodeForm(body);
+        ASSERT_FALSE(call) << body;
+        EXPECT_FALSE(call.error().empty()) << body;
     }
     std::string many = "api=A&version=1&method=m";
     for (int i = 0; i < 1000; ++i) {
         many += "&p" + std::to_string(i) + "=1";
     }
-    std::string why;
-    EXPECT_FALSE(decodeForm(many, why));
+    EXPECT_FALSE(decodeForm(many));
 }
 
 TEST(WireForm, hasNoParameterWithTheNameOfAField) {

@@ -1,8 +1,8 @@
 // SPDX-License-Identifier: Apache-2.0
-#include "credential/sealed_box.h"
 #include "platform/own_files.h"
 
 #include <ovradrcore/json.h>
+#include <ovraplatform/sealed_box.h>
 
 #include <gtest/gtest.h>
 #include <sys/stat.h>
@@ -38,8 +38,7 @@ SealNonce nonce(unsigned char value) {
 class SealScene : public OvraTest::OwnFiles {
 protected:
     SealKeyPair newKeys(const std::string &name = "key") {
-        std::string why;
-        return SealKeyPair::loadOrCreate(path(name), why).value();
+        return SealKeyPair::loadOrCreate(path(name)).value();
     }
     static WireCall secretCall() {
         WireCall call{{"OVRA.Core.Auth", 1, "login"}};
@@ -141,16 +140,17 @@ TEST_F(SealScene, keepsItsKeyInAFileOfItsOwnerOnly) {
     EXPECT_EQ(OvraTest::modeOf(path("key")), 0600U);
     EXPECT_EQ(newKeys().publicKey(), made.publicKey()) << "an existing key must be kept";
 
-    std::string why;
     ASSERT_EQ(chmod(path("key").c_str(), 0640), 0);
-    EXPECT_FALSE(SealKeyPair::load(path("key"), why));
+    EXPECT_FALSE(SealKeyPair::load(path("key")));
     const std::string text = OvraTest::readFile(path("key"));
     for (const std::string &damaged : {std::string(), std::string("x"), text.substr(0, 30)}) {
         OvraTest::writeFile(path("key"), damaged);
         ASSERT_EQ(chmod(path("key").c_str(), 0600), 0);
-        EXPECT_FALSE(SealKeyPair::load(path("key"), why)) << damaged.size();
-        EXPECT_FALSE(SealKeyPair::loadOrCreate(path("key"), why)) << "must not be replaced";
-        EXPECT_EQ(why.find(text.substr(20, 10)), std::string::npos) << "no key in a message";
+        EXPECT_FALSE(SealKeyPair::load(path("key"))) << damaged.size();
+        const auto kept = SealKeyPair::loadOrCreate(path("key"));
+        ASSERT_FALSE(kept) << "must not be replaced";
+        EXPECT_EQ(kept.error().find(text.substr(20, 10)), std::string::npos)
+            << "no key in a message";
     }
 }
 

@@ -1,11 +1,11 @@
 // SPDX-License-Identifier: Apache-2.0
-#include "credential/cred_errors.h"
-#include "credential/peer_trust.h"
 #include "platform/own_files.h"
 #include "support/log_capture.h"
 #include "support/sealing_daemon.h"
 
 #include <ovracredential/cred_request.h>
+#include <ovraplatform/cred_errors.h>
+#include <ovraplatform/peer_trust.h>
 
 #include <gtest/gtest.h>
 

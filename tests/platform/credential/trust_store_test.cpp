@@ -1,7 +1,8 @@
 // SPDX-License-Identifier: Apache-2.0
-#include "credential/encoding.h"
-#include "credential/trust_store.h"
 #include "platform/own_files.h"
+
+#include <ovrabase/encoding.h>
+#include <ovraplatform/trust_store.h>
 
 #include <gtest/gtest.h>
 
@@ -15,8 +16,8 @@ using namespace OvraPlatform;
 using namespace std::chrono_literals;
 
 std::string fingerprint(const std::string &of) {
-    sodiumReady();
-    return fingerprintOf(reinterpret_cast<const unsigned char *>(of.data()), of.size());
+    OvraBase::sodiumReady();
+    return OvraBase::fingerprintOf(reinterpret_cast<const unsigned char *>(of.data()), of.size());
 }
 
 class TrustScene : public OvraTest::OwnFiles {

@@ -1,7 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-#include "webapi/api_errors.h"
-#include "webapi/api_registry.h"
-
+#include <ovraplatform/api_errors.h>
+#include <ovraplatform/api_registry.h>
 #include <ovrawebapi/api_runner.h>
 
 #include <gtest/gtest.h>
@@ -44,16 +43,16 @@ class Dispatch : public testing::TestWithParam<Scene> {};
 
 TEST_P(Dispatch, answersWithTheCodeOfTheWireForm) {
     APIRegistry registry;
-    registry.add("Open", 1, "get", APIRight::kNone, APILane::kQuick, echo);
-    registry.add("Mine", 2, "get", APIRight::kSession, APILane::kQuick, echo);
-    registry.add("All", 1, "set", APIRight::kAdministrator, APILane::kSlow, echo);
-    registry.add("Bad", 1, "throw", APIRight::kNone, APILane::kQuick,
+    registry.add("Open", 1, "get", APIRight::kNone, APIQueue::kQuick, echo);
+    registry.add("Mine", 2, "get", APIRight::kSession, APIQueue::kQuick, echo);
+    registry.add("All", 1, "set", APIRight::kAdministrator, APIQueue::kSlow, echo);
+    registry.add("Bad", 1, "throw", APIRight::kNone, APIQueue::kQuick,
                  [](const Json::Value &params, const APICaller &) -> Json::Value {
                      return apiSuccess(params["list"].asInt());
                  });
-    registry.add("Bad", 1, "throw_number", APIRight::kNone, APILane::kQuick,
+    registry.add("Bad", 1, "throw_number", APIRight::kNone, APIQueue::kQuick,
                  [](const Json::Value &, const APICaller &) -> Json::Value { throw 7; });
-    registry.add("Bad", 1, "no_document", APIRight::kNone, APILane::kQuick,
+    registry.add("Bad", 1, "no_document", APIRight::kNone, APIQueue::kQuick,
                  [](const Json::Value &, const APICaller &) { return Json::Value("done"); });
     EXPECT_EQ(codeOf(registry.dispatch(GetParam().call, GetParam().caller)), GetParam().code);
 }
@@ -83,25 +82,25 @@ INSTANTIATE_TEST_SUITE_P(
 
 TEST(APIRegistry, givesAHandlerAnObjectForNullParameters) {
     APIRegistry registry;
-    registry.add("Open", 1, "get", APIRight::kNone, APILane::kQuick, echo);
+    registry.add("Open", 1, "get", APIRight::kNone, APIQueue::kQuick, echo);
     const Json::Value reply = registry.dispatch({"Open", 1, "get", Json::Value()}, kNobody);
     EXPECT_EQ(reply["data"]["params"], Json::Value(Json::objectValue));
 }
 
 TEST(APIRegistry, knowsTheLaneOfEachVersion) {
     APIRegistry registry;
-    registry.add("A", 1, "get", APIRight::kNone, APILane::kQuick, echo);
-    registry.add("A", 2, "get", APIRight::kNone, APILane::kSlow, echo);
-    EXPECT_EQ(registry.lane({"A", 1, "get"}), APILane::kQuick);
-    EXPECT_EQ(registry.lane({"A", 2, "get"}), APILane::kSlow);
-    EXPECT_EQ(registry.lane({"B", 1, "get"}), APILane::kQuick);
+    registry.add("A", 1, "get", APIRight::kNone, APIQueue::kQuick, echo);
+    registry.add("A", 2, "get", APIRight::kNone, APIQueue::kSlow, echo);
+    EXPECT_EQ(registry.queue({"A", 1, "get"}), APIQueue::kQuick);
+    EXPECT_EQ(registry.queue({"A", 2, "get"}), APIQueue::kSlow);
+    EXPECT_EQ(registry.queue({"B", 1, "get"}), APIQueue::kQuick);
 }
 
 TEST(APIRunner, runsTheHandlersThatItsProcessHostsAsALocalAdministrator) {
     Json::Value out;
     {
         APIRegistry registry;
-        registry.add("All", 1, "set", APIRight::kAdministrator, APILane::kQuick, echo);
+        registry.add("All", 1, "set", APIRight::kAdministrator, APIQueue::kQuick, echo);
         registry.host();
         ASSERT_TRUE(OVRA::APIRunner().Exec(out, "All", 1, "set", Json::Value(), "admin"));
         EXPECT_EQ(out["data"]["user"], "admin");

@@ -1,12 +1,13 @@
 // SPDX-License-Identifier: Apache-2.0
-#include "core/appliance.h"
-#include "core/unique_fd.h"
 #include "platform/own_files.h"
-#include "webapi/api_errors.h"
 #include "webapi/local_address.h"
-#include "webapi/local_server.h"
+#include "webapi/local_wire.h"
 
+#include <ovrabase/unique_fd.h>
 #include <ovradrcore/json.h>
+#include <ovraplatform/api_errors.h>
+#include <ovraplatform/appliance.h>
+#include <ovraplatform/local_server.h>
 #include <ovrawebapi/api_runner.h>
 
 #include <gtest/gtest.h>
@@ -47,14 +48,15 @@ Json::Value ask(const char *method = "get", const Json::Value &params = Json::Va
     return out;
 }
 
-UniqueFd connectRaw() {
-    UniqueFd fd(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
-    return connectLocal(fd.get(), *localAddress(kSocketFile)) ? std::move(fd) : UniqueFd();
+OvraBase::UniqueFd connectRaw() {
+    OvraBase::UniqueFd fd(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+    return connectLocal(fd.get(), *localAddress(kSocketFile)) ? std::move(fd)
+                                                              : OvraBase::UniqueFd();
 }
 
 /// What the server answers to these bytes; "" when it just hangs up.
 std::string answerTo(const std::string &bytes) {
-    const UniqueFd fd = connectRaw();
+    const OvraBase::UniqueFd fd = connectRaw();
     send(fd.get(), bytes.data(), bytes.size(), MSG_NOSIGNAL);
     shutdown(fd.get(), SHUT_WR);
     return receiveFrame(fd.get(), std::chrono::steady_clock::now() + 5s).value_or("");
@@ -66,13 +68,11 @@ protected:
         ASSERT_NO_FATAL_FAILURE(OwnFiles::SetUp());
         std::filesystem::remove_all(kStateDir);
     }
-
-    std::string why_;
 };
 
 TEST_F(LocalCallScene, carriesTheWholeCallAndTheWholeReply) {
     LocalServer server(kSocketFile, echo);
-    ASSERT_TRUE(server.start(why_)) << why_;
+    ASSERT_TRUE(server.start());
     Json::Value params;
     params["text"] = std::string(100'000, 'x') + "\n\xC3\xA9";
     const Json::Value out = ask("get", params);
@@ -95,7 +95,7 @@ TEST_F(LocalCallScene, saysSoWhenNoDaemonRuns) {
 TEST_F(LocalCallScene, saysSoWhenTheDaemonDiesDuringTheCall) {
     OvraTest::OtherProcess daemon([this] {
         LocalServer server(kSocketFile, [](const LocalCall &) -> Json::Value { _exit(9); });
-        server.start(why_);
+        static_cast<void>(server.start());
         pause();
         return 0;
     });
@@ -109,7 +109,7 @@ TEST_F(LocalCallScene, replacesTheSocketOfADeadDaemonOnly) {
     {
         OvraTest::OtherProcess daemon([this] {
             LocalServer server(kSocketFile, echo);
-            server.start(why_);
+            static_cast<void>(server.start());
             pause();
             return 0;
         });
@@ -117,12 +117,12 @@ TEST_F(LocalCallScene, replacesTheSocketOfADeadDaemonOnly) {
             std::this_thread::sleep_for(10ms);
         }
         LocalServer second(kSocketFile, echo);
-        EXPECT_FALSE(second.start(why_));
+        EXPECT_FALSE(second.start());
         EXPECT_EQ(codeOf(ask()), 0) << "the first must go on answering";
         daemon.end(SIGKILL);
     }
     LocalServer server(kSocketFile, echo);
-    ASSERT_TRUE(server.start(why_)) << why_;
+    ASSERT_TRUE(server.start());
     EXPECT_EQ(codeOf(ask()), 0);
 }
 
@@ -130,12 +130,13 @@ TEST_F(LocalCallScene, takesNoPlaceThatIsNotItsOwn) {
     ASSERT_TRUE(ensureStateDir());
     OvraTest::writeFile(kSocketFile, "precious");
     LocalServer onFile(kSocketFile, echo);
-    EXPECT_FALSE(onFile.start(why_));
+    EXPECT_FALSE(onFile.start());
     EXPECT_EQ(OvraTest::readFile(kSocketFile), "precious");
 
     LocalServer tooLong(path(std::string(120, 'x')), echo);
-    EXPECT_FALSE(tooLong.start(why_));
-    EXPECT_NE(why_.find("too long"), std::string::npos) << why_;
+    const auto started = tooLong.start();
+    ASSERT_FALSE(started);
+    EXPECT_NE(started.error().find("too long"), std::string::npos);
 }
 
 TEST_F(LocalCallScene, refusesTheProcessesOfOtherUsers) {
@@ -143,7 +144,7 @@ TEST_F(LocalCallScene, refusesTheProcessesOfOtherUsers) {
         GTEST_SKIP() << "only root can become another user";
     }
     LocalServer server(kSocketFile, echo);
-    ASSERT_TRUE(server.start(why_)) << why_;
+    ASSERT_TRUE(server.start());
     // The modes alone would keep them out: open them, so that the peer check has to.
     ASSERT_EQ(chmod(kStateDir, 0755), 0);
     ASSERT_EQ(chmod(kSocketFile, 0666), 0);
@@ -161,7 +162,7 @@ TEST_F(LocalCallScene, refusesTheProcessesOfOtherUsers) {
 
 TEST_F(LocalCallScene, survivesRubbish) {
     LocalServer server(kSocketFile, echo);
-    ASSERT_TRUE(server.start(why_)) << why_;
+    ASSERT_TRUE(server.start());
     const std::string four("\0\0\0\4", 4);
     EXPECT_EQ(answerTo(""), "");
     EXPECT_EQ(answerTo(std::string("\0\0", 2)), "");
@@ -182,7 +183,7 @@ TEST_F(LocalCallScene, answersForAHandlerThatFails) {
         }
         return apiSuccess(std::string(kMaxFrame, 'x'));
     });
-    ASSERT_TRUE(server.start(why_)) << why_;
+    ASSERT_TRUE(server.start());
     EXPECT_EQ(codeOf(ask("throw")), APIError::kInternal);
     EXPECT_EQ(codeOf(ask("flood")), APIError::kTooLarge);
 }
@@ -202,7 +203,7 @@ TEST_F(LocalCallScene, servesMoreCallersThanItHasThreads) {
             return echo(call);
         },
         2);
-    ASSERT_TRUE(server.start(why_)) << why_;
+    ASSERT_TRUE(server.start());
     std::vector<std::future<Json::Value>> callers;
     for (int i = 0; i < 20; ++i) {
         callers.push_back(std::async(std::launch::async, [] { return ask(); }));
@@ -220,8 +221,8 @@ TEST_F(LocalCallScene, stopsAtOnceButAnswersTheCallUnderWay) {
         std::this_thread::sleep_for(200ms);
         return echo(call);
     });
-    ASSERT_TRUE(server.start(why_)) << why_;
-    const UniqueFd idle = connectRaw(); // says nothing, and must not hold up the stop
+    ASSERT_TRUE(server.start());
+    const OvraBase::UniqueFd idle = connectRaw(); // says nothing, and must not hold up the stop
     auto caller = std::async(std::launch::async, [] { return ask(); });
     entered.get_future().wait();
     const auto begin = std::chrono::steady_clock::now();

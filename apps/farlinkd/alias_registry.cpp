@@ -1,0 +1,164 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "alias_registry.h"
+
+#include <ovrabase/file.h>
+#include <ovradrcore/log.h>
+#include <ovraplatform/farlink.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <set>
+#include <sstream>
+#include <utility>
+
+namespace Farlinkd {
+
+namespace {
+
+constexpr char kHeading[] = "farlink-aliases-1";
+constexpr mode_t kMode = 0600;
+
+} // namespace
+
+AliasRegistry::AliasRegistry(std::string path, const Limits &limits)
+    : path_(std::move(path))
+    , limits_(limits)
+    , nextPort_(limits.firstPort) {}
+
+OvraBase::Expected<void> AliasRegistry::load() {
+    const OvraBase::Expected<std::string> text = OvraBase::readFile(path_);
+    if (!text && text.error().number == ENOENT) {
+        return {};
+    }
+    std::istringstream lines(text.value_or(""));
+    std::string heading;
+    if (!(lines >> heading >> nextPort_) || heading != kHeading) {
+        return OvraBase::Unexpected({path_ +
+                                     " cannot be read or is no list of aliases: restore it, "
+                                     "or move it away, and its aliases are free again"});
+    }
+    std::set<int> ports;
+    Alias alias;
+    while (lines >> alias.name >> alias.port >> alias.expires >> alias.key) {
+        if (OvraPlatform::isFarlinkAlias(alias.name) && alias.port >= limits_.firstPort &&
+            alias.port <= limits_.lastPort && ports.insert(alias.port).second) {
+            entries_[alias.name] = alias;
+        } else {
+            OVRA_WARN("The alias [%s] at port [%d] is dropped: its port is not, or no longer, one "
+                      "of this service",
+                      alias.name.c_str(), alias.port);
+        }
+    }
+    return {};
+}
+
+AliasRegistry::Enrolment AliasRegistry::enrol(const std::string &name, const std::string &key,
+                                              std::int64_t now, Alias &alias) {
+    Entries changed = entries_;
+    const auto found = changed.find(name);
+    const bool isNew = found == changed.end() || found->second.expires <= now;
+    if (!isNew && found->second.key != key) {
+        return Enrolment::kTaken;
+    }
+    int nextPort = nextPort_;
+    if (found == changed.end()) {
+        const auto ofKey = std::count_if(changed.begin(), changed.end(), [&key](const auto &entry) {
+            return entry.second.key == key;
+        });
+        if (static_cast<std::size_t>(ofKey) >= limits_.perKey) {
+            return Enrolment::kTooMany;
+        }
+        alias.port = freePort();
+        if (alias.port == 0) {
+            return Enrolment::kFull;
+        }
+        nextPort = alias.port + 1;
+    } else {
+        alias.port = found->second.port;
+    }
+    alias.name = name;
+    alias.key = key;
+    alias.expires = now + limits_.lease.count();
+    changed[name] = alias;
+    if (!store(changed, nextPort)) {
+        return Enrolment::kNotStored;
+    }
+    entries_ = std::move(changed);
+    nextPort_ = nextPort;
+    return isNew ? Enrolment::kMade : Enrolment::kRenewed;
+}
+
+const Alias *AliasRegistry::find(const std::string &name) const {
+    const auto found = entries_.find(name);
+    return found == entries_.end() ? nullptr : &found->second;
+}
+
+bool AliasRegistry::release(const std::string &name) {
+    Entries changed = entries_;
+    if (changed.erase(name) == 0 || !store(changed, nextPort_)) {
+        return false;
+    }
+    entries_ = std::move(changed);
+    return true;
+}
+
+std::vector<Alias> AliasRegistry::dropExpired(std::int64_t now) {
+    const auto expired = [now](const auto &entry) { return entry.second.expires <= now; };
+    std::vector<Alias> dropped;
+    if (std::none_of(entries_.begin(), entries_.end(), expired)) {
+        return dropped;
+    }
+    Entries changed;
+    for (const auto &entry : entries_) {
+        if (expired(entry)) {
+            dropped.push_back(entry.second);
+        } else {
+            changed.insert(entry);
+        }
+    }
+    // What could not be stored has expired all the same, and is dropped again after a restart.
+    store(changed, nextPort_);
+    entries_ = std::move(changed);
+    return dropped;
+}
+
+std::vector<Alias> AliasRegistry::list() const {
+    std::vector<Alias> all;
+    for (const auto &[name, alias] : entries_) {
+        all.push_back(alias);
+    }
+    return all;
+}
+
+bool AliasRegistry::store(const Entries &entries, int nextPort) const {
+    std::ostringstream text;
+    text << kHeading << ' ' << nextPort << '\n';
+    for (const auto &[name, alias] : entries) {
+        text << name << ' ' << alias.port << ' ' << alias.expires << ' ' << alias.key << '\n';
+    }
+    const auto stored = OvraBase::FileUpdate::begin(path_).and_then(
+        [&text](const OvraBase::FileUpdate &file) { return file.commit(text.str(), kMode); });
+    if (!stored) {
+        OVRA_ERR("[%s] cannot be written: [%s]", path_.c_str(), stored.error().text.c_str());
+    }
+    return stored.has_value();
+}
+
+/// 0 when all are taken.
+int AliasRegistry::freePort() const {
+    std::set<int> taken;
+    for (const auto &[name, alias] : entries_) {
+        taken.insert(alias.port);
+    }
+    const int count = limits_.lastPort - limits_.firstPort + 1;
+    for (int i = 0; i < count; ++i) {
+        const int offset = (nextPort_ - limits_.firstPort + i) % count;
+        const int port = limits_.firstPort + (offset < 0 ? offset + count : offset);
+        if (taken.count(port) == 0) {
+            return port;
+        }
+    }
+    return 0;
+}
+
+} // namespace Farlinkd

@@ -1,0 +1,350 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "relay_api.h"
+
+#include <ovrabase/encoding.h>
+#include <ovrabase/number.h>
+#include <ovradrcore/json.h>
+#include <ovradrcore/log.h>
+#include <ovraplatform/api_errors.h>
+#include <ovraplatform/farlink.h>
+
+#include <cstring>
+#include <ctime>
+#include <memory>
+#include <utility>
+#include <vector>
+
+namespace Farlinkd {
+
+namespace {
+
+namespace APIError = OvraPlatform::APIError;
+using OvraDRCore::memberString;
+using OvraPlatform::apiError;
+using OvraPlatform::apiSuccess;
+
+constexpr std::size_t kMaxText = 256;
+constexpr std::chrono::seconds kChallengeTime{60};
+/// An appliance that has not asked for so long is not there; it asks anew when it was answered.
+constexpr std::chrono::seconds kGoneAfter{15};
+constexpr std::size_t kMaxQueued = 64;
+constexpr std::size_t kTokenBytes = 32;
+
+// For one client address. An appliance that is called often asks once for each caller.
+constexpr std::size_t kCallsPerMinute = 3000;
+constexpr std::size_t kProofsPerMinute = 30;
+constexpr std::size_t kAliasesPerHour = 10;
+
+Json::Value noSuchAlias() {
+    return OvraPlatform::apiBadParameter("alias", "nobody has this alias: check how it is written");
+}
+
+Json::Value badAlias() {
+    return OvraPlatform::apiBadParameter(
+        "alias", "an alias has 3 to 63 lower-case letters, digits and inner hyphens");
+}
+
+std::string randomText() {
+    std::array<unsigned char, kTokenBytes> bytes{};
+    randombytes_buf(bytes.data(), bytes.size());
+    return OvraBase::toBase64Url(bytes.data(), bytes.size());
+}
+
+/// In a time that does not tell how much of it is right.
+bool sameSecret(const std::string &a, const std::string &b) {
+    return a.size() == b.size() && sodium_memcmp(a.data(), b.data(), a.size()) == 0;
+}
+
+/// The text of a parameter; "" when it is none, or too long to be one.
+std::string textOf(const Json::Value &params, const char *name) {
+    std::string text = memberString(params, name);
+    return text.size() <= kMaxText ? text : std::string();
+}
+
+} // namespace
+
+RelayApi::RelayApi(AliasRegistry aliases, Settings settings)
+    : settings_(std::move(settings))
+    , aliases_(std::move(aliases))
+    , calls_(kCallsPerMinute, std::chrono::minutes(1))
+    , proofs_(kProofsPerMinute, std::chrono::minutes(1))
+    , newAliases_(kAliasesPerHour, std::chrono::hours(1)) {
+    crypto_auth_keygen(secret_.data());
+}
+
+void RelayApi::connect(TunnelServer &tunnelServer) {
+    const std::lock_guard lock(mutex_);
+    tunnelServer_ = &tunnelServer;
+    for (const Alias &alias : aliases_.list()) {
+        openPort(alias);
+    }
+}
+
+bool RelayApi::openPort(const Alias &alias) {
+    auto listener = OvraService::Listener::listen(settings_.address, alias.port);
+    if (!listener) {
+        OVRA_ERR("The alias [%s] cannot be reached: %s", alias.name.c_str(),
+                 listener.error().text.c_str());
+        return false;
+    }
+    tunnelServer_->open(alias.name, std::move(*listener));
+    return true;
+}
+
+void RelayApi::serve(OvraService::HttpRequest request, const Answer &answer) {
+    // std::function has to be copyable.
+    const auto held = std::make_shared<OvraService::HttpRequest>(std::move(request));
+    if (!queue_.submit([this, held, answer] { handle(*held, answer); })) {
+        answer(OvraDRCore::toString(
+            apiError(APIError::kTooBusy, "the relay service has too much to do: try again later")));
+    }
+}
+
+void RelayApi::stop() {
+    queue_.stop(Clock::now() + std::chrono::seconds(2));
+}
+
+void RelayApi::handle(OvraService::HttpRequest &request, const Answer &answer) {
+    const auto reply = [&answer](const Json::Value &document) {
+        answer(OvraDRCore::toString(document));
+    };
+    const auto call = OvraPlatform::decodeForm(request.body);
+    if (!call) {
+        return reply(apiError(APIError::kBadRequest, call.error()));
+    }
+    if (call->api != OvraPlatform::kFarlinkApi || call->version != 1) {
+        return reply(apiError(APIError::kNoSuchAPI, "this is a relay service: it has no such API"));
+    }
+    const Json::Value params =
+        call->params.isObject() ? call->params : Json::Value(Json::objectValue);
+    const std::lock_guard lock(mutex_);
+    if (!calls_.allow(request.address, Clock::now())) {
+        return reply(
+            apiError(APIError::kTooBusy, "too many calls from this address: wait a minute"));
+    }
+    if (!OvraPlatform::isFarlinkAlias(memberString(params, "alias"))) {
+        return reply(badAlias());
+    }
+    if (call->method == "lookup") {
+        return reply(lookUp(params));
+    }
+    if (call->method == "challenge") {
+        return reply(challenge(params, request.address));
+    }
+    if (call->method == "enrol") {
+        return reply(enrol(params, request.address));
+    }
+    if (call->method == "release") {
+        return reply(release(params));
+    }
+    if (call->method == "wait") {
+        return wait(params, answer);
+    }
+    reply(apiError(APIError::kNoSuchMethod, "the relay service has no such method"));
+}
+
+Json::Value RelayApi::lookUp(const Json::Value &params) {
+    const std::string name = memberString(params, "alias");
+    const Alias *alias = aliases_.find(name);
+    if (alias == nullptr) {
+        return noSuchAlias();
+    }
+    const auto agent = agents_.find(name);
+    if (agent == agents_.end() || !isThere(agent->second)) {
+        return apiError(APIError::kTooBusy,
+                        "the appliance is not connected to the relay service now: check that it "
+                        "runs and has a way out");
+    }
+    Json::Value data(Json::objectValue);
+    data["port"] = alias->port;
+    if (!settings_.host.empty()) {
+        data["host"] = settings_.host;
+    }
+    return apiSuccess(data);
+}
+
+std::string RelayApi::challengeFor(const std::string &alias, const std::string &key,
+                                   std::int64_t time) const {
+    const std::string text = std::to_string(time) + " " + alias + " " + key;
+    std::array<unsigned char, crypto_auth_BYTES> proof{};
+    crypto_auth(proof.data(), reinterpret_cast<const unsigned char *>(text.data()), text.size(),
+                secret_.data());
+    return std::to_string(time) + "." + OvraBase::toBase64Url(proof.data(), proof.size());
+}
+
+bool RelayApi::isFresh(const std::string &challenge, const std::string &alias,
+                       const std::string &key) const {
+    const std::int64_t now = std::time(nullptr);
+    const std::int64_t time =
+        OvraBase::parseNumber<std::int64_t>(challenge.substr(0, challenge.find('.'))).value_or(0);
+    return time <= now && now - time <= kChallengeTime.count() &&
+           sameSecret(challenge, challengeFor(alias, key, time));
+}
+
+Json::Value RelayApi::challenge(const Json::Value &params, const std::string &address) {
+    if (!proofs_.allow(address, Clock::now())) {
+        return apiError(APIError::kTooBusy, "too many attempts from this address: wait a minute");
+    }
+    Json::Value data(Json::objectValue);
+    data["challenge"] =
+        challengeFor(memberString(params, "alias"), textOf(params, "key"), std::time(nullptr));
+    return apiSuccess(data);
+}
+
+Json::Value RelayApi::enrol(const Json::Value &params, const std::string &address) {
+    const std::string name = memberString(params, "alias");
+    const std::string key = textOf(params, "key");
+    const std::string challenge = textOf(params, "challenge");
+    if (!isFresh(challenge, name, key) ||
+        !OvraPlatform::verifyFarlink(key, name, challenge, textOf(params, "signature"))) {
+        OVRA_NOTICE("An attempt from [%s] to enrol [%s] proves no key", address.c_str(),
+                    name.c_str());
+        return apiError(APIError::kNoPermission, "the proof of the key is not valid: try again");
+    }
+    if (aliases_.find(name) == nullptr && !newAliases_.allow(address, Clock::now())) {
+        return apiError(APIError::kTooBusy, "too many new aliases from this address: wait an hour");
+    }
+    Alias alias;
+    switch (aliases_.enrol(name, key, std::time(nullptr), alias)) {
+    case AliasRegistry::Enrolment::kMade:
+        OVRA_NOTICE("[%s] took the alias [%s] at port [%d]", address.c_str(), name.c_str(),
+                    alias.port);
+        leave(name); // an owner whose time was over
+        if (!openPort(alias)) {
+            aliases_.release(name);
+            return apiError(APIError::kInternal,
+                            "the port of the alias cannot be opened: the log of the service says "
+                            "why");
+        }
+        break;
+    case AliasRegistry::Enrolment::kRenewed:
+        break;
+    case AliasRegistry::Enrolment::kTaken:
+        OVRA_NOTICE("[%s] asked for the alias [%s] with another key than its owner's",
+                    address.c_str(), name.c_str());
+        return apiError(APIError::kNoPermission,
+                        "the alias belongs to another appliance: choose another one");
+    case AliasRegistry::Enrolment::kTooMany:
+        return apiError(APIError::kNoPermission,
+                        "this appliance has as many aliases as it may: release one");
+    case AliasRegistry::Enrolment::kFull:
+        return apiError(APIError::kTooBusy, "the relay service has no alias left");
+    case AliasRegistry::Enrolment::kNotStored:
+        return apiError(APIError::kInternal,
+                        "the relay service cannot store the alias: see its log");
+    }
+    Agent &agent = agents_[name];
+    if (agent.waiting) {
+        agent.waiting(OvraDRCore::toString(apiError(APIError::kNoSession)));
+    }
+    // Callers who wait already stay; it is there once it asks for them.
+    agent.waiting = nullptr;
+    agent.token = randomText();
+    agent.seen = Clock::now() - kGoneAfter;
+    Json::Value data(Json::objectValue);
+    data["port"] = alias.port;
+    data["tunnel_port"] = settings_.tunnelPort;
+    data["token"] = agent.token;
+    data["expires"] = Json::Int64{alias.expires};
+    data["lease"] = Json::Int64{alias.expires - std::time(nullptr)};
+    return apiSuccess(data);
+}
+
+/// The appliance whose token came with the call; null for anybody else.
+RelayApi::Agent *RelayApi::agentOf(const Json::Value &params) {
+    const auto found = agents_.find(memberString(params, "alias"));
+    const bool ours =
+        found != agents_.end() && sameSecret(found->second.token, textOf(params, "token"));
+    return ours ? &found->second : nullptr;
+}
+
+bool RelayApi::isThere(const Agent &agent) const {
+    return agent.waiting || Clock::now() - agent.seen < kGoneAfter;
+}
+
+/// Answers with all callers that there are.
+void RelayApi::tellCallers(Agent &agent, const Answer &answer) {
+    Json::Value data(Json::objectValue);
+    data["callers"] = Json::Value(Json::arrayValue);
+    for (const std::string &caller : agent.callers) {
+        data["callers"].append(caller);
+    }
+    agent.callers.clear();
+    agent.seen = Clock::now();
+    answer(OvraDRCore::toString(apiSuccess(data)));
+}
+
+void RelayApi::wait(const Json::Value &params, const Answer &answer) {
+    Agent *const agent = agentOf(params);
+    if (agent == nullptr) {
+        answer(OvraDRCore::toString(
+            apiError(APIError::kNoSession, "the token is not, or no longer, valid: enrol anew")));
+        return;
+    }
+    if (agent->waiting) {
+        // The connection of the earlier question was lost.
+        tellCallers(*agent, std::exchange(agent->waiting, nullptr));
+    }
+    if (!agent->callers.empty()) {
+        tellCallers(*agent, answer);
+        return;
+    }
+    agent->waiting = answer;
+    agent->waitingSince = Clock::now();
+}
+
+Json::Value RelayApi::release(const Json::Value &params) {
+    const std::string name = memberString(params, "alias");
+    if (agentOf(params) == nullptr) {
+        return apiError(APIError::kNoSession, "the token is not, or no longer, valid: enrol anew");
+    }
+    if (!aliases_.release(name)) {
+        return apiError(APIError::kInternal,
+                        "the relay service cannot store that the alias is free: see its log");
+    }
+    OVRA_NOTICE("The alias [%s] was given up", name.c_str());
+    leave(name);
+    return apiSuccess();
+}
+
+/// Forgets the appliance of an alias and ends its calls.
+void RelayApi::leave(const std::string &alias) {
+    const auto agent = agents_.find(alias);
+    if (agent != agents_.end()) {
+        if (agent->second.waiting) {
+            agent->second.waiting(OvraDRCore::toString(apiError(APIError::kNoSession)));
+        }
+        agents_.erase(agent);
+    }
+    tunnelServer_->close(alias);
+}
+
+bool RelayApi::announce(const std::string &alias, const std::string &caller) {
+    const std::lock_guard lock(mutex_);
+    const auto found = agents_.find(alias);
+    if (found == agents_.end() || !isThere(found->second) ||
+        found->second.callers.size() >= kMaxQueued) {
+        return false;
+    }
+    Agent &agent = found->second;
+    agent.callers.push_back(caller);
+    if (agent.waiting) {
+        tellCallers(agent, std::exchange(agent.waiting, nullptr));
+    }
+    return true;
+}
+
+void RelayApi::endOverdue() {
+    const std::lock_guard lock(mutex_);
+    for (auto &[name, agent] : agents_) {
+        if (agent.waiting && Clock::now() - agent.waitingSince >= OvraPlatform::kFarlinkHold) {
+            tellCallers(agent, std::exchange(agent.waiting, nullptr));
+        }
+    }
+    for (const Alias &alias : aliases_.dropExpired(std::time(nullptr))) {
+        OVRA_NOTICE("The alias [%s] has expired", alias.name.c_str());
+        leave(alias.name);
+    }
+}
+
+} // namespace Farlinkd

@@ -1,0 +1,94 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include "alias_registry.h"
+#include "service/http_server.h"
+#include "service/rate_limit.h"
+#include "service/work_queue.h"
+#include "tunnel_server.h"
+
+#include <ovrabase/secret.h>
+#include <ovraplatform/wire_form.h>
+
+#include <json/value.h>
+#include <sodium.h>
+
+#include <array>
+#include <chrono>
+#include <deque>
+#include <map>
+#include <mutex>
+#include <string>
+
+namespace Farlinkd {
+
+/// The calls of the relay service, and which appliances are there; docs/wire.md describes both.
+class RelayApi {
+public:
+    struct Settings {
+        std::string address; ///< where the aliases' ports are opened; "": everywhere
+        std::string host;    ///< that callers are told; "": the one they know the service by
+        int tunnelPort = 0;
+    };
+
+    RelayApi(AliasRegistry aliases, Settings settings);
+    RelayApi(const RelayApi &) = delete;
+    RelayApi &operator=(const RelayApi &) = delete;
+
+    /// Opens the ports of the aliases in the book. The tunnelServer has to outlive everything
+    /// below.
+    void connect(TunnelServer &tunnelServer);
+    /// Carries out one request; does not wait.
+    void serve(OvraService::HttpRequest request, const OvraService::HttpServer::Answer &answer);
+    /// Tells the appliance of the alias about a caller; false when it is not there.
+    bool announce(const std::string &alias, const std::string &caller);
+    /// Ends what has lasted long enough: questions for callers, and aliases. Now and then.
+    void endOverdue();
+    /// Drops the requests that wait, and waits for those under way.
+    void stop();
+
+private:
+    using Clock = std::chrono::steady_clock;
+    using Answer = OvraService::HttpServer::Answer;
+
+    /// An appliance that has proved whose alias it is.
+    struct Agent {
+        std::string token;
+        Clock::time_point seen;
+        std::deque<std::string> callers; ///< that it was not told about yet
+        Answer waiting;                  ///< its question, held back until there is a caller
+        Clock::time_point waitingSince;
+    };
+
+    void handle(OvraService::HttpRequest &request, const Answer &answer);
+    Json::Value lookUp(const Json::Value &params);
+    Json::Value challenge(const Json::Value &params, const std::string &address);
+    Json::Value enrol(const Json::Value &params, const std::string &address);
+    Json::Value release(const Json::Value &params);
+    void wait(const Json::Value &params, const Answer &answer);
+
+    std::string challengeFor(const std::string &alias, const std::string &key,
+                             std::int64_t time) const;
+    bool isFresh(const std::string &challenge, const std::string &alias,
+                 const std::string &key) const;
+    Agent *agentOf(const Json::Value &params);
+    bool isThere(const Agent &agent) const;
+    static void tellCallers(Agent &agent, const Answer &answer);
+    bool openPort(const Alias &alias);
+    void leave(const std::string &alias);
+
+    Settings settings_;
+    TunnelServer *tunnelServer_ = nullptr;
+    /// Proves that a challenge is one of ours without remembering it.
+    OvraBase::SecretBytes<crypto_auth_KEYBYTES> secret_;
+    std::mutex mutex_; ///< of everything below
+    AliasRegistry aliases_;
+    std::map<std::string, Agent> agents_;
+    OvraService::RateLimit calls_;
+    OvraService::RateLimit proofs_;
+    OvraService::RateLimit newAliases_;
+    // Last, so that it goes first: its jobs use everything above.
+    OvraService::WorkQueue queue_{2, 512};
+};
+
+} // namespace Farlinkd

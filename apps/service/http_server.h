@@ -1,0 +1,98 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include "service/connections.h"
+#include "service/listener.h"
+#include "service/tls_identity.h"
+
+#include <sys/socket.h>
+
+#include <chrono>
+#include <cstddef>
+#include <cstdint>
+#include <functional>
+#include <memory>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <vector>
+
+namespace OvraService {
+
+struct HttpLimits {
+    ConnectionLimits connections;
+    std::size_t body = std::size_t{1} * 1024 * 1024;
+    /// Of all bodies together that have not been handed over yet.
+    std::size_t bodies = std::size_t{64} * 1024 * 1024;
+};
+
+/// A request to the entry point of the web API.
+struct HttpRequest {
+    std::string body;
+    std::string address; ///< numeric address of the client
+    bool secure = false; ///< came over TLS
+};
+
+/// A file that is sent as it is.
+struct ServedFile {
+    OvraBase::UniqueFd fd;
+    std::uint64_t size = 0;
+};
+
+/// Files that a program serves beside the web API.
+struct FileSource {
+    std::string prefix; ///< of the URL paths that it is asked for
+    /// Opens the file that a URL path names, its escapes resolved; nothing when there is none.
+    std::function<std::optional<ServedFile>(std::string_view path)> open;
+    std::size_t atOnce = 0; ///< how many are sent at the same time
+    std::string absentText; ///< what clients are told when there is no such file
+    std::string busyText;   ///< and when as many as may be are being sent
+};
+
+/// A client whose connection came another way than through a listening socket.
+struct ConnectedClient {
+    OvraBase::UniqueFd fd;
+    sockaddr_storage address{};
+    socklen_t size = 0;
+};
+
+/// The HTTP side of a daemon: POST of a form to /webapi/query.cgi, answered with a JSON document,
+/// and GET of the files of a source, where the daemon has one. Everything else is refused here,
+/// also with a JSON document.
+///
+/// A few threads wait for the network, none for a handler. While a request is being worked on its
+/// connection sleeps.
+class HttpServer {
+public:
+    /// Ends the request with a JSON text; called once, in any thread, also after the server is
+    /// gone.
+    using Answer = std::function<void(std::string document)>;
+    /// Gets every request that is whole, in a thread of the server: it must not wait.
+    using Handler = std::function<void(HttpRequest request, Answer answer)>;
+
+    HttpServer(Handler handler, const HttpLimits &limits,
+               std::optional<FileSource> files = std::nullopt);
+    HttpServer(const HttpServer &) = delete;
+    HttpServer &operator=(const HttpServer &) = delete;
+    /// Stops.
+    ~HttpServer();
+
+    /// Begins to serve on the sockets.
+    /// \param identity  for those that speak TLS; has to live as long as the server does
+    [[nodiscard]] OvraBase::Expected<void>
+    start(std::vector<Listener> https, std::vector<Listener> http, const TlsIdentity &identity);
+    /// Serves a client that is connected already, as one of the https sockets. In any thread while
+    /// the server is started and not stopped.
+    void adopt(ConnectedClient client);
+    /// Takes no further connections and refuses further requests; those under way go on.
+    void quiesce();
+    /// Ends every request still under way with a refusal, gives the replies half a second to leave,
+    /// and closes all connections.
+    void stop();
+
+private:
+    struct Impl;
+    std::unique_ptr<Impl> impl_;
+};
+
+} // namespace OvraService

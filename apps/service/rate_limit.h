@@ -1,0 +1,52 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include <chrono>
+#include <cstddef>
+#include <string>
+#include <unordered_map>
+
+namespace OvraService {
+
+/// At most so many events of one address in a period. Not safe for threads.
+class RateLimit {
+public:
+    using TimePoint = std::chrono::steady_clock::time_point;
+
+    RateLimit(std::size_t most, std::chrono::seconds period)
+        : most_(most)
+        , period_(period) {}
+
+    /// Counts one event; false when there were too many, and then it does not count.
+    bool allow(const std::string &address, TimePoint now) {
+        if (windows_.size() >= kMaxAddresses) {
+            forgetOld(now);
+        }
+        Window &window = windows_[address];
+        if (now - window.begin >= period_) {
+            window = {now, 0};
+        }
+        return window.count < most_ && ++window.count > 0;
+    }
+
+private:
+    static constexpr std::size_t kMaxAddresses = 8192;
+    struct Window {
+        TimePoint begin;
+        std::size_t count = 0;
+    };
+
+    void forgetOld(TimePoint now) {
+        std::erase_if(windows_,
+                      [&](const auto &entry) { return now - entry.second.begin >= period_; });
+        if (windows_.size() >= kMaxAddresses) {
+            windows_.clear(); // rather than refuse everybody new
+        }
+    }
+
+    std::size_t most_;
+    std::chrono::seconds period_;
+    std::unordered_map<std::string, Window> windows_;
+};
+
+} // namespace OvraService

@@ -1,0 +1,70 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "service/tls_identity.h"
+
+#include <ovrabase/file.h>
+
+#include <gnutls/gnutls.h>
+
+#include <cerrno>
+#include <memory>
+#include <type_traits>
+#include <utility>
+
+namespace OvraService {
+
+namespace {
+
+using OvraBase::Unexpected;
+
+struct FreeCredentials {
+    void operator()(gnutls_certificate_credentials_t credentials) const {
+        gnutls_certificate_free_credentials(credentials);
+    }
+};
+using Credentials =
+    std::unique_ptr<std::remove_pointer_t<gnutls_certificate_credentials_t>, FreeCredentials>;
+
+Unexpected unreadable(const std::string &path, const OvraBase::Error &why) {
+    return why.number == EPERM
+               ? Unexpected({path + " can be read by others: set its mode to 0600", why.number})
+               : Unexpected(
+                     {path + " cannot be read (" + why.text + "): run ovradr setup", why.number});
+}
+
+/// The library only reads it.
+gnutls_datum_t datumOf(const std::string &text) {
+    return {reinterpret_cast<unsigned char *>(const_cast<char *>(text.data())),
+            static_cast<unsigned int>(text.size())};
+}
+
+} // namespace
+
+OvraBase::Expected<TlsIdentity> TlsIdentity::load(const std::string &keyFile,
+                                                  const std::string &certificateFile) {
+    OvraBase::Expected<OvraBase::Secret> key =
+        OvraBase::readPrivateFile(keyFile, OvraBase::Links::kFollow);
+    if (!key) {
+        return unreadable(keyFile, key.error());
+    }
+    OvraBase::Expected<std::string> certificate = OvraBase::readFile(certificateFile);
+    if (!certificate) {
+        return unreadable(certificateFile, certificate.error());
+    }
+    gnutls_certificate_credentials_t raw = nullptr;
+    if (gnutls_certificate_allocate_credentials(&raw) != GNUTLS_E_SUCCESS) {
+        return Unexpected({"no memory for the TLS key"});
+    }
+    const Credentials credentials(raw);
+    const gnutls_datum_t keyDatum = datumOf(key->get());
+    const gnutls_datum_t certificateDatum = datumOf(*certificate);
+    const int code = gnutls_certificate_set_x509_key_mem(credentials.get(), &certificateDatum,
+                                                         &keyDatum, GNUTLS_X509_FMT_PEM);
+    if (code < 0) {
+        return Unexpected({keyFile + " and " + certificateFile +
+                           " are not a key and its certificate (" + gnutls_strerror(code) +
+                           "): put the right ones there, or remove both and run ovradr setup"});
+    }
+    return TlsIdentity{std::move(*key), std::move(*certificate)};
+}
+
+} // namespace OvraService

@@ -1,0 +1,50 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include <sys/socket.h>
+
+#include <optional>
+#include <string>
+#include <string_view>
+
+// Addresses and host names as text, each in one spelling.
+namespace OvraBase {
+
+/// A socket address of either family.
+struct SocketAddress {
+    sockaddr_storage storage{};
+    socklen_t size = 0;
+
+    const sockaddr *get() const { return reinterpret_cast<const sockaddr *>(&storage); }
+    bool isIpv6() const { return storage.ss_family == AF_INET6; }
+};
+
+/// The socket address of a numeric IPv4 address (four decimal numbers) or IPv6 address, without
+/// brackets or scope; nothing for any other text.
+std::optional<SocketAddress> parseAddress(const std::string &text, int port);
+bool isNumericAddress(const std::string &text);
+
+/// The one spelling of an IPv6 address (RFC 5952), which may stand in brackets; "" for any other
+/// text.
+std::string normalizeIpv6(std::string text);
+
+/// The numeric text of a socket's address, without port; that of an IPv4 client on a socket for
+/// both families as IPv4. "" for an address of another family, and for null.
+std::string addressText(const sockaddr *address);
+
+/// What counts as one client: an IPv4 address, or the network of 64 bits of an IPv6 address, which
+/// is what one subscriber has at least (RFC 6177). Any other text stands for itself.
+/// \param address  numeric, as addressText() gives it
+std::string clientKey(const std::string &address);
+
+/// Whether the text can be the name of a host: 1 to 253 ASCII letters, digits, '-', '.' and '_'
+/// (RFC 1035, 2.3.4, as text), neither a dot nor a hyphen in front.
+bool isHostName(std::string_view text);
+
+/// "host:port", with an IPv6 address in brackets.
+std::string joinHostPort(const std::string &host, int port);
+
+/// The ASCII letters of the text in lower case.
+std::string toLower(std::string_view text);
+
+} // namespace OvraBase

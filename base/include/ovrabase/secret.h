@@ -1,0 +1,92 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include <string.h>
+
+#include <array>
+#include <cstddef>
+#include <string>
+#include <string_view>
+#include <utility>
+
+namespace OvraBase {
+
+/// Overwrites what the text holds (explicit_bzero(3)) and empties it.
+inline void wipe(std::string &text) {
+    explicit_bzero(text.data(), text.size());
+    text.clear();
+}
+
+/// Text that is wiped when it goes or is replaced. It never grows beyond the room that it was
+/// given, so that no copy stays behind where it lay before.
+class Secret {
+public:
+    /// Room for anything that people or peers call a password, in bytes.
+    static constexpr std::size_t kMaxSize = 1024;
+
+    Secret() { text_.reserve(kMaxSize); }
+    explicit Secret(std::string_view text) {
+        text_.reserve(text.size() > kMaxSize ? text.size() : kMaxSize);
+        text_.assign(text);
+    }
+    /// Takes the text over; `text` is left empty and wiped.
+    static Secret take(std::string &text) {
+        Secret secret(text);
+        wipe(text);
+        return secret;
+    }
+    Secret(const Secret &other)
+        : Secret(std::string_view(other.text_)) {}
+    Secret(Secret &&other) noexcept { text_.swap(other.text_); }
+    Secret &operator=(Secret other) noexcept {
+        text_.swap(other.text_);
+        return *this;
+    }
+    ~Secret() { wipe(text_); }
+
+    /// False when there is no room for it.
+    [[nodiscard]] bool append(char c) {
+        const bool fits = text_.size() < kMaxSize && text_.size() < text_.capacity();
+        if (fits) {
+            text_ += c;
+        }
+        return fits;
+    }
+    void removeLast() {
+        if (!text_.empty()) {
+            text_.back() = '\0';
+            text_.pop_back();
+        }
+    }
+    /// Valid as long as this object is not changed.
+    const std::string &get() const { return text_; }
+    bool empty() const { return text_.empty(); }
+
+private:
+    std::string text_;
+};
+
+/// Bytes that are wiped when they go.
+template <std::size_t Size>
+struct SecretBytes : std::array<unsigned char, Size> {
+    SecretBytes()
+        : std::array<unsigned char, Size>{} {}
+    SecretBytes(const SecretBytes &) = default;
+    SecretBytes &operator=(const SecretBytes &) = default;
+    ~SecretBytes() { explicit_bzero(this->data(), Size); }
+};
+
+/// Wipes a text that somebody else owns at the end of the scope.
+class WipeAtEnd {
+public:
+    explicit WipeAtEnd(std::string &text)
+        : text_(text) {}
+    WipeAtEnd(const WipeAtEnd &) = delete;
+    WipeAtEnd &operator=(const WipeAtEnd &) = delete;
+    ~WipeAtEnd() { wipe(text_); }
+
+private:
+    std::string &text_;
+};
+
+} // namespace OvraBase

@@ -1,0 +1,60 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include "http/http_connection.h"
+#include "ovraplatform/trust_store.h"
+
+#include <chrono>
+#include <cstddef>
+#include <list>
+#include <memory>
+#include <mutex>
+#include <set>
+#include <string>
+#include <vector>
+
+namespace OvraPlatform {
+
+/// The idle connections of this process, judged and ready for the next request to their endpoint.
+///
+/// Safe for threads. A forked child starts with none: it closes its copies of the sockets, so that
+/// it neither uses nor ends the parent's TLS connections, and leaves their handles alone for ever.
+/// A connection is dropped once it was idle for 30 seconds, or when the trusted keys have changed.
+class ConnectionPool {
+public:
+    static constexpr std::size_t kMaxIdle = 32;
+    static constexpr std::size_t kMaxIdlePerEndpoint = 4;
+    static constexpr std::chrono::seconds kIdleTime{30};
+
+    /// The pool of this process; it is never destroyed, because threads may outlive main().
+    static ConnectionPool &instance();
+
+    /// The connection that was idle for the shortest time, or null.
+    std::unique_ptr<HttpConnection> take(const Endpoint &endpoint, const TrustStore::Stamp &trust);
+    /// Keeps a connection on which a request has just ended well.
+    /// \param trust  the stamp of the trusted keys from before that request
+    void keep(const Endpoint &endpoint, const TrustStore::Stamp &trust,
+              std::unique_ptr<HttpConnection> connection);
+
+    /// A socket that a forked child closes; -1 when there is none to be had.
+    int openSocket(int family, int type, int protocol);
+    void closeSocket(int fd);
+
+private:
+    struct Idle {
+        std::string endpoint;
+        TrustStore::Stamp trust;
+        std::chrono::steady_clock::time_point since;
+        std::unique_ptr<HttpConnection> connection;
+    };
+
+    ConnectionPool();
+    void dropAllInChild();
+
+    std::mutex mutex_;
+    std::list<Idle> idle_; ///< the longest idle first
+    std::set<int> sockets_;
+    std::list<Idle> parents_; ///< a child's copies of its parent's, out of use
+};
+
+} // namespace OvraPlatform

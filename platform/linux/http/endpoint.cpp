@@ -1,0 +1,60 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "http/endpoint.h"
+
+#include <ovrabase/address.h>
+#include <ovrabase/number.h>
+
+#include <algorithm>
+
+namespace OvraPlatform {
+
+namespace {
+
+constexpr std::size_t kMaxPath = 1024;
+
+bool isAlphanumeric(char c) {
+    return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z') || (c >= '0' && c <= '9');
+}
+
+/// The host in its one spelling, "" when it is none. What is left out keeps control characters,
+/// blanks, user parts, paths and escapes out of the URL.
+std::string normalizeHost(const std::string &host) {
+    const std::string ipv6 = OvraBase::normalizeIpv6(host);
+    if (!ipv6.empty()) {
+        return ipv6;
+    }
+    return OvraBase::isHostName(host) ? OvraBase::toLower(host) : "";
+}
+
+} // namespace
+
+std::optional<Endpoint> Endpoint::make(const std::string &protocol, const std::string &host,
+                                       int port) {
+    if ((protocol != "http" && protocol != "https") || port < 1 || port > OvraBase::kMaxPort) {
+        return std::nullopt;
+    }
+    Endpoint endpoint;
+    endpoint.protocol_ = protocol;
+    endpoint.host_ = normalizeHost(host);
+    endpoint.port_ = port;
+    if (endpoint.host_.empty()) {
+        return std::nullopt;
+    }
+    return endpoint;
+}
+
+std::string Endpoint::key() const {
+    return protocol_ + "://" + OvraBase::joinHostPort(host_, port_);
+}
+
+std::optional<std::string> Endpoint::url(const std::string &path) const {
+    const bool clean = std::all_of(path.begin(), path.end(), [](char c) {
+        return isAlphanumeric(c) || c == '-' || c == '.' || c == '_' || c == '/';
+    });
+    if (!clean || path.size() > kMaxPath) {
+        return std::nullopt;
+    }
+    return key() + (path.starts_with('/') ? "" : "/") + path;
+}
+
+} // namespace OvraPlatform

@@ -1,0 +1,404 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "http/http_connection.h"
+
+#include "http/connection_pool.h"
+#include "http/sigpipe_guard.h"
+
+#include <ovradrcore/log.h>
+
+#include <linux/tcp.h>
+#include <netinet/in.h>
+#include <sys/socket.h>
+#include <sys/stat.h>
+
+#include <algorithm>
+#include <cstddef>
+#include <exception>
+
+namespace OvraPlatform {
+
+namespace {
+
+/// The hashed folder and not the bundle of all certificates, which takes 26 ms to load for every
+/// connection.
+constexpr char kCertificateDir[] = "/etc/ssl/certs";
+constexpr long kConnectMillis = 10'000;
+/// A peer whose kernel says nothing for so long is gone, however long the answer may take.
+constexpr unsigned kSilenceMillis = 10'000;
+constexpr int kKeepAliveSeconds = 3;
+constexpr std::size_t kMaxHeader = std::size_t{64} * 1024;
+constexpr std::size_t kMaxProbeReply = std::size_t{64} * 1024;
+constexpr int kMaxAttempts = 2;
+
+bool curlReady() {
+    static const bool ready = curl_global_init(CURL_GLOBAL_DEFAULT) == CURLE_OK;
+    return ready;
+}
+
+/// Sets one option after the other and remembers whether all were taken.
+class Options {
+public:
+    explicit Options(CURL *handle)
+        : handle_(handle) {}
+
+    template <typename Value>
+    Options &set(CURLoption option, Value value) {
+        ok_ = ok_ && curl_easy_setopt(handle_, option, value) == CURLE_OK;
+        return *this;
+    }
+    bool ok() const { return ok_; }
+
+private:
+    CURL *handle_;
+    bool ok_ = true;
+};
+
+struct FreeMime {
+    void operator()(curl_mime *mime) const { curl_mime_free(mime); }
+};
+using Mime = std::unique_ptr<curl_mime, FreeMime>;
+
+/// How many bytes the peer's kernel has acknowledged on this connection (tcp(7), RFC 4898); nothing
+/// when this kernel does not tell.
+std::optional<std::uint64_t> deliveredBytes(int socket) {
+    tcp_info info{};
+    socklen_t size = sizeof(info);
+    constexpr std::size_t kNeeded = offsetof(tcp_info, tcpi_bytes_acked) + sizeof(__u64);
+    if (getsockopt(socket, IPPROTO_TCP, TCP_INFO, &info, &size) != 0 || size < kNeeded) {
+        return std::nullopt;
+    }
+    return info.tcpi_bytes_acked;
+}
+
+/// Has the kernel end the connection when the peer's does not acknowledge what is sent, nor answer
+/// when it is asked whether it is still there (tcp(7), RFC 5482).
+void endWhenSilent(int socket) {
+    const auto set = [socket](int level, int option, int value) {
+        setsockopt(socket, level, option, &value, sizeof value);
+    };
+    set(IPPROTO_TCP, TCP_USER_TIMEOUT, static_cast<int>(kSilenceMillis));
+    set(IPPROTO_TCP, TCP_KEEPIDLE, kKeepAliveSeconds);
+    set(IPPROTO_TCP, TCP_KEEPINTVL, kKeepAliveSeconds);
+    set(SOL_SOCKET, SO_KEEPALIVE, 1);
+}
+
+/// Whether the connection ended because nothing came from the peer any more; the kernel's clocks
+/// are a little apart.
+bool endedInSilence(int socket) {
+    constexpr unsigned kTolerance = 500; // milliseconds
+    constexpr unsigned kClosed = 7;      // TCP_CLOSE of a header that excludes linux/tcp.h
+    tcp_info info{};
+    socklen_t size = sizeof info;
+    return getsockopt(socket, IPPROTO_TCP, TCP_INFO, &info, &size) == 0 &&
+           size >= offsetof(tcp_info, tcpi_last_ack_recv) + sizeof info.tcpi_last_ack_recv &&
+           info.tcpi_state == kClosed && info.tcpi_last_ack_recv + kTolerance >= kSilenceMillis;
+}
+
+long millisecondsUntil(Deadline deadline) {
+    using std::chrono::milliseconds;
+    return std::chrono::ceil<milliseconds>(deadline - std::chrono::steady_clock::now()).count();
+}
+
+bool isRegularFile(const std::string &path) {
+    struct stat status {};
+    return stat(path.c_str(), &status) == 0 && S_ISREG(status.st_mode);
+}
+
+/// The form of an upload; null when there is no memory or the file cannot be read.
+Mime makeForm(CURL *handle, const std::vector<std::pair<std::string, std::string>> &fields,
+              const Upload &upload) {
+    Mime form(curl_mime_init(handle));
+    if (!form) {
+        return nullptr;
+    }
+    for (const auto &[name, value] : fields) {
+        curl_mimepart *part = curl_mime_addpart(form.get());
+        if (part == nullptr || curl_mime_name(part, name.c_str()) != CURLE_OK ||
+            curl_mime_data(part, value.data(), value.size()) != CURLE_OK) {
+            return nullptr;
+        }
+    }
+    curl_mimepart *file = curl_mime_addpart(form.get());
+    const bool attached = file != nullptr &&
+                          curl_mime_name(file, upload.name.c_str()) == CURLE_OK &&
+                          curl_mime_filedata(file, upload.path.c_str()) == CURLE_OK &&
+                          curl_mime_filename(file, upload.name.c_str()) == CURLE_OK &&
+                          curl_mime_type(file, "application/octet-stream") == CURLE_OK;
+    return attached ? std::move(form) : nullptr;
+}
+
+} // namespace
+
+std::unique_ptr<HttpConnection> HttpConnection::open(const Endpoint &endpoint, Purpose purpose) {
+    if (!curlReady()) {
+        return nullptr;
+    }
+    std::unique_ptr<HttpConnection> connection(new HttpConnection(endpoint, purpose));
+    return connection->setUp() ? std::move(connection) : nullptr;
+}
+
+HttpConnection::HttpConnection(const Endpoint &endpoint, Purpose purpose)
+    : endpoint_(endpoint)
+    , purpose_(purpose)
+    , verifier_(endpoint, purpose == Purpose::kObserve)
+    , handle_(curl_easy_init()) {}
+
+HttpConnection::~HttpConnection() {
+    const SigpipeGuard noSigpipe; // TLS says good-bye to a peer that may be gone
+    handle_.reset();
+}
+
+bool HttpConnection::setUp() {
+    if (!handle_) {
+        return false;
+    }
+    constexpr std::size_t kMaxSockets = 16; // two at most are open at a time
+    sockets_.reserve(kMaxSockets);
+    for (const char *header : {"Accept: application/json", "Expect:"}) {
+        curl_slist *longer = curl_slist_append(headers_.get(), header);
+        if (longer == nullptr) {
+            return false;
+        }
+        headers_.release();
+        headers_.reset(longer);
+    }
+    Options options(handle_.get());
+    options.set(CURLOPT_NOSIGNAL, 1L)
+        .set(CURLOPT_PROTOCOLS_STR, endpoint_.isTls() ? "https" : "http")
+        .set(CURLOPT_HTTP_VERSION, static_cast<long>(CURL_HTTP_VERSION_1_1))
+        .set(CURLOPT_FOLLOWLOCATION, 0L)
+        .set(CURLOPT_PROXY, "")
+        .set(CURLOPT_NOPROXY, "*")
+        .set(CURLOPT_NETRC, static_cast<long>(CURL_NETRC_IGNORED))
+        .set(CURLOPT_HTTPHEADER, headers_.get())
+        .set(CURLOPT_MAXCONNECTS, 1L)
+        .set(CURLOPT_MAXAGE_CONN, static_cast<long>(ConnectionPool::kIdleTime.count()))
+        // A name server that is silent must not hold us longer than the time that was given.
+        .set(CURLOPT_QUICK_EXIT, 1L)
+        .set(CURLOPT_WRITEFUNCTION, &HttpConnection::onBody)
+        .set(CURLOPT_WRITEDATA, this)
+        .set(CURLOPT_HEADERFUNCTION, &HttpConnection::onHeader)
+        .set(CURLOPT_HEADERDATA, this)
+        .set(CURLOPT_OPENSOCKETFUNCTION, &HttpConnection::onOpenSocket)
+        .set(CURLOPT_OPENSOCKETDATA, this)
+        .set(CURLOPT_CLOSESOCKETFUNCTION, &HttpConnection::onCloseSocket)
+        .set(CURLOPT_CLOSESOCKETDATA, this)
+        .set(CURLOPT_PREREQFUNCTION, &HttpConnection::onRequest)
+        .set(CURLOPT_PREREQDATA, this);
+    if (endpoint_.isTls()) {
+        options.set(CURLOPT_SSLVERSION, static_cast<long>(CURL_SSLVERSION_TLSv1_2))
+            .set(CURLOPT_CAINFO, nullptr)
+            .set(CURLOPT_CAPATH, kCertificateDir);
+    }
+    if (purpose_ == Purpose::kProbe) {
+        options.set(CURLOPT_SSL_VERIFYPEER, 0L)
+            .set(CURLOPT_SSL_VERIFYHOST, 0L)
+            .set(CURLOPT_SSL_SESSIONID_CACHE, 0L)
+            .set(CURLOPT_FORBID_REUSE, 1L);
+    } else {
+        // The judge replaces libcurl's check of the chain, and checks the host as well.
+        options.set(CURLOPT_SSL_VERIFYPEER, 1L)
+            .set(CURLOPT_SSL_VERIFYHOST, 0L)
+            .set(CURLOPT_SSL_CTX_FUNCTION, &HttpConnection::onTlsContext)
+            .set(CURLOPT_SSL_CTX_DATA, this);
+    }
+    return options.ok();
+}
+
+HttpAnswer HttpConnection::get(const std::string &url, Deadline deadline) {
+    if (!Options(handle_.get()).set(CURLOPT_HTTPGET, 1L).ok()) {
+        return {CredError::kOutOfMemory};
+    }
+    return perform(url, deadline);
+}
+
+HttpAnswer HttpConnection::post(const std::string &url, const std::string &body,
+                                Deadline deadline) {
+    const bool set = Options(handle_.get())
+                         .set(CURLOPT_POSTFIELDS, body.c_str())
+                         .set(CURLOPT_POSTFIELDSIZE_LARGE, static_cast<curl_off_t>(body.size()))
+                         .ok();
+    HttpAnswer answer = set ? perform(url, deadline) : HttpAnswer{CredError::kOutOfMemory};
+    curl_easy_setopt(handle_.get(), CURLOPT_POSTFIELDS, nullptr);
+    return answer;
+}
+
+HttpAnswer HttpConnection::postFile(const std::string &url,
+                                    const std::vector<std::pair<std::string, std::string>> &fields,
+                                    const Upload &upload, Deadline deadline) {
+    if (!isRegularFile(upload.path)) {
+        return {CredError::kUploadUnreadable};
+    }
+    const Mime form = makeForm(handle_.get(), fields, upload);
+    if (!form) {
+        return {CredError::kUploadUnreadable};
+    }
+    const bool set = Options(handle_.get()).set(CURLOPT_MIMEPOST, form.get()).ok();
+    HttpAnswer answer = set ? perform(url, deadline) : HttpAnswer{CredError::kOutOfMemory};
+    curl_easy_setopt(handle_.get(), CURLOPT_MIMEPOST, nullptr);
+    return answer;
+}
+
+HttpAnswer HttpConnection::connectOnly(const std::string &url, Deadline deadline) {
+    if (!Options(handle_.get()).set(CURLOPT_CONNECT_ONLY, 1L).ok()) {
+        return {CredError::kOutOfMemory};
+    }
+    return perform(url, deadline);
+}
+
+HttpAnswer HttpConnection::perform(const std::string &url, Deadline deadline) {
+    const long left = millisecondsUntil(deadline);
+    if (left <= 0) {
+        return {CredError::kTimedOut};
+    }
+    const std::size_t limit = purpose_ == Purpose::kProbe ? kMaxProbeReply : kMaxReply;
+    const bool set = Options(handle_.get())
+                         .set(CURLOPT_URL, url.c_str())
+                         .set(CURLOPT_TIMEOUT_MS, left)
+                         .set(CURLOPT_CONNECTTIMEOUT_MS, std::min(left, kConnectMillis))
+                         .set(CURLOPT_MAXFILESIZE_LARGE, static_cast<curl_off_t>(limit))
+                         .ok();
+    if (!set) {
+        return {CredError::kOutOfMemory};
+    }
+    answer_ = HttpAnswer();
+    headerBytes_ = 0;
+    attempt_ = Attempt();
+    replyTooLarge_ = false;
+    const SigpipeGuard noSigpipe;
+    const CURLcode code = curl_easy_perform(handle_.get());
+    if (code != CURLE_OK) {
+        OVRA_INFO("Request to [%s] failed: [%s]", endpoint_.key().c_str(),
+                  curl_easy_strerror(code));
+        return {errorOf(code)};
+    }
+    curl_easy_getinfo(handle_.get(), CURLINFO_RESPONSE_CODE, &answer_.status);
+    return std::move(answer_);
+}
+
+CredError HttpConnection::errorOf(CURLcode code) const {
+    const CertificateVerifier::Verdict verdict = verifier_.verdict();
+    if (verdict == CertificateVerifier::Verdict::kChanged) {
+        return CredError::kCertificateChanged;
+    }
+    if (verdict == CertificateVerifier::Verdict::kUnavailable) {
+        return CredError::kTrustUnavailable;
+    }
+    if (attempt_.endedInSilence) {
+        return CredError::kTimedOut;
+    }
+    switch (code) {
+    case CURLE_OPERATION_TIMEDOUT:
+        return CredError::kTimedOut;
+    case CURLE_COULDNT_RESOLVE_HOST:
+    case CURLE_COULDNT_CONNECT:
+    case CURLE_SSL_CONNECT_ERROR:
+    case CURLE_PEER_FAILED_VERIFICATION:
+        return CredError::kCannotConnect;
+    case CURLE_FILESIZE_EXCEEDED:
+        return CredError::kReplyTooLarge;
+    case CURLE_WRITE_ERROR:
+        return replyTooLarge_ ? CredError::kReplyTooLarge : CredError::kOutOfMemory;
+    case CURLE_OUT_OF_MEMORY:
+        return CredError::kOutOfMemory;
+    case CURLE_READ_ERROR:
+        return CredError::kUploadUnreadable;
+    case CURLE_GOT_NOTHING:
+    case CURLE_PARTIAL_FILE:
+    case CURLE_RECV_ERROR:
+    case CURLE_SEND_ERROR:
+    case CURLE_ABORTED_BY_CALLBACK: // onRequest() would not send it twice
+        return CredError::kConnectionLost;
+    case CURLE_UNSUPPORTED_PROTOCOL: // a reply without a status line
+    case CURLE_WEIRD_SERVER_REPLY:
+    case CURLE_BAD_CONTENT_ENCODING:
+        return CredError::kReplyBroken;
+    default:
+        OVRA_ERR("Unexpected failure of a request: [%s]", curl_easy_strerror(code));
+        return CredError::kInternal;
+    }
+}
+
+std::size_t HttpConnection::onBody(char *data, std::size_t size, std::size_t count, void *self) {
+    auto *connection = static_cast<HttpConnection *>(self);
+    const std::size_t limit = connection->purpose_ == Purpose::kProbe ? kMaxProbeReply : kMaxReply;
+    if (connection->answer_.body.size() + size * count > limit) {
+        connection->replyTooLarge_ = true;
+        return 0;
+    }
+    try {
+        connection->answer_.body.append(data, size * count);
+    } catch (const std::exception &) {
+        return 0;
+    }
+    return size * count;
+}
+
+std::size_t HttpConnection::onHeader(char *, std::size_t size, std::size_t count, void *self) {
+    auto *connection = static_cast<HttpConnection *>(self);
+    connection->headerBytes_ += size * count;
+    connection->replyTooLarge_ = connection->headerBytes_ > kMaxHeader;
+    return connection->replyTooLarge_ ? 0 : size * count;
+}
+
+CURLcode HttpConnection::onTlsContext(CURL *, void *context, void *self) {
+    static_cast<HttpConnection *>(self)->verifier_.install(static_cast<SSL_CTX *>(context));
+    return CURLE_OK;
+}
+
+/// Called when a connection is ready (TLS included) and before anything of the request is sent.
+///
+/// libcurl repeats a request by itself when a kept connection ends without an answer, also when the
+/// peer may have carried it out. Here it is repeated only when the peer's kernel had acknowledged
+/// none of its bytes, and not when the peer fell silent.
+int HttpConnection::onRequest(void *self, char *, char *, int, int) {
+    auto *connection = static_cast<HttpConnection *>(self);
+    Attempt &attempt = connection->attempt_;
+    ++attempt.count;
+    if (attempt.count > kMaxAttempts || (attempt.count > 1 && attempt.mayHaveArrived)) {
+        return CURL_PREREQFUNC_ABORT;
+    }
+    if (connection->purpose_ == Purpose::kRequests && !connection->verifier_.pinNewKey()) {
+        return CURL_PREREQFUNC_ABORT;
+    }
+    attempt.mayHaveArrived = true;
+    attempt.socket = connection->sockets_.size() == 1 ? connection->sockets_.front() : -1;
+    attempt.delivered = deliveredBytes(attempt.socket);
+    if (attempt.socket >= 0 && !connection->endsWhenSilent_) {
+        endWhenSilent(attempt.socket);
+        connection->endsWhenSilent_ = true;
+    }
+    return CURL_PREREQFUNC_OK;
+}
+
+curl_socket_t HttpConnection::onOpenSocket(void *self, curlsocktype, curl_sockaddr *address) {
+    auto *connection = static_cast<HttpConnection *>(self);
+    if (connection->attempt_.endedInSilence) {
+        return CURL_SOCKET_BAD; // it would be waited for once more
+    }
+    const int fd = ConnectionPool::instance().openSocket(address->family, address->socktype,
+                                                         address->protocol);
+    if (fd < 0) {
+        return CURL_SOCKET_BAD;
+    }
+    connection->sockets_.push_back(fd);
+    connection->endsWhenSilent_ = false;
+    return fd;
+}
+
+int HttpConnection::onCloseSocket(void *self, curl_socket_t socket) {
+    auto *connection = static_cast<HttpConnection *>(self);
+    Attempt &attempt = connection->attempt_;
+    if (socket == attempt.socket) {
+        const std::optional<std::uint64_t> delivered = deliveredBytes(socket);
+        attempt.mayHaveArrived = !delivered || delivered != attempt.delivered;
+        attempt.endedInSilence = endedInSilence(socket);
+        attempt.socket = -1;
+    }
+    std::vector<int> &sockets = connection->sockets_;
+    sockets.erase(std::remove(sockets.begin(), sockets.end(), socket), sockets.end());
+    ConnectionPool::instance().closeSocket(socket);
+    return 0;
+}
+
+} // namespace OvraPlatform

@@ -1,0 +1,109 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include "http/endpoint.h"
+#include "ovraplatform/cred_errors.h"
+#include "trust/certificate_verifier.h"
+
+#include <curl/curl.h>
+
+#include <chrono>
+#include <cstddef>
+#include <cstdint>
+#include <memory>
+#include <optional>
+#include <string>
+#include <utility>
+#include <vector>
+
+namespace OvraPlatform {
+
+using Deadline = std::chrono::steady_clock::time_point;
+
+/// Bound on the body of a reply.
+inline constexpr std::size_t kMaxReply = std::size_t{8} * 1024 * 1024;
+
+struct HttpAnswer {
+    CredError error = CredError::kNone; ///< kNone: an answer came, with any status
+    long status = 0;
+    std::string body;
+};
+
+/// A file that travels with a request.
+struct Upload {
+    std::string path;
+    std::string name; ///< its field name and file name in the form
+};
+
+/// One libcurl handle for one endpoint, with at most one connection. For one thread at a time.
+///
+/// HTTP 1.1 and TLS 1.2 or newer; no redirects, no proxy, no .netrc, nothing from the environment.
+class HttpConnection {
+public:
+    enum class Purpose {
+        kRequests, ///< the certificate is judged, new keys are pinned, the connection is kept
+        kProbe,    ///< the certificate is not looked at; nothing secret may be sent
+        kObserve,  ///< the certificate is judged but passes anyway; nothing is sent
+    };
+
+    /// Null when there is no memory.
+    static std::unique_ptr<HttpConnection> open(const Endpoint &endpoint, Purpose purpose);
+    HttpConnection(const HttpConnection &) = delete;
+    HttpConnection &operator=(const HttpConnection &) = delete;
+    ~HttpConnection();
+
+    HttpAnswer get(const std::string &url, Deadline deadline);
+    /// \param body  application/x-www-form-urlencoded
+    HttpAnswer post(const std::string &url, const std::string &body, Deadline deadline);
+    /// Sends multipart/form-data: the fields, then the file.
+    HttpAnswer postFile(const std::string &url,
+                        const std::vector<std::pair<std::string, std::string>> &fields,
+                        const Upload &upload, Deadline deadline);
+    /// Connects, shakes hands, and sends nothing.
+    HttpAnswer connectOnly(const std::string &url, Deadline deadline);
+
+    const CertificateVerifier &verifier() const { return verifier_; }
+
+private:
+    /// One use of a connection, to tell whether it may be repeated on another one.
+    struct Attempt {
+        int count = 0;
+        int socket = -1;
+        std::optional<std::uint64_t> delivered; ///< bytes that had arrived when it began
+        bool mayHaveArrived = true;             ///< something of a request that failed
+        bool endedInSilence = false;            ///< the peer said nothing any more
+    };
+    struct FreeHandle {
+        void operator()(CURL *handle) const { curl_easy_cleanup(handle); }
+    };
+    struct FreeList {
+        void operator()(curl_slist *list) const { curl_slist_free_all(list); }
+    };
+
+    HttpConnection(const Endpoint &endpoint, Purpose purpose);
+    bool setUp();
+    HttpAnswer perform(const std::string &url, Deadline deadline);
+    CredError errorOf(CURLcode code) const;
+
+    static std::size_t onBody(char *data, std::size_t size, std::size_t count, void *self);
+    static std::size_t onHeader(char *data, std::size_t size, std::size_t count, void *self);
+    static CURLcode onTlsContext(CURL *handle, void *context, void *self);
+    static int onRequest(void *self, char *peer, char *local, int peerPort, int localPort);
+    static curl_socket_t onOpenSocket(void *self, curlsocktype type, curl_sockaddr *address);
+    static int onCloseSocket(void *self, curl_socket_t socket);
+
+    Endpoint endpoint_;
+    Purpose purpose_;
+    CertificateVerifier verifier_;
+    std::unique_ptr<curl_slist, FreeList> headers_;
+    HttpAnswer answer_;
+    std::size_t headerBytes_ = 0;
+    Attempt attempt_;
+    std::vector<int> sockets_; ///< more than one only while several addresses are tried
+    bool replyTooLarge_ = false;
+    bool endsWhenSilent_ = false; ///< the present socket has been told to
+    // Last, so that it goes first: closing a connection calls back.
+    std::unique_ptr<CURL, FreeHandle> handle_;
+};
+
+} // namespace OvraPlatform

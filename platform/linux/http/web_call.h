@@ -1,0 +1,44 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include "http/http_connection.h"
+#include "ovraplatform/sealed_box.h"
+#include "ovraplatform/wire_form.h"
+
+#include <optional>
+#include <string>
+
+namespace OvraPlatform {
+
+struct WebCallOptions {
+    Deadline deadline;   ///< for everything together
+    bool reuse = true;   ///< a kept connection may carry it, and it may be kept
+    bool sealed = false; ///< seal the parameters also where TLS protects them
+    std::optional<Upload> upload;
+};
+
+struct WebReply {
+    CredError error = CredError::kNone;
+    std::string document; ///< a reply document when there is no error
+};
+
+/// Calls a web API of a remote appliance and returns its reply document, opened when it was sealed.
+///
+/// Over plain http every call travels sealed, to the key that the endpoint had when it was first
+/// met. A call that is refused because the clocks differ, or because the appliance has a new key,
+/// is sealed anew and sent once more.
+WebReply callWebAPI(const Endpoint &endpoint, const WireCall &call, const WebCallOptions &options);
+
+/// Asks the entry point without any secret, and whoever it is. kNone: it answered.
+CredError probe(const Endpoint &endpoint, const std::string &url, Deadline deadline);
+
+struct FetchedKey {
+    CredError error = CredError::kNone;
+    PublicKey key{};
+};
+
+/// Asks the endpoint for the key that requests to it are sealed to. Over plain http anybody may
+/// have answered; nothing is judged here.
+FetchedKey fetchSealKey(const Endpoint &endpoint, const WebCallOptions &options);
+
+} // namespace OvraPlatform

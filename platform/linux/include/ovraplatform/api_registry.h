@@ -1,0 +1,83 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include "ovraplatform/api_call.h"
+#include "ovraplatform/export.h"
+
+#include <json/value.h>
+
+#include <functional>
+#include <map>
+#include <string>
+
+namespace OvraPlatform {
+
+/// Who may call.
+enum class APIRight {
+    kNone,          ///< anybody, also without a session
+    kSession,       ///< any user who is logged in
+    kAdministrator, ///< an administrator who is logged in
+};
+
+/// Where a call has to run.
+enum class APIQueue {
+    kQuick, ///< answers from this machine alone
+    kSlow,  ///< may wait on the network; must not hold up the quick ones
+};
+
+/// On whose behalf a handler runs.
+struct APICaller {
+    std::string user; ///< empty: nobody is logged in
+    bool administrator = false;
+    std::string session; ///< the session id; empty for a local caller
+    std::string address; ///< the client's address; empty for a local caller
+    bool local = false;  ///< a process of this appliance, not a remote client
+};
+
+/// Gets the parameters (always an object) and returns a reply document (webapi/api_errors.h).
+using APIHandler = std::function<Json::Value(const Json::Value &params, const APICaller &caller)>;
+
+/// The web-API handlers of a process, found by API, version and method.
+///
+/// Filled by one thread first, then used by any number of them.
+class OVRAPLATFORM_EXPORT APIRegistry {
+public:
+    struct Entry {
+        APIRight right;
+        APIQueue queue;
+        APIHandler handler;
+    };
+
+    APIRegistry() = default;
+    APIRegistry(const APIRegistry &) = delete;
+    APIRegistry &operator=(const APIRegistry &) = delete;
+    /// A hosted registry is no longer hosted; no call may be under way.
+    ~APIRegistry();
+
+    /// Registers a handler; one that was there under the same names is replaced.
+    void add(const std::string &api, int version, const std::string &method, APIRight right,
+             APIQueue queue, APIHandler handler);
+
+    /// The queue of the call. One that nobody registered is quick: it is refused at once.
+    APIQueue queue(const APICall &call) const;
+
+    /// Runs the handler of the call and returns its reply. Never throws: errors 102, 103, 104 for a
+    /// call that nobody registered, 119 and 105 for a caller without the right, 101 for parameters
+    /// that are no object, 100 for a handler that threw or returned no reply document.
+    Json::Value dispatch(const APICall &call, const APICaller &caller) const;
+
+    /// Makes this registry the one in which OVRA::APIRunner runs the calls of this process.
+    void host();
+    /// The registry that this process hosts, or null.
+    static const APIRegistry *hosted();
+
+private:
+    using Versions = std::map<int, Entry>;
+    using Methods = std::map<std::string, Versions>;
+
+    const Entry *find(const APICall &call, int &error) const;
+
+    std::map<std::string, Methods> apis_;
+};
+
+} // namespace OvraPlatform

@@ -1,0 +1,59 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include "ovraplatform/export.h"
+
+#include <string>
+#include <vector>
+
+/// Everything that the platform for stand-alone Linux has fixed: its files, and the settings of the
+/// appliance. Formats, modes and recovery of the files: docs/files.md.
+namespace OvraPlatform {
+
+/// Settings, keys and certificate: written by `ovradr setup` and by the operator. Mode 0755,
+/// because the node identity and the node database live here too.
+inline constexpr char kConfigDir[] = "/usr/ovra/etc/ovradr";
+inline constexpr char kConfigFile[] = "/usr/ovra/etc/ovradr/ovradrd.conf";
+inline constexpr char kTlsKeyFile[] = "/usr/ovra/etc/ovradr/ovradrd.key";         ///< mode 0600
+inline constexpr char kTlsCertificateFile[] = "/usr/ovra/etc/ovradr/ovradrd.crt"; ///< mode 0644
+inline constexpr char kSealKeyFile[] = "/usr/ovra/etc/ovradr/ovradrd.seal";       ///< mode 0600
+inline constexpr char kFarlinkFile[] = "/usr/ovra/etc/ovradr/farlink.conf";
+
+/// What the platform writes while it runs. Mode 0700.
+inline constexpr char kStateDir[] = "/usr/ovra/var/ovradr";
+inline constexpr char kFarlinkKeyFile[] = "/usr/ovra/var/ovradr/farlink.key"; ///< mode 0600
+inline constexpr char kSocketFile[] = "/usr/ovra/var/ovradr/webapi.sock";
+inline constexpr char kAccountsFile[] = "/usr/ovra/var/ovradr/accounts.db";
+inline constexpr char kSessionsFile[] = "/usr/ovra/var/ovradr/sessions.db";
+inline constexpr char kKnownEndpointsFile[] = "/usr/ovra/var/ovradr/known_endpoints";
+
+/// The settings of this appliance, the lines key="value" of ovradrd.conf. A key that is missing or
+/// empty has the value given here.
+struct ApplianceConfig {
+    int httpPort = 5000;  ///< key http_port
+    int httpsPort = 5001; ///< key https_port
+    /// Whether the appliance serves at every address of the machine: the key `address` is not set.
+    bool servesAllAddresses = true;
+    /// Otherwise the addresses that it serves at, numeric text, in the order of the file (key
+    /// address, separated by commas). Empty when the key holds nothing usable.
+    std::vector<std::string> addresses;
+    std::string hostname; ///< key hostname; empty: the system's
+    std::string serial;   ///< key serial; empty: the machine's
+
+    /// One sentence for everything in the file that could not be taken; a program that serves
+    /// should not start while there are any.
+    std::vector<std::string> problems;
+};
+
+/// Reads the settings. A value that is not usable is named in `problems` and in one ERR log line
+/// and counts as not set, except that an unusable `address` never widens to every address. A file
+/// that does not exist is an appliance with defaults.
+OVRAPLATFORM_EXPORT ApplianceConfig readApplianceConfig(const std::string &path = kConfigFile);
+
+/// Makes the state directory, mode 0700, and what is missing above it, mode 0755. One that exists
+/// must be a directory of our own user that nobody else can write to.
+/// \param path  kStateDir, or a path that stands for it
+/// \return false, after an ERR log line that says what to do, when it cannot be used.
+OVRAPLATFORM_EXPORT bool ensureStateDir(const std::string &path = kStateDir);
+
+} // namespace OvraPlatform

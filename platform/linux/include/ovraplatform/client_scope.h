@@ -1,0 +1,25 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include "ovraplatform/export.h"
+
+#include <string>
+
+namespace OvraPlatform {
+
+/// While it lives, `address` is the web client for which this thread works: what the login-session
+/// library records and reports. Scopes nest; they are destroyed in the thread that made them.
+class OVRAPLATFORM_EXPORT ClientScope {
+public:
+    /// \param address  numeric text; anything else counts as "no client"
+    explicit ClientScope(std::string address);
+    ClientScope(const ClientScope &) = delete;
+    ClientScope &operator=(const ClientScope &) = delete;
+    ~ClientScope();
+
+private:
+    std::string address_;
+    const std::string *previous_;
+};
+
+} // namespace OvraPlatform

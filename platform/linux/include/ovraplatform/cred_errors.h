@@ -1,0 +1,31 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include "ovraplatform/export.h"
+
+namespace OvraPlatform {
+
+/// The error numbers of the credential request library, as OVRA::CredRequest::GetError() gives
+/// them. 4, 5, 6 and 10 are a contract with the node library; the others tell failures apart.
+enum class CredError : int {
+    kNone = 0,
+    kBadArgument = 1,        ///< an endpoint, a path or a call that cannot be used
+    kOutOfMemory = 2,        ///< no memory, or no descriptor
+    kInternal = 3,           ///< a failure that has no number of its own
+    kNoPermission = 4,       ///< HTTP status 401 or 403
+    kCannotConnect = 5,      ///< no such name, refused, unreachable, or no TLS on that port
+    kCertificateChanged = 6, ///< the endpoint's key is not the one trusted for it
+    kReplyTooLarge = 7,      ///< over 8 MiB
+    kReplyBroken = 8,        ///< empty, not HTTP, or not a reply document
+    kConnectionLost = 9,     ///< the connection ended before the reply was complete
+    kTimedOut = 10,          ///< not done within the time that was given
+    kHttpStatus = 11,        ///< an HTTP status that is no answer
+    kUploadUnreadable = 12,  ///< the file to send cannot be read, or cannot travel as it must
+    kSealFailed = 13,        ///< the request could not be sealed, or the reply not opened
+    kTrustUnavailable = 14,  ///< the file of trusted keys can be neither read nor written
+};
+
+/// What the number means and what to do, for people; never null.
+OVRAPLATFORM_EXPORT const char *credErrorText(int error);
+
+} // namespace OvraPlatform

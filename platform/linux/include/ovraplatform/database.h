@@ -1,0 +1,120 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include "ovraplatform/export.h"
+
+#include <cstdint>
+#include <memory>
+#include <optional>
+#include <string>
+#include <string_view>
+
+struct sqlite3;
+struct sqlite3_stmt;
+
+namespace OvraPlatform {
+
+/// What kind of file a store has.
+struct DatabaseLayout {
+    const char *name;   ///< as messages call it, e.g. "session store"
+    int applicationId;  ///< SQLite's application_id: another program's file is refused
+    int version;        ///< SQLite's user_version: a newer program's file is refused
+    const char *schema; ///< makes the tables in a new file
+};
+
+/// A prepared statement. Text and blobs are bound, never pasted.
+class OVRAPLATFORM_EXPORT Statement {
+public:
+    Statement &bind(int index, std::string_view text);
+    Statement &bind(int index, std::int64_t number);
+    Statement &bindBlob(int index, std::string_view bytes);
+    /// Binds nothing, i.e. NULL, for an absent text.
+    Statement &bindOptional(int index, std::string_view text);
+
+    /// \return true when there is a row; false at the end and on failure (Database::failed()).
+    bool step();
+    /// Runs a statement that gives no row; false on failure.
+    bool run();
+
+    std::string text(int column) const; ///< NULL reads as ""
+    std::int64_t number(int column) const;
+    bool isNull(int column) const;
+
+private:
+    friend class Database;
+    struct Finalize {
+        void operator()(sqlite3_stmt *statement) const;
+    };
+
+    Statement(class Database *database, sqlite3_stmt *statement)
+        : database_(database)
+        , statement_(statement) {}
+
+    class Database *database_;
+    std::unique_ptr<sqlite3_stmt, Finalize> statement_;
+};
+
+/// One connection to a store's SQLite file. Not shared between threads, nor kept across a fork.
+/// Everything fails, harmlessly, when the file could not be opened. A failure is remembered as one
+/// sentence that says what was wrong and what to do, and is logged once at ERR.
+class OVRAPLATFORM_EXPORT Database {
+public:
+    /// Opens the file; makes it, mode 0600, and its folder (ensureStateDir()) when missing.
+    Database(std::string path, const DatabaseLayout &layout);
+    Database(const Database &) = delete;
+    Database &operator=(const Database &) = delete;
+
+    bool isOpen() const { return database_ != nullptr; }
+    /// Whether anything failed since the last clearError().
+    bool failed() const { return !error_.empty(); }
+    const std::string &error() const { return error_; }
+    void clearError() { error_.clear(); }
+    /// Remembers a failure and logs it at ERR. Always false.
+    bool fail(const std::string &sentence);
+    /// Remembers why the store does not do what it was asked to; the asker tells. Always false.
+    bool refuse(const std::string &sentence);
+
+    Statement prepare(const char *sql);
+    bool execute(const char *sql);
+    /// Rows that the last statement changed.
+    int changes() const;
+
+private:
+    friend class Statement;
+    friend class Transaction;
+    struct Close {
+        void operator()(sqlite3 *database) const;
+    };
+
+    bool makeFile();
+    bool setUp();
+    bool isOurs();
+    bool makeTables();
+    bool failSqlite(int code);
+    void rollback();
+    std::optional<std::int64_t> pragma(const char *sql);
+
+    std::string path_;
+    DatabaseLayout layout_;
+    std::unique_ptr<sqlite3, Close> database_;
+    std::string error_;
+};
+
+/// A write transaction: nothing is written unless commit() says so.
+class OVRAPLATFORM_EXPORT Transaction {
+public:
+    /// Waits for another process's transaction as long as the connection's busy time-out.
+    explicit Transaction(Database &database);
+    Transaction(const Transaction &) = delete;
+    Transaction &operator=(const Transaction &) = delete;
+    ~Transaction();
+
+    bool isOpen() const { return open_; }
+    bool commit();
+
+private:
+    Database &database_;
+    bool open_;
+};
+
+} // namespace OvraPlatform

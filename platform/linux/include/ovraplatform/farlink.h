@@ -1,0 +1,75 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include "ovraplatform/cred_errors.h"
+#include "ovraplatform/export.h"
+#include "ovraplatform/farlink_key.h"
+
+#include <ovradrcore/response.h>
+
+#include <chrono>
+#include <string>
+
+// The appliance's side of the relay service; docs/wire.md describes the calls.
+namespace OvraPlatform {
+
+inline constexpr char kFarlinkApi[] = "OVRA.Farlink";
+inline constexpr int kFarlinkPort = 5443;
+/// How long the relay service holds a question for callers back when there are none.
+inline constexpr std::chrono::seconds kFarlinkHold{20};
+
+/// Whether the text can be an alias: 3 to 63 lower-case letters, digits and inner hyphens, as a
+/// label of a host name (RFC 1123, 2.1).
+OVRAPLATFORM_EXPORT bool isFarlinkAlias(const std::string &text);
+
+/// Which relay service the appliance uses, and under which name it is reached there.
+struct FarlinkSettings {
+    std::string host; ///< "": none is used
+    int port = kFarlinkPort;
+    std::string alias; ///< "": others are looked up, this appliance is not reached
+
+    bool operator==(const FarlinkSettings &other) const {
+        return host == other.host && port == other.port && alias == other.alias;
+    }
+};
+
+/// The lines host="...", port="..." and alias="..." of kFarlinkFile. A file that is missing or
+/// cannot be used is an appliance without relay service.
+/// \param problem  takes one sentence when the file cannot be used, otherwise ""
+OVRAPLATFORM_EXPORT FarlinkSettings readFarlinkSettings(std::string &problem);
+/// \return false when the file cannot be written.
+OVRAPLATFORM_EXPORT bool writeFarlinkSettings(const FarlinkSettings &settings);
+
+struct OVRAPLATFORM_EXPORT FarlinkReply {
+    CredError error = CredError::kNone; ///< otherwise no answer came
+    OvraDRCore::Response response;
+
+    bool isSuccess() const { return error == CredError::kNone && response.isSuccess(); }
+    /// What went wrong and what to do, for people.
+    std::string why() const;
+};
+
+/// The calls of an appliance to its relay service. Its key is trusted on first use.
+class OVRAPLATFORM_EXPORT FarlinkClient {
+public:
+    explicit FarlinkClient(FarlinkSettings settings)
+        : settings_(std::move(settings)) {}
+
+    /// Where the alias is reached now: "port", and "host" where it is not that of the service.
+    FarlinkReply lookUp(const std::string &alias) const;
+    /// Proves that this appliance has the key of its alias, or takes a free alias: "port",
+    /// "tunnel_port", "token" and "expires".
+    FarlinkReply enrol(const FarlinkKey &key) const;
+    /// Waits for callers of the alias: "callers", maybe none. Error 119: enrol anew.
+    FarlinkReply wait(const std::string &token) const;
+    /// Gives the alias up.
+    FarlinkReply release(const std::string &token) const;
+
+private:
+    FarlinkReply call(const char *method, const Json::Value &params,
+                      std::chrono::seconds time) const;
+
+    FarlinkSettings settings_;
+};
+
+} // namespace OvraPlatform

@@ -1,0 +1,35 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include "ovraplatform/cred_errors.h"
+#include "ovraplatform/export.h"
+#include "ovraplatform/trust_store.h"
+
+#include <string>
+
+namespace OvraPlatform {
+
+/// How an endpoint shows itself now.
+struct PeerIdentity {
+    CredError error = CredError::kNone;
+    std::string fingerprint;       ///< "SHA256:...", as `ssh-keygen -l` shows keys
+    bool acceptedBySystem = false; ///< the system's store accepts its certificate
+    /// What the pinned keys say about it.
+    TrustVerdict pinned = TrustVerdict::kUnknown;
+};
+
+/// Meets the endpoint to show its fingerprint before it is trusted. Nothing secret is sent and
+/// nothing is pinned. Over https it is the fingerprint of the certificate's key, over http that of
+/// the key to which requests are sealed.
+/// \param seconds  1 to 86,400
+OVRAPLATFORM_EXPORT PeerIdentity peerFingerprint(const std::string &protocol,
+                                                 const std::string &host, int port, long seconds);
+
+/// Trusts the fingerprint for the endpoint from now on, before it is met.
+/// \return kTrusted; kDifferent when another one is pinned, which stays; kUnavailable when the
+///         arguments are not valid or the file cannot be written
+OVRAPLATFORM_EXPORT TrustVerdict expectFingerprint(const std::string &protocol,
+                                                   const std::string &host, int port,
+                                                   const std::string &fingerprint);
+
+} // namespace OvraPlatform

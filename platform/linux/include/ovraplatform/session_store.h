@@ -1,0 +1,102 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include "ovraplatform/appliance.h"
+#include "ovraplatform/database.h"
+#include "ovraplatform/export.h"
+
+#include <cstdint>
+#include <ctime>
+#include <functional>
+#include <optional>
+#include <string>
+#include <vector>
+
+namespace OvraPlatform {
+
+/// A login session. The id is a secret: whoever has it acts as the user.
+struct OVRAPLATFORM_EXPORT SessionRecord {
+    std::string id;
+    std::string user;
+    std::string app;          ///< "" when none was given
+    std::string extra;        ///< JSON text, or ""
+    std::string ui;           ///< JSON text, or ""
+    std::string remote;       ///< numeric address of the client, or "" when it is not known
+    std::int64_t created = 0; ///< seconds of the system clock
+    std::optional<std::int64_t> expires; ///< absent: never
+
+    /// Names the session to people and in logs: 16 hexadecimal digits of the id's SHA-256. It opens
+    /// nothing.
+    std::string reference() const;
+    /// One line for people and logs, without the id.
+    std::string toString() const;
+};
+
+/// What a new session is made of.
+struct SessionRequest {
+    std::string user;
+    std::string app;
+    std::string extra;
+    std::string ui;
+    std::string remote;
+    int timeout = 3600;      ///< seconds; negative: never ends; 0 is refused
+    bool keepOthers = false; ///< otherwise the user's other sessions of the same app end
+};
+
+/// The appliance's login sessions, in a SQLite file that all processes share. Expired sessions are
+/// never handed out; they are swept when a session is made, and by sweep(). The clock set back by
+/// more than a minute ends the timed sessions that lie in its future.
+///
+/// An object holds one connection: short-lived, for one thread, not kept across a fork. Every
+/// change is one transaction.
+class OVRAPLATFORM_EXPORT SessionStore {
+public:
+    static constexpr int kMaxSessionsOfUser = 512;
+    static constexpr int kMaxSessions = 4096;
+    static constexpr std::size_t kIdLength = 43; ///< base64url (RFC 4648) of 256 bits, no padding
+    static constexpr std::size_t kMaxUser = 491;
+    static constexpr std::size_t kMaxApp = 255;
+    static constexpr std::size_t kMaxJsonText = 4096; ///< of extra and of ui
+
+    using Clock = std::function<std::time_t()>;
+
+    /// Opens the store; makes file and folder when missing.
+    explicit SessionStore(const std::string &path = kSessionsFile, Clock clock = {});
+
+    bool isOpen() const { return database_.isOpen(); }
+    /// Why the last operation failed, one sentence; "" when it did not.
+    const std::string &error() const { return database_.error(); }
+
+    /// Whether `text` can be the extra or ui text of a session: a JSON object, not too long.
+    static bool isData(const std::string &text);
+
+    /// Makes a session. \return its id, 43 characters (256 random bits); nothing on failure.
+    std::optional<std::string> create(const SessionRequest &request);
+    /// The live session with this id. The time that it takes tells nothing about the ids that
+    /// exist.
+    std::optional<SessionRecord> find(const std::string &id);
+    /// Every live session, the oldest first. \return false on failure.
+    bool list(std::vector<SessionRecord> &sessions);
+    /// Removes the session with this id. \return false on failure; one that is not there is
+    /// removed.
+    bool remove(const std::string &id);
+    /// Removes the expired sessions. \return false on failure.
+    bool sweep();
+    /// Removes, together, the live sessions for which `test` answers true. `test` is called while
+    /// the store is not locked: it may use the store itself.
+    /// \return false on failure; nothing is removed then.
+    bool removeIf(const std::function<bool(const SessionRecord &)> &test);
+
+private:
+    std::int64_t now() const;
+    bool checkRequest(const SessionRequest &request);
+    std::optional<std::int64_t> count(const char *sql, const std::string &user);
+    bool removeExpired();
+    bool makeRoom(const SessionRequest &request);
+    bool insert(const SessionRequest &request, const std::string &id);
+
+    Database database_;
+    Clock clock_;
+};
+
+} // namespace OvraPlatform

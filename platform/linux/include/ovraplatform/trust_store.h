@@ -1,0 +1,67 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include "ovraplatform/appliance.h"
+#include "ovraplatform/export.h"
+
+#include <sys/types.h>
+
+#include <cstdint>
+#include <optional>
+#include <string>
+#include <tuple>
+#include <vector>
+
+namespace OvraBase {
+class FileUpdate;
+} // namespace OvraBase
+
+namespace OvraPlatform {
+
+/// What the store says about a key of an endpoint.
+enum class TrustVerdict {
+    kTrusted,     ///< it is the pinned one
+    kUnknown,     ///< no key is pinned for the endpoint
+    kDifferent,   ///< another key is pinned
+    kUnavailable, ///< the file cannot be read or written; an ERR line says why
+};
+
+/// The keys that endpoints had when they were first met: a text file of mode 0600, one line
+/// "ENDPOINT FINGERPRINT" each, shared by all processes of the appliance.
+///
+/// A change is made under a lock and replaces the file at once, so that a reader needs no lock and
+/// a crash leaves the old file or the new one. Lines that are none of ours stay where they are and
+/// count for nothing; of two lines for one endpoint the first counts.
+class OVRAPLATFORM_EXPORT TrustStore {
+public:
+    struct Entry {
+        std::string endpoint;    ///< "https://host:5001", in lower case
+        std::string fingerprint; ///< "SHA256:..."
+    };
+    /// Changes when the file does.
+    using Stamp = std::tuple<dev_t, ino_t, std::int64_t, std::int64_t, off_t>;
+
+    explicit TrustStore(std::string path = kKnownEndpointsFile);
+
+    TrustVerdict lookup(const std::string &endpoint, const std::string &fingerprint) const;
+    /// Trusts the key from now on, unless another one is pinned.
+    /// \return kTrusted, kDifferent or kUnavailable
+    TrustVerdict pin(const std::string &endpoint, const std::string &fingerprint);
+    /// Drops the key of the endpoint. \return false when the file could not be changed; an endpoint
+    /// without a key is no failure.
+    bool forget(const std::string &endpoint);
+    /// Every pinned key in the order of the file; nothing when the file cannot be read.
+    std::optional<std::vector<Entry>> list() const;
+    /// For those who keep what they looked up: it holds while the stamp is the same.
+    Stamp stamp() const;
+
+private:
+    struct Line;
+
+    std::optional<std::vector<Line>> read() const;
+    bool write(const OvraBase::FileUpdate &file, const std::vector<Line> &lines) const;
+
+    std::string path_;
+};
+
+} // namespace OvraPlatform

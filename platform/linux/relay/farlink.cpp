@@ -1,0 +1,173 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "ovraplatform/farlink.h"
+
+#include "http/web_call.h"
+#include "ovracore/ovracore.h"
+#include "ovracredential/cred_request.h"
+
+#include <ovrabase/address.h>
+#include <ovrabase/number.h>
+#include <ovradrcore/json.h>
+#include <ovradrcore/log.h>
+
+#include <algorithm>
+#include <array>
+#include <exception>
+
+namespace OvraPlatform {
+
+namespace {
+
+constexpr std::size_t kMinAlias = 3;
+constexpr std::size_t kMaxAlias = 63;
+constexpr std::chrono::seconds kAnswerTime{10};
+
+/// "" when the file has no such line.
+std::string setting(const char *key) {
+    std::array<char, 300> value{};
+    const int length =
+        OLIBCFileGetKeyValue(kFarlinkFile, key, value.data(), static_cast<int>(value.size()), 0);
+    return length > 0 ? std::string(value.data(), static_cast<std::size_t>(length)) : std::string();
+}
+
+std::string messageText(const Json::Value &message) {
+    return message.isString() ? message.asString() : OvraDRCore::memberString(message, "text");
+}
+
+} // namespace
+
+bool isFarlinkAlias(const std::string &text) {
+    return text.size() >= kMinAlias && text.size() <= kMaxAlias && text.front() != '-' &&
+           text.back() != '-' && std::all_of(text.begin(), text.end(), [](char c) {
+               return (c >= 'a' && c <= 'z') || (c >= '0' && c <= '9') || c == '-';
+           });
+}
+
+FarlinkSettings readFarlinkSettings(std::string &problem) {
+    problem.clear();
+    FarlinkSettings settings;
+    settings.host = setting("host");
+    settings.alias = setting("alias");
+    const std::string port = setting("port");
+    settings.port = port.empty() ? kFarlinkPort : OvraBase::parsePort(port).value_or(0);
+    const bool usable =
+        settings.port != 0 &&
+        (settings.host.empty() || Endpoint::make("https", settings.host, settings.port)) &&
+        (settings.alias.empty() || isFarlinkAlias(settings.alias));
+    if (!usable) {
+        problem = std::string(kFarlinkFile) +
+                  " names no relay service that could be used: run ovradr farlink enable";
+        return {};
+    }
+    return settings;
+}
+
+bool writeFarlinkSettings(const FarlinkSettings &settings) {
+    const auto put = [](const char *key, const std::string &value) {
+        return OLIBCFileSetKeyValue(kFarlinkFile, key, value.c_str(), "%s=\"%s\"\n") >= 0;
+    };
+    // The alias goes first and comes last: what is half written never offers this appliance at
+    // another service.
+    return put("alias", "") && put("host", settings.host) &&
+           put("port", std::to_string(settings.port)) &&
+           (settings.alias.empty() || put("alias", settings.alias));
+}
+
+std::string FarlinkReply::why() const {
+    if (error != CredError::kNone) {
+        return credErrorText(static_cast<int>(error));
+    }
+    const std::string text = messageText(response.getErrMsg());
+    return text.empty() ? "error " + std::to_string(response.getErrCode()) : text;
+}
+
+FarlinkReply FarlinkClient::call(const char *method, const Json::Value &params,
+                                 std::chrono::seconds time) const {
+    const auto endpoint = Endpoint::make("https", settings_.host, settings_.port);
+    if (!endpoint) {
+        return {CredError::kBadArgument, {}};
+    }
+    WireCall wire;
+    wire.api = kFarlinkApi;
+    wire.version = 1;
+    wire.method = method;
+    wire.params = params;
+    const WebReply reply = callWebAPI(*endpoint, wire, {std::chrono::steady_clock::now() + time});
+    FarlinkReply result{reply.error, {}};
+    if (reply.error == CredError::kNone) {
+        result.response.setResp(reply.document);
+    }
+    return result;
+}
+
+FarlinkReply FarlinkClient::lookUp(const std::string &alias) const {
+    Json::Value params(Json::objectValue);
+    params["alias"] = alias;
+    return call("lookup", params, kAnswerTime);
+}
+
+FarlinkReply FarlinkClient::enrol(const FarlinkKey &key) const {
+    Json::Value params(Json::objectValue);
+    params["alias"] = settings_.alias;
+    params["key"] = key.publicText();
+    FarlinkReply asked = call("challenge", params, kAnswerTime);
+    if (!asked.isSuccess()) {
+        return asked;
+    }
+    const std::string challenge = asked.response.getDataFieldtoStr("challenge");
+    params["challenge"] = challenge;
+    params["signature"] = key.sign(settings_.alias, challenge);
+    return call("enrol", params, kAnswerTime);
+}
+
+FarlinkReply FarlinkClient::wait(const std::string &token) const {
+    Json::Value params(Json::objectValue);
+    params["alias"] = settings_.alias;
+    params["token"] = token;
+    return call("wait", params, kFarlinkHold + kAnswerTime);
+}
+
+FarlinkReply FarlinkClient::release(const std::string &token) const {
+    Json::Value params(Json::objectValue);
+    params["alias"] = settings_.alias;
+    params["token"] = token;
+    return call("release", params, kAnswerTime);
+}
+
+} // namespace OvraPlatform
+
+namespace OVRA {
+
+int CredRequestFarlink::GetConnInfo(const std::string &alias, Json::Value &info, const void *) {
+    info = Json::Value();
+    try {
+        std::string problem;
+        const OvraPlatform::FarlinkSettings settings = OvraPlatform::readFarlinkSettings(problem);
+        if (settings.host.empty()) {
+            OVRA_NOTICE("[%s] cannot be looked up: %s", alias.c_str(),
+                        problem.empty() ? "no relay service is set up on this appliance; run "
+                                          "ovradr farlink enable, or use a direct endpoint"
+                                        : problem.c_str());
+            return 0;
+        }
+        const OvraPlatform::FarlinkReply reply =
+            OvraPlatform::FarlinkClient(settings).lookUp(OvraBase::toLower(alias));
+        const Json::Value port = reply.response.getDataField("port");
+        if (!reply.isSuccess() || !port.isInt()) {
+            OVRA_NOTICE("The relay service [%s] does not tell where [%s] is reached: [%s]",
+                        settings.host.c_str(), alias.c_str(), reply.why().c_str());
+            return 0;
+        }
+        const std::string host = reply.response.getDataFieldtoStr("host");
+        info["host"] = host.empty() ? settings.host : host;
+        info["protocol"] = "https";
+        info["port"] = port.asInt();
+        return 1;
+    } catch (const std::exception &error) {
+        OVRA_ERR("[%s] cannot be looked up: [%s]", alias.c_str(), error.what());
+        info = Json::Value();
+        return 0;
+    }
+}
+
+} // namespace OVRA

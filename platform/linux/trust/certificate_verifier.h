@@ -1,0 +1,58 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include "http/endpoint.h"
+#include "ovraplatform/trust_store.h"
+
+#include <openssl/ssl.h>
+#include <openssl/x509.h>
+
+#include <string>
+
+namespace OvraPlatform {
+
+/// "SHA256:..." of the certificate's public key (its SubjectPublicKeyInfo); "" when there is none.
+/// The key and not the certificate, so that a certificate that is renewed on its key stays trusted.
+std::string fingerprintOf(const X509 *certificate);
+
+/// Judges the certificate of one endpoint in the TLS handshake.
+///
+/// What the system's store accepts for the host is accepted, whatever is pinned. Otherwise the key
+/// must be the pinned one. A key met for the first time passes the handshake, and has to be pinned
+/// (pinNewKey) before anything is sent: only then has the peer proved that it holds the key.
+class CertificateVerifier {
+public:
+    enum class Verdict {
+        kNotAsked,    ///< no certificate was shown yet
+        kSystem,      ///< the system's store accepts it
+        kPinned,      ///< it has the pinned key
+        kNew,         ///< no key is pinned yet
+        kChanged,     ///< another key is pinned
+        kUnavailable, ///< the pinned keys cannot be read
+    };
+
+    /// \param observe  every certificate passes; the verdict is only told
+    CertificateVerifier(Endpoint endpoint, bool observe);
+
+    /// Makes the connections of the context ask this verifier, which has to live as long as they
+    /// do.
+    void install(SSL_CTX *context);
+    /// Pins a key that is new; false when that failed, and then the verdict says why.
+    bool pinNewKey();
+
+    Verdict verdict() const { return verdict_; }
+    /// Of the key that was judged last.
+    const std::string &fingerprint() const { return fingerprint_; }
+
+private:
+    static int verify(X509_STORE_CTX *chain, void *self);
+    Verdict judge(X509_STORE_CTX *chain);
+    bool systemAccepts(X509_STORE_CTX *chain) const;
+
+    Endpoint endpoint_;
+    bool observe_;
+    Verdict verdict_ = Verdict::kNotAsked;
+    std::string fingerprint_;
+};
+
+} // namespace OvraPlatform

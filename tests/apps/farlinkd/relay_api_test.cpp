@@ -1,0 +1,144 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "relay_api.h"
+
+#include <ovradrcore/json.h>
+#include <ovraplatform/farlink_key.h>
+
+#include <gtest/gtest.h>
+
+#include <future>
+
+namespace {
+
+using Farlinkd::AliasRegistry;
+using Farlinkd::RelayApi;
+using Farlinkd::TunnelServer;
+using OvraPlatform::FarlinkKey;
+
+class TheRelayApi : public testing::Test {
+protected:
+    TheRelayApi() {
+        EXPECT_TRUE(tunnelServer.start(OvraService::Listener::listen("127.0.0.1", 0).value()));
+        api.connect(tunnelServer);
+    }
+    ~TheRelayApi() override { api.stop(); }
+
+    using Reply = std::future<Json::Value>;
+    /// Sends a call; its reply may come later.
+    Reply begin(const std::string &method, const Json::Value &params) {
+        OvraPlatform::WireCall call;
+        call.api = "OVRA.Farlink";
+        call.version = 1;
+        call.method = method;
+        call.params = params;
+        const auto promise = std::make_shared<std::promise<Json::Value>>();
+        api.serve({*encodeForm(call), address, true}, [promise](const std::string &document) {
+            Json::Value reply;
+            OvraDRCore::fromString(reply, document);
+            promise->set_value(reply);
+        });
+        return promise->get_future();
+    }
+    Json::Value call(const std::string &method, const Json::Value &params) {
+        return begin(method, params).get();
+    }
+    /// 0, or the error code.
+    static int code(const Json::Value &reply) { return reply["error"]["code"].asInt(); }
+
+    static FarlinkKey key(const char *name) {
+        return FarlinkKey::loadOrCreate(std::string("/usr/ovra/") + name).value();
+    }
+    Json::Value proof(const FarlinkKey &owner, const std::string &alias) {
+        Json::Value params;
+        params["alias"] = alias;
+        params["key"] = owner.publicText();
+        params["challenge"] = call("challenge", params)["data"]["challenge"];
+        params["signature"] = owner.sign(alias, params["challenge"].asString());
+        return params;
+    }
+    Json::Value named(const std::string &alias, const Json::Value &token = Json::Value()) {
+        Json::Value params;
+        params["alias"] = alias;
+        params["token"] = token;
+        return params;
+    }
+
+    std::string address = "192.0.2.1";
+    TunnelServer tunnelServer{[](const std::string &, const std::string &) { return false; }, {}};
+    RelayApi api{AliasRegistry("/usr/ovra/aliases", {20100, 20110, std::chrono::seconds(60), 2}),
+                 {"127.0.0.1", "relay.example", 5444}};
+};
+
+} // namespace
+
+TEST_F(TheRelayApi, GivesAnAliasToWhoProvesTheKeyAndToNobodyElse) {
+    const FarlinkKey owner = key("owner");
+    const FarlinkKey thief = key("thief");
+    EXPECT_EQ(code(call("lookup", named("nas"))), 106) << "nobody has it";
+    const Json::Value made = call("enrol", proof(owner, "nas"));
+    ASSERT_EQ(code(made), 0) << OvraDRCore::toString(made);
+    EXPECT_EQ(code(call("enrol", proof(thief, "nas"))), 105);
+
+    Json::Value replaced = proof(owner, "nas");
+    replaced["key"] = thief.publicText();
+    EXPECT_EQ(code(call("enrol", replaced)), 105) << "a challenge of another key";
+    Json::Value forged = proof(thief, "nas");
+    forged["key"] = owner.publicText();
+    EXPECT_EQ(code(call("enrol", forged)), 105) << "a signature of another key";
+    Json::Value moved = proof(owner, "other");
+    moved["alias"] = "nas2";
+    EXPECT_EQ(code(call("enrol", moved)), 105) << "a proof for another alias";
+    Json::Value old = proof(owner, "nas");
+    old["challenge"] =
+        "1." + old["challenge"].asString().substr(old["challenge"].asString().find('.') + 1);
+    EXPECT_EQ(code(call("enrol", old)), 105) << "a challenge that is none of ours";
+
+    const Json::Value token = made["data"]["token"];
+    EXPECT_EQ(code(call("lookup", named("nas"))), 107) << "it asks for no callers yet";
+    Reply waiting = begin("wait", named("nas", token));
+    for (const char *method : {"wait", "release"}) {
+        EXPECT_EQ(code(call(method, named("nas", "guess"))), 119) << method;
+        EXPECT_EQ(code(call(method, named("other", token))), 119) << method;
+    }
+    Json::Value found = call("lookup", named("nas"));
+    for (int i = 0; i < 100 && code(found) != 0; ++i) {
+        found = call("lookup", named("nas"));
+    }
+    EXPECT_EQ(found["data"]["host"], "relay.example");
+    EXPECT_EQ(code(call("release", named("nas", token))), 0);
+    EXPECT_EQ(code(call("lookup", named("nas"))), 106);
+    EXPECT_EQ(code(call("enrol", proof(thief, "nas"))), 0);
+}
+
+TEST_F(TheRelayApi, TellsTheApplianceOfItsCallersAndOfAnotherEnrolment) {
+    const FarlinkKey owner = key("owner");
+    const Json::Value first = call("enrol", proof(owner, "nas"))["data"]["token"];
+    Reply waiting = begin("wait", named("nas", first));
+    EXPECT_EQ(waiting.wait_for(std::chrono::milliseconds(100)), std::future_status::timeout);
+    EXPECT_TRUE(api.announce("nas", "caller-1"));
+    EXPECT_EQ(waiting.get()["data"]["callers"][0], "caller-1");
+    EXPECT_TRUE(api.announce("nas", "caller-2")) << "between two questions";
+    EXPECT_EQ(call("wait", named("nas", first))["data"]["callers"][0], "caller-2");
+    EXPECT_FALSE(api.announce("nobody", "caller-3"));
+
+    waiting = begin("wait", named("nas", first));
+    const Json::Value second = call("enrol", proof(owner, "nas"))["data"]["token"];
+    EXPECT_EQ(code(waiting.get()), 119) << "the earlier one learns it at once";
+    EXPECT_EQ(code(call("wait", named("nas", first))), 119);
+    waiting = begin("wait", named("nas", second));
+    EXPECT_EQ(waiting.wait_for(std::chrono::milliseconds(100)), std::future_status::timeout);
+}
+
+TEST_F(TheRelayApi, BoundsWhatOneAddressMayDo) {
+    const FarlinkKey owner = key("owner");
+    int attempts = 0;
+    while (attempts < 100 && code(call("challenge", named("nas"))) == 0) {
+        ++attempts;
+    }
+    EXPECT_EQ(attempts, 30);
+    address = "192.0.2.2";
+    EXPECT_EQ(code(call("challenge", named("nas"))), 0) << "others are not held up";
+    for (const char *alias : {"", "ab", "-ab", "ab-", "a b", "a/b", "NAS", "../aliases"}) {
+        EXPECT_EQ(code(call("enrol", named(alias))), 106) << alias;
+    }
+}

@@ -1,0 +1,145 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "tunnel_server.h"
+
+#include <arpa/inet.h>
+#include <gtest/gtest.h>
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include <condition_variable>
+#include <mutex>
+#include <thread>
+
+namespace {
+
+using Farlinkd::TunnelServer;
+using OvraBase::UniqueFd;
+using OvraService::Listener;
+
+UniqueFd dial(int port) {
+    UniqueFd fd(socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0));
+    sockaddr_in address{};
+    address.sin_family = AF_INET;
+    address.sin_port = htons(static_cast<std::uint16_t>(port));
+    address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+    const timeval patience{10, 0};
+    setsockopt(fd.get(), SOL_SOCKET, SO_RCVTIMEO, &patience, sizeof patience);
+    EXPECT_EQ(connect(fd.get(), reinterpret_cast<sockaddr *>(&address), sizeof address), 0);
+    return fd;
+}
+
+void say(const UniqueFd &fd, const std::string &text) {
+    for (std::size_t done = 0; done < text.size();) {
+        const ssize_t size = send(fd.get(), &text[done], text.size() - done, MSG_NOSIGNAL);
+        if (size <= 0) {
+            return;
+        }
+        done += static_cast<std::size_t>(size);
+    }
+}
+
+/// What comes until the other end closes, or 10 seconds have passed without a byte ("timeout").
+std::string hearAll(const UniqueFd &fd) {
+    std::string all;
+    std::string buffer(1 << 16, '\0');
+    for (;;) {
+        const ssize_t size = recv(fd.get(), buffer.data(), buffer.size(), 0);
+        if (size <= 0) {
+            return size < 0 && errno == EAGAIN ? "timeout" : all;
+        }
+        all.append(buffer, 0, static_cast<std::size_t>(size));
+    }
+}
+
+class ThroughTheTunnelServer : public testing::Test {
+protected:
+    void begin(const TunnelServer::Limits &limits) {
+        server = std::make_unique<TunnelServer>(
+            [this](const std::string &alias, const std::string &id) {
+                const std::lock_guard lock(mutex);
+                rung = alias == "nas" ? id : "";
+                announced.notify_all();
+                return there;
+            },
+            limits);
+        auto tunnel = Listener::listen("127.0.0.1", 0);
+        auto callers = Listener::listen("127.0.0.1", 0);
+        ASSERT_TRUE(tunnel && callers);
+        tunnelPort = tunnel->port;
+        callerPort = callers->port;
+        ASSERT_TRUE(server->start(std::move(*tunnel)));
+        server->open("nas", std::move(*callers));
+    }
+    /// The caller that was announced since the last time.
+    std::string caller() {
+        std::unique_lock lock(mutex);
+        announced.wait_for(lock, std::chrono::seconds(10), [this] { return !rung.empty(); });
+        return std::exchange(rung, "");
+    }
+    UniqueFd answer(const std::string &id) const {
+        UniqueFd fd = dial(tunnelPort);
+        say(fd, "FARLINK1 " + id + "\n");
+        return fd;
+    }
+
+    std::mutex mutex;
+    std::condition_variable announced;
+    std::string rung;
+    bool there = true;
+    int tunnelPort = 0;
+    int callerPort = 0;
+    std::unique_ptr<TunnelServer> server;
+};
+
+} // namespace
+
+TEST_F(ThroughTheTunnelServer, EveryByteGoesThroughBothWaysAlsoAfterOneEndHasFinished) {
+    begin({});
+    std::string much(8 << 20, '\0');
+    for (std::size_t i = 0; i < much.size(); ++i) {
+        much[i] = static_cast<char>(i * 2654435761U >> 24U);
+    }
+    UniqueFd client = dial(callerPort);
+    say(client, "early"); // before anybody is there
+    UniqueFd appliance = answer(caller());
+    std::thread talk([&] {
+        say(client, much);
+        shutdown(client.get(), SHUT_WR);
+    });
+    const std::string heard = hearAll(appliance);
+    talk.join();
+    EXPECT_TRUE(heard == "early" + much);
+    std::thread reply([&] {
+        say(appliance, much);
+        appliance.reset();
+    });
+    EXPECT_TRUE(hearAll(client) == much);
+    reply.join();
+}
+
+TEST_F(ThroughTheTunnelServer, NobodyIsConnectedToSomebodyElse) {
+    begin({.line = std::chrono::milliseconds(300), .answer = std::chrono::milliseconds(600)});
+    const UniqueFd client = dial(callerPort);
+    const std::string id = caller();
+    std::string other = id;
+    other[0] = other[0] == '0' ? '1' : '0';
+    EXPECT_EQ(hearAll(answer(other)), "") << "another caller";
+    EXPECT_EQ(hearAll(answer(id.substr(1))), "") << "never says it all";
+    EXPECT_EQ(hearAll(client), "") << "whom nobody answers";
+    EXPECT_EQ(hearAll(answer(id)), "") << "too late";
+    there = false;
+    EXPECT_EQ(hearAll(dial(callerPort)), "") << "the appliance is not there";
+}
+
+TEST_F(ThroughTheTunnelServer, AreBoundedAndEndWithTheAlias) {
+    begin({.perAlias = 1, .idle = std::chrono::milliseconds(500)});
+    UniqueFd client = dial(callerPort);
+    UniqueFd appliance = answer(caller());
+    EXPECT_EQ(hearAll(dial(callerPort)), "") << "one too many";
+    EXPECT_EQ(hearAll(client), "") << "in silence for too long";
+    client = dial(callerPort);
+    appliance = answer(caller());
+    server->close("nas");
+    EXPECT_EQ(hearAll(client), "");
+    EXPECT_EQ(hearAll(appliance), "");
+}

@@ -1,0 +1,136 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "login_throttle.h"
+
+#include <gtest/gtest.h>
+
+#include <chrono>
+#include <string>
+#include <thread>
+#include <vector>
+
+using Ovradrd::LoginThrottle;
+using std::chrono::milliseconds;
+
+namespace {
+
+struct Throttle : testing::Test {
+    /// The milliseconds that a log-in has to wait; -1: it is turned away.
+    long admit(const std::string &account, const std::string &address) {
+        const auto wait = throttle.admit(account, address);
+        return wait ? static_cast<long>(wait->count()) : -1;
+    }
+    /// A log-in that waits as it is told and then fails.
+    long fail(const std::string &account, const std::string &address) {
+        const long wait = admit(account, address);
+        now += milliseconds(wait);
+        return wait;
+    }
+
+    LoginThrottle::TimePoint now{std::chrono::hours(1)};
+    LoginThrottle throttle{[this] { return now; }};
+};
+
+TEST_F(Throttle, DoublesTheWaitAfterThreeFailures) {
+    for (const long wait : {0, 0, 0, 250, 500, 1000, 2000, 4000, 8000, 8000, 8000}) {
+        EXPECT_EQ(fail("ann", "192.0.2.1"), wait);
+    }
+    EXPECT_EQ(admit("bob", "192.0.2.2"), 0);
+}
+
+TEST_F(Throttle, CountsForTheAccountAndForTheAddressByThemselves) {
+    for (int i = 0; i < 5; ++i) {
+        fail("ann", "192.0.2." + std::to_string(i));
+    }
+    EXPECT_EQ(admit("ann", "192.0.2.99"), 1000);
+    EXPECT_EQ(admit("bob", "192.0.2.0"), 0);
+    for (int i = 0; i < 5; ++i) {
+        fail("user" + std::to_string(i), "198.51.100.1");
+    }
+    EXPECT_EQ(admit("other", "198.51.100.1"), 1000);
+}
+
+TEST_F(Throttle, SpacesLoginsThatComeAtOnceAndTurnTheRestAway) {
+    for (int i = 0; i < 8; ++i) {
+        fail("ann", "192.0.2.1");
+    }
+    EXPECT_EQ(admit("ann", "192.0.2.1"), 8000);
+    EXPECT_EQ(admit("ann", "192.0.2.1"), 16000);
+    EXPECT_EQ(admit("ann", "192.0.2.1"), -1);
+    EXPECT_EQ(admit("ann", "192.0.2.2"), -1);
+    now += std::chrono::seconds(8);
+    EXPECT_EQ(admit("ann", "192.0.2.1"), 16000);
+}
+
+TEST_F(Throttle, AMinuteTakesOneFailureBack) {
+    for (int i = 0; i < 5; ++i) {
+        fail("ann", "192.0.2.1");
+    }
+    now += std::chrono::seconds(119);
+    EXPECT_EQ(admit("ann", "192.0.2.1"), 0); // long since the last one, but it counts: 4 + 1
+    EXPECT_EQ(admit("ann", "192.0.2.1"), 1000);
+    now += std::chrono::hours(1);
+    for (int i = 0; i < 3; ++i) {
+        EXPECT_EQ(admit("ann", "192.0.2.1"), 0);
+    }
+}
+
+TEST_F(Throttle, ASuccessClearsTheAccountButNotTheAddress) {
+    for (int i = 0; i < 5; ++i) {
+        fail("ann", "192.0.2.1");
+    }
+    admit("ann", "192.0.2.9");
+    throttle.succeeded("ann", "192.0.2.9");
+    EXPECT_EQ(admit("ann", "192.0.2.9"), 0);
+    // One's own account does not buy more guesses at others.
+    fail("mallory", "192.0.2.1");
+    throttle.succeeded("mallory", "192.0.2.1");
+    EXPECT_EQ(admit("bob", "192.0.2.1"), 1000);
+}
+
+TEST_F(Throttle, AForgivenLoginIsNotCountedAndClearsNothing) {
+    for (int i = 0; i < 4; ++i) {
+        fail("ann", "192.0.2.1");
+    }
+    for (int i = 0; i < 5; ++i) {
+        EXPECT_EQ(fail("ann", "192.0.2.1"), 500);
+        throttle.forgive("ann", "192.0.2.1");
+    }
+}
+
+TEST_F(Throttle, AnIpv6ClientIsItsNetwork) {
+    for (int i = 0; i < 5; ++i) {
+        fail("user" + std::to_string(i), "2001:db8:0:7::" + std::to_string(i));
+    }
+    EXPECT_EQ(admit("other", "2001:db8:0:7:ffff::1"), 1000);
+    EXPECT_EQ(admit("another", "2001:db8:0:8::1"), 0);
+}
+
+TEST_F(Throttle, AFloodOfNamesDoesNotMakeItForgetTheAccountThatIsGuessed) {
+    for (int i = 0; i < 6; ++i) {
+        fail("ann", "192.0.2.1");
+        fail("zoe", "192.0.2.2");
+    }
+    for (int i = 0; i < 6000; ++i) {
+        admit("name" + std::to_string(i),
+              "10.0." + std::to_string(i / 250) + "." + std::to_string(i % 250));
+    }
+    EXPECT_GE(admit("ann", "203.0.113.1"), 1000);
+    EXPECT_GE(admit("zoe", "203.0.113.2"), 1000);
+}
+
+TEST(ThrottleThreads, CountEveryFailure) {
+    LoginThrottle throttle;
+    std::vector<std::thread> threads;
+    threads.reserve(4);
+    for (int i = 0; i < 4; ++i) {
+        threads.emplace_back([&] { throttle.admit("ann", "192.0.2.1"); });
+    }
+    for (std::thread &thread : threads) {
+        thread.join();
+    }
+    const auto wait = throttle.admit("ann", "192.0.2.1");
+    ASSERT_TRUE(wait);
+    EXPECT_GT(*wait, milliseconds(250)); // the fourth waits for 250 ms, the fifth behind it
+}
+
+} // namespace

@@ -1,0 +1,137 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "service/connections.h"
+
+#include <gtest/gtest.h>
+#include <poll.h>
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include <chrono>
+#include <ostream>
+#include <string>
+#include <thread>
+
+namespace {
+
+using OvraService::ConnectionLimits;
+using OvraService::Connections;
+using Phase = Connections::Phase;
+using namespace std::chrono_literals;
+
+/// One end of a pair of sockets stands for a client's connection.
+class Client {
+public:
+    Client(Connections &table, const std::string &name)
+        : table_(table) {
+        if (socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, ends_) == 0) {
+            connection_ = table.open(ends_[0], name);
+        }
+    }
+    Client(const Client &) = delete;
+    ~Client() {
+        table_.close(connection_);
+        close(ends_[0]);
+        close(ends_[1]);
+    }
+
+    void enter(Phase phase) { table_.enter(connection_, phase); }
+    void beginRequest() { table_.beginRequest(connection_); }
+    /// Whether the connection was shut down, or is within the time.
+    bool isShut(std::chrono::milliseconds wait = 0ms) const {
+        pollfd end{ends_[1], POLLIN, 0};
+        return poll(&end, 1, static_cast<int>(wait.count())) == 1;
+    }
+
+private:
+    Connections &table_;
+    int ends_[2] = {-1, -1};
+    Connections::Connection *connection_ = nullptr;
+};
+
+TEST(Connections, makesRoomByEndingTheOneThatWaitedLongestForItsClient) {
+    Connections table({.total = 3});
+    Client working(table, "a");
+    working.enter(Phase::kWorking);
+    Client slow(table, "b");
+    std::this_thread::sleep_for(2ms);
+    Client idle(table, "c");
+    idle.enter(Phase::kIdle);
+
+    EXPECT_TRUE(table.admit("d"));
+    EXPECT_TRUE(slow.isShut());
+    EXPECT_FALSE(idle.isShut());
+    EXPECT_FALSE(working.isShut());
+}
+
+TEST(Connections, keepsOneClientFromTakingTheRoomOfOthers) {
+    Connections table({.total = 10, .perClient = 2});
+    Client other(table, "b");
+    std::this_thread::sleep_for(2ms);
+    Client first(table, "a");
+    std::this_thread::sleep_for(2ms);
+    Client second(table, "a");
+    EXPECT_TRUE(table.admit("a"));
+    EXPECT_TRUE(first.isShut());
+    EXPECT_FALSE(second.isShut());
+    EXPECT_FALSE(other.isShut());
+}
+
+TEST(Connections, refusesWhenEveryConnectionIsBeingServed) {
+    Connections table({.total = 2});
+    Client working(table, "a");
+    working.enter(Phase::kWorking);
+    Client replying(table, "a");
+    replying.enter(Phase::kReplying);
+    EXPECT_FALSE(table.admit("b"));
+    EXPECT_FALSE(working.isShut());
+    EXPECT_FALSE(replying.isShut());
+}
+
+TEST(Connections, countsOneThatIsClosedNoMore) {
+    Connections table({.total = 1});
+    { const Client gone(table, "a"); }
+    const Client present(table, "a");
+    EXPECT_FALSE(present.isShut());
+}
+
+struct PhaseScene {
+    const char *name;
+    Phase phase;
+    bool ends;
+
+    friend std::ostream &operator<<(std::ostream &out, const PhaseScene &scene) {
+        return out << scene.name;
+    }
+};
+
+class ConnectionPhase : public testing::TestWithParam<PhaseScene> {};
+
+TEST_P(ConnectionPhase, endsWhenItsTimeIsOver) {
+    ConnectionLimits limits;
+    limits.arriving = limits.idle = limits.replying = 100ms;
+    Connections table(limits);
+    Client client(table, "a");
+    client.enter(GetParam().phase);
+    EXPECT_EQ(client.isShut(1000ms), GetParam().ends);
+}
+
+INSTANTIATE_TEST_SUITE_P(, ConnectionPhase,
+                         testing::Values(PhaseScene{"arriving", Phase::kArriving, true},
+                                         PhaseScene{"idle", Phase::kIdle, true},
+                                         PhaseScene{"replying", Phase::kReplying, true},
+                                         PhaseScene{"working", Phase::kWorking, false}),
+                         [](const auto &scene) { return std::string(scene.param.name); });
+
+TEST(Connections, doNotGiveANewConnectionMoreTimeBecauseItsHeaderCame) {
+    ConnectionLimits limits;
+    limits.arriving = 600ms;
+    Connections table(limits);
+    Client client(table, "a");
+    const auto begun = std::chrono::steady_clock::now();
+    std::this_thread::sleep_for(400ms);
+    client.beginRequest();
+    EXPECT_TRUE(client.isShut(2000ms));
+    EXPECT_LT(std::chrono::steady_clock::now() - begun, 950ms);
+}
+
+} // namespace

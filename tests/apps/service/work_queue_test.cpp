@@ -1,0 +1,100 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "service/work_queue.h"
+
+#include <gtest/gtest.h>
+
+#include <atomic>
+#include <future>
+#include <memory>
+#include <stdexcept>
+
+namespace {
+
+using OvraService::WorkQueue;
+using namespace std::chrono_literals;
+
+/// Holds a thread of a queue until it is told to let go.
+class Plug {
+public:
+    WorkQueue::Job job() {
+        return [this] {
+            inside.set_value();
+            release.get_future().wait();
+        };
+    }
+    void waitUntilInside() { inside.get_future().wait(); }
+    void letGo() { release.set_value(); }
+
+private:
+    std::promise<void> inside;
+    std::promise<void> release;
+};
+
+TEST(WorkQueue, refusesWhatDoesNotFitInItsQueue) {
+    WorkQueue queue(1, 2);
+    Plug plug;
+    ASSERT_TRUE(queue.submit(plug.job()));
+    plug.waitUntilInside();
+    std::atomic<int> ran = 0;
+    EXPECT_TRUE(queue.submit([&ran] { ++ran; }));
+    EXPECT_TRUE(queue.submit([&ran] { ++ran; }));
+    EXPECT_FALSE(queue.submit([&ran] { ++ran; }));
+    plug.letGo();
+    std::promise<void> last;
+    while (!queue.submit([&last] { last.set_value(); })) {
+    }
+    last.get_future().wait();
+    EXPECT_EQ(ran, 2);
+}
+
+TEST(WorkQueue, letsADelayedJobHoldNoThread) {
+    WorkQueue queue(1, 10);
+    std::promise<std::chrono::steady_clock::time_point> late;
+    std::promise<std::chrono::steady_clock::time_point> atOnce;
+    const auto begun = std::chrono::steady_clock::now();
+    queue.submit([&late] { late.set_value(std::chrono::steady_clock::now()); }, 300ms);
+    queue.submit([&atOnce] { atOnce.set_value(std::chrono::steady_clock::now()); });
+    EXPECT_LT(atOnce.get_future().get() - begun, 250ms);
+    EXPECT_GE(late.get_future().get() - begun, 300ms);
+}
+
+TEST(WorkQueue, runsJobsThatAreDueTogetherSideBySide) {
+    WorkQueue queue(2, 10);
+    std::promise<void> begun[2];
+    std::promise<bool> met[2];
+    for (const int self : {0, 1}) {
+        queue.submit(
+            [&, self] {
+                begun[self].set_value();
+                met[self].set_value(begun[1 - self].get_future().wait_for(5s) ==
+                                    std::future_status::ready);
+            },
+            100ms);
+    }
+    EXPECT_TRUE(met[0].get_future().get());
+    EXPECT_TRUE(met[1].get_future().get());
+}
+
+TEST(WorkQueue, goesOnAfterAJobThatThrows) {
+    WorkQueue queue(1, 10);
+    std::promise<void> next;
+    queue.submit([] { throw std::runtime_error("broken"); });
+    queue.submit([&next] { next.set_value(); });
+    EXPECT_EQ(next.get_future().wait_for(5s), std::future_status::ready);
+}
+
+TEST(WorkQueue, dropsWaitingJobsWhenItStopsAndTellsOfTheOneThatGoesOn) {
+    WorkQueue queue(1, 10);
+    Plug plug;
+    queue.submit(plug.job());
+    plug.waitUntilInside();
+    const auto held = std::make_shared<int>(0);
+    queue.submit([held] { FAIL() << "a dropped job ran"; });
+    EXPECT_FALSE(queue.stop(std::chrono::steady_clock::now() + 50ms));
+    EXPECT_EQ(held.use_count(), 1);
+    EXPECT_FALSE(queue.submit([] {}));
+    plug.letGo();
+    EXPECT_TRUE(queue.stop(std::chrono::steady_clock::now() + 5s));
+}
+
+} // namespace

@@ -1,0 +1,108 @@
+// SPDX-License-Identifier: Apache-2.0
+#include <ovrabase/file.h>
+
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <filesystem>
+#include <fstream>
+#include <thread>
+#include <vector>
+
+using namespace OvraBase;
+
+namespace {
+
+class Files : public testing::Test {
+protected:
+    Files() { std::filesystem::create_directories(folder); }
+    ~Files() override { std::filesystem::remove_all(folder); }
+
+    std::string path(const std::string &name) const { return folder + "/" + name; }
+    static void put(const std::string &path, const std::string &content, mode_t mode = 0600) {
+        std::ofstream(path) << content;
+        chmod(path.c_str(), mode);
+    }
+    static mode_t modeOf(const std::string &path) {
+        struct stat status {};
+        return stat(path.c_str(), &status) == 0 ? status.st_mode & 07777U : 0;
+    }
+
+    const std::string folder = "/tmp/file_test";
+};
+
+} // namespace
+
+TEST_F(Files, AreReadWholeOrNotAtAll) {
+    put(path("text"), std::string(20'000, 'x'));
+    EXPECT_EQ(readFile(path("text")).value(), std::string(20'000, 'x'));
+    put(path("large"), std::string(kMaxTextFile + 1, 'x'));
+    EXPECT_EQ(readFile(path("large")).error().number, EFBIG);
+    EXPECT_EQ(readFile(path("missing")).error().number, ENOENT);
+    EXPECT_EQ(readFile(folder).error().number, EINVAL);
+    ASSERT_EQ(mkfifo(path("pipe").c_str(), 0600), 0);
+    EXPECT_EQ(readFile(path("pipe")).error().number, EINVAL) << "must not wait for a writer";
+}
+
+TEST_F(Files, ThatArePrivateAreReadByTheirOwnerOnlyAndThroughNoLink) {
+    put(path("key"), "secret");
+    EXPECT_EQ(readPrivateFile(path("key"), Links::kRefuse).value().get(), "secret");
+    ASSERT_EQ(symlink(path("key").c_str(), path("link").c_str()), 0);
+    EXPECT_EQ(readPrivateFile(path("link"), Links::kRefuse).error().number, ELOOP);
+    EXPECT_EQ(readPrivateFile(path("link"), Links::kFollow).value().get(), "secret");
+    chmod(path("key").c_str(), 0640);
+    EXPECT_EQ(readPrivateFile(path("key"), Links::kRefuse).error().number, EPERM);
+    put(path("empty"), "");
+    EXPECT_TRUE(readPrivateFile(path("empty"), Links::kRefuse).value().empty());
+}
+
+TEST_F(Files, ThatExistAreNeverReplacedByCreation) {
+    umask(0);
+    EXPECT_TRUE(createFile(path("new"), "first", 0640).value());
+    EXPECT_FALSE(createFile(path("new"), "second", 0600).value());
+    EXPECT_EQ(readFile(path("new")).value(), "first");
+    EXPECT_EQ(modeOf(path("new")), 0640U);
+    EXPECT_EQ(createFile(path("missing/new"), "", 0600).error().number, ENOENT);
+    const auto entries = std::filesystem::directory_iterator(folder);
+    EXPECT_EQ(std::distance(begin(entries), end(entries)), 1) << "something was left behind";
+}
+
+TEST_F(Files, AreCreatedByOneOfManyThatTryAtOnce) {
+    std::atomic<int> made = 0;
+    std::vector<std::thread> threads;
+    for (int i = 0; i < 8; ++i) {
+        threads.emplace_back([&] { made += createFile(path("new"), "x", 0600).value() ? 1 : 0; });
+    }
+    for (std::thread &thread : threads) {
+        thread.join();
+    }
+    EXPECT_EQ(made, 1);
+}
+
+TEST_F(Files, KeepTheirModeWhenTheyAreReplaced) {
+    put(path("settings"), "old", 0640);
+    ASSERT_EQ(symlink(path("settings").c_str(), path("link").c_str()), 0);
+    ASSERT_TRUE(FileUpdate::begin(path("link")).value().commit("new", 0600));
+    EXPECT_EQ(readFile(path("settings")).value(), "new");
+    EXPECT_EQ(modeOf(path("settings")), 0640U);
+    EXPECT_TRUE(std::filesystem::is_symlink(path("link")));
+    ASSERT_TRUE(FileUpdate::begin(path("fresh")).value().commit("x", 0600));
+    EXPECT_EQ(modeOf(path("fresh")), 0600U);
+}
+
+TEST_F(Files, AreNotReplacedWhereTheyAreNoFiles) {
+    std::filesystem::create_directory(path("folder"));
+    const auto refused = FileUpdate::begin(path("folder")).value().commit("x", 0600);
+    ASSERT_FALSE(refused);
+    EXPECT_EQ(refused.error().number, EINVAL);
+    EXPECT_FALSE(std::filesystem::exists(path("folder.new")));
+}
+
+TEST(Folder, IsWhatStandsBeforeTheLastName) {
+    EXPECT_EQ(folderOf("/a/b"), "/a");
+    EXPECT_EQ(folderOf("/a//b"), "/a");
+    EXPECT_EQ(folderOf("/a"), "/");
+    EXPECT_EQ(folderOf("a"), ".");
+}

@@ -1,0 +1,87 @@
+// SPDX-License-Identifier: Apache-2.0
+#include <ovrabase/lock.h>
+
+#include <fcntl.h>
+#include <gtest/gtest.h>
+#include <sys/file.h>
+#include <sys/wait.h>
+
+#include <cerrno>
+
+using namespace OvraBase;
+using namespace std::chrono_literals;
+
+namespace {
+
+constexpr char kPath[] = "/tmp/lock_test.lock";
+
+UniqueFd openLock() {
+    return UniqueFd(open(kPath, O_RDWR | O_CREAT | O_CLOEXEC, 0600));
+}
+
+/// A child that holds whatever this process has open, until it is gone.
+class ForkedChild {
+public:
+    ForkedChild()
+        : pid_(fork()) {
+        if (pid_ == 0) {
+            pause();
+            _exit(0);
+        }
+    }
+    ForkedChild(const ForkedChild &) = delete;
+    ForkedChild &operator=(const ForkedChild &) = delete;
+    ~ForkedChild() {
+        kill(pid_, SIGKILL);
+        waitpid(pid_, nullptr, 0);
+    }
+
+private:
+    pid_t pid_;
+};
+
+} // namespace
+
+TEST(Lock, ExcludesAnotherOpenFileUntilItGoes) {
+    auto held = LockedFd::lock(openLock(), LOCK_EX, 0ms);
+    ASSERT_TRUE(held);
+    const auto begun = std::chrono::steady_clock::now();
+    const auto refused = LockedFd::lock(openLock(), LOCK_EX, 100ms);
+    ASSERT_FALSE(refused);
+    EXPECT_EQ(refused.error().number, ETIMEDOUT);
+    EXPECT_GE(std::chrono::steady_clock::now() - begun, 100ms);
+    held->reset();
+    EXPECT_TRUE(LockedFd::lock(openLock(), LOCK_EX, 0ms));
+}
+
+TEST(Lock, IsNotLeftWithAChildThatWasForkedMeanwhile) {
+    auto held = LockedFd::lock(openLock(), LOCK_EX, 0ms);
+    const UniqueFd byte = openLock();
+    ASSERT_TRUE(held);
+    ASSERT_TRUE(lockByte(byte.get(), 7, 0ms));
+    const ForkedChild child;
+    held->reset();
+    unlockByte(byte.get(), 7);
+    EXPECT_TRUE(LockedFd::lock(openLock(), LOCK_EX, 0ms));
+    EXPECT_TRUE(lockByte(openLock().get(), 7, 0ms));
+}
+
+TEST(Lock, OfOneByteLeavesTheOthersFree) {
+    const UniqueFd one = openLock();
+    const UniqueFd other = openLock();
+    ASSERT_TRUE(lockByte(one.get(), 7, 0ms));
+    EXPECT_TRUE(lockByte(other.get(), 8, 0ms));
+    const auto refused = lockByte(other.get(), 7, 0ms);
+    ASSERT_FALSE(refused);
+    EXPECT_EQ(refused.error().number, ETIMEDOUT);
+}
+
+TEST(Lock, SaysAtOnceWhyItCannotBeHad) {
+    const auto begun = std::chrono::steady_clock::now();
+    const auto closed = lockFile(-1, LOCK_EX, 10s);
+    ASSERT_FALSE(closed);
+    EXPECT_EQ(closed.error().number, EBADF);
+    const UniqueFd readOnly(open("/dev/null", O_RDONLY | O_CLOEXEC));
+    EXPECT_FALSE(lockByte(readOnly.get(), 0, 10s));
+    EXPECT_LT(std::chrono::steady_clock::now() - begun, 5s);
+}

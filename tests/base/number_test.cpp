@@ -1,0 +1,61 @@
+// SPDX-License-Identifier: Apache-2.0
+#include <ovrabase/number.h>
+#include <ovrabase/secret.h>
+
+#include <gtest/gtest.h>
+
+#include <cstdint>
+#include <string>
+
+using namespace OvraBase;
+
+TEST(Number, IsTheWholeTextOrNothing) {
+    EXPECT_EQ(parseNumber<int>("42"), 42);
+    EXPECT_EQ(parseNumber<int>("-42"), -42);
+    EXPECT_EQ(parseNumber<std::uint64_t>("18446744073709551615"), UINT64_MAX);
+    for (const char *text : {"", "x", "42x", " 42", "42 ", "+42", "0x10", "4.2", "99999999999"}) {
+        EXPECT_FALSE(parseNumber<int>(text)) << text;
+    }
+    EXPECT_FALSE(parseNumber<unsigned int>("-1"));
+}
+
+TEST(Number, APortCanBeConnectedTo) {
+    EXPECT_EQ(parsePort("1"), 1);
+    EXPECT_EQ(parsePort("65535"), 65535);
+    for (const char *text : {"0", "65536", "-1", "5443x", ""}) {
+        EXPECT_FALSE(parsePort(text)) << text;
+    }
+}
+
+TEST(Secret, LeavesNothingWhereItLay) {
+    Secret secret("correct horse");
+    const char *const where = secret.get().data();
+    secret.removeLast();
+    EXPECT_EQ(secret.get(), "correct hors");
+    secret = Secret("another one");
+    EXPECT_EQ(secret.get(), "another one");
+    std::string text = "taken over";
+    const Secret taken = Secret::take(text);
+    EXPECT_EQ(taken.get(), "taken over");
+    EXPECT_EQ(text, "");
+    EXPECT_NE(where, nullptr);
+}
+
+TEST(Secret, NeverMovesWhileItIsTypedIn) {
+    Secret secret;
+    const char *const where = secret.get().data();
+    for (std::size_t i = 0; i < Secret::kMaxSize; ++i) {
+        ASSERT_TRUE(secret.append('x'));
+    }
+    EXPECT_FALSE(secret.append('x'));
+    EXPECT_EQ(secret.get().data(), where);
+    EXPECT_EQ(secret.get().size(), Secret::kMaxSize);
+}
+
+TEST(Secret, IsWipedAtTheEndOfTheScope) {
+    std::string text = "a password that is longer than a short string";
+    const std::size_t size = text.size();
+    { const WipeAtEnd wiped(text); }
+    EXPECT_TRUE(text.empty());
+    EXPECT_EQ(std::string(text.data(), size), std::string(size, '\0'));
+}

@@ -1,0 +1,120 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "platform/own_files.h"
+#include "support/test_certificate.h"
+#include "trust/certificate_verifier.h"
+
+#include <ovrabase/encoding.h>
+
+#include <gtest/gtest.h>
+#include <openssl/ssl.h>
+
+#include <memory>
+
+namespace {
+
+using namespace OvraPlatform;
+using Verdict = CertificateVerifier::Verdict;
+
+struct Free {
+    void operator()(SSL_CTX *context) const { SSL_CTX_free(context); }
+    void operator()(SSL *ssl) const { SSL_free(ssl); }
+};
+
+/// Shakes hands with a server of that certificate, in memory. \param system  what the client's
+/// store of certificates holds
+bool shakeHands(CertificateVerifier &judge, const OvraTest::TestCertificate &server,
+                const OvraTest::TestCertificate *system) {
+    const std::unique_ptr<SSL_CTX, Free> serverContext(SSL_CTX_new(TLS_server_method()));
+    const std::unique_ptr<SSL_CTX, Free> clientContext(SSL_CTX_new(TLS_client_method()));
+    SSL_CTX_use_certificate(serverContext.get(), server.certificate());
+    SSL_CTX_use_PrivateKey(serverContext.get(), server.key());
+    if (system != nullptr) {
+        X509_STORE_add_cert(SSL_CTX_get_cert_store(clientContext.get()), system->certificate());
+    }
+    judge.install(clientContext.get());
+    const std::unique_ptr<SSL, Free> serverEnd(SSL_new(serverContext.get()));
+    const std::unique_ptr<SSL, Free> clientEnd(SSL_new(clientContext.get()));
+    BIO *one = nullptr;
+    BIO *two = nullptr;
+    BIO_new_bio_pair(&one, 0, &two, 0);
+    SSL_set_bio(serverEnd.get(), one, one);
+    SSL_set_bio(clientEnd.get(), two, two);
+    SSL_set_accept_state(serverEnd.get());
+    SSL_set_connect_state(clientEnd.get());
+    for (int i = 0; i < 10; ++i) {
+        const int client = SSL_do_handshake(clientEnd.get());
+        if (client == 1) {
+            return true;
+        }
+        if (SSL_get_error(clientEnd.get(), client) == SSL_ERROR_SSL) {
+            return false;
+        }
+        SSL_do_handshake(serverEnd.get());
+    }
+    return false;
+}
+
+class JudgeScene : public OvraTest::OwnFiles {
+protected:
+    void SetUp() override {
+        ASSERT_NO_FATAL_FAILURE(OwnFiles::SetUp());
+        std::filesystem::remove_all(kStateDir);
+    }
+    static Endpoint endpoint(const std::string &host) {
+        return Endpoint::make("https", host, 5001).value();
+    }
+
+    OvraTest::TestCertificate server_{"DNS:nas.example,IP:192.0.2.7"};
+};
+
+TEST_F(JudgeScene, acceptsWhatTheSystemAcceptsForThatNameOrAddress) {
+    for (const auto &[host, verdict] : {std::pair{"nas.example", Verdict::kSystem},
+                                        {"192.0.2.7", Verdict::kSystem},
+                                        {"other.example", Verdict::kNew},
+                                        {"192.0.2.8", Verdict::kNew}}) {
+        CertificateVerifier judge(endpoint(host), false);
+        EXPECT_TRUE(shakeHands(judge, server_, &server_)) << host;
+        EXPECT_EQ(judge.verdict(), verdict) << host;
+    }
+}
+
+TEST_F(JudgeScene, acceptsWhatTheSystemAcceptsAlsoWhenAnotherKeyWasPinned) {
+    const OvraTest::TestCertificate old;
+    TrustStore().pin("https://nas.example:5001", fingerprintOf(old.certificate()));
+    CertificateVerifier judge(endpoint("nas.example"), false);
+    EXPECT_TRUE(shakeHands(judge, server_, &server_));
+    EXPECT_EQ(judge.verdict(), Verdict::kSystem);
+}
+
+TEST_F(JudgeScene, pinsAKeyItMeetsFirstOnlyWhenItIsTold) {
+    CertificateVerifier first(endpoint("nas.example"), false);
+    ASSERT_TRUE(shakeHands(first, server_, nullptr));
+    EXPECT_EQ(first.verdict(), Verdict::kNew);
+    EXPECT_TRUE(TrustStore().list()->empty());
+    EXPECT_TRUE(first.pinNewKey());
+
+    CertificateVerifier second(endpoint("nas.example"), false);
+    EXPECT_TRUE(shakeHands(second, server_, nullptr));
+    EXPECT_EQ(second.verdict(), Verdict::kPinned);
+}
+
+TEST_F(JudgeScene, endsTheHandshakeWithAnotherKey) {
+    const OvraTest::TestCertificate other;
+    TrustStore().pin("https://nas.example:5001", fingerprintOf(other.certificate()));
+    CertificateVerifier judge(endpoint("nas.example"), false);
+    EXPECT_FALSE(shakeHands(judge, server_, nullptr));
+    EXPECT_EQ(judge.verdict(), Verdict::kChanged);
+
+    CertificateVerifier observer(endpoint("nas.example"), true);
+    EXPECT_TRUE(shakeHands(observer, server_, nullptr));
+    EXPECT_EQ(observer.verdict(), Verdict::kChanged);
+}
+
+TEST_F(JudgeScene, endsTheHandshakeWhenThePinnedKeysCannotBeRead) {
+    std::filesystem::create_directories(kKnownEndpointsFile);
+    CertificateVerifier judge(endpoint("nas.example"), false);
+    EXPECT_FALSE(shakeHands(judge, server_, nullptr));
+    EXPECT_EQ(judge.verdict(), Verdict::kUnavailable);
+}
+
+} // namespace

@@ -1,0 +1,181 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "host/key_value_file.h"
+#include "platform/own_files.h"
+
+#include <ovrabase/file.h>
+#include <ovracore/ovracore.h>
+
+#include <array>
+#include <chrono>
+#include <memory>
+#include <optional>
+#include <thread>
+
+using OvraPlatform::findKeyValue;
+using OvraTest::modeOf;
+using OvraTest::OtherProcess;
+using OvraTest::readFile;
+using OvraTest::writeFile;
+
+namespace {
+
+constexpr char kFormat[] = "%s=\"%s\"\n";
+
+struct KeyValueFile : OvraTest::OwnFiles {
+    std::string file() const { return path("settings.conf"); }
+    int set(const char *key, const char *value) const {
+        return OLIBCFileSetKeyValue(file().c_str(), key, value, kFormat);
+    }
+    std::string get(const char *key) const {
+        std::array<char, 4096> buffer{};
+        const int length = OLIBCFileGetKeyValue(file().c_str(), key, buffer.data(),
+                                                static_cast<int>(buffer.size()), 0);
+        return length < 0 ? "(none)" : std::string(buffer.data(), static_cast<std::size_t>(length));
+    }
+};
+
+TEST(KeyValueText, ReadsTheUsualWaysToWriteALine) {
+    struct Row {
+        const char *text;
+        std::optional<std::string> value;
+    };
+    const Row rows[] = {
+        {"key=\"a value\"\n", "a value"},
+        {"key=value", "value"},
+        {"  key = value \t\r\n", "value"},
+        {"key=\"# = inside\" # comment\n", "# = inside"},
+        {"key=value # comment\n", "value"},
+        {"key=va#lue\n", "va#lue"},
+        {"key=#value\n", "#value"},
+        {"key=\n", ""},
+        {"key=\"\"\n", ""},
+        {"key=\"first\"\nkey=\"last\"\n", "last"},
+        {"key=\"good\"\nkey=\"cut off\n", "good"},
+        {"key=\"a\"b\"\n", std::nullopt},
+        {"#key=\"value\"\n", std::nullopt},
+        {"key\n=value\nkeys=value\nKEY=value\n", std::nullopt},
+        {"", std::nullopt},
+    };
+    for (const Row &row : rows) {
+        EXPECT_EQ(findKeyValue(row.text, "key"), row.value) << row.text;
+    }
+}
+
+TEST_F(KeyValueFile, ChangesOneLineAndKeepsTheOthersByteForByte) {
+    const std::string before = "# made by hand\r\n\tother = 1\n\x01\xFFgarbage\n";
+    const std::string after = "\n\n  last=\"no newline\"";
+    writeFile(file(), before + " node_id = old # note\r\n" + after);
+    ASSERT_GE(set("node_id", "new"), 0);
+    EXPECT_EQ(readFile(file()), before + "node_id=\"new\"\n" + after);
+    ASSERT_GE(set("added", "x"), 0);
+    EXPECT_EQ(readFile(file()), before + "node_id=\"new\"\n" + after + "\nadded=\"x\"\n");
+}
+
+TEST_F(KeyValueFile, ANewFileIsReadableForAllAndAnOldOneKeepsItsMode) {
+    umask(077);
+    ASSERT_GE(set("node_id", "value"), 0);
+    EXPECT_EQ(readFile(file()), "node_id=\"value\"\n");
+    EXPECT_EQ(modeOf(file()), 0644U);
+    chmod(file().c_str(), 0640);
+    ASSERT_GE(set("node_id", "other"), 0);
+    EXPECT_EQ(modeOf(file()), 0640U);
+}
+
+TEST_F(KeyValueFile, WhatWouldNotReadBackIsRefusedAndNothingChanges) {
+    struct Row {
+        const char *key;
+        const char *value;
+        const char *format;
+    };
+    const Row rows[] = {
+        {"k", "a\"b", kFormat},  {"k", "a\nevil=\"1\"", kFormat},
+        {"k=x", "v", kFormat},   {"", "v", kFormat},
+        {"#k", "v", kFormat},    {"k", "v", "%s=\"%s\""},
+        {"k", "v", "%s=%d\n"},   {"k", "v", "%s=\n"},
+        {"k", "v", "%s=%s%s\n"}, {"k", " v ", "%s=%s\n"},
+        {"k", "v", "x%s=%s\n"},  {"k", "v", "%s=%s\n%%\n"},
+        {"k", nullptr, kFormat},
+    };
+    writeFile(file(), "k=\"old\"\n");
+    for (const Row &row : rows) {
+        EXPECT_LT(OLIBCFileSetKeyValue(file().c_str(), row.key, row.value, row.format), 0)
+            << row.key << " " << row.format;
+    }
+    EXPECT_EQ(readFile(file()), "k=\"old\"\n");
+}
+
+TEST_F(KeyValueFile, AValueThatDoesNotFitTheBufferIsAFailureNotACutValue) {
+    writeFile(file(), "key=\"12345\"\n");
+    std::array<char, 6> buffer{};
+    EXPECT_EQ(OLIBCFileGetKeyValue(file().c_str(), "key", buffer.data(), 6, 0), 5);
+    EXPECT_STREQ(buffer.data(), "12345");
+    EXPECT_EQ(OLIBCFileGetKeyValue(file().c_str(), "key", buffer.data(), 5, 0), -1);
+    EXPECT_STREQ(buffer.data(), "");
+    EXPECT_EQ(OLIBCFileGetKeyValue(path("absent").c_str(), "key", buffer.data(), 6, 0), -1);
+    EXPECT_EQ(OLIBCFileExist(path("absent").c_str()), 0);
+    EXPECT_NE(OLIBCFileExist(file().c_str()), 0);
+}
+
+TEST_F(KeyValueFile, WhatIsNoTextFileOfSettingsIsRefusedInBoundedTime) {
+    ASSERT_EQ(mkfifo(file().c_str(), 0600), 0);
+    EXPECT_EQ(get("key"), "(none)");
+    EXPECT_LT(set("key", "value"), 0);
+    std::filesystem::remove(file());
+    writeFile(file(), std::string(3 << 20, 'x'));
+    EXPECT_EQ(get("key"), "(none)");
+    EXPECT_LT(set("key", "value"), 0);
+    EXPECT_EQ(std::filesystem::file_size(file()), 3U << 20U);
+}
+
+TEST_F(KeyValueFile, ALinkStaysALink) {
+    writeFile(path("real/target.conf"), "key=\"old\"\n");
+    std::filesystem::create_symlink("real/target.conf", file());
+    ASSERT_GE(set("key", "new"), 0);
+    EXPECT_TRUE(std::filesystem::is_symlink(file()));
+    EXPECT_EQ(readFile(path("real/target.conf")), "key=\"new\"\n");
+}
+
+TEST_F(KeyValueFile, AChangeWaitsForTheOneUnderWaySoThatNeitherIsLost) {
+    ASSERT_GE(set("mine", "old"), 0);
+    std::optional<OvraBase::FileUpdate> underWay = OvraBase::FileUpdate::begin(file()).value();
+    OtherProcess other([&] { return set("other", "new") < 0 ? 1 : 0; });
+    std::this_thread::sleep_for(std::chrono::milliseconds(50));
+    ASSERT_TRUE(underWay->commit("mine=\"new\"\n", 0644));
+    underWay.reset();
+    EXPECT_EQ(other.wait(), 0);
+    EXPECT_EQ(readFile(file()), "mine=\"new\"\nother=\"new\"\n");
+}
+
+TEST_F(KeyValueFile, AWriterKilledAtAnyMomentLeavesAWholeFileThatCanBeChangedAgain) {
+    const std::string big(2000, 'x');
+    ASSERT_GE(set("key", ("0" + big).c_str()), 0);
+    for (int round = 0; round < 15; ++round) {
+        OtherProcess writer([&] {
+            for (int i = 0;; ++i) {
+                set("key", (std::to_string(i) + big).c_str());
+            }
+            return 0;
+        });
+        std::this_thread::sleep_for(std::chrono::microseconds(1000 + 997 * round));
+        writer.end(SIGKILL);
+        const std::string value = get("key");
+        ASSERT_GT(value.size(), big.size());
+        EXPECT_EQ(value.substr(value.size() - big.size()), big);
+    }
+    EXPECT_GE(set("key", "done"), 0);
+    EXPECT_EQ(readFile(file()), "key=\"done\"\n");
+    EXPECT_FALSE(std::filesystem::exists(file() + ".new"));
+}
+
+TEST_F(KeyValueFile, AFullDiskLeavesTheOldFile) {
+    ASSERT_GE(set("key", "old"), 0);
+    OtherProcess writer([&] {
+        OvraTest::limitFileSize(64);
+        return set("key", std::string(500, 'x').c_str()) < 0 ? 0 : 1;
+    });
+    EXPECT_EQ(writer.wait(), 0);
+    EXPECT_EQ(readFile(file()), "key=\"old\"\n");
+    EXPECT_FALSE(std::filesystem::exists(file() + ".new"));
+}
+
+} // namespace

@@ -1,0 +1,215 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "platform/own_files.h"
+#include "platform/store/raw_sqlite.h"
+
+#include <ovraplatform/account_store.h>
+#include <ovraplatform/totp.h>
+
+#include <sodium.h>
+
+#include <array>
+#include <chrono>
+#include <string>
+#include <vector>
+
+using OvraPlatform::Account;
+using OvraPlatform::AccountStore;
+using OvraPlatform::LoginResult;
+using OvraTest::modeOf;
+using OvraTest::RawSqlite;
+using OvraTest::readFile;
+using OvraTest::writeFile;
+
+namespace OvraPlatform {
+
+void PrintTo(LoginResult result, std::ostream *out) {
+    *out << static_cast<int>(result);
+}
+
+} // namespace OvraPlatform
+
+namespace {
+
+constexpr char kPassword[] = "correct horse";
+constexpr char kSecret[] = "GEZDGNBVGY3TQOJQGEZDGNBVGY3TQOJQ"; // of RFC 6238, appendix B
+constexpr std::time_t kCodeTime = 1111111111;
+constexpr char kCode[] = "050471";        // of kCodeTime
+constexpr char kEarlierCode[] = "081804"; // of the step before
+
+struct Accounts : OvraTest::OwnFiles {
+    std::string file() const { return path("state/accounts.db"); }
+    AccountStore store() {
+        return AccountStore(file(), [this] { return time; });
+    }
+    LoginResult verify(const std::string &name, const std::string &password,
+                       const std::string &code = "") {
+        return store().verify(name, password, code);
+    }
+
+    std::time_t time = kCodeTime;
+};
+
+TEST_F(Accounts, LogInAsTheirStateAllows) {
+    for (const char *name : {"plain", "disabled", "local", "coded", "disabledCoded"}) {
+        ASSERT_TRUE(store().add(name, kPassword, false)) << store().error();
+    }
+    ASSERT_TRUE(store().setDisabled("disabled", true) && store().setRemoteLogin("local", false) &&
+                store().setTotp("coded", kSecret) && store().setTotp("disabledCoded", kSecret) &&
+                store().setDisabled("disabledCoded", true));
+    const struct {
+        const char *name;
+        const char *password;
+        const char *code;
+        int result;
+    } rows[] = {
+        {"plain", kPassword, "", 0},         {"plain", kPassword, "123456", 0}, // not asked for
+        {"plain", "correct horsf", "", 400}, {"plain", "", "", 400},
+        {"Plain", kPassword, "", 400},       {"plain ", kPassword, "", 400},
+        {"nobody", kPassword, "", 400},      {"' OR 1=1 --", kPassword, "", 400},
+        {"disabled", kPassword, "", 401},    {"disabled", "wrong", "", 400},
+        {"local", kPassword, "", 402},       {"local", "wrong", "", 400},
+        {"coded", kPassword, "", 403},       {"coded", kPassword, "000000", 404},
+        {"coded", kPassword, "50471", 404},  {"coded", "wrong", "", 400},
+        {"coded", "wrong", kCode, 400},      {"disabledCoded", kPassword, kCode, 401},
+        {"coded", kPassword, kCode, 0},
+    };
+    for (const auto &row : rows) {
+        EXPECT_EQ(static_cast<int>(verify(row.name, row.password, row.code)), row.result)
+            << row.name << " " << row.password << " " << row.code;
+    }
+    EXPECT_EQ(verify("plain", kPassword + std::string(2000, 'x')), LoginResult::kWrong);
+}
+
+TEST_F(Accounts, AnUnknownNameTakesAsLongAsAWrongPassword) {
+    ASSERT_TRUE(store().add("ann", kPassword, false));
+    verify("warm", "up");
+    const auto shortest = [&](const char *name) {
+        auto best = std::chrono::steady_clock::duration::max();
+        for (int i = 0; i < 3; ++i) {
+            const auto start = std::chrono::steady_clock::now();
+            verify(name, "wrong password");
+            best = std::min(best, std::chrono::steady_clock::now() - start);
+        }
+        return best;
+    };
+    const auto known = shortest("ann");
+    const auto unknown = shortest("nobody");
+    EXPECT_GT(unknown, known / 2);
+    EXPECT_LT(unknown, known * 2);
+}
+
+TEST_F(Accounts, ACodeIsAcceptedOnceAndNoEarlierOneAfterIt) {
+    ASSERT_TRUE(store().add("ann", kPassword, false) && store().setTotp("ann", kSecret));
+    EXPECT_EQ(verify("ann", kPassword, kCode), LoginResult::kOk);
+    EXPECT_EQ(verify("ann", kPassword, kCode), LoginResult::kCodeWrong);
+    EXPECT_EQ(verify("ann", kPassword, kEarlierCode), LoginResult::kCodeWrong);
+    ASSERT_TRUE(store().setPassword("ann", "another horse"));
+    EXPECT_EQ(verify("ann", "another horse", kCode), LoginResult::kCodeWrong);
+    ASSERT_TRUE(store().clearTotp("ann"));
+    EXPECT_EQ(verify("ann", "another horse"), LoginResult::kOk);
+    ASSERT_TRUE(store().setTotp("ann", kSecret));
+    EXPECT_EQ(verify("ann", "another horse", kEarlierCode), LoginResult::kOk);
+}
+
+TEST_F(Accounts, OfTwoLogInsAtOnceWithTheSameCodeOneIsLetIn) {
+    ASSERT_TRUE(store().add("ann", kPassword, false) && store().setTotp("ann", kSecret));
+    // The store asks for the time when it has read the account and is about to check the code.
+    LoginResult meanwhile = LoginResult::kStoreFailed;
+    AccountStore slower(file(), [&] {
+        meanwhile = verify("ann", kPassword, kCode);
+        return time;
+    });
+    EXPECT_EQ(slower.verify("ann", kPassword, kCode), LoginResult::kCodeWrong);
+    EXPECT_EQ(meanwhile, LoginResult::kOk);
+}
+
+TEST_F(Accounts, AreManaged) {
+    ASSERT_TRUE(store().add("bob", kPassword, false) && store().add("ann", kPassword, true));
+    ASSERT_TRUE(store().setTotp("ann", "gezd gnbv gy3t qojq gezd gnbv gy3t qojq"));
+    std::vector<Account> accounts;
+    ASSERT_TRUE(store().list(accounts));
+    ASSERT_EQ(accounts.size(), 2U);
+    EXPECT_EQ(accounts[0].name, "ann");
+    EXPECT_TRUE(accounts[0].administrator && accounts[0].oneTimeCode && accounts[0].remoteLogin);
+    EXPECT_FALSE(accounts[0].disabled || accounts[1].administrator || accounts[1].oneTimeCode);
+    EXPECT_EQ(accounts[0].created, time);
+    ASSERT_TRUE(store().setAdministrator("ann", false) && store().setDisabled("ann", true));
+    EXPECT_TRUE(store().find("ann")->disabled);
+    EXPECT_FALSE(store().find("ann")->administrator);
+    ASSERT_TRUE(store().setPassword("bob", "new password"));
+    EXPECT_EQ(verify("bob", kPassword), LoginResult::kWrong);
+    EXPECT_EQ(verify("bob", "new password"), LoginResult::kOk);
+    ASSERT_TRUE(store().remove("ann"));
+    EXPECT_FALSE(store().exists("ann"));
+    EXPECT_TRUE(store().exists("bob"));
+}
+
+TEST_F(Accounts, WhatCannotBeDoneIsRefusedWithAReason) {
+    AccountStore accounts = store();
+    ASSERT_TRUE(accounts.add("ann", kPassword, false));
+    const auto reason = [&](bool done) { return done ? std::string("done") : accounts.error(); };
+    EXPECT_EQ(reason(accounts.add("ann", "other password", true)),
+              "There is an account [ann] already.");
+    EXPECT_EQ(reason(accounts.setDisabled("bob", true)), "There is no account [bob].");
+    EXPECT_EQ(reason(accounts.setPassword("bob", kPassword)), "There is no account [bob].");
+    EXPECT_EQ(reason(accounts.remove("bob")), "There is no account [bob].");
+    EXPECT_NE(reason(accounts.setPassword("ann", "short")).find("8 to 1024"), std::string::npos);
+    EXPECT_NE(reason(accounts.setTotp("ann", "GEZDGNBV")).find("base32"), std::string::npos);
+    EXPECT_EQ(verify("ann", kPassword), LoginResult::kOk);
+    EXPECT_FALSE(accounts.find("ann")->administrator);
+}
+
+TEST(AccountNames, AreOfASafeSet) {
+    for (const char *name : {"a", "ann.b-c_d@example", "0", "_system"}) {
+        EXPECT_TRUE(AccountStore::isName(name)) << name;
+    }
+    for (const std::string &name :
+         {std::string(), std::string(65, 'a'), std::string("-a"), std::string(".a"),
+          std::string("@a"), std::string("a b"), std::string("a/b"), std::string("a\nb"),
+          std::string("a\0b", 3), std::string("\xC3\xA4"), std::string("a'b")}) {
+        EXPECT_FALSE(AccountStore::isName(name)) << name;
+    }
+    EXPECT_TRUE(AccountStore::isName(std::string(64, 'a')));
+}
+
+TEST_F(Accounts, AHashOfAnotherCostIsRenewedAtTheNextLogIn) {
+    ASSERT_TRUE(store().add("ann", kPassword, false));
+    std::array<char, crypto_pwhash_STRBYTES> cheap{};
+    ASSERT_EQ(crypto_pwhash_str(cheap.data(), kPassword, sizeof kPassword - 1,
+                                crypto_pwhash_OPSLIMIT_MIN, crypto_pwhash_MEMLIMIT_MIN),
+              0);
+    RawSqlite raw(file());
+    ASSERT_TRUE(raw.run(std::string("UPDATE account SET hash = '") + cheap.data() + "'"));
+    EXPECT_EQ(verify("ann", "wrong password"), LoginResult::kWrong);
+    EXPECT_EQ(raw.cell("SELECT hash FROM account"), cheap.data());
+    EXPECT_EQ(verify("ann", kPassword), LoginResult::kOk);
+    EXPECT_EQ(raw.cell("SELECT hash FROM account").substr(0, 26), "$argon2id$v=19$m=65536,t=2");
+    EXPECT_EQ(verify("ann", kPassword), LoginResult::kOk);
+}
+
+TEST_F(Accounts, KeepNoPasswordAndAreForTheirOwnerOnly) {
+    umask(0);
+    ASSERT_TRUE(store().add("ann", kPassword, false));
+    EXPECT_EQ(modeOf(file()), 0600U);
+    EXPECT_EQ(modeOf(path("state")), 0700U);
+    EXPECT_EQ(readFile(file()).find(kPassword), std::string::npos);
+    ASSERT_TRUE(store().setTotp("ann", kSecret) && store().clearTotp("ann"));
+    EXPECT_EQ(readFile(file()).find(kSecret), std::string::npos);
+}
+
+TEST_F(Accounts, ADamagedStoreLetsNobodyIn) {
+    writeFile(file(), std::string(8192, 'x'));
+    chmod(path("state").c_str(), 0700);
+    AccountStore accounts = store();
+    EXPECT_EQ(accounts.verify("ann", kPassword, ""), LoginResult::kStoreFailed);
+    EXPECT_FALSE(accounts.exists("ann"));
+    EXPECT_FALSE(accounts.add("ann", kPassword, true));
+    EXPECT_NE(accounts.error().find("damaged"), std::string::npos);
+    // A session store in its place is refused as well: kinds are told apart.
+    std::filesystem::remove(file());
+    ASSERT_TRUE(RawSqlite(file()).run("CREATE TABLE account (name, hash); PRAGMA user_version = 1; "
+                                      "PRAGMA application_id = 1332106085"));
+    EXPECT_FALSE(store().isOpen());
+}
+
+} // namespace

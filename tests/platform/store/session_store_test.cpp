@@ -1,0 +1,282 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "platform/own_files.h"
+#include "platform/store/raw_sqlite.h"
+
+#include <ovraplatform/session_store.h>
+
+#include <chrono>
+#include <memory>
+#include <optional>
+#include <string>
+#include <thread>
+#include <vector>
+
+using OvraPlatform::SessionRecord;
+using OvraPlatform::SessionRequest;
+using OvraPlatform::SessionStore;
+using OvraTest::modeOf;
+using OvraTest::OtherProcess;
+using OvraTest::RawSqlite;
+using OvraTest::readFile;
+using OvraTest::writeFile;
+
+namespace {
+
+struct Sessions : OvraTest::OwnFiles {
+    std::string file() const { return path("state/sessions.db"); }
+    SessionStore store() {
+        return SessionStore(file(), [this] { return time; });
+    }
+    std::string create(const std::string &user, int timeout, const std::string &app = "") {
+        return store().create({user, app, "", "", "", timeout, true}).value_or("");
+    }
+    std::size_t count() {
+        std::vector<SessionRecord> sessions;
+        return store().list(sessions) ? sessions.size() : 9999;
+    }
+
+    std::time_t time = 1'700'000'000;
+};
+
+TEST_F(Sessions, KeepWhatTheyWereMadeOf) {
+    const SessionRequest request = {
+        "ann", "Tidewater", R"({"node_id":"n1"})", R"({"hide":true})", "::ffff:192.0.2.1",
+        60,    true};
+    const std::optional<std::string> id = store().create(request);
+    ASSERT_TRUE(id);
+    EXPECT_EQ(id->size(), 43U);
+    EXPECT_EQ(
+        id->find_first_not_of("abcdefghijklmnopqrstuvwxyzABCDEFGHIJKLMNOPQRSTUVWXYZ0123456789-_"),
+        std::string::npos);
+    const std::optional<SessionRecord> found = store().find(*id);
+    ASSERT_TRUE(found);
+    EXPECT_EQ(found->id, *id);
+    EXPECT_EQ(found->user + found->app + found->extra + found->ui + found->remote,
+              request.user + request.app + request.extra + request.ui + request.remote);
+    EXPECT_EQ(found->created, time);
+    EXPECT_EQ(found->expires, time + 60);
+    EXPECT_EQ(found->toString().find(*id), std::string::npos);
+    EXPECT_NE(found->toString().find(found->reference()), std::string::npos);
+}
+
+TEST_F(Sessions, AreFoundByTheWholeIdOnly) {
+    const std::string id = create("ann", -1);
+    std::string altered = id;
+    altered[20] = altered[20] == 'A' ? 'B' : 'A';
+    for (const std::string &other : {std::string(), altered, id + "=", id.substr(0, 42), id + id,
+                                     std::string("%"), std::string(43, '\0')}) {
+        EXPECT_FALSE(store().find(other)) << other;
+    }
+    EXPECT_TRUE(store().find(id));
+    EXPECT_NE(id, create("ann", -1));
+}
+
+TEST_F(Sessions, EndAtTheirTimeAndAreThenSwept) {
+    const std::string timed = create("ann", 10);
+    const std::string lasting = create("ann", -1);
+    time += 9;
+    EXPECT_TRUE(store().find(timed));
+    time += 1;
+    EXPECT_FALSE(store().find(timed));
+    EXPECT_EQ(count(), 1U);
+    bool walked = false;
+    store().removeIf([&](const SessionRecord &session) {
+        walked = walked || session.id == timed;
+        return false;
+    });
+    EXPECT_FALSE(walked);
+    EXPECT_EQ(RawSqlite(file()).cell("SELECT count(*) FROM session"), "2");
+    create("bob", 10);
+    EXPECT_EQ(RawSqlite(file()).cell("SELECT count(*) FROM session"), "2");
+    time += 1'000'000'000;
+    EXPECT_TRUE(store().sweep());
+    EXPECT_EQ(RawSqlite(file()).cell("SELECT count(*) FROM session"), "1");
+    EXPECT_TRUE(store().find(lasting));
+}
+
+TEST_F(Sessions, AClockThatWasSetBackEndsTimedSessionsOnly) {
+    const std::string timed = create("ann", 3600);
+    const std::string lasting = create("ann", -1);
+    time -= 60;
+    EXPECT_TRUE(store().find(timed));
+    time -= 1;
+    EXPECT_FALSE(store().find(timed));
+    EXPECT_TRUE(store().find(lasting));
+}
+
+TEST_F(Sessions, ANewOneEndsTheUsersOthersOfItsApplicationUnlessTheyAreToStay) {
+    const std::string first = create("ann", -1, "web");
+    const std::string second = create("ann", -1, "web");
+    const std::string otherApp = create("ann", -1, "Tidewater");
+    const std::string noApp = create("ann", -1);
+    const std::string otherUser = create("bob", -1, "web");
+    const std::string alone = store().create({"ann", "web", "", "", "", -1, false}).value_or("");
+    EXPECT_FALSE(store().find(first));
+    EXPECT_FALSE(store().find(second));
+    for (const std::string &id : {alone, otherApp, noApp, otherUser}) {
+        EXPECT_TRUE(store().find(id));
+    }
+    ASSERT_TRUE(store().create({"ann", "", "", "", "", -1, false}));
+    EXPECT_FALSE(store().find(noApp));
+    EXPECT_TRUE(store().find(alone));
+}
+
+TEST_F(Sessions, AreLimitedPerUser) {
+    SessionStore sessions = store();
+    ASSERT_TRUE(sessions.create({"ann", "", "", "", "", -1, true}));
+    RawSqlite raw(file());
+    ASSERT_TRUE(
+        raw.run("WITH RECURSIVE n(i) AS (VALUES (2) UNION ALL SELECT i + 1 FROM n WHERE i < "
+                "512) INSERT INTO session (key, id, user, created, expires) SELECT "
+                "randomblob(32), 'x' || i, 'ann', 1700000000, 1700000100 FROM n"));
+    EXPECT_FALSE(sessions.create({"ann", "", "", "", "", -1, true}));
+    EXPECT_NE(sessions.error().find("User [ann] has 512 sessions"), std::string::npos);
+    EXPECT_TRUE(sessions.create({"bob", "", "", "", "", -1, true}));
+    EXPECT_EQ(sessions.error(), "");
+    time += 100;
+    EXPECT_TRUE(sessions.create({"ann", "", "", "", "", -1, true})); // the expired ones are swept
+}
+
+TEST_F(Sessions, AreLimitedInAll) {
+    ASSERT_NE(create("ann", -1), "");
+    ASSERT_TRUE(RawSqlite(file()).run(
+        "WITH RECURSIVE n(i) AS (VALUES (2) UNION ALL SELECT i + 1 FROM n WHERE i < 4096) INSERT "
+        "INTO session (key, id, user, created) SELECT randomblob(32), 'x' || i, 'u' || i, 1 FROM "
+        "n"));
+    SessionStore sessions = store();
+    EXPECT_FALSE(sessions.create({"bob", "", "", "", "", -1, true}));
+    EXPECT_NE(sessions.error().find("4096 sessions"), std::string::npos);
+    EXPECT_EQ(count(), 4096U);
+}
+
+TEST_F(Sessions, OfUnusableThingsAreRefused) {
+    const SessionRequest requests[] = {
+        {"", "", "", "", "", -1, true},
+        {std::string(492, 'u'), "", "", "", "", -1, true},
+        {"ann", "", "", "", "", 0, true},
+        {"ann", std::string(256, 'a'), "", "", "", -1, true},
+        {"ann", "", "[1]", "", "", -1, true},
+        {"ann", "", "{\"a\":", "", "", -1, true},
+        {"ann", "", "", "{\"a\":\"" + std::string(4096, 'x') + "\"}", "", -1, true},
+        {"ann", "", "", "", "192.0.2.1\nforged line", -1, true},
+    };
+    for (const SessionRequest &request : requests) {
+        SessionStore sessions = store();
+        EXPECT_FALSE(sessions.create(request)) << request.user;
+        EXPECT_NE(sessions.error(), "");
+    }
+    EXPECT_EQ(count(), 0U);
+    EXPECT_NE(create(std::string(491, 'u'), -1), "");
+    EXPECT_NE(create("a'; DROP TABLE session; --\xFF", -1), "");
+    EXPECT_EQ(count(), 2U);
+}
+
+TEST_F(Sessions, ThatAreRemovedAreGoneFromTheFileToo) {
+    const std::string gone = create("ann", -1);
+    const std::string kept = create("ann", -1);
+    EXPECT_NE(readFile(file()).find(gone), std::string::npos);
+    EXPECT_TRUE(store().remove(gone));
+    EXPECT_TRUE(store().remove(gone));
+    EXPECT_FALSE(store().find(gone));
+    EXPECT_TRUE(store().find(kept));
+    EXPECT_EQ(readFile(file()).find(gone), std::string::npos);
+}
+
+TEST_F(Sessions, AreForTheirOwnerOnly) {
+    umask(0);
+    create("ann", -1);
+    EXPECT_EQ(modeOf(path("state")), 0700U);
+    EXPECT_EQ(modeOf(file()), 0600U);
+    chmod(file().c_str(), 0644);
+    EXPECT_EQ(count(), 1U);
+    EXPECT_EQ(modeOf(file()), 0600U);
+    std::filesystem::rename(file(), path("state/elsewhere"));
+    std::filesystem::create_symlink("elsewhere", file());
+    EXPECT_FALSE(store().isOpen());
+}
+
+TEST_F(Sessions, ADamagedOrForeignFileIsAClearErrorAndStaysAsItIs) {
+    const std::string id = create("ann", -1);
+    const std::string good = readFile(file());
+    std::string torn = good;
+    torn.replace(100, torn.size() - 100, torn.size() - 100, '\x5A');
+    RawSqlite(path("foreign")).run("CREATE TABLE session (mine)");
+    RawSqlite(path("foreign.v1")).run("CREATE TABLE session (mine); PRAGMA user_version = 1");
+    std::filesystem::copy(file(), path("newer"));
+    RawSqlite(path("newer")).run("PRAGMA user_version = 2");
+    const std::string contents[] = {
+        std::string(5000, 'x'),    good.substr(0, 5000),         torn,
+        readFile(path("foreign")), readFile(path("foreign.v1")), readFile(path("newer"))};
+    for (const std::string &content : contents) {
+        writeFile(file(), content);
+        SessionStore sessions = store();
+        std::vector<SessionRecord> listed;
+        EXPECT_FALSE(sessions.find(id));
+        EXPECT_FALSE(sessions.list(listed));
+        EXPECT_FALSE(sessions.create({"ann", "", "", "", "", -1, true}));
+        EXPECT_FALSE(sessions.removeIf([](const SessionRecord &) { return true; }));
+        EXPECT_NE(sessions.error().find(file()), std::string::npos) << sessions.error();
+        EXPECT_NE(sessions.error().find("move"), std::string::npos) << sessions.error();
+        EXPECT_EQ(readFile(file()), content);
+    }
+}
+
+TEST_F(Sessions, ManyProcessesMakeTheStoreAndUseItAtOnce) {
+    std::vector<std::unique_ptr<OtherProcess>> processes;
+    processes.reserve(4);
+    for (int i = 0; i < 4; ++i) {
+        processes.push_back(std::make_unique<OtherProcess>([&] {
+            for (int session = 0; session < 10; ++session) {
+                if (create("ann", -1).empty()) {
+                    return 1;
+                }
+            }
+            return 0;
+        }));
+    }
+    for (const auto &process : processes) {
+        EXPECT_EQ(process->wait(), 0);
+    }
+    EXPECT_EQ(count(), 40U);
+}
+
+TEST_F(Sessions, ThatWereHandedOutOutliveAKilledProcess) {
+    for (int round = 0; round < 8; ++round) {
+        const std::string handedOut = path("ids" + std::to_string(round));
+        writeFile(handedOut, "");
+        OtherProcess maker([&] {
+            std::ofstream ids(handedOut);
+            while (true) {
+                ids << create("user" + std::to_string(round), -1) << std::endl;
+            }
+            return 0;
+        });
+        std::this_thread::sleep_for(std::chrono::milliseconds(15 + 7 * round));
+        maker.end(SIGKILL);
+        std::ifstream ids(handedOut);
+        for (std::string id; std::getline(ids, id) && !ids.eof();) {
+            EXPECT_TRUE(store().find(id)) << id;
+        }
+    }
+    EXPECT_GT(count(), 0U);
+    EXPECT_EQ(RawSqlite(file()).cell("PRAGMA integrity_check"), "ok");
+}
+
+TEST_F(Sessions, AFullDiskIsAClearErrorAndLosesNothing) {
+    const std::string id = create("ann", -1);
+    OtherProcess full([&] {
+        OvraTest::limitFileSize(std::filesystem::file_size(file()));
+        SessionStore sessions = store();
+        for (int i = 0; i < 500; ++i) {
+            if (!sessions.create({"ann", "", "", "", "", -1, true})) {
+                return sessions.error().find("disk") != std::string::npos ? 0 : 2;
+            }
+        }
+        return 1;
+    });
+    EXPECT_EQ(full.wait(), 0);
+    EXPECT_TRUE(store().find(id));
+    EXPECT_NE(create("bob", -1), "");
+}
+
+} // namespace
