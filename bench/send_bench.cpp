@@ -47,8 +47,10 @@ bool benchSend() {
     const std::string session = addCredential();
     const Work ours = [] {
         OvraDRNode::NodeSender sender(kNode);
-        if (!sender.process(OvraDRNode::WebAPI::getDRNodeInfoAPI({})).isSuccess()) {
-            std::fprintf(stderr, "no answer, code %d\n", sender.GetErrCode());
+        const auto answer = sender.process(OvraDRNode::WebAPI::getDRNodeInfoAPI({}));
+        if (!answer.isSuccess()) {
+            std::fprintf(stderr, "failed, code %d\n",
+                         OvraDRNode::errorOf(sender, answer).GetErrCode());
             std::exit(1);
         }
     };

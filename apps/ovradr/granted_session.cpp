@@ -65,7 +65,7 @@ Trouble endSessions(const std::vector<GrantedSession> &sessions) {
     for (const GrantedSession &session : sessions) {
         store.DeleteBySessionId(session.record.id);
         if (store.GetErrCode() != OvraDRCore::ERR::kNone) {
-            Failure found = failureOf(store.GetErrCode(), store.GetErrMsg());
+            Failure found = failureOf(store);
             found.message = "The session " + session.reference() + ": " + found.message;
             return found;
         }

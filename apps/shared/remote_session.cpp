@@ -28,17 +28,17 @@ SessionAnswer askSession(const OvraDRNode::Conn &conn, const std::string &sessio
     if (response.isSuccess()) {
         return {SessionState::kLive, 0, {}};
     }
+    const OvraDRCore::ErrRecorder error = errorOf(sender, response);
     if (!response.isValid()) {
-        const int code = sender.GetErrCode();
         // The endpoint, which comes with this code, is known to who asks.
-        const bool bare = code == OvraDRCore::ERR::kNotConnectable;
-        return {SessionState::kSilent, code == 0 ? response.getErrCode() : code,
-                bare ? Json::Value() : sender.GetErrMsg()};
+        const bool bare = error.GetErrCode() == OvraDRCore::ERR::kNotConnectable;
+        return {SessionState::kSilent, error.GetErrCode(),
+                bare ? Json::Value() : error.GetErrMsg()};
     }
-    if (response.getErrCode() == OvraPlatform::APIError::kNoSession) {
+    if (error.GetErrCode() == OvraPlatform::APIError::kNoSession) {
         return {SessionState::kGone, 0, {}};
     }
-    return {SessionState::kRefused, response.getErrCode(), response.getErrMsg()};
+    return {SessionState::kRefused, error.GetErrCode(), error.GetErrMsg()};
 }
 
 std::optional<int> countUsers(const std::string &session, const std::string &exceptCredId) {

@@ -11,6 +11,8 @@
 
 namespace OvraDRNode {
 
+class BaseSender;
+
 /// An operation that runs on the local node or, by a web-API request, on a remote one. A subclass
 /// says how to check the parameters, how to do the work here, and which request does it there;
 /// Run() decides where. An object serves one operation: construct, Run() once, read GetErr() and
@@ -49,6 +51,9 @@ public:
 protected:
     Json::Value result;
     std::string nodeId;
+
+private:
+    bool runOver(BaseSender &sender);
 };
 
 } // namespace OvraDRNode

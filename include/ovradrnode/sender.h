@@ -22,7 +22,8 @@ class CredRequest;
 namespace OvraDRNode {
 
 /// Carries a web-API request to a node. A failure is recorded in the sender (GetErrCode(),
-/// GetErrMsg()); nothing throws. A sender serves one thread at a time.
+/// GetErrMsg()) or is what the remote answered; errorOf() tells which. Nothing throws. A sender
+/// serves one thread at a time.
 class OVRADRNODE_EXPORT BaseSender : public OvraDRCore::ErrRecorder {
 public:
     ~BaseSender() override;
@@ -36,6 +37,24 @@ public:
     /// The recorded verdict; probes only when that is older than 5 seconds.
     static bool GetCachedConnectable(const Conn &conn);
 };
+
+/// Why a call failed. A call fails in one of two places: a remote that refuses says so in its
+/// answer, and where no valid answer came the sender has recorded why. This looks in both.
+///
+///     NodeSender sender(nodeId);
+///     const OvraDRCore::Response answer = sender.process(request);
+///     if (!answer.isSuccess()) {
+///         report(errorOf(sender, answer).GetErr());
+///     }
+///
+/// \param sender  as process() left it
+/// \param answer  what process() returned
+/// \return the remote's code and message when `answer` is a valid refusal, also where the sender
+/// has
+///         a code of its own for it; otherwise those of the sender; 407 when neither has one. The
+///         code is 0 only for an answer that is a success.
+OVRADRNODE_EXPORT OvraDRCore::ErrRecorder errorOf(const OvraDRCore::ErrRecorder &sender,
+                                                  const OvraDRCore::Response &answer);
 
 /// Sends to one endpoint under one credential.
 class OVRADRNODE_EXPORT BaseCredSender : public BaseSender {

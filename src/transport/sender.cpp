@@ -24,6 +24,16 @@ Response BaseSender::run(const Request &request) {
     return Response(reply);
 }
 
+OvraDRCore::ErrRecorder errorOf(const OvraDRCore::ErrRecorder &sender, const Response &answer) {
+    OvraDRCore::ErrRecorder error;
+    if (!answer.isValid() && sender.GetErrCode() != OvraDRCore::ERR::kNone) {
+        error.SetErr(&sender);
+    } else {
+        error.SetErr(answer.getErrCode(), answer.getErrMsg()); // 407 for one that is not valid
+    }
+    return error;
+}
+
 bool BaseSender::IsConnectable(const Conn &conn) {
     const std::time_t start = std::time(nullptr);
     const ProbeResult probe = IsConnectableWithErrCheck(conn);

@@ -47,7 +47,7 @@ Failure flowFailure(const CredCreate &flow, const Conn &conn) {
                        "The other appliance granted the credential, but it could not be stored.",
                        "The system log says why; correct that and make the credential again.");
     }
-    Failure found = failureOf(flow.GetErrCode(), flow.GetErrMsg());
+    Failure found = failureOf(flow);
     found.message = targetText(conn) + ": " + found.message;
     return found;
 }
