@@ -16,5 +16,13 @@ OVRADRNODE_EXPORT bool TestSessionValid(const Conn &conn, const std::string &ses
 OVRADRNODE_EXPORT bool NotifyRemoteNodeDeleteSessionIfNotUsed(const Conn &conn,
                                                               const std::string &session);
 
+/// How many node credentials hold the session; only these keep a session alive, temporary ones do
+/// not. Reads the node database.
+/// \param exceptCredId  a credential that does not count, or ""
+/// \return -1 when it cannot be told: the session is empty, or the database cannot be read. Logged
+///         at ERR.
+OVRADRNODE_EXPORT int GetSessionUsedCount(const std::string &session,
+                                          const std::string &exceptCredId = "");
+
 } // namespace CredUtils
 } // namespace OvraDRNode

@@ -61,10 +61,20 @@ public:
     /// The whole creation.
     bool process();
 
+    /// Whether the node that getRemoteNodeInfo() met is this one. No step refuses a credential to
+    /// this node itself; who does not want one asks here before a session is requested.
+    bool isLocalNode() const;
+    /// The creation for a caller who has run getRemoteNodeInfo() himself, to judge the node first:
+    /// as process(), only that the node is not asked a second time who it is.
+    /// \return false with the codes of process(); 519 when no node was met.
+    bool processKnownNode();
+
     /// The record as far as it has been built.
     const DRNode &getNode() const { return node; }
 
 private:
+    bool createFor(const char *function);
+
     DRNode node;
     std::string account;
     BaseSender *sender = nullptr;

@@ -69,6 +69,9 @@ public:
     static bool Get(const std::string &nodeId, DRNode &node);
     /// The credential with this id, from either table; false when there is none that is valid.
     static bool GetCred(const std::string &credId, DRNode &node);
+    /// The temporary credential with this id, also one that is not valid because it lacks
+    /// something; false when there is none, or the table cannot be read.
+    static bool GetTempCred(const std::string &credId, DRNode &node);
     /// How many credentials the node has (temporary ones count only when there are no others); -1
     /// on an error.
     static int IsNodeIdExist(const std::string &nodeId);

@@ -21,4 +21,18 @@ private:
     std::string credId;
 };
 
+/// The same for a temporary credential. Its session goes too unless a node credential uses it; what
+/// is known of the node stays as it is while there is another credential to it.
+class OVRADRNODE_EXPORT TempCredDelete {
+public:
+    explicit TempCredDelete(const std::string &credId);
+
+    bool DeleteRecord() const;
+    /// \return whether the row is gone; nothing else decides.
+    bool process();
+
+private:
+    std::string credId;
+};
+
 } // namespace OvraDRNode
