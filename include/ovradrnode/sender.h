@@ -94,8 +94,11 @@ protected:
     bool inited = false;
 
 private:
+    class CallTexts;
+
     void freeHandles();
-    OvraDRCore::Response send(const OvraDRCore::Request &request, const char *function) const;
+    OvraDRCore::Response send(const OvraDRCore::Request &request, CallTexts &texts,
+                              const char *function) const;
 };
 
 /// Logs in with account, password and one-time code before the first request, and out at the end.

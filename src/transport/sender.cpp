@@ -9,6 +9,7 @@
 #include <ovrawebapi/api_runner.h>
 
 #include <ctime>
+#include <utility>
 
 namespace OvraDRNode {
 
@@ -21,7 +22,9 @@ Response BaseSender::run(const Request &request) {
     Json::Value reply;
     OVRA::APIRunner().Exec(reply, request.getAPI().c_str(), request.getVersion(),
                            request.getMethod().c_str(), request.getParams(), Word::kLocalUser);
-    return Response(reply);
+    Response response;
+    response.setResp(std::move(reply));
+    return response;
 }
 
 OvraDRCore::ErrRecorder errorOf(const OvraDRCore::ErrRecorder &sender, const Response &answer) {
