@@ -33,6 +33,10 @@ public:
     std::string GetUserBySession(const std::string &sessionId);
     /// Removes all that was granted, of every user.
     void DeleteAllNodeSession();
+
+    /// The node that a session of ours is tied to; "" when it is tied to none.
+    /// \param extra  what the store keeps with the session as its extra data
+    static std::string NodeIdOf(const std::string &extra);
 };
 
 } // namespace OvraDRNode
