@@ -126,8 +126,9 @@ Release retryRelease(const PendingRelease &pending, PendingReleases &store) {
         const auto now = look(pending.conn, pending.session, "", ReleaseOutcome::kReleased);
         if (!now) {
             const SessionLock lock(SessionLock::Purpose::kRelease);
-            OvraDRNode::CredUtils::NotifyRemoteNodeDeleteSessionIfNotUsed(pending.conn,
-                                                                          pending.session);
+            // What came of it is looked at below.
+            (void)OvraDRNode::CredUtils::NotifyRemoteNodeDeleteSessionIfNotUsed(pending.conn,
+                                                                                pending.session);
         }
         result = now ? *now : lookAfter(pending.conn, pending.session, ReleaseOutcome::kReleased);
     }

@@ -49,8 +49,11 @@ void Response::setResp(const std::string &text) {
         return;
     }
     Json::Value reply;
-    fromString(reply, text);
-    setResp(std::move(reply));
+    if (fromString(reply, text)) {
+        setResp(std::move(reply));
+    } else {
+        *this = Response();
+    }
 }
 
 bool Response::hasDataField(const char *key) const {

@@ -13,9 +13,9 @@ class OVRADRNODE_EXPORT DRNodeCredDelete {
 public:
     explicit DRNodeCredDelete(const std::string &credId);
 
-    bool DeleteRecord() const;
+    [[nodiscard]] bool DeleteRecord() const;
     /// \return whether the row is gone; nothing else decides.
-    bool process();
+    [[nodiscard]] bool process();
 
 private:
     std::string credId;
@@ -27,9 +27,9 @@ class OVRADRNODE_EXPORT TempCredDelete {
 public:
     explicit TempCredDelete(const std::string &credId);
 
-    bool DeleteRecord() const;
+    [[nodiscard]] bool DeleteRecord() const;
     /// \return whether the row is gone; nothing else decides.
-    bool process();
+    [[nodiscard]] bool process();
 
 private:
     std::string credId;

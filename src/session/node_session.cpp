@@ -168,8 +168,7 @@ void SetRemoteIP() {
 std::string hiddenUi() {
     Json::Value ui;
     const char *const ours = OvraCgiLoginUIJsonConfigTemplate();
-    OvraDRCore::fromString(ui, ours != nullptr ? ours : "");
-    if (!ui.isObject()) {
+    if (!OvraDRCore::fromString(ui, ours != nullptr ? ours : "") || !ui.isObject()) {
         ui = Json::Value(Json::objectValue);
     }
     ui["hide"] = true;

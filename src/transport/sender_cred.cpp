@@ -50,7 +50,7 @@ int loginError(int remoteCode) {
 BaseCredSender::BaseCredSender() = default;
 
 BaseCredSender::BaseCredSender(const Conn &conn_) {
-    setConn(conn_);
+    (void)setConn(conn_); // isValid() tells
 }
 
 BaseCredSender::~BaseCredSender() {

@@ -63,7 +63,7 @@ public:
     /// \param reply  what `text` parses to. Where no object waits, nothing happens.
     static void give(const std::string &text, Response &&reply);
     /// Takes the reply that was given with this very text. \return false when there is none.
-    static bool take(const std::string &text, Response &reply);
+    [[nodiscard]] static bool take(const std::string &text, Response &reply);
 
 private:
     ReplyHandOver *outer_;

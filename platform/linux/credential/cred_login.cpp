@@ -59,10 +59,10 @@ CredError login(const OVRACred &cred, const std::string &otp, OVRACredSess &sess
         return reply.error;
     }
     Json::Value document;
-    OvraDRCore::fromString(document, reply.document);
     const std::string sid = reply.response.getDataFieldtoStr("sid");
-    if (reply.response.isSuccess() &&
-        (sid.empty() || OVRACredSessItemSetAccessToken(&sess, sid.c_str()) != 0)) {
+    const bool unusable = reply.response.isSuccess() &&
+                          (sid.empty() || OVRACredSessItemSetAccessToken(&sess, sid.c_str()) != 0);
+    if (unusable || !OvraDRCore::fromString(document, reply.document)) {
         return CredError::kReplyBroken;
     }
     out = std::move(document);

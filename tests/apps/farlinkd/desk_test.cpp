@@ -35,7 +35,7 @@ protected:
         const auto promise = std::make_shared<std::promise<Json::Value>>();
         desk.serve({*encodeForm(call), address, true}, [promise](const std::string &document) {
             Json::Value reply;
-            OvraDRCore::fromString(reply, document);
+            EXPECT_TRUE(OvraDRCore::fromString(reply, document));
             promise->set_value(reply);
         });
         return promise->get_future();
