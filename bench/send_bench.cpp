@@ -25,11 +25,11 @@ std::string addCredential() {
     std::string session = sessions.CreateNodeSession(kNode, "bench");
     const OvraDRNode::Conn conn = OvraDRNode::Conn::https("127.0.0.1", kPort);
     OvraDRNode::DRNode node(kNode, conn, session);
-    node.setCredId("bench-cred");
+    const bool complete = !session.empty() && node.setCredId("bench-cred");
     OvraDRCore::InsertCommand command;
     command.SetTable(OvraDRNode::NodeCredSqliteTable());
     command.SetFieldValues(node.ToSqliteRecord());
-    if (session.empty() || !OvraDRNode::NodeDBHandler::GetHandler().InsertRecord(command)) {
+    if (!complete || !OvraDRNode::NodeDBHandler::GetHandler().InsertRecord(command)) {
         std::fprintf(stderr,
                      "cannot make a credential: is ovradrd running, with the user bench?\n");
         std::exit(1);
@@ -48,8 +48,10 @@ bool benchSend() {
     const std::string session = addCredential();
     const Work ours = [] {
         OvraDRNode::NodeSender sender(kNode);
-        if (!sender.process(OvraDRNode::WebAPI::getDRNodeInfoAPI({})).isSuccess()) {
-            std::fprintf(stderr, "no answer, code %d\n", sender.GetErrCode());
+        const auto answer = sender.process(OvraDRNode::WebAPI::getDRNodeInfoAPI({}));
+        if (!answer.isSuccess()) {
+            std::fprintf(stderr, "failed, code %d\n",
+                         OvraDRNode::errorOf(sender, answer).GetErrCode());
             std::exit(1);
         }
     };

@@ -12,7 +12,10 @@ int main(int argc, char **argv) {
     OvraDRNode::NodeSender sender(nodeId);
     const OvraDRCore::Response answer = sender.process(OvraDRNode::WebAPI::getDRNodeInfoAPI({}));
     if (!answer.isSuccess()) {
-        std::cerr << "no answer: " << OvraDRCore::toString(sender.GetErr()) << '\n';
+        // A refusal is in the answer; why there is no answer, in the sender.
+        const OvraDRCore::ErrRecorder error = OvraDRNode::errorOf(sender, answer);
+        std::cerr << (answer.isValid() ? "refused: " : "no answer: ")
+                  << OvraDRCore::toString(error.GetErr()) << '\n';
         return 1;
     }
     std::cout << nodeId << " is " << answer.getDataFieldtoStr("hostname") << '\n';

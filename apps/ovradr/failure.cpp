@@ -3,7 +3,6 @@
 
 #include "target.h"
 
-#include <ovradrcore/err_recorder.h>
 #include <ovradrcore/json.h>
 #include <ovraplatform/api_errors.h>
 #include <ovraplatform/cred_errors.h>
@@ -193,6 +192,10 @@ Failure failureOf(int code, const Json::Value &detail) {
     }
     addDetail(found, saysItAll(code) ? "" : detailText(code, detail));
     return found;
+}
+
+Failure failureOf(const OvraDRCore::ErrRecorder &error) {
+    return failureOf(error.GetErrCode(), error.GetErrMsg());
 }
 
 } // namespace Ovradr

@@ -1,6 +1,8 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
+#include <ovradrcore/err_recorder.h>
+
 #include <json/value.h>
 
 #include <optional>
@@ -51,6 +53,7 @@ Failure storeFailure(ExitCode exit, const std::string &sentences);
 /// The failure that an error code of the library or of the web API stands for.
 /// \param detail  what came with the code; null when nothing did
 Failure failureOf(int code, const Json::Value &detail = Json::Value());
+Failure failureOf(const OvraDRCore::ErrRecorder &error);
 
 /// A value, or why there is none.
 template <typename T>

@@ -3,23 +3,12 @@
 
 #include "output.h"
 
-#include <ovradrcore/json.h>
 #include <ovradrnode/node_session.h>
 
 namespace Ovradr {
 
 using OvraDRNode::NodeSession;
 using OvraPlatform::SessionRecord;
-
-namespace {
-
-std::string nodeIdOf(const SessionRecord &record) {
-    Json::Value extra;
-    OvraDRCore::fromString(extra, record.extra);
-    return OvraDRCore::memberString(extra, "node_id");
-}
-
-} // namespace
 
 Expected<std::vector<GrantedSession>> grantedSessions() {
     OvraPlatform::SessionStore store;
@@ -30,7 +19,7 @@ Expected<std::vector<GrantedSession>> grantedSessions() {
     std::vector<GrantedSession> sessions;
     for (const SessionRecord &record : records) {
         if (record.app == NodeSession::kApplication) {
-            sessions.push_back({record, nodeIdOf(record)});
+            sessions.push_back({record, NodeSession::NodeIdOf(record.extra)});
         }
     }
     return sessions;
@@ -65,7 +54,7 @@ Trouble endSessions(const std::vector<GrantedSession> &sessions) {
     for (const GrantedSession &session : sessions) {
         store.DeleteBySessionId(session.record.id);
         if (store.GetErrCode() != OvraDRCore::ERR::kNone) {
-            Failure found = failureOf(store.GetErrCode(), store.GetErrMsg());
+            Failure found = failureOf(store);
             found.message = "The session " + session.reference() + ": " + found.message;
             return found;
         }

@@ -3,22 +3,11 @@
 
 #include <ovradrcore/err_recorder.h>
 #include <ovradrcore/response.h>
-#include <ovradrcore/sqlite_command.h>
 #include <ovradrnode/node_api.h>
-#include <ovradrnode/node_db.h>
 #include <ovradrnode/sender.h>
 #include <ovraplatform/api_errors.h>
 
-#include <algorithm>
-#include <vector>
-
 namespace OvraApps {
-
-namespace {
-
-constexpr const char *kCredIdColumn = "cred_id";
-
-} // namespace
 
 SessionAnswer askSession(const OvraDRNode::Conn &conn, const std::string &session) {
     OvraDRNode::CredSessionSender sender(conn, session);
@@ -27,33 +16,17 @@ SessionAnswer askSession(const OvraDRNode::Conn &conn, const std::string &sessio
     if (response.isSuccess()) {
         return {SessionState::kLive, 0, {}};
     }
+    const OvraDRCore::ErrRecorder error = errorOf(sender, response);
     if (!response.isValid()) {
-        const int code = sender.GetErrCode();
         // The endpoint, which comes with this code, is known to who asks.
-        const bool bare = code == OvraDRCore::ERR::kNotConnectable;
-        return {SessionState::kSilent, code == 0 ? response.getErrCode() : code,
-                bare ? Json::Value() : sender.GetErrMsg()};
+        const bool bare = error.GetErrCode() == OvraDRCore::ERR::kNotConnectable;
+        return {SessionState::kSilent, error.GetErrCode(),
+                bare ? Json::Value() : error.GetErrMsg()};
     }
-    if (response.getErrCode() == OvraPlatform::APIError::kNoSession) {
+    if (error.GetErrCode() == OvraPlatform::APIError::kNoSession) {
         return {SessionState::kGone, 0, {}};
     }
-    return {SessionState::kRefused, response.getErrCode(), response.getErrMsg()};
-}
-
-std::optional<int> countUsers(const std::string &session, const std::string &exceptCredId) {
-    OvraDRCore::SelectCommand command;
-    command.AddField(kCredIdColumn);
-    command.SetTable(OvraDRNode::NodeCredSqliteTable());
-    command.SetCondition(OvraDRCore::SqliteEqual("session", session));
-    std::vector<OvraDRCore::SqliteValueList> rows;
-    if (!OvraDRNode::NodeDBHandler::GetHandler().SelectRecords(command, rows)) {
-        return std::nullopt;
-    }
-    return static_cast<int>(std::count_if(
-        rows.begin(), rows.end(), [&exceptCredId](const OvraDRCore::SqliteValueList &row) {
-            std::string credId;
-            return row.GetValue(kCredIdColumn, credId) && credId != exceptCredId;
-        }));
+    return {SessionState::kRefused, error.GetErrCode(), error.GetErrMsg()};
 }
 
 } // namespace OvraApps

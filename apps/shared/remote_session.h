@@ -5,7 +5,6 @@
 
 #include <json/value.h>
 
-#include <optional>
 #include <string>
 
 namespace OvraApps {
@@ -30,10 +29,5 @@ struct SessionAnswer {
 /// at most 10 seconds where nobody answers; an endpoint that was found dead in the last 5 seconds
 /// is not asked.
 SessionAnswer askSession(const OvraDRNode::Conn &conn, const std::string &session);
-
-/// How many lasting credentials of this node hold the session: only these keep a session alive.
-/// \param exceptCredId  a credential that does not count, or ""
-/// \return nothing when the node database cannot be read.
-std::optional<int> countUsers(const std::string &session, const std::string &exceptCredId = "");
 
 } // namespace OvraApps

@@ -7,7 +7,6 @@
 #include <ovradrcore/err_recorder.h>
 #include <ovradrcore/log.h>
 #include <ovradrnode/cred_utils.h>
-#include <ovradrnode/node_cache.h>
 #include <ovradrnode/node_db.h>
 #include <ovradrnode/node_delete.h>
 
@@ -32,11 +31,11 @@ std::optional<Release> look(const Conn &conn, const std::string &session,
     if (session.empty()) {
         return Release{ReleaseOutcome::kEndedAlready, 0, {}, false};
     }
-    const std::optional<int> users = countUsers(session, exceptCredId);
-    if (!users) {
+    const int users = OvraDRNode::CredUtils::GetSessionUsedCount(session, exceptCredId);
+    if (users < 0) {
         return left(OvraDRCore::ERR::kFailed);
     }
-    if (*users > 0) {
+    if (users > 0) {
         return Release{ReleaseOutcome::kKept, 0, {}, false};
     }
     const SessionAnswer answer = askSession(conn, session);
@@ -62,20 +61,6 @@ void settle(PendingReleases &store, const PendingRelease &pending, Release &rele
     if (release.outcome != ReleaseOutcome::kLeft) {
         store.remove(pending.reference());
     }
-}
-
-/// As the deletion of a lasting credential; only the table is another one.
-bool deleteTemporary(const DRNode &record) {
-    const OvraDRCore::SqliteEqual condition("cred_id", record.credId);
-    if (!OvraDRNode::NodeDBHandler::GetHandler().DeleteRecord(condition.text,
-                                                              OvraDRNode::TempCredSqliteTable())) {
-        return false;
-    }
-    OvraDRNode::CredUtils::NotifyRemoteNodeDeleteSessionIfNotUsed(record.conn, record.session);
-    if (DRNodeDB::IsNodeIdExist(record.nodeId) <= 0) {
-        OvraDRNode::NodeCache(record.nodeId, false).Remove();
-    }
-    return true;
 }
 
 } // namespace
@@ -127,7 +112,7 @@ ReleasingFlow runReleasing(const DRNode &record, const Conn &conn,
 
 ReleasingFlow deleteCredential(const DRNode &record, bool temporary) {
     return runReleasing(record, record.conn, [&record, temporary] {
-        return temporary ? deleteTemporary(record)
+        return temporary ? OvraDRNode::TempCredDelete(record.credId).process()
                          : OvraDRNode::DRNodeCredDelete(record.credId).process();
     });
 }
@@ -141,8 +126,9 @@ Release retryRelease(const PendingRelease &pending, PendingReleases &store) {
         const auto now = look(pending.conn, pending.session, "", ReleaseOutcome::kReleased);
         if (!now) {
             const SessionLock lock(SessionLock::Purpose::kRelease);
-            OvraDRNode::CredUtils::NotifyRemoteNodeDeleteSessionIfNotUsed(pending.conn,
-                                                                          pending.session);
+            // What came of it is looked at below.
+            (void)OvraDRNode::CredUtils::NotifyRemoteNodeDeleteSessionIfNotUsed(pending.conn,
+                                                                                pending.session);
         }
         result = now ? *now : lookAfter(pending.conn, pending.session, ReleaseOutcome::kReleased);
     }

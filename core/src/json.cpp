@@ -73,6 +73,10 @@ const Json::CharReaderBuilder &readerFactory() {
 } // namespace
 
 std::string toString(const Json::Value &value) {
+    // The literals of the boolean caches are written and read on every request.
+    if (value.isBool()) {
+        return value.asBool() ? "true" : "false";
+    }
     return Json::writeString(writerFactory(), value);
 }
 
@@ -87,7 +91,6 @@ std::string toLogString(const Json::Value &value) {
 }
 
 bool fromString(Json::Value &value, const std::string &text) {
-    // The literals of the boolean caches are read on every request.
     if (text == "true" || text == "false") {
         value = text == "true";
         return true;

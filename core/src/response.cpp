@@ -4,25 +4,38 @@
 #include "ovradrcore/err_recorder.h"
 #include "ovradrcore/json.h"
 
+#include <utility>
+
 namespace OvraDRCore {
 
+namespace {
+
+thread_local ReplyHandOver *innermost = nullptr;
+
+} // namespace
+
 void Response::setResp(const Json::Value &reply) {
+    setResp(Json::Value(reply));
+}
+
+void Response::setResp(Json::Value &&reply) {
     *this = Response();
-    if (!reply.isObject() || !reply["success"].isBool()) {
+    const Json::Value &document = reply; // looking for a member adds it where that is allowed
+    if (!document.isObject() || !document["success"].isBool()) {
         return;
     }
-    if (reply["success"].asBool()) {
-        const Json::Value &data = reply["data"];
+    if (document["success"].asBool()) {
+        const Json::Value &data = document["data"];
         if (!data.isNull() && !data.isObject()) {
             return;
         }
         valid_ = true;
         success_ = true;
         errCode_ = ERR::kNone;
-        data_ = data.isNull() ? Json::Value(Json::objectValue) : data;
+        data_ = data.isNull() ? Json::Value(Json::objectValue) : std::move(reply["data"]);
         return;
     }
-    const Json::Value &error = reply["error"];
+    const Json::Value &error = document["error"];
     if (!error.isObject() || !error["code"].isInt() || error["code"].asInt() == ERR::kNone) {
         return;
     }
@@ -32,9 +45,15 @@ void Response::setResp(const Json::Value &reply) {
 }
 
 void Response::setResp(const std::string &text) {
+    if (ReplyHandOver::take(text, *this)) {
+        return;
+    }
     Json::Value reply;
-    fromString(reply, text);
-    setResp(reply);
+    if (fromString(reply, text)) {
+        setResp(std::move(reply));
+    } else {
+        *this = Response();
+    }
 }
 
 bool Response::hasDataField(const char *key) const {
@@ -68,6 +87,29 @@ Json::Value Response::toJson() const {
         reply["error"]["msg"] = errMsg_;
     }
     return reply;
+}
+
+ReplyHandOver::ReplyHandOver()
+    : outer_(std::exchange(innermost, this)) {}
+
+ReplyHandOver::~ReplyHandOver() {
+    innermost = outer_;
+}
+
+void ReplyHandOver::give(const std::string &text, Response &&reply) {
+    if (innermost != nullptr) {
+        innermost->text_ = text;
+        innermost->reply_ = std::move(reply);
+    }
+}
+
+bool ReplyHandOver::take(const std::string &text, Response &reply) {
+    if (innermost == nullptr || !innermost->reply_.isValid() || innermost->text_ != text) {
+        return false;
+    }
+    reply = std::exchange(innermost->reply_, Response());
+    innermost->text_.clear();
+    return true;
 }
 
 } // namespace OvraDRCore

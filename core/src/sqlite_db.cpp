@@ -145,10 +145,7 @@ int SqliteDB::GetSchemaVersion() {
     select.SetTable(SqliteTableHandler(infoTable_, ""));
     SqliteValueList row;
     int version = -1;
-    if (SelectRecord(select, row)) {
-        row.GetValue("version", version);
-    }
-    return version;
+    return SelectRecord(select, row) && row.GetValue("version", version) ? version : -1;
 }
 
 } // namespace OvraDRCore

@@ -23,7 +23,7 @@ public:
     OvraDRCore::SqliteValueList
     ToSqliteValues(const std::vector<std::string> &fields) const override;
     /// Loads whichever of the three columns the row has; false when it has none.
-    bool FromSqliteValues(const OvraDRCore::SqliteValueList &row) override;
+    [[nodiscard]] bool FromSqliteValues(const OvraDRCore::SqliteValueList &row) override;
     std::vector<std::string> ListSqliteField() const override;
 
     /// Invalid: no address, no protocol, port -1.

@@ -18,7 +18,7 @@ class OVRADRNODE_EXPORT CredPermissionCache : public OvraDRCore::Cache {
 public:
     ~CredPermissionCache() override;
     Json::Value GetInfo() const override;
-    bool GetUpdatedData(Json::Value &value) const override;
+    [[nodiscard]] bool GetUpdatedData(Json::Value &value) const override;
     bool IsValid(const Json::Value &value) const override;
     bool IsUpdatedDataRequired() const override;
 

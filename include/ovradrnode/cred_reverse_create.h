@@ -24,24 +24,24 @@ class OVRADRNODE_EXPORT CredReverseCreate : public OvraDRCore::ErrRecorder {
 public:
     ~CredReverseCreate() override;
     /// Asks the remote node to create its credential.
-    virtual bool relayCreate(const Conn &conn, const std::string &session);
+    [[nodiscard]] virtual bool relayCreate(const Conn &conn, const std::string &session);
 
     // Setters record no code.
-    bool setCredId(const std::string &credId);
-    bool setLocalAccount(const std::string &account);
+    [[nodiscard]] bool setCredId(const std::string &credId);
+    [[nodiscard]] bool setLocalAccount(const std::string &account);
     void setCredInfo(const Json::Value &info) { credInfo = info; }
-    bool addLocalConn(const Conn &conn);
+    [[nodiscard]] bool addLocalConn(const Conn &conn);
     /// In order, up to the first that is refused.
-    bool addLocalConns(const std::vector<Conn> &conns);
-    bool checkParameter() const;
-    OvraDRCore::Response sendReq(const OvraDRCore::Request &request) const;
+    [[nodiscard]] bool addLocalConns(const std::vector<Conn> &conns);
+    [[nodiscard]] bool checkParameter() const;
+    [[nodiscard]] OvraDRCore::Response sendReq(const OvraDRCore::Request &request) const;
     /// Learns which of the endpoints offered the remote node can reach (522 when its answer is
     /// none).
-    bool testAvailableConn(Conn &conn) const;
+    [[nodiscard]] bool testAvailableConn(Conn &conn) const;
     /// The whole flow, except that the remote only checks.
-    bool check();
+    [[nodiscard]] bool check();
     /// The whole flow. The result is whether an error was recorded.
-    bool process();
+    [[nodiscard]] bool process();
 
     /// What the remote node reported about the credential that it made.
     const Json::Value &getCredInfo() const { return credInfo; }
@@ -60,7 +60,7 @@ private:
 class OVRADRNODE_EXPORT TempCredReverseCreate : public CredReverseCreate {
 public:
     ~TempCredReverseCreate() override;
-    bool relayCreate(const Conn &conn, const std::string &session) override;
+    [[nodiscard]] bool relayCreate(const Conn &conn, const std::string &session) override;
 };
 
 } // namespace OvraDRNode

@@ -21,7 +21,7 @@ public:
     OvraDRCore::SqliteValueList
     ToSqliteValues(const std::vector<std::string> &fields) const override;
     /// Loads whichever of the record's columns the row has; false when it has none.
-    bool FromSqliteValues(const OvraDRCore::SqliteValueList &row) override;
+    [[nodiscard]] bool FromSqliteValues(const OvraDRCore::SqliteValueList &row) override;
     /// "addr", "protocol", "port", "cred_id", "node_id", "session".
     std::vector<std::string> ListSqliteField() const override;
 
@@ -32,10 +32,10 @@ public:
     DRNode &operator=(const DRNode &) = default;
 
     // Each refuses an empty (or invalid) value with false and leaves the record unchanged.
-    bool setNodeId(const std::string &id);
-    bool setCredId(const std::string &id);
-    bool setConn(const Conn &value);
-    bool setSession(const std::string &value);
+    [[nodiscard]] bool setNodeId(const std::string &id);
+    [[nodiscard]] bool setCredId(const std::string &id);
+    [[nodiscard]] bool setConn(const Conn &value);
+    [[nodiscard]] bool setSession(const std::string &value);
 
     /// Both ids, and either the local node's own record or a valid endpoint with a session.
     bool isValid() const;
@@ -53,7 +53,7 @@ public:
     static std::string getLocalNodeId();
     /// Removes the identity file, so that the next getLocalNodeId() makes a new id.
     /// \return false when the lock could not be had within 5 seconds.
-    static bool resetLocalNodeId();
+    [[nodiscard]] static bool resetLocalNodeId();
     /// The local node's own record.
     static DRNode getLocalNode();
     /// Conn::listLocal().

@@ -17,7 +17,7 @@ class OVRADRNODE_EXPORT NodeCache : public OvraDRCore::Cache {
 public:
     ~NodeCache() override;
     Json::Value GetInfo() const override;
-    bool GetUpdatedData(Json::Value &value) const override;
+    [[nodiscard]] bool GetUpdatedData(Json::Value &value) const override;
     bool IsValid(const Json::Value &value) const override;
 
     /// \param flag  whether a reader waits for a refresh that another process is doing; always so

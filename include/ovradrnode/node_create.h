@@ -32,40 +32,51 @@ public:
     CredCreate &operator=(const CredCreate &) = delete;
 
     /// Checks and probes the endpoint (401, 500).
-    bool setConn(const Conn &conn);
+    [[nodiscard]] bool setConn(const Conn &conn);
     /// Takes ownership of a sender that is ready to use (403 for null).
-    bool setSender(BaseSender *newSender);
+    [[nodiscard]] bool setSender(BaseSender *newSender);
     /// Initialises the sender (a login, for an account) and takes ownership of it; it is deleted
     /// when that fails.
-    bool setCredSender(BaseCredSender *newSender);
+    [[nodiscard]] bool setCredSender(BaseCredSender *newSender);
     void clearSender();
-    bool setCredAccount(const std::string &newAccount);
+    [[nodiscard]] bool setCredAccount(const std::string &newAccount);
 
     /// Proves itself by a login. `otp` may be empty.
-    bool setCred(const Conn &conn, const std::string &newAccount, const std::string &password,
-                 const std::string &otp);
+    [[nodiscard]] bool setCred(const Conn &conn, const std::string &newAccount,
+                               const std::string &password, const std::string &otp);
     /// Proves itself by a session that the remote node granted before.
-    bool setCred(const Conn &conn, const std::string &session);
+    [[nodiscard]] bool setCred(const Conn &conn, const std::string &session);
     /// Proves itself by a credential that this node holds.
-    bool setCred(const std::string &credId);
+    [[nodiscard]] bool setCred(const std::string &credId);
 
-    bool checkParameter() const;
+    [[nodiscard]] bool checkParameter() const;
     /// Whether the account works on the remote node; creates nothing.
-    bool check() const;
-    bool checkCredAccount() const;
+    [[nodiscard]] bool check() const;
+    [[nodiscard]] bool checkCredAccount() const;
     /// The one way by which every remote request of the flow goes.
-    OvraDRCore::Response sendReq(const OvraDRCore::Request &request) const;
-    bool getRemoteNodeInfo();
-    bool requestRemoteSession();
-    bool queryCredAccountBySession(const std::string &session, std::string &foundAccount) const;
-    bool insertCredNodeRecord();
+    [[nodiscard]] OvraDRCore::Response sendReq(const OvraDRCore::Request &request) const;
+    [[nodiscard]] bool getRemoteNodeInfo();
+    [[nodiscard]] bool requestRemoteSession();
+    [[nodiscard]] bool queryCredAccountBySession(const std::string &session,
+                                                 std::string &foundAccount) const;
+    [[nodiscard]] bool insertCredNodeRecord();
     /// The whole creation.
-    bool process();
+    [[nodiscard]] bool process();
+
+    /// Whether the node that getRemoteNodeInfo() met is this one. No step refuses a credential to
+    /// this node itself; who does not want one asks here before a session is requested.
+    [[nodiscard]] bool isLocalNode() const;
+    /// The creation for a caller who has run getRemoteNodeInfo() himself, to judge the node first:
+    /// as process(), only that the node is not asked a second time who it is.
+    /// \return false with the codes of process(); 519 when no node was met.
+    [[nodiscard]] bool processKnownNode();
 
     /// The record as far as it has been built.
     const DRNode &getNode() const { return node; }
 
 private:
+    [[nodiscard]] bool createFor(const char *function);
+
     DRNode node;
     std::string account;
     BaseSender *sender = nullptr;

@@ -60,32 +60,35 @@ public:
     }
 
     /// Deletes every node credential of the node; its temporary ones stay.
-    static bool Delete(const std::string &nodeId);
+    [[nodiscard]] static bool Delete(const std::string &nodeId);
     /// Appends every credential. True even when a table could not be read (which is logged).
     static bool List(std::vector<DRNode> &nodes, CredType type);
     /// Appends the credentials of one node, like List(); false for an empty id.
     static bool ListCred(const std::string &nodeId, std::vector<DRNode> &nodes, CredType type);
     /// The first node credential of the node. A node without any gives true and a record that holds
     /// the node id alone, which is not valid.
-    static bool Get(const std::string &nodeId, DRNode &node);
+    [[nodiscard]] static bool Get(const std::string &nodeId, DRNode &node);
     /// The credential with this id, from either table; false when there is none that is valid.
-    static bool GetCred(const std::string &credId, DRNode &node);
+    [[nodiscard]] static bool GetCred(const std::string &credId, DRNode &node);
+    /// The temporary credential with this id, also one that is not valid because it lacks
+    /// something; false when there is none, or the table cannot be read.
+    [[nodiscard]] static bool GetTempCred(const std::string &credId, DRNode &node);
     /// How many credentials the node has (temporary ones count only when there are no others); -1
     /// on an error.
-    static int IsNodeIdExist(const std::string &nodeId);
+    [[nodiscard]] static int IsNodeIdExist(const std::string &nodeId);
     /// Points a node credential to another endpoint. True also when no credential has this id.
-    static bool SetConn(const std::string &credId, const Conn &conn);
+    [[nodiscard]] static bool SetConn(const std::string &credId, const Conn &conn);
 
     /// Reads one attribute; false when there is none.
-    static bool GetAttr(const std::string &nodeId, const std::string &app, const std::string &attr,
-                        std::string &value);
+    [[nodiscard]] static bool GetAttr(const std::string &nodeId, const std::string &app,
+                                      const std::string &attr, std::string &value);
     /// Appends the attributes that the application keeps about the node.
-    static bool ListAttr(const std::string &nodeId, const std::string &app,
-                         std::vector<DRNodeAttr> &attrs);
+    [[nodiscard]] static bool ListAttr(const std::string &nodeId, const std::string &app,
+                                       std::vector<DRNodeAttr> &attrs);
     /// Adds or changes one attribute. The test whether it exists and the write are two statements.
-    static bool SetAttr(const DRNodeAttr &attr);
-    static bool SetAttr(const std::string &nodeId, const std::string &app, const std::string &attr,
-                        const std::string &value);
+    [[nodiscard]] static bool SetAttr(const DRNodeAttr &attr);
+    [[nodiscard]] static bool SetAttr(const std::string &nodeId, const std::string &app,
+                                      const std::string &attr, const std::string &value);
 };
 
 } // namespace OvraDRNode

@@ -13,9 +13,23 @@ class OVRADRNODE_EXPORT DRNodeCredDelete {
 public:
     explicit DRNodeCredDelete(const std::string &credId);
 
-    bool DeleteRecord() const;
+    [[nodiscard]] bool DeleteRecord() const;
     /// \return whether the row is gone; nothing else decides.
-    bool process();
+    [[nodiscard]] bool process();
+
+private:
+    std::string credId;
+};
+
+/// The same for a temporary credential. Its session goes too unless a node credential uses it; what
+/// is known of the node stays as it is while there is another credential to it.
+class OVRADRNODE_EXPORT TempCredDelete {
+public:
+    explicit TempCredDelete(const std::string &credId);
+
+    [[nodiscard]] bool DeleteRecord() const;
+    /// \return whether the row is gone; nothing else decides.
+    [[nodiscard]] bool process();
 
 private:
     std::string credId;

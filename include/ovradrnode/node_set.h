@@ -25,18 +25,18 @@ public:
     ~DRNodeCredSet() override;
 
     /// Loads the credential to change (401, 404, 516).
-    bool setCredId(const std::string &credId);
+    [[nodiscard]] bool setCredId(const std::string &credId);
     /// The new endpoint and login (500, 401, or what the login failed with).
-    bool setCred(const Conn &conn, const std::string &account, const std::string &password,
-                 const std::string &otp);
+    [[nodiscard]] bool setCred(const Conn &conn, const std::string &account,
+                               const std::string &password, const std::string &otp);
     bool IsSessionChanged() const;
     /// Whether the new login reaches the node that the credential belongs to (518 when another).
-    bool check();
-    bool checkRemoteNodeInfo();
-    bool requestRemoteSession();
-    bool setCredRecord();
+    [[nodiscard]] bool check();
+    [[nodiscard]] bool checkRemoteNodeInfo();
+    [[nodiscard]] bool requestRemoteSession();
+    [[nodiscard]] bool setCredRecord();
     /// The whole update.
-    bool process();
+    [[nodiscard]] bool process();
 
 private:
     DRNode record;

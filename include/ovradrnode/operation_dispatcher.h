@@ -12,6 +12,8 @@
 
 namespace OvraDRNode {
 
+class BaseSender;
+
 /// An operation that runs on the local node or, by a web-API request, on a remote one. A subclass
 /// says how to check the parameters, how to do the work here, and which request does it there;
 /// Run() decides where. An object serves one operation: construct, Run() once, read GetErr() and
@@ -22,11 +24,11 @@ public:
     /// Always true.
     virtual bool SetNodeId(const std::string &id);
     /// Does the work on the local node; Run() returns what this returns.
-    virtual bool RunLocal() = 0;
+    [[nodiscard]] virtual bool RunLocal() = 0;
     /// The request that does the work on a remote node.
     virtual OvraDRCore::Request GetRequest() = 0;
     /// Asked before anything else, wherever the operation is to run.
-    virtual bool IsValidParam() = 0;
+    [[nodiscard]] virtual bool IsValidParam() = 0;
     /// The credential for a remote run; "" lets the sender choose.
     virtual std::string GetCredId() const;
 
@@ -36,13 +38,13 @@ public:
     bool IsLocalNode() const;
     bool IsRemoteNode() const;
     /// The node is the local one, or known to the node database.
-    bool HasPrivilege() const;
+    [[nodiscard]] bool HasPrivilege() const;
     /// Checks, decides and runs. Codes: 401 bad parameters, 507 unknown node, 518 and 519 for the
     /// named credential, otherwise the sender's or the remote's own.
-    bool Run();
-    bool RemoteRun();
-    bool RunNodeSender();
-    bool RunCredNodeSender(const std::string &credId);
+    [[nodiscard]] bool Run();
+    [[nodiscard]] bool RemoteRun();
+    [[nodiscard]] bool RunNodeSender();
+    [[nodiscard]] bool RunCredNodeSender(const std::string &credId);
 
     /// The remote's data after a successful remote run; null before.
     const Json::Value &GetResult() const { return result; }
@@ -50,6 +52,9 @@ public:
 protected:
     Json::Value result;
     std::string nodeId;
+
+private:
+    [[nodiscard]] bool runOver(BaseSender &sender);
 };
 
 } // namespace OvraDRNode

@@ -23,20 +23,39 @@ class CredRequest;
 namespace OvraDRNode {
 
 /// Carries a web-API request to a node. A failure is recorded in the sender (GetErrCode(),
-/// GetErrMsg()); nothing throws. A sender serves one thread at a time.
+/// GetErrMsg()) or is what the remote answered; errorOf() tells which. Nothing throws. A sender
+/// serves one thread at a time.
 class OVRADRNODE_EXPORT BaseSender : public OvraDRCore::ErrRecorder {
 public:
     ~BaseSender() override;
     virtual bool isValid() const = 0;
-    virtual OvraDRCore::Response process(const OvraDRCore::Request &request) = 0;
+    [[nodiscard]] virtual OvraDRCore::Response process(const OvraDRCore::Request &request) = 0;
 
     /// Runs `request` on the local appliance with the administrator's rights.
-    static OvraDRCore::Response run(const OvraDRCore::Request &request);
+    [[nodiscard]] static OvraDRCore::Response run(const OvraDRCore::Request &request);
     /// Probes the endpoint now (at most 10 seconds) and records the verdict for all processes.
-    static bool IsConnectable(const Conn &conn);
+    [[nodiscard]] static bool IsConnectable(const Conn &conn);
     /// The recorded verdict; probes only when that is older than 5 seconds.
     static bool GetCachedConnectable(const Conn &conn);
 };
+
+/// Why a call failed. A call fails in one of two places: a remote that refuses says so in its
+/// answer, and where no valid answer came the sender has recorded why. This looks in both.
+///
+///     NodeSender sender(nodeId);
+///     const OvraDRCore::Response answer = sender.process(request);
+///     if (!answer.isSuccess()) {
+///         report(errorOf(sender, answer).GetErr());
+///     }
+///
+/// \param sender  as process() left it
+/// \param answer  what process() returned
+/// \return the remote's code and message when `answer` is a valid refusal, also where the sender
+/// has
+///         a code of its own for it; otherwise those of the sender; 407 when neither has one. The
+///         code is 0 only for an answer that is a success.
+[[nodiscard]] OVRADRNODE_EXPORT OvraDRCore::ErrRecorder
+errorOf(const OvraDRCore::ErrRecorder &sender, const OvraDRCore::Response &answer);
 
 /// Sends to one endpoint under one credential.
 class OVRADRNODE_EXPORT BaseCredSender : public BaseSender {
@@ -45,8 +64,8 @@ public:
     bool isValid() const override;
     /// Logs in on first use, asks for the endpoint's verdict, sends. Nothing is sent to an endpoint
     /// that is held unreachable (500).
-    OvraDRCore::Response process(const OvraDRCore::Request &request) override;
-    virtual bool initCred() = 0;
+    [[nodiscard]] OvraDRCore::Response process(const OvraDRCore::Request &request) override;
+    [[nodiscard]] virtual bool initCred() = 0;
     virtual void doClear() = 0;
     virtual bool isCredValid() const = 0;
 
@@ -57,12 +76,12 @@ public:
 
     /// Takes the endpoint, translated when it is a relay endpoint; an invalid one is refused and
     /// the old one stays.
-    bool setConn(const Conn &value);
+    [[nodiscard]] bool setConn(const Conn &value);
     const Conn &getConn() const { return conn; }
     /// Puts the endpoint into the credential.
-    bool initConn() const;
+    [[nodiscard]] bool initConn() const;
     /// Makes the credential usable: allocated, filled, and logged in where that applies.
-    bool init();
+    [[nodiscard]] bool init();
     /// Back to the state before init().
     void clear();
     /// Records the error of the credential library; a connection failure marks the endpoint as
@@ -76,15 +95,18 @@ protected:
     bool inited = false;
 
 private:
+    class CallTexts;
+
     void freeHandles();
-    OvraDRCore::Response send(const OvraDRCore::Request &request, const char *function) const;
+    [[nodiscard]] OvraDRCore::Response send(const OvraDRCore::Request &request, CallTexts &texts,
+                                            const char *function) const;
 };
 
 /// Logs in with account, password and one-time code before the first request, and out at the end.
 class OVRADRNODE_EXPORT CredAccountSender : public BaseCredSender {
 public:
     ~CredAccountSender() override;
-    bool initCred() override;
+    [[nodiscard]] bool initCred() override;
     void doClear() override;
     bool isCredValid() const override;
 
@@ -95,9 +117,9 @@ public:
                       const std::string &otp);
 
     /// False, changing nothing, when account or password is empty; `otp` may be.
-    bool setCred(const std::string &newAccount, const std::string &newPasswd,
-                 const std::string &newOtp);
-    bool login();
+    [[nodiscard]] bool setCred(const std::string &newAccount, const std::string &newPasswd,
+                               const std::string &newOtp);
+    [[nodiscard]] bool login();
     void logout();
 
 private:
@@ -111,7 +133,7 @@ private:
 class OVRADRNODE_EXPORT CredSessionSender : public BaseCredSender {
 public:
     ~CredSessionSender() override;
-    bool initCred() override;
+    [[nodiscard]] bool initCred() override;
     void doClear() override;
     bool isCredValid() const override;
 
@@ -119,7 +141,7 @@ public:
     CredSessionSender(const Conn &conn, const std::string &session);
 
     /// False when empty.
-    bool setCred(const std::string &newSession);
+    [[nodiscard]] bool setCred(const std::string &newSession);
 
 private:
     std::string session;
@@ -131,30 +153,31 @@ class OVRADRNODE_EXPORT NodeSender : public BaseSender {
 public:
     ~NodeSender() override;
     bool isValid() const override;
-    OvraDRCore::Response process(const OvraDRCore::Request &request) override;
+    [[nodiscard]] OvraDRCore::Response process(const OvraDRCore::Request &request) override;
 
     explicit NodeSender(const std::string &nodeId);
 
     /// False when empty.
-    bool setNode(const std::string &id);
-    bool setNode(const DRNode &node);
+    [[nodiscard]] bool setNode(const std::string &id);
+    [[nodiscard]] bool setNode(const DRNode &node);
     /// Builds the request, sends it to `nodeId` and copies the answer's data into `out`.
     /// \return whether an answer came; an error answer gives the empty object.
-    static bool process(const std::string &nodeId, const std::string &api,
-                        const std::string &method, int version, const Json::Value &params,
-                        Json::Value &out);
+    [[nodiscard]] static bool process(const std::string &nodeId, const std::string &api,
+                                      const std::string &method, int version,
+                                      const Json::Value &params, Json::Value &out);
     /// One attempt over one credential; true when the answer got through: it is valid, and not the
     /// remote's refusal for lack of permission.
-    bool processByCred(const DRNode &node, const OvraDRCore::Request &request,
-                       OvraDRCore::Response &response);
-    bool processByCredId(const std::string &credId, const OvraDRCore::Request &request,
-                         OvraDRCore::Response &response);
+    [[nodiscard]] bool processByCred(const DRNode &node, const OvraDRCore::Request &request,
+                                     OvraDRCore::Response &response);
+    [[nodiscard]] bool processByCredId(const std::string &credId,
+                                       const OvraDRCore::Request &request,
+                                       OvraDRCore::Response &response);
     /// The first node credential that has the right; "" when none has.
     std::string getValidCredId() const;
     /// The credential that worked last; looked for anew after 5 seconds.
     std::string getCachedCredId() const;
     /// Whether the node answers over any of its node credentials, probed now.
-    bool isConnectable() const;
+    [[nodiscard]] bool isConnectable() const;
 
 private:
     std::string nodeId;
@@ -165,22 +188,22 @@ class OVRADRNODE_EXPORT CredNodeSender : public BaseSender {
 public:
     ~CredNodeSender() override;
     bool isValid() const override;
-    OvraDRCore::Response process(const OvraDRCore::Request &request) override;
+    [[nodiscard]] OvraDRCore::Response process(const OvraDRCore::Request &request) override;
 
     explicit CredNodeSender(const DRNode &node);
     explicit CredNodeSender(const std::string &credId);
 
-    bool setCred(const DRNode &value);
-    bool setCred(const std::string &credId);
+    [[nodiscard]] bool setCred(const DRNode &value);
+    [[nodiscard]] bool setCred(const std::string &credId);
     const DRNode &getNode() const { return node; }
     /// Whether the credential has the right on its node; asks the node when the verdict is older
     /// than 3 seconds.
-    bool testPrivilege();
+    [[nodiscard]] bool testPrivilege();
 
     using BaseSender::GetCachedConnectable;
     using BaseSender::IsConnectable;
     /// As for the record's endpoint; the local node is always connectable.
-    static bool IsConnectable(const DRNode &node);
+    [[nodiscard]] static bool IsConnectable(const DRNode &node);
     static bool GetCachedConnectable(const DRNode &node);
 
 private:

@@ -24,9 +24,9 @@ std::string text(const Conn &conn) {
     return OvraDRCore::toString(conn.toJson());
 }
 
-/// How many node credentials hold the session; temporary ones never keep a session alive. -1 when
-/// that cannot be told.
-int GetSessionUsedCount(const std::string &session) {
+} // namespace
+
+int GetSessionUsedCount(const std::string &session, const std::string &exceptCredId) {
     if (session.empty()) {
         OVRA_ERR("invalid session");
         return -1;
@@ -43,12 +43,12 @@ int GetSessionUsedCount(const std::string &session) {
     int count = 0;
     for (const SqliteValueList &row : rows) {
         std::string credId;
-        count += row.GetValue(Word::kCredId, credId) ? 1 : 0;
+        const bool counts =
+            row.GetValue(Word::kCredId, credId) && (exceptCredId.empty() || credId != exceptCredId);
+        count += counts ? 1 : 0;
     }
     return count;
 }
-
-} // namespace
 
 bool TestSessionValid(const Conn &conn, const std::string &session) {
     if (!conn.isValid() || session.empty()) {

@@ -15,6 +15,7 @@ namespace OvraDRNode {
 
 namespace ERR = OvraDRCore::ERR;
 using OvraDRCore::InsertCommand;
+using OvraDRCore::LogLevel;
 using OvraDRCore::Request;
 using OvraDRCore::Response;
 using OvraDRCore::SqliteTableHandler;
@@ -303,13 +304,36 @@ bool CredCreate::process() {
         OVRA_ERR("Failed to get info of node [%s]", node.conn.addr.c_str());
         return false;
     }
+    return createFor(__func__);
+}
+
+bool CredCreate::isLocalNode() const {
+    return DRNode::isLocalNodeId(node.nodeId);
+}
+
+bool CredCreate::processKnownNode() {
+    if (!checkParameter()) {
+        return false;
+    }
+    if (node.nodeId.empty() || node.credId.empty()) {
+        SetErr(ERR::kNodeInfoFailed);
+        OVRA_ERR("No node was met at [%s]", node.conn.addr.c_str());
+        return false;
+    }
+    return createFor(__func__);
+}
+
+/// The creation once it is known whose node it is for.
+/// \param function  whose log lines these are
+bool CredCreate::createFor(const char *function) {
     if (!requestRemoteSession()) {
         SetErr(ERR::kCredIncomplete);
-        OVRA_ERR("Failed to request session of remote node [%s]", node.conn.addr.c_str());
+        OVRA_LOG_IN(LogLevel::kErr, function, "Failed to request session of remote node [%s]",
+                    node.conn.addr.c_str());
         return false;
     }
     if (!insertCredNodeRecord()) {
-        OVRA_ERR("Failed to insert crednode to db");
+        OVRA_LOG_IN(LogLevel::kErr, function, "Failed to insert crednode to db");
         return false;
     }
     NodeCache(node.nodeId, true).Update();

@@ -11,16 +11,44 @@
 
 namespace OvraDRNode {
 
+using OvraDRCore::LogLevel;
+
+namespace {
+
+bool deleteRow(const std::string &credId, const OvraDRCore::SqliteTableHandler &table) {
+    const OvraDRCore::SqliteEqual condition(Word::kCredId, credId);
+    if (!NodeDBHandler::GetHandler().DeleteRecord(condition.text, table)) {
+        OVRA_LOG_IN(LogLevel::kErr, "DeleteRecord", "Failed to delete node with credId[%s] from db",
+                    credId.c_str());
+        return false;
+    }
+    return true;
+}
+
+/// What the deletion of every kind of credential does; its lines are those of process().
+/// \param record  the credential, as far as there is one
+template <typename Flow>
+bool deleteAndRelease(const Flow &flow, const std::string &credId, const DRNode &record) {
+    constexpr const char *kFunction = "process";
+    if (!flow.DeleteRecord()) {
+        OVRA_LOG_IN(LogLevel::kErr, kFunction, "Failed to delete record of cred[%s]",
+                    credId.c_str());
+        return false;
+    }
+    if (!CredUtils::NotifyRemoteNodeDeleteSessionIfNotUsed(record.conn, record.session)) {
+        OVRA_LOG_IN(LogLevel::kWarn, kFunction, "Failed to notify remote [%s] to delete session",
+                    OvraDRCore::toString(record.conn.toJson()).c_str());
+    }
+    return true;
+}
+
+} // namespace
+
 DRNodeCredDelete::DRNodeCredDelete(const std::string &credId_)
     : credId(credId_) {}
 
 bool DRNodeCredDelete::DeleteRecord() const {
-    const OvraDRCore::SqliteEqual condition(Word::kCredId, credId);
-    if (!NodeDBHandler::GetHandler().DeleteRecord(condition.text, NodeCredSqliteTable())) {
-        OVRA_ERR("Failed to delete node with credId[%s] from db", credId.c_str());
-        return false;
-    }
-    return true;
+    return deleteRow(credId, NodeCredSqliteTable());
 }
 
 bool DRNodeCredDelete::process() {
@@ -33,19 +61,40 @@ bool DRNodeCredDelete::process() {
         OVRA_WARN("Failed to get cred[%s] from db", credId.c_str());
         record = DRNode(); // nothing of a row that is not a valid one
     }
-    if (!DeleteRecord()) {
-        OVRA_ERR("Failed to delete record of cred[%s]", credId.c_str());
+    if (!deleteAndRelease(*this, credId, record)) {
         return false;
-    }
-    if (!CredUtils::NotifyRemoteNodeDeleteSessionIfNotUsed(record.conn, record.session)) {
-        OVRA_WARN("Failed to notify remote [%s] to delete session",
-                  OvraDRCore::toString(record.conn.toJson()).c_str());
     }
     NodeCache cache(record.nodeId, false);
     if (DRNodeDB::IsNodeIdExist(record.nodeId) > 0) {
         cache.Update();
     } else {
         cache.Remove();
+    }
+    return true;
+}
+
+TempCredDelete::TempCredDelete(const std::string &credId_)
+    : credId(credId_) {}
+
+bool TempCredDelete::DeleteRecord() const {
+    return deleteRow(credId, TempCredSqliteTable());
+}
+
+bool TempCredDelete::process() {
+    if (credId.empty()) {
+        OVRA_ERR("Invalid credId to delete");
+        return false;
+    }
+    DRNode record;
+    if (!DRNodeDB::GetTempCred(credId, record)) {
+        OVRA_WARN("Failed to get cred[%s] from db", credId.c_str());
+    }
+    if (!deleteAndRelease(*this, credId, record)) {
+        return false;
+    }
+    // The other credentials reach the node as before, so what it said last stands.
+    if (DRNodeDB::IsNodeIdExist(record.nodeId) <= 0) {
+        NodeCache(record.nodeId, false).Remove();
     }
     return true;
 }

@@ -29,7 +29,7 @@ std::string text(const Conn &conn) {
 } // namespace
 
 DRNodeCredSet::DRNodeCredSet(const std::string &credId) {
-    setCredId(credId);
+    (void)setCredId(credId); // its error is kept, and check() refuses an empty record
 }
 
 DRNodeCredSet::~DRNodeCredSet() = default;
@@ -202,7 +202,8 @@ bool DRNodeCredSet::process() {
         if (IsSessionChanged()) {
             OVRA_ERR("Failed to set credId[%s], notify remote to delete new session",
                      record.credId.c_str());
-            CredUtils::NotifyRemoteNodeDeleteSessionIfNotUsed(conn, newSession);
+            // The change has failed in any case; what became of the session is in the log.
+            (void)CredUtils::NotifyRemoteNodeDeleteSessionIfNotUsed(conn, newSession);
         }
         return false;
     }

@@ -49,11 +49,8 @@ void listNodes(const std::string &nodeId, std::vector<DRNode> &nodes, DRNodeDB::
     }
 }
 
-bool GetCred(const SqliteTableHandler &table, const std::string &credId, DRNode &node) {
-    if (credId.empty()) {
-        OVRA_ERR("Invalid credId [%s]", credId.c_str());
-        return false;
-    }
+/// Reads one row, be the record valid or not.
+bool readCred(const SqliteTableHandler &table, const std::string &credId, DRNode &node) {
     SelectCommand command;
     command.SelectAll();
     command.SetTable(table);
@@ -62,7 +59,7 @@ bool GetCred(const SqliteTableHandler &table, const std::string &credId, DRNode 
     if (!NodeDBHandler::GetHandler().SelectRecord(command, row)) {
         return false;
     }
-    return node.FromSqliteValues(row) && node.isValid();
+    return node.FromSqliteValues(row);
 }
 
 int GetNodeRecordNum(const std::string &nodeId, const SqliteTableHandler &table) {
@@ -130,8 +127,16 @@ bool DRNodeDB::GetCred(const std::string &credId, DRNode &node) {
         node = DRNode::getLocalNode();
         return true;
     }
-    return OvraDRNode::GetCred(NodeCredSqliteTable(), credId, node) ||
-           OvraDRNode::GetCred(TempCredSqliteTable(), credId, node);
+    return (readCred(NodeCredSqliteTable(), credId, node) && node.isValid()) ||
+           (readCred(TempCredSqliteTable(), credId, node) && node.isValid());
+}
+
+bool DRNodeDB::GetTempCred(const std::string &credId, DRNode &node) {
+    if (credId.empty()) {
+        OVRA_ERR("Invalid credId [%s]", credId.c_str());
+        return false;
+    }
+    return readCred(TempCredSqliteTable(), credId, node);
 }
 
 int DRNodeDB::IsNodeIdExist(const std::string &nodeId) {

@@ -115,8 +115,9 @@ bool DRNodeDB::ListAttr(const std::string &nodeId, const std::string &app,
     }
     for (const SqliteValueList &row : rows) {
         DRNodeAttr found(nodeId, app, "", "");
-        row.GetValue(Word::kAttr, found.attr);
-        row.GetValue(Word::kValue, found.value);
+        // A column that holds no text stays empty.
+        (void)row.GetValue(Word::kAttr, found.attr);
+        (void)row.GetValue(Word::kValue, found.value);
         attrs.push_back(found);
     }
     return true;

@@ -61,8 +61,9 @@ bool NodeOperationDispatcher::RemoteRun() {
     return credId.empty() ? RunNodeSender() : RunCredNodeSender(credId);
 }
 
-bool NodeOperationDispatcher::RunNodeSender() {
-    NodeSender sender(nodeId);
+/// The sender's code goes before the remote's: who runs an operation compares it with the codes of
+/// this library.
+bool NodeOperationDispatcher::runOver(BaseSender &sender) {
     const Response response = sender.process(GetRequest());
     if (response.isSuccess()) {
         result = response.getData();
@@ -76,6 +77,11 @@ bool NodeOperationDispatcher::RunNodeSender() {
     return false;
 }
 
+bool NodeOperationDispatcher::RunNodeSender() {
+    NodeSender sender(nodeId);
+    return runOver(sender);
+}
+
 bool NodeOperationDispatcher::RunCredNodeSender(const std::string &credId) {
     DRNode node;
     if (!DRNodeDB::GetCred(credId, node)) {
@@ -87,17 +93,7 @@ bool NodeOperationDispatcher::RunCredNodeSender(const std::string &credId) {
         return false;
     }
     CredNodeSender sender(node);
-    const Response response = sender.process(GetRequest());
-    if (sender.GetErrCode() != ERR::kNone) {
-        SetErr(&sender);
-        return false;
-    }
-    if (!response.isSuccess()) {
-        SetErr(response.getErrCode(), response.getErrMsg());
-        return false;
-    }
-    result = response.getData();
-    return true;
+    return runOver(sender);
 }
 
 } // namespace OvraDRNode

@@ -66,11 +66,7 @@ bool readField(json_object *record, int field, std::string &value) {
 
 std::string nodeIdOf(json_object *record) {
     std::string extra;
-    Json::Value parsed;
-    if (!readField(record, OVRA_CGI_FIELD_EXTRA, extra) || !OvraDRCore::fromString(parsed, extra)) {
-        return {};
-    }
-    return OvraDRCore::memberString(parsed, Word::kNodeId);
+    return readField(record, OVRA_CGI_FIELD_EXTRA, extra) ? NodeSession::NodeIdOf(extra) : "";
 }
 
 /// Removes every session of ours, whoever's it is.
@@ -172,8 +168,7 @@ void SetRemoteIP() {
 std::string hiddenUi() {
     Json::Value ui;
     const char *const ours = OvraCgiLoginUIJsonConfigTemplate();
-    OvraDRCore::fromString(ui, ours != nullptr ? ours : "");
-    if (!ui.isObject()) {
+    if (!OvraDRCore::fromString(ui, ours != nullptr ? ours : "") || !ui.isObject()) {
         ui = Json::Value(Json::objectValue);
     }
     ui["hide"] = true;
@@ -239,6 +234,12 @@ bool CgiLogout(const std::string &sessionId) {
 } // namespace
 
 NodeSession::~NodeSession() = default;
+
+std::string NodeSession::NodeIdOf(const std::string &extra) {
+    Json::Value parsed;
+    return OvraDRCore::fromString(parsed, extra) ? OvraDRCore::memberString(parsed, Word::kNodeId)
+                                                 : "";
+}
 
 std::string NodeSession::CreateNodeSession(const std::string &nodeId, const std::string &userName) {
     SetErr(ERR::kFailed);

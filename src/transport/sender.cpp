@@ -9,6 +9,7 @@
 #include <ovrawebapi/api_runner.h>
 
 #include <ctime>
+#include <utility>
 
 namespace OvraDRNode {
 
@@ -21,7 +22,19 @@ Response BaseSender::run(const Request &request) {
     Json::Value reply;
     OVRA::APIRunner().Exec(reply, request.getAPI().c_str(), request.getVersion(),
                            request.getMethod().c_str(), request.getParams(), Word::kLocalUser);
-    return Response(reply);
+    Response response;
+    response.setResp(std::move(reply));
+    return response;
+}
+
+OvraDRCore::ErrRecorder errorOf(const OvraDRCore::ErrRecorder &sender, const Response &answer) {
+    OvraDRCore::ErrRecorder error;
+    if (!answer.isValid() && sender.GetErrCode() != OvraDRCore::ERR::kNone) {
+        error.SetErr(&sender);
+    } else {
+        error.SetErr(answer.getErrCode(), answer.getErrMsg()); // 407 for one that is not valid
+    }
+    return error;
 }
 
 bool BaseSender::IsConnectable(const Conn &conn) {

@@ -40,21 +40,6 @@ std::string text(const Conn &conn) {
     return OvraDRCore::toString(conn.toJson());
 }
 
-std::string text(const Request &request) {
-    return OvraDRCore::toLogString(request.toJson());
-}
-
-bool CreateOvraWebAPIRequest(OVRA::CredRequest &credRequest, OVRACred *cred, OVRACredSess *sess,
-                             const Request &request) {
-    if (OVRA::CredRequest::CreateWebAPIRequest(credRequest, cred, sess, request.getAPI(),
-                                               request.getVersion(), request.getMethod(),
-                                               request.getParams()) == 0) {
-        OVRA_DEBUG("Failed to create cred request for request[%s]", text(request).c_str());
-        return false;
-    }
-    return true;
-}
-
 int loginError(int remoteCode) {
     const bool listed = remoteCode >= kFirstLoginCode && remoteCode <= kLastLoginCode;
     return listed ? ERR::kLoginFailed + (remoteCode - kFirstLoginCode) : ERR::kLoginFailed;
@@ -65,7 +50,7 @@ int loginError(int remoteCode) {
 BaseCredSender::BaseCredSender() = default;
 
 BaseCredSender::BaseCredSender(const Conn &conn_) {
-    setConn(conn_);
+    (void)setConn(conn_); // isValid() tells
 }
 
 BaseCredSender::~BaseCredSender() {
@@ -169,14 +154,46 @@ void BaseCredSender::SetCredRequestError(OVRA::CredRequest &request) const {
     }
 }
 
+/// What the log lines of one call show, rendered once, at the first line that needs it.
+class BaseCredSender::CallTexts {
+public:
+    CallTexts(const Request &request, const Conn &conn)
+        : request_(request)
+        , conn_(conn) {}
+
+    const char *request() {
+        if (requestText_.empty()) {
+            requestText_ = OvraDRCore::toLogString(request_.toJson());
+        }
+        return requestText_.c_str();
+    }
+    const char *conn() {
+        if (connText_.empty()) {
+            connText_ = text(conn_);
+        }
+        return connText_.c_str();
+    }
+
+private:
+    const Request &request_;
+    const Conn &conn_;
+    std::string requestText_;
+    std::string connText_;
+};
+
 /// The sending itself, once nothing speaks against it; its lines are those of process().
-Response BaseCredSender::send(const Request &request, const char *function) const {
+Response BaseCredSender::send(const Request &request, CallTexts &texts,
+                              const char *function) const {
     Response response;
     OVRA::CredRequest credRequest;
-    if (!CreateOvraWebAPIRequest(credRequest, cred, credSess, request)) {
+    if (OVRA::CredRequest::CreateWebAPIRequest(credRequest, cred, credSess, request.getAPI(),
+                                               request.getVersion(), request.getMethod(),
+                                               request.getParams()) == 0) {
+        OVRA_LOG_IN(LogLevel::kDebug, "CreateOvraWebAPIRequest",
+                    "Failed to create cred request for request[%s]", texts.request());
         SetCredRequestError(credRequest);
         OVRA_LOG_IN(LogLevel::kNotice, function, "Failed to create cred request [%s]",
-                    text(request).c_str());
+                    texts.request());
         return response;
     }
     credRequest.SetResponseTimeout(request.getResponseTimeout());
@@ -186,10 +203,11 @@ Response BaseCredSender::send(const Request &request, const char *function) cons
     if (!request.getUploadPath().empty() && !request.getUploadName().empty()) {
         credRequest.SetUploadFile(request.getUploadPath(), request.getUploadName());
     }
+    const OvraDRCore::ReplyHandOver replyHandOver; // the credential library has read the reply
     if (credRequest.Process(true, kSend) == 0) {
         SetCredRequestError(credRequest);
         OVRA_LOG_IN(LogLevel::kNotice, function, "Failed to process cred request [%s]",
-                    text(request).c_str());
+                    texts.request());
         return response;
     }
     response.setResp(credRequest.GetResponse());
@@ -203,25 +221,25 @@ Response BaseCredSender::send(const Request &request, const char *function) cons
 Response BaseCredSender::process(const Request &request) {
     SetErr(ERR::kNone);
     Response response;
+    CallTexts texts(request, conn);
     if (!request.isValid()) {
         SetErr(ERR::kBadParameter, OvraDRCore::maskSecrets(request.toJson()));
         OVRA_ERR("Invalid api");
     } else if (!isValid()) {
         SetErr(ERR::kBadParameter);
-        OVRA_ERR("invalid conn [%s] or cred", text(conn).c_str());
+        OVRA_ERR("invalid conn [%s] or cred", texts.conn());
     } else if (!inited && !init()) {
-        OVRA_ERR("Failed to init cred for conn [%s]", text(conn).c_str());
+        OVRA_ERR("Failed to init cred for conn [%s]", texts.conn());
     } else if (!GetCachedConnectable(conn)) {
         SetErr(ERR::kNotConnectable, conn.toJson());
-        OVRA_NOTICE("Failed to send req [%s] since cache [%s] not connectable",
-                    text(request).c_str(), text(conn).c_str());
+        OVRA_NOTICE("Failed to send req [%s] since cache [%s] not connectable", texts.request(),
+                    texts.conn());
     } else {
-        response = send(request, __func__);
+        response = send(request, texts, __func__);
     }
     if (GetErrCode() != ERR::kNone) {
-        OVRA_DEBUG("Failed to process request[%s] to conn [%s] since error [%s]",
-                   text(request).c_str(), text(conn).c_str(),
-                   OvraDRCore::toLogString(GetErr()).c_str());
+        OVRA_DEBUG("Failed to process request[%s] to conn [%s] since error [%s]", texts.request(),
+                   texts.conn(), OvraDRCore::toLogString(GetErr()).c_str());
     }
     return response;
 }

@@ -41,7 +41,7 @@ bool isLocal(const DRNode &node) {
 } // namespace
 
 NodeSender::NodeSender(const std::string &nodeId_) {
-    setNode(nodeId_);
+    (void)setNode(nodeId_); // isValid() tells
 }
 
 NodeSender::~NodeSender() = default;
@@ -173,11 +173,11 @@ bool NodeSender::isConnectable() const {
 }
 
 CredNodeSender::CredNodeSender(const DRNode &node_) {
-    setCred(node_);
+    (void)setCred(node_); // isValid() tells, and the code says why
 }
 
 CredNodeSender::CredNodeSender(const std::string &credId) {
-    setCred(credId);
+    (void)setCred(credId); // isValid() tells, and the code says why
 }
 
 CredNodeSender::~CredNodeSender() = default;

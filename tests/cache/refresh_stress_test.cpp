@@ -56,10 +56,12 @@ const std::array<std::function<void(const std::string &node, const Conn &conn)>,
     [](const std::string &node, const Conn &) {
         CredPermissionCache("live-" + node).HasPrivilege();
     },
-    [](const std::string &node, const Conn &) { CredNodeSender("slow-" + node).testPrivilege(); },
+    [](const std::string &node, const Conn &) {
+        (void)CredNodeSender("slow-" + node).testPrivilege(); // either way it refreshes
+    },
     [](const std::string &, const Conn &conn) { BaseSender::GetCachedConnectable(conn); },
     [](const std::string &node, const Conn &) {
-        NodeSender(node).process(WebAPI::getDRNodeInfoAPI({}));
+        (void)NodeSender(node).process(WebAPI::getDRNodeInfoAPI({})); // either way it refreshes
     },
 };
 

@@ -5,6 +5,8 @@
 
 #include <gtest/gtest.h>
 
+#include <thread>
+
 using namespace OvraDRCore;
 
 namespace {
@@ -93,4 +95,38 @@ TEST(Response, AnythingElseIsInvalidWithANonZeroCode) {
         EXPECT_EQ(response.getErrCode(), 407) << reply.substr(0, 60);
         EXPECT_FALSE(response.hasDataField("old")) << reply.substr(0, 60);
     }
+}
+
+TEST(Response, AReplyThatWasReadAlreadyIsHandedOverToWhoeverHasItsTextAndWaits) {
+    const std::string text = R"({"success":true,"data":{"a":1}})";
+    // Not what the text says, so that it shows where a reply came from.
+    const auto give = [&text] { ReplyHandOver::give(text, Response(json(R"({"success":true})"))); };
+    const auto wasHandedOver = [&text] {
+        Response response;
+        response.setResp(text);
+        return response.isSuccess() && !response.hasDataField("a");
+    };
+    give();
+    EXPECT_FALSE(wasHandedOver()) << "nobody waited";
+    {
+        const ReplyHandOver outer;
+        EXPECT_FALSE(wasHandedOver()) << "nothing was given";
+        give();
+        {
+            const ReplyHandOver inner;
+            EXPECT_FALSE(wasHandedOver()) << "given to another";
+        }
+        std::thread([&] {
+            give();
+            EXPECT_FALSE(wasHandedOver()) << "on another thread";
+        }).join();
+        Response other;
+        other.setResp(text + " ");
+        EXPECT_TRUE(other.hasDataField("a")) << "another text";
+        EXPECT_TRUE(wasHandedOver());
+        EXPECT_FALSE(wasHandedOver()) << "once";
+        give();
+    }
+    const ReplyHandOver next;
+    EXPECT_FALSE(wasHandedOver()) << "given before it waited";
 }

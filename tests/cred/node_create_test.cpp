@@ -102,6 +102,31 @@ TEST_F(CredFlow, CreationFailsAtEachStepWithItsCodeAndWritesNothing) {
               4);
 }
 
+TEST_F(CredFlow, ANodeThatWasMetIsNotAskedAgainWhoItIs) {
+    DRNodeCredCreate create;
+    ASSERT_TRUE(create.setCred(conn, "joe", "pw", ""));
+    EXPECT_FALSE(create.processKnownNode()) << "no node was met";
+    EXPECT_EQ(create.GetErrCode(), 519);
+    EXPECT_EQ(sent("login-sid create"), 0);
+    ASSERT_TRUE(create.getRemoteNodeInfo());
+    EXPECT_FALSE(create.isLocalNode());
+    EXPECT_TRUE(create.processKnownNode()) << OvraDRCore::toString(create.GetErr());
+    EXPECT_EQ(rows("node_cred"), granted("granted"));
+    EXPECT_EQ(sent("login-sid info"), 1);
+    EXPECT_EQ(NodeCache("n1", false).GetCachedData()["hostname"].asString(), "b");
+
+    remote.answer("info", R"({"success":true,"data":{"serial":"S1","node_id":")" +
+                              DRNode::getLocalNodeId() + R"("}})");
+    ASSERT_TRUE(create.getRemoteNodeInfo());
+    EXPECT_TRUE(create.isLocalNode());
+    remote.answer("create", R"({"success":false,"error":{"code":105}})");
+    EXPECT_FALSE(create.processKnownNode());
+    EXPECT_EQ(create.GetErrCode(), 509);
+    EXPECT_EQ(log.count("ERR", "node_create", "processKnownNode",
+                        "Failed to request session of remote node [127.0.0.1]"),
+              1);
+}
+
 TEST_F(CredFlow, ARowThatCannotBeWrittenLeavesTheGrantedSessionOnTheRemote) {
     DRNodeCredCreate create;
     ASSERT_TRUE(create.setCred(conn, "joe", "pw", ""));

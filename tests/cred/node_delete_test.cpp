@@ -75,6 +75,34 @@ TEST_F(CredDeletion, TheNodeInformationIsRefreshedAndGoesWithTheLastCredential) 
     EXPECT_TRUE(NodeCache("n1", false).GetCachedData().isNull());
 }
 
+TEST_F(CredDeletion, ATemporaryOneGoesInTheSameWay) {
+    EXPECT_EQ(CredUtils::GetSessionUsedCount("shared"), 2);
+    EXPECT_EQ(CredUtils::GetSessionUsedCount("shared", "c1"), 1);
+    EXPECT_EQ(CredUtils::GetSessionUsedCount("own"), 1) << "temporary ones do not count";
+    NodeCache("n1", false).UpdateWithData("stored");
+    EXPECT_TRUE(TempCredDelete("t1").process());
+    EXPECT_EQ(rows("temp_cred"), "");
+    EXPECT_EQ(remote.calls(), "") << "a node credential uses the session";
+    EXPECT_EQ(NodeCache("n1", false).GetCachedData().asString(), "stored");
+
+    executeSql("DELETE FROM node_cred");
+    addCred("temp_cred", "n1", "t2", "https", remote.port(), "own");
+    addCred("temp_cred", "n1", "no session", "https", remote.port(), "");
+    EXPECT_TRUE(TempCredDelete("no session").process()) << "a record that is not valid goes too";
+    remote.answer("own delete", R"({"success":false,"error":{"code":105}})");
+    EXPECT_TRUE(TempCredDelete("t2").process());
+    EXPECT_EQ(sent("own delete"), 1);
+    EXPECT_EQ(rows("temp_cred"), "");
+    EXPECT_TRUE(NodeCache("n1", false).GetCachedData().isNull());
+
+    EXPECT_FALSE(TempCredDelete("").process());
+    executeSql("DROP TABLE temp_cred");
+    EXPECT_FALSE(TempCredDelete("t1").process());
+    executeSql("DROP TABLE node_cred");
+    EXPECT_EQ(CredUtils::GetSessionUsedCount("own"), -1);
+    EXPECT_EQ(CredUtils::GetSessionUsedCount(""), -1);
+}
+
 TEST_F(CredDeletion, AnUnknownCredentialIsNoErrorAndAnUnreadableDatabaseIs) {
     EXPECT_TRUE(remove("c9"));
     EXPECT_EQ(log.count("WARN", "node_delete", "process", "Failed to get cred[c9] from db"), 1);

@@ -37,7 +37,7 @@ protected:
     /// What the temporary session was good for while the remote had it.
     void noteSession(const std::string &call) {
         Json::Value params;
-        OvraDRCore::fromString(params, remote.params(call));
+        EXPECT_TRUE(OvraDRCore::fromString(params, remote.params(call)));
         lent = params["session"].asString();
         lentUser = NodeSession().GetUserBySession(lent);
     }
@@ -62,7 +62,7 @@ TEST_F(ReverseCreation, TheRemoteGetsAnEndpointItReachesAndASessionForTheTimeOfT
     EXPECT_EQ(lentUser, "joe");
     EXPECT_TRUE(isGone());
     Json::Value params;
-    OvraDRCore::fromString(params, remote.params("create"));
+    EXPECT_TRUE(OvraDRCore::fromString(params, remote.params("create")));
     EXPECT_EQ(params["conn"], Conn::https("192.0.2.1", 5001).toJson());
     EXPECT_EQ(params["auth"].asString() + params["cred_direction"].asString(),
               "sessionunidirection");

@@ -63,6 +63,32 @@ TEST_F(CredSender, WhatCannotBeSentIsRefusedWithoutAWordToTheRemote) {
     EXPECT_EQ(remote.calls(), "");
 }
 
+TEST_F(CredSender, WhyACallFailedIsToldByTheRemoteOrElseByTheSender) {
+    const struct {
+        const char *what;
+        Answer answer;
+        int code;
+        Json::Value message;
+    } cases[] = {
+        {"success", Answer::success(), 0, {}},
+        {"refused", Answer::json(R"({"success":false,"error":{"code":120,"msg":"m"}})"), 120, "m"},
+        {"refused, and the sender has a code for it",
+         Answer::json(R"({"success":false,"error":{"code":105,"msg":"disabled"}})"), 105,
+         "disabled"},
+        {"no reply", Answer::html(), 524, 8},
+        {"no reply, without a message", Answer::status(403), 525, {}},
+    };
+    for (const auto &each : cases) {
+        remote.answer("info", each.answer);
+        CredSessionSender sender(conn, "s1");
+        const OvraDRCore::ErrRecorder error = errorOf(sender, send(sender));
+        EXPECT_EQ(error.GetErrCode(), each.code) << each.what;
+        EXPECT_EQ(error.GetErrMsg(), each.message) << each.what;
+    }
+    // A request on this appliance has no sender, or one that recorded nothing.
+    EXPECT_EQ(errorOf(OvraDRCore::ErrRecorder(), Response()).GetErrCode(), 407);
+}
+
 TEST_F(CredSender, NothingIsSentToAnEndpointHeldUnreachable) {
     ConnCache(conn).UpdateWithData(false);
     CredSessionSender sender(conn, "s1");

@@ -215,7 +215,9 @@ TEST_F(NodeSend, ARelayedTestOfPrivilegeSaysNothingAboutTheCredentialThatCarried
     EXPECT_TRUE(permission.SetHasPrivilege());
     remote.answer("relay", kNoPermission);
     CredNodeSender cred("c1");
-    cred.process(WebAPI::getDRNodeCredRelayAPI("x", WebAPI::getDRNodeTestPrivilegeAPI()));
+    const Response refused =
+        cred.process(WebAPI::getDRNodeCredRelayAPI("x", WebAPI::getDRNodeTestPrivilegeAPI()));
+    EXPECT_EQ(refused.getErrCode(), 105);
     EXPECT_EQ(cred.GetErrCode(), 525);
     EXPECT_TRUE(permission.GetCachedHasPrivilege());
     EXPECT_EQ(log.count("NOTICE", "cred_permission_cache", "SetNoPrivilege",

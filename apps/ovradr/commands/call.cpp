@@ -104,21 +104,17 @@ Expected<Json::Value> collectParameters(const CallOptions &options) {
     return params;
 }
 
-/// Sends over the named credential, or lets the library choose one.
 struct Answer {
     Response response;
-    int errCode = ERR::kNone; ///< why there is no usable response
-    Json::Value errMsg;
+    OvraDRCore::ErrRecorder error; ///< why it is not a success
 };
 
 Answer sendOver(OvraDRNode::BaseSender &sender, const Request &request) {
-    Answer answer;
-    answer.response = sender.process(request);
-    answer.errCode = sender.GetErrCode();
-    answer.errMsg = sender.GetErrMsg();
-    return answer;
+    const Response response = sender.process(request);
+    return {response, errorOf(sender, response)};
 }
 
+/// Sends over the named credential, or lets the library choose one.
 Expected<Answer> send(const std::string &nodeId, const std::string &credId,
                       const Request &request) {
     if (credId.empty()) {
@@ -138,18 +134,14 @@ Expected<Answer> send(const std::string &nodeId, const std::string &credId,
 
 Outcome report(const Answer &answer) {
     const Response &response = answer.response;
-    if (response.isSuccess()) {
-        Report report;
-        // A granted session is as good as a password.
-        report.data = OvraDRCore::maskSecrets(response.getData());
-        report.text = prettyJson(report.data);
-        return report;
+    if (!response.isSuccess()) {
+        return failureOf(answer.error);
     }
-    if (response.isValid()) {
-        return failureOf(response.getErrCode(), response.getErrMsg());
-    }
-    return answer.errCode != ERR::kNone ? failureOf(answer.errCode, answer.errMsg)
-                                        : failureOf(ERR::kFailed);
+    Report report;
+    // A granted session is as good as a password.
+    report.data = OvraDRCore::maskSecrets(response.getData());
+    report.text = prettyJson(report.data);
+    return report;
 }
 
 /// Whether a credential of the node goes through the relay service.
@@ -183,7 +175,7 @@ Outcome call(const CallOptions &options) {
     if (!answer) {
         return answer.failure();
     }
-    if (!answer->response.isValid() && answer->errCode == ERR::kBadParameter &&
+    if (!answer->response.isValid() && answer->error.GetErrCode() == ERR::kBadParameter &&
         isRelayed(*nodeId)) {
         return failure(ExitCode::kNotReachable,
                        "The relay service does not tell where the node is reached now.",

@@ -42,7 +42,7 @@ Failure setFailure(const DRNodeCredSet &flow, const Conn &conn) {
                        "The credential is as it was. The system log says why; correct that and "
                        "try again.");
     }
-    Failure found = failureOf(flow.GetErrCode(), flow.GetErrMsg());
+    Failure found = failureOf(flow);
     if (flow.GetErrCode() == ERR::kOtherNode) {
         found.message = "This is another node than the one that the credential is for.";
         found.hint = "Check the URL, or make a new credential with `ovradr cred create`.";

@@ -47,7 +47,7 @@ Failure flowFailure(const CredCreate &flow, const Conn &conn) {
                        "The other appliance granted the credential, but it could not be stored.",
                        "The system log says why; correct that and make the credential again.");
     }
-    Failure found = failureOf(flow.GetErrCode(), flow.GetErrMsg());
+    Failure found = failureOf(flow);
     found.message = targetText(conn) + ": " + found.message;
     return found;
 }
@@ -67,7 +67,7 @@ Outcome runFlow(CredCreate &flow, const Conn &conn, const CreateOptions &options
     if (!flow.getRemoteNodeInfo()) {
         return flowFailure(flow, conn);
     }
-    if (DRNode::isLocalNodeId(flow.getNode().nodeId)) {
+    if (flow.isLocalNode()) {
         return failure(ExitCode::kUsage, targetText(conn) + " is this appliance itself.",
                        "Give the URL of another one.");
     }
@@ -75,7 +75,7 @@ Outcome runFlow(CredCreate &flow, const Conn &conn, const CreateOptions &options
         return checkOnly(flow, conn);
     }
     const OvraApps::SessionLock lock(OvraApps::SessionLock::Purpose::kObtain);
-    if (!flow.process()) {
+    if (!flow.processKnownNode()) {
         return flowFailure(flow, conn);
     }
     const DRNode &record = flow.getNode();

@@ -16,16 +16,11 @@ namespace {
 using OvraDRCore::Response;
 using OvraDRNode::CredNodeSender;
 using OvraDRNode::DRNode;
-namespace ERR = OvraDRCore::ERR;
 namespace WebAPI = OvraDRNode::WebAPI;
 
 /// Why a request got no success.
 Failure refusal(const CredNodeSender &sender, const Response &response) {
-    const bool answered = response.isValid() && sender.GetErrCode() == ERR::kNone;
-    Failure found =
-        answered ? failureOf(response.getErrCode(), response.getErrMsg())
-                 : failureOf(sender.GetErrCode() == ERR::kNone ? ERR::kFailed : sender.GetErrCode(),
-                             sender.GetErrMsg());
+    Failure found = failureOf(errorOf(sender, response));
     found.message = targetText(sender.getNode().conn) + ": " + found.message;
     return found;
 }

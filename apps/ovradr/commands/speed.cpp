@@ -8,6 +8,7 @@
 #include "target.h"
 
 #include <ovradrnode/node.h>
+#include <ovradrnode/sender.h>
 
 #include <memory>
 #include <vector>
@@ -100,14 +101,6 @@ Failure noneWorked(const std::vector<Tried> &tried) {
     return none;
 }
 
-Failure whyNot(const Response &answer, const ErrRecorder &sender) {
-    if (answer.isValid() && !answer.isSuccess()) {
-        return failureOf(answer.getErrCode(), answer.getErrMsg());
-    }
-    const int code = sender.GetErrCode();
-    return code == ERR::kNone ? failureOf(ERR::kFailed) : failureOf(code, sender.GetErrMsg());
-}
-
 Outcome reportOf(const std::string &nodeId, const std::string &speed,
                  const std::vector<Tried> &tried) {
     Report report;
@@ -156,8 +149,9 @@ Outcome measureNode(const SpeedOptions &options) {
                     return;
                 }
                 const bool worked = answer->isSuccess();
-                tried.push_back({targetText(conn), worked ? answer->getDataFieldtoStr("speed") : "",
-                                 worked ? Failure() : whyNot(*answer, sender)});
+                tried.push_back(
+                    {targetText(conn), worked ? answer->getDataFieldtoStr("speed") : "",
+                     worked ? Failure() : failureOf(OvraDRNode::errorOf(sender, *answer))});
             });
         said = progress.caught();
     }

@@ -16,8 +16,6 @@
 #include <ovradrnode/node_set.h>
 #include <ovraplatform/api_errors.h>
 
-#include <algorithm>
-#include <optional>
 #include <string>
 #include <vector>
 
@@ -83,11 +81,11 @@ Json::Value carryOut(OvraDRNode::CredCreate &flow, const Proof &proof) {
     if (!proof.giveTo(flow) || !flow.getRemoteNodeInfo()) {
         return flowError(flow, ERR::kCredIncomplete);
     }
-    if (DRNode::isLocalNodeId(flow.getNode().nodeId)) {
+    if (flow.isLocalNode()) {
         return OvraPlatform::apiBadParameter("conn", "conn is this node itself: name another one");
     }
     const OvraApps::SessionLock lock(OvraApps::SessionLock::Purpose::kObtain);
-    return flow.process() ? Json::Value() : flowError(flow, ERR::kCredIncomplete);
+    return flow.processKnownNode() ? Json::Value() : flowError(flow, ERR::kCredIncomplete);
 }
 
 Json::Value create(const Json::Value &params, const APICaller &caller) {
@@ -185,16 +183,6 @@ Json::Value list(const Json::Value &params, const APICaller & /*caller*/) {
     return apiSuccess(data);
 }
 
-/// A temporary credential, also one that lacks something.
-std::optional<DRNode> findTemporary(const std::string &credId) {
-    std::vector<DRNode> records;
-    DRNodeDB::List(records, DRNodeDB::CRED_TYPE_TEMP);
-    const auto found =
-        std::find_if(records.begin(), records.end(),
-                     [&credId](const DRNode &record) { return record.credId == credId; });
-    return found == records.end() ? std::nullopt : std::optional(*found);
-}
-
 /// A new log-in, perhaps over another endpoint, for an existing credential.
 /// \param dryRun  whether it only has to be tried
 Json::Value set(const Json::Value &params, bool dryRun) {
@@ -205,11 +193,11 @@ Json::Value set(const Json::Value &params, bool dryRun) {
     if (!in.ok()) {
         return in.error();
     }
-    if (findTemporary(credId)) {
+    DRNode record;
+    if (DRNodeDB::GetTempCred(credId, record)) {
         return OvraPlatform::apiBadParameter(
             "cred_id", "cred_id is a temporary credential: delete it and make a new one");
     }
-    DRNode record;
     if (!DRNodeDB::GetCred(credId, record)) {
         return noSuchCredential();
     }
@@ -233,13 +221,12 @@ Json::Value remove(const Json::Value &params, const APICaller & /*caller*/) {
     if (!in.ok()) {
         return in.error();
     }
-    const std::optional<DRNode> temporary = findTemporary(credId);
-    DRNode record = temporary.value_or(DRNode());
+    DRNode record;
+    const bool temporary = DRNodeDB::GetTempCred(credId, record);
     if (!temporary && !DRNodeDB::GetCred(credId, record)) {
         record.credId = credId;
     }
-    const OvraApps::ReleasingFlow result =
-        OvraApps::deleteCredential(record, temporary.has_value());
+    const OvraApps::ReleasingFlow result = OvraApps::deleteCredential(record, temporary);
     if (!result.done) {
         return apiError(ERR::kFailed, "the credential cannot be deleted: see the log of the "
                                       "appliance, and check that its disk is not full");

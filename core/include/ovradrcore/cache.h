@@ -27,7 +27,7 @@ public:
     /// The value when nothing usable is stored and none can be fetched; null here.
     virtual Json::Value GetDefaultValue() const;
     /// Fetches a fresh value into `value`; false: there is none, and what is stored must stay.
-    virtual bool GetUpdatedData(Json::Value &value) const = 0;
+    [[nodiscard]] virtual bool GetUpdatedData(Json::Value &value) const = 0;
     /// Whether a stored value is usable.
     virtual bool IsValid(const Json::Value &value) const = 0;
     /// A further reason to refresh a value that is still fresh; false here.

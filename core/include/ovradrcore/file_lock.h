@@ -26,7 +26,7 @@ public:
     /// \param operation  the bits of flock(2): LOCK_SH or LOCK_EX, with or without LOCK_NB
     /// \param wait       seconds to keep trying, on the monotonic clock; 0 tries once
     /// \return true when held.
-    bool lock(int operation, unsigned int wait);
+    [[nodiscard]] bool lock(int operation, unsigned int wait);
     void unlock() const;
 
 private:

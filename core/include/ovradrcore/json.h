@@ -22,7 +22,7 @@ OVRADRCORE_EXPORT std::string toLogString(const Json::Value &value);
 /// Parses JSON text (RFC 8259, strict: no comments, nothing after the document, no duplicate keys,
 /// at most 200 levels deep) into `value`.
 /// \return false, with `value` unchanged, when `text` is not such a document. Never throws.
-OVRADRCORE_EXPORT bool fromString(Json::Value &value, const std::string &text);
+[[nodiscard]] OVRADRCORE_EXPORT bool fromString(Json::Value &value, const std::string &text);
 
 /// Member `key` of `value` when `value` is an object that has it as a string, otherwise "".
 OVRADRCORE_EXPORT std::string memberString(const Json::Value &value, const char *key);

@@ -20,6 +20,8 @@ public:
 
     /// Takes a reply document. What was held before is gone, also when the document is refused.
     void setResp(const Json::Value &reply);
+    /// The same without a copy of its data; what is left of `reply` is not specified.
+    void setResp(Json::Value &&reply);
     /// Parses a reply text.
     void setResp(const std::string &text);
 
@@ -45,6 +47,28 @@ private:
     int errCode_ = 407;
     Json::Value errMsg_;
     Json::Value data_;
+};
+
+/// Spares the second parse of a reply that is read where it arrives, to judge it, and again where
+/// it is used, because only its text travels in between. While an object lives, give() on the same
+/// thread hands it a reply, and setResp() of exactly that text takes it instead of parsing. Objects
+/// may nest; the innermost one counts. What nobody took goes with the object.
+class OVRADRCORE_EXPORT ReplyHandOver {
+public:
+    ReplyHandOver();
+    ~ReplyHandOver();
+    ReplyHandOver(const ReplyHandOver &) = delete;
+    ReplyHandOver &operator=(const ReplyHandOver &) = delete;
+
+    /// \param reply  what `text` parses to. Where no object waits, nothing happens.
+    static void give(const std::string &text, Response &&reply);
+    /// Takes the reply that was given with this very text. \return false when there is none.
+    [[nodiscard]] static bool take(const std::string &text, Response &reply);
+
+private:
+    ReplyHandOver *outer_;
+    std::string text_;
+    Response reply_;
 };
 
 } // namespace OvraDRCore

@@ -31,17 +31,18 @@ public:
     ~SqliteDB() override;
 
     /// The first row of the result, or an empty list when there is none.
-    bool SelectRecord(const SelectCommand &command, SqliteValueList &row);
+    [[nodiscard]] bool SelectRecord(const SelectCommand &command, SqliteValueList &row);
     /// Appends one list per row, in SQLite's order.
-    bool SelectRecords(const SelectCommand &command, std::vector<SqliteValueList> &rows);
-    bool InsertRecord(const InsertCommand &command);
+    [[nodiscard]] bool SelectRecords(const SelectCommand &command,
+                                     std::vector<SqliteValueList> &rows);
+    [[nodiscard]] bool InsertRecord(const InsertCommand &command);
     /// Success does not depend on how many rows changed.
-    bool UpdateRecord(const UpdateCommand &command);
+    [[nodiscard]] bool UpdateRecord(const UpdateCommand &command);
     /// An empty condition is refused: a delete never means every row.
-    bool DeleteRecord(const std::string &condition, const SqliteTableHandler &table);
+    [[nodiscard]] bool DeleteRecord(const std::string &condition, const SqliteTableHandler &table);
 
     /// The schema version that provisioning wrote into the info table; -1 when it cannot be read.
-    int GetSchemaVersion();
+    [[nodiscard]] int GetSchemaVersion();
 
 private:
     struct Close {

@@ -23,9 +23,9 @@ public:
         : value_(number) {} // NOLINT(google-explicit-constructor)
 
     /// True, and sets `text`, when the value holds text.
-    bool GetValue(std::string &text) const;
+    [[nodiscard]] bool GetValue(std::string &text) const;
     /// True, and sets `number`, when the value holds an integer.
-    bool GetValue(int &number) const;
+    [[nodiscard]] bool GetValue(int &number) const;
     /// The value as an SQL literal; text with a NUL in it as the text of its bytes; none as NULL.
     std::string ToLiteral() const;
 
@@ -44,8 +44,8 @@ public:
     SqliteValue GetValue(const std::string &name) const;
     /// True, and sets the target, when the column is there and convertible; an integer reads as its
     /// decimal text, and decimal text that fits reads as an integer.
-    bool GetValue(const std::string &name, std::string &text) const;
-    bool GetValue(const std::string &name, int &number) const;
+    [[nodiscard]] bool GetValue(const std::string &name, std::string &text) const;
+    [[nodiscard]] bool GetValue(const std::string &name, int &number) const;
 
     bool empty() const { return columns_.empty(); }
     std::size_t size() const { return columns_.size(); }
@@ -64,7 +64,7 @@ public:
     /// The current values of those listed columns that the record knows.
     virtual SqliteValueList ToSqliteValues(const std::vector<std::string> &fields) const = 0;
     /// Loads the columns that the record knows; false when the row has none of them.
-    virtual bool FromSqliteValues(const SqliteValueList &row) = 0;
+    [[nodiscard]] virtual bool FromSqliteValues(const SqliteValueList &row) = 0;
     /// The record's column names, in its own order.
     virtual std::vector<std::string> ListSqliteField() const = 0;
 

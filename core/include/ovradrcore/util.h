@@ -11,7 +11,7 @@ namespace OvraDRCore {
 
 /// A random UUID (version 4, RFC 9562) from the kernel's generator, in lower case; "" when the
 /// kernel gives no random bytes.
-OVRADRCORE_EXPORT std::string GenerateUUID();
+[[nodiscard]] OVRADRCORE_EXPORT std::string GenerateUUID();
 
 /// The text of a value as a default string stream writes it. Only `int` is provided.
 template <typename T>
@@ -23,7 +23,7 @@ namespace File {
 
 /// Makes `path` and the folders above it that are missing, each with exactly `mode`.
 /// \return true when `path` is a directory afterwards; one that exists keeps its mode.
-OVRADRCORE_EXPORT bool CreateDir(const std::string &path, mode_t mode);
+[[nodiscard]] OVRADRCORE_EXPORT bool CreateDir(const std::string &path, mode_t mode);
 
 } // namespace File
 

@@ -59,11 +59,10 @@ CredError login(const OVRACred &cred, const std::string &otp, OVRACredSess &sess
         return reply.error;
     }
     Json::Value document;
-    OvraDRCore::fromString(document, reply.document);
-    const OvraDRCore::Response response(document);
-    const std::string sid = response.getDataFieldtoStr("sid");
-    if (response.isSuccess() &&
-        (sid.empty() || OVRACredSessItemSetAccessToken(&sess, sid.c_str()) != 0)) {
+    const std::string sid = reply.response.getDataFieldtoStr("sid");
+    const bool unusable = reply.response.isSuccess() &&
+                          (sid.empty() || OVRACredSessItemSetAccessToken(&sess, sid.c_str()) != 0);
+    if (unusable || !OvraDRCore::fromString(document, reply.document)) {
         return CredError::kReplyBroken;
     }
     out = std::move(document);
@@ -79,9 +78,7 @@ CredError logout(const OVRACred &cred, const OVRACredSess &sess, bool &confirmed
     call.sid = sess.token.get();
     const WebReply reply =
         OvraPlatform::callWebAPI(*endpoint, call, {std::chrono::steady_clock::now() + kLogoutTime});
-    OvraDRCore::Response response;
-    response.setResp(reply.document);
-    confirmed = response.isSuccess();
+    confirmed = reply.response.isSuccess();
     return reply.error;
 }
 

@@ -78,6 +78,7 @@ struct CredRequest::Impl {
         WebReply reply = OvraPlatform::callWebAPI(
             *endpoint, *call, {deadline(), reuse, encryptMode == kSealed, upload});
         response = std::move(reply.document);
+        OvraDRCore::ReplyHandOver::give(response, std::move(reply.response));
         return reply.error;
     }
 

@@ -7,7 +7,6 @@
 
 #include <ovradrcore/json.h>
 #include <ovradrcore/log.h>
-#include <ovradrcore/response.h>
 
 #include <memory>
 #include <utility>
@@ -23,11 +22,15 @@ constexpr long kHttpNotFound = 404;
 constexpr long kHttpServerError = 500;
 
 WebReply failure(CredError error) {
-    return {error, {}};
+    return {error, {}, {}};
 }
 
-bool isReplyDocument(const Json::Value &document) {
-    return OvraDRCore::Response(document).isValid();
+/// What came as a reply, read here once for everybody.
+WebReply readReply(std::string text) {
+    OvraDRCore::Response response;
+    response.setResp(text);
+    return response.isValid() ? WebReply{CredError::kNone, std::move(text), std::move(response)}
+                              : failure(CredError::kReplyBroken);
 }
 
 CredError errorOfStatus(long status) {
@@ -41,8 +44,7 @@ CredError errorOfStatus(long status) {
 HttpAnswer post(const Endpoint &endpoint, const WireCall &call, const WebCallOptions &options) {
     const auto url = endpoint.url(kEntryPoint);
     const auto fields = toFormFields(call);
-    const auto body = options.upload ? std::nullopt : encodeForm(call);
-    if (!url || !fields || (!options.upload && !body)) {
+    if (!url || !fields) {
         return {CredError::kBadArgument};
     }
     // From before the request: a key that is replaced while it runs ends the connection's life.
@@ -59,7 +61,7 @@ HttpAnswer post(const Endpoint &endpoint, const WireCall &call, const WebCallOpt
     }
     HttpAnswer answer = options.upload
                             ? connection->postFile(*url, *fields, *options.upload, options.deadline)
-                            : connection->post(*url, *body, options.deadline);
+                            : connection->post(*url, encodeForm(*fields), options.deadline);
     if (answer.error != CredError::kNone) {
         return answer;
     }
@@ -75,11 +77,7 @@ WebReply callPlain(const Endpoint &endpoint, const WireCall &call, const WebCall
     if (answer.error != CredError::kNone) {
         return failure(answer.error);
     }
-    Json::Value document;
-    if (!OvraDRCore::fromString(document, answer.body) || !isReplyDocument(document)) {
-        return failure(CredError::kReplyBroken);
-    }
-    return {CredError::kNone, std::move(answer.body)};
+    return readReply(std::move(answer.body));
 }
 
 /// Over plain http the key itself has to be the one that was met first.
@@ -100,8 +98,7 @@ CredError judgeSealKey(const Endpoint &endpoint, const PublicKey &key) {
 }
 
 /// What an appliance says without the seal, because it could not open it.
-bool isPlainRefusal(const Json::Value &reply) {
-    const OvraDRCore::Response response(reply);
+bool isPlainRefusal(const OvraDRCore::Response &response) {
     switch (response.getErrCode()) {
     case APIError::kInternal:
     case APIError::kBadRequest:
@@ -114,8 +111,7 @@ bool isPlainRefusal(const Json::Value &reply) {
 }
 
 /// The reason of a refusal 109; "" for any other reply.
-std::string sealRefusalReason(const Json::Value &reply) {
-    const OvraDRCore::Response response(reply);
+std::string sealRefusalReason(const OvraDRCore::Response &response) {
     return response.isValid() && response.getErrCode() == APIError::kSealRefused
                ? OvraDRCore::memberString(response.getErrMsg(), "reason")
                : std::string();
@@ -184,7 +180,7 @@ private:
             return failure(CredError::kReplyBroken);
         }
         return reply.isMember("sealed_reply") ? readSealed(reply, replyKey)
-                                              : readPlain(reply, body);
+                                              : readPlain(std::move(reply), body);
     }
 
     std::optional<WebReply> readSealed(const Json::Value &reply, const ReplyKey &replyKey) {
@@ -192,31 +188,32 @@ private:
         if (!text) {
             return failure(CredError::kSealFailed);
         }
-        Json::Value document;
-        if (!OvraDRCore::fromString(document, *text) || !isReplyDocument(document)) {
-            return failure(CredError::kReplyBroken);
-        }
+        WebReply opened = readReply(std::move(*text));
         // Only a time that came sealed is believed: a wrong one would let somebody who holds the
         // request back deliver it later.
-        if (!realigned_ && sealRefusalReason(document) == "stale" && realign(document)) {
+        if (!realigned_ && sealRefusalReason(opened.response) == "stale" &&
+            realign(opened.response)) {
             realigned_ = true;
             return std::nullopt;
         }
-        return WebReply{CredError::kNone, std::move(*text)};
+        return opened;
     }
 
-    std::optional<WebReply> readPlain(const Json::Value &reply, const std::string &body) {
-        if (!rekeyed_ && sealRefusalReason(reply) == "key") {
+    std::optional<WebReply> readPlain(Json::Value &&document, const std::string &body) {
+        OvraDRCore::Response response;
+        response.setResp(std::move(document));
+        if (!rekeyed_ && sealRefusalReason(response) == "key") {
             rekeyed_ = true;
             SealKeyCache::instance().drop(endpoint_.key());
             return std::nullopt;
         }
-        return isPlainRefusal(reply) ? WebReply{CredError::kNone, body}
-                                     : failure(CredError::kSealFailed);
+        return isPlainRefusal(response) ? WebReply{CredError::kNone, body, std::move(response)}
+                                        : failure(CredError::kSealFailed);
     }
 
-    bool realign(const Json::Value &document) {
-        const Json::Value &time = document["error"]["msg"]["time"];
+    /// \param refusal  one with a reason, so that its message is an object
+    bool realign(const OvraDRCore::Response &refusal) {
+        const Json::Value &time = refusal.getErrMsg()["time"];
         if (!time.isInt64()) {
             return false;
         }
@@ -246,9 +243,7 @@ FetchedKey fetchSealKey(const Endpoint &endpoint, const WebCallOptions &options)
     if (reply.error != CredError::kNone) {
         return {reply.error};
     }
-    OvraDRCore::Response response;
-    response.setResp(reply.document);
-    const auto key = parsePublicKey(response.getDataFieldtoStr("public_key"));
+    const auto key = parsePublicKey(reply.response.getDataFieldtoStr("public_key"));
     if (!key) {
         OVRA_NOTICE("[%s] has no key to seal a request to", endpoint.key().c_str());
         return {CredError::kSealFailed};

@@ -5,6 +5,8 @@
 #include "ovraplatform/sealed_box.h"
 #include "ovraplatform/wire_form.h"
 
+#include <ovradrcore/response.h>
+
 #include <optional>
 #include <string>
 
@@ -19,7 +21,8 @@ struct WebCallOptions {
 
 struct WebReply {
     CredError error = CredError::kNone;
-    std::string document; ///< a reply document when there is no error
+    std::string document;          ///< a reply document when there is no error
+    OvraDRCore::Response response; ///< what it says
 };
 
 /// Calls a web API of a remote appliance and returns its reply document, opened when it was sealed.

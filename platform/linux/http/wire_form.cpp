@@ -152,13 +152,9 @@ std::optional<Fields> toFormFields(const WireCall &call) {
     return fields;
 }
 
-std::optional<std::string> encodeForm(const WireCall &call) {
-    const std::optional<Fields> fields = toFormFields(call);
-    if (!fields) {
-        return std::nullopt;
-    }
+std::string encodeForm(const Fields &fields) {
     std::string body;
-    for (const auto &[name, value] : *fields) {
+    for (const auto &[name, value] : fields) {
         if (!body.empty()) {
             body += '&';
         }
@@ -167,6 +163,11 @@ std::optional<std::string> encodeForm(const WireCall &call) {
         appendEscaped(body, value);
     }
     return body;
+}
+
+std::optional<std::string> encodeForm(const WireCall &call) {
+    const std::optional<Fields> fields = toFormFields(call);
+    return fields ? std::optional(encodeForm(*fields)) : std::nullopt;
 }
 
 tl::expected<WireCall, std::string> decodeForm(std::string_view body) {

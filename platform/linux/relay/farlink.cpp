@@ -92,12 +92,8 @@ FarlinkReply FarlinkClient::call(const char *method, const Json::Value &params,
     wire.version = 1;
     wire.method = method;
     wire.params = params;
-    const WebReply reply = callWebAPI(*endpoint, wire, {std::chrono::steady_clock::now() + time});
-    FarlinkReply result{reply.error, {}};
-    if (reply.error == CredError::kNone) {
-        result.response.setResp(reply.document);
-    }
-    return result;
+    WebReply reply = callWebAPI(*endpoint, wire, {std::chrono::steady_clock::now() + time});
+    return {reply.error, std::move(reply.response)};
 }
 
 FarlinkReply FarlinkClient::lookUp(const std::string &alias) const {

@@ -13,6 +13,7 @@
 #include <cerrno>
 #include <cstdint>
 #include <cstring>
+#include <utility>
 
 namespace OvraPlatform {
 
@@ -135,7 +136,9 @@ std::optional<LocalCall> parseLocalRequest(const std::string &text) {
         return std::nullopt;
     }
     call.version = request["version"].asInt();
-    call.params = params;
+    if (!params.isNull()) {
+        call.params = std::move(parsed["params"]);
+    }
     return call;
 }
 

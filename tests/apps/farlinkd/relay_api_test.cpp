@@ -34,7 +34,7 @@ protected:
         const auto promise = std::make_shared<std::promise<Json::Value>>();
         api.serve({*encodeForm(call), address, true}, [promise](const std::string &document) {
             Json::Value reply;
-            OvraDRCore::fromString(reply, document);
+            EXPECT_TRUE(OvraDRCore::fromString(reply, document));
             promise->set_value(reply);
         });
         return promise->get_future();

@@ -253,6 +253,18 @@ TEST_F(Pairing, ANodeIsFoundByTheBeginningOfItsId) {
     }
 }
 
+TEST_F(Pairing, WhatTheNodeSaysAboutARefusalIsTheAdvice) {
+    OvraTest::addCred("node_cred", "remote-node", "c-1", "https", remote.port(), "s");
+    remote.answer("test_privilege", R"({"success":false,"error":{"code":105,"msg":)"
+                                    R"("the account is disabled: enable it"}})");
+    for (const Arguments &command : {Arguments{"cred", "test", "c-1"}, {"doctor", "remote-node"}}) {
+        const Result refused = run(command);
+        EXPECT_EQ(refused.exit, 8) << refused.out << refused.err;
+        EXPECT_NE(refused.err.find("the account is disabled"), std::string::npos) << refused.err;
+        EXPECT_NE(refused.err.find("Enable it."), std::string::npos) << refused.err;
+    }
+}
+
 TEST_F(Pairing, AnEndpointIsTested) {
     const Json::Value open = run({"conn", "test", url(), "--json"}).json()["data"];
     EXPECT_TRUE(open["connectable"].asBool());

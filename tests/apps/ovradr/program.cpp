@@ -58,8 +58,7 @@ std::string contentOf(int fd) {
 
 Json::Value Result::json() const {
     Json::Value document;
-    OvraDRCore::fromString(document, out);
-    return document;
+    return OvraDRCore::fromString(document, out) ? document : Json::Value();
 }
 
 Program::Program(const Arguments &arguments, const std::string &input)

@@ -139,7 +139,7 @@ Reply Appliance::http(const HttpCall &call) const {
         curl_easy_getinfo(curl.get(), CURLINFO_RESPONSE_CODE, &reply.status);
     }
     curl_slist_free_all(headers);
-    OvraDRCore::fromString(reply.document, reply.text);
+    (void)OvraDRCore::fromString(reply.document, reply.text); // not every answer is a document
     return reply;
 }
 

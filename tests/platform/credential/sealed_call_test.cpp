@@ -69,7 +69,7 @@ protected:
         request.SetEncryptMode(encryptMode);
         request.SetResponseTimeout(5);
         request.Process(true, 0);
-        OvraDRCore::fromString(reply_, request.GetResponse());
+        (void)OvraDRCore::fromString(reply_, request.GetResponse()); // there may be none
         return static_cast<CredError>(request.GetError());
     }
 

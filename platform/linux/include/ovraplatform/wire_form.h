@@ -26,6 +26,9 @@ struct WireCall : APICall {
 /// a field of the form itself.
 std::optional<std::vector<std::pair<std::string, std::string>>> toFormFields(const WireCall &call);
 
+/// The body that holds these fields.
+std::string encodeForm(const std::vector<std::pair<std::string, std::string>> &fields);
+
 /// The body itself.
 OVRAPLATFORM_EXPORT std::optional<std::string> encodeForm(const WireCall &call);
 
