@@ -2,6 +2,7 @@
 #include "ovradrcore/json.h"
 #include "ovradrcore/request.h"
 #include "ovradrcore/response.h"
+#include "support/print_json.h"
 
 #include <gtest/gtest.h>
 

@@ -5,6 +5,7 @@
 #include "ovradrnode/dr_node_attr.h"
 #include "support/local_node.h"
 #include "support/log_capture.h"
+#include "support/print_json.h"
 
 #include <gtest/gtest.h>
 #include <sys/file.h>

@@ -2,6 +2,7 @@
 #pragma once
 
 #include "core/appliance.h"
+#include "support/print_json.h"
 
 #include <gtest/gtest.h>
 #include <sys/resource.h>

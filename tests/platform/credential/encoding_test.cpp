@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "credential/endpoint.h"
 #include "credential/wire_form.h"
+#include "support/print_json.h"
 
 #include <ovradrcore/json.h>
 

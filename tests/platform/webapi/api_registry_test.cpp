@@ -1,4 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
+#include "support/print_json.h"
 #include "webapi/api_errors.h"
 #include "webapi/api_registry.h"
 
