@@ -3,12 +3,10 @@
 # yet, and says what it runs. Everything made lies in build/.
 
 JOBS ?= $(shell nproc)
-# The lab's programs for the tests are the development build's, for the demo the release build's.
-testStage := $(CURDIR)/build/stage-dev
 stage := $(CURDIR)/build/stage
 
 .DEFAULT_GOAL := help
-.PHONY: help build test demo bench format check clean stage stage-dev deps-build deps-test deps-lab \
+.PHONY: help build build-dev test demo bench format check clean stage deps-build deps-test deps-lab \
 	deps-bench deps-check
 
 help: ## this list
@@ -18,9 +16,9 @@ help: ## this list
 demo: deps-lab stage ## two appliances on this machine pair, talk and part, before your eyes
 	@OVRADR_LAB_PREFIX='$(stage)' lab/demo
 
-test: deps-test deps-lab stage-dev ## every test, each on a node of its own (TESTS=regex picks some)
+test: deps-test deps-lab build-dev ## every test, each on a node of its own (TESTS=regex picks some)
 	@lab/lab way | sed 's/^/tests run by way of /'
-	OVRADR_LAB_PREFIX='$(testStage)' ctest --preset dev -j $(JOBS) $(if $(TESTS),-R '$(TESTS)')
+	ctest --preset dev -j $(JOBS) $(if $(TESTS),-R '$(TESTS)')
 
 bench: deps-bench build/bench/build.ninja ## the benchmarks, side by side with the floor
 	@cmake --build build/bench -j $(JOBS) --target bench
@@ -31,9 +29,8 @@ build: deps-build build/release/build.ninja ## the libraries and programs, optim
 stage: build
 	@cmake --install build/release --prefix '$(stage)' >build/stage.log || { cat build/stage.log; exit 1; }
 
-stage-dev: deps-test build/dev/build.ninja
+build-dev: deps-test build/dev/build.ninja
 	@cmake --build build/dev -j $(JOBS)
-	@cmake --install build/dev --prefix '$(testStage)' >build/stage-dev.log || { cat build/stage-dev.log; exit 1; }
 
 # Ninja configures again by itself when a CMakeLists.txt changes, but not when the presets do.
 # The benchmarks have a tree of their own, so that the demo does not wait for them.

@@ -4,6 +4,7 @@
 // Run by `make bench`, in a view of its own; "send" needs a running ovradrd.
 
 #include "measure.h"
+#include "support/sandbox.h"
 
 #include <cstdio>
 #include <cstring>
@@ -12,6 +13,10 @@ int main(int argc, char **argv) {
     if (argc != 2) {
         std::fprintf(stderr, "usage: %s cache|db|send\n", argv[0]);
         return 2;
+    }
+    if (!OvraTest::isSandbox()) {
+        OvraTest::explainSandbox(argc, argv);
+        return OvraTest::kNotHere;
     }
     const char *rows = argv[1];
     bool good = false;

@@ -6,6 +6,8 @@
 lab=$(dirname "$(readlink -f "${BASH_SOURCE[0]}")")/../lab
 # shellcheck source=lab/lib/ports.sh
 . "${lab%/lab}/lib/ports.sh"
+# shellcheck source=lab/lib/trace.sh
+. "${lab%/lab}/lib/trace.sh"
 work=$(mktemp -d /tmp/ove.XXXXXX)
 export OVRADR_LAB_DIR=$work/lab
 finish() {
@@ -15,13 +17,18 @@ finish() {
 trap finish EXIT
 
 fail() {
-    printf 'FAILED: %s\n--- last output:\n%s\n' "$1" "${output-}"
+    trace "FAILED: $1"
+    printf -- '--- last output:\n%s\n' "${output-}"
     for node in 1 2; do
         printf -- '--- log of node %s:\n' "$node"
         "$lab" log "$node" | tail -n 15 || true
     done
     exit 1
 }
+
+# A command that nobody expected to fail. In a subshell it is a failure of the command around it, if one.
+set -E
+trap '((BASH_SUBSHELL)) || fail "exit code $? of: $BASH_COMMAND"' ERR
 
 # on NODE CODE COMMAND...: runs a command on a node and expects its exit code; sets output.
 on() {
@@ -30,6 +37,10 @@ on() {
     output=$("$lab" run "$node" -- timeout 60 "$@" 2>&1 </dev/null) || code=$?
     ((code == wanted)) || fail "exit code $code instead of $wanted: $*"
 }
+# value FILTER: what jq finds in the last output.
+value() { jq -er "$1" <<<"$output"; }
+# holds FILTER: the last output is JSON for which that is true.
+holds() { jq -e "$1" <<<"$output" >/dev/null 2>&1 || fail "the output does not hold: $1"; }
 says() { [[ $output == *"$1"* ]] || fail "the output does not say \"$1\""; }
 logSays() { "$lab" log "$1" | grep -qF -- "$2" || fail "the log of node $1 does not say \"$2\""; }
 
@@ -45,13 +56,14 @@ up() {
     on 1 0 sh -c "umask 077; printf %s '$password' >/usr/ovra/pw"
     on 2 0 sh -c "umask 077; printf %s '$password' >/usr/ovra/pw"
     on 2 0 ovradr user add replica --admin --password-file /usr/ovra/pw
-    on 2 0 ovradr node id
-    remote=$output
+    on 2 0 ovradr --json node id
+    remote=$(value .data.node_id)
     key=$(fingerprint 2)
 }
-# fingerprint NODE: the fingerprint of the node's key for HTTPS.
+# fingerprint NODE [PROTOCOL]: the fingerprint of the node's key for HTTPS, or for that.
 fingerprint() {
-    "$lab" run "$1" -- ovradr conn local | sed -n 's/^https.*\(SHA256:[^ ]*\).*/\1/p' | head -n 1
+    "$lab" run "$1" -- ovradr --json conn local |
+        jq -er --arg protocol "${2-https}" 'first(.data.conns[] | select(.protocol == $protocol)).fingerprint'
 }
 create() {
     local code=$1

@@ -54,12 +54,8 @@ nodeState() {
     printf '%s' "$state"
 }
 
-# bwrapPid FILE: the pid that bubblewrap wrote with --info-fd.
-bwrapPid() {
-    local text
-    text=$(<"$1")
-    [[ $text =~ \"child-pid\":\ *([0-9]+) ]] && printf '%s' "${BASH_REMATCH[1]}"
-}
+# bwrapPid FILE: the pid that bubblewrap wrote with --info-fd; false while it has not.
+bwrapPid() { jq -er '."child-pid"' "$1" 2>/dev/null; }
 
 # stopNodes FOLDER COUNT: orders every node's daemon to end, and waits up to 5 seconds for that.
 stopNodes() {

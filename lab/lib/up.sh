@@ -21,6 +21,7 @@ labUp() {
     if [[ $withDaemon == yes ]]; then
         checkPrograms
     fi
+    needProgram jq jq
     pickLabWay || fail "$labWhy"
     echo "lab: $(wayText "$labWay"), because $labWhy"
     lab=$(labFolder)

@@ -6,6 +6,9 @@
 # /run go away at any moment, so those are put back as symbolic links into /run/host, except the
 # ones on the way to a path that must stay itself (the checkout, the working folder).
 
+# A folder that says that this is such a view: the test programs look for it before they touch a fixed
+# path.
+viewMark=/run/host/ovradr-sandbox
 # At most so many entries of /tmp and of /run are put back; bubblewrap takes 9,000 arguments in all.
 viewLinkLimit=1000
 
@@ -19,12 +22,20 @@ leadsTo() {
     return 1
 }
 
+# isFixed ENTRY: whether it is a path that is the view's own in any case.
+isFixed() {
+    case $1 in
+    /usr/ovra | /tmp/.ovradrcache | /run/lock | /run/host | /dev/log) return 0 ;;
+    esac
+    return 1
+}
+
 # isOwn ENTRY: whether the view has its own instead of the machine's. Other labs are left out too.
 isOwn() {
     case $1 in
-    /usr/ovra | /tmp/.ovradrcache | /run/lock | /run/host | /dev/log | /tmp/ovralab-* | /tmp/ovl.*) return 0 ;;
+    /tmp/ovralab-* | /tmp/ovl.*) return 0 ;;
     esac
-    return 1
+    isFixed "$1"
 }
 
 # entriesOf FOLDER: sets entries, at most viewLinkLimit of them.
@@ -43,7 +54,7 @@ bwrapView() {
     viewArgs=(--bind / / --dev /dev --bind-try /dev/shm /dev/shm --dev-bind-try /dev/net /dev/net
         --tmpfs /usr --perms 1777 --tmpfs /tmp --tmpfs /run
         --bind /tmp /run/host/tmp --bind /run /run/host/run
-        --dir /usr/ovra --perms 1777 --dir /run/lock)
+        --dir /usr/ovra --perms 1777 --dir /run/lock --dir "$viewMark")
     entriesOf /usr
     for entry in "${entries[@]}"; do
         if isOwn "$entry"; then
@@ -57,7 +68,7 @@ bwrapView() {
     for folder in /tmp /run; do
         entriesOf "$folder"
         for entry in "${entries[@]}"; do
-            if leadsTo "$entry" "$@"; then
+            if ! isFixed "$entry" && leadsTo "$entry" "$@"; then
                 viewArgs+=(--bind "$entry" "$entry")
             elif ! isOwn "$entry"; then
                 viewArgs+=(--symlink "/run/host$entry" "$entry")
@@ -94,14 +105,14 @@ prootView() {
         viewArgs+=(-b "$folder:/run/host$folder")
         entriesOf "$folder"
         for entry in "${entries[@]}"; do
-            if leadsTo "$entry" "$@"; then
+            if ! isFixed "$entry" && leadsTo "$entry" "$@"; then
                 placeEntry "$entry"
             elif ! isOwn "$entry"; then
                 links[$folder]+="/run/host$entry"$'\n'
             fi
         done
     done
-    mkdir -p "$root"/{usr/ovra,tmp,run/lock,dev} "${folders[@]}"
+    mkdir -p "$root"/{usr/ovra,tmp,run/lock,dev} "$root$viewMark" "${folders[@]}"
     ((${#files[@]} == 0)) || touch "${files[@]}"
     for folder in "${!links[@]}"; do
         if [[ $folder == /tmp || $folder == /run ]]; then

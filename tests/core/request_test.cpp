@@ -1,4 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
+#include "support/print_json.h"
+
 #include <ovradrcore/json.h>
 #include <ovradrcore/request.h>
 #include <ovradrcore/response.h>

@@ -6,11 +6,18 @@ root=$(cd "$(dirname "${BASH_SOURCE[0]}")/../.." && pwd -P)
 # Under /tmp, and short, whatever TMPDIR says: the lab's proot way needs short paths.
 scratch=$(mktemp -d /tmp/ovt.XXXX)
 
+# shellcheck source=lab/lib/trace.sh
+. "$root/lab/lib/trace.sh"
+
 # broken WHAT: ends the scene.
 broken() {
-    printf 'FAILED: %s\n' "$*" >&2
+    trace "FAILED: $*" >&2
     exit 1
 }
+# A command that nobody expected to fail. In a subshell it is a failure of the command around it, if one.
+set -E
+trap '((BASH_SUBSHELL)) || broken "exit code $? of: $BASH_COMMAND"' ERR
+
 same() { [[ $2 == "$3" ]] || broken "$1: expected \"$3\", got \"$2\""; }
 holds() { [[ $2 == *"$3"* ]] || broken "$1: expected \"$3\" somewhere in: $2"; }
 absent() { [[ ! -e $1 ]] || broken "$1 is there"; }

@@ -1,13 +1,16 @@
 #!/bin/bash
 # SPDX-License-Identifier: Apache-2.0
-# lab_test.sh SCENE WAY: one scene of the lab or the sandbox, made in that way. Exit code 77 where
-# the machine does not allow the way, or the way has not what the scene is about.
+# lab_test.sh SCENE WAY [PROGRAM]: one scene of the lab or the sandbox, made in that way, PROGRAM being
+# the test program of the node database. Exit code 77 where the machine does not allow the way, or the
+# way has not what the scene is about.
 set -euo pipefail
 # shellcheck source=tests/lab/expect.sh
 . "$(dirname "$0")/expect.sh"
 # shellcheck source=lab/lib/ports.sh
 . "$root/lab/lib/ports.sh"
-scene=$1 way=$2
+# shellcheck source=lab/lib/view.sh
+. "$root/lab/lib/view.sh"
+scene=$1 way=$2 testProgram=${3-}
 export OVRADR_LAB_WAY=$way OVRADR_LAB_DIR=$scratch/lab
 # A word by which processes of this scene are known from outside.
 mark=31${RANDOM}${BASHPID}
@@ -42,12 +45,13 @@ programs() {
 }
 
 sandboxKeepsThePathsPrivate() {
-    local seen
+    local seen folder
     local fill='for path in /usr/ovra/x /tmp/.ovradrcache /run/lock/x /dev/log; do
         [[ ! -e $path ]] || echo "already there: $path"
         echo mine >"$path"; stat -c %s "$path"; mv "$path" "$path.moved"; cat "$path.moved"
     done; stat -c %a /usr/ovra; [[ -O /usr/ovra ]] && echo yes'
-    for _ in 1 2; do
+    for folder in "$scratch" "$scratch" /run/lock; do
+        cd "$folder"
         seen=$(sandbox bash -c "$fill" | tr '\n' ' ')
         same "own, empty, writable, owned by who runs it" "$seen" "5 mine 5 mine 5 mine 5 mine 755 yes "
     done
@@ -55,6 +59,35 @@ sandboxKeepsThePathsPrivate() {
     absent /tmp/.ovradrcache.moved
     absent /run/lock/x.moved
     absent /dev/log.moved
+}
+
+# What the machine's own node has to lose, played in a sandbox: if it went wrong, nobody would be hurt.
+testProgramsRunInASandboxOnly() {
+    local outside case=--gtest_filter=NodeDb.CountsTheCredentialsOfANode
+    exitCodeOf sandbox "$testProgram" "$case"
+    holds "the case runs inside" "$output" "[  PASSED  ] 1 test"
+    same "exit code inside" "$code" 0
+    # Both the variable and the view are asked for; either may be there by itself.
+    for outside in 'unset OVRADR_SANDBOX' "rmdir $viewMark"; do
+        # shellcheck disable=SC2016 # expanded in the sandbox
+        exitCodeOf sandbox bash -c "$outside"'
+            mkdir -p /usr/ovra/etc/ovradr /tmp/.ovradrcache
+            echo mine | tee /usr/ovra/etc/ovradr/node.{db,info} /tmp/.ovradrcache/x /run/lock/x >/dev/null
+            files() { find /usr/ovra /tmp/.ovradrcache /run/lock -printf "%p %s %i %T@ %C@\n"; }
+            before=$(files) code=0
+            "$@" || code=$?
+            [[ $(files) == "$before" ]] || echo "the files were touched"
+            exit "$code"' outside "$testProgram" "$case"
+        same "exit code after $outside" "$code" 2
+        [[ $output != *touched* ]] || broken "after $outside: $output"
+    done
+    exitCodeOf "$testProgram" --gtest_list_tests
+    same "exit code of the list outside" "$code" 0
+    # Outside, and no case is selected: there is nothing to do, and yet it is refused.
+    exitCodeOf env OVRADR_SANDBOX=yes "$testProgram" --gtest_filter=-*
+    same "exit code outside" "$code" 2
+    holds "how to run it" "$output" "$root/lab/sandbox $testProgram --gtest_filter=-*"
+    holds "how to debug it" "$output" "$root/lab/sandbox gdb --args $testProgram --gtest_filter=-*"
 }
 
 sandboxPassesExitCodes() {
@@ -78,8 +111,8 @@ sandboxPassesFolderInputAndEnvironment() {
 sandboxLeavesNothingAfterASignal() {
     local signal
     for signal in TERM INT HUP KILL; do
-        # A shell starts its background jobs with SIGINT ignored; this one must hear it.
-        perl -e '$SIG{INT} = "DEFAULT"; exec @ARGV' \
+        # A shell starts its background jobs with SIGINT ignored, nohup with SIGHUP; this one must hear them.
+        perl -e '$SIG{INT} = $SIG{HUP} = "DEFAULT"; exec @ARGV' \
             "$root/lab/sandbox" bash -c "touch '/usr/ovra/$mark' '$scratch/runs'; env -i sleep $mark & sleep $mark" &
         eventually "the command runs" test -e "$scratch/runs"
         kill -"$signal" $!

@@ -66,4 +66,22 @@ exportsRefuseAForeignName() {
     holds "a helper that got out" "$output" helper
 }
 
+scenesNameTheLineThatFailed() {
+    local library head
+    while read -r library head; do
+        # It fails in line 3, which line 4 calls.
+        printf '%s\n' "set -euo pipefail; . '$root/$library'" 'helper() {' '"$@"; }' 'scene() { helper "$@"; }' 'scene "$@"' >"$scratch/scene.sh"
+        exitCodeOf bash "$scratch/scene.sh" "$head" "this is wrong"
+        same "exit code of $head" "$code" 1
+        holds "an expectation" "$output" "scene.sh:3: FAILED: this is wrong"
+        holds "who asked for it" "$output" "scene.sh:4: called from here"
+        exitCodeOf bash "$scratch/scene.sh" grep -q this /dev/null
+        same "exit code of a command" "$code" 1
+        holds "a command that failed" "$output" "scene.sh:3: FAILED: exit code 1 of: "
+    done <<-'END'
+	tests/lab/expect.sh broken
+	lab/lib/play.sh fail
+	END
+}
+
 "$1"

@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "support/local_node.h"
 #include "support/log_capture.h"
+#include "support/print_json.h"
 
 #include <ovradrcore/file_lock.h>
 #include <ovradrcore/json.h>

@@ -1,4 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
+#include "platform/store/raw_sqlite.h"
 #include "support/local_node.h"
 #include "support/log_capture.h"
 
@@ -6,14 +7,13 @@
 #include <ovradrnode/node_session.h>
 #include <ovraplatform/api_errors.h>
 #include <ovraplatform/api_registry.h>
+#include <ovraplatform/session_store.h>
 
 #include <gtest/gtest.h>
 #include <json-c/json_object.h>
 
-#include <chrono>
 #include <cstdlib>
 #include <fstream>
-#include <thread>
 
 using namespace OvraDRNode;
 using OvraPlatform::apiError;
@@ -101,11 +101,14 @@ TEST_F(Session, BadArgumentsAndUnknownUsersGetNone) {
 }
 
 TEST_F(Session, ATemporaryOneIsTiedToNoNodeAndEnds) {
-    const std::string temp = session.CreateTempSession("joe", 1);
+    const std::string temp = session.CreateTempSession("joe", 7);
     EXPECT_EQ(userOf(temp), "joe");
     EXPECT_NE(create("n1", "joe"), temp);
     EXPECT_NE(session.CreateTempSession("joe", 60), temp) << "never reused";
-    std::this_thread::sleep_for(std::chrono::milliseconds(2100));
+    const std::string row = " WHERE id = '" + temp + "'";
+    OvraTest::RawSqlite sessions(OvraPlatform::kSessionsFile);
+    EXPECT_EQ(sessions.cell("SELECT expires - created FROM session" + row), "7");
+    ASSERT_TRUE(sessions.run("UPDATE session SET expires = expires - 7" + row));
     EXPECT_EQ(userOf(temp), "");
 }
 

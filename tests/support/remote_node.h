@@ -2,6 +2,7 @@
 #pragma once
 
 #include "support/misbehaving_server.h"
+#include "support/print_json.h"
 #include "support/sealing_daemon.h"
 
 #include <functional>

@@ -141,7 +141,7 @@ TEST_F(CredSender, AReplyThatIsNoReplyIsInvalidInBoundedTime) {
         EXPECT_EQ(response.getErrCode(), 407) << each.what;
         EXPECT_EQ(sender.GetErrCode(), each.code)
             << each.what << " " << OvraDRCore::toString(sender.GetErr());
-        EXPECT_LT(std::chrono::steady_clock::now() - start, std::chrono::seconds(3)) << each.what;
+        EXPECT_LT(std::chrono::steady_clock::now() - start, std::chrono::seconds(5)) << each.what;
     }
 }
 
@@ -165,7 +165,7 @@ TEST_F(CredSender, ARequestThatTakesTooLongIsCutAndMarksTheEndpoint) {
     CredSessionSender sender(conn, "s1");
     const auto start = std::chrono::steady_clock::now();
     EXPECT_FALSE(sender.process(request).isValid());
-    EXPECT_LT(std::chrono::steady_clock::now() - start, std::chrono::seconds(3));
+    EXPECT_LT(std::chrono::steady_clock::now() - start, std::chrono::seconds(5));
     EXPECT_EQ(sender.GetErrCode(), 500);
     EXPECT_FALSE(ConnCache(conn).getStoredVerdict());
 }

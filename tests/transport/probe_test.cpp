@@ -85,9 +85,9 @@ TEST_F(Probe, AHostThatAcceptsAndSaysNothingCostsTheProbesTimeOutOnce) {
     EXPECT_FALSE(BaseSender::GetCachedConnectable(conn));
     const std::chrono::duration<double> took = std::chrono::steady_clock::now() - start;
     EXPECT_GE(took.count(), 9.0);
-    EXPECT_LT(took.count(), 12.0);
+    EXPECT_LT(took.count(), 15.0);
     EXPECT_FALSE(BaseSender::GetCachedConnectable(conn));
-    EXPECT_LT(std::chrono::steady_clock::now() - start, std::chrono::seconds(13));
+    EXPECT_LT(std::chrono::steady_clock::now() - start, std::chrono::seconds(18));
     EXPECT_EQ(log.count("cred error[10]"), 1);
 }
 

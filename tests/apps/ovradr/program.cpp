@@ -111,6 +111,8 @@ Terminal::Terminal(const Arguments &arguments) {
     if (pid_ == 0) {
         close(master_);
         login_tty(slave_);
+        std::signal(SIGINT,
+                    SIG_DFL); // who starts the tests in the background ignores it, and all below
         execute(arguments);
     }
 }

@@ -72,8 +72,6 @@ Json::Value json(const std::string &text) {
 }
 
 void Appliance::provision() {
-    const char *const way = std::getenv("OVRADR_LAB_WAY");
-    require(way != nullptr, "run this under lab/sandbox");
     provisionNode();
     require(OvraPlatform::ensureStateDir(), "no state folder");
     writeTlsFiles();

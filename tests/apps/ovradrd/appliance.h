@@ -2,6 +2,7 @@
 #pragma once
 
 #include "daemon.h"
+#include "support/print_json.h"
 
 #include <gtest/gtest.h>
 #include <json/json.h>

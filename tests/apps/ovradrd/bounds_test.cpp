@@ -61,13 +61,13 @@ TEST_P(SlowClient, isCutOffWhenItsRequestTakesTooLong) {
     const auto begun = std::chrono::steady_clock::now();
     const auto time = [begun] { return std::chrono::steady_clock::now() - begun; };
     connection.send(GetParam().begin);
-    while (!connection.closesWithin(100ms) && time() < 5s) {
+    while (!connection.closesWithin(100ms) && time() < 10s) {
         if (GetParam().drip != '\0') {
             connection.send(std::string(1, GetParam().drip));
         }
     }
     EXPECT_GE(time(), 900ms);
-    EXPECT_LT(time(), 3s);
+    EXPECT_LT(time(), 10s);
 }
 
 INSTANTIATE_TEST_SUITE_P(

@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "handlers/flow_error.h"
 #include "handlers/params.h"
+#include "support/print_json.h"
 
 #include <ovradrcore/json.h>
 

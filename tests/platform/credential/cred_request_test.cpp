@@ -111,7 +111,7 @@ TEST_P(WhenItAnswers, theErrorTellsWhatWasWrong) {
     EXPECT_EQ(result.error, GetParam().error);
     EXPECT_EQ(result.ok, GetParam().error == CredError::kNone);
     EXPECT_EQ(result.response.empty(), !result.ok);
-    EXPECT_LT(std::chrono::steady_clock::now() - begin, 3s);
+    EXPECT_LT(std::chrono::steady_clock::now() - begin, 5s);
     EXPECT_EQ(server.requests().size(), 1U);
 }
 
@@ -163,7 +163,7 @@ TEST_F(CredRequestScene, tellsWhyItCannotConnect) {
     silent.fallSilent();
     const auto begin = std::chrono::steady_clock::now();
     EXPECT_EQ(call(silent, true, 1).error, CredError::kTimedOut);
-    EXPECT_LT(std::chrono::steady_clock::now() - begin, 2s);
+    EXPECT_LT(std::chrono::steady_clock::now() - begin, 5s);
 }
 
 TEST_F(CredRequestScene, followsNeitherARedirectNorAProxyOfTheEnvironment) {

@@ -7,8 +7,9 @@
 
 #include <sodium.h>
 
+#include <algorithm>
 #include <array>
-#include <chrono>
+#include <ctime>
 #include <string>
 #include <vector>
 
@@ -35,6 +36,12 @@ constexpr char kSecret[] = "GEZDGNBVGY3TQOJQGEZDGNBVGY3TQOJQ"; // of RFC 6238, a
 constexpr std::time_t kCodeTime = 1111111111;
 constexpr char kCode[] = "050471";        // of kCodeTime
 constexpr char kEarlierCode[] = "081804"; // of the step before
+
+double threadSeconds() {
+    timespec time{};
+    clock_gettime(CLOCK_THREAD_CPUTIME_ID, &time);
+    return static_cast<double>(time.tv_sec) + static_cast<double>(time.tv_nsec) / 1e9;
+}
 
 struct Accounts : OvraTest::OwnFiles {
     std::string file() const { return path("state/accounts.db"); }
@@ -83,17 +90,18 @@ TEST_F(Accounts, LogInAsTheirStateAllows) {
 TEST_F(Accounts, AnUnknownNameTakesAsLongAsAWrongPassword) {
     ASSERT_TRUE(store().add("ann", kPassword, false));
     verify("warm", "up");
-    const auto shortest = [&](const char *name) {
-        auto best = std::chrono::steady_clock::duration::max();
-        for (int i = 0; i < 3; ++i) {
-            const auto start = std::chrono::steady_clock::now();
-            verify(name, "wrong password");
-            best = std::min(best, std::chrono::steady_clock::now() - start);
-        }
-        return best;
+    // What this thread works, and not what passes while it waits for a processor.
+    const auto cost = [&](const char *name) {
+        const double before = threadSeconds();
+        verify(name, "wrong password");
+        return threadSeconds() - before;
     };
-    const auto known = shortest("ann");
-    const auto unknown = shortest("nobody");
+    double known = cost("ann");
+    double unknown = cost("nobody");
+    for (int i = 0; i < 4; ++i) {
+        known = std::min(known, cost("ann"));
+        unknown = std::min(unknown, cost("nobody"));
+    }
     EXPECT_GT(unknown, known / 2);
     EXPECT_LT(unknown, known * 2);
 }

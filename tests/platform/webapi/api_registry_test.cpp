@@ -1,4 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
+#include "support/print_json.h"
+
 #include <ovraplatform/api_errors.h>
 #include <ovraplatform/api_registry.h>
 #include <ovrawebapi/api_runner.h>
