@@ -4,7 +4,6 @@
 using namespace OvraDRNode;
 using namespace OvraTest;
 using namespace OvraVendor;
-using OvraDRCore::Response;
 
 namespace {
 

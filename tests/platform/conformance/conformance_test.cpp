@@ -73,7 +73,7 @@ std::string fieldOf(const std::string &sid, int number) {
     if (OvraCgiGetSessionBySID(&store, sid.c_str(), &record) != 1) {
         return "gone";
     }
-    const std::string value = field(record, number);
+    std::string value = field(record, number);
     json_object_put(record);
     return value;
 }
