@@ -25,7 +25,7 @@ test: deps-test deps-lab stage-dev ## every test, each on a node of its own (TES
 bench: deps-bench build/bench/build.ninja ## the benchmarks, side by side with the floor
 	@cmake --build build/bench -j $(JOBS) --target bench
 
-vendor: deps-test ## the library on an appliance's own platform, with stand-ins for it
+vendor: deps-test deps-check ## the library on an appliance's own platform, with stand-ins for it
 	@tools/check-vendor
 
 build: deps-build build/release/build.ninja ## the libraries and programs, optimised
