@@ -6,7 +6,7 @@ JOBS ?= $(shell nproc)
 stage := $(CURDIR)/build/stage
 
 .DEFAULT_GOAL := help
-.PHONY: help build build-dev test demo bench format check clean stage deps-build deps-test deps-lab \
+.PHONY: help build build-dev test demo bench vendor format check clean stage deps-build deps-test deps-lab \
 	deps-bench deps-check
 
 help: ## this list
@@ -22,6 +22,9 @@ test: deps-test deps-lab build-dev ## every test, each on a node of its own (TES
 
 bench: deps-bench build/bench/build.ninja ## the benchmarks, side by side with the floor
 	@cmake --build build/bench -j $(JOBS) --target bench
+
+vendor: deps-test deps-check ## the library on an appliance's own platform, with stand-ins for it
+	@tools/check-vendor
 
 build: deps-build build/release/build.ninja ## the libraries and programs, optimised
 	@cmake --build build/release -j $(JOBS)

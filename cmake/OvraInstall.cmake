@@ -9,6 +9,10 @@ install(TARGETS ${ovra_installed} EXPORT OvraDRNodeTargets
   LIBRARY DESTINATION "${CMAKE_INSTALL_LIBDIR}")
 install(DIRECTORY include/ovradrnode core/include/ovradrcore
   DESTINATION "${CMAKE_INSTALL_INCLUDEDIR}" FILES_MATCHING PATTERN "*.h")
+# What an appliance is set up with: by ovradr, or by its own package where there is none.
+install(FILES src/db/node.sql DESTINATION "${CMAKE_INSTALL_DATADIR}/ovradrnode")
+install(PROGRAMS scripts/TestDownloadSpeed.sh scripts/TestSyncSpeed.sh
+  DESTINATION "${CMAKE_INSTALL_DATADIR}/ovradrnode")
 
 set(ovra_cmake_dir "${CMAKE_INSTALL_LIBDIR}/cmake/OvraDRNode")
 install(EXPORT OvraDRNodeTargets NAMESPACE OvraDRNode:: DESTINATION "${ovra_cmake_dir}")

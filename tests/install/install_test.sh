@@ -22,7 +22,7 @@ g++ -std=c++17 "$work/readme.cpp" "${flags[@]}" -o "$work/by_pkg_config"
 # A node that nothing is known about is a clear error, not a crash.
 library=$(dirname "$(find "$work/moved" -name libovradrnode.so.1)")
 for program in "$work/cmake/node_info" "$work/by_pkg_config"; do
-    if LD_LIBRARY_PATH=$library "$source/lab/sandbox" "$program" no-such-node 2>"$work/err"; then
+    if LD_LIBRARY_PATH=$library${LD_LIBRARY_PATH:+:$LD_LIBRARY_PATH} "$source/lab/sandbox" "$program" no-such-node 2>"$work/err"; then
         echo "expected a failure of $program"
         exit 1
     fi

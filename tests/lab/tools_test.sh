@@ -49,19 +49,34 @@ layersRefuseWhatIsAbovePrivateOrASibling() {
 	END
 }
 
-exportsRefuseAForeignName() {
-    local name space
-    for name in core:OvraDRCore node:OvraDRNode platform:OVRA; do
-        space=${name#*:}
-        printf '#include <vector>\nnamespace %s { struct A { virtual ~A(); }; A::~A() {} int f(std::vector<A>) { return 1; } }\n%s\n' \
-            "$space" '__attribute__((visibility("hidden"))) int inner() { return 2; }' >"$scratch/${name%:*}.cpp"
-        g++ -shared -fPIC -fvisibility-inlines-hidden -o "$scratch/libovradr${name%:*}.so" "$scratch/${name%:*}.cpp"
+# A checkout of its own: three libraries, each with a header of one class and one function.
+makeLibraries() {
+    local part name space folder
+    mkdir -p "$scratch/tools"
+    cp "$root/tools/check-exports" "$root/tools/declared-symbols" "$scratch/tools/"
+    for part in core:OvraDRCore:core/include node:OvraDRNode:include platform:OVRA:platform/include; do
+        IFS=: read -r name space folder <<<"$part"
+        mkdir -p "$scratch/$folder"
+        printf '#include <vector>\nnamespace %s { struct A { virtual ~A(); }; int f(std::vector<A>); }\n' \
+            "$space" >"$scratch/$folder/$name.h"
+        printf '#include "%s"\nnamespace %s { A::~A() {} int f(std::vector<A>) { return 1; } }\n%s\n' \
+            "$scratch/$folder/$name.h" "$space" \
+            '__attribute__((visibility("hidden"))) int inner() { return 2; }' >"$scratch/$name.cpp"
+        buildLibrary "$name"
     done
-    exitCodeOf "$root/tools/check-exports" "$scratch"
+}
+
+buildLibrary() {
+    g++ -shared -fPIC -fvisibility-inlines-hidden -o "$scratch/libovradr$1.so" "$scratch/$1.cpp"
+}
+
+exportsRefuseAForeignName() {
+    makeLibraries
+    exitCodeOf "$scratch/tools/check-exports" "$scratch"
     same "only names of their own: $output" "$code" 0
     echo 'int helper() { return 3; }' >>"$scratch/core.cpp"
-    g++ -shared -fPIC -fvisibility-inlines-hidden -o "$scratch/libovradrcore.so" "$scratch/core.cpp"
-    exitCodeOf "$root/tools/check-exports" "$scratch"
+    buildLibrary core
+    exitCodeOf "$scratch/tools/check-exports" "$scratch"
     same "a helper that got out" "$code" 1
     holds "a helper that got out" "$output" helper
 }
@@ -82,6 +97,20 @@ scenesNameTheLineThatFailed() {
 	tests/lab/expect.sh broken
 	lab/lib/play.sh fail
 	END
+}
+
+exportsMissNothingThatIsDeclared() {
+    makeLibraries
+    echo 'namespace OvraDRNode { struct __attribute__((visibility("hidden"))) B { virtual ~B(); }; }' >>"$scratch/include/node.h"
+    echo 'OvraDRNode::B::~B() {}' >>"$scratch/node.cpp"
+    buildLibrary node
+    echo 'extern int OVRACount; namespace OVRA { inline int g() { return 1; } int h(); }' >>"$scratch/platform/include/platform.h"
+    exitCodeOf "$scratch/tools/check-exports" "$scratch"
+    same "hidden and undefined names" "$code" 1
+    holds "a class that is hidden" "$output" 'vtable for OvraDRNode::B'
+    holds "a function that nobody defines" "$output" 'OVRA::h()'
+    holds "a variable that nobody defines" "$output" OVRACount
+    [[ $output != *'g()'* ]] || broken "a function that needs no library: $output"
 }
 
 "$1"

@@ -2,8 +2,10 @@
 #include "http/web_call.h"
 
 #include "http/connection_pool.h"
+#include "http/form_fields.h"
 #include "ovraplatform/api_errors.h"
 #include "seal/seal_key_cache.h"
+#include "seal/sealing.h"
 
 #include <ovradrcore/json.h>
 #include <ovradrcore/log.h>

@@ -1,6 +1,8 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "ovraplatform/wire_form.h"
 
+#include "http/form_fields.h"
+
 #include <ovrabase/number.h>
 #include <ovradrcore/json.h>
 
@@ -20,8 +22,6 @@ constexpr char kSealed[] = "sealed";
 constexpr std::array<std::string_view, 5> kReserved = {kApi, kVersion, kMethod, kSid, kSealed};
 constexpr std::size_t kMaxFields = 1000;
 constexpr char kHexDigits[] = "0123456789ABCDEF";
-
-using Fields = std::vector<std::pair<std::string, std::string>>;
 
 bool isReserved(std::string_view name) {
     return std::find(kReserved.begin(), kReserved.end(), name) != kReserved.end();
@@ -79,8 +79,8 @@ std::optional<std::string> unescape(std::string_view text) {
     return plain;
 }
 
-std::optional<Fields> splitForm(std::string_view body) {
-    Fields fields;
+std::optional<FormFields> splitForm(std::string_view body) {
+    FormFields fields;
     while (!body.empty()) {
         const std::size_t end = std::min(body.find('&'), body.size());
         const std::string_view field = body.substr(0, end);
@@ -129,8 +129,8 @@ const char *takeField(WireCall &call, const std::string &name, std::string &valu
 
 } // namespace
 
-std::optional<Fields> toFormFields(const WireCall &call) {
-    Fields fields{
+std::optional<FormFields> toFormFields(const WireCall &call) {
+    FormFields fields{
         {kApi, call.api}, {kVersion, std::to_string(call.version)}, {kMethod, call.method}};
     if (!call.sid.empty()) {
         fields.emplace_back(kSid, call.sid);
@@ -152,7 +152,7 @@ std::optional<Fields> toFormFields(const WireCall &call) {
     return fields;
 }
 
-std::string encodeForm(const Fields &fields) {
+std::string encodeForm(const FormFields &fields) {
     std::string body;
     for (const auto &[name, value] : fields) {
         if (!body.empty()) {
@@ -166,13 +166,13 @@ std::string encodeForm(const Fields &fields) {
 }
 
 std::optional<std::string> encodeForm(const WireCall &call) {
-    const std::optional<Fields> fields = toFormFields(call);
+    const std::optional<FormFields> fields = toFormFields(call);
     return fields ? std::optional(encodeForm(*fields)) : std::nullopt;
 }
 
 tl::expected<WireCall, std::string> decodeForm(std::string_view body) {
     const auto refused = [](const char *why) { return tl::unexpected(std::string(why)); };
-    std::optional<Fields> fields = splitForm(body);
+    std::optional<FormFields> fields = splitForm(body);
     if (!fields) {
         return refused("the body is not a form, or has too many fields");
     }

@@ -2,6 +2,7 @@
 #include "ovraplatform/sealed_box.h"
 
 #include "ovraplatform/api_errors.h"
+#include "seal/sealing.h"
 
 #include <ovrabase/encoding.h>
 #include <ovradrcore/json.h>

@@ -1,5 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "appliance.h"
+#include "seal/sealing.h"
 
 #include <ovracredential/cred_request.h>
 #include <ovradrcore/json.h>

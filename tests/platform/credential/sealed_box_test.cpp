@@ -1,5 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "platform/own_files.h"
+#include "seal/sealing.h"
 
 #include <ovradrcore/json.h>
 #include <ovraplatform/sealed_box.h>

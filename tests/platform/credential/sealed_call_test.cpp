@@ -1,5 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "platform/own_files.h"
+#include "seal/sealing.h"
 #include "support/log_capture.h"
 #include "support/sealing_daemon.h"
 

@@ -29,8 +29,6 @@ struct ReplyKey : OvraBase::SecretBytes<crypto_secretbox_KEYBYTES> {};
 
 /// The text form of a public key on the wire.
 OVRAPLATFORM_EXPORT std::string publicKeyText(const PublicKey &key);
-/// Nothing when the text is no public key.
-std::optional<PublicKey> parsePublicKey(const std::string &text);
 /// "SHA256:..." of the key.
 OVRAPLATFORM_EXPORT std::string fingerprintOf(const PublicKey &key);
 
@@ -57,7 +55,6 @@ private:
 
 /// Milliseconds since 1970.
 using UnixMillis = std::int64_t;
-UnixMillis wallClock();
 
 using SealNonce = std::array<unsigned char, 16>;
 
@@ -101,13 +98,6 @@ private:
     std::set<std::pair<UnixMillis, SealNonce>> seen_;
 };
 
-/// Seals parameters and session id of `call` to `receiver`.
-/// \param time      the receiver's time
-/// \param replyKey  takes the key for the reply
-/// \return the text of the field "sealed"; "" when libsodium cannot be used.
-std::string sealRequest(const PublicKey &receiver, const WireCall &call, UnixMillis time,
-                        ReplyKey &replyKey);
-
 enum class SealVerdict {
     kOpened,
     kUnreadable, ///< not sealed to this key; there is no reply key either
@@ -132,7 +122,5 @@ OVRAPLATFORM_EXPORT Json::Value sealRefusal(SealVerdict verdict, UnixMillis now)
 
 /// The sealed form of a reply document: a JSON text.
 OVRAPLATFORM_EXPORT std::string sealReply(const ReplyKey &key, const std::string &document);
-/// The document inside `reply` (an object with "sealed_reply"); nothing when it does not open.
-std::optional<std::string> openReply(const ReplyKey &key, const Json::Value &reply);
 
 } // namespace OvraPlatform

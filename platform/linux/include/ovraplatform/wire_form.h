@@ -9,8 +9,6 @@
 #include <optional>
 #include <string>
 #include <string_view>
-#include <utility>
-#include <vector>
 
 // The body of a web-API request: application/x-www-form-urlencoded, as docs/wire.md describes it.
 namespace OvraPlatform {
@@ -22,14 +20,7 @@ struct WireCall : APICall {
     std::string sealed; ///< the sealed envelope, or ""
 };
 
-/// The fields of the body in their order, not yet escaped; nothing when a parameter has the name of
-/// a field of the form itself.
-std::optional<std::vector<std::pair<std::string, std::string>>> toFormFields(const WireCall &call);
-
-/// The body that holds these fields.
-std::string encodeForm(const std::vector<std::pair<std::string, std::string>> &fields);
-
-/// The body itself.
+/// The body; nothing when a parameter has the name of a field of the form itself.
 OVRAPLATFORM_EXPORT std::optional<std::string> encodeForm(const WireCall &call);
 
 /// Reads a body. Refused are a body without api, version or method, a field that stands twice, a

@@ -1,0 +1,20 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include "ovraplatform/wire_form.h"
+
+#include <optional>
+#include <string>
+#include <utility>
+#include <vector>
+
+namespace OvraPlatform {
+
+/// The fields of a form in their order, not yet escaped.
+using FormFields = std::vector<std::pair<std::string, std::string>>;
+
+/// Nothing when a parameter has the name of a field of the form itself.
+std::optional<FormFields> toFormFields(const WireCall &call);
+std::string encodeForm(const FormFields &fields);
+
+} // namespace OvraPlatform

@@ -1,0 +1,130 @@
+// SPDX-License-Identifier: Apache-2.0
+
+// Key-value files and programs with a pipe, for real.
+
+#include "stand_in.h"
+
+#include <ovracore/ovracore.h>
+
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <cstdarg>
+#include <fstream>
+
+using OvraVendor::coreLibrary;
+
+namespace {
+
+std::vector<std::string> linesOf(const char *path) {
+    std::ifstream file(path);
+    std::vector<std::string> lines;
+    for (std::string line; std::getline(file, line);) {
+        lines.push_back(line);
+    }
+    return lines;
+}
+
+bool isOfKey(const std::string &line, const std::string &key) {
+    return line.compare(0, key.size() + 1, key + "=") == 0;
+}
+
+std::map<FILE *, pid_t> &programs() {
+    static std::map<FILE *, pid_t> running;
+    return running;
+}
+
+} // namespace
+
+OvraVendor::CoreLibrary &OvraVendor::coreLibrary() {
+    static CoreLibrary library;
+    return library;
+}
+
+extern "C" {
+
+int OLIBCFileExist(const char *path) {
+    return access(path, F_OK) == 0 ? 1 : 0;
+}
+
+int OLIBCFileGetKeyValue(const char *path, const char *key, char *buffer, int size, int /*flag*/) {
+    for (const std::string &line : linesOf(path)) {
+        if (!isOfKey(line, key)) {
+            continue;
+        }
+        std::string value = line.substr(std::string(key).size() + 1);
+        if (value.size() >= 2 && value.front() == '"' && value.back() == '"') {
+            value = value.substr(1, value.size() - 2);
+        }
+        const bool fits = static_cast<int>(value.size()) < size;
+        return fits ? std::snprintf(buffer, static_cast<std::size_t>(size), "%s", value.c_str())
+                    : -1;
+    }
+    return -1;
+}
+
+int OLIBCFileSetKeyValue(const char *path, const char *key, const char *value,
+                         const char * /*format*/) {
+    if (coreLibrary().readOnly) {
+        return -1;
+    }
+    const std::string line = std::string(key) + "=\"" + value + "\"";
+    std::vector<std::string> lines = linesOf(path);
+    bool replaced = false;
+    for (std::string &each : lines) {
+        if (isOfKey(each, key)) {
+            each = line;
+            replaced = true;
+        }
+    }
+    if (!replaced) {
+        lines.push_back(line);
+    }
+    std::ofstream file(path);
+    for (const std::string &each : lines) {
+        file << each << '\n';
+    }
+    return file.flush() ? 0 : -1;
+}
+
+FILE *OLIBCPopen(const char *path, const char *mode, ...) {
+    std::vector<char *> arguments{const_cast<char *>(path)};
+    va_list list;
+    va_start(list, mode);
+    while (arguments.back() != nullptr) {
+        arguments.push_back(va_arg(list, char *));
+    }
+    va_end(list);
+    int ends[2];
+    if (access(path, X_OK) != 0 || pipe(ends) != 0) {
+        return nullptr;
+    }
+    const pid_t child = fork();
+    if (child == 0) {
+        dup2(ends[1], STDOUT_FILENO);
+        close(ends[0]);
+        close(ends[1]);
+        execv(path, arguments.data());
+        _exit(127);
+    }
+    close(ends[1]);
+    FILE *stream = fdopen(ends[0], mode);
+    programs()[stream] = child;
+    coreLibrary().streams.obtained();
+    return stream;
+}
+
+int OLIBCPclose(FILE *stream) {
+    const auto found = programs().find(stream);
+    if (found == programs().end()) {
+        ++coreLibrary().streams.misused;
+        return -1;
+    }
+    const pid_t child = found->second;
+    programs().erase(found);
+    coreLibrary().streams.givenBack();
+    fclose(stream);
+    int status = -1;
+    return waitpid(child, &status, 0) == child ? status : -1;
+}
+}

@@ -1,0 +1,32 @@
+// SPDX-License-Identifier: Apache-2.0
+
+// What the appliance's web server listens on, as the test says.
+
+#include "stand_in.h"
+
+#include <ovraw3/talo.h>
+
+OvraVendor::W3Library &OvraVendor::w3Library() {
+    static W3Library library;
+    return library;
+}
+
+namespace ovraw3 {
+
+Talo::Talo() {
+    OvraVendor::w3Library().clients.obtained();
+}
+
+Talo::~Talo() {
+    OvraVendor::w3Library().clients.givenBack();
+}
+
+int Talo::GetHttpPort() {
+    return OvraVendor::w3Library().http;
+}
+
+int Talo::GetHttpsPort() {
+    return OvraVendor::w3Library().https;
+}
+
+} // namespace ovraw3

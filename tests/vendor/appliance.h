@@ -1,0 +1,123 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include "support/local_node.h"
+
+#include <ovradrcore/json.h>
+#include <ovradrnode/ovradrnode.h>
+#include <ovravendor/stand_in.h>
+
+#include <gtest/gtest.h>
+
+#include <algorithm>
+#include <string>
+#include <vector>
+
+namespace OvraTest {
+
+inline Json::Value json(const std::string &text) {
+    Json::Value value;
+    OvraDRCore::fromString(value, text);
+    return value;
+}
+
+/// A node behind one endpoint, which does what nodes ask of each other. Its account is "joe" with
+/// the password "pw".
+class PeerNode {
+public:
+    explicit PeerNode(const std::string &host, const std::string &nodeId = "n1")
+        : conn(OvraDRNode::Conn::https(host, 5001))
+        , remote(OvraVendor::credentialLibrary().remotes["https://" + host + ":5001"])
+        , nodeId_(nodeId) {
+        remote.accounts = {{"joe", {"pw"}}};
+        remote.answer = [this](const OvraVendor::Call &call) { return answer(call); };
+    }
+
+    /// What "method" or "session method" is answered from now on, as JSON text.
+    std::map<std::string, std::string> answers;
+    OvraDRNode::Conn conn;
+    OvraVendor::Remote &remote;
+
+    /// "session method" of each call since the last time this was asked, joined by ", ".
+    std::string calls() {
+        std::string text;
+        for (const OvraVendor::Call &call : remote.calls) {
+            text += (text.empty() ? "" : ", ") + call.session + " " + call.method;
+        }
+        remote.calls.clear();
+        return text;
+    }
+    /// The first call of `method` so far; an empty one when there was none.
+    OvraVendor::Call callOf(const std::string &method) const {
+        for (const OvraVendor::Call &call : remote.calls) {
+            if (call.method == method) {
+                return call;
+            }
+        }
+        return {};
+    }
+    /// Stores a credential for this node whose session it knows.
+    void grant(const std::string &credId, const std::string &session) {
+        remote.sessions.insert(session);
+        executeSql("INSERT INTO node_cred VALUES ('" + conn.addr + "', 'https', 5001, '" + credId +
+                   "', '" + nodeId_ + "', '" + session + "')");
+    }
+
+private:
+    Json::Value answer(const OvraVendor::Call &call) {
+        for (const std::string &name : {call.session + " " + call.method, call.method}) {
+            const auto found = answers.find(name);
+            if (found != answers.end()) {
+                return json(found->second);
+            }
+        }
+        Json::Value data(Json::objectValue);
+        if (call.api == "OVRA.DR.Node" && call.method == "info") {
+            data = json(R"({"serial":"S1","hostname":"peer","additional":{"timezone":"UTC"}})");
+            data["node_id"] = nodeId_;
+        } else if (call.api == "OVRA.DR.Node" && call.method == "test_connection") {
+            data = call.params["conns"][0];
+        } else if (call.api == "OVRA.DR.Node" && call.method == "test_download_speed") {
+            data["speed"] = "11 MB/s";
+        } else if (call.api == "OVRA.DR.Node.Session" && call.method == "get") {
+            data["account"] = "joe";
+        } else if (call.api == "OVRA.DR.Node.Session" && call.method == "delete") {
+            remote.sessions.erase(call.params["session"].asString());
+        } else if (call.api == "OVRA.DR.Node.Session") {
+            const std::string session = "granted-" + std::to_string(++granted_);
+            remote.sessions.insert(session);
+            data["session"] = session;
+        } else if (call.api == "OVRA.DR.Node.Credential") {
+            data["src_cred"]["cred_id"] = "r1";
+        }
+        Json::Value document;
+        document["success"] = true;
+        document["data"] = data;
+        return document;
+    }
+
+    std::string nodeId_;
+    int granted_ = 0;
+};
+
+/// A provisioned node on the stand-ins. Each case ends with every resource of the appliance's
+/// libraries given back, once.
+class Appliance : public testing::Test {
+protected:
+    void SetUp() override {
+        provisionNode();
+        OvraVendor::webApiLibrary().answer = [](const OvraVendor::Call &call,
+                                                const std::string &user) {
+            const bool known = user == "admin" && call.params["name"] == "joe";
+            return json(known ? R"({"success":true})"
+                              : R"({"success":false,"error":{"code":3106}})");
+        };
+    }
+    void TearDown() override { EXPECT_EQ(OvraVendor::leftOver(), ""); }
+
+    static std::string rows() {
+        return querySql("SELECT node_id, addr, session FROM node_cred ORDER BY rowid");
+    }
+};
+
+} // namespace OvraTest
