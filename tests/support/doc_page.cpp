@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "support/doc_page.h"
 
+#include <filesystem>
 #include <fstream>
 #include <sstream>
 #include <stdexcept>
@@ -61,6 +62,17 @@ std::vector<DocPage::Row> DocPage::rows(const std::string &heading) const {
         }
     }
     return rows;
+}
+
+std::vector<std::string> docPages() {
+    std::vector<std::string> pages = {"README.md", "CONTRIBUTING.md", "SECURITY.md",
+                                      "lab/README.md"};
+    for (const auto &entry : std::filesystem::directory_iterator(OVRA_SOURCE_DIR "/docs")) {
+        if (entry.path().extension() == ".md") {
+            pages.push_back("docs/" + entry.path().filename().string());
+        }
+    }
+    return pages;
 }
 
 std::vector<std::string> codeIn(const std::string &text) {

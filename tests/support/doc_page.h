@@ -26,6 +26,9 @@ private:
     std::vector<Section> sections_;
 };
 
+/// The pages that describe what there is now, from the top of the source tree.
+std::vector<std::string> docPages();
+
 /// What stands between backticks, and each line of blocks of code.
 std::vector<std::string> codeIn(const std::string &text);
 

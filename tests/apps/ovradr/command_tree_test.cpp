@@ -179,10 +179,15 @@ TEST_F(CommandTree, isDocumentedAsAWhole) {
     }
 }
 
+TEST_F(CommandTree, showsAnExampleOfEveryCommand) {
+    for (const auto &[command, node] : commands_) {
+        EXPECT_NE(node->get_footer().find("ovradr " + command), std::string::npos)
+            << "--help of `ovradr " << command << "` has no example: add one to its footer";
+    }
+}
+
 TEST_F(CommandTree, isAllThatPagesMention) {
-    for (const char *name :
-         {kPage, "docs/architecture.md", "docs/changing.md", "docs/farlinkd.md", "docs/files.md",
-          "docs/ovradrd.md", "docs/wire.md", "README.md", "SECURITY.md", "lab/README.md"}) {
+    for (const std::string &name : OvraTest::docPages()) {
         const DocPage page(name);
         for (const DocPage::Section &section : page.sections()) {
             for (const Usage &usage : usagesIn(section)) {
