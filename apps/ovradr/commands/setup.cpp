@@ -102,11 +102,11 @@ Expected<SetUpStep> writeSettings(const Settings &settings) {
     const auto number = [](const std::optional<int> &value) {
         return value ? std::optional(std::to_string(*value)) : std::nullopt;
     };
-    add("hostname", settings.hostname);
-    add("serial", settings.serial);
-    add("address", settings.addresses);
-    add("http_port", number(settings.httpPort));
-    add("https_port", number(settings.httpsPort));
+    add(OvraPlatform::Setting::kHostname, settings.hostname);
+    add(OvraPlatform::Setting::kSerial, settings.serial);
+    add(OvraPlatform::Setting::kAddress, settings.addresses);
+    add(OvraPlatform::Setting::kHttpPort, number(settings.httpPort));
+    add(OvraPlatform::Setting::kHttpsPort, number(settings.httpsPort));
     std::string names;
     for (const auto &[key, value] : given) {
         if (OLIBCFileSetKeyValue(OvraPlatform::kConfigFile, key, value.c_str(), "%s=\"%s\"\n") <

@@ -58,7 +58,7 @@ bool isAddress(const std::string &text) {
 }
 
 void readAddresses(const Lines &lines, ApplianceConfig &config) {
-    const std::string list = valueOf(lines, "address");
+    const std::string list = valueOf(lines, Setting::kAddress);
     config.servesAllAddresses = list.empty();
     for (std::size_t begin = 0; begin < list.size();) {
         const std::size_t comma = std::min(list.find(',', begin), list.size());
@@ -142,14 +142,14 @@ ApplianceConfig readApplianceConfig(const std::string &path) {
     }
     const Lines lines = parseKeyValueLines(text);
     nameBrokenLines(lines, config.problems);
-    readPort(lines, "http_port", config.httpPort, config.problems);
-    readPort(lines, "https_port", config.httpsPort, config.problems);
+    readPort(lines, Setting::kHttpPort, config.httpPort, config.problems);
+    readPort(lines, Setting::kHttpsPort, config.httpsPort, config.problems);
     if (error == 0) {
         readAddresses(lines, config);
     }
-    readText(lines, "hostname", kMaxHostname, isHostnameCharacter, config.hostname,
+    readText(lines, Setting::kHostname, kMaxHostname, isHostnameCharacter, config.hostname,
              config.problems);
-    readText(lines, "serial", kMaxSerial, isPrintable, config.serial, config.problems);
+    readText(lines, Setting::kSerial, kMaxSerial, isPrintable, config.serial, config.problems);
     logOnce(path, config.problems);
     return config;
 }
