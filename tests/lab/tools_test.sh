@@ -89,6 +89,8 @@ factsAreMissedWhereTheyAreForgotten() {
     checkFacts 'docs/ovradrd.md: no fact about a node: timezone' docs/ovradrd.md 's/known: `timezone`/known: zone/'
     checkFacts 'docs/wire.md: no row for the method release' docs/wire.md '/^| `release`/d'
     checkFacts 'names `ovradr set up`' apps/ovradrd/main.cpp 's/`ovradr setup`/`ovradr set up`/'
+    checkFacts 'does not name conn_test.cpp' tests/model/CMakeLists.txt 's/ conn_test.cpp//'
+    checkFacts 'no include of node_db.h' include/ovradrnode/ovradrnode.h '/node_db.h/d'
     checkFacts 'links to file.md' docs/architecture.md 's/(files.md)/(file.md)/'
     checkFacts 'names src/creds, which is not there' docs/architecture.md 's:`src/cred`:`src/creds`:'
     checkFacts 'no such heading' docs/farlinkd.md 's/wire.md#the-relay/wire.md#relays/'

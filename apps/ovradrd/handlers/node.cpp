@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "handlers/handlers.h"
 #include "handlers/params.h"
+#include "handlers/words.h"
 #include "ovradrnode/dr_node.h"
 #include "ovradrnode/sender.h"
 #include "timezone.h"
@@ -101,11 +102,10 @@ Json::Value testConnection(const Json::Value &params, const APICaller & /*caller
 void addNodeAPI(OvraPlatform::APIRegistry &registry) {
     using OvraPlatform::APILane;
     using OvraPlatform::APIRight;
-    constexpr char kApi[] = "OVRA.DR.Node";
-    registry.add(kApi, 1, "info", APIRight::kSession, APILane::kQuick, info);
-    registry.add(kApi, 1, "test_privilege", APIRight::kAdministrator, APILane::kQuick,
+    registry.add(kNodeApi, 1, "info", APIRight::kSession, APILane::kQuick, info);
+    registry.add(kNodeApi, 1, "test_privilege", APIRight::kAdministrator, APILane::kQuick,
                  testPrivilege);
-    registry.add(kApi, 1, "test_connection", APIRight::kAdministrator, APILane::kSlow,
+    registry.add(kNodeApi, 1, "test_connection", APIRight::kAdministrator, APILane::kSlow,
                  testConnection);
 }
 
