@@ -192,8 +192,7 @@ private:
     }
 
     Failure senderFailure(const Response &response) const {
-        Failure found = response.isValid() ? failureOf(response.getErrCode(), response.getErrMsg())
-                                           : failureOf(sender_->GetErrCode(), sender_->GetErrMsg());
+        Failure found = failureOf(response, *sender_);
         found.message = targetText(conn_) + ": " + found.message;
         return found;
     }

@@ -5,6 +5,7 @@
 
 #include <ovradrcore/err_recorder.h>
 #include <ovradrcore/json.h>
+#include <ovradrcore/response.h>
 
 #include <credential/cred_errors.h>
 #include <unistd.h>
@@ -193,6 +194,14 @@ Failure failureOf(int code, const Json::Value &detail) {
     }
     addDetail(found, saysItAll(code) ? "" : detailText(code, detail));
     return found;
+}
+
+Failure failureOf(const OvraDRCore::Response &answer, const OvraDRCore::ErrRecorder &sender) {
+    if (answer.isValid()) {
+        return failureOf(answer.getErrCode(), answer.getErrMsg());
+    }
+    return failureOf(sender.GetErrCode() == ERR::kNone ? ERR::kFailed : sender.GetErrCode(),
+                     sender.GetErrMsg());
 }
 
 } // namespace Ovradr

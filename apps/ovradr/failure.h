@@ -8,6 +8,11 @@
 #include <utility>
 #include <variant>
 
+namespace OvraDRCore {
+class ErrRecorder;
+class Response;
+} // namespace OvraDRCore
+
 namespace Ovradr {
 
 /// What the program exits with; docs/ovradr.md tells scripts.
@@ -51,6 +56,9 @@ Failure storeFailure(ExitCode exit, const std::string &sentences);
 /// The failure that an error code of the library or of the web API stands for.
 /// \param detail  what came with the code; null when nothing did
 Failure failureOf(int code, const Json::Value &detail = Json::Value());
+
+/// Why a request had no success: what was answered, otherwise what its sender recorded.
+Failure failureOf(const OvraDRCore::Response &answer, const OvraDRCore::ErrRecorder &sender);
 
 /// A value, or why there is none.
 template <typename T>

@@ -75,8 +75,7 @@ Expected<Json::Value> askNode(const std::string &nodeId) {
     if (answer.isSuccess()) {
         return answer.getData();
     }
-    return answer.isValid() ? failureOf(answer.getErrCode(), answer.getErrMsg())
-                            : failureOf(sender.GetErrCode(), sender.GetErrMsg());
+    return failureOf(answer, sender);
 }
 
 Outcome nodeInfo(const NodeInfoOptions &options) {

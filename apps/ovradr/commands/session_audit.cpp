@@ -69,11 +69,7 @@ Expected<Json::Value> ask(const std::string &nodeId, const char *method,
     if (answer.isSuccess()) {
         return answer.getData();
     }
-    if (answer.isValid()) {
-        return failureOf(answer.getErrCode(), answer.getErrMsg());
-    }
-    return failureOf(sender.GetErrCode() == ERR::kNone ? ERR::kFailed : sender.GetErrCode(),
-                     sender.GetErrMsg());
+    return failureOf(answer, sender);
 }
 
 Expected<std::vector<HeldCred>> heldCreds(const std::string &nodeId, const std::string &localId) {

@@ -1,11 +1,9 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "appliance.h"
 #include "handlers/auth.h"
-#include "ovradrnode/node_api.h"
 #include "support/doc_page.h"
 #include "webapi/api_registry.h"
 
-#include <algorithm>
 #include <map>
 
 namespace {
@@ -40,12 +38,7 @@ std::string queueOf(const APIRegistry::Method &method) {
     return method.lane == APILane::kQuick ? "quick" : "slow";
 }
 
-class Registry : public OvraTest::Appliance {
-protected:
-    static std::vector<APIRegistry::Method> registered() {
-        return APIRegistry::hosted()->methods();
-    }
-};
+class Registry : public OvraTest::Appliance {};
 
 TEST_F(Registry, isDocumentedWithItsRightsAndQueues) {
     std::map<std::string, OvraTest::DocPage::Row> rows;
@@ -54,7 +47,7 @@ TEST_F(Registry, isDocumentedWithItsRightsAndQueues) {
         EXPECT_TRUE(rows.emplace(row[0], row).second)
             << "docs/ovradrd.md has two rows for " << row[0] << ": remove one";
     }
-    for (const APIRegistry::Method &method : registered()) {
+    for (const APIRegistry::Method &method : APIRegistry::hosted()->methods()) {
         const std::string name = nameOf(method.api, method.version, method.method);
         const auto row = rows.find(name);
         if (row == rows.end()) {
@@ -74,43 +67,6 @@ TEST_F(Registry, isDocumentedWithItsRightsAndQueues) {
     for (const auto &[name, row] : rows) {
         ADD_FAILURE() << "docs/ovradrd.md describes " << name
                       << ", which the daemon does not register: correct or remove the row";
-    }
-}
-
-TEST_F(Registry, answersWhatTheLibraryAsks) {
-    namespace WebAPI = OvraDRNode::WebAPI;
-    const OvraDRNode::Conn conn("192.0.2.1", "https", 5001);
-    const OvraDRCore::Request info = WebAPI::getDRNodeInfoAPI({});
-    const OvraDRCore::Request requests[] = {
-        info,
-        WebAPI::OvraCoreUserGetAPI("a"),
-        WebAPI::getDRNodeSessionCreateAPI("n"),
-        WebAPI::getDRNodeSessionTempCreateAPI(),
-        WebAPI::getDRNodeSessionDeleteAPI("s"),
-        WebAPI::getDRNodeSessionGetAPI("s"),
-        WebAPI::getDRNodeTestPrivilegeAPI(),
-        WebAPI::getDRNodeTestConnectionAPI({conn}),
-        WebAPI::getDRNodeTestSyncSpeedAPI("n", 0, 1),
-        WebAPI::getDRNodeTestDownloadSpeedAPI("http://n:1/", 0, 1),
-        WebAPI::getDRNodeCredCreateAPI("c"),
-        WebAPI::getDRNodeCredGetAPI("c"),
-        WebAPI::getDRNodeCredSetAPI("c", conn, "a", "p", ""),
-        WebAPI::getDRNodeCredRelayAPI("c", info),
-        WebAPI::getDRNodeCredReverseCreateAPI("c", conn),
-        WebAPI::getDRNodeTestCredReverseCreateAPI("c", conn),
-        WebAPI::getDRNodeTestCredCreateAPI(conn, "a", "s"),
-        WebAPI::getDRNodeTestCredSetAPI("c", conn, "a", "p", ""),
-        WebAPI::getDRNodeTempCredCreateAPI(conn, "s"),
-        WebAPI::getDRNodeTempCredReverseCreateAPI("c", conn),
-    };
-    const std::vector<APIRegistry::Method> methods = registered();
-    for (const OvraDRCore::Request &request : requests) {
-        const bool known = std::any_of(methods.begin(), methods.end(), [&](const auto &method) {
-            return method.api == request.getAPI() && method.version == request.getVersion() &&
-                   method.method == request.getMethod();
-        });
-        EXPECT_TRUE(known) << "no handler is registered for "
-                           << nameOf(request.getAPI(), request.getVersion(), request.getMethod());
     }
 }
 
