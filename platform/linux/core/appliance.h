@@ -66,6 +66,10 @@ struct ApplianceConfig {
 /// that does not exist is an appliance with defaults.
 OVRAPLATFORM_EXPORT ApplianceConfig readApplianceConfig(const std::string &path = kConfigFile);
 
+/// What is wrong with a value for a setting: one sentence, "" when nothing is.
+/// \param key  one of namespace Setting
+OVRAPLATFORM_EXPORT std::string settingProblem(const std::string &key, const std::string &value);
+
 /// Makes the state directory, mode 0700, and what is missing above it, mode 0755. One that exists
 /// must be a directory of our own user that nobody else can write to.
 /// \param path  kStateDir, or a path that stands for it
