@@ -1,11 +1,12 @@
 #!/bin/bash
 # SPDX-License-Identifier: Apache-2.0
-# options_test.sh PROGRAM PAGE: the page names every option of the program, and no other.
+# options_test.sh PROGRAM PAGE: the page names every option of the program, and no other. OVRA_PAGES names
+# another folder than the source tree.
 set -euo pipefail
 program=$1 page=$2
 options() { grep -oE -- '--[a-z][a-z-]*' | sort -u; }
 
-cd "$(dirname "$0")/../.."
+cd "${OVRA_PAGES:-$(dirname "$0")/../..}"
 has=$("$program" --help | options)
 # In code, but not where another program is called.
 # shellcheck disable=SC2016

@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "support/doc_page.h"
 
+#include <cstdlib>
 #include <filesystem>
 #include <fstream>
 #include <sstream>
@@ -14,6 +15,11 @@ std::string trimmed(const std::string &text) {
     const std::size_t first = text.find_first_not_of(' ');
     return first == std::string::npos ? std::string()
                                       : text.substr(first, text.find_last_not_of(' ') - first + 1);
+}
+
+std::string treeTop() {
+    const char *const other = std::getenv("OVRA_PAGES");
+    return other != nullptr ? other : OVRA_SOURCE_DIR;
 }
 
 DocPage::Row cellsOf(const std::string &line) {
@@ -33,7 +39,7 @@ DocPage::Row cellsOf(const std::string &line) {
 } // namespace
 
 DocPage::DocPage(const std::string &path) {
-    std::ifstream file(OVRA_SOURCE_DIR "/" + path);
+    std::ifstream file(treeTop() + "/" + path);
     if (!file) {
         throw std::runtime_error(path + " cannot be read");
     }
@@ -67,7 +73,7 @@ std::vector<DocPage::Row> DocPage::rows(const std::string &heading) const {
 std::vector<std::string> docPages() {
     std::vector<std::string> pages = {"README.md", "CONTRIBUTING.md", "SECURITY.md",
                                       "lab/README.md"};
-    for (const auto &entry : std::filesystem::directory_iterator(OVRA_SOURCE_DIR "/docs")) {
+    for (const auto &entry : std::filesystem::directory_iterator(treeTop() + "/docs")) {
         if (entry.path().extension() == ".md") {
             pages.push_back("docs/" + entry.path().filename().string());
         }

@@ -6,7 +6,8 @@
 
 namespace OvraTest {
 
-/// A page of docs/, read for the facts that stand in it.
+/// A page of docs/, read for the facts that stand in it. OVRA_PAGES names another folder than the
+/// source tree.
 class DocPage {
 public:
     struct Section {
@@ -15,7 +16,7 @@ public:
     };
     using Row = std::vector<std::string>;
 
-    /// \param path  from the top of the source tree
+    /// \param path  from the top of the tree
     explicit DocPage(const std::string &path);
 
     const std::vector<Section> &sections() const { return sections_; }
@@ -26,7 +27,7 @@ private:
     std::vector<Section> sections_;
 };
 
-/// The pages that describe what there is now, from the top of the source tree.
+/// The pages that describe what there is now, from the top of the tree.
 std::vector<std::string> docPages();
 
 /// What stands between backticks, and each line of blocks of code.
