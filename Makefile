@@ -50,8 +50,8 @@ build/bench/build.ninja: CMakePresets.json
 format: deps-check ## put every C++ file into the one layout
 	@tools/sources cpp | xargs -0 clang-format -i
 
-check: deps-check ## what CI asks of every change, without the builds
-	@tools/check-format && tools/check-scripts && tools/check-layers && tools/check-leftovers
+check: deps-build deps-check ## what CI asks of every change, without the builds
+	@tools/check
 
 clean: ## remove everything that was made
 	rm -rf build

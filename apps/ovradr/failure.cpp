@@ -4,6 +4,7 @@
 #include "target.h"
 
 #include <ovradrcore/json.h>
+#include <ovradrcore/response.h>
 #include <ovraplatform/api_errors.h>
 #include <ovraplatform/cred_errors.h>
 
@@ -16,6 +17,13 @@
 namespace Ovradr {
 
 namespace {
+
+/// The names of what this program finds itself, in the order of the exit codes.
+constexpr std::array kExitNames = {
+    "ok",          "failed",    "usage",         "not_reachable", "login_refused", "one_time_code",
+    "certificate", "not_found", "not_permitted", "not_set_up",    "name_unknown",  "no_appliance",
+    "wrong_node",  "clock",
+};
 
 namespace ERR = OvraDRCore::ERR;
 namespace APIError = OvraPlatform::APIError;
@@ -172,6 +180,11 @@ void addDetail(Failure &found, const std::string &detail) {
 }
 
 } // namespace
+
+Failure failure(ExitCode exit, const std::string &message, const std::string &hint) {
+    const int number = static_cast<int>(exit);
+    return {exit, number, kExitNames.at(static_cast<std::size_t>(number)), message, hint};
+}
 
 Failure storeFailure(ExitCode exit, const std::string &sentences) {
     const std::size_t end = sentences.find(". ");

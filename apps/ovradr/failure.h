@@ -10,6 +10,11 @@
 #include <utility>
 #include <variant>
 
+namespace OvraDRCore {
+class ErrRecorder;
+class Response;
+} // namespace OvraDRCore
+
 namespace Ovradr {
 
 /// What the program exits with; docs/ovradr.md tells scripts.

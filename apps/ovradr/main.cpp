@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 // ovradr: the command line of an appliance. docs/ovradr.md describes it.
-#include "commands/commands.h"
+#include "command_tree.h"
 #include "output.h"
 
 #include <algorithm>
@@ -16,7 +16,6 @@ namespace Ovradr {
 
 namespace {
 
-constexpr std::string_view kJsonFlag = "--json";
 constexpr std::string_view kOneTimeCodeOption = "--otp";
 
 /// Takes the arguments over and wipes a one-time code from where every process can see it.
@@ -34,35 +33,6 @@ std::vector<std::string> takeArguments(int argc, char **argv) {
         arguments.push_back(argument);
     }
     return arguments;
-}
-
-void describe(CLI::App &app, bool &json, Command &chosen) {
-    app.fallthrough();
-    app.require_subcommand(1);
-    app.set_version_flag("--version", "ovradr " OVRADR_VERSION);
-    app.add_flag(std::string(kJsonFlag), json,
-                 "One JSON document on standard output, also for an error");
-    app.footer(
-        "Exit codes: 0 ok, 1 failed, 2 usage, 3 not reachable, 4 log-in refused, 5 one-time "
-        "code,\n  6 key not trusted, 7 not found, 8 not permitted, 9 not set up;\n  of doctor "
-        "also 10 name unknown, 11 no appliance, 12 wrong node, 13 clocks\n"
-        "Examples:\n"
-        "  ovradr setup\n"
-        "  ovradr user add repl --admin\n"
-        "  ovradr cred create https://nas2 --account repl\n"
-        "  ovradr call 3f2a OVRA.DR.Node info");
-    addSetupCommand(app, chosen);
-    addNodeCommands(app, chosen);
-    addUserCommands(app, chosen);
-    addCredCommands(app, chosen);
-    addSessionCommands(app, chosen);
-    addCallCommand(app, chosen);
-    addConnCommands(app, chosen);
-    addAttrCommands(app, chosen);
-    addWhyCommand(app, chosen);
-    addDoctorCommand(app, chosen);
-    addSpeedCommand(app, chosen);
-    addFarlinkCommands(app, chosen);
 }
 
 constexpr const char *kHelpHint =
@@ -103,7 +73,7 @@ int run(int argc, char **argv) {
     bool json = std::find(arguments.begin(), arguments.end(), kJsonFlag) != arguments.end();
     CLI::App app("The command line of a replication node.", "ovradr");
     Command chosen;
-    describe(app, json, chosen);
+    addCommandTree(app, json, chosen);
     try {
         std::reverse(arguments.begin(), arguments.end());
         app.parse(arguments);

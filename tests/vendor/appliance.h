@@ -17,7 +17,7 @@ namespace OvraTest {
 
 inline Json::Value json(const std::string &text) {
     Json::Value value;
-    OvraDRCore::fromString(value, text);
+    EXPECT_TRUE(OvraDRCore::fromString(value, text)) << text;
     return value;
 }
 

@@ -53,7 +53,7 @@ TEST_F(Appliance, GivesTheNodeItsIdentity) {
     EXPECT_TRUE(DRNode::resetLocalNodeId());
     EXPECT_NE(DRNode::getLocalNodeId(), id);
 
-    DRNode::resetLocalNodeId();
+    ASSERT_TRUE(DRNode::resetLocalNodeId());
     coreLibrary().readOnly = true;
     EXPECT_EQ(DRNode::getLocalNodeId(), "") << "a value that was not stored is none";
 

@@ -16,7 +16,6 @@
 
 #include <unistd.h>
 
-#include <algorithm>
 #include <array>
 #include <memory>
 #include <optional>
@@ -27,9 +26,8 @@ namespace Ovradr {
 namespace {
 
 using OvraPlatform::ApplianceConfig;
+namespace Setting = OvraPlatform::Setting;
 
-constexpr std::size_t kMaxHostname = 253; // RFC 1035, 2.3.4, as text
-constexpr std::size_t kMaxSerial = 64;
 constexpr int kMaxInterfaces = 32;
 
 /// The settings that were given; those that were not stay as they are.
@@ -41,37 +39,10 @@ struct Settings {
     std::optional<int> httpsPort;
 };
 
-// CLI11 validators: "" when the text is fine, otherwise why not.
-
-std::string checkHostname(const std::string &text) {
-    const bool valid =
-        text.size() <= kMaxHostname && std::all_of(text.begin(), text.end(), [](char c) {
-            return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z') || (c >= '0' && c <= '9') ||
-                   c == '-' || c == '.' || c == '_';
-        });
-    return valid ? "" : "a host name has letters, digits, \"-\", \".\" and \"_\"";
-}
-
-std::string checkSerial(const std::string &text) {
-    const bool valid = text.size() <= kMaxSerial &&
-                       std::all_of(text.begin(), text.end(),
-                                   [](char c) { return c >= ' ' && c <= '~' && c != '"'; });
-    return valid ? "" : "a serial number has at most 64 characters of ASCII without quotes";
-}
-
-std::string checkAddresses(const std::string &text) {
-    if (std::count(text.begin(), text.end(), ',') >= kMaxInterfaces) {
-        return "there may be 32 addresses at most";
-    }
-    for (std::size_t begin = 0; begin < text.size();) {
-        const std::size_t comma = std::min(text.find(',', begin), text.size());
-        const std::string address = text.substr(begin, comma - begin);
-        if (!OvraBase::isNumericAddress(address)) {
-            return "\"" + address + "\" is not a numeric IPv4 or IPv6 address";
-        }
-        begin = comma + 1;
-    }
-    return "";
+/// Refuses what the daemon could not use.
+CLI::Validator usableAs(const char *key) {
+    return {[key](const std::string &text) { return OvraPlatform::settingProblem(key, text); }, "",
+            ""};
 }
 
 Trouble makeFolders() {
@@ -99,11 +70,11 @@ Expected<SetUpStep> writeSettings(const Settings &settings) {
     const auto number = [](const std::optional<int> &value) {
         return value ? std::optional(std::to_string(*value)) : std::nullopt;
     };
-    add("hostname", settings.hostname);
-    add("serial", settings.serial);
-    add("address", settings.addresses);
-    add("http_port", number(settings.httpPort));
-    add("https_port", number(settings.httpsPort));
+    add(Setting::kHostname, settings.hostname);
+    add(Setting::kSerial, settings.serial);
+    add(Setting::kAddress, settings.addresses);
+    add(Setting::kHttpPort, number(settings.httpPort));
+    add(Setting::kHttpsPort, number(settings.httpsPort));
     std::string names;
     for (const auto &[key, value] : given) {
         if (OLIBCFileSetKeyValue(OvraPlatform::kConfigFile, key, value.c_str(), "%s=\"%s\"\n") <
@@ -279,14 +250,14 @@ void addSetupCommand(CLI::App &app, Command &chosen) {
         "setup", "Make what a fresh machine needs: folders, database, keys, node id, scripts.");
     const auto settings = std::make_shared<Settings>();
     command->add_option("--hostname", settings->hostname, "Name of this appliance")
-        ->check(checkHostname);
+        ->check(usableAs(Setting::kHostname));
     command
         ->add_option("--serial", settings->serial, "Serial number to show instead of the machine's")
-        ->check(checkSerial);
+        ->check(usableAs(Setting::kSerial));
     command
         ->add_option("--address", settings->addresses,
                      "Numeric addresses to serve at, separated by commas; \"\" for all")
-        ->check(checkAddresses);
+        ->check(usableAs(Setting::kAddress));
     command->add_option("--http-port", settings->httpPort, "Port for HTTP (5000)")
         ->check(CLI::Range(1, OvraBase::kMaxPort));
     command->add_option("--https-port", settings->httpsPort, "Port for HTTPS (5001)")

@@ -8,11 +8,7 @@ namespace Ovradrd {
 
 namespace {
 
-Json::Value getFarlink(const FarlinkAgent &agent, const OvraPlatform::APICaller &caller) {
-    if (!caller.local) {
-        return OvraPlatform::apiError(OvraPlatform::APIError::kNoPermission,
-                                      "the relay service is asked about on the appliance itself");
-    }
+Json::Value getFarlink(const FarlinkAgent &agent) {
     std::string problem;
     const OvraPlatform::FarlinkSettings settings = OvraPlatform::readFarlinkSettings(problem);
     Json::Value data(Json::objectValue);
@@ -35,11 +31,12 @@ Json::Value getFarlink(const FarlinkAgent &agent, const OvraPlatform::APICaller 
 } // namespace
 
 void addFarlinkAPI(OvraPlatform::APIRegistry &registry, const FarlinkAgent &agent) {
-    registry.add("OVRA.Core.Farlink", 1, "get", OvraPlatform::APIRight::kAdministrator,
-                 OvraPlatform::APIQueue::kQuick,
-                 [&agent](const Json::Value & /*params*/, const OvraPlatform::APICaller &caller) {
-                     return getFarlink(agent, caller);
-                 });
+    registry.add(
+        "OVRA.Core.Farlink", 1, "get", OvraPlatform::APIRight::kLocal,
+        OvraPlatform::APIQueue::kQuick,
+        [&agent](const Json::Value & /*params*/, const OvraPlatform::APICaller & /*caller*/) {
+            return getFarlink(agent);
+        });
 }
 
 } // namespace Ovradrd

@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "handlers/handlers.h"
 #include "handlers/params.h"
+#include "handlers/words.h"
 #include "timezone.h"
 #include "version.h"
 
@@ -101,11 +102,10 @@ Json::Value testConnection(const Json::Value &params, const APICaller & /*caller
 void addNodeAPI(OvraPlatform::APIRegistry &registry) {
     using OvraPlatform::APIQueue;
     using OvraPlatform::APIRight;
-    constexpr char kApi[] = "OVRA.DR.Node";
-    registry.add(kApi, 1, "info", APIRight::kSession, APIQueue::kQuick, info);
-    registry.add(kApi, 1, "test_privilege", APIRight::kAdministrator, APIQueue::kQuick,
+    registry.add(kNodeApi, 1, "info", APIRight::kSession, APIQueue::kQuick, info);
+    registry.add(kNodeApi, 1, "test_privilege", APIRight::kAdministrator, APIQueue::kQuick,
                  testPrivilege);
-    registry.add(kApi, 1, "test_connection", APIRight::kAdministrator, APIQueue::kSlow,
+    registry.add(kNodeApi, 1, "test_connection", APIRight::kAdministrator, APIQueue::kSlow,
                  testConnection);
 }
 

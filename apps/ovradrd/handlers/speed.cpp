@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "handlers/handlers.h"
 #include "handlers/params.h"
+#include "handlers/words.h"
 
 #include <ovradrcore/err_recorder.h>
 #include <ovradrnode/node.h>
@@ -113,10 +114,9 @@ Json::Value testSyncSpeed(const Json::Value &params, const APICaller & /*caller*
 void addSpeedAPI(OvraPlatform::APIRegistry &registry) {
     using OvraPlatform::APIQueue;
     using OvraPlatform::APIRight;
-    constexpr char kApi[] = "OVRA.DR.Node";
-    registry.add(kApi, 1, "test_download_speed", APIRight::kAdministrator, APIQueue::kSlow,
+    registry.add(kNodeApi, 1, "test_download_speed", APIRight::kAdministrator, APIQueue::kSlow,
                  testDownloadSpeed);
-    registry.add(kApi, 1, "test_sync_speed", APIRight::kAdministrator, APIQueue::kSlow,
+    registry.add(kNodeApi, 1, "test_sync_speed", APIRight::kAdministrator, APIQueue::kSlow,
                  testSyncSpeed);
 }
 

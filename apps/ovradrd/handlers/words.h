@@ -4,6 +4,7 @@
 /// Names that more than one family of calls uses.
 namespace Ovradrd {
 
+inline constexpr char kNodeApi[] = "OVRA.DR.Node";
 inline constexpr char kCredentialApi[] = "OVRA.DR.Node.Credential";
 inline constexpr char kRelay[] = "relay";
 

@@ -50,7 +50,7 @@ void readPort(const Lines &lines, const char *key, int &port, std::vector<std::s
 }
 
 void readAddresses(const Lines &lines, ApplianceConfig &config) {
-    const std::string list = valueOf(lines, "address");
+    const std::string list = valueOf(lines, Setting::kAddress);
     config.servesAllAddresses = list.empty();
     for (std::size_t begin = 0; begin < list.size();) {
         const std::size_t comma = std::min(list.find(',', begin), list.size());
@@ -100,6 +100,15 @@ void nameBrokenLines(const Lines &lines, std::vector<std::string> &problems) {
     }
 }
 
+void takeSettings(const Lines &lines, ApplianceConfig &config) {
+    readPort(lines, Setting::kHttpPort, config.httpPort, config.problems);
+    readPort(lines, Setting::kHttpsPort, config.httpsPort, config.problems);
+    readAddresses(lines, config);
+    readText(lines, Setting::kHostname, kMaxHostname, isHostnameCharacter, config.hostname,
+             config.problems);
+    readText(lines, Setting::kSerial, kMaxSerial, isPrintable, config.serial, config.problems);
+}
+
 /// The settings are read often: the same problems are logged once a process.
 void logOnce(const std::string &path, const std::vector<std::string> &problems) {
     static std::mutex mutex;
@@ -133,16 +142,23 @@ ApplianceConfig readApplianceConfig(const std::string &path) {
     }
     const Lines lines = parseKeyValueLines(text.value_or(""));
     nameBrokenLines(lines, config.problems);
-    readPort(lines, "http_port", config.httpPort, config.problems);
-    readPort(lines, "https_port", config.httpsPort, config.problems);
     if (text) {
-        readAddresses(lines, config);
+        takeSettings(lines, config);
     }
-    readText(lines, "hostname", kMaxHostname, isHostnameCharacter, config.hostname,
-             config.problems);
-    readText(lines, "serial", kMaxSerial, isPrintable, config.serial, config.problems);
     logOnce(path, config.problems);
     return config;
+}
+
+std::string settingProblem(const std::string &key, const std::string &value) {
+    if (value.find('"') != std::string::npos) {
+        return key + " cannot hold quotes";
+    }
+    KeyValueLine line;
+    line.key = key;
+    line.value = value;
+    ApplianceConfig config;
+    takeSettings({line}, config);
+    return config.problems.empty() ? "" : config.problems.front();
 }
 
 bool ensureStateDir(const std::string &path) {

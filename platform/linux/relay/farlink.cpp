@@ -46,9 +46,9 @@ bool isFarlinkAlias(const std::string &text) {
 FarlinkSettings readFarlinkSettings(std::string &problem) {
     problem.clear();
     FarlinkSettings settings;
-    settings.host = setting("host");
-    settings.alias = setting("alias");
-    const std::string port = setting("port");
+    settings.host = setting(FarlinkSetting::kHost);
+    settings.alias = setting(FarlinkSetting::kAlias);
+    const std::string port = setting(FarlinkSetting::kPort);
     settings.port = port.empty() ? kFarlinkPort : OvraBase::parsePort(port).value_or(0);
     const bool usable =
         settings.port != 0 &&
@@ -68,9 +68,9 @@ bool writeFarlinkSettings(const FarlinkSettings &settings) {
     };
     // The alias goes first and comes last: what is half written never offers this appliance at
     // another service.
-    return put("alias", "") && put("host", settings.host) &&
-           put("port", std::to_string(settings.port)) &&
-           (settings.alias.empty() || put("alias", settings.alias));
+    return put(FarlinkSetting::kAlias, "") && put(FarlinkSetting::kHost, settings.host) &&
+           put(FarlinkSetting::kPort, std::to_string(settings.port)) &&
+           (settings.alias.empty() || put(FarlinkSetting::kAlias, settings.alias));
 }
 
 std::string FarlinkReply::why() const {

@@ -79,6 +79,18 @@ const APIRegistry::Entry *APIRegistry::find(const APICall &call, int &error) con
     return &entry->second;
 }
 
+std::vector<APIRegistry::Method> APIRegistry::methods() const {
+    std::vector<Method> all;
+    for (const auto &[api, methods] : apis_) {
+        for (const auto &[method, versions] : methods) {
+            for (const auto &[version, entry] : versions) {
+                all.push_back({api, version, method, entry.right, entry.queue});
+            }
+        }
+    }
+    return all;
+}
+
 APIQueue APIRegistry::queue(const APICall &call) const {
     int error = 0;
     const Entry *entry = find(call, error);
@@ -97,6 +109,10 @@ Json::Value APIRegistry::dispatch(const APICall &call, const APICaller &caller) 
     if (entry->right == APIRight::kAdministrator && !caller.administrator) {
         return apiError(APIError::kNoPermission,
                         "the call needs an administrator: use an administrator's account");
+    }
+    if (entry->right == APIRight::kLocal && !caller.local) {
+        return apiError(APIError::kNoPermission,
+                        "the call is for the appliance's own processes: make it on the appliance");
     }
     if (!call.params.isNull() && !call.params.isObject()) {
         return apiError(APIError::kBadRequest, "the parameters are not an object");

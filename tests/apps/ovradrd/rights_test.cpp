@@ -4,9 +4,11 @@
 #include "support/local_node.h"
 
 #include <ovraplatform/account_store.h>
+#include <ovraplatform/api_registry.h>
 #include <ovraplatform/session_store.h>
 #include <ovrawebapi/api_runner.h>
 
+#include <algorithm>
 #include <ctime>
 #include <filesystem>
 
@@ -39,6 +41,8 @@ const Scene kScenes[] = {
     {kNode, "none", "{}", 1, 103, 103, 103},
     {kNode, "info", "{}", 2, 104, 104, 104},
     {"OVRA.Core.Auth", "login", "{}", 2, 104, 104, 104},
+    {"OVRA.Core.Auth", "login", "{}", 1, 106, 106, 106},
+    {"OVRA.Core.Auth", "logout", "{}", 1, 119, 0, 0},
     {"OVRA.Core.Encryption", "getinfo", "{}", 1, 0, 0, 0},
     {kUser, "get", R"({"name":"user"})", 1, 119, 0, 0},
     {kUser, "get", R"({"name":"root"})", 1, 119, 105, 0},
@@ -79,8 +83,6 @@ class Rights : public Appliance {};
 TEST_F(Rights, areAskedForOfEveryCaller) {
     addAccount("user", false);
     addAccount("root", true);
-    const std::string user = session("user");
-    const std::string administrator = session("root");
     for (const Scene &scene : kScenes) {
         SCOPED_TRACE(std::string(scene.api) + " " + scene.method + " " + scene.params);
         const auto code = [&](const std::string &sid) {
@@ -88,8 +90,21 @@ TEST_F(Rights, areAskedForOfEveryCaller) {
         };
         EXPECT_EQ(code(""), scene.nobody);
         EXPECT_EQ(code("unknown-session"), scene.nobody);
-        EXPECT_EQ(code(user), scene.user);
-        EXPECT_EQ(code(administrator), scene.administrator);
+        EXPECT_EQ(code(session("user")), scene.user);
+        EXPECT_EQ(code(session("root")), scene.administrator);
+    }
+}
+
+TEST_F(Rights, areStatedHereForEveryMethod) {
+    for (const auto &method : OvraPlatform::APIRegistry::hosted()->methods()) {
+        EXPECT_TRUE(std::any_of(std::begin(kScenes), std::end(kScenes),
+                                [&](const Scene &scene) {
+                                    return scene.api == method.api &&
+                                           scene.method == method.method &&
+                                           scene.version == method.version;
+                                }))
+            << "kScenes has no row for " << method.api << " " << method.version << " "
+            << method.method << ": add one";
     }
 }
 

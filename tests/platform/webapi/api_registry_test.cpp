@@ -40,6 +40,7 @@ std::ostream &operator<<(std::ostream &out, const Scene &scene) {
 const APICaller kNobody{};
 const APICaller kUser{"ann", false, "s1", "192.0.2.1", false};
 const APICaller kAdministrator{"root", true, "s2", "192.0.2.1", false};
+const APICaller kLocal{"admin", true, "", "", true};
 
 class Dispatch : public testing::TestWithParam<Scene> {};
 
@@ -48,6 +49,7 @@ TEST_P(Dispatch, answersWithTheCodeOfTheWireForm) {
     registry.add("Open", 1, "get", APIRight::kNone, APIQueue::kQuick, echo);
     registry.add("Mine", 2, "get", APIRight::kSession, APIQueue::kQuick, echo);
     registry.add("All", 1, "set", APIRight::kAdministrator, APIQueue::kSlow, echo);
+    registry.add("Here", 1, "get", APIRight::kLocal, APIQueue::kQuick, echo);
     registry.add("Bad", 1, "throw", APIRight::kNone, APIQueue::kQuick,
                  [](const Json::Value &params, const APICaller &) -> Json::Value {
                      return apiSuccess(params["list"].asInt());
@@ -77,6 +79,11 @@ INSTANTIATE_TEST_SUITE_P(
         Scene{"no session", {"Mine", 2, "get"}, kNobody, APIError::kNoSession},
         Scene{"no session, more needed", {"All", 1, "set"}, kNobody, APIError::kNoSession},
         Scene{"no right", {"All", 1, "set"}, kUser, APIError::kNoPermission},
+        Scene{"no process of the appliance",
+              {"Here", 1, "get"},
+              kAdministrator,
+              APIError::kNoPermission},
+        Scene{"a process of the appliance", {"Here", 1, "get"}, kLocal, 0},
         Scene{"no object", {"Open", 1, "get", "text"}, kUser, APIError::kBadRequest},
         Scene{"wrong type used", {"Bad", 1, "throw", objectWithList()}, kUser, APIError::kInternal},
         Scene{"not an exception", {"Bad", 1, "throw_number"}, kUser, APIError::kInternal},

@@ -9,6 +9,7 @@
 #include <functional>
 #include <map>
 #include <string>
+#include <vector>
 
 namespace OvraPlatform {
 
@@ -17,6 +18,7 @@ enum class APIRight {
     kNone,          ///< anybody, also without a session
     kSession,       ///< any user who is logged in
     kAdministrator, ///< an administrator who is logged in
+    kLocal,         ///< a process of this appliance
 };
 
 /// Where a call has to run.
@@ -57,6 +59,17 @@ public:
     /// Registers a handler; one that was there under the same names is replaced.
     void add(const std::string &api, int version, const std::string &method, APIRight right,
              APIQueue queue, APIHandler handler);
+
+    /// One registered method, as a caller sees it.
+    struct Method {
+        std::string api;
+        int version;
+        std::string method;
+        APIRight right;
+        APIQueue queue;
+    };
+    /// All that is registered, in the order of API, method and version.
+    std::vector<Method> methods() const;
 
     /// The queue of the call. One that nobody registered is quick: it is refused at once.
     APIQueue queue(const APICall &call) const;

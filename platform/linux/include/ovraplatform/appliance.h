@@ -27,18 +27,34 @@ inline constexpr char kAccountsFile[] = "/usr/ovra/var/ovradr/accounts.db";
 inline constexpr char kSessionsFile[] = "/usr/ovra/var/ovradr/sessions.db";
 inline constexpr char kKnownEndpointsFile[] = "/usr/ovra/var/ovradr/known_endpoints";
 
-/// The settings of this appliance, the lines key="value" of ovradrd.conf. A key that is missing or
+/// The keys of kConfigFile.
+namespace Setting {
+inline constexpr char kHttpPort[] = "http_port";
+inline constexpr char kHttpsPort[] = "https_port";
+inline constexpr char kAddress[] = "address"; ///< numeric addresses, separated by commas
+inline constexpr char kHostname[] = "hostname";
+inline constexpr char kSerial[] = "serial";
+} // namespace Setting
+
+/// The keys of kFarlinkFile.
+namespace FarlinkSetting {
+inline constexpr char kHost[] = "host";
+inline constexpr char kPort[] = "port";
+inline constexpr char kAlias[] = "alias";
+} // namespace FarlinkSetting
+
+/// The settings of this appliance, the lines key="value" of kConfigFile. A key that is missing or
 /// empty has the value given here.
 struct ApplianceConfig {
-    int httpPort = 5000;  ///< key http_port
-    int httpsPort = 5001; ///< key https_port
-    /// Whether the appliance serves at every address of the machine: the key `address` is not set.
+    int httpPort = 5000;
+    int httpsPort = 5001;
+    /// Whether the appliance serves at every address of the machine: no address is set.
     bool servesAllAddresses = true;
-    /// Otherwise the addresses that it serves at, numeric text, in the order of the file (key
-    /// address, separated by commas). Empty when the key holds nothing usable.
+    /// Otherwise the addresses that it serves at, numeric text, in the order of the file. Empty
+    /// when the setting holds nothing usable.
     std::vector<std::string> addresses;
-    std::string hostname; ///< key hostname; empty: the system's
-    std::string serial;   ///< key serial; empty: the machine's
+    std::string hostname; ///< empty: the system's
+    std::string serial;   ///< empty: the machine's
 
     /// One sentence for everything in the file that could not be taken; a program that serves
     /// should not start while there are any.
@@ -49,6 +65,10 @@ struct ApplianceConfig {
 /// and counts as not set, except that an unusable `address` never widens to every address. A file
 /// that does not exist is an appliance with defaults.
 OVRAPLATFORM_EXPORT ApplianceConfig readApplianceConfig(const std::string &path = kConfigFile);
+
+/// What is wrong with a value for a setting: one sentence, "" when nothing is.
+/// \param key  one of namespace Setting
+OVRAPLATFORM_EXPORT std::string settingProblem(const std::string &key, const std::string &value);
 
 /// Makes the state directory, mode 0700, and what is missing above it, mode 0755. One that exists
 /// must be a directory of our own user that nobody else can write to.

@@ -1,0 +1,37 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "command_tree.h"
+
+#include <string>
+
+namespace Ovradr {
+
+void addCommandTree(CLI::App &app, bool &json, Command &chosen) {
+    app.fallthrough();
+    app.require_subcommand(1);
+    app.set_version_flag("--version", "ovradr " OVRADR_VERSION);
+    app.add_flag(std::string(kJsonFlag), json,
+                 "One JSON document on standard output, also for an error");
+    app.footer(
+        "Exit codes: 0 ok, 1 failed, 2 usage, 3 not reachable, 4 log-in refused, 5 one-time "
+        "code,\n  6 key not trusted, 7 not found, 8 not permitted, 9 not set up;\n  of doctor "
+        "also 10 name unknown, 11 no appliance, 12 wrong node, 13 clocks\n"
+        "Examples:\n"
+        "  ovradr setup\n"
+        "  ovradr user add repl --admin\n"
+        "  ovradr cred create https://nas2 --account repl\n"
+        "  ovradr call 3f2a OVRA.DR.Node info");
+    addSetupCommand(app, chosen);
+    addNodeCommands(app, chosen);
+    addUserCommands(app, chosen);
+    addCredCommands(app, chosen);
+    addSessionCommands(app, chosen);
+    addCallCommand(app, chosen);
+    addConnCommands(app, chosen);
+    addAttrCommands(app, chosen);
+    addWhyCommand(app, chosen);
+    addDoctorCommand(app, chosen);
+    addSpeedCommand(app, chosen);
+    addFarlinkCommands(app, chosen);
+}
+
+} // namespace Ovradr
