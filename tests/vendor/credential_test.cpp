@@ -122,11 +122,12 @@ TEST_F(Credential, TurnsTheLibrarysErrorNumbersIntoItsOwn) {
 TEST_F(Credential, SealsWhatHasToBeSealed) {
     peer.grant("c1", "s1");
     const Conn here = Conn::https("192.0.2.1", 5001);
-    CredNodeSender("c1").process(WebAPI::getDRNodeCredCreateAPI(here, "sid", "unidirection"));
+    const auto create = WebAPI::getDRNodeCredCreateAPI(here, "sid", "unidirection");
+    EXPECT_TRUE(CredNodeSender("c1").process(create).isValid());
     EXPECT_TRUE(peer.callOf("create").sealed);
     OvraDRCore::Request upload = WebAPI::getDRNodeTestPrivilegeAPI();
     upload.setUpload("/usr/ovra/file", "file");
-    CredNodeSender("c1").process(upload);
+    EXPECT_TRUE(CredNodeSender("c1").process(upload).isValid());
     EXPECT_EQ(peer.callOf("test_privilege").uploadName, "file");
 }
 

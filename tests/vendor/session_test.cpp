@@ -79,8 +79,8 @@ TEST_F(GrantedSession, IsRemovedByItsIdItsUserOrWithAllOfThem) {
         return json(R"({"success":true})");
     };
     const std::string first = session.CreateNodeSession("n1", "joe");
-    session.CreateNodeSession("n2", "joe");
-    session.CreateTempSession("joe", 300);
+    EXPECT_NE(session.CreateNodeSession("n2", "joe"), "");
+    EXPECT_NE(session.CreateTempSession("joe", 300), "");
     const std::string ann = session.CreateNodeSession("n1", "ann");
     session.DeleteBySessionId(first);
     EXPECT_EQ(session.GetErrCode(), 0);
