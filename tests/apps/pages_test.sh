@@ -30,13 +30,13 @@ registry 'no row for `OVRA.Core.User` 1 `get`' '/^| `OVRA.Core.User`/d'
 registry 'correct the right of `OVRA.Core.Farlink` 1 `get`' 's/| local | quick/| session | quick/'
 registry 'correct the queue of `OVRA.DR.Node.Credential` 1 `set`' '/1 `set`/s/slow/quick/'
 registry 'describes `OVRA.DR.Node` 1 `infos`' 's/^| `OVRA.DR.Node` 1 `info` .*/&\n| `OVRA.DR.Node` 1 `infos` | session | quick | | |/'
-tree 'does not describe `ovradr attr list`' 's/`ovradr attr list [^`]*`//' CommandTree.isDocumentedAsAWhole
-tree 'has an option --retry' '/^| `--retry`/d' CommandTree.isDocumentedAsAWhole
-tree 'takes SUBJECT' 's/`ovradr doctor \[SUBJECT\]`/`ovradr doctor`/' CommandTree.isDocumentedAsAWhole
-tree 'there is no `ovradr user lists' 's/`ovradr user list`/`ovradr user lists`/' CommandTree.isAllThatPagesMention
-tree 'has no option --admins' 's/ovradr user add NAME \[--admin\]/ovradr user add NAME [--admins]/' CommandTree.isAllThatPagesMention
-tree 'an option --forgot' 's/`--forget SESSION`/`--forgot SESSION`/' CommandTree.hasEveryOptionThatItsPageDescribes
-tree 'add a row with the `data` of `why`' '/^| `why` /d' CommandTree.hasItsDocumentsForScriptsDescribed
-tree '| 505 | `otp_wrong` | 5 |' '/^| 505 /d' Failure.isDocumentedWithWhatItsCodeMeans
+tree 'does not describe `ovradr attr list`' 's/`ovradr attr list [^`]*`//' CommandTree.IsDocumentedAsAWhole
+tree 'has an option --retry' '/^| `--retry`/d' CommandTree.IsDocumentedAsAWhole
+tree 'takes SUBJECT' 's/`ovradr doctor \[SUBJECT\]`/`ovradr doctor`/' CommandTree.IsDocumentedAsAWhole
+tree 'there is no `ovradr user lists' 's/`ovradr user list`/`ovradr user lists`/' CommandTree.IsAllThatPagesMention
+tree 'has no option --admins' 's/ovradr user add NAME \[--admin\]/ovradr user add NAME [--admins]/' CommandTree.IsAllThatPagesMention
+tree 'an option --forgot' 's/`--forget SESSION`/`--forgot SESSION`/' CommandTree.HasEveryOptionThatItsPageDescribes
+tree 'add a row with the `data` of `why`' '/^| `why` /d' CommandTree.HasItsDocumentsForScriptsDescribed
+tree '| 505 | `otp_wrong` | 5 |' '/^| 505 /d' Failure.IsDocumentedWithWhatItsCodeMeans
 fails 'there and not named: --lease' docs/farlinkd.md '/^| `--lease /d' \
     bash "$root/tests/apps/options_test.sh" "$farlinkd" docs/farlinkd.md

@@ -156,7 +156,7 @@ private:
     Ovradr::Command chosen_;
 };
 
-TEST_F(CommandTree, isDocumentedAsAWhole) {
+TEST_F(CommandTree, IsDocumentedAsAWhole) {
     const DocPage page(kPage);
     for (const auto &[command, node] : commands_) {
         Names documented;
@@ -179,14 +179,14 @@ TEST_F(CommandTree, isDocumentedAsAWhole) {
     }
 }
 
-TEST_F(CommandTree, showsAnExampleOfEveryCommand) {
+TEST_F(CommandTree, ShowsAnExampleOfEveryCommand) {
     for (const auto &[command, node] : commands_) {
         EXPECT_NE(node->get_footer().find("ovradr " + command), std::string::npos)
             << "--help of `ovradr " << command << "` has no example: add one to its footer";
     }
 }
 
-TEST_F(CommandTree, isAllThatPagesMention) {
+TEST_F(CommandTree, IsAllThatPagesMention) {
     for (const std::string &name : OvraTest::docPages()) {
         const DocPage page(name);
         for (const DocPage::Section &section : page.sections()) {
@@ -202,7 +202,7 @@ TEST_F(CommandTree, isAllThatPagesMention) {
     }
 }
 
-TEST_F(CommandTree, hasEveryOptionThatItsPageDescribes) {
+TEST_F(CommandTree, HasEveryOptionThatItsPageDescribes) {
     const DocPage page(kPage);
     for (const DocPage::Section &section : page.sections()) {
         Names commands;
@@ -223,7 +223,7 @@ TEST_F(CommandTree, hasEveryOptionThatItsPageDescribes) {
     }
 }
 
-TEST_F(CommandTree, hasItsDocumentsForScriptsDescribed) {
+TEST_F(CommandTree, HasItsDocumentsForScriptsDescribed) {
     Names described;
     for (const DocPage::Row &row : DocPage(kPage).rows("For scripts")) {
         for (const std::string &code : codeIn(row[0])) {

@@ -18,7 +18,7 @@ std::string rowOf(const Failure &failure) {
            std::to_string(static_cast<int>(failure.exit)) + " | " + failure.message + " |";
 }
 
-TEST(Failure, isDocumentedWithWhatItsCodeMeans) {
+TEST(Failure, IsDocumentedWithWhatItsCodeMeans) {
     std::map<std::string, std::string> rows;
     for (const auto &row : OvraTest::DocPage("docs/ovradr.md").rows("Error codes")) {
         std::string &text = rows[row[0]];

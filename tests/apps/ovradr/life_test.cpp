@@ -215,7 +215,7 @@ TEST_F(Life, ASessionIsNotReleasedWhileACredentialIsMadeWithIt) {
     EXPECT_EQ(remote.calls().find("granted delete"), std::string::npos);
 }
 
-TEST(PendingRelease, isDueAgainAfterPausesThatGrow) {
+TEST(PendingRelease, IsDueAgainAfterPausesThatGrow) {
     std::time_t now = 1000;
     PendingReleases store("/usr/ovra/var/ovradr/releases.db", [&now] { return now; });
     const auto due = [&store, &now](std::time_t time) {

@@ -53,7 +53,7 @@ struct SlowScene {
 
 class SlowClient : public Bounds, public testing::WithParamInterface<SlowScene> {};
 
-TEST_P(SlowClient, isCutOffWhenItsRequestTakesTooLong) {
+TEST_P(SlowClient, IsCutOffWhenItsRequestTakesTooLong) {
     OvraService::HttpLimits limits;
     limits.connections.arriving = 1s;
     restart(limits);
@@ -82,7 +82,7 @@ INSTANTIATE_TEST_SUITE_P(
                               'a'}),
     [](const auto &scene) { return std::string(scene.param.name); });
 
-TEST_F(Bounds, leave500SlowConnectionsNoInfluence) {
+TEST_F(Bounds, Leave500SlowConnectionsNoInfluence) {
     std::list<RawConnection> slow;
     for (int i = 0; i < 500; ++i) {
         slow.emplace_back(port(i % 2 == 0));
@@ -99,7 +99,7 @@ TEST_F(Bounds, leave500SlowConnectionsNoInfluence) {
     }
 }
 
-TEST_F(Bounds, holdWhenMoreConnectionsComeThanThereMayBe) {
+TEST_F(Bounds, HoldWhenMoreConnectionsComeThanThereMayBe) {
     std::list<RawConnection> flood;
     for (int i = 0; i < 1500; ++i) {
         flood.emplace_back(port(i % 2 == 0));
@@ -156,7 +156,7 @@ protected:
     std::optional<Ovradrd::WorkQueues> queues{std::in_place};
 };
 
-TEST_F(FullLanes, refuseAtOnceAndDoNotHoldUpQuickCalls) {
+TEST_F(FullLanes, RefuseAtOnceAndDoNotHoldUpQuickCalls) {
     for (int i = 0; i < 16; ++i) {
         serve("wait");
     }
@@ -180,7 +180,7 @@ TEST_F(FullLanes, refuseAtOnceAndDoNotHoldUpQuickCalls) {
     queues.reset();
 }
 
-TEST_F(FullLanes, letLocalCallersGoWhenTheDaemonStops) {
+TEST_F(FullLanes, LetLocalCallersGoWhenTheDaemonStops) {
     OvraPlatform::LocalCall call;
     call.api = "Test";
     call.version = 1;

@@ -64,7 +64,7 @@ protected:
     std::string sid;
 };
 
-TEST_F(Credential, isMadeByALogIn) {
+TEST_F(Credential, IsMadeByALogIn) {
     const Reply reply = ask("create", byAccount());
     ASSERT_EQ(reply.code(), 0) << reply.text;
     EXPECT_EQ(reply.data()["src_cred"]["node_id"], "n1");
@@ -75,7 +75,7 @@ TEST_F(Credential, isMadeByALogIn) {
     EXPECT_EQ(reply.text.find("granted"), std::string::npos);
 }
 
-TEST_F(Credential, isMadeByASessionOrByAnotherCredential) {
+TEST_F(Credential, IsMadeByASessionOrByAnotherCredential) {
     Json::Value params = json(R"({"auth":"session","session":"login-sid"})");
     params["conn"] = conn();
     params["cred_direction"] = "unidirection";
@@ -90,7 +90,7 @@ TEST_F(Credential, isMadeByASessionOrByAnotherCredential) {
     EXPECT_EQ(rows("node_cred"), "n1|granted\nn1|granted\n");
 }
 
-TEST_F(Credential, passesTheReasonOfARefusalOn) {
+TEST_F(Credential, PassesTheReasonOfARefusalOn) {
     remote.answer("login", R"({"success":false,"error":{"code":403}})");
     EXPECT_EQ(ask("create", byAccount()).code(), 504);
     remote.server.refuse();
@@ -98,7 +98,7 @@ TEST_F(Credential, passesTheReasonOfARefusalOn) {
     EXPECT_EQ(rows("node_cred"), "");
 }
 
-TEST_F(Credential, isAskedForWithEveryParameterItsProofNeeds) {
+TEST_F(Credential, IsAskedForWithEveryParameterItsProofNeeds) {
     for (const char *missing : {"auth", "account", "password", "conn", "cred_direction"}) {
         Json::Value params = byAccount();
         params.removeMember(missing);
@@ -109,7 +109,7 @@ TEST_F(Credential, isAskedForWithEveryParameterItsProofNeeds) {
     EXPECT_EQ(remote.calls(), "");
 }
 
-TEST_F(Credential, inBothDirectionsIsMadeThereAndBack) {
+TEST_F(Credential, InBothDirectionsIsMadeThereAndBack) {
     Json::Value params = byAccount();
     params["cred_direction"] = "bidirection";
     const Reply reply = ask("create", params);
@@ -121,7 +121,7 @@ TEST_F(Credential, inBothDirectionsIsMadeThereAndBack) {
     EXPECT_EQ(asked["conn"]["addr"], "10.0.0.1");
 }
 
-TEST_F(Credential, inBothDirectionsIsNotBegunWithoutAnAddressOfOnesOwn) {
+TEST_F(Credential, InBothDirectionsIsNotBegunWithoutAnAddressOfOnesOwn) {
     OvraTest::writeFile(OvraPlatform::kConfigFile, "address=\"192.0.2.1\"\n");
     Json::Value params = byAccount();
     params["cred_direction"] = "bidirection";
@@ -129,7 +129,7 @@ TEST_F(Credential, inBothDirectionsIsNotBegunWithoutAnAddressOfOnesOwn) {
     EXPECT_EQ(remote.calls(), "");
 }
 
-TEST_F(Credential, inBothDirectionsLeavesNothingWhenTheWayBackFails) {
+TEST_F(Credential, InBothDirectionsLeavesNothingWhenTheWayBackFails) {
     remote.answer("granted create", R"({"success":false,"error":{"code":500,"msg":"m"}})");
     Json::Value params = byAccount();
     params["cred_direction"] = "bidirection";
@@ -138,7 +138,7 @@ TEST_F(Credential, inBothDirectionsLeavesNothingWhenTheWayBackFails) {
     EXPECT_NE(remote.calls().find("granted delete"), std::string::npos);
 }
 
-TEST_F(Credential, thatIsTemporaryStandsInATableOfItsOwn) {
+TEST_F(Credential, ThatIsTemporaryStandsInATableOfItsOwn) {
     Json::Value params = byAccount();
     params.removeMember("cred_direction");
     const Reply reply = ask("temp_create", params);
@@ -156,7 +156,7 @@ TEST_F(Credential, thatIsTemporaryStandsInATableOfItsOwn) {
     EXPECT_NE(remote.calls().find("temporary delete"), std::string::npos);
 }
 
-TEST_F(Credential, isOnlyTriedByATest) {
+TEST_F(Credential, IsOnlyTriedByATest) {
     Json::Value params = byAccount();
     EXPECT_EQ(ask("test_create", params).code(), 0);
     remote.answer("login-sid get", R"({"success":false,"error":{"code":106}})");
@@ -164,7 +164,7 @@ TEST_F(Credential, isOnlyTriedByATest) {
     EXPECT_EQ(rows("node_cred"), "");
 }
 
-TEST_F(Credential, isListedAndShownWithoutItsSession) {
+TEST_F(Credential, IsListedAndShownWithoutItsSession) {
     const std::string id = make();
     OvraTest::addCred("temp_cred", "n2", "c2", "https", 1, "s");
     const Reply list = ask("list", {});
@@ -179,7 +179,7 @@ TEST_F(Credential, isListedAndShownWithoutItsSession) {
     EXPECT_EQ(ask("get", credId(id)).data()["node_id"], "n1");
 }
 
-TEST_F(Credential, isChangedByANewLogIn) {
+TEST_F(Credential, IsChangedByANewLogIn) {
     Json::Value params = credId(make());
     params["account"] = "joe";
     params["password"] = "other";
@@ -196,7 +196,7 @@ TEST_F(Credential, isChangedByANewLogIn) {
     EXPECT_EQ(ask("set", params).code(), 404);
 }
 
-TEST_F(Credential, isDeletedAlsoWhenItsNodeIsGone) {
+TEST_F(Credential, IsDeletedAlsoWhenItsNodeIsGone) {
     const std::string id = make();
     EXPECT_EQ(ask("delete", credId(make())).data()["release"], "kept");
     remote.server.refuse();
@@ -205,7 +205,7 @@ TEST_F(Credential, isDeletedAlsoWhenItsNodeIsGone) {
     EXPECT_EQ(ask("delete", credId(id)).code(), 0);
 }
 
-TEST_F(Credential, isAskedBackFromItsNode) {
+TEST_F(Credential, IsAskedBackFromItsNode) {
     Json::Value params = credId(make());
     EXPECT_EQ(ask("test_reverse_create", params).code(), 0);
     EXPECT_EQ(ask("reverse_create", params).data()["dst_cred"], json(R"({"cred_id":"back"})"));
@@ -216,7 +216,7 @@ TEST_F(Credential, isAskedBackFromItsNode) {
     EXPECT_EQ(json(remote.params("test_connection"))["conns"][0]["addr"], "10.9.9.9");
 }
 
-TEST_F(Credential, doesNotReachTheNodeItself) {
+TEST_F(Credential, DoesNotReachTheNodeItself) {
     const std::string self = call("OVRA.DR.Node", 1, "info", {}, sid).data()["node_id"].asString();
     for (const char *method : {"get", "delete", "reverse_create"}) {
         EXPECT_EQ(ask(method, credId(self)).code(), 106) << method;
@@ -237,13 +237,13 @@ protected:
     Json::Value params;
 };
 
-TEST_F(Relay, carriesTheRequestAndItsAnswer) {
+TEST_F(Relay, CarriesTheRequestAndItsAnswer) {
     remote.answer("granted relayed", R"({"success":true,"data":{"b":2}})");
     EXPECT_EQ(ask("relay", params).data(), json(R"({"b":2})"));
     EXPECT_EQ(remote.params("relayed"), R"({"a":1})");
 }
 
-TEST_F(Relay, carriesTheRefusal) {
+TEST_F(Relay, CarriesTheRefusal) {
     for (const int code : {105, 119, 404}) {
         remote.answer("granted relayed", R"({"success":false,"error":{"code":)" +
                                              std::to_string(code) + R"(,"msg":"m"}})");
@@ -251,7 +251,7 @@ TEST_F(Relay, carriesTheRefusal) {
     }
 }
 
-TEST_F(Relay, goesNoFurtherThanOneNode) {
+TEST_F(Relay, GoesNoFurtherThanOneNode) {
     params["webapi"]["api"] = "OVRA.DR.Node.Credential";
     params["webapi"]["method"] = "relay";
     EXPECT_EQ(ask("relay", params).code(), 106);

@@ -50,7 +50,7 @@ const Scene kScenes[] = {
 
 class Wire : public Appliance {};
 
-TEST_F(Wire, answersEverythingWithADocument) {
+TEST_F(Wire, AnswersEverythingWithADocument) {
     for (const Scene &scene : kScenes) {
         const Reply reply = http(scene.call);
         EXPECT_EQ(reply.status, scene.status) << scene.name;
@@ -58,7 +58,7 @@ TEST_F(Wire, answersEverythingWithADocument) {
     }
 }
 
-TEST_F(Wire, survivesRubbish) {
+TEST_F(Wire, SurvivesRubbish) {
     std::string rubbish;
     for (int i = 0; i < 100'000; ++i) {
         rubbish += static_cast<char>(i * 7919 % 256);
@@ -80,7 +80,7 @@ TEST_F(Wire, survivesRubbish) {
     EXPECT_EQ(http({.body = kGetInfo}).code(), 0);
 }
 
-TEST_F(Wire, keepsAConnectionForFurtherRequests) {
+TEST_F(Wire, KeepsAConnectionForFurtherRequests) {
     const RawConnection connection(port(false));
     const std::string request = "POST /webapi/query.cgi HTTP/1.1\r\nHost: a\r\n"
                                 "Content-Type: application/x-www-form-urlencoded\r\n"
@@ -140,7 +140,7 @@ struct TlsVisit {
     Session session;
 };
 
-TEST_F(Wire, resumesTlsSessions) {
+TEST_F(Wire, ResumesTlsSessions) {
     for (const int version : {TLS1_2_VERSION, TLS1_3_VERSION}) {
         const TlsVisit first(port(true), version, nullptr);
         ASSERT_TRUE(first.connected);
@@ -149,7 +149,7 @@ TEST_F(Wire, resumesTlsSessions) {
     }
 }
 
-TEST_F(Wire, speaksNoOldTls) {
+TEST_F(Wire, SpeaksNoOldTls) {
     EXPECT_FALSE(TlsVisit(port(true), TLS1_1_VERSION, nullptr).connected);
     EXPECT_TRUE(TlsVisit(port(true), TLS1_2_VERSION, nullptr).connected);
 }

@@ -34,7 +34,7 @@ std::string codeOf(const std::string &secret) {
     return code.data();
 }
 
-TEST_F(Login, givesASessionOfHalfAnHourThatWorksUntilLogout) {
+TEST_F(Login, GivesASessionOfHalfAnHourThatWorksUntilLogout) {
     addAccount("alice", true);
     const Reply granted = login("alice", kPassword);
     ASSERT_EQ(granted.code(), 0) << granted.text;
@@ -52,7 +52,7 @@ TEST_F(Login, givesASessionOfHalfAnHourThatWorksUntilLogout) {
     EXPECT_EQ(call("OVRA.Core.Auth", 1, "logout", {}, sid).code(), 119);
 }
 
-TEST_F(Login, tellsWhyItRefusesOnlyToWhoKnowsThePassword) {
+TEST_F(Login, TellsWhyItRefusesOnlyToWhoKnowsThePassword) {
     for (const char *name : {"plain", "disabled", "local", "coded"}) {
         addAccount(name, false);
     }
@@ -75,7 +75,7 @@ TEST_F(Login, tellsWhyItRefusesOnlyToWhoKnowsThePassword) {
     EXPECT_EQ(login("coded", kPassword, code).code(), 404) << "a code counts once";
 }
 
-TEST_F(Login, refusesParametersThatAreNoLogIn) {
+TEST_F(Login, RefusesParametersThatAreNoLogIn) {
     for (const char *params :
          {R"({})", R"({"account":"a"})", R"({"account":7,"passwd":"x"})",
           R"({"account":"a","passwd":"x","otp_code":7})", R"({"account":"a\n","passwd":"x"})"}) {
@@ -87,7 +87,7 @@ TEST_F(Login, refusesParametersThatAreNoLogIn) {
     EXPECT_EQ(call("OVRA.Core.Auth", 1, "login", huge).code(), 106);
 }
 
-TEST_F(Login, slowsGuessesDownWhileOthersAreServed) {
+TEST_F(Login, SlowsGuessesDownWhileOthersAreServed) {
     addAccount("alice", false);
     const std::string sid = session("alice");
     std::chrono::steady_clock::time_point begun;
@@ -113,7 +113,7 @@ TEST_F(Login, slowsGuessesDownWhileOthersAreServed) {
     EXPECT_GE(std::chrono::steady_clock::now() - begun, std::chrono::seconds(3));
 }
 
-TEST_F(Login, writesNoSecretToTheLog) {
+TEST_F(Login, WritesNoSecretToTheLog) {
     const LogCapture log;
     addAccount("alice", false);
     AccountStore().setTotp("alice", OvraPlatform::newTotpSecret());

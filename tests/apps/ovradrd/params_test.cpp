@@ -49,7 +49,7 @@ const Scene kScenes[] = {
     {"object", [](Params &in) { in.object("x"); }, R"([{"a": 1}])", R"([[], null, "a"])"},
 };
 
-TEST(Params, areTakenOrNamedAsUnusable) {
+TEST(Params, AreTakenOrNamedAsUnusable) {
     for (const Scene &scene : kScenes) {
         for (const bool usable : {true, false}) {
             for (const Json::Value &value : parse(usable ? scene.usable : scene.refused)) {
@@ -64,7 +64,7 @@ TEST(Params, areTakenOrNamedAsUnusable) {
     }
 }
 
-TEST(Params, nameTheFirstThatIsUnusable) {
+TEST(Params, NameTheFirstThatIsUnusable) {
     const Json::Value params = parse(R"({"y": 7})");
     Params in(params);
     in.text("y", 4);
@@ -73,7 +73,7 @@ TEST(Params, nameTheFirstThatIsUnusable) {
     EXPECT_EQ(in.error()["error"]["msg"]["param"], "y");
 }
 
-TEST(FlowError, passesTheCodeAndMessageOn) {
+TEST(FlowError, PassesTheCodeAndMessageOn) {
     const OvraDRCore::ErrRecorder flow;
     flow.SetErr(518, "n2");
     EXPECT_EQ(Ovradrd::flowError(flow, 509)["error"], parse(R"({"code":518,"msg":"n2"})"));
@@ -81,7 +81,7 @@ TEST(FlowError, passesTheCodeAndMessageOn) {
     EXPECT_EQ(Ovradrd::flowError(flow, 509)["error"]["code"], 509);
 }
 
-TEST(FlowError, doesNotPassOffAnotherNodesRefusalAsItsOwn) {
+TEST(FlowError, DoesNotPassOffAnotherNodesRefusalAsItsOwn) {
     const OvraDRCore::ErrRecorder flow;
     for (const int refusal : {105, 119}) {
         flow.SetErr(refusal);

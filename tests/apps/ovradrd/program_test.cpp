@@ -98,7 +98,7 @@ protected:
     }
 };
 
-TEST_F(TheProgram, doesNotStartWhereNothingIsSetUp) {
+TEST_F(TheProgram, DoesNotStartWhereNothingIsSetUp) {
     Program program;
     EXPECT_NE(program.line().find("run ovradr setup"), std::string::npos);
     EXPECT_EQ(program.wait(), 9);
@@ -107,7 +107,7 @@ TEST_F(TheProgram, doesNotStartWhereNothingIsSetUp) {
     EXPECT_EQ(Program().wait(), 9);
 }
 
-TEST_F(TheProgram, doesNotStartWithSettingsThatItCannotTake) {
+TEST_F(TheProgram, DoesNotStartWithSettingsThatItCannotTake) {
     Appliance::provision();
     configure("hostname=\"a b\"\n");
     Program program;
@@ -115,7 +115,7 @@ TEST_F(TheProgram, doesNotStartWithSettingsThatItCannotTake) {
     EXPECT_EQ(program.wait(), 1);
 }
 
-TEST_F(TheProgram, doesNotStartWithAKeyThatOthersCanRead) {
+TEST_F(TheProgram, DoesNotStartWithAKeyThatOthersCanRead) {
     Appliance::provision();
     std::filesystem::permissions(OvraPlatform::kTlsKeyFile,
                                  std::filesystem::perms::owner_read |
@@ -125,7 +125,7 @@ TEST_F(TheProgram, doesNotStartWithAKeyThatOthersCanRead) {
     EXPECT_EQ(program.wait(), 1);
 }
 
-TEST_F(TheProgram, doesNotStartWithTheCertificateOfAnotherKey) {
+TEST_F(TheProgram, DoesNotStartWithTheCertificateOfAnotherKey) {
     Appliance::provision();
     const std::string certificate = OvraTest::readFile(OvraPlatform::kTlsCertificateFile);
     std::filesystem::remove(OvraTest::kNodeDatabase);
@@ -136,7 +136,7 @@ TEST_F(TheProgram, doesNotStartWithTheCertificateOfAnotherKey) {
     EXPECT_EQ(program.wait(), 1);
 }
 
-TEST_F(TheProgram, saysThatAPortIsInUse) {
+TEST_F(TheProgram, SaysThatAPortIsInUse) {
     Appliance::provision();
     configure();
     Program first;
@@ -146,13 +146,13 @@ TEST_F(TheProgram, saysThatAPortIsInUse) {
     EXPECT_EQ(second.wait(), 3);
 }
 
-TEST_F(TheProgram, knowsItsArguments) {
+TEST_F(TheProgram, KnowsItsArguments) {
     EXPECT_EQ(Program("--version").wait(), 0);
     EXPECT_EQ(Program("--help").wait(), 0);
     EXPECT_EQ(Program("--unknown").wait(), 2);
 }
 
-TEST_F(TheProgram, servesUntilItIsToldToEnd) {
+TEST_F(TheProgram, ServesUntilItIsToldToEnd) {
     Appliance::provision();
     configure();
     for (const int signal : {SIGTERM, SIGINT}) {
@@ -167,7 +167,7 @@ TEST_F(TheProgram, servesUntilItIsToldToEnd) {
     EXPECT_EQ(ask("OVRA.DR.Node", "info")["error"]["code"], 100);
 }
 
-TEST_F(TheProgram, startsAgainAfterItWasKilled) {
+TEST_F(TheProgram, StartsAgainAfterItWasKilled) {
     Appliance::provision();
     configure();
     {
@@ -180,7 +180,7 @@ TEST_F(TheProgram, startsAgainAfterItWasKilled) {
     EXPECT_EQ(ask("OVRA.DR.Node", "info")["success"], true);
 }
 
-TEST_F(TheProgram, endsInTimeWhileACallWaitsForAnotherAppliance) {
+TEST_F(TheProgram, EndsInTimeWhileACallWaitsForAnotherAppliance) {
     Appliance::provision();
     configure();
     OvraTest::MisbehavingServer silent;

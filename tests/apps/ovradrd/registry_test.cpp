@@ -41,7 +41,7 @@ std::string queueOf(const APIRegistry::Method &method) {
 
 class Registry : public OvraTest::Appliance {};
 
-TEST_F(Registry, isDocumentedWithItsRightsAndQueues) {
+TEST_F(Registry, IsDocumentedWithItsRightsAndQueues) {
     std::map<std::string, OvraTest::DocPage::Row> rows;
     for (const auto &row : OvraTest::DocPage("docs/ovradrd.md").rows("What can be called")) {
         ASSERT_EQ(row.size(), 5U) << row[0];

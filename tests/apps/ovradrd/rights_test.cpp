@@ -80,7 +80,7 @@ const Scene kScenes[] = {
 
 class Rights : public Appliance {};
 
-TEST_F(Rights, areAskedForOfEveryCaller) {
+TEST_F(Rights, AreAskedForOfEveryCaller) {
     addAccount("user", false);
     addAccount("root", true);
     for (const Scene &scene : kScenes) {
@@ -95,7 +95,7 @@ TEST_F(Rights, areAskedForOfEveryCaller) {
     }
 }
 
-TEST_F(Rights, areStatedHereForEveryMethod) {
+TEST_F(Rights, AreStatedHereForEveryMethod) {
     for (const auto &method : OvraPlatform::APIRegistry::hosted()->methods()) {
         EXPECT_TRUE(std::any_of(std::begin(kScenes), std::end(kScenes),
                                 [&](const Scene &scene) {
@@ -110,7 +110,7 @@ TEST_F(Rights, areStatedHereForEveryMethod) {
 
 class Session : public Appliance {};
 
-TEST_F(Session, isWorthWhatItsAccountIsWorthNow) {
+TEST_F(Session, IsWorthWhatItsAccountIsWorthNow) {
     addAccount("alice", true);
     addAccount("root", true);
     const std::string sid = session("alice");
@@ -126,7 +126,7 @@ TEST_F(Session, isWorthWhatItsAccountIsWorthNow) {
     EXPECT_EQ(code(), 119);
 }
 
-TEST_F(Session, thatExpiredIsUnknown) {
+TEST_F(Session, ThatExpiredIsUnknown) {
     addAccount("alice", true);
     const std::string sid = session("alice");
     EXPECT_EQ(call(kNode, 1, "info", {}, sid).code(), 0);
@@ -136,7 +136,7 @@ TEST_F(Session, thatExpiredIsUnknown) {
     EXPECT_EQ(call(kNode, 1, "info", {}, sid).code(), 119);
 }
 
-TEST_F(Session, isNotTakenForExpiredWhenTheStoreCannotBeRead) {
+TEST_F(Session, IsNotTakenForExpiredWhenTheStoreCannotBeRead) {
     addAccount("alice", true);
     const std::string sid = session("alice");
     for (int i = 0; i < 20; ++i) {
@@ -148,7 +148,7 @@ TEST_F(Session, isNotTakenForExpiredWhenTheStoreCannotBeRead) {
     }
 }
 
-TEST_F(Session, isLookedUpInTheFileThatIsThereNow) {
+TEST_F(Session, IsLookedUpInTheFileThatIsThereNow) {
     addAccount("alice", true);
     const std::string before = session("alice");
     for (int i = 0; i < 20; ++i) {
@@ -162,7 +162,7 @@ TEST_F(Session, isLookedUpInTheFileThatIsThereNow) {
     }
 }
 
-TEST_F(Session, forANodeIsReusedAndTiedToTheCallersAccount) {
+TEST_F(Session, ForANodeIsReusedAndTiedToTheCallersAccount) {
     addAccount("alice", true);
     const std::string sid = session("alice");
     const Json::Value node = json(R"({"node_id":"n1"})");
@@ -179,7 +179,7 @@ TEST_F(Session, forANodeIsReusedAndTiedToTheCallersAccount) {
     EXPECT_EQ(call(kNode, 1, "test_privilege", {}, granted).code(), 119);
 }
 
-TEST_F(Session, thatIsTemporaryEndsAfterAnHour) {
+TEST_F(Session, ThatIsTemporaryEndsAfterAnHour) {
     addAccount("alice", true);
     const Reply reply = call(kSession, 1, "temp_create", {}, session("alice"));
     ASSERT_EQ(reply.code(), 0) << reply.text;
@@ -190,7 +190,7 @@ TEST_F(Session, thatIsTemporaryEndsAfterAnHour) {
 
 class Node : public Appliance {};
 
-TEST_F(Node, tellsWhatItIsAskedFor) {
+TEST_F(Node, TellsWhatItIsAskedFor) {
     addAccount("alice", false);
     const std::string sid = session("alice");
     const Reply bare = call(kNode, 1, "info", {}, sid);
@@ -202,7 +202,7 @@ TEST_F(Node, tellsWhatItIsAskedFor) {
     EXPECT_EQ(more.data()["node_id"], bare.data()["node_id"]);
 }
 
-TEST_F(Node, findsTheFirstEndpointThatItReaches) {
+TEST_F(Node, FindsTheFirstEndpointThatItReaches) {
     addAccount("root", true);
     Json::Value params;
     params["conns"][0] = json(R"({"addr":"127.0.0.1","protocol":"http","port":1})");
@@ -225,7 +225,7 @@ Json::Value askLocally(const char *api, const char *method, const char *params =
     return reply;
 }
 
-TEST_F(Node, servesItsOwnProcessesAsAdministrators) {
+TEST_F(Node, ServesItsOwnProcessesAsAdministrators) {
     EXPECT_EQ(askLocally("OVRA.Core.Farlink", "get")["data"], json(R"({"enabled":false})"));
     EXPECT_EQ(askLocally(kNode, "test_privilege")["success"], true);
     EXPECT_EQ(askLocally(kCredential, "create")["error"]["code"], 106);

@@ -52,7 +52,7 @@ protected:
     ReplyKey replyKey;
 };
 
-TEST_F(Sealed, logInAndCallsWorkOverPlainHttp) {
+TEST_F(Sealed, LogInAndCallsWorkOverPlainHttp) {
     OVRACred *cred = OVRACredAlloc();
     OVRACredSess *sess = OVRACredSessAlloc();
     OVRACredItemSetProtocol(cred, "http");
@@ -73,13 +73,13 @@ TEST_F(Sealed, logInAndCallsWorkOverPlainHttp) {
     OVRACredFree(cred);
 }
 
-TEST_F(Sealed, isAnsweredSealed) {
+TEST_F(Sealed, IsAnsweredSealed) {
     const Reply reply = post(seal(wallClock()));
     EXPECT_EQ(reply.document.getMemberNames(), std::vector<std::string>{"sealed_reply"});
     EXPECT_EQ(open(reply)["success"], true);
 }
 
-TEST_F(Sealed, isRefusedTheSecondTime) {
+TEST_F(Sealed, IsRefusedTheSecondTime) {
     const WireCall outer = seal(wallClock());
     EXPECT_EQ(open(post(outer))["success"], true);
     const Json::Value again = open(post(outer));
@@ -87,20 +87,20 @@ TEST_F(Sealed, isRefusedTheSecondTime) {
     EXPECT_EQ(again["error"]["msg"]["reason"], "replayed");
 }
 
-TEST_F(Sealed, isToldTheTimeWhenItIsStale) {
+TEST_F(Sealed, IsToldTheTimeWhenItIsStale) {
     const Json::Value refusal = open(post(seal(wallClock() - 120'000)));
     EXPECT_EQ(refusal["error"]["code"], 109);
     EXPECT_EQ(refusal["error"]["msg"]["reason"], "stale");
     EXPECT_NEAR(refusal["error"]["msg"]["time"].asDouble(), static_cast<double>(wallClock()), 5000);
 }
 
-TEST_F(Sealed, cannotBeMovedToAnotherCall) {
+TEST_F(Sealed, CannotBeMovedToAnotherCall) {
     WireCall outer = seal(wallClock());
     outer.method = "info";
     EXPECT_EQ(open(post(outer))["error"]["msg"]["reason"], "call");
 }
 
-TEST_F(Sealed, thatCannotBeOpenedIsRefusedUnsealed) {
+TEST_F(Sealed, ThatCannotBeOpenedIsRefusedUnsealed) {
     WireCall outer = seal(wallClock());
     outer.sealed[10] = outer.sealed[10] == 'A' ? 'B' : 'A';
     const Reply reply = post(outer);
@@ -108,7 +108,7 @@ TEST_F(Sealed, thatCannotBeOpenedIsRefusedUnsealed) {
     EXPECT_EQ(reply.document["error"]["msg"]["reason"], "key");
 }
 
-TEST_F(Sealed, isWhatPlainHttpDemands) {
+TEST_F(Sealed, IsWhatPlainHttpDemands) {
     const auto code = [this](const char *api, const char *method, const char *params,
                              const std::string &sid) {
         const Reply reply = call(api, 1, method, json(params), sid, false);

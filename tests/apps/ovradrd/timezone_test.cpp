@@ -27,7 +27,7 @@ const Scene kScenes[] = {
     {nullptr, "", "no name\n", ""},
     {nullptr, nullptr, nullptr, "Etc/UTC"}};
 
-TEST(Timezone, isFoundWhereTheMachineSaysIt) {
+TEST(Timezone, IsFoundWhereTheMachineSaysIt) {
     for (const Scene &scene : kScenes) {
         SCOPED_TRACE(scene.zone);
         std::string folder = "/tmp/ovrat.XXXXXX";

@@ -48,7 +48,7 @@ private:
     Connections::Connection *connection_ = nullptr;
 };
 
-TEST(Connections, makesRoomByEndingTheOneThatWaitedLongestForItsClient) {
+TEST(Connections, MakesRoomByEndingTheOneThatWaitedLongestForItsClient) {
     Connections table({.total = 3});
     Client working(table, "a");
     working.enter(Phase::kWorking);
@@ -63,7 +63,7 @@ TEST(Connections, makesRoomByEndingTheOneThatWaitedLongestForItsClient) {
     EXPECT_FALSE(working.isShut());
 }
 
-TEST(Connections, keepsOneClientFromTakingTheRoomOfOthers) {
+TEST(Connections, KeepsOneClientFromTakingTheRoomOfOthers) {
     Connections table({.total = 10, .perClient = 2});
     Client other(table, "b");
     std::this_thread::sleep_for(2ms);
@@ -76,7 +76,7 @@ TEST(Connections, keepsOneClientFromTakingTheRoomOfOthers) {
     EXPECT_FALSE(other.isShut());
 }
 
-TEST(Connections, refusesWhenEveryConnectionIsBeingServed) {
+TEST(Connections, RefusesWhenEveryConnectionIsBeingServed) {
     Connections table({.total = 2});
     Client working(table, "a");
     working.enter(Phase::kWorking);
@@ -87,7 +87,7 @@ TEST(Connections, refusesWhenEveryConnectionIsBeingServed) {
     EXPECT_FALSE(replying.isShut());
 }
 
-TEST(Connections, countsOneThatIsClosedNoMore) {
+TEST(Connections, CountsOneThatIsClosedNoMore) {
     Connections table({.total = 1});
     { const Client gone(table, "a"); }
     const Client present(table, "a");
@@ -106,7 +106,7 @@ struct PhaseScene {
 
 class ConnectionPhase : public testing::TestWithParam<PhaseScene> {};
 
-TEST_P(ConnectionPhase, endsWhenItsTimeIsOver) {
+TEST_P(ConnectionPhase, EndsWhenItsTimeIsOver) {
     ConnectionLimits limits;
     limits.arriving = limits.idle = limits.replying = 100ms;
     Connections table(limits);
@@ -122,7 +122,7 @@ INSTANTIATE_TEST_SUITE_P(, ConnectionPhase,
                                          PhaseScene{"working", Phase::kWorking, false}),
                          [](const auto &scene) { return std::string(scene.param.name); });
 
-TEST(Connections, doNotGiveANewConnectionMoreTimeBecauseItsHeaderCame) {
+TEST(Connections, DoNotGiveANewConnectionMoreTimeBecauseItsHeaderCame) {
     ConnectionLimits limits;
     limits.arriving = 600ms;
     Connections table(limits);

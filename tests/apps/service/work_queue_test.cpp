@@ -30,7 +30,7 @@ private:
     std::promise<void> release;
 };
 
-TEST(WorkQueue, refusesWhatDoesNotFitInItsQueue) {
+TEST(WorkQueue, RefusesWhatDoesNotFitInItsQueue) {
     WorkQueue queue(1, 2);
     Plug plug;
     ASSERT_TRUE(queue.submit(plug.job()));
@@ -47,7 +47,7 @@ TEST(WorkQueue, refusesWhatDoesNotFitInItsQueue) {
     EXPECT_EQ(ran, 2);
 }
 
-TEST(WorkQueue, letsADelayedJobHoldNoThread) {
+TEST(WorkQueue, LetsADelayedJobHoldNoThread) {
     WorkQueue queue(1, 10);
     std::promise<std::chrono::steady_clock::time_point> late;
     std::promise<std::chrono::steady_clock::time_point> atOnce;
@@ -59,7 +59,7 @@ TEST(WorkQueue, letsADelayedJobHoldNoThread) {
     EXPECT_GE(lateAt - begun, 300ms);
 }
 
-TEST(WorkQueue, runsJobsThatAreDueTogetherSideBySide) {
+TEST(WorkQueue, RunsJobsThatAreDueTogetherSideBySide) {
     WorkQueue queue(2, 10);
     std::promise<void> begun[2];
     std::promise<bool> met[2];
@@ -76,7 +76,7 @@ TEST(WorkQueue, runsJobsThatAreDueTogetherSideBySide) {
     EXPECT_TRUE(met[1].get_future().get());
 }
 
-TEST(WorkQueue, goesOnAfterAJobThatThrows) {
+TEST(WorkQueue, GoesOnAfterAJobThatThrows) {
     WorkQueue queue(1, 10);
     std::promise<void> next;
     queue.submit([] { throw std::runtime_error("broken"); });
@@ -84,7 +84,7 @@ TEST(WorkQueue, goesOnAfterAJobThatThrows) {
     EXPECT_EQ(next.get_future().wait_for(5s), std::future_status::ready);
 }
 
-TEST(WorkQueue, dropsWaitingJobsWhenItStopsAndTellsOfTheOneThatGoesOn) {
+TEST(WorkQueue, DropsWaitingJobsWhenItStopsAndTellsOfTheOneThatGoesOn) {
     WorkQueue queue(1, 10);
     Plug plug;
     queue.submit(plug.job());

@@ -67,7 +67,7 @@ protected:
     OvraTest::TestCertificate server_{"DNS:nas.example,IP:192.0.2.7"};
 };
 
-TEST_F(JudgeScene, acceptsWhatTheSystemAcceptsForThatNameOrAddress) {
+TEST_F(JudgeScene, AcceptsWhatTheSystemAcceptsForThatNameOrAddress) {
     for (const auto &[host, verdict] : {std::pair{"nas.example", Verdict::kSystem},
                                         {"192.0.2.7", Verdict::kSystem},
                                         {"other.example", Verdict::kNew},
@@ -78,7 +78,7 @@ TEST_F(JudgeScene, acceptsWhatTheSystemAcceptsForThatNameOrAddress) {
     }
 }
 
-TEST_F(JudgeScene, acceptsWhatTheSystemAcceptsAlsoWhenAnotherKeyWasPinned) {
+TEST_F(JudgeScene, AcceptsWhatTheSystemAcceptsAlsoWhenAnotherKeyWasPinned) {
     const OvraTest::TestCertificate old;
     TrustStore().pin("https://nas.example:5001", fingerprintOf(old.certificate()));
     CertificateVerifier judge(endpoint("nas.example"), false);
@@ -86,7 +86,7 @@ TEST_F(JudgeScene, acceptsWhatTheSystemAcceptsAlsoWhenAnotherKeyWasPinned) {
     EXPECT_EQ(judge.verdict(), Verdict::kSystem);
 }
 
-TEST_F(JudgeScene, pinsAKeyItMeetsFirstOnlyWhenItIsTold) {
+TEST_F(JudgeScene, PinsAKeyItMeetsFirstOnlyWhenItIsTold) {
     CertificateVerifier first(endpoint("nas.example"), false);
     ASSERT_TRUE(shakeHands(first, server_, nullptr));
     EXPECT_EQ(first.verdict(), Verdict::kNew);
@@ -98,7 +98,7 @@ TEST_F(JudgeScene, pinsAKeyItMeetsFirstOnlyWhenItIsTold) {
     EXPECT_EQ(second.verdict(), Verdict::kPinned);
 }
 
-TEST_F(JudgeScene, endsTheHandshakeWithAnotherKey) {
+TEST_F(JudgeScene, EndsTheHandshakeWithAnotherKey) {
     const OvraTest::TestCertificate other;
     TrustStore().pin("https://nas.example:5001", fingerprintOf(other.certificate()));
     CertificateVerifier judge(endpoint("nas.example"), false);
@@ -110,7 +110,7 @@ TEST_F(JudgeScene, endsTheHandshakeWithAnotherKey) {
     EXPECT_EQ(observer.verdict(), Verdict::kChanged);
 }
 
-TEST_F(JudgeScene, endsTheHandshakeWhenThePinnedKeysCannotBeRead) {
+TEST_F(JudgeScene, EndsTheHandshakeWhenThePinnedKeysCannotBeRead) {
     std::filesystem::create_directories(kKnownEndpointsFile);
     CertificateVerifier judge(endpoint("nas.example"), false);
     EXPECT_FALSE(shakeHands(judge, server_, nullptr));

@@ -78,7 +78,7 @@ protected:
     }
 };
 
-TEST_F(CredRequestScene, postsTheCallAndReturnsTheDocument) {
+TEST_F(CredRequestScene, PostsTheCallAndReturnsTheDocument) {
     MisbehavingServer server({.tls = true});
     const Result result = call(server);
     EXPECT_TRUE(result.ok);
@@ -103,7 +103,7 @@ std::ostream &operator<<(std::ostream &out, const AnswerScene &scene) {
 
 class WhenItAnswers : public CredRequestScene, public testing::WithParamInterface<AnswerScene> {};
 
-TEST_P(WhenItAnswers, theErrorTellsWhatWasWrong) {
+TEST_P(WhenItAnswers, TheErrorTellsWhatWasWrong) {
     MisbehavingServer server({.tls = true});
     server.answer(GetParam().answer);
     const auto begin = std::chrono::steady_clock::now();
@@ -150,7 +150,7 @@ INSTANTIATE_TEST_SUITE_P(
         AnswerScene{"500", Answer::status(500), CredError::kHttpStatus},
         AnswerScene{"a redirect", Answer::redirect("https://127.0.0.1/"), CredError::kHttpStatus}));
 
-TEST_F(CredRequestScene, tellsWhyItCannotConnect) {
+TEST_F(CredRequestScene, TellsWhyItCannotConnect) {
     MisbehavingServer server({.tls = true});
     MisbehavingServer plain;
     server.refuse();
@@ -166,7 +166,7 @@ TEST_F(CredRequestScene, tellsWhyItCannotConnect) {
     EXPECT_LT(std::chrono::steady_clock::now() - begin, 5s);
 }
 
-TEST_F(CredRequestScene, followsNeitherARedirectNorAProxyOfTheEnvironment) {
+TEST_F(CredRequestScene, FollowsNeitherARedirectNorAProxyOfTheEnvironment) {
     MisbehavingServer elsewhere;
     const std::string url = "http://127.0.0.1:" + std::to_string(elsewhere.port()) + "/";
     for (const char *name : {"http_proxy", "https_proxy", "all_proxy", "HTTPS_PROXY"}) {
@@ -179,7 +179,7 @@ TEST_F(CredRequestScene, followsNeitherARedirectNorAProxyOfTheEnvironment) {
     EXPECT_EQ(elsewhere.connections(), 0);
 }
 
-TEST_F(CredRequestScene, refusesWhatCannotBeSent) {
+TEST_F(CredRequestScene, RefusesWhatCannotBeSent) {
     MisbehavingServer server({.tls = true});
     const Objects objects(server);
     OVRA::CredRequest request;
@@ -208,7 +208,7 @@ TEST_F(CredRequestScene, refusesWhatCannotBeSent) {
     EXPECT_NE(create(objects.cred.get(), "A", 1, {}), 0) << "what was refused changed nothing";
 }
 
-TEST_F(CredRequestScene, keepsAConnectionForTheNextRequest) {
+TEST_F(CredRequestScene, KeepsAConnectionForTheNextRequest) {
     MisbehavingServer server({.tls = true});
     call(server); // pins the key, which ends the first connection
     const int before = server.connections();
@@ -220,7 +220,7 @@ TEST_F(CredRequestScene, keepsAConnectionForTheNextRequest) {
     EXPECT_EQ(server.connections(), before + 2);
 }
 
-TEST_F(CredRequestScene, replacesAKeptConnectionThatThePeerHasClosed) {
+TEST_F(CredRequestScene, ReplacesAKeptConnectionThatThePeerHasClosed) {
     MisbehavingServer server({.tls = true});
     call(server);
     call(server);
@@ -230,7 +230,7 @@ TEST_F(CredRequestScene, replacesAKeptConnectionThatThePeerHasClosed) {
     EXPECT_EQ(server.requests().size(), 3U);
 }
 
-TEST_F(CredRequestScene, repeatsARequestOfWhichNothingArrived) {
+TEST_F(CredRequestScene, RepeatsARequestOfWhichNothingArrived) {
     MisbehavingServer server({.tls = true});
     call(server);
     call(server);
@@ -241,7 +241,7 @@ TEST_F(CredRequestScene, repeatsARequestOfWhichNothingArrived) {
     EXPECT_EQ(server.requests().size(), 3U);
 }
 
-TEST_F(CredRequestScene, doesNotRepeatARequestThatMayHaveBeenCarriedOut) {
+TEST_F(CredRequestScene, DoesNotRepeatARequestThatMayHaveBeenCarriedOut) {
     MisbehavingServer server({.tls = true});
     call(server);
     call(server);
@@ -252,7 +252,7 @@ TEST_F(CredRequestScene, doesNotRepeatARequestThatMayHaveBeenCarriedOut) {
         << "it was the kept connection";
 }
 
-TEST_F(CredRequestScene, refusesAnEndpointWhoseKeyHasChanged) {
+TEST_F(CredRequestScene, RefusesAnEndpointWhoseKeyHasChanged) {
     MisbehavingServer server({.tls = true});
     EXPECT_TRUE(call(server).ok);
     server.changeCertificate();
@@ -266,7 +266,7 @@ TEST_F(CredRequestScene, refusesAnEndpointWhoseKeyHasChanged) {
     EXPECT_TRUE(call(server).ok);
 }
 
-TEST_F(CredRequestScene, dropsKeptConnectionsWhenTrustIsTakenBack) {
+TEST_F(CredRequestScene, DropsKeptConnectionsWhenTrustIsTakenBack) {
     MisbehavingServer server({.tls = true});
     call(server);
     call(server);
@@ -278,7 +278,7 @@ TEST_F(CredRequestScene, dropsKeptConnectionsWhenTrustIsTakenBack) {
     EXPECT_EQ(call(server).error, CredError::kCertificateChanged);
 }
 
-TEST_F(CredRequestScene, sendsNothingWhenAKeyCannotBePinned) {
+TEST_F(CredRequestScene, SendsNothingWhenAKeyCannotBePinned) {
     MisbehavingServer server({.tls = true});
     OtherProcess full([&server] {
         limitFileSize(0);
@@ -288,7 +288,7 @@ TEST_F(CredRequestScene, sendsNothingWhenAKeyCannotBePinned) {
     EXPECT_TRUE(server.requests().empty());
 }
 
-TEST_F(CredRequestScene, showsTheFingerprintWithoutTrustingIt) {
+TEST_F(CredRequestScene, ShowsTheFingerprintWithoutTrustingIt) {
     MisbehavingServer server({.tls = true});
     const PeerIdentity identity = peerFingerprint("https", "127.0.0.1", server.port(), 5);
     EXPECT_EQ(identity.error, CredError::kNone);
@@ -308,7 +308,7 @@ TEST_F(CredRequestScene, showsTheFingerprintWithoutTrustingIt) {
               TrustVerdict::kUnavailable);
 }
 
-TEST_F(CredRequestScene, leavesTheParentsConnectionAloneInAForkedChild) {
+TEST_F(CredRequestScene, LeavesTheParentsConnectionAloneInAForkedChild) {
     MisbehavingServer server({.tls = true});
     call(server);
     call(server);
@@ -320,7 +320,7 @@ TEST_F(CredRequestScene, leavesTheParentsConnectionAloneInAForkedChild) {
     EXPECT_EQ(server.connections(), before + 1) << "the parent's must still be usable";
 }
 
-TEST_F(CredRequestScene, servesThreadsAtOnce) {
+TEST_F(CredRequestScene, ServesThreadsAtOnce) {
     MisbehavingServer server({.tls = true});
     call(server);
     std::vector<std::thread> threads;
@@ -339,7 +339,7 @@ TEST_F(CredRequestScene, servesThreadsAtOnce) {
     EXPECT_EQ(server.requests().size(), 161U);
 }
 
-TEST_F(CredRequestScene, sendsAFileAlong) {
+TEST_F(CredRequestScene, SendsAFileAlong) {
     MisbehavingServer server({.tls = true});
     writeFile(path("file"), "the content\n");
     const Objects objects(server);
@@ -373,7 +373,7 @@ std::ostream &operator<<(std::ostream &out, const ProbeScene &scene) {
 
 class ProbeThatGets : public CredRequestScene, public testing::WithParamInterface<ProbeScene> {};
 
-TEST_P(ProbeThatGets, countsAnAnswerOfTheEntryPoint) {
+TEST_P(ProbeThatGets, CountsAnAnswerOfTheEntryPoint) {
     for (const bool tls : {false, true}) {
         MisbehavingServer server({.tls = tls});
         server.answer(GetParam().answer);
@@ -401,7 +401,7 @@ INSTANTIATE_TEST_SUITE_P(
                     ProbeScene{"50 MB", Answer::huge(50'000'000, false),
                                CredError::kReplyTooLarge}));
 
-TEST_F(CredRequestScene, probesOverConnectionsOfTheirOwn) {
+TEST_F(CredRequestScene, ProbesOverConnectionsOfTheirOwn) {
     MisbehavingServer server({.tls = true});
     call(server);
     server.changeCertificate();

@@ -13,7 +13,7 @@ namespace {
 
 using namespace OvraPlatform;
 
-TEST(WireForm, bringsEveryValueBackAsItWas) {
+TEST(WireForm, BringsEveryValueBackAsItWas) {
     WireCall call;
     call.api = "OVRA.DR.Node";
     call.version = 2;
@@ -37,13 +37,13 @@ TEST(WireForm, bringsEveryValueBackAsItWas) {
     EXPECT_EQ(OvraDRCore::toString(read->params), OvraDRCore::toString(call.params));
 }
 
-TEST(WireForm, readsWhatOtherClientsWrite) {
+TEST(WireForm, ReadsWhatOtherClientsWrite) {
     const auto call = decodeForm("method=get&&x=%22a+b%2f%2F%22&version=1&api=A&");
     ASSERT_TRUE(call);
     EXPECT_EQ(call->params["x"], "a b//");
 }
 
-TEST(WireForm, refusesWhatIsNoCall) {
+TEST(WireForm, RefusesWhatIsNoCall) {
     for (const char *body :
          {"", "api=A&method=m", "api=A&version=0&method=m", "api=A&version=1x&method=m",
           "api=A&version=99999999999&method=m", "version=1&method=m", "api=A&version=1",
@@ -62,7 +62,7 @@ TEST(WireForm, refusesWhatIsNoCall) {
     EXPECT_FALSE(decodeForm(many));
 }
 
-TEST(WireForm, hasNoParameterWithTheNameOfAField) {
+TEST(WireForm, HasNoParameterWithTheNameOfAField) {
     for (const char *name : {"api", "version", "method", "_sid", "sealed"}) {
         WireCall call{{"A", 1, "m"}};
         call.params[name] = 1;
@@ -82,7 +82,7 @@ std::ostream &operator<<(std::ostream &out, const EndpointScene &scene) {
 
 class EndpointIs : public testing::TestWithParam<EndpointScene> {};
 
-TEST_P(EndpointIs, oneSpellingOrRefused) {
+TEST_P(EndpointIs, OneSpellingOrRefused) {
     const EndpointScene &scene = GetParam();
     const auto endpoint = Endpoint::make(scene.protocol, scene.host, scene.port);
     EXPECT_EQ(endpoint ? endpoint->key() : "", scene.key);
@@ -104,7 +104,7 @@ INSTANTIATE_TEST_SUITE_P(
                     EndpointScene{"https", "a:80", 1, ""}, EndpointScene{"https", "[::1", 1, ""},
                     EndpointScene{"https", "fe80::1%eth0", 1, ""}));
 
-TEST(Endpoint, takesNothingIntoAPathThatIsNotPartOfOne) {
+TEST(Endpoint, TakesNothingIntoAPathThatIsNotPartOfOne) {
     const auto endpoint = Endpoint::make("https", "a", 1);
     ASSERT_TRUE(endpoint);
     EXPECT_EQ(endpoint->url("webapi/query.cgi"), "https://a:1/webapi/query.cgi");

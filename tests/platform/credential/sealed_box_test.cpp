@@ -64,7 +64,7 @@ protected:
     OpenedRequest opened_;
 };
 
-TEST_F(SealScene, carriesParametersAndSessionToTheOneReceiver) {
+TEST_F(SealScene, CarriesParametersAndSessionToTheOneReceiver) {
     const SealKeyPair keys = newKeys();
     const WireCall outer = seal(keys, secretCall(), kStart, replyKey_);
     EXPECT_EQ(open(newKeys("other"), outer), SealVerdict::kUnreadable);
@@ -74,14 +74,14 @@ TEST_F(SealScene, carriesParametersAndSessionToTheOneReceiver) {
     EXPECT_EQ(opened_.replyKey, replyKey_);
 }
 
-TEST_F(SealScene, isSeenOnce) {
+TEST_F(SealScene, IsSeenOnce) {
     const SealKeyPair keys = newKeys();
     const WireCall outer = seal(keys, secretCall(), kStart, replyKey_);
     EXPECT_EQ(open(keys, outer), SealVerdict::kOpened);
     EXPECT_EQ(open(keys, outer), SealVerdict::kReplayed);
 }
 
-TEST_F(SealScene, isGoodForItsOwnCallOnly) {
+TEST_F(SealScene, IsGoodForItsOwnCallOnly) {
     const SealKeyPair keys = newKeys();
     const WireCall outer = seal(keys, secretCall(), kStart, replyKey_);
     for (const APICall &other :
@@ -93,7 +93,7 @@ TEST_F(SealScene, isGoodForItsOwnCallOnly) {
     }
 }
 
-TEST_F(SealScene, doesNotOpenWhenAnyPartOfItIsChanged) {
+TEST_F(SealScene, DoesNotOpenWhenAnyPartOfItIsChanged) {
     const SealKeyPair keys = newKeys();
     const WireCall outer = seal(keys, secretCall(), kStart, replyKey_);
     for (std::size_t i = 0; i < outer.sealed.size(); i += 7) {
@@ -108,7 +108,7 @@ TEST_F(SealScene, doesNotOpenWhenAnyPartOfItIsChanged) {
     }
 }
 
-TEST_F(SealScene, doesNotShowTheLengthOfAPassword) {
+TEST_F(SealScene, DoesNotShowTheLengthOfAPassword) {
     const SealKeyPair keys = newKeys();
     WireCall call = secretCall();
     const std::size_t size = seal(keys, call, kStart, replyKey_).sealed.size();
@@ -116,7 +116,7 @@ TEST_F(SealScene, doesNotShowTheLengthOfAPassword) {
     EXPECT_EQ(seal(keys, call, kStart, replyKey_).sealed.size(), size);
 }
 
-TEST_F(SealScene, bringsTheReplyBackToItsSenderOnly) {
+TEST_F(SealScene, BringsTheReplyBackToItsSenderOnly) {
     const std::string document = R"({"success":true,"data":{"sid":"s"}})";
     newKeys(); // libsodium is ready
     randombytes_buf(replyKey_.data(), replyKey_.size());
@@ -136,7 +136,7 @@ TEST_F(SealScene, bringsTheReplyBackToItsSenderOnly) {
     EXPECT_FALSE(openReply(replyKey_, Json::Value("x")));
 }
 
-TEST_F(SealScene, keepsItsKeyInAFileOfItsOwnerOnly) {
+TEST_F(SealScene, KeepsItsKeyInAFileOfItsOwnerOnly) {
     const SealKeyPair made = newKeys();
     EXPECT_EQ(OvraTest::modeOf(path("key")), 0600U);
     EXPECT_EQ(newKeys().publicKey(), made.publicKey()) << "an existing key must be kept";
@@ -155,7 +155,7 @@ TEST_F(SealScene, keepsItsKeyInAFileOfItsOwnerOnly) {
     }
 }
 
-TEST_F(SealScene, hasOneKeyWhenTwoProcessesMakeItAtOnce) {
+TEST_F(SealScene, HasOneKeyWhenTwoProcessesMakeItAtOnce) {
     for (int round = 0; round < 20; ++round) {
         const std::string name = "key" + std::to_string(round);
         const auto make = [&, this](const std::string &result) {
@@ -173,7 +173,7 @@ TEST_F(SealScene, hasOneKeyWhenTwoProcessesMakeItAtOnce) {
     }
 }
 
-TEST(ReplayGuard, takesWhatIsStampedWithinItsWindow) {
+TEST(ReplayGuard, TakesWhatIsStampedWithinItsWindow) {
     FakeTime time;
     ReplayGuard guard(time.clocks());
     time.pass(100'000);
@@ -185,14 +185,14 @@ TEST(ReplayGuard, takesWhatIsStampedWithinItsWindow) {
     EXPECT_EQ(guard.admit(now + ReplayGuard::kFuture + 1, nonce(4)), V::kStale);
 }
 
-TEST(ReplayGuard, takesNothingFromBeforeItsStart) {
+TEST(ReplayGuard, TakesNothingFromBeforeItsStart) {
     FakeTime time;
     ReplayGuard guard(time.clocks());
     EXPECT_EQ(guard.admit(kStart - 1, nonce(1)), ReplayGuard::Verdict::kStale);
     EXPECT_EQ(guard.admit(kStart, nonce(1)), ReplayGuard::Verdict::kFresh);
 }
 
-TEST(ReplayGuard, refusesARepetitionAsLongAsItIsFreshAndAfterwards) {
+TEST(ReplayGuard, RefusesARepetitionAsLongAsItIsFreshAndAfterwards) {
     FakeTime time;
     ReplayGuard guard(time.clocks());
     const UnixMillis stamp = kStart + ReplayGuard::kFuture;
@@ -203,7 +203,7 @@ TEST(ReplayGuard, refusesARepetitionAsLongAsItIsFreshAndAfterwards) {
     }
 }
 
-TEST(ReplayGuard, doesNotForgetWhenTheClockIsSetBack) {
+TEST(ReplayGuard, DoesNotForgetWhenTheClockIsSetBack) {
     FakeTime time;
     ReplayGuard guard(time.clocks());
     ASSERT_EQ(guard.admit(kStart, nonce(1)), ReplayGuard::Verdict::kFresh);
@@ -215,7 +215,7 @@ TEST(ReplayGuard, doesNotForgetWhenTheClockIsSetBack) {
     EXPECT_EQ(guard.now(), time.wall) << "a clock that is set forward is followed";
 }
 
-TEST(ReplayGuard, isBoundedAndForgetsNoneItWouldTakeAgain) {
+TEST(ReplayGuard, IsBoundedAndForgetsNoneItWouldTakeAgain) {
     FakeTime time;
     ReplayGuard guard(time.clocks(), 10);
     for (unsigned char i = 0; i < 50; ++i) {

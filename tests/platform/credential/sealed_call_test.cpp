@@ -94,7 +94,7 @@ protected:
     Json::Value reply_;
 };
 
-TEST_F(SealedCallScene, keepsEverySecretOutOfPlainHttp) {
+TEST_F(SealedCallScene, KeepsEverySecretOutOfPlainHttp) {
     const auto server = start(false);
     EXPECT_NE(login(), 0);
     EXPECT_EQ(reply_["data"]["sid"], "granted-sid");
@@ -108,7 +108,7 @@ TEST_F(SealedCallScene, keepsEverySecretOutOfPlainHttp) {
     EXPECT_TRUE(carries(*server, "api=OVRA.Test&version=1&method=set&sealed="));
 }
 
-TEST_F(SealedCallScene, logsNothingSecretWhateverGoesWrong) {
+TEST_F(SealedCallScene, LogsNothingSecretWhateverGoesWrong) {
     const LogCapture log;
     const auto server = start(false);
     login();
@@ -130,7 +130,7 @@ TEST_F(SealedCallScene, logsNothingSecretWhateverGoesWrong) {
     }
 }
 
-TEST_F(SealedCallScene, logsInOverTlsWithoutASeal) {
+TEST_F(SealedCallScene, LogsInOverTlsWithoutASeal) {
     const auto server = start(true);
     EXPECT_NE(login(), 0);
     EXPECT_EQ(reply_["data"]["sid"], "granted-sid");
@@ -138,7 +138,7 @@ TEST_F(SealedCallScene, logsInOverTlsWithoutASeal) {
     EXPECT_TRUE(carries(*server, "passwd=%22hunter2%22"));
 }
 
-TEST_F(SealedCallScene, sealsOverTlsWhenThatIsAsked) {
+TEST_F(SealedCallScene, SealsOverTlsWhenThatIsAsked) {
     const auto server = start(true);
     ASSERT_EQ(call(2), CredError::kNone);
     EXPECT_EQ(reply_["data"]["params"]["password"], "topsecret");
@@ -146,14 +146,14 @@ TEST_F(SealedCallScene, sealsOverTlsWhenThatIsAsked) {
     EXPECT_FALSE(carries(*server, "sid-1"));
 }
 
-TEST_F(SealedCallScene, handsOutTheDocumentOfARefusedLogIn) {
+TEST_F(SealedCallScene, HandsOutTheDocumentOfARefusedLogIn) {
     const auto server = start(false);
     OVRACredItemSetRemotePasswd(cred_.get(), "wrong");
     EXPECT_NE(login(), 0);
     EXPECT_EQ(reply_["error"]["code"], 400);
 }
 
-TEST_F(SealedCallScene, saysWhyALogInGotNoAnswer) {
+TEST_F(SealedCallScene, SaysWhyALogInGotNoAnswer) {
     const auto server = start(false);
     server->refuse();
     EXPECT_EQ(login(), 0);
@@ -161,14 +161,14 @@ TEST_F(SealedCallScene, saysWhyALogInGotNoAnswer) {
     EXPECT_EQ(reply_["error"]["msg"]["cred_error"], 5);
 }
 
-TEST_F(SealedCallScene, takesNoSuccessWithoutASessionForALogIn) {
+TEST_F(SealedCallScene, TakesNoSuccessWithoutASessionForALogIn) {
     const auto server = start(true);
     server->answer(Answer::success());
     EXPECT_EQ(login(), 0);
     EXPECT_FALSE(reply_["success"].asBool());
 }
 
-TEST_F(SealedCallScene, logsOutOnce) {
+TEST_F(SealedCallScene, LogsOutOnce) {
     const auto server = start(true);
     login();
     EXPECT_NE(OVRA::CredRequestUtil::Logout(cred_.get(), sess_.get()), 0);
@@ -176,7 +176,7 @@ TEST_F(SealedCallScene, logsOutOnce) {
     EXPECT_EQ(server->requests().size(), 2U);
 }
 
-TEST_F(SealedCallScene, getsThroughToAnApplianceWithAnotherTime) {
+TEST_F(SealedCallScene, GetsThroughToAnApplianceWithAnotherTime) {
     for (const UnixMillis skew : {-90'000'000, 90'000'000}) {
         skew_ = skew;
         daemon_ = std::make_unique<SealingDaemon>(
@@ -193,7 +193,7 @@ TEST_F(SealedCallScene, getsThroughToAnApplianceWithAnotherTime) {
     }
 }
 
-TEST_F(SealedCallScene, triesNoMoreThanTwiceWhenTheTimeRunsAway) {
+TEST_F(SealedCallScene, TriesNoMoreThanTwiceWhenTheTimeRunsAway) {
     const auto runAway = [this] { return wallClock() + (skew_ += 1'000'000); };
     daemon_ = std::make_unique<SealingDaemon>(path("runaway"), serve,
                                               ReplayGuard::Clocks{runAway, runAway});
@@ -203,7 +203,7 @@ TEST_F(SealedCallScene, triesNoMoreThanTwiceWhenTheTimeRunsAway) {
     EXPECT_EQ(server->requests().size(), 3U) << "the key and two tries";
 }
 
-TEST_F(SealedCallScene, refusesAnHttpEndpointWhoseKeyHasChanged) {
+TEST_F(SealedCallScene, RefusesAnHttpEndpointWhoseKeyHasChanged) {
     const auto server = start(false);
     ASSERT_EQ(call(), CredError::kNone);
     daemon_->newKey(path("other"));
@@ -215,14 +215,14 @@ TEST_F(SealedCallScene, refusesAnHttpEndpointWhoseKeyHasChanged) {
     EXPECT_EQ(call(), CredError::kNone);
 }
 
-TEST_F(SealedCallScene, takesANewKeyThatComesOverTls) {
+TEST_F(SealedCallScene, TakesANewKeyThatComesOverTls) {
     const auto server = start(true);
     ASSERT_EQ(call(2), CredError::kNone);
     daemon_->newKey(path("other"));
     EXPECT_EQ(call(2), CredError::kNone);
 }
 
-TEST_F(SealedCallScene, believesNothingThatCouldBeForged) {
+TEST_F(SealedCallScene, BelievesNothingThatCouldBeForged) {
     const auto server = start(false);
     ASSERT_EQ(call(), CredError::kNone);
     const auto withoutTheKey = [](const std::string &reply) { return Answer::json(reply); };
@@ -238,7 +238,7 @@ TEST_F(SealedCallScene, believesNothingThatCouldBeForged) {
     EXPECT_EQ(reply_["error"]["code"], 107);
 }
 
-TEST_F(SealedCallScene, sendsNothingToAnEndpointThatHasNoKey) {
+TEST_F(SealedCallScene, SendsNothingToAnEndpointThatHasNoKey) {
     const auto server = start(false);
     server->answer(Answer::json(R"({"success":false,"error":{"code":102}})"));
     EXPECT_EQ(login(), 0);
@@ -246,7 +246,7 @@ TEST_F(SealedCallScene, sendsNothingToAnEndpointThatHasNoKey) {
     EXPECT_EQ(server->requests().size(), 1U);
 }
 
-TEST_F(SealedCallScene, sendsNoFileOverPlainHttp) {
+TEST_F(SealedCallScene, SendsNoFileOverPlainHttp) {
     const auto server = start(false);
     writeFile(path("file"), "content");
     OVRA::CredRequest request;
@@ -258,7 +258,7 @@ TEST_F(SealedCallScene, sendsNoFileOverPlainHttp) {
     EXPECT_EQ(server->connections(), 0);
 }
 
-TEST(Relay, isNotSetUp) {
+TEST(Relay, IsNotSetUp) {
     Json::Value info("x");
     EXPECT_EQ(OVRA::CredRequestFarlink::GetConnInfo("alias", info, nullptr), 0);
     EXPECT_TRUE(info.isNull());

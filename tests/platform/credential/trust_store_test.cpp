@@ -26,7 +26,7 @@ protected:
     TrustStore store() const { return TrustStore(file()); }
 };
 
-TEST_F(TrustScene, trustsTheKeyThatAnEndpointHadFirst) {
+TEST_F(TrustScene, TrustsTheKeyThatAnEndpointHadFirst) {
     const std::string key = fingerprint("a");
     EXPECT_EQ(store().lookup("https://a:1", key), TrustVerdict::kUnknown);
     EXPECT_EQ(store().pin("https://a:1", key), TrustVerdict::kTrusted);
@@ -39,7 +39,7 @@ TEST_F(TrustScene, trustsTheKeyThatAnEndpointHadFirst) {
     EXPECT_EQ(OvraTest::modeOf(file()), 0600U);
 }
 
-TEST_F(TrustScene, forgetsOneEndpointAndListsTheOthers) {
+TEST_F(TrustScene, ForgetsOneEndpointAndListsTheOthers) {
     EXPECT_TRUE(store().forget("https://a:1"));
     for (const char *endpoint : {"https://a:1", "https://b:1", "https://c:1"}) {
         store().pin(endpoint, fingerprint(endpoint));
@@ -53,7 +53,7 @@ TEST_F(TrustScene, forgetsOneEndpointAndListsTheOthers) {
     EXPECT_EQ(entries->back().fingerprint, fingerprint("https://c:1"));
 }
 
-TEST_F(TrustScene, keepsLinesThatItDoesNotUnderstand) {
+TEST_F(TrustScene, KeepsLinesThatItDoesNotUnderstand) {
     const std::string strange = "# a comment\n\nhttps://a:1 SHA256:short\nrubbish\n"
                                 "https://b:1  " +
                                 fingerprint("b") + "\n";
@@ -66,7 +66,7 @@ TEST_F(TrustScene, keepsLinesThatItDoesNotUnderstand) {
     EXPECT_EQ(store().lookup("https://c:1", fingerprint("c")), TrustVerdict::kTrusted);
 }
 
-TEST_F(TrustScene, countsTheFirstOfTwoLines) {
+TEST_F(TrustScene, CountsTheFirstOfTwoLines) {
     OvraTest::writeFile(file(), "https://a:1 " + fingerprint("1") + "\nhttps://a:1 " +
                                     fingerprint("2") + "\n");
     EXPECT_EQ(store().lookup("https://a:1", fingerprint("2")), TrustVerdict::kDifferent);
@@ -75,7 +75,7 @@ TEST_F(TrustScene, countsTheFirstOfTwoLines) {
     EXPECT_EQ(store().lookup("https://a:1", fingerprint("2")), TrustVerdict::kUnknown);
 }
 
-TEST_F(TrustScene, refusesToJudgeWithoutItsFile) {
+TEST_F(TrustScene, RefusesToJudgeWithoutItsFile) {
     std::filesystem::create_directory(file());
     EXPECT_EQ(store().lookup("https://a:1", fingerprint("a")), TrustVerdict::kUnavailable);
     EXPECT_EQ(store().pin("https://a:1", fingerprint("a")), TrustVerdict::kUnavailable);
@@ -83,7 +83,7 @@ TEST_F(TrustScene, refusesToJudgeWithoutItsFile) {
     EXPECT_FALSE(store().forget("https://a:1"));
 }
 
-TEST_F(TrustScene, keepsTheOldKeysWhenTheDiskIsFull) {
+TEST_F(TrustScene, KeepsTheOldKeysWhenTheDiskIsFull) {
     store().pin("https://a:1", fingerprint("a"));
     const std::string before = OvraTest::readFile(file());
     OvraTest::OtherProcess full([this, &before] {
@@ -94,7 +94,7 @@ TEST_F(TrustScene, keepsTheOldKeysWhenTheDiskIsFull) {
     EXPECT_EQ(OvraTest::readFile(file()), before);
 }
 
-TEST_F(TrustScene, losesNoKeyOfProcessesThatPinAtOnce) {
+TEST_F(TrustScene, LosesNoKeyOfProcessesThatPinAtOnce) {
     const auto pinMany = [this](const std::string &name) {
         return [this, name] {
             for (int i = 0; i < 25; ++i) {
@@ -110,7 +110,7 @@ TEST_F(TrustScene, losesNoKeyOfProcessesThatPinAtOnce) {
     EXPECT_EQ(store().list()->size(), 50U);
 }
 
-TEST_F(TrustScene, survivesTheDeathOfAWriter) {
+TEST_F(TrustScene, SurvivesTheDeathOfAWriter) {
     store().pin("https://first:1", fingerprint("first"));
     std::size_t atLeast = 1;
     for (int round = 0; round < 10; ++round) {

@@ -44,7 +44,7 @@ const APICaller kLocal{"admin", true, "", "", true};
 
 class Dispatch : public testing::TestWithParam<Scene> {};
 
-TEST_P(Dispatch, answersWithTheCodeOfTheWireForm) {
+TEST_P(Dispatch, AnswersWithTheCodeOfTheWireForm) {
     APIRegistry registry;
     registry.add("Open", 1, "get", APIRight::kNone, APIQueue::kQuick, echo);
     registry.add("Mine", 2, "get", APIRight::kSession, APIQueue::kQuick, echo);
@@ -89,14 +89,14 @@ INSTANTIATE_TEST_SUITE_P(
         Scene{"not an exception", {"Bad", 1, "throw_number"}, kUser, APIError::kInternal},
         Scene{"no document", {"Bad", 1, "no_document"}, kUser, APIError::kInternal}));
 
-TEST(APIRegistry, givesAHandlerAnObjectForNullParameters) {
+TEST(APIRegistry, GivesAHandlerAnObjectForNullParameters) {
     APIRegistry registry;
     registry.add("Open", 1, "get", APIRight::kNone, APIQueue::kQuick, echo);
     const Json::Value reply = registry.dispatch({"Open", 1, "get", Json::Value()}, kNobody);
     EXPECT_EQ(reply["data"]["params"], Json::Value(Json::objectValue));
 }
 
-TEST(APIRegistry, knowsTheLaneOfEachVersion) {
+TEST(APIRegistry, KnowsTheLaneOfEachVersion) {
     APIRegistry registry;
     registry.add("A", 1, "get", APIRight::kNone, APIQueue::kQuick, echo);
     registry.add("A", 2, "get", APIRight::kNone, APIQueue::kSlow, echo);
@@ -105,7 +105,7 @@ TEST(APIRegistry, knowsTheLaneOfEachVersion) {
     EXPECT_EQ(registry.queue({"B", 1, "get"}), APIQueue::kQuick);
 }
 
-TEST(APIRunner, runsTheHandlersThatItsProcessHostsAsALocalAdministrator) {
+TEST(APIRunner, RunsTheHandlersThatItsProcessHostsAsALocalAdministrator) {
     Json::Value out;
     {
         APIRegistry registry;
@@ -121,7 +121,7 @@ TEST(APIRunner, runsTheHandlersThatItsProcessHostsAsALocalAdministrator) {
     EXPECT_EQ(APIRegistry::hosted(), nullptr);
 }
 
-TEST(APIValidator, acceptsPortsOnly) {
+TEST(APIValidator, AcceptsPortsOnly) {
     EXPECT_TRUE(OVRA::APIValidator::IsPort(1));
     EXPECT_TRUE(OVRA::APIValidator::IsPort(65535));
     EXPECT_FALSE(OVRA::APIValidator::IsPort(0));

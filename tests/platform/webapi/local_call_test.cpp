@@ -70,7 +70,7 @@ protected:
     }
 };
 
-TEST_F(LocalCallScene, carriesTheWholeCallAndTheWholeReply) {
+TEST_F(LocalCallScene, CarriesTheWholeCallAndTheWholeReply) {
     LocalServer server(kSocketFile, echo);
     ASSERT_TRUE(server.start());
     Json::Value params;
@@ -85,14 +85,14 @@ TEST_F(LocalCallScene, carriesTheWholeCallAndTheWholeReply) {
     EXPECT_EQ(OvraTest::modeOf(kStateDir), 0700U);
 }
 
-TEST_F(LocalCallScene, saysSoWhenNoDaemonRuns) {
+TEST_F(LocalCallScene, SaysSoWhenNoDaemonRuns) {
     Json::Value out;
     EXPECT_FALSE(OVRA::APIRunner().Exec(out, "Test", 1, "get", Json::Value(), "admin"));
     EXPECT_EQ(codeOf(out), APIError::kInternal);
     EXPECT_NE(out["error"]["msg"].asString().find("ovradrd does not answer"), std::string::npos);
 }
 
-TEST_F(LocalCallScene, saysSoWhenTheDaemonDiesDuringTheCall) {
+TEST_F(LocalCallScene, SaysSoWhenTheDaemonDiesDuringTheCall) {
     OvraTest::OtherProcess daemon([this] {
         LocalServer server(kSocketFile, [](const LocalCall &) -> Json::Value { _exit(9); });
         static_cast<void>(server.start());
@@ -105,7 +105,7 @@ TEST_F(LocalCallScene, saysSoWhenTheDaemonDiesDuringTheCall) {
     EXPECT_EQ(codeOf(ask()), APIError::kInternal);
 }
 
-TEST_F(LocalCallScene, replacesTheSocketOfADeadDaemonOnly) {
+TEST_F(LocalCallScene, ReplacesTheSocketOfADeadDaemonOnly) {
     {
         OvraTest::OtherProcess daemon([this] {
             LocalServer server(kSocketFile, echo);
@@ -126,7 +126,7 @@ TEST_F(LocalCallScene, replacesTheSocketOfADeadDaemonOnly) {
     EXPECT_EQ(codeOf(ask()), 0);
 }
 
-TEST_F(LocalCallScene, takesNoPlaceThatIsNotItsOwn) {
+TEST_F(LocalCallScene, TakesNoPlaceThatIsNotItsOwn) {
     ASSERT_TRUE(ensureStateDir());
     OvraTest::writeFile(kSocketFile, "precious");
     LocalServer onFile(kSocketFile, echo);
@@ -139,7 +139,7 @@ TEST_F(LocalCallScene, takesNoPlaceThatIsNotItsOwn) {
     EXPECT_NE(started.error().find("too long"), std::string::npos);
 }
 
-TEST_F(LocalCallScene, refusesTheProcessesOfOtherUsers) {
+TEST_F(LocalCallScene, RefusesTheProcessesOfOtherUsers) {
     if (geteuid() != 0) {
         GTEST_SKIP() << "only root can become another user";
     }
@@ -160,7 +160,7 @@ TEST_F(LocalCallScene, refusesTheProcessesOfOtherUsers) {
     EXPECT_EQ(code, APIError::kNoPermission);
 }
 
-TEST_F(LocalCallScene, survivesRubbish) {
+TEST_F(LocalCallScene, SurvivesRubbish) {
     LocalServer server(kSocketFile, echo);
     ASSERT_TRUE(server.start());
     const std::string four("\0\0\0\4", 4);
@@ -176,7 +176,7 @@ TEST_F(LocalCallScene, survivesRubbish) {
     EXPECT_EQ(codeOf(ask()), 0);
 }
 
-TEST_F(LocalCallScene, answersForAHandlerThatFails) {
+TEST_F(LocalCallScene, AnswersForAHandlerThatFails) {
     LocalServer server(kSocketFile, [](const LocalCall &call) {
         if (call.method == "throw") {
             throw std::runtime_error("broken");
@@ -188,7 +188,7 @@ TEST_F(LocalCallScene, answersForAHandlerThatFails) {
     EXPECT_EQ(codeOf(ask("flood")), APIError::kTooLarge);
 }
 
-TEST_F(LocalCallScene, servesMoreCallersThanItHasThreads) {
+TEST_F(LocalCallScene, ServesMoreCallersThanItHasThreads) {
     std::atomic<int> running{0};
     std::atomic<int> most{0};
     LocalServer server(
@@ -214,7 +214,7 @@ TEST_F(LocalCallScene, servesMoreCallersThanItHasThreads) {
     EXPECT_EQ(most, 2);
 }
 
-TEST_F(LocalCallScene, stopsAtOnceButAnswersTheCallUnderWay) {
+TEST_F(LocalCallScene, StopsAtOnceButAnswersTheCallUnderWay) {
     std::promise<void> entered;
     LocalServer server(kSocketFile, [&](const LocalCall &call) {
         entered.set_value();
