@@ -5,9 +5,9 @@
 #include "alias_registry.h"
 #include "relay_api.h"
 #include "service/certificate.h"
-#include "service/exit_code.h"
 #include "service/http_server.h"
 #include "service/listener.h"
+#include "service/startup.h"
 #include "service/tls_identity.h"
 #include "tunnel_server.h"
 
@@ -18,7 +18,6 @@
 #include <ovraplatform/farlink.h>
 
 #include <CLI/CLI.hpp>
-#include <sys/resource.h>
 #include <syslog.h>
 
 #include <array>
@@ -39,7 +38,7 @@ using OvraService::Listener;
 using OvraService::StartError;
 using OvraService::TlsIdentity;
 
-constexpr rlim_t kDescriptors = 16384;
+constexpr unsigned long kDescriptors = 16384;
 constexpr int kMaxAliases = 4000; // what fits into the file of aliases, with room to spare
 constexpr timespec kTick{1, 0};
 
@@ -61,18 +60,7 @@ constexpr char kFooter[] =
     "Exit codes: 0 ended by a signal, 1 failed, 2 wrong usage, 3 a port is in use.";
 
 int fail(const StartError &why) {
-    OVRA_ERR("farlinkd does not start: %s", why.text.c_str());
-    std::fprintf(stderr, "farlinkd: %s\n", why.text.c_str());
-    return static_cast<int>(why.exit);
-}
-
-void raiseDescriptorLimit() {
-    rlimit limit{};
-    if (getrlimit(RLIMIT_NOFILE, &limit) == 0 && limit.rlim_cur < kDescriptors) {
-        limit.rlim_cur =
-            limit.rlim_max == RLIM_INFINITY ? kDescriptors : std::min(kDescriptors, limit.rlim_max);
-        setrlimit(RLIMIT_NOFILE, &limit);
-    }
+    return OvraService::reportStartError("farlinkd", why);
 }
 
 std::string ownName() {
@@ -107,14 +95,8 @@ void waitForEnd(const sigset_t &signals, RelayApi &api) {
 }
 
 int serve(const Options &options) {
-    std::signal(SIGPIPE, SIG_IGN);
-    sigset_t signals;
-    sigemptyset(&signals);
-    for (const int signal : {SIGTERM, SIGINT, SIGHUP}) {
-        sigaddset(&signals, signal);
-    }
-    pthread_sigmask(SIG_BLOCK, &signals, nullptr);
-    raiseDescriptorLimit();
+    const sigset_t signals = OvraService::blockEndSignals();
+    OvraService::raiseDescriptorLimit(kDescriptors);
 
     std::string fingerprint;
     const auto identity = identityIn(options, fingerprint);

@@ -1,7 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
-#include "service/exit_code.h"
+#include "service/startup.h"
 #include "service/http_server.h"
 
 #include <chrono>

@@ -9,7 +9,6 @@
 #include <ovraplatform/appliance.h>
 
 #include <CLI/CLI.hpp>
-#include <sys/resource.h>
 #include <syslog.h>
 #include <unistd.h>
 
@@ -28,7 +27,7 @@ using OvraService::StartError;
 
 constexpr time_t kWorkPeriodSeconds = 20;
 /// Descriptors for the connections that it may have, and for everything else.
-constexpr rlim_t kDescriptors = 4096;
+constexpr unsigned long kDescriptors = 4096;
 
 constexpr char kFooter[] =
     "Serves in the foreground until SIGTERM or SIGINT; prints one line when it is ready. Settings\n"
@@ -37,9 +36,7 @@ constexpr char kFooter[] =
     "Exit codes: 0 ended by a signal, 1 failed, 2 wrong usage, 3 a port is in use, 9 not set up.";
 
 int fail(const StartError &why) {
-    OVRA_ERR("ovradrd does not start: %s", why.text.c_str());
-    std::fprintf(stderr, "ovradrd: %s\n", why.text.c_str());
-    return static_cast<int>(why.exit);
+    return OvraService::reportStartError("ovradrd", why);
 }
 
 tl::expected<Ovradrd::Settings, StartError> readSettings() {
@@ -61,31 +58,6 @@ tl::expected<Ovradrd::Settings, StartError> readSettings() {
     return settings;
 }
 
-void raiseDescriptorLimit() {
-    rlimit limit{};
-    if (getrlimit(RLIMIT_NOFILE, &limit) != 0 || limit.rlim_cur >= kDescriptors) {
-        return;
-    }
-    limit.rlim_cur =
-        limit.rlim_max == RLIM_INFINITY ? kDescriptors : std::min(kDescriptors, limit.rlim_max);
-    if (setrlimit(RLIMIT_NOFILE, &limit) != 0 || limit.rlim_cur < kDescriptors) {
-        OVRA_WARN("Only [%llu] descriptors are allowed, fewer than all connections need: raise "
-                  "the limit of open files",
-                  static_cast<unsigned long long>(limit.rlim_cur));
-    }
-}
-
-/// The signals that end the daemon, kept from all threads so that the main one can wait for them.
-sigset_t blockEndSignals() {
-    sigset_t signals;
-    sigemptyset(&signals);
-    for (const int signal : {SIGTERM, SIGINT, SIGHUP}) {
-        sigaddset(&signals, signal);
-    }
-    pthread_sigmask(SIG_BLOCK, &signals, nullptr);
-    return signals;
-}
-
 /// Waits for the end, and has the daemon do its periodic work meanwhile.
 void waitForEnd(Daemon &daemon, const sigset_t &signals) {
     const timespec period{kWorkPeriodSeconds, 0};
@@ -95,9 +67,8 @@ void waitForEnd(Daemon &daemon, const sigset_t &signals) {
 }
 
 int serve() {
-    std::signal(SIGPIPE, SIG_IGN);
-    const sigset_t signals = blockEndSignals();
-    raiseDescriptorLimit();
+    const sigset_t signals = OvraService::blockEndSignals();
+    OvraService::raiseDescriptorLimit(kDescriptors);
 
     const auto settings = readSettings();
     if (!settings) {

@@ -3,6 +3,7 @@
 
 #include <ovrabase/expected.h>
 
+#include <csignal>
 #include <string>
 
 namespace OvraService {
@@ -27,5 +28,16 @@ struct StartError {
     StartError(OvraBase::Error why) // NOLINT(google-explicit-constructor)
         : text(std::move(why.text)) {}
 };
+
+/// Tells on standard error and in the log why `program` does not start. \return its exit status
+int reportStartError(const char *program, const StartError &why);
+
+/// Raises the soft limit of open file descriptors to `count`, as far as the hard limit allows; a
+/// lower limit is a warning in the log.
+void raiseDescriptorLimit(unsigned long count);
+
+/// Blocks the signals that end a daemon (SIGTERM, SIGINT, SIGHUP) in this thread and those that it
+/// starts, so that one thread can wait for them, and ignores SIGPIPE. \return those signals
+sigset_t blockEndSignals();
 
 } // namespace OvraService

@@ -1,0 +1,44 @@
+// SPDX-License-Identifier: Apache-2.0
+#include "service/startup.h"
+
+#include <ovradrcore/log.h>
+
+#include <pthread.h>
+#include <sys/resource.h>
+
+#include <algorithm>
+#include <cstdio>
+
+namespace OvraService {
+
+int reportStartError(const char *program, const StartError &why) {
+    OVRA_ERR("%s does not start: %s", program, why.text.c_str());
+    std::fprintf(stderr, "%s: %s\n", program, why.text.c_str());
+    return static_cast<int>(why.exit);
+}
+
+void raiseDescriptorLimit(unsigned long count) {
+    rlimit limit{};
+    if (getrlimit(RLIMIT_NOFILE, &limit) != 0 || limit.rlim_cur >= count) {
+        return;
+    }
+    limit.rlim_cur = std::min<rlim_t>(count, limit.rlim_max);
+    if (setrlimit(RLIMIT_NOFILE, &limit) != 0 || limit.rlim_cur < count) {
+        OVRA_WARN("Only [%llu] descriptors are allowed, fewer than all connections need: raise "
+                  "the limit of open files",
+                  static_cast<unsigned long long>(limit.rlim_cur));
+    }
+}
+
+sigset_t blockEndSignals() {
+    std::signal(SIGPIPE, SIG_IGN);
+    sigset_t signals;
+    sigemptyset(&signals);
+    for (const int signal : {SIGTERM, SIGINT, SIGHUP}) {
+        sigaddset(&signals, signal);
+    }
+    pthread_sigmask(SIG_BLOCK, &signals, nullptr);
+    return signals;
+}
+
+} // namespace OvraService
