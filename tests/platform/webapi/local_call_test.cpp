@@ -93,7 +93,7 @@ TEST_F(LocalCallScene, SaysSoWhenNoDaemonRuns) {
 }
 
 TEST_F(LocalCallScene, SaysSoWhenTheDaemonDiesDuringTheCall) {
-    OvraTest::OtherProcess daemon([this] {
+    OvraTest::OtherProcess daemon([] {
         LocalServer server(kSocketFile, [](const LocalCall &) -> Json::Value { _exit(9); });
         static_cast<void>(server.start());
         pause();
@@ -107,7 +107,7 @@ TEST_F(LocalCallScene, SaysSoWhenTheDaemonDiesDuringTheCall) {
 
 TEST_F(LocalCallScene, ReplacesTheSocketOfADeadDaemonOnly) {
     {
-        OvraTest::OtherProcess daemon([this] {
+        OvraTest::OtherProcess daemon([] {
             LocalServer server(kSocketFile, echo);
             static_cast<void>(server.start());
             pause();
