@@ -25,7 +25,6 @@ using OvraDRCore::Request;
 using OvraDRCore::Response;
 using OvraDRNode::Conn;
 using OvraDRNode::NodeSender;
-namespace ERR = OvraDRCore::ERR;
 
 constexpr const char *kCredentialApi = "OVRA.DR.Node.Credential";
 
