@@ -20,7 +20,8 @@ void Response::setResp(const Json::Value &reply) {
 
 void Response::setResp(Json::Value &&reply) {
     *this = Response();
-    const Json::Value &document = reply; // looking for a member adds it where that is allowed
+    const Json::Value &document =
+        reply; // operator[] would add a missing member to a non-const value
     if (!document.isObject() || !document["success"].isBool()) {
         return;
     }
