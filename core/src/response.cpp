@@ -20,8 +20,7 @@ void Response::setResp(const Json::Value &reply) {
 
 void Response::setResp(Json::Value &&reply) {
     *this = Response();
-    const Json::Value &document =
-        reply; // operator[] would add a missing member to a non-const value
+    const Json::Value &document = reply; // a non-const operator[] would add a missing member
     if (!document.isObject() || !document["success"].isBool()) {
         return;
     }

@@ -20,7 +20,7 @@ if ($nameA eq '--probe') {
     exit;
 }
 my $delay = $milliseconds / 2000;
-# Drops what a kernel queue would drop as well.
+# Beyond this a kernel queue would drop frames as well.
 my $most = 20_000;
 
 sub openTap {

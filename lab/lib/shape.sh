@@ -1,8 +1,10 @@
 # SPDX-License-Identifier: Apache-2.0
 # shellcheck shell=bash
 # lab shape: makes a node's links slow, delayed or lossy.
-#   rate both directions, by a token bucket (tc) at both ends of the link delay added to the round trip: a program of ours between node and switch forwards every frame with half of it each way. Not tc's netem, which container kernels lack. loss of the IPv4 packets in each
-#   direction, by the firewall of the switch
+#   rate    both directions, by a token bucket (tc) at both ends of the link
+#   delay   added to the round trip: a program of ours between node and switch forwards every frame
+#           after half of it. Not tc's netem, which container kernels lack.
+#   loss    of the IPv4 packets in each direction, by the firewall of the switch
 
 labShape() {
     local action=shape rate="" delay="" loss="" off=no shaped=(0 1)
