@@ -1,6 +1,6 @@
 # SPDX-License-Identifier: Apache-2.0
-# The usual ways to build, test and show. Each installs what is missing, does only what is not done
-# yet, and says what it runs. Everything made lies in build/.
+# The usual targets to build, test and demonstrate. Each installs missing packages, does only what
+# is not up to date, and prints what it runs. All output is in build/.
 
 JOBS ?= $(shell nproc)
 stage := $(CURDIR)/build/stage
@@ -13,17 +13,17 @@ help: ## this list
 	@sed -n 's/^\([a-z-]*\):.*## /\1\t/p' $(MAKEFILE_LIST) | while IFS="$$(printf '\t')" read -r target text; do \
 		printf '  make %-8s %s\n' "$$target" "$$text"; done
 
-demo: deps-lab stage ## two appliances on this machine pair, talk and part, before your eyes
+demo: deps-lab stage ## two appliances on this machine pair, talk and part
 	@OVRADR_LAB_PREFIX='$(stage)' lab/demo
 
-test: deps-test deps-lab build-dev ## every test, each on a node of its own (TESTS=regex picks some)
+test: deps-test deps-lab build-dev ## every test, each on its own node (TESTS=regex selects some)
 	@lab/lab way | sed 's/^/tests run by way of /'
 	ctest --preset dev -j $(JOBS) $(if $(TESTS),-R '$(TESTS)')
 
-bench: deps-bench build/bench/build.ninja ## the benchmarks, side by side with the floor
+bench: deps-bench build/bench/build.ninja ## the benchmarks, compared with their baselines
 	@cmake --build build/bench -j $(JOBS) --target bench
 
-vendor: deps-test deps-check ## the library on an appliance's own platform, with stand-ins for it
+vendor: deps-test deps-check ## the library on a vendor's own platform, with stand-ins for it
 	@tools/check-vendor
 
 build: deps-build build/release/build.ninja ## the libraries and programs, optimised
@@ -35,8 +35,8 @@ stage: build
 build-dev: deps-test build/dev/build.ninja
 	@cmake --build build/dev -j $(JOBS)
 
-# Ninja configures again by itself when a CMakeLists.txt changes, but not when the presets do.
-# The benchmarks have a tree of their own, so that the demo does not wait for them.
+# Ninja reconfigures by itself when a CMakeLists.txt changes, but not when the presets do. The
+# benchmarks have their own build tree, so that the demo does not wait for them.
 build/dev/build.ninja: CMakePresets.json
 	cmake --preset dev
 	@touch $@
@@ -47,13 +47,13 @@ build/bench/build.ninja: CMakePresets.json
 	cmake --preset release -B build/bench
 	@touch $@
 
-format: deps-check ## put every C++ file into the one layout
+format: deps-check ## format every C++ file
 	@tools/sources cpp | xargs -0 clang-format -i
 
-check: deps-build deps-check ## what CI asks of every change, without the builds
+check: deps-build deps-check ## the CI checks that need no build
 	@tools/check
 
-clean: ## remove everything that was made
+clean: ## remove all output
 	rm -rf build
 
 deps-build deps-test deps-lab deps-bench deps-check: deps-%:

@@ -16,7 +16,7 @@ namespace OvraBench {
 namespace {
 
 constexpr const char *kFloorFile = "/tmp/.ovradrcache/floor";
-/// What one update of a cache file writes at most: one copy of a bucket.
+/// The most that one update of a cache file writes: one copy of a bucket.
 constexpr std::size_t kBlock = 4096;
 
 class BenchCache : public OvraDRCore::Cache {
@@ -28,7 +28,7 @@ public:
     bool IsValid(const Json::Value &value) const override { return value.isBool(); }
 };
 
-/// Open, lock, read or write, close: what any file that processes share costs.
+/// Open, lock, read or write, close: the cost of any file shared by processes.
 void floorOperation(bool write) {
     static std::array<char, kBlock> block{};
     const int fd = open(kFloorFile, O_RDWR | O_CREAT | O_CLOEXEC, 0600);

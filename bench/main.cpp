@@ -1,7 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 
-// Measures the library beside the floor under it and prints the rows of docs/performance.md.
-// Run by `make bench`, in a view of its own; "send" needs a running ovradrd.
+// Compares the library with baselines and prints the rows of docs/performance.md. Run by `make
+// bench`, in a sandbox; "send" needs a running ovradrd.
 
 #include "measure.h"
 #include "support/sandbox.h"

@@ -21,17 +21,17 @@ struct Comparison {
     Spread ratio; ///< ours / floor, round by round
 };
 
-/// Runs the two in turn, a batch of calls each, so that a machine whose speed drifts treats both
-/// alike.
-/// \param calls   calls in a batch
-/// \param rounds  pairs of batches that count, after one that does not
+/// Runs the two alternately, one batch of calls each, so that drift in the machine's speed affects
+/// both alike.
+/// \param calls   calls per batch
+/// \param rounds  measured pairs of batches, after one warm-up pair
 Comparison compare(int calls, int rounds, const Work &ours, const Work &floor);
 
-/// Prints one row of the table: what was compared, both times, the ratio and what it may be at
-/// most. \return whether the median is within the bound.
+/// Prints one row of the table: the operations, both times, the ratio and its upper bound. \return
+/// whether the median is within the bound.
 bool report(const std::string &what, const Comparison &comparison, double bound);
 
-// Each runs its rows. \return whether all of them are within their bounds.
+// Each runs its rows. \return whether all are within their bounds.
 bool benchCache();
 bool benchDb();
 bool benchSend();

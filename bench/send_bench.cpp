@@ -18,8 +18,8 @@ namespace {
 constexpr const char *kNode = "bench-remote";
 constexpr int kPort = 5001;
 
-/// A credential to the daemon of this very appliance under another node id: the library then takes
-/// the road over the network.
+/// A credential for this appliance's own daemon under another node id, so that the library uses the
+/// network.
 std::string addCredential() {
     OvraDRNode::NodeSession sessions;
     std::string session = sessions.CreateNodeSession(kNode, "bench");

@@ -1,4 +1,4 @@
-# Compiler settings, and the two functions by which every target here is made.
+# Compiler settings, and the two functions that create the library targets.
 
 set(CMAKE_CXX_STANDARD 20)
 set(CMAKE_CXX_STANDARD_REQUIRED ON)

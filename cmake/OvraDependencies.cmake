@@ -1,4 +1,4 @@
-# The libraries that this project stands on, each as one imported target.
+# The dependencies of this project, each as one imported target.
 
 find_package(PkgConfig REQUIRED)
 pkg_check_modules(jsoncpp REQUIRED IMPORTED_TARGET jsoncpp)

@@ -1,4 +1,4 @@
-# What `cmake --install` puts where, and the packages by which other projects find it.
+# Installation rules, and the packages by which other projects find the library.
 include(CMakePackageConfigHelpers)
 
 set(ovra_installed ovradrcore ovradrnode)
@@ -9,7 +9,7 @@ install(TARGETS ${ovra_installed} EXPORT OvraDRNodeTargets
   LIBRARY DESTINATION "${CMAKE_INSTALL_LIBDIR}")
 install(DIRECTORY include/ovradrnode core/include/ovradrcore
   DESTINATION "${CMAKE_INSTALL_INCLUDEDIR}" FILES_MATCHING PATTERN "*.h")
-# What an appliance is set up with: by ovradr, or by its own package where there is none.
+# The files for setting up an appliance: by ovradr, or by the vendor's package where there is none.
 install(FILES src/db/node.sql DESTINATION "${CMAKE_INSTALL_DATADIR}/ovradrnode")
 install(PROGRAMS scripts/TestDownloadSpeed.sh scripts/TestSyncSpeed.sh
   DESTINATION "${CMAKE_INSTALL_DATADIR}/ovradrnode")
@@ -24,7 +24,7 @@ install(FILES "${PROJECT_BINARY_DIR}/OvraDRNodeConfig.cmake"
               "${PROJECT_BINARY_DIR}/OvraDRNodeConfigVersion.cmake"
   DESTINATION "${ovra_cmake_dir}")
 
-# The packages say where they are by where they lie, so an installed tree can be moved.
+# The packages are relocatable, so an installed tree can be moved.
 file(RELATIVE_PATH ovra_pc_to_prefix
   "/prefix/${CMAKE_INSTALL_LIBDIR}/pkgconfig" "/prefix")
 foreach(package ovradrcore ovradrnode)

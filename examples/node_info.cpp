@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 
-// Asks a node who it is: node_info NODE_ID, or node_info alone for this appliance.
+// Asks a node for its identity: node_info NODE_ID, or node_info alone for this appliance.
 
 #include <ovradrcore/json.h>
 #include <ovradrnode/ovradrnode.h>
@@ -12,7 +12,7 @@ int main(int argc, char **argv) {
     OvraDRNode::NodeSender sender(nodeId);
     const OvraDRCore::Response answer = sender.process(OvraDRNode::WebAPI::getDRNodeInfoAPI({}));
     if (!answer.isSuccess()) {
-        // A refusal is in the answer; why there is no answer, in the sender.
+        // A refusal is in the answer; the reason for a missing answer is in the sender.
         const OvraDRCore::ErrRecorder error = OvraDRNode::errorOf(sender, answer);
         std::cerr << (answer.isValid() ? "refused: " : "no answer: ")
                   << OvraDRCore::toString(error.GetErr()) << '\n';

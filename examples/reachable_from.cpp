@@ -1,9 +1,9 @@
 // SPDX-License-Identifier: Apache-2.0
 
-// Which of several endpoints does a node reach? A complete operation that runs here or there:
-//   reachable_from NODE_ID PROTOCOL:ADDRESS:PORT...
-// NODE_ID "local" is this appliance. OVRADR_CRED=CRED_ID names the credential to use for another
-// one; without it the library takes whichever works.
+// Finds which of several endpoints a node can reach. A complete operation that runs locally or
+//   remotely: reachable_from NODE_ID PROTOCOL:ADDRESS:PORT...
+// NODE_ID "local" is this appliance. For another node, OVRADR_CRED=CRED_ID selects the credential;
+// without it the library uses one that works.
 
 #include <ovradrcore/json.h>
 #include <ovradrnode/ovradrnode.h>
@@ -17,7 +17,7 @@
 using OvraDRNode::Conn;
 using OvraDRNode::DRNode;
 
-/// What an operation has to say about itself; Run() of the base class does the rest.
+/// Defines the operation; Run() of the base class does the rest.
 class FindReachable : public OvraDRNode::NodeOperationDispatcher {
 public:
     FindReachable(const std::string &nodeId, const std::vector<Conn> &conns,
@@ -26,7 +26,7 @@ public:
         , conns_(conns)
         , credId_(credId) {}
 
-    /// Asked first, also when the node is another one: nothing is sent that it would refuse.
+    /// Called first, also for a remote node: nothing is sent that it would refuse.
     bool IsValidParam() override {
         constexpr std::size_t kMaxConns = 32;
         return !conns_.empty() && conns_.size() <= kMaxConns &&
@@ -34,7 +34,7 @@ public:
                            [](const Conn &conn) { return conn.isValid(); });
     }
 
-    /// The work itself, when the node is this one.
+    /// The work on the local node.
     bool RunLocal() override {
         for (const Conn &conn : conns_) {
             if (OvraDRNode::BaseSender::IsConnectable(conn)) {
@@ -46,7 +46,7 @@ public:
         return false;
     }
 
-    /// The request that has another node do the same.
+    /// The request that makes another node do the same.
     OvraDRCore::Request GetRequest() override {
         return OvraDRNode::WebAPI::getDRNodeTestConnectionAPI(conns_);
     }
@@ -58,7 +58,7 @@ private:
     std::string credId_;
 };
 
-/// "https:192.0.2.7:5001"; what cannot be read gives an endpoint that is not valid.
+/// "https:192.0.2.7:5001"; malformed text gives an invalid endpoint.
 static Conn parseConn(const std::string &text) {
     const std::size_t first = text.find(':');
     const std::size_t last = text.rfind(':');

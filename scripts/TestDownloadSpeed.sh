@@ -1,17 +1,17 @@
 #!/bin/sh
 # SPDX-License-Identifier: Apache-2.0
-# TestDownloadSpeed.sh URL RETRIES TIMEOUT: downloads URL, throws the bytes away, and prints how fast
-# they came, from the first byte to the last, as "NUMBER Mbit/s" (10^6 bits a second, one decimal)
-# without an end of line. Prints nothing when nothing can be measured; standard error says why.
+# TestDownloadSpeed.sh URL RETRIES TIMEOUT: downloads URL, discards the bytes, and prints the speed
+# from the first byte to the last as "NUMBER Mbit/s" (10^6 bits per second, one decimal) without a
+# newline. Prints nothing if nothing can be measured; standard error says why.
 #
-# RETRIES further attempts follow one that failed, at most 10. TIMEOUT bounds all of them together,
-# in seconds, at most 600; 0 counts as 30. Where it is over before the download is, the part that
-# came is measured.
+# After a failure up to RETRIES further attempts follow, at most 10. TIMEOUT limits all of them
+# together, in seconds, at most 600; 0 counts as 30. If it expires during the download, the received
+# part is measured.
 set -eu
 export LC_ALL=C
 
 mostBytes=1073741824
-# A smaller part says little about the link: much of it fits into the buffers on the way.
+# A smaller part says little about the link: most of it fits into buffers along the path.
 leastBytes=262144
 
 fail() {
@@ -55,9 +55,9 @@ while [ "$tries" -gt 0 ]; do
     tries=$((tries - 1))
     left=$((end - $(date +%s)))
     [ "$left" -gt 0 ] || break
-    # The bytes are thrown away and nothing secret is sent, so no certificate is asked for. Nothing
-    # comes from the environment or from a file; redirects are not followed. What exceeds the size is
-    # cut by head, which ends curl.
+    # The bytes are discarded and nothing secret is sent, so the certificate is not verified. No
+    # settings come from the environment or a file; redirects are not followed. head truncates at the
+    # size limit, which ends curl.
     figures=$({
         curl -q --silent --show-error --fail --globoff --insecure --proto '=http,https' \
             --noproxy '*' --http1.1 --connect-timeout 10 --max-time "$left" --output - \
@@ -70,7 +70,7 @@ while [ "$tries" -gt 0 ]; do
         speedOf "$@"
         exit 0
     fi
-    # Without the address: who reads this knows it, and it may hold a name that nobody should guess.
+    # Without the address: the caller knows it, and it may contain a name that must stay secret.
     reason=$(printf '%s\n' "$figures" | sed -n 's/^curl: ([0-9]*) //p' | head -n 1)
     [ "$tries" -eq 0 ] || sleep 1
 done

@@ -1,16 +1,16 @@
 #!/bin/sh
 # SPDX-License-Identifier: Apache-2.0
-# TestSyncSpeed.sh setup: makes a file for measuring a link and prints its name, the absolute path,
-# without an end of line. ovradrd serves it at /webman/modules/ovradr/ followed by that path. Who is
-# done with it removes it by that name; what was left behind is swept here. Prints nothing when no
-# file can be made; standard error says why.
+# TestSyncSpeed.sh setup: creates a file for a speed test and prints its absolute path without a
+# newline. ovradrd serves it at /webman/modules/ovradr/ followed by that path. The caller removes it
+# by that name; left-over files are removed here. Prints nothing if no file can be created; standard
+# error says why.
 set -eu
 umask 077
 
 # ovradrd serves this folder and no other.
 folder=/usr/ovra/var/ovradr/speedtest
 size=67108864
-# A file that is older than this was left behind, in minutes; and no more than so many at once.
+# Maximum age of a file in minutes, and maximum number of files.
 age=60
 most=4
 
@@ -19,7 +19,7 @@ fail() {
     exit 1
 }
 
-# A killed process leaves its file behind, and so does a test of a node that is not known.
+# A killed process leaves its file behind, and so does a test with an unknown node.
 sweep() {
     find "$folder" -maxdepth 1 -type f -name 'speed-*' -mmin "+$age" -exec rm -f {} +
     find "$folder" -maxdepth 1 -type f -name 'speed-*' -printf '%T@ %p\n' | sort -rn |
@@ -33,12 +33,12 @@ if [ -L "$folder" ] || [ ! -O "$folder" ]; then
 fi
 chmod 700 "$folder"
 sweep
-# Never the last free space of an appliance.
+# Never use up the last free space of an appliance.
 free=$(df --output=avail -B1 "$folder" | tail -n 1)
 [ "$free" -gt $((size * 2)) ] || fail "too little space is free on the disk of $folder"
 file=$folder/speed-$(od -An -N16 -tx1 /dev/urandom | tr -d ' \n')
 trap 'rm -f "$file"' EXIT
-# Random, so that nothing on the way can compress it.
+# Random, so that nothing on the path can compress it.
 head -c "$size" /dev/urandom >"$file" || fail "cannot write $file"
 trap - EXIT
 printf '%s' "$file"

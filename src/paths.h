@@ -1,8 +1,8 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
-/// Every path of the library, once. The doubled slash and the word "premission" are what all
-/// processes on the appliance use.
+/// Every path of the library. All processes on the appliance use the doubled slash and the spelling
+/// "premission".
 namespace OvraDRNode::Path {
 
 inline constexpr const char *kConfigDir = "/usr/ovra/etc/ovradr";

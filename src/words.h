@@ -1,7 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
-/// The words of the protocol, of the records and of the database, once.
+/// Names in the protocol, the records and the database.
 namespace OvraDRNode::Word {
 
 // Record members and columns.

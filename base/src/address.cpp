@@ -21,7 +21,7 @@ bool isHostNameCharacter(char c) {
            c == '.' || c == '_';
 }
 
-/// inet_pton(3) would take a text up to its first NUL.
+/// inet_pton(3) would stop at the first NUL.
 bool toBinary(int family, const std::string &text, void *binary) {
     return text.find('\0') == std::string::npos && inet_pton(family, text.c_str(), binary) == 1;
 }

@@ -17,7 +17,7 @@ namespace {
 
 constexpr std::chrono::seconds kLockWait{5};
 
-/// Removes a file that was written aside, unless it has been given its name.
+/// Removes a temporary file unless it has been renamed.
 class Aside {
 public:
     explicit Aside(std::string path)
@@ -30,7 +30,7 @@ public:
         }
     }
 
-    /// Gives the file the name `target`, whatever bears it now.
+    /// Renames the file to `target`, replacing what is there.
     bool renameTo(const std::string &target) {
         const bool renamed = rename(path_.c_str(), target.c_str()) == 0;
         if (renamed) {
@@ -43,9 +43,9 @@ private:
     std::string path_;
 };
 
-/// A regular file that is open for reading; EINVAL for anything else.
+/// Opens a regular file for reading; EINVAL for anything else.
 Expected<UniqueFd> openRegular(const std::string &path, int flags, struct stat &status) {
-    // Not blocking, so that a pipe in the file's place cannot hold us up.
+    // Non-blocking, so that opening a FIFO in the file's place cannot hang.
     UniqueFd fd(open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY | flags));
     if (!fd || fstat(fd.get(), &status) != 0) {
         return lastSystemError();
@@ -56,7 +56,7 @@ Expected<UniqueFd> openRegular(const std::string &path, int flags, struct stat &
     return fd;
 }
 
-/// Calls `take` with every part of the file.
+/// Calls `take` with each chunk of the file.
 template <typename Take>
 Expected<void> readParts(int fd, Take take) {
     std::array<char, 8192> part{};
@@ -133,7 +133,8 @@ Expected<Secret> readPrivateFile(const std::string &path, Links links) {
     const WipeAtEnd wiped(content);
     content.reserve(static_cast<std::size_t>(status.st_size));
     const Expected<void> whole = readParts(fd->get(), [&content](std::string_view part) {
-        // One that grows while it is read is not ours, and must not leave copies behind.
+        // A file that grows while being read is not ours, and reallocation must not leave copies
+        // behind.
         content += part.substr(0, content.capacity() - content.size());
     });
     if (!whole) {
@@ -146,7 +147,7 @@ Expected<bool> createFile(const std::string &path, std::string_view content, mod
     if (access(path.c_str(), F_OK) == 0) {
         return false;
     }
-    // Written aside and then linked: the file is complete when its name appears.
+    // Written under a temporary name and then linked: the file is complete when its name appears.
     std::string asidePath = path + ".XXXXXX";
     const UniqueFd fd(mkostemp(asidePath.data(), O_CLOEXEC));
     if (!fd) {
@@ -196,7 +197,7 @@ Expected<void> FileUpdate::commit(std::string_view content, mode_t modeWhenNew) 
     Aside aside(asidePath);
     if (exists) {
         mode = old.st_mode & 07777U;
-        // Only the superuser can give files away; for others the file becomes their own.
+        // Only the superuser can change the owner; for others the file becomes their own.
         if (fchown(fd.get(), old.st_uid, old.st_gid) != 0 && errno != EPERM) {
             return lastSystemError();
         }

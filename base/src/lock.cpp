@@ -16,11 +16,11 @@ using std::chrono::microseconds;
 using std::chrono::milliseconds;
 using std::chrono::steady_clock;
 
-/// A lock that is held for a moment only is had soon, and a long wait costs little.
+/// The pauses grow: a briefly held lock is acquired soon, and a long wait costs little.
 constexpr microseconds kFirstPause{50};
 constexpr microseconds kMaxPause{20'000};
 
-/// Calls `attempt`, which answers as a system call does, until it succeeds or the wait is over.
+/// Calls `attempt`, which returns like a system call, until it succeeds or the time-out expires.
 template <typename Attempt>
 Expected<void> keepTrying(milliseconds wait, Attempt attempt) {
     const auto deadline = steady_clock::now() + wait;

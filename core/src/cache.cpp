@@ -12,7 +12,7 @@ namespace OvraDRCore {
 
 namespace {
 
-/// A refresh asks at most a few endpoints, ten seconds each.
+/// A refresh probes at most a few endpoints, ten seconds each.
 constexpr long kRefreshWait = 30;
 constexpr std::int64_t kSecond = 1000;
 
@@ -82,7 +82,7 @@ Json::Value Cache::Read() const {
                 return storedOrDefault();
             }
         }
-        // Whoever held the lock before may have stored what is wanted.
+        // The previous holder of the lock may have stored a fresh value.
         if (isUsable()) {
             return stored->value;
         }
@@ -102,7 +102,7 @@ double Cache::GetCachedAge() const {
 }
 
 bool Cache::Update() const {
-    // Readers meanwhile share this refresh; one that another process began before may already be
+    // Concurrent readers share this refresh; one that another process began earlier may already be
     // out of date, so it is not waited for.
     RefreshLock lock(path_, name_);
     if (!lock.isHeldHere()) {
@@ -116,7 +116,7 @@ bool Cache::refresh(Json::Value &value) const {
     if (!GetUpdatedData(value)) {
         return false;
     }
-    // Without a usable directory the fresh value still serves this caller.
+    // Without a usable directory this caller still gets the fresh value.
     UpdateWithData(value);
     return true;
 }
@@ -128,8 +128,8 @@ bool Cache::UpdateWithData(const Json::Value &value) const {
 
 bool Cache::UpdateWithData(const Json::Value &value, long start, long end) const {
     const std::int64_t now = systemMilliseconds();
-    // A measurement that ended in this very second ended now: whole seconds would take up to one
-    // second off its lifetime.
+    // A measurement that ended in the current second ended now: rounding to seconds would shorten
+    // its lifetime by up to one second.
     const std::int64_t ended = end == now / kSecond ? now : end * kSecond;
     return CacheFile(path_).write(
         {name_, toString(value), start * kSecond, ended, lifetime_ * kSecond}, now);

@@ -12,7 +12,7 @@ namespace {
 constexpr std::uint32_t kMagic = 0x3143564FU; // "OVC1"
 
 struct Header {
-    std::uint64_t checksum; // XXH3 of all that follows, to the end of the entries
+    std::uint64_t checksum; // XXH3 of everything after it, to the end of the entries
     std::uint32_t magic;
     std::uint32_t bucketCount;
     std::uint32_t bucketIndex;
@@ -47,8 +47,8 @@ std::string_view textAt(const std::byte *place, std::size_t size) {
     return {reinterpret_cast<const char *>(place), size};
 }
 
-/// Calls visit(header, name, value) for each entry until it returns false. The checksum vouches for
-/// the sizes, but a file that somebody made on purpose has a right checksum too: they are checked.
+/// Calls visit(header, name, value) for each entry until it returns false. The sizes are checked
+/// although they are under the checksum, because a forged file has a valid checksum too.
 template <typename Visit>
 void forEach(const std::byte *copy, Visit visit) {
     const std::size_t used = headerOf(copy).used;
@@ -86,7 +86,7 @@ std::optional<std::uint64_t> BucketImage::check(const std::byte *copy, std::uint
                                                 std::uint32_t bucketIndex) {
     const Header header = headerOf(copy);
     if (header.magic == 0 && header.checksum == 0 && header.sequence == 0 && header.used == 0) {
-        return 0; // a hole of the file
+        return 0; // a hole in the file
     }
     if (header.magic != kMagic || header.bucketCount != bucketCount ||
         header.bucketIndex != bucketIndex || header.used > kCapacity || header.sequence == 0 ||

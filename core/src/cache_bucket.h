@@ -20,35 +20,35 @@ struct CacheEntry {
     std::int64_t lifetime = 0; ///< milliseconds
 };
 
-/// One copy of a bucket as it lies in the file: a header, then entries one behind the other.
-/// Numbers are in host byte order: the file never leaves its machine.
+/// One copy of a bucket as stored in the file: a header, then the entries back to back. Numbers are
+/// in host byte order: the file never leaves its machine.
 class BucketImage {
 public:
     static constexpr std::size_t kSize = 4096;
 
-    /// What the copy says of its age, before anything of it is checked.
+    /// The sequence number in the header, unchecked.
     static std::uint64_t claimedSequence(const std::byte *copy);
-    /// Checks the copy and its place in the file.
-    /// \return the sequence number (0: never written), or nothing when the copy is damaged.
+    /// Checks the copy and its position in the file.
+    /// \return the sequence number (0: never written); std::nullopt if the copy is damaged.
     static std::optional<std::uint64_t> check(const std::byte *copy, std::uint32_t bucketCount,
                                               std::uint32_t bucketIndex);
-    /// Finds one entry of a checked copy without taking the others apart.
+    /// Finds one entry of a checked copy without decoding the others.
     static std::optional<CacheEntry> find(const std::byte *copy, std::string_view name);
     /// All entries of a checked copy.
     static std::vector<CacheEntry> entries(const std::byte *copy);
 
-    /// Bytes that an entry takes of capacity().
+    /// Bytes of capacity() that an entry takes.
     static std::size_t measure(const CacheEntry &entry);
     static std::size_t capacity();
 
     explicit BucketImage(std::uint32_t bucketCount, std::uint32_t bucketIndex)
         : bucketCount_(bucketCount)
         , bucketIndex_(bucketIndex) {}
-    /// Takes over the entries of a checked copy, except that of `name` and those that ended before
-    /// `oldest` for longer than they live.
-    /// \return false when there is no room for them.
+    /// Copies the entries of a checked copy, except that of `name` and those that expired before
+    /// `oldest`.
+    /// \return false if there is no room for them.
     bool copyFrom(const std::byte *copy, std::string_view name, std::int64_t oldest);
-    /// \return false when there is no room.
+    /// \return false if there is no room.
     bool add(const CacheEntry &entry);
     /// Completes the copy. \return its bytes.
     std::string_view finish(std::uint64_t sequence);
@@ -63,7 +63,7 @@ private:
     std::array<std::byte, kSize> bytes_;
 };
 
-/// The hash that chooses an entry's bucket and its refresh lock (XXH3, 64 bits).
+/// The hash that selects an entry's bucket and its refresh lock (XXH3, 64 bits).
 std::uint64_t cacheNameHash(std::string_view name);
 
 } // namespace OvraDRCore

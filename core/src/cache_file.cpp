@@ -28,8 +28,8 @@ using OvraBase::UniqueFd;
 constexpr std::size_t kPair = 2 * BucketImage::kSize;
 constexpr std::uint32_t kMinBuckets = 16;
 constexpr std::uint32_t kMaxBuckets = 65536;
-/// A bucket that overflows in a file emptier than this share holds names made to collide, or huge
-/// values: its oldest entries go, and the file does not grow.
+/// A bucket that overflows in a file emptier than this holds deliberately colliding names, or huge
+/// values: its oldest entries are evicted, and the file does not grow.
 constexpr std::uint64_t kMinLoadToGrow = 64;
 constexpr std::chrono::milliseconds kLockWait{2000};
 
@@ -39,8 +39,8 @@ bool isOursAlone(const struct stat &status) {
     return status.st_uid == geteuid() && (status.st_mode & (S_IWGRP | S_IWOTH)) == 0;
 }
 
-/// Whether the directory may be trusted. Somebody else cannot exchange it between this look and the
-/// opening of a file in it: its own folder is sticky or ours.
+/// Whether the directory may be trusted. Nobody else can replace it between this check and the
+/// opening of a file in it: its parent folder is sticky or ours.
 bool checkDirectory(const std::string &directory, bool create) {
     struct stat status {};
     if (lstat(directory.c_str(), &status) != 0) {
@@ -68,7 +68,7 @@ bool checkDirectory(const std::string &directory, bool create) {
     return false;
 }
 
-/// The number of buckets of a file of this size; 0 when no cache file has it.
+/// The number of buckets of a file of this size; 0 if it is not the size of a cache file.
 std::uint32_t bucketsOf(const struct stat &status) {
     const auto size = static_cast<std::uint64_t>(status.st_size);
     const std::uint64_t buckets = size / kPair;
@@ -91,14 +91,14 @@ std::uint32_t bucketOf(std::string_view name, std::uint32_t buckets) {
     return static_cast<std::uint32_t>(cacheNameHash(name)) & (buckets - 1);
 }
 
-/// Which of the two copies counts, and which is to be overwritten next.
+/// Which of the two copies is current, and which is overwritten next.
 struct Choice {
-    bool valid = false; ///< at least one copy is whole
+    bool valid = false; ///< at least one copy is valid
     std::size_t newer = 0;
     std::uint64_t sequence = 0;
 };
 
-/// The copy that claims to be newer is looked at first, and the other one only when that is
+/// Checks the copy with the higher sequence number first, and the other one only if that is
 /// damaged.
 Choice choose(const Pair &pair, std::uint32_t buckets, std::uint32_t index) {
     const std::byte *second = pair.data() + BucketImage::kSize;
@@ -127,9 +127,9 @@ bool storeCopy(int fd, std::uint32_t index, std::size_t which, std::string_view 
 /// A cache file under its exclusive lock.
 class LockedFile {
 public:
-    /// Opens and locks the file at `path`; one that is damaged or not ours is replaced.
+    /// Opens and locks the file at `path`; a damaged or foreign one is replaced.
     static std::optional<LockedFile> open(const std::string &path, bool create) {
-        // The name may come to mean another file between opening and locking: a file that grew.
+        // Between opening and locking, growing may have replaced the file.
         for (int attempt = 0; attempt < 100; ++attempt) {
             LockedFile file;
             UniqueFd fd = openFile(path, create ? O_RDWR | O_CREAT : O_RDWR);
@@ -174,14 +174,14 @@ public:
         return std::nullopt;
     }
 
-    /// Reads the bucket of `name` into `pair`, which has to stay while the bucket is used.
+    /// Reads the bucket of `name` into `pair`, which must outlive the use of the bucket.
     void load(std::string_view name, Pair &pair) {
         index_ = bucketOf(name, buckets_);
         choice_ = readPair(fd_.get(), index_, pair) ? choose(pair, buckets_, index_) : Choice{};
         copy_ = choice_.valid ? chosenCopy(pair, choice_) : nullptr;
     }
 
-    /// The whole copy of the loaded bucket; null when there is none.
+    /// The valid copy of the loaded bucket; null if there is none.
     const std::byte *copy() const { return copy_; }
 
     /// An empty copy for the loaded bucket.
@@ -193,14 +193,14 @@ public:
         return storeCopy(fd_.get(), index_, older, image.finish(choice_.sequence + 1));
     }
 
-    /// Writes the file anew with twice the buckets, without what is long past, and goes on there.
-    /// \return false when that is not to be done or not possible: the old file stays as it is.
+    /// Rewrites the file with twice the buckets, without long-expired entries, and switches to it.
+    /// \return false if growing is not allowed or fails: the old file is unchanged.
     bool grow(const std::string &path, std::int64_t oldest) {
         if (buckets_ == kMaxBuckets) {
             return false;
         }
         const std::uint32_t buckets = 2 * buckets_;
-        // Only the holder of the lock gets here, so a left-over of the same name is dead.
+        // Only the lock holder gets here, so a left-over of the same name is stale.
         const std::string temporary = path + ".new";
         unlink(temporary.c_str());
         auto grown = LockedFd::lock(openFile(temporary, O_RDWR | O_CREAT | O_EXCL), LOCK_EX, {});
@@ -220,7 +220,7 @@ public:
     }
 
 private:
-    /// Writes the entries of one bucket into the two of the grown file that they belong to.
+    /// Splits one bucket into the two corresponding ones of the grown file.
     bool split(int grown, std::uint32_t index, std::int64_t oldest, std::uint64_t &total) const {
         Pair pair;
         if (!readPair(fd_.get(), index, pair)) {
@@ -255,7 +255,7 @@ private:
     const std::byte *copy_ = nullptr;
 };
 
-/// The entries of a copy without that of `name`, newest first.
+/// The entries of a copy except `name`, newest first.
 std::vector<CacheEntry> newestFirst(const std::byte *copy, std::string_view name) {
     std::vector<CacheEntry> entries = BucketImage::entries(copy);
     std::erase_if(entries, [&](const CacheEntry &entry) { return entry.name == name; });
@@ -264,7 +264,7 @@ std::vector<CacheEntry> newestFirst(const std::byte *copy, std::string_view name
     return entries;
 }
 
-/// The loaded bucket with `entry` in it. \return false when there is no room for all.
+/// The loaded bucket with `entry` added. \return false if there is no room for all.
 bool compose(const LockedFile &file, const CacheEntry &entry, std::int64_t oldest,
              BucketImage &image) {
     image = file.image();
@@ -297,7 +297,7 @@ std::optional<CacheEntry> CacheFile::read(std::string_view name, int attempts) c
     const std::uint32_t index = bucketOf(name, buckets);
     Pair pair;
     for (int attempt = 0; attempt <= attempts; ++attempt) {
-        // Two writes during one read can spoil both copies of it. The last attempt keeps them away.
+        // Two writes during one read can tear both copies. The last attempt takes the lock.
         const bool lastAttempt = attempt == attempts;
         if (lastAttempt && !OvraBase::lockFile(fd.get(), LOCK_SH, kLockWait)) {
             return std::nullopt;
@@ -341,7 +341,7 @@ bool CacheFile::write(const CacheEntry &entry, std::int64_t now) const {
         file->load(entry.name, pair);
         fits = compose(*file, entry, oldest, image);
     }
-    if (!fits) { // the oldest go
+    if (!fits) { // evict the oldest
         image = file->image();
         image.add(entry);
         for (const CacheEntry &other : newestFirst(file->copy(), entry.name)) {
@@ -383,7 +383,7 @@ thread_local std::vector<std::string> refreshing;
 
 RefreshLock::RefreshLock(const std::string &path, const std::string &name)
     : key_(path + '\0' + name)
-    , offset_(cacheNameHash(name) >> 2) { // an offset has to be positive, with room behind it
+    , offset_(cacheNameHash(name) >> 2) { // an offset must be positive, with room after it
     if (checkDirectory(OvraBase::folderOf(path), true)) {
         file_ = openFile(path + ".lock", O_RDWR | O_CREAT);
     }

@@ -13,22 +13,22 @@
 
 namespace OvraDRCore {
 
-/// The operations on one cache file; each opens it, works and closes it. Format: docs/files.md.
+/// The operations on one cache file; each opens and closes it. Format: docs/files.md.
 class CacheFile {
 public:
     explicit CacheFile(const std::string &path);
 
-    /// \param attempts  reads that may meet a write under way before one waits for the lock
+    /// \param attempts  reads that may collide with a write before one waits for the lock
     std::optional<CacheEntry> read(std::string_view name, int attempts) const;
-    /// Adds or replaces; drops entries of the same bucket whose lifetime is long past.
+    /// Adds or replaces; drops long-expired entries of the same bucket.
     bool write(const CacheEntry &entry, std::int64_t now) const;
-    /// True when the entry is not there afterwards.
+    /// True if the entry does not exist afterwards.
     bool remove(std::string_view name) const;
 
-    /// An entry is dropped, at the next write beside it, when it has been stale for this long. The
-    /// last known facts of a node that is away for some days are worth keeping.
+    /// The next write to its bucket drops an entry that has been stale for this long. The last
+    /// known facts of a node that is away for some days are worth keeping.
     static constexpr std::int64_t kKeepStale = std::int64_t{7} * 24 * 3600 * 1000;
-    /// Room of one entry: name and value together.
+    /// Capacity of one entry: name and value together.
     static std::size_t maxEntrySize();
 
 private:
@@ -36,8 +36,8 @@ private:
 };
 
 /// The right to refresh one entry, held by one process on the appliance at a time: a byte of the
-/// lock file beside the cache file, chosen by the entry's name (fcntl(2), open file description
-/// locks). It goes with the process when that dies.
+/// lock file next to the cache file, selected by the entry's name (fcntl(2), open file description
+/// locks). It is released when the process dies.
 class RefreshLock {
 public:
     RefreshLock(const std::string &path, const std::string &name);
@@ -45,12 +45,12 @@ public:
     RefreshLock(const RefreshLock &) = delete;
     RefreshLock &operator=(const RefreshLock &) = delete;
 
-    /// This thread is refreshing this very entry already, further up.
+    /// This thread is already refreshing this entry, further up the call stack.
     bool isHeldHere() const;
     bool tryAcquire();
     /// Waits at most `seconds`.
     bool acquire(long seconds);
-    /// There is a directory in which processes can meet.
+    /// There is a directory that all processes can share.
     bool isUsable() const { return static_cast<bool>(file_); }
 
 private:

@@ -10,7 +10,8 @@ using ClockFunction = std::int64_t (*)();
 
 std::int64_t systemMilliseconds();
 
-/// Replaces the clock of this process; null restores the system's. For tests, which cannot wait.
+/// Replaces the clock of this process; null restores the system clock. For tests, which cannot
+/// wait.
 void setSystemClock(ClockFunction clock);
 
 } // namespace OvraDRCore

@@ -15,7 +15,7 @@ namespace {
 constexpr int kMaxDepth = 200;
 constexpr const char *kMask = "***";
 
-/// Members whose values are login material, wherever they stand.
+/// Members whose values are login material, at any depth.
 constexpr std::array<std::string_view, 13> kSecretMembers = {
     "password", "passwd",       "otpcode", "otp_code",     "session",   "_sid",   "sid",
     "token",    "access_token", "sealed",  "sealed_reply", "reply_key", "secret",
@@ -30,8 +30,8 @@ bool isSecret(std::string_view name) {
     return false;
 }
 
-/// \param secret  whether the value stands under a secret name, alone or in an array; an object
-///                there is not login material itself, but may hold some
+/// \param secret  whether the value is under a secret name, alone or in an array; an object there
+///                is not login material itself, but may hold some
 void mask(Json::Value &value, bool secret) {
     if (value.isArray()) {
         for (Json::Value &item : value) {
@@ -73,7 +73,7 @@ const Json::CharReaderBuilder &readerFactory() {
 } // namespace
 
 std::string toString(const Json::Value &value) {
-    // The literals of the boolean caches are written and read on every request.
+    // The boolean caches write and read these literals on every request.
     if (value.isBool()) {
         return value.asBool() ? "true" : "false";
     }
@@ -95,7 +95,7 @@ bool fromString(Json::Value &value, const std::string &text) {
         value = text == "true";
         return true;
     }
-    // The reader takes a NUL for the end and would not look at what follows.
+    // The reader treats a NUL as the end and would ignore what follows.
     if (text.find('\0') != std::string::npos) {
         return false;
     }

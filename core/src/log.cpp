@@ -14,7 +14,7 @@ namespace OvraDRCore {
 
 namespace {
 
-/// Below the 8 KiB that log daemons accept as one line, with room for the place of the line.
+/// Below the 8 KiB that log daemons accept as one line, with room for the prefix.
 constexpr std::size_t kMaxMessage = 7000;
 
 const char *levelWord(LogLevel level) {
@@ -53,7 +53,7 @@ __attribute__((format(printf, 1, 0))) std::string vformat(const char *format, va
     return text;
 }
 
-/// Escapes control characters; cuts what is too long at a character boundary.
+/// Escapes control characters; truncates long text at a character boundary.
 std::string oneLine(const std::string &text) {
     std::string line;
     line.reserve(text.size());

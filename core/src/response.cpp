@@ -20,7 +20,7 @@ void Response::setResp(const Json::Value &reply) {
 
 void Response::setResp(Json::Value &&reply) {
     *this = Response();
-    const Json::Value &document = reply; // looking for a member adds it where that is allowed
+    const Json::Value &document = reply; // a non-const operator[] would add a missing member
     if (!document.isObject() || !document["success"].isBool()) {
         return;
     }

@@ -16,8 +16,8 @@ namespace OvraDRCore {
 
 namespace {
 
-/// The row as named values. A NULL, a floating-point number and an integer over 32 bits have no
-/// place in a record: such a column reads as absent.
+/// The row as named values. Records hold no NULL, floating-point number or integer over 32 bits:
+/// such a column reads as absent.
 SqliteValueList rowOf(sqlite3_stmt *statement) {
     SqliteValueList row;
     const int columns = sqlite3_column_count(statement);
@@ -41,7 +41,7 @@ SqliteValueList rowOf(sqlite3_stmt *statement) {
     return row;
 }
 
-/// A condition comes as text: whatever follows its statement would be run unseen.
+/// Conditions are text: anything after the statement would be run unnoticed.
 bool isBlank(const char *tail, const char *end) {
     return std::all_of(tail, end, [](char c) { return c == ' ' || c == '\n' || c == '\t'; });
 }
@@ -58,7 +58,7 @@ SqliteDB::SqliteDB(const std::string &path, unsigned int busyTime, const std::st
     constexpr unsigned int kMilliseconds = 1000;
     const unsigned int limit = INT_MAX / kMilliseconds;
     OvraBase::SqliteHandle database;
-    // A failure to open is found out by the first statement.
+    // The first statement reports a failure to open.
     OvraBase::openSqlite(path, static_cast<int>(std::min(busyTime, limit) * kMilliseconds),
                          database);
     db_.reset(database.release());

@@ -19,7 +19,7 @@ std::string quoted(const std::string &text) {
     return literal + "'";
 }
 
-/// SQL text ends at a NUL, so such a value is written as the bytes it consists of.
+/// SQL text ends at a NUL, so such a value is written as its bytes.
 std::string quotedBytes(const std::string &text) {
     constexpr std::array<char, 17> kDigits = {"0123456789abcdef"};
     std::string literal = "CAST(x'";

@@ -61,7 +61,7 @@ bool CreateDir(const std::string &path, mode_t mode) {
         return false;
     }
     if (mkdir(path.c_str(), mode) == 0) {
-        return chmod(path.c_str(), mode) == 0; // whatever the umask is
+        return chmod(path.c_str(), mode) == 0; // regardless of the umask
     }
     return errno == EEXIST && isDirectory(path);
 }

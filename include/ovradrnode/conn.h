@@ -15,14 +15,14 @@ namespace OvraDRNode {
 /// Whether `protocol` is one of the words "http", "https" and "flk" (relay), exactly.
 OVRADRNODE_EXPORT bool isValidProtocol(const std::string &protocol);
 
-/// How a node's web API is reached: over plain HTTP, over HTTPS, or through the relay service.
-/// A small value; nothing is validated until isValid() is asked. Nothing here throws.
+/// An endpoint of a node's web API: plain HTTP, HTTPS, or through the relay service. A small value
+/// type; nothing is validated before isValid(). Nothing here throws.
 class OVRADRNODE_EXPORT Conn final : public OvraDRCore::SqliteRecord {
 public:
-    /// Of the columns "addr", "protocol" (text) and "port" (integer), those that are listed.
+    /// The listed ones of the columns "addr", "protocol" (text) and "port" (integer).
     OvraDRCore::SqliteValueList
     ToSqliteValues(const std::vector<std::string> &fields) const override;
-    /// Loads whichever of the three columns the row has; false when it has none.
+    /// Loads those of the three columns that the row has; false if it has none.
     [[nodiscard]] bool FromSqliteValues(const OvraDRCore::SqliteValueList &row) override;
     std::vector<std::string> ListSqliteField() const override;
 
@@ -34,7 +34,7 @@ public:
 
     static Conn http(const std::string &addr, int port);
     static Conn https(const std::string &addr, int port);
-    /// The endpoint behind the relay server alias; its port, 443, stands for no route.
+    /// The endpoint behind a relay alias; its port, 443, is a placeholder.
     static Conn farlink(const std::string &alias);
 
     bool isFarlink() const;
@@ -46,20 +46,21 @@ public:
 
     /// Members "addr", "protocol" and "port".
     Json::Value toJson() const;
-    /// The endpoint that `value` describes; an invalid one, and a WARN line, when a member is
-    /// missing or of the wrong type.
+    /// The endpoint described by `value`; an invalid one, and a WARN line, if a member is missing
+    /// or of the wrong type.
     static Conn fromJson(const Json::Value &value);
 
     /// The endpoints at which this appliance serves: HTTPS and HTTP of every address, then the
-    /// relay endpoint when the relay service is enabled. What cannot be found out is left out.
+    /// relay endpoint if the relay service is enabled. Endpoints that cannot be determined are left
+    /// out.
     static std::vector<Conn> listLocal();
     /// `addr` with the appliance's HTTP or HTTPS port.
     static Conn localHttp(const std::string &addr);
     static Conn localHttps(const std::string &addr);
-    /// Invalid when the relay service is not enabled.
+    /// Invalid if the relay service is not enabled.
     static Conn localFarlink();
-    /// The direct endpoint behind a relay endpoint (asks the relay service); any other endpoint
-    /// comes back unchanged. Invalid when the relay does not know it.
+    /// The direct endpoint behind a relay endpoint (queries the relay service); any other endpoint
+    /// is returned unchanged. Invalid if the relay does not know it.
     static Conn translateFarlink(const Conn &conn);
 
     std::string addr;

@@ -12,8 +12,8 @@
 
 namespace OvraDRNode {
 
-/// Whether a credential has the right to operate on its node: noted after every attempt over it,
-/// and asked of the node again after 3 seconds.
+/// Whether a credential has the right to operate on its node: updated after every attempt over it;
+/// the node is asked again after 3 seconds.
 class OVRADRNODE_EXPORT CredPermissionCache : public OvraDRCore::Cache {
 public:
     ~CredPermissionCache() override;
@@ -24,17 +24,17 @@ public:
 
     explicit CredPermissionCache(const std::string &credId);
 
-    /// A value that is no verdict counts as having the right.
+    /// A value that is not a verdict counts as having the right.
     bool HasPrivilege(const Json::Value &value) const;
     /// May ask the node.
     bool HasPrivilege() const;
     /// Never asks the node.
     bool GetCachedHasPrivilege() const;
 
-    // These store a verdict; false when it could not be stored (an empty id never is).
+    // These store a verdict; false if it could not be stored (an empty id never is).
     bool SetCacheData(bool has) const;
     bool SetHasPrivilege() const;
-    /// \param request  what was refused; a relayed test of the right says nothing about this
+    /// \param request  the refused request; a relayed privilege test says nothing about this
     ///                 credential and is not stored
     bool SetNoPrivilege(const OvraDRCore::Request &request) const;
     bool SetPrivilege(const OvraDRCore::Request &request, bool has) const;

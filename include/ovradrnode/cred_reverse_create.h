@@ -16,9 +16,9 @@
 
 namespace OvraDRNode {
 
-/// Has a remote node make a credential back to this one, over a credential that this node holds:
-/// the remote picks one of the endpoints offered, gets a short-lived local session, and creates its
-/// credential with the two. setCredId(), setLocalAccount(), addLocalConns(), then check() or
+/// Has a remote node create a credential for this one, over a credential that this node holds: the
+/// remote picks one of the offered endpoints, gets a short-lived local session, and creates its
+/// credential from both. setCredId(), setLocalAccount(), addLocalConns(), then check() or
 /// process(). Nothing is written here; the temporary session is always deleted again.
 class OVRADRNODE_EXPORT CredReverseCreate : public OvraDRCore::ErrRecorder {
 public:
@@ -31,19 +31,19 @@ public:
     [[nodiscard]] bool setLocalAccount(const std::string &account);
     void setCredInfo(const Json::Value &info) { credInfo = info; }
     [[nodiscard]] bool addLocalConn(const Conn &conn);
-    /// In order, up to the first that is refused.
+    /// In order, up to the first refused one.
     [[nodiscard]] bool addLocalConns(const std::vector<Conn> &conns);
     [[nodiscard]] bool checkParameter() const;
     [[nodiscard]] OvraDRCore::Response sendReq(const OvraDRCore::Request &request) const;
-    /// Learns which of the endpoints offered the remote node can reach (522 when its answer is
-    /// none).
+    /// Finds out which of the offered endpoints the remote node can reach (522 if its answer is not
+    /// a valid endpoint).
     [[nodiscard]] bool testAvailableConn(Conn &conn) const;
     /// The whole flow, except that the remote only checks.
     [[nodiscard]] bool check();
     /// The whole flow. The result is whether an error was recorded.
     [[nodiscard]] bool process();
 
-    /// What the remote node reported about the credential that it made.
+    /// What the remote node reported about the credential that it created.
     const Json::Value &getCredInfo() const { return credInfo; }
 
 private:

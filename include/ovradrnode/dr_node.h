@@ -14,13 +14,12 @@
 namespace OvraDRNode {
 
 /// One credential that this node holds: which node it reaches, its own id, the endpoint, and the
-/// session that the remote node granted. The local node is the record whose two ids are both the
-/// local node id.
+/// session that the remote node granted. In the local node's record both ids are the local node id.
 class OVRADRNODE_EXPORT DRNode final : public OvraDRCore::SqliteRecord {
 public:
     OvraDRCore::SqliteValueList
     ToSqliteValues(const std::vector<std::string> &fields) const override;
-    /// Loads whichever of the record's columns the row has; false when it has none.
+    /// Loads those of the record's columns that the row has; false if it has none.
     [[nodiscard]] bool FromSqliteValues(const OvraDRCore::SqliteValueList &row) override;
     /// "addr", "protocol", "port", "cred_id", "node_id", "session".
     std::vector<std::string> ListSqliteField() const override;
@@ -31,7 +30,7 @@ public:
     DRNode(const DRNode &) = default;
     DRNode &operator=(const DRNode &) = default;
 
-    // Each refuses an empty (or invalid) value with false and leaves the record unchanged.
+    // Each returns false for an empty (or invalid) value and leaves the record unchanged.
     [[nodiscard]] bool setNodeId(const std::string &id);
     [[nodiscard]] bool setCredId(const std::string &id);
     [[nodiscard]] bool setConn(const Conn &value);
@@ -41,24 +40,24 @@ public:
     bool isValid() const;
     /// Members "cred_id", "node_id", "addr", "protocol" and "port"; never the session.
     Json::Value toJson() const;
-    /// Takes the two ids, where present as strings; the endpoint stays as it was. Always true.
+    /// Sets the two ids, where present as strings; the endpoint is unchanged. Always true.
     bool fromJson(const Json::Value &value);
 
-    /// The host name; "" when the system gives none.
+    /// The host name; "" if the system has none.
     static std::string getLocalHostName();
-    /// The serial number; "" when there is none.
+    /// The serial number; "" if there is none.
     static std::string getLocalSerial();
-    /// The local node id, made on first use; "" when it can be neither read nor made. Reads the
-    /// identity file under its lock, which it waits for up to 5 seconds.
+    /// The local node id, created on first use; "" if it can be neither read nor created. Reads the
+    /// identity file under its lock, waiting up to 5 seconds for it.
     static std::string getLocalNodeId();
-    /// Removes the identity file, so that the next getLocalNodeId() makes a new id.
-    /// \return false when the lock could not be had within 5 seconds.
+    /// Removes the identity file, so that the next getLocalNodeId() creates a new id.
+    /// \return false if the lock could not be acquired within 5 seconds.
     [[nodiscard]] static bool resetLocalNodeId();
     /// The local node's own record.
     static DRNode getLocalNode();
     /// Conn::listLocal().
     static std::vector<Conn> getLocalConn();
-    /// Compares with the local node id as it was when this process first asked.
+    /// Compares with the local node id as this process first read it.
     static bool isLocalNodeId(const std::string &id);
 
     std::string nodeId;

@@ -9,7 +9,7 @@
 
 namespace OvraDRNode {
 
-/// A text that an application keeps about a node: one value for each (node id, application, name).
+/// A text that an application stores about a node: one value for each (node id, application, name).
 class OVRADRNODE_EXPORT DRNodeAttr {
 public:
     DRNodeAttr() = default;

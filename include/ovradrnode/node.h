@@ -18,19 +18,19 @@ public:
     Node() = default;
     ~Node() override;
 
-    /// How fast `url` downloads to this node, as the measuring script words it; "" on failure (401
-    /// the script could not be run, 407 it printed nothing).
+    /// The download speed of `url`, as printed by the measuring script; "" on failure (401 the
+    /// script could not be run, 407 it printed nothing).
     /// \param timeout  seconds
     [[nodiscard]] std::string TestDownloadSpeed(const std::string &url, int retries, int timeout);
-    /// How fast the remote node downloads from this one, over the first local endpoint at which
-    /// that works, as the remote words it; "" on failure (401, 407). \param timeout  seconds
+    /// The speed at which the remote node downloads from this one, over the first local endpoint
+    /// that works, as the remote prints it; "" on failure (401, 407). \param timeout seconds
     [[nodiscard]] std::string TestSyncSpeed(const std::string &nodeId, int retries, int timeout);
 
-    /// Is told of each endpoint that is tried: before (`answer` null) and after. \param sender  why
-    /// there is no valid answer
+    /// Called for each endpoint, before (`answer` null) and after the attempt. \param sender holds
+    /// the reason if there is no valid answer
     using EndpointWatcher = std::function<void(const Conn &conn, const OvraDRCore::Response *answer,
                                                const OvraDRCore::ErrRecorder &sender)>;
-    /// The same test for somebody who watches it.
+    /// The same test, reporting progress to `watcher`.
     [[nodiscard]] std::string TestSyncSpeed(const std::string &nodeId, int retries, int timeout,
                                             const EndpointWatcher &watcher);
 };

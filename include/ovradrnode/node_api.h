@@ -11,25 +11,25 @@
 
 namespace OvraDRNode {
 
-/// The requests that nodes exchange. A builder that refuses its arguments logs one ERR line and
-/// returns an invalid Request; test isValid() before sending. docs/wire.md lists them all.
+/// The requests that nodes exchange. A builder that rejects its arguments logs one ERR line and
+/// returns an invalid Request; check isValid() before sending. docs/ovradrd.md lists them all.
 namespace WebAPI {
 
 using OvraDRCore::Request;
 
-/// Looks up a user; refuses an empty name silently.
+/// Looks up a user; rejects an empty name silently.
 OVRADRNODE_EXPORT Request OvraCoreUserGetAPI(const std::string &user);
 
 OVRADRNODE_EXPORT Request getDRNodeSessionCreateAPI(const std::string &nodeId);
 OVRADRNODE_EXPORT Request getDRNodeSessionTempCreateAPI();
 OVRADRNODE_EXPORT Request getDRNodeSessionDeleteAPI(const std::string &sessionId);
-/// Refuses an empty id silently.
+/// Rejects an empty id silently.
 OVRADRNODE_EXPORT Request getDRNodeSessionGetAPI(const std::string &sessionId);
 
-/// \param additional  names of further facts to answer with, e.g. "timezone"
+/// \param additional  names of additional facts to include, e.g. "timezone"
 OVRADRNODE_EXPORT Request getDRNodeInfoAPI(const std::vector<std::string> &additional);
 OVRADRNODE_EXPORT Request getDRNodeTestPrivilegeAPI();
-/// Invalid endpoints are left out; refused when none is left.
+/// Invalid endpoints are left out; rejected if none is left.
 OVRADRNODE_EXPORT Request getDRNodeTestConnectionAPI(const std::vector<Conn> &conns);
 /// \param timeout  seconds
 OVRADRNODE_EXPORT Request getDRNodeTestSyncSpeedAPI(const std::string &nodeId, int retries,
@@ -38,7 +38,8 @@ OVRADRNODE_EXPORT Request getDRNodeTestSyncSpeedAPI(const std::string &nodeId, i
 OVRADRNODE_EXPORT Request getDRNodeTestDownloadSpeedAPI(const std::string &url, int retries,
                                                         int timeout);
 
-// Credentials that a node holds. Those that carry a password or a session travel sealed.
+// Requests about credentials that a node holds. Those that carry a password or a session are
+// sealed.
 OVRADRNODE_EXPORT Request getDRNodeCredCreateAPI(const Conn &conn, const std::string &session,
                                                  const std::string &credDirection);
 OVRADRNODE_EXPORT Request getDRNodeCredCreateAPI(const Conn &conn, const std::string &account,
@@ -51,7 +52,7 @@ OVRADRNODE_EXPORT Request getDRNodeCredSetAPI(const std::string &credId, const C
                                               const std::string &account,
                                               const std::string &password,
                                               const std::string &otpcode);
-/// Has the receiver send `request` on over its credential.
+/// Has the receiver forward `request` over its credential.
 OVRADRNODE_EXPORT Request getDRNodeCredRelayAPI(const std::string &credId, const Request &request);
 OVRADRNODE_EXPORT Request getDRNodeCredReverseCreateAPI(const std::string &credId,
                                                         const Conn &conn);
@@ -73,7 +74,7 @@ OVRADRNODE_EXPORT Request getDRNodeTempCredCreateAPI(const Conn &conn, const std
 OVRADRNODE_EXPORT Request getDRNodeTempCredReverseCreateAPI(const std::string &credId,
                                                             const Conn &conn);
 
-/// Whether `request` is a relayed test of privilege.
+/// Whether `request` is a relayed privilege test.
 OVRADRNODE_EXPORT bool isRelayTestPrivilegeAPI(const Request &request);
 
 } // namespace WebAPI

@@ -11,8 +11,8 @@
 
 namespace OvraDRNode {
 
-/// What a node says about itself (host name, serial number, time zone), asked again after 60
-/// seconds (5 for the local node). A node that cannot be reached keeps what it said last.
+/// A node's facts about itself (host name, serial number, time zone), refreshed after 60 seconds (5
+/// for the local node). For an unreachable node the last known facts stay.
 class OVRADRNODE_EXPORT NodeCache : public OvraDRCore::Cache {
 public:
     ~NodeCache() override;
@@ -20,11 +20,11 @@ public:
     [[nodiscard]] bool GetUpdatedData(Json::Value &value) const override;
     bool IsValid(const Json::Value &value) const override;
 
-    /// \param flag  whether a reader waits for a refresh that another process is doing; always so
-    ///              for the local node
+    /// \param flag  whether a reader waits for a refresh by another process; always for the local
+    ///              node
     NodeCache(const std::string &nodeId, bool flag);
 
-    // Each is "" when unknown; may ask the node.
+    // Each is "" if unknown; may ask the node.
     std::string GetHostName() const;
     std::string GetSerialNum() const;
     std::string GetTimeZone() const;

@@ -11,22 +11,22 @@
 
 namespace OvraDRNode {
 
-/// What the caches say about one question, without asking anybody.
+/// The cached answer to one question; sends nothing.
 struct CachedVerdict {
-    bool known = false; ///< something is stored
-    bool value = true;  ///< what is stored; unknown counts as true
-    bool fresh = false; ///< it will be believed; otherwise it is asked again before it is used
-    double age = -1;    ///< seconds since it was found out; -1: unknown, or stamped in the future
+    bool known = false; ///< a value is stored
+    bool value = true;  ///< the stored value; unknown counts as true
+    bool fresh = false; ///< still valid; otherwise refreshed before use
+    double age = -1;    ///< seconds since it was determined; -1: unknown, or stamped in the future
 };
 
-/// One credential of a node as a sender to that node would meet it now.
+/// One credential of a node as a sender would find it now.
 struct OVRADRNODE_EXPORT NodeCandidate {
-    /// What a request sent now would do with it, as far as the caches tell.
+    /// How a request sent now would use it, according to the caches.
     enum class Outlook {
         kNext,        ///< tried next
-        kLater,       ///< tried when those before it do not get through
-        kUnreachable, ///< passed over: its endpoint is held unreachable
-        kInvalid,     ///< passed over: the record has no session or no valid endpoint
+        kLater,       ///< tried if those before it fail
+        kUnreachable, ///< skipped: its endpoint is considered unreachable
+        kInvalid,     ///< skipped: the record has no session or no valid endpoint
     };
 
     DRNode node;
@@ -41,12 +41,11 @@ struct OVRADRNODE_EXPORT NodeCandidate {
     Json::Value toJson() const;
 };
 
-/// Why a request to `nodeId` goes the way that it goes: the credentials in the order in which
+/// Explains which credential a request to `nodeId` uses: the credentials in the order in which
 /// NodeSender would try them. Reads the database and the caches and sends nothing. The remembered
-/// credential stands first for 5 seconds, and longer while it may have the right; else the first
-/// lasting one that may. What is stale is asked again by whoever sends, and may then turn out
-/// differently.
-/// \return no candidate for a node that is not known, or is the local one.
+/// credential comes first for 5 seconds, and longer while it may have the right; otherwise the
+/// first lasting one that may. A sender refreshes stale entries first, which may change the order.
+/// \return empty for an unknown node and for the local one.
 OVRADRNODE_EXPORT std::vector<NodeCandidate> listNodeCandidates(const std::string &nodeId);
 
 } // namespace OvraDRNode

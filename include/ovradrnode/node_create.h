@@ -15,16 +15,16 @@
 
 namespace OvraDRNode {
 
-/// Makes a credential: proves itself to the remote node, asks it who it is and for a session, and
-/// stores the record. Construct, call one setCred() form, then process() (or check()); on false
-/// read GetErr(). Nothing is written here before the last step; a session that the remote granted
-/// is not given back when that step fails.
+/// Creates a credential: authenticates to the remote node, requests its identity and a session, and
+/// stores the record. Construct, call one setCred() overload, then process() (or check()); on false
+/// read GetErr(). Nothing is written locally before the last step; if that step fails, the session
+/// that the remote granted is not released.
 class OVRADRNODE_EXPORT CredCreate : public OvraDRCore::ErrRecorder {
 public:
     ~CredCreate() override;
     /// The request for the remote session of this kind of credential.
     virtual OvraDRCore::Request getSessionRequestAPI() const = 0;
-    /// The table that the record goes to.
+    /// The table that stores the record.
     virtual OvraDRCore::SqliteTableHandler getCredTableHandler() const = 0;
 
     CredCreate() = default;
@@ -35,25 +35,25 @@ public:
     [[nodiscard]] bool setConn(const Conn &conn);
     /// Takes ownership of a sender that is ready to use (403 for null).
     [[nodiscard]] bool setSender(BaseSender *newSender);
-    /// Initialises the sender (a login, for an account) and takes ownership of it; it is deleted
-    /// when that fails.
+    /// Initialises the sender (a login, for an account) and takes ownership of it; it is deleted on
+    /// failure.
     [[nodiscard]] bool setCredSender(BaseCredSender *newSender);
     void clearSender();
     [[nodiscard]] bool setCredAccount(const std::string &newAccount);
 
-    /// Proves itself by a login. `otp` may be empty.
+    /// Authenticates by a login. `otp` may be empty.
     [[nodiscard]] bool setCred(const Conn &conn, const std::string &newAccount,
                                const std::string &password, const std::string &otp);
-    /// Proves itself by a session that the remote node granted before.
+    /// Authenticates by a session that the remote node granted before.
     [[nodiscard]] bool setCred(const Conn &conn, const std::string &session);
-    /// Proves itself by a credential that this node holds.
+    /// Authenticates by a credential that this node holds.
     [[nodiscard]] bool setCred(const std::string &credId);
 
     [[nodiscard]] bool checkParameter() const;
     /// Whether the account works on the remote node; creates nothing.
     [[nodiscard]] bool check() const;
     [[nodiscard]] bool checkCredAccount() const;
-    /// The one way by which every remote request of the flow goes.
+    /// Sends every remote request of the flow.
     [[nodiscard]] OvraDRCore::Response sendReq(const OvraDRCore::Request &request) const;
     [[nodiscard]] bool getRemoteNodeInfo();
     [[nodiscard]] bool requestRemoteSession();
@@ -63,15 +63,15 @@ public:
     /// The whole creation.
     [[nodiscard]] bool process();
 
-    /// Whether the node that getRemoteNodeInfo() met is this one. No step refuses a credential to
-    /// this node itself; who does not want one asks here before a session is requested.
+    /// Whether the node that getRemoteNodeInfo() reached is this one. No step refuses a credential
+    /// for this node itself; callers that do not want one check here before a session is requested.
     [[nodiscard]] bool isLocalNode() const;
-    /// The creation for a caller who has run getRemoteNodeInfo() himself, to judge the node first:
-    /// as process(), only that the node is not asked a second time who it is.
-    /// \return false with the codes of process(); 519 when no node was met.
+    /// As process(), for a caller that has already run getRemoteNodeInfo() to check the node: its
+    /// identity is not requested again.
+    /// \return false with the codes of process(); 519 if no node was reached.
     [[nodiscard]] bool processKnownNode();
 
-    /// The record as far as it has been built.
+    /// The record as built so far.
     const DRNode &getNode() const { return node; }
 
 private:
@@ -82,7 +82,7 @@ private:
     BaseSender *sender = nullptr;
 };
 
-/// A credential that lasts: a session for this node's id, a row in "node_cred".
+/// A lasting credential: a session for this node's id, a row in "node_cred".
 class OVRADRNODE_EXPORT DRNodeCredCreate : public CredCreate {
 public:
     ~DRNodeCredCreate() override;

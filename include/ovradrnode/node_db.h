@@ -21,7 +21,7 @@ public:
     ~NodeCredSqliteTable() override;
 };
 
-/// Credentials for short-lived use, of the same shape.
+/// Credentials for short-lived use, with the same columns.
 class OVRADRNODE_EXPORT TempCredSqliteTable : public OvraDRCore::SqliteTableHandler {
 public:
     TempCredSqliteTable();
@@ -37,23 +37,23 @@ public:
     ~NodeAttrSqliteTable() override;
 };
 
-/// The node database, opened for one statement. It has to have been provisioned (`ovradr setup`).
+/// The node database, opened for one statement. It must have been provisioned (`ovradr setup`).
 class OVRADRNODE_EXPORT NodeDBHandler : public OvraDRCore::SqliteDB {
 public:
     NodeDBHandler();
     NodeDBHandler(NodeDBHandler &&) noexcept = default;
     ~NodeDBHandler() override;
 
-    /// A new handler at every call.
+    /// A new handler for every call.
     static NodeDBHandler GetHandler();
 };
 
-/// The store over the node database. Every operation opens it for one statement and closes it
-/// again; a failure is a false result and an ERR line. The local node has no row: its id is
-/// answered with DRNode::getLocalNode().
+/// Access to the node database. Every operation opens it for one statement and closes it again; a
+/// failure returns false and logs an ERR line. The local node has no row: for its id
+/// DRNode::getLocalNode() is returned.
 class OVRADRNODE_EXPORT DRNodeDB {
 public:
-    /// Which credential tables are read, a set of bits; both: node credentials first.
+    /// Which credential tables to read, a bit set; both: node credentials first.
     enum CredType { CRED_TYPE_NODE = 1, CRED_TYPE_TEMP = 2 };
     friend constexpr CredType operator|(CredType left, CredType right) {
         return static_cast<CredType>(static_cast<int>(left) | static_cast<int>(right));
@@ -61,31 +61,31 @@ public:
 
     /// Deletes every node credential of the node; its temporary ones stay.
     [[nodiscard]] static bool Delete(const std::string &nodeId);
-    /// Appends every credential. True even when a table could not be read (which is logged).
+    /// Appends every credential. True even if a table could not be read (which is logged).
     static bool List(std::vector<DRNode> &nodes, CredType type);
     /// Appends the credentials of one node, like List(); false for an empty id.
     static bool ListCred(const std::string &nodeId, std::vector<DRNode> &nodes, CredType type);
-    /// The first node credential of the node. A node without any gives true and a record that holds
-    /// the node id alone, which is not valid.
+    /// The first node credential of the node. For a node without any: true, and an invalid record
+    /// that holds only the node id.
     [[nodiscard]] static bool Get(const std::string &nodeId, DRNode &node);
-    /// The credential with this id, from either table; false when there is none that is valid.
+    /// The credential with this id, from either table; false if there is no valid one.
     [[nodiscard]] static bool GetCred(const std::string &credId, DRNode &node);
-    /// The temporary credential with this id, also one that is not valid because it lacks
-    /// something; false when there is none, or the table cannot be read.
+    /// The temporary credential with this id, even an incomplete and thus invalid one; false if
+    /// there is none, or the table cannot be read.
     [[nodiscard]] static bool GetTempCred(const std::string &credId, DRNode &node);
     /// How many credentials the node has (temporary ones count only when there are no others); -1
     /// on an error.
     [[nodiscard]] static int IsNodeIdExist(const std::string &nodeId);
-    /// Points a node credential to another endpoint. True also when no credential has this id.
+    /// Changes the endpoint of a node credential. True also if no credential has this id.
     [[nodiscard]] static bool SetConn(const std::string &credId, const Conn &conn);
 
-    /// Reads one attribute; false when there is none.
+    /// Reads one attribute; false if there is none.
     [[nodiscard]] static bool GetAttr(const std::string &nodeId, const std::string &app,
                                       const std::string &attr, std::string &value);
-    /// Appends the attributes that the application keeps about the node.
+    /// Appends the attributes that the application stores about the node.
     [[nodiscard]] static bool ListAttr(const std::string &nodeId, const std::string &app,
                                        std::vector<DRNodeAttr> &attrs);
-    /// Adds or changes one attribute. The test whether it exists and the write are two statements.
+    /// Adds or changes one attribute. The existence check and the write are two statements.
     [[nodiscard]] static bool SetAttr(const DRNodeAttr &attr);
     [[nodiscard]] static bool SetAttr(const std::string &nodeId, const std::string &app,
                                       const std::string &attr, const std::string &value);

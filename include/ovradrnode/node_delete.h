@@ -7,7 +7,7 @@
 
 namespace OvraDRNode {
 
-/// Deletes a node credential: the row first, then, when no other credential uses it, the session on
+/// Deletes a node credential: first the row, then, if no other credential uses it, the session on
 /// the remote node. A remote node that does not answer never blocks the deletion.
 class OVRADRNODE_EXPORT DRNodeCredDelete {
 public:
@@ -21,8 +21,8 @@ private:
     std::string credId;
 };
 
-/// The same for a temporary credential. Its session goes too unless a node credential uses it; what
-/// is known of the node stays as it is while there is another credential to it.
+/// The same for a temporary credential. Its session is released too unless a node credential uses
+/// it; cached facts about the node stay while there is another credential for it.
 class OVRADRNODE_EXPORT TempCredDelete {
 public:
     explicit TempCredDelete(const std::string &credId);

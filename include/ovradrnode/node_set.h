@@ -12,9 +12,9 @@
 
 namespace OvraDRNode {
 
-/// Changes a node credential: a new login, perhaps over another endpoint, to the same node. The row
-/// is rewritten first; then the session that nothing uses any more is released. Construct with the
-/// credential id, setCred(), process().
+/// Changes a node credential: a new login, possibly over another endpoint, to the same node. The
+/// row is rewritten first; then a session that nothing uses any more is released. Construct with
+/// the credential id, setCred(), process().
 class OVRADRNODE_EXPORT DRNodeCredSet : public OvraDRCore::ErrRecorder {
 public:
     DRNodeCredSet() = default;
@@ -26,11 +26,11 @@ public:
 
     /// Loads the credential to change (401, 404, 516).
     [[nodiscard]] bool setCredId(const std::string &credId);
-    /// The new endpoint and login (500, 401, or what the login failed with).
+    /// The new endpoint and login (500, 401, or the error of the login).
     [[nodiscard]] bool setCred(const Conn &conn, const std::string &account,
                                const std::string &password, const std::string &otp);
     bool IsSessionChanged() const;
-    /// Whether the new login reaches the node that the credential belongs to (518 when another).
+    /// Whether the new login reaches the node that the credential belongs to (518 if another).
     [[nodiscard]] bool check();
     [[nodiscard]] bool checkRemoteNodeInfo();
     [[nodiscard]] bool requestRemoteSession();

@@ -15,9 +15,9 @@ namespace OvraDRNode {
 class BaseSender;
 
 /// An operation that runs on the local node or, by a web-API request, on a remote one. A subclass
-/// says how to check the parameters, how to do the work here, and which request does it there;
-/// Run() decides where. An object serves one operation: construct, Run() once, read GetErr() and
-/// GetResult(). examples/ holds a complete one.
+/// defines how to check the parameters, how to do the work locally, and which request does it
+/// remotely; Run() decides where. An object serves one operation: construct, Run() once, read
+/// GetErr() and GetResult(). examples/ has a complete one.
 class OVRADRNODE_EXPORT NodeOperationDispatcher : public OvraDRCore::ErrRecorder {
 public:
     ~NodeOperationDispatcher() override;
@@ -27,7 +27,7 @@ public:
     [[nodiscard]] virtual bool RunLocal() = 0;
     /// The request that does the work on a remote node.
     virtual OvraDRCore::Request GetRequest() = 0;
-    /// Asked before anything else, wherever the operation is to run.
+    /// Called before anything else, wherever the operation is to run.
     [[nodiscard]] virtual bool IsValidParam() = 0;
     /// The credential for a remote run; "" lets the sender choose.
     virtual std::string GetCredId() const;
@@ -40,7 +40,7 @@ public:
     /// The node is the local one, or known to the node database.
     [[nodiscard]] bool HasPrivilege() const;
     /// Checks, decides and runs. Codes: 401 bad parameters, 507 unknown node, 518 and 519 for the
-    /// named credential, otherwise the sender's or the remote's own.
+    /// named credential, otherwise those of the sender or the remote.
     [[nodiscard]] bool Run();
     [[nodiscard]] bool RemoteRun();
     [[nodiscard]] bool RunNodeSender();

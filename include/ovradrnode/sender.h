@@ -22,9 +22,9 @@ class CredRequest;
 
 namespace OvraDRNode {
 
-/// Carries a web-API request to a node. A failure is recorded in the sender (GetErrCode(),
-/// GetErrMsg()) or is what the remote answered; errorOf() tells which. Nothing throws. A sender
-/// serves one thread at a time.
+/// Sends a web-API request to a node. A failure is recorded in the sender (GetErrCode(),
+/// GetErrMsg()) or is the remote's answer; errorOf() returns the right one. Nothing throws. A
+/// sender may be used by one thread at a time.
 class OVRADRNODE_EXPORT BaseSender : public OvraDRCore::ErrRecorder {
 public:
     ~BaseSender() override;
@@ -35,12 +35,12 @@ public:
     [[nodiscard]] static OvraDRCore::Response run(const OvraDRCore::Request &request);
     /// Probes the endpoint now (at most 10 seconds) and records the verdict for all processes.
     [[nodiscard]] static bool IsConnectable(const Conn &conn);
-    /// The recorded verdict; probes only when that is older than 5 seconds.
+    /// The recorded verdict; probes only if that is older than 5 seconds.
     static bool GetCachedConnectable(const Conn &conn);
 };
 
-/// Why a call failed. A call fails in one of two places: a remote that refuses says so in its
-/// answer, and where no valid answer came the sender has recorded why. This looks in both.
+/// Why a call failed. If the remote refused, the reason is in its answer; if no valid answer came,
+/// it is recorded in the sender. This looks in both.
 ///
 ///     NodeSender sender(nodeId);
 ///     const OvraDRCore::Response answer = sender.process(request);
@@ -50,10 +50,9 @@ public:
 ///
 /// \param sender  as process() left it
 /// \param answer  what process() returned
-/// \return the remote's code and message when `answer` is a valid refusal, also where the sender
-/// has
-///         a code of its own for it; otherwise those of the sender; 407 when neither has one. The
-///         code is 0 only for an answer that is a success.
+/// \return the remote's code and message if `answer` is a valid refusal, even if the sender has its
+///         own code for it; otherwise those of the sender; 407 if neither has one. The code is 0
+///         only for a successful answer.
 [[nodiscard]] OVRADRNODE_EXPORT OvraDRCore::ErrRecorder
 errorOf(const OvraDRCore::ErrRecorder &sender, const OvraDRCore::Response &answer);
 
@@ -62,8 +61,8 @@ class OVRADRNODE_EXPORT BaseCredSender : public BaseSender {
 public:
     ~BaseCredSender() override;
     bool isValid() const override;
-    /// Logs in on first use, asks for the endpoint's verdict, sends. Nothing is sent to an endpoint
-    /// that is held unreachable (500).
+    /// Logs in on first use, checks the endpoint's verdict, sends. Nothing is sent to an endpoint
+    /// that is considered unreachable (500).
     [[nodiscard]] OvraDRCore::Response process(const OvraDRCore::Request &request) override;
     [[nodiscard]] virtual bool initCred() = 0;
     virtual void doClear() = 0;
@@ -74,13 +73,13 @@ public:
     BaseCredSender(const BaseCredSender &) = delete;
     BaseCredSender &operator=(const BaseCredSender &) = delete;
 
-    /// Takes the endpoint, translated when it is a relay endpoint; an invalid one is refused and
-    /// the old one stays.
+    /// Sets the endpoint, translated if it is a relay endpoint; an invalid one is rejected and the
+    /// old one stays.
     [[nodiscard]] bool setConn(const Conn &value);
     const Conn &getConn() const { return conn; }
-    /// Puts the endpoint into the credential.
+    /// Copies the endpoint into the credential.
     [[nodiscard]] bool initConn() const;
-    /// Makes the credential usable: allocated, filled, and logged in where that applies.
+    /// Makes the credential usable: allocates it, fills it, and logs in where that applies.
     [[nodiscard]] bool init();
     /// Back to the state before init().
     void clear();
@@ -102,7 +101,8 @@ private:
                                             const char *function) const;
 };
 
-/// Logs in with account, password and one-time code before the first request, and out at the end.
+/// Logs in with account, password and one-time code before the first request, and logs out at the
+/// end.
 class OVRADRNODE_EXPORT CredAccountSender : public BaseCredSender {
 public:
     ~CredAccountSender() override;
@@ -116,7 +116,7 @@ public:
     CredAccountSender(const std::string &account, const std::string &passwd,
                       const std::string &otp);
 
-    /// False, changing nothing, when account or password is empty; `otp` may be.
+    /// False, changing nothing, if account or password is empty; `otp` may be empty.
     [[nodiscard]] bool setCred(const std::string &newAccount, const std::string &newPasswd,
                                const std::string &newOtp);
     [[nodiscard]] bool login();
@@ -147,8 +147,8 @@ private:
     std::string session;
 };
 
-/// Sends to a node: locally when it is the local one, otherwise over the credential that worked
-/// last, then over every other credential of the node, until one gets through.
+/// Sends to a node: locally if it is the local one, otherwise over the credential that worked last,
+/// then over every other credential of the node, until one succeeds.
 class OVRADRNODE_EXPORT NodeSender : public BaseSender {
 public:
     ~NodeSender() override;
@@ -165,16 +165,16 @@ public:
     [[nodiscard]] static bool process(const std::string &nodeId, const std::string &api,
                                       const std::string &method, int version,
                                       const Json::Value &params, Json::Value &out);
-    /// One attempt over one credential; true when the answer got through: it is valid, and not the
-    /// remote's refusal for lack of permission.
+    /// One attempt over one credential; true if the answer is valid and not a refusal for lack of
+    /// permission.
     [[nodiscard]] bool processByCred(const DRNode &node, const OvraDRCore::Request &request,
                                      OvraDRCore::Response &response);
     [[nodiscard]] bool processByCredId(const std::string &credId,
                                        const OvraDRCore::Request &request,
                                        OvraDRCore::Response &response);
-    /// The first node credential that has the right; "" when none has.
+    /// The first node credential that has the right; "" if none has.
     std::string getValidCredId() const;
-    /// The credential that worked last; looked for anew after 5 seconds.
+    /// The credential that worked last; searched for again after 5 seconds.
     std::string getCachedCredId() const;
     /// Whether the node answers over any of its node credentials, probed now.
     [[nodiscard]] bool isConnectable() const;
@@ -196,13 +196,13 @@ public:
     [[nodiscard]] bool setCred(const DRNode &value);
     [[nodiscard]] bool setCred(const std::string &credId);
     const DRNode &getNode() const { return node; }
-    /// Whether the credential has the right on its node; asks the node when the verdict is older
-    /// than 3 seconds.
+    /// Whether the credential has the right on its node; asks the node if the verdict is older than
+    /// 3 seconds.
     [[nodiscard]] bool testPrivilege();
 
     using BaseSender::GetCachedConnectable;
     using BaseSender::IsConnectable;
-    /// As for the record's endpoint; the local node is always connectable.
+    /// The same for the record's endpoint; the local node is always connectable.
     [[nodiscard]] static bool IsConnectable(const DRNode &node);
     static bool GetCachedConnectable(const DRNode &node);
 

@@ -1,6 +1,6 @@
 #!/bin/bash
 # SPDX-License-Identifier: Apache-2.0
-# Whether a lab's network can be made in this namespace: a switch, a link, a firewall table.
+# Whether a lab's network can be created in this namespace: a switch, a link, a firewall table.
 set -euo pipefail
 PATH=$PATH:/usr/sbin:/sbin
 ip link add sw0 type bridge

@@ -1,8 +1,10 @@
 # SPDX-License-Identifier: Apache-2.0
-# collector.pl FILE: a node's system log. Listens on /dev/log and appends one line a message to FILE.
+# collector.pl FILE: a node's system log. Listens on /dev/log and appends one line per message to
+# FILE.
 #
-# Not busybox's syslogd: that cuts messages at 1,024 bytes and lets its file grow for ever. Here a
-# message of up to 8,192 bytes stays whole, and at 8 MiB the file becomes FILE.old.
+# Not busybox's syslogd, which truncates messages at 1,024 bytes and lets its file grow without
+# limit. Here messages of up to 8,192 bytes stay whole, and at 8 MiB the file is renamed to
+# FILE.old.
 use strict;
 use warnings;
 use IO::Handle;

@@ -1,6 +1,6 @@
 # SPDX-License-Identifier: Apache-2.0
-# deaf.pl ADDRESS PORT FILE: an appliance that hangs. Takes every connection and never says a word;
-# each is a line in FILE.
+# deaf.pl ADDRESS PORT FILE: an appliance that hangs. Accepts every connection and never sends
+# anything; logs each as a line in FILE.
 use strict;
 use warnings;
 use IO::Handle;

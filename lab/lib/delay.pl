@@ -1,10 +1,10 @@
 # SPDX-License-Identifier: Apache-2.0
-# delay.pl TAP-A TAP-B MILLISECONDS: carries every frame from either tap to the other, half of that
-# time later. Says "ready" once it carries, and ends when a tap is removed. With --probe it only tries
-# whether it could.
+# delay.pl TAP-A TAP-B MILLISECONDS: forwards every frame from either TAP device to the other after
+# half of that time. Prints "ready" once it runs, and exits when a TAP device is removed. With --probe
+# it only checks whether that would work.
 #
-# Taps, because the kernel hands their frames over as a cable would carry them: no longer than the
-# MTU, and with their checksums.
+# TAP devices, because the kernel passes their frames as they would be on a cable: no longer than
+# the MTU, and with checksums.
 use strict;
 use warnings;
 use Errno;
@@ -20,7 +20,7 @@ if ($nameA eq '--probe') {
     exit;
 }
 my $delay = $milliseconds / 2000;
-# What a queue of the kernel would drop as well.
+# Beyond this a kernel queue would drop frames as well.
 my $most = 20_000;
 
 sub openTap {
@@ -32,7 +32,7 @@ sub openTap {
 }
 
 my @ends   = (openTap($nameA), openTap($nameB));
-my @queues = ([], []);    # frames for that end, each with the time at which it is due
+my @queues = ([], []);    # frames for that end, each with its due time
 $| = 1;
 print "ready\n";
 

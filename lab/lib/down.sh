@@ -2,7 +2,7 @@
 # shellcheck shell=bash
 # lab down, lab status, lab run, lab log, lab addr.
 
-# waitUntilGone: waits until the keeper has removed the lab, at most 15 seconds.
+# waitUntilGone: waits up to 15 seconds until the keeper has removed the lab.
 waitUntilGone() {
     local i
     for ((i = 0; i < 300; i++)); do
@@ -12,13 +12,14 @@ waitUntilGone() {
     return 1
 }
 
-# sweepLab: removes what is left of a lab whose keeper is gone.
+# sweepLab: removes the remains of a lab whose keeper is dead.
 sweepLab() {
     [[ ! -s $lab/id ]] || killLab "$(<"$lab/id")" || fail "processes of the lab in $lab survive SIGKILL"
     removeTree "$lab" || fail "cannot remove $lab"
 }
 
-# isKeeper PID: whether that process is the keeper of this lab, and not a later one of that number.
+# isKeeper PID: whether that process is the keeper of this lab, and not a later process with the
+# same pid.
 isKeeper() {
     local words=()
     [[ -n $1 ]] && mapfile -d '' -t words <"/proc/$1/cmdline" || return 1
@@ -48,7 +49,7 @@ labDown() {
     echo "lab: down; no process, mount, interface or folder of it is left"
 }
 
-# verifyGone ID: looks for what a lab could leave behind, and stops with what there is.
+# verifyGone ID: looks for left-overs of a lab, and fails naming them.
 verifyGone() {
     local left
     left=$(labProcesses "$1" | tr '\n' ' ')
@@ -93,7 +94,7 @@ labStatus() {
     local i daemons format='%-8s %-21s  %-28s  %s\n'
     needLab
     daemons=$(<"$lab/daemon")
-    # shellcheck disable=SC2059 # one format for the headline and the rows
+    # shellcheck disable=SC2059 # one format for header and rows
     printf "$format" NODE ADDRESS LINKS DAEMON
     for ((i = 1; i <= labCount; i++)); do
         # shellcheck disable=SC2059
@@ -116,7 +117,7 @@ linkWord() {
     echo "$(<"$lab/n$1/link$2")$shape"
 }
 
-# daemonWord NODE YES-OR-NO: whether the node's daemon answers now, asked from inside.
+# daemonWord NODE YES-OR-NO: whether the node's daemon answers now, checked from inside.
 daemonWord() {
     if [[ $2 == no ]]; then
         echo "none"

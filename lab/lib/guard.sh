@@ -1,6 +1,7 @@
 #!/bin/bash
 # SPDX-License-Identifier: Apache-2.0
-# guard.sh FOLDER ID: when standard input ends, kills every process with that id, removes FOLDER.
+# guard.sh FOLDER ID: at the end of standard input, kills every process with that id and removes
+# FOLDER.
 set -euo pipefail
 lib=$(dirname "${BASH_SOURCE[0]}")
 # shellcheck source=lab/lib/processes.sh

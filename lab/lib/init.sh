@@ -1,8 +1,8 @@
 #!/bin/bash
 # SPDX-License-Identifier: Apache-2.0
-# init.sh FOLDER: the first program inside a lab made of namespaces; it runs as root of them. Makes
+# init.sh FOLDER: the first program inside a lab made of namespaces, running as their root. Creates
 # two switches in its own network namespace and, for every node, a network namespace with one link
-# to each, a file view, a host name and a process namespace. When this ends, everything ends.
+# to each, a file view, a host name and a process namespace. When it ends, everything ends.
 set -euo pipefail
 lib=$(dirname "${BASH_SOURCE[0]}")
 # shellcheck source=lab/lib/common.sh
@@ -22,8 +22,8 @@ makeSwitches() {
 	link set sw0 up
 	link set sw1 up
 	END
-    # For `lab drop`. IPv4 only, so that neighbours are still found: a packet goes out and nothing
-    # comes back, as behind a router that drops; a missing neighbour would be an error at once.
+    # For `lab drop`. IPv4 only, so that ARP still works: packets go out and nothing comes back, as
+    # behind a router that drops; a missing neighbour would be an immediate error.
     nft -f - <<-'END'
 	table bridge lab {
 	    set dropping { type ifname; }
@@ -36,7 +36,7 @@ makeSwitches() {
 	END
 }
 
-# startNode NODE: the node's programs start once its links are plugged in; until then bubblewrap
+# startNode NODE: the node's programs start once its links are connected; until then bubblewrap
 # waits for a byte.
 startNode() {
     local folder=$lab/n$1 info block pid i

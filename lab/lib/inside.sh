@@ -1,8 +1,9 @@
 # SPDX-License-Identifier: Apache-2.0
 # shellcheck shell=bash
-# Entering a lab that is up. Needs what needLab sets.
+# Entering a running lab. Requires needLab.
 
-# enterLab COMMAND...: replaces this shell with COMMAND among the switches, as root of the lab.
+# enterLab COMMAND...: replaces this shell with COMMAND in the switches' namespace, as root of the
+# lab.
 enterLab() {
     local pid users=()
     pid=$(bwrapPid "$lab/init.json")
@@ -10,8 +11,8 @@ enterLab() {
     exec nsenter -t "$pid" "${users[@]}" -m -n -u -p -- "$@"
 }
 
-# enterNode NODE COMMAND...: replaces this shell with COMMAND in the node, in the folder where it
-# was called if the node has that, or else in /.
+# enterNode NODE COMMAND...: replaces this shell with COMMAND in the node, in the current folder if
+# the node has it, otherwise in /.
 enterNode() {
     local number=$1
     shift
@@ -24,7 +25,7 @@ enterNode() {
         prootRun "$lab/n$number" "$@" || code=$?
         exit "$code"
     fi
-    # The pid in init's numbering: the first step changes into that.
+    # The pid in init's namespace, which the first step enters.
     local nodePid
     nodePid=$(bwrapPid "$lab/n$number/bwrap.json")
     enterLab nsenter -t "$nodePid" -m -n -u -p -- /bin/bash -c \

@@ -1,9 +1,9 @@
 #!/bin/bash
 # SPDX-License-Identifier: Apache-2.0
-# keeper.sh FOLDER: holds one lab together. Starts it, waits for the end, and then leaves nothing of
-# it: no process, no folder. `lab up` writes "keep" to the standard input once all is well; when
-# that ends without the word (`lab up` failed, was interrupted, was killed), so does the lab.
-# SIGTERM ends it too; that is `lab down`.
+# keeper.sh FOLDER: supervises one lab. Starts it, waits for its end, and then removes its processes
+# and its folder. `lab up` writes "keep" to the standard input once the lab is up; if the input ends
+# without it (`lab up` failed, was interrupted, was killed), the lab ends. `lab down` ends it with
+# SIGTERM.
 set -euo pipefail
 lib=$(dirname "${BASH_SOURCE[0]}")
 # shellcheck source=lab/lib/common.sh
@@ -51,7 +51,7 @@ startProots() {
 }
 
 PATH=$(insidePath "$labPrefix")
-# The id is exported only now: this process itself is not to be found by it.
+# The id is exported only now, so that this process itself is not found by it.
 export PATH OVRADR_LAB_WAY=$labWay OVRADR_LAB_ID=$labId
 if [[ $labWay == proot ]]; then startProots; else startNamespaces; fi
 echo "$$" >"$lab/keeper.pid"
@@ -59,5 +59,5 @@ echo "$$" >"$lab/keeper.pid"
 word=
 IFS= read -r word || true
 [[ $word == keep ]] || exit 0
-# Some node may end before the others; the lab is over when all have.
+# A node may end before the others; the lab ends when all have.
 wait

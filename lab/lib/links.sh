@@ -1,10 +1,10 @@
 # SPDX-License-Identifier: Apache-2.0
 # shellcheck shell=bash
 # lab cut, lab drop, lab restore: done at the switch, so that a node sees what a real one would.
-#   cut    the cable is out: no carrier, and neighbours are no longer found
-#   drop   the carrier stays and every IPv4 packet vanishes: nobody is ever told
-# lab hide: a node that others cannot connect to and that can connect to them, as behind a router
-# that translates addresses.
+#   cut    the cable is unplugged: no carrier, and ARP fails
+#   drop   the carrier stays and every IPv4 packet is silently dropped
+# lab hide: blocks inbound connections to a node, not outbound ones, as behind a router with address
+# translation.
 
 labLink() {
     local action=$1 port file element

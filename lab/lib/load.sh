@@ -1,8 +1,8 @@
 #!/bin/bash
 # SPDX-License-Identifier: Apache-2.0
-# load.sh CLIENTS COUNT PAUSE FOLDER COMMAND...: inside a node, CLIENTS processes run COMMAND at the
-# same time and COUNT times each (0: until FOLDER/stop is there), with a PAUSE of seconds in between.
-# Every run is a line in FOLDER/runs: its start and its duration in microseconds, and its exit code.
+# load.sh CLIENTS COUNT PAUSE FOLDER COMMAND...: inside a node, CLIENTS concurrent processes run
+# COMMAND COUNT times each (0: until FOLDER/stop exists), with PAUSE seconds in between. Every run is
+# a line in FOLDER/runs: start and duration in microseconds, and exit code.
 set -euo pipefail
 clients=$1 count=$2 pause=$3 folder=$4
 shift 4

@@ -1,7 +1,7 @@
 #!/bin/bash
 # SPDX-License-Identifier: Apache-2.0
 # node.sh FOLDER NODE: the first program inside a node. Sets up its links, its system log and the
-# appliance on it, tells in FOLDER/nNODE/state how that went, and then waits for orders.
+# appliance, reports the result in FOLDER/nNODE/state, and then waits for commands.
 set -euo pipefail
 lib=$(dirname "${BASH_SOURCE[0]}")
 # shellcheck source=lab/lib/common.sh
@@ -11,14 +11,14 @@ lab=$1
 node=$2
 own=$lab/n$node
 way=$(<"$lab/way")
-# How long the daemon may take to answer on both of its ports.
+# How long the daemon may take to answer on both ports.
 startSeconds=30
 daemon=0
 export OVRADR_LAB_NODE=$node
 
 exec >"$own/console" 2>&1
 
-# say STATE [WHY]: replaces the state file in one step, as others read it at any moment.
+# say STATE [WHY]: replaces the state file atomically, as others read it at any time.
 say() {
     printf '%s\n' "$*" >"$own/state.new"
     mv "$own/state.new" "$own/state"
@@ -44,7 +44,7 @@ startLog() {
     return 1
 }
 
-# answers: whether the daemon gives an HTTP answer, whatever it says, on both ports.
+# answers: whether the daemon gives any HTTP answer on both ports.
 answers() {
     local address url
     address=$(nodeAddress "$way" "$node" 0)

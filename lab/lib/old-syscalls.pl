@@ -1,11 +1,12 @@
 # SPDX-License-Identifier: Apache-2.0
 # old-syscalls.pl COMMAND...: runs COMMAND as on a kernel without the system calls that proot does
-# not know. It would let them through untranslated, so that a program saw this machine's files where
-# it should see its node's; without them the C library falls back on the ones that proot translates.
+# not know. Proot would pass them through untranslated, so that a program would see this machine's
+# files instead of its node's; without them the C library falls back on those that proot translates.
 #
-# clone3 is not among them, although proot does not know it either. It only reads the flags of a new
-# task there, and does better without: for a clone with CLONE_VM, the C library's posix_spawn, proot
-# lets parent and child share one record of their heaps beyond the exec, and one of them crashes.
+# clone3 is not among them, although proot does not know it either. Proot only reads the flags of a
+# new task there, and is better off without: after a clone with CLONE_VM, as in the C library's
+# posix_spawn, proot lets parent and child share one heap record beyond the exec, and one of them
+# crashes.
 #
 # Perl, because it is on every Debian system and can call prctl(2) by number. Numbers: asm/unistd.h;
 # filter: seccomp(2), linux/filter.h, linux/audit.h.
@@ -51,6 +52,6 @@ syscall($machine->{prctl}, $setNoNewPrivileges, 1, 0, 0, 0) == 0
 syscall($machine->{prctl}, $setSeccomp, $modeFilter, $program, 0, 0) == 0
     or die "old-syscalls: cannot set the filter: $!\n";
 
-# A shell starts its background commands with these ignored.
+# A shell starts background commands with these ignored.
 $SIG{INT} = $SIG{QUIT} = 'DEFAULT';
 exec { $ARGV[0] } @ARGV or die "old-syscalls: cannot run $ARGV[0]: $!\n";

@@ -1,7 +1,7 @@
 # SPDX-License-Identifier: Apache-2.0
 # shellcheck shell=bash
-# What scenes with two appliances are played with: a lab of their own, taken down at the end, in which
-# node 1 pairs with node 2, whose administrator is "replica". What is run is said and judged here.
+# The framework of scenes with two appliances: their own lab, taken down at the end, in which node 1
+# pairs with node 2, whose administrator is "replica". Runs commands and checks their outcome.
 
 lab=$(dirname "$(readlink -f "${BASH_SOURCE[0]}")")/../lab
 # shellcheck source=lab/lib/ports.sh
@@ -26,7 +26,7 @@ fail() {
     exit 1
 }
 
-# A command that nobody expected to fail. In a subshell it is a failure of the command around it, if one.
+# A command failed unexpectedly. In a subshell the enclosing command decides.
 set -E
 trap '((BASH_SUBSHELL)) || fail "exit code $? of: $BASH_COMMAND"' ERR
 
@@ -37,16 +37,16 @@ on() {
     output=$("$lab" run "$node" -- timeout 60 "$@" 2>&1 </dev/null) || code=$?
     ((code == wanted)) || fail "exit code $code instead of $wanted: $*"
 }
-# value FILTER: what jq finds in the last output.
+# value FILTER: the result of jq on the last output.
 value() { jq -er "$1" <<<"$output"; }
-# holds FILTER: the last output is JSON for which that is true.
+# holds FILTER: the last output is JSON for which FILTER is true.
 holds() { jq -e "$1" <<<"$output" >/dev/null 2>&1 || fail "the output does not hold: $1"; }
 says() { [[ $output == *"$1"* ]] || fail "the output does not say \"$1\""; }
 logSays() { "$lab" log "$1" | grep -qF -- "$2" || fail "the log of node $1 does not say \"$2\""; }
 
 password=correct-horse-battery
 account=replica
-# up: with as many nodes as $nodes says, two if it says nothing.
+# up: starts $nodes nodes, two by default.
 up() {
     local way
     way=$("$lab" way)
@@ -60,7 +60,7 @@ up() {
     remote=$(value .data.node_id)
     key=$(fingerprint 2)
 }
-# fingerprint NODE [PROTOCOL]: the fingerprint of the node's key for HTTPS, or for that.
+# fingerprint NODE [PROTOCOL]: the fingerprint of the node's key for HTTPS, or for PROTOCOL.
 fingerprint() {
     "$lab" run "$1" -- ovradr --json conn local |
         jq -er --arg protocol "${2-https}" 'first(.data.conns[] | select(.protocol == $protocol)).fingerprint'
@@ -73,8 +73,8 @@ create() {
 }
 info() { on 1 "$1" ovradr call "$remote" OVRA.DR.Node info; }
 
-# signalDaemon SIGNAL: to the daemon of node 2 and to no other: with proot every process of the machine
-# can be seen, those of other labs and a real appliance's among them. False when there is none.
+# signalDaemon SIGNAL: to the daemon of node 2 only: with proot every process of the machine is
+# visible, including those of other labs and of a real appliance. False if there is none.
 signalDaemon() {
     # shellcheck disable=SC2016 # expanded in the node
     "$lab" run 2 -- bash -c '
@@ -95,7 +95,7 @@ waitGone() {
     done
     fail "ovradrd does not end"
 }
-# In the background of the node, as its init would; the lab ends it. Node 1 learns nothing of it.
+# In the background of the node, as its init would; the lab ends it. Node 1 is not notified.
 startDaemon() {
     waitGone
     "$lab" run 2 -- sh -c 'ovradrd >/tmp/ovradrd.out 2>&1 &'

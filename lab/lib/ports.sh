@@ -1,9 +1,9 @@
 # SPDX-License-Identifier: Apache-2.0
 # shellcheck shell=bash
-# Labs made by proot share this machine's ports, so that scenes and tests play one after the other.
+# Proot labs share this machine's ports, so scenes and tests run one after another.
 
-# takePorts WAY: waits for its turn, at most two minutes, where WAY is proot. The turn ends with the
-# last process that inherited it, so also when this one is killed.
+# takePorts WAY: if WAY is proot, waits for the lock on the ports, at most two minutes. The lock is
+# released with the last process that inherited it, so also when this one is killed.
 takePorts() {
     local turn
     [[ $1 == proot ]] || return 0

@@ -2,8 +2,8 @@
 # shellcheck shell=bash
 # The processes of one lab or sandbox, found by the id in their environment.
 
-# labProcesses ID: the pids that carry the id, and those that a proot among them traces (a program
-# that was started with an empty environment is still one of ours). Not the calling shell.
+# labProcesses ID: the pids with the id in their environment, and those traced by a proot among them
+# (a program started with an empty environment is still one of ours). Not the calling shell.
 labProcesses() {
     local environ pid marked=" "
     while IFS= read -r environ; do
@@ -15,8 +15,8 @@ labProcesses() {
         $1 != self && (index(marked, " " $1 " ") || ($2 != 0 && index(marked, " " $2 " "))) { print $1 }'
 }
 
-# tracedBy: a line for each living process, with its pid and that of who traces it (0 for nobody).
-# The files are read by grep, which goes on where a process ends meanwhile; awk stops there.
+# tracedBy: a line for each live process, with its pid and that of its tracer (0: none). grep reads
+# the files, because it continues if a process ends meanwhile; awk would stop.
 tracedBy() {
     env -u OVRADR_LAB_ID grep -sE '^(State|TracerPid):' /proc/[0-9]*/status |
         env -u OVRADR_LAB_ID awk -F '[/:[:space:]]+' '
@@ -24,7 +24,7 @@ tracedBy() {
             $5 == "TracerPid" && !zombie { print $3, $6 }' || true
 }
 
-# killLab ID: kills them all and looks again until none is left; false when some survive 5 seconds.
+# killLab ID: kills them all, repeatedly, until none is left; false if some survive 5 seconds.
 killLab() {
     local pids round
     for ((round = 0; round < 100; round++)); do
@@ -36,7 +36,7 @@ killLab() {
     return 1
 }
 
-# removeTree FOLDER: removes it with all it holds, folders without permissions included.
+# removeTree FOLDER: removes it with its contents, including folders without permissions.
 removeTree() {
     rm -rf -- "$1" 2>/dev/null && return 0
     chmod -R u+rwX -- "$1" 2>/dev/null || true

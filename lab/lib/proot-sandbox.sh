@@ -1,7 +1,7 @@
 #!/bin/bash
 # SPDX-License-Identifier: Apache-2.0
-# proot-sandbox.sh PATH... -- COMMAND...: lab/sandbox where namespaces are refused. The PATHs stay
-# themselves in the view.
+# proot-sandbox.sh PATH... -- COMMAND...: lab/sandbox where namespaces are not permitted. The PATHs
+# are visible unchanged in the view.
 set -euo pipefail
 lib=$(dirname "${BASH_SOURCE[0]}")
 # shellcheck source=lab/lib/common.sh
@@ -21,10 +21,10 @@ done
 shift
 
 id=$(newId)
-# Short and fixed: proot puts this folder before the path of every Unix socket, and such a path has
-# room for 107 bytes.
+# Short and fixed: proot prepends this folder to the path of every Unix socket, which is limited to
+# 107 bytes.
 folder=$(mktemp -d /tmp/ovl.XXXXXX)
-# As open as the root folder of a machine, for commands that change their user.
+# With the mode of a machine's root folder, for commands that change their user.
 chmod 711 "$folder"
 
 # shellcheck disable=SC2317 # called by the trap
@@ -38,9 +38,9 @@ trap 'exit 130' INT
 trap 'exit 143' TERM
 trap 'exit 129' HUP
 
-# The guard outlives a SIGKILL of this script: it waits for the end of a pipe that only this script
-# holds, and then cleans up in its stead. It is in a session of its own and nobody's child, so
-# that who kills a whole process tree does not kill it too.
+# The guard survives a SIGKILL of this script: it waits for the end of a pipe that only this script
+# holds, and then cleans up. It is detached in its own session, so that killing a whole process tree
+# does not kill it too.
 exec {hold}> >(exec setsid -f bash "$labLib/guard.sh" "$folder" "$id" >/dev/null 2>&1)
 
 mkdir "$folder/root"

@@ -1,16 +1,16 @@
 # SPDX-License-Identifier: Apache-2.0
 # shellcheck shell=bash
-# Running a command under proot so that its end and its exit code are its own: proot by itself ends
-# with the last process that it traces, hands out that one's exit code, and ignores SIGTERM.
+# Running a command under proot with the command's own end and exit code: by itself proot ends with
+# the last process that it traces, returns that one's exit code, and ignores SIGTERM.
 
 # prootRun FOLDER COMMAND...: runs COMMAND in the view of viewArgs and returns its exit code (128 +
-# signal where one ended it). What it leaves running stays. FOLDER is private and gets a fifo for
+# signal if one ended it). Background processes keep running. FOLDER is private and gets a FIFO for
 # the exit code. SIGINT, SIGTERM or SIGHUP kill the command and all that it started.
 prootRun() {
     local folder=$1 fifo=$1/status.$BASHPID code="" status
     shift
     mkfifo -m 600 "$fifo"
-    # Open in both directions, so that neither side waits for the other.
+    # Opened read-write, so that neither side blocks.
     exec {status}<>"$fifo"
     rm -f "$fifo"
     PROOT_TMP_DIR=$folder perl "$labLib/old-syscalls.pl" proot -v -1 "${viewArgs[@]}" -w / \
@@ -25,7 +25,7 @@ prootRun() {
     trap 'killTraced "$prootPid"; exit 129' HUP
     until IFS= read -r -t 1 -u "$status" code; do
         kill -0 "$prootPid" 2>/dev/null && continue
-        # It may have ended between the two.
+        # It may have ended in between.
         IFS= read -r -t 0.01 -u "$status" code || code=137
         break
     done
@@ -34,7 +34,7 @@ prootRun() {
     return "$code"
 }
 
-# killTraced PID: kills a proot with all that it traces.
+# killTraced PID: kills a proot and all processes that it traces.
 killTraced() {
     local pids round
     for ((round = 0; round < 20; round++)); do

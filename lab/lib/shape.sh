@@ -1,9 +1,9 @@
 # SPDX-License-Identifier: Apache-2.0
 # shellcheck shell=bash
-# lab shape: makes a node's links slow, long or lossy.
-#   rate    both ways, by a token bucket (tc) at both ends of the link
-#   delay   added to the round trip: between node and switch a program of ours carries every frame
-#           and takes half of it each way. Not tc's netem, which kernels for containers leave out.
+# lab shape: makes a node's links slow, delayed or lossy.
+#   rate    both directions, by a token bucket (tc) at both ends of the link
+#   delay   added to the round trip: a program of ours between node and switch forwards every frame
+#           after half of it. Not tc's netem, which container kernels lack.
 #   loss    of the IPv4 packets in each direction, by the firewall of the switch
 
 labShape() {
@@ -60,14 +60,14 @@ readShape() {
     esac
 }
 
-# needTaps: stops where a program cannot carry frames.
+# needTaps: fails if a program cannot forward frames here.
 needTaps() {
     local why
     why=$( (enterLab perl "$labLib/delay.pl" --probe) 2>&1) ||
         fail "packets cannot be delayed here: ${why%.}; a delay needs a kernel with tun and a /dev/net/tun that this user may open, so leave --delay out"
 }
 
-# shapeLink: gives one link of the node its shape, from scratch.
+# shapeLink: shapes one link of the node, from scratch.
 shapeLink() {
     local port=n${node}e$link told=""
     clearShape "$port"
@@ -96,8 +96,8 @@ shapeLink() {
     echo "lab: eth$link of node-$node:$told"
 }
 
-# setRate: both ways. The bucket holds what passes in 10 ms, because the kernel's clock may tick no
-# more than 100 times a second.
+# setRate: both directions. The burst is 10 ms, because the kernel's clock may tick only 100 times a
+# second.
 setRate() {
     local burst=$((rate / 8 / 100)) bucket
     ((burst >= 16384)) || burst=16384
@@ -108,7 +108,8 @@ setRate() {
     fi
 }
 
-# setDelay PORT: takes the port from the switch, and puts two taps with a program between them.
+# setDelay PORT: disconnects the port from the switch, and inserts two TAP devices with a program in
+# between.
 setDelay() {
     local carrier=$lab/n$node/carrier$link
     rm -f "$carrier"
@@ -143,7 +144,7 @@ dropSome() {
 
 # clearShape PORT
 clearShape() {
-    # Without its tap the program ends.
+    # Without its TAP device the program exits.
     (enterLab ip link del "$1a") 2>/dev/null || true
     (enterLab ip link del "$1d") 2>/dev/null || true
     (enterLab ip link set "$1" master "sw$link")

@@ -1,28 +1,28 @@
 # SPDX-License-Identifier: Apache-2.0
 # shellcheck shell=bash
-# The folder of a lab and who owns it. In it:
+# The folder of a lab and its ownership. Contents:
 #   id way prefix count daemon      one line each, written by `lab up`
-#   keeper.pid keeper.log           the process that holds the lab together
-#   init.json                       bubblewrap's word on the first process inside (not with proot)
+#   keeper.pid keeper.log           the supervisor of the lab
+#   init.json                       bubblewrap's report on the first process inside (not with proot)
 #   nI/state                        starting, up, failed or stopped, and why
-#   nI/log nI/console nI/control    system log, output of the programs, fifo for orders
+#   nI/log nI/console nI/control    system log, output of the programs, FIFO for commands
 #   nI/link0 nI/link1               up, cut or dropping
-# An exclusive flock on the folder itself says that the lab lives: the keeper holds it.
+# The keeper holds an exclusive flock on the folder itself while the lab is up.
 
-# labFolder: where the lab of this user is.
+# labFolder: the path of this user's lab.
 labFolder() {
     local folder=${OVRADR_LAB_DIR:-/tmp/ovralab-$EUID}
     [[ $folder == /* ]] || folder=$PWD/$folder
     printf '%s' "$folder"
 }
 
-# checkFolder FOLDER: stops unless FOLDER is a folder of this user that nobody else may enter.
+# checkFolder FOLDER: fails unless FOLDER is a private folder of this user.
 checkFolder() {
     [[ -d $1 && ! -L $1 && -O $1 && $(stat -c %a "$1") == 700 ]] ||
         fail "$1 is not a private folder of this user: remove it, or set OVRADR_LAB_DIR to another place"
 }
 
-# needLab: sets lab, labWay, labPrefix, labCount and labId of the lab that is up, or stops.
+# needLab: sets lab, labWay, labPrefix, labCount and labId of the running lab, or fails.
 needLab() {
     lab=$(labFolder)
     [[ -d $lab ]] || fail "no lab is up; start one with: lab up N"
@@ -34,34 +34,34 @@ needLab() {
     labWay=$(<"$lab/way") labPrefix=$(<"$lab/prefix") labCount=$(<"$lab/count") labId=$(<"$lab/id")
 }
 
-# needNode NODE: sets node to its number; both 2 and node-2 name the second.
+# needNode NODE: sets node to its number; both 2 and node-2 are accepted.
 needNode() {
     node=${1#node-}
     [[ $node =~ ^[1-9][0-9]?$ && $node -le $labCount ]] ||
         fail "there is no node \"$1\"; the nodes are 1 to $labCount"
 }
 
-# needLink LINK: sets link to 0 or 1; both 1 and eth1 name the second.
+# needLink LINK: sets link to 0 or 1; both 1 and eth1 are accepted.
 needLink() {
     link=${1#eth}
     [[ $link == [01] ]] || fail "there is no link \"$1\"; the links are 0 (eth0) and 1 (eth1)"
 }
 
-# nodeState FOLDER NODE: the state that the node wrote.
+# nodeState FOLDER NODE: the state written by the node.
 nodeState() {
     local state=starting
     [[ ! -s $1/n$2/state ]] || state=$(<"$1/n$2/state")
     printf '%s' "$state"
 }
 
-# bwrapPid FILE: the pid that bubblewrap wrote with --info-fd; false while it has not.
+# bwrapPid FILE: the pid that bubblewrap wrote with --info-fd; false if it has not yet.
 bwrapPid() { jq -er '."child-pid"' "$1" 2>/dev/null; }
 
-# stopNodes FOLDER COUNT: orders every node's daemon to end, and waits up to 5 seconds for that.
+# stopNodes FOLDER COUNT: tells every node's daemon to exit, and waits up to 5 seconds for that.
 stopNodes() {
     local i round waiting
     for ((i = 1; i <= $2; i++)); do
-        # Opened in both directions: a node that is gone must not hold this up.
+        # Opened read-write: a dead node must not block this.
         [[ ! -p $1/n$i/control ]] || echo stop 1<>"$1/n$i/control" || true
     done
     for ((round = 0; round < 50; round++)); do

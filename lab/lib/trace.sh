@@ -1,12 +1,12 @@
 # SPDX-License-Identifier: Apache-2.0
 # shellcheck shell=bash
-# Where a scene failed.
+# Locates the failing line of a scene.
 
 traceRoot=$(cd "$(dirname "${BASH_SOURCE[0]}")/../.." && pwd -P)
 traceScript=$(readlink -f "$0")
 
-# trace WHAT: the lines of the script that was started which led here, the innermost first and with
-# WHAT, as FILE:LINE from the checkout. The helpers that it sources are left out.
+# trace WHAT: the call stack in the started script, innermost first and with WHAT, as FILE:LINE
+# relative to the checkout. Sourced helpers are left out.
 trace() {
     local i what=$1
     for ((i = 1; i < ${#BASH_SOURCE[@]}; i++)); do

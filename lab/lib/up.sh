@@ -1,10 +1,10 @@
 # SPDX-License-Identifier: Apache-2.0
 # shellcheck shell=bash
-# lab up: makes the folder, starts the keeper, waits for the nodes.
+# lab up: creates the folder, starts the keeper, waits for the nodes.
 
-# More nodes than this are no use on one machine, and addresses end at 254.
+# More nodes are of no use on one machine, and addresses end at 254.
 maxNodes=32
-# How long a lab may take to come up; a node gives up by itself before.
+# How long a lab may take to come up; a node gives up earlier by itself.
 upSeconds=90
 
 labUp() {
@@ -29,8 +29,8 @@ labUp() {
     [[ $labWay != proot ]] || checkProot "$count" "$withDaemon"
     makeFolder "$count" "$withDaemon"
 
-    # Whatever ends this script early, SIGKILL included, the end of the keeper's standard input ends
-    # the lab.
+    # If this script ends early for any reason, SIGKILL included, the end of the keeper's standard
+    # input ends the lab.
     trap 'endEarly "interrupted"' INT TERM HUP
     exec {keeper}> >(exec setsid bash "$labLib/keeper.sh" "$lab" >"$lab/keeper.log" 2>&1)
     waitForNodes "$count" || endEarly "the lab did not come up"
@@ -41,7 +41,7 @@ labUp() {
     labStatus
 }
 
-# endEarly WHY: takes down a lab that is coming up, and stops.
+# endEarly WHY: takes down a lab that is coming up, and fails.
 endEarly() {
     trap '' INT TERM HUP
     exec {keeper}>&- 9<&-
@@ -58,8 +58,8 @@ checkPrograms() {
     done
 }
 
-# The limits of the proot way: a Unix socket's path has room for 107 bytes, and proot puts the node's
-# root folder before it; the ports are this machine's.
+# The limits of proot: a Unix socket's path is limited to 107 bytes, and proot prepends the node's
+# root folder; the ports are this machine's.
 checkProot() {
     local i port
     ((${#lab} <= 50)) ||
@@ -74,7 +74,7 @@ checkProot() {
     done
 }
 
-# clearFolder: stops when a lab is up, and clears away one whose keeper was killed.
+# clearFolder: fails if a lab is up, and removes one whose keeper was killed.
 clearFolder() {
     [[ -e $lab || -L $lab ]] || return 0
     checkFolder "$lab"
@@ -88,7 +88,7 @@ clearFolder() {
 makeFolder() {
     local i
     mkdir -m 700 "$lab" || fail "cannot make the folder $lab; set OVRADR_LAB_DIR to another place"
-    # Held open by the keeper for as long as the lab lives.
+    # The keeper holds it open while the lab is up.
     exec 9<"$lab"
     flock -n 9 || fail "another lab is coming up in $lab at this moment; try again"
     newId >"$lab/id"
@@ -104,7 +104,8 @@ makeFolder() {
     done
 }
 
-# waitForNodes COUNT: false, after the reason and the logs, when one fails or the time is over.
+# waitForNodes COUNT: prints the reason and the logs and returns false if one fails or the time is
+# up.
 waitForNodes() {
     local i up state deadline=$((SECONDS + upSeconds))
     while :; do
@@ -130,7 +131,7 @@ waitForNodes() {
     done
 }
 
-# showNode NODE STATE: what a failed node said, the last lines of it.
+# showNode NODE STATE: the last lines of a failed node's output.
 showNode() {
     {
         echo "lab: node-$1 $2"

@@ -1,15 +1,15 @@
 # SPDX-License-Identifier: Apache-2.0
 # shellcheck shell=bash
-# The file view of a node: /usr/ovra, /tmp/.ovradrcache, /run/lock and /dev/log are its own, all the
-# rest is this machine's. Nothing is made on this machine: /usr, /tmp, /run and /dev become empty
-# folders of the view, into which what the machine has there is put back. Some entries of /tmp and
-# /run go away at any moment, so those are put back as symbolic links into /run/host, except the
-# ones on the way to a path that must stay itself (the checkout, the working folder).
+# The file view of a node: /usr/ovra, /tmp/.ovradrcache, /run/lock and /dev/log are private,
+# everything else is this machine's. Nothing is created on this machine: /usr, /tmp, /run and /dev
+# become empty folders of the view, into which the machine's entries are mapped. Entries of /tmp and
+# /run may disappear at any time, so those are mapped as symbolic links into /run/host, except for
+# the parents of a path that must stay unchanged (the checkout, the working folder).
 
-# A folder that says that this is such a view: the test programs look for it before they touch a fixed
-# path.
+# A folder that marks such a view: the test programs check for it before they touch a fixed path.
 viewMark=/run/host/ovradr-sandbox
-# At most so many entries of /tmp and of /run are put back; bubblewrap takes 9,000 arguments in all.
+# The maximum number of entries mapped from /tmp and from /run; bubblewrap takes 9,000 arguments in
+# all.
 viewLinkLimit=1000
 
 # leadsTo ENTRY PATH...: whether ENTRY is one of the paths or a folder above one.
@@ -22,7 +22,7 @@ leadsTo() {
     return 1
 }
 
-# isFixed ENTRY: whether it is a path that is the view's own in any case.
+# isFixed ENTRY: whether the path is always private to the view.
 isFixed() {
     case $1 in
     /usr/ovra | /tmp/.ovradrcache | /run/lock | /run/host | /dev/log) return 0 ;;
@@ -30,7 +30,8 @@ isFixed() {
     return 1
 }
 
-# isOwn ENTRY: whether the view has its own instead of the machine's. Other labs are left out too.
+# isOwn ENTRY: whether the view has a private one instead of the machine's. Other labs are left out
+# too.
 isOwn() {
     case $1 in
     /tmp/ovralab-* | /tmp/ovl.*) return 0 ;;
@@ -48,7 +49,7 @@ entriesOf() {
     entries=("${entries[@]:0:viewLinkLimit}")
 }
 
-# bwrapView PATH...: sets viewArgs to the view as bubblewrap's arguments; the PATHs stay themselves.
+# bwrapView PATH...: sets viewArgs to bubblewrap's arguments for the view; the PATHs stay unchanged.
 bwrapView() {
     local entry folder
     viewArgs=(--bind / / --dev /dev --bind-try /dev/shm /dev/shm --dev-bind-try /dev/net /dev/net
@@ -78,8 +79,8 @@ bwrapView() {
 }
 
 # prootView FOLDER PATH...: makes FOLDER the root folder of a view and sets viewArgs to proot's
-# arguments for it. Every place where something of the machine is shown exists in FOLDER beforehand:
-# proot would make up a place without permissions otherwise.
+# arguments for it. Every mount point exists in FOLDER beforehand: otherwise proot would make up one
+# without permissions.
 prootView() {
     local root=$1 entry folder name
     local -A links=()
@@ -128,7 +129,7 @@ prootView() {
     chmod 1777 "$root/tmp" "$root/run/lock"
 }
 
-# placeEntry ENTRY: part of prootView; shows the machine's ENTRY at its own place.
+# placeEntry ENTRY: part of prootView; maps the machine's ENTRY to the same path.
 placeEntry() {
     if [[ -L $1 ]]; then
         links[$1]=$(readlink "$1")

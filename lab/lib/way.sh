@@ -1,12 +1,13 @@
 # SPDX-License-Identifier: Apache-2.0
 # shellcheck shell=bash
-# Which of the three ways this machine allows. Sets labWay (root, user or proot) and labWhy.
+# Picks one of the three ways that this machine allows. Sets labWay (root, user or proot) and
+# labWhy.
 
-# Joining a user namespace as its root with every capability in it, so that links and firewall rules
-# can be made there as root makes them.
+# Joins a user namespace as its root with every capability in it, so that links and firewall rules
+# can be created there as by root.
 userNamespace=(--unshare-user --uid 0 --gid 0 --cap-add ALL)
 
-# wayTry WAY COMMAND...: whether COMMAND succeeds inside fresh namespaces made that way.
+# wayTry WAY COMMAND...: whether COMMAND succeeds inside fresh namespaces of that way.
 wayTry() {
     local flags=()
     [[ $1 == root ]] || flags=("${userNamespace[@]}")
@@ -15,13 +16,13 @@ wayTry() {
         --die-with-parent "${flags[@]}" -- "$@" </dev/null >/dev/null 2>&1
 }
 
-# prootWorks: whether this container lets a process trace another one, which is all that proot needs.
+# prootWorks: whether this container permits ptrace, which is all that proot needs.
 prootWorks() {
     perl "$labLib/old-syscalls.pl" proot -r / /bin/true </dev/null >/dev/null 2>&1
 }
 
-# pickWay [COMMAND...]: takes the best way in which COMMAND (true, when none is given) works.
-# OVRADR_LAB_WAY forces one. False, with the reason in labWhy, when there is none.
+# pickWay [COMMAND...]: picks the best way in which COMMAND (default: true) works. OVRADR_LAB_WAY
+# forces one. False, with the reason in labWhy, if there is none.
 pickWay() {
     (($#)) || set -- true
     labWay=${OVRADR_LAB_WAY-}
@@ -61,11 +62,11 @@ pickWay() {
     return 1
 }
 
-# pickLabWay: the best way in which a whole lab can be made. The check travels as text: the checkout
-# may be where the trial's namespaces have nothing.
+# pickLabWay: picks the best way for a whole lab. The check is passed as text, because the checkout
+# may not be visible in the trial's namespaces.
 pickLabWay() { pickWay bash -c "$(<"$labLib/can-switch.sh")"; }
 
-# wayText WAY: what that way gives, in words.
+# wayText WAY: a description of that way.
 wayText() {
     case $1 in
     root) printf 'root: network and mount namespaces, two links a node' ;;

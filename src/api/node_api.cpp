@@ -11,7 +11,7 @@ namespace OvraDRNode::WebAPI {
 namespace {
 
 constexpr int kVersion = 1;
-/// The second version of the session request names the node that the session is for.
+/// Version 2 of the session request names the node that the session is for.
 constexpr int kSessionCreateVersion = 2;
 
 constexpr const char *kAuthAccount = "account";
@@ -60,7 +60,7 @@ Request reverseRequest(const char *method, const std::string &credId, const Conn
     return request;
 }
 
-/// A request over `conn` that an account proves.
+/// A request for `conn`, authenticated by an account.
 Request accountRequest(const char *method, const Conn &conn, const std::string &account,
                        const std::string &password, const std::string &otpcode) {
     Request request = credRequest(method);
@@ -71,7 +71,7 @@ Request accountRequest(const char *method, const Conn &conn, const std::string &
     return request;
 }
 
-/// A request over `conn` that a session proves.
+/// A request for `conn`, authenticated by a session.
 Request sessionAuthRequest(const char *method, const Conn &conn, const std::string &session) {
     Request request = credRequest(method);
     request.addParam(Word::kSession, session);
@@ -81,7 +81,7 @@ Request sessionAuthRequest(const char *method, const Conn &conn, const std::stri
     return request;
 }
 
-/// A change of a credential: the endpoint's members stand among the parameters.
+/// A change of a credential: the endpoint's members are parameters themselves.
 Request setRequest(const char *method, const std::string &credId, const Conn &conn,
                    const std::string &account, const std::string &password,
                    const std::string &otpcode) {

@@ -48,7 +48,7 @@ bool NodeCache::GetUpdatedData(Json::Value &value) const {
     const OvraDRCore::Response response =
         sender.process(WebAPI::getDRNodeInfoAPI({Word::kTimeZone}));
     if (sender.GetErrCode() != OvraDRCore::ERR::kNone) {
-        // Out of reach: what it said last is still the best that is known.
+        // Unreachable: the last known facts are the best available.
         value = GetCachedData();
         return true;
     }

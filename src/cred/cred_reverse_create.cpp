@@ -19,7 +19,7 @@ using OvraDRCore::toLogString;
 
 namespace {
 
-/// The remote node probes, logs in and asks back within one call.
+/// The remote node probes, logs in and calls back within one call.
 constexpr unsigned int kTempSessionLifetime = 300; // seconds
 
 constexpr const char *kDirection = "unidirection";
@@ -129,8 +129,8 @@ bool CredReverseCreate::relayCreate(const Conn &conn, const std::string &session
     return response.isSuccess();
 }
 
-/// What check() and process() share: step(conn, session) asks the remote node, with a local session
-/// that lives as long as that takes.
+/// Shared by check() and process(): step(conn, session) calls the remote node, with a local session
+/// that exists for that time.
 template <typename Step>
 bool CredReverseCreate::withTempSession(const char *function, Step step) {
     SetErr(ERR::kNone);
@@ -157,7 +157,7 @@ bool CredReverseCreate::withTempSession(const char *function, Step step) {
     if (!session.empty()) {
         nodeSession.DeleteBySessionId(session);
     }
-    // What the step answered does not count, only whether an error was recorded on the way.
+    // The result of the step does not count, only whether an error was recorded.
     return GetErrCode() == ERR::kNone;
 }
 

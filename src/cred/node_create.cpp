@@ -27,7 +27,8 @@ std::string text(const Conn &conn) {
     return OvraDRCore::toString(conn.toJson());
 }
 
-/// The local node id names the local node's own record, so no credential may have it as its id.
+/// The local node id identifies the local node's own record, so no credential may have it as its
+/// id.
 std::string generateCredId() {
     std::string id = OvraDRCore::GenerateUUID();
     while (DRNode::isLocalNodeId(id)) {
@@ -158,7 +159,7 @@ bool CredCreate::checkParameter() const {
         OVRA_ERR("node [%s] is not initialized", OvraDRCore::toString(node.toJson()).c_str());
         return false;
     }
-    // A setCred() form that failed can leave the object without a sender.
+    // A failed setCred() can leave the object without a sender.
     if (sender == nullptr || !sender->isValid()) {
         SetErr(ERR::kCredCheckFailed);
         OVRA_ERR("sender [%s] is invalid", text(node.conn).c_str());
@@ -323,8 +324,8 @@ bool CredCreate::processKnownNode() {
     return createFor(__func__);
 }
 
-/// The creation once it is known whose node it is for.
-/// \param function  whose log lines these are
+/// The creation, once the node is known.
+/// \param function  the function name in the log lines
 bool CredCreate::createFor(const char *function) {
     if (!requestRemoteSession()) {
         SetErr(ERR::kCredIncomplete);

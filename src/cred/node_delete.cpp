@@ -25,8 +25,8 @@ bool deleteRow(const std::string &credId, const OvraDRCore::SqliteTableHandler &
     return true;
 }
 
-/// What the deletion of every kind of credential does; its lines are those of process().
-/// \param record  the credential, as far as there is one
+/// The deletion, common to all kinds of credentials; it logs as process().
+/// \param record  the credential, if there is one
 template <typename Flow>
 bool deleteAndRelease(const Flow &flow, const std::string &credId, const DRNode &record) {
     constexpr const char *kFunction = "process";
@@ -59,7 +59,7 @@ bool DRNodeCredDelete::process() {
     DRNode record;
     if (!DRNodeDB::GetCred(credId, record)) {
         OVRA_WARN("Failed to get cred[%s] from db", credId.c_str());
-        record = DRNode(); // nothing of a row that is not a valid one
+        record = DRNode(); // ignore an invalid row
     }
     if (!deleteAndRelease(*this, credId, record)) {
         return false;
@@ -92,7 +92,7 @@ bool TempCredDelete::process() {
     if (!deleteAndRelease(*this, credId, record)) {
         return false;
     }
-    // The other credentials reach the node as before, so what it said last stands.
+    // The other credentials still reach the node, so its cached facts stay.
     if (DRNodeDB::IsNodeIdExist(record.nodeId) <= 0) {
         NodeCache(record.nodeId, false).Remove();
     }

@@ -29,7 +29,7 @@ std::string text(const Conn &conn) {
 } // namespace
 
 DRNodeCredSet::DRNodeCredSet(const std::string &credId) {
-    (void)setCredId(credId); // its error is kept, and check() refuses an empty record
+    (void)setCredId(credId); // its error is kept, and check() rejects an empty record
 }
 
 DRNodeCredSet::~DRNodeCredSet() = default;
@@ -165,7 +165,7 @@ bool DRNodeCredSet::requestRemoteSession() {
 bool DRNodeCredSet::setCredRecord() {
     const Conn &newConn = sender.getConn();
     if (record.conn == newConn && newSession == record.session) {
-        // The line names the node under this word.
+        // The log line uses this name for the node.
         OVRA_INFO("No change of conn or session of credId[%s]", record.nodeId.c_str());
         return true;
     }
@@ -202,7 +202,7 @@ bool DRNodeCredSet::process() {
         if (IsSessionChanged()) {
             OVRA_ERR("Failed to set credId[%s], notify remote to delete new session",
                      record.credId.c_str());
-            // The change has failed in any case; what became of the session is in the log.
+            // The change has failed in any case; the outcome for the session is in the log.
             (void)CredUtils::NotifyRemoteNodeDeleteSessionIfNotUsed(conn, newSession);
         }
         return false;
@@ -211,7 +211,7 @@ bool DRNodeCredSet::process() {
         !CredUtils::NotifyRemoteNodeDeleteSessionIfNotUsed(conn, record.session)) {
         OVRA_WARN("Failed to notify remote [%s] to delete not used session", text(conn).c_str());
     }
-    // What was known of the node and of the right came over the old endpoint and session.
+    // Cached facts about the node and the right came over the old endpoint and session.
     CredPermissionCache(record.credId).Update();
     NodeCache(record.nodeId, true).Update();
     SetErr(ERR::kNone);

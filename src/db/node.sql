@@ -1,10 +1,11 @@
 -- SPDX-License-Identifier: Apache-2.0
 --
 -- The node database, /usr/ovra/etc/ovradr/node.db (mode 0600), schema version 1. `ovradr setup`
--- applies this file to an empty database in one transaction; no other program makes a table there.
+-- applies this file to an empty database in one transaction; no other program creates a table
+-- there.
 --
--- The credential tables keep their rowid: rows of one node come out in the order in which they were
--- stored, and the first one is the one that is used first.
+-- The credential tables keep their rowid: rows of one node are returned in insertion order, and the
+-- first one is used first.
 
 CREATE TABLE ovradrcore_db_info (
     id INTEGER PRIMARY KEY CHECK (id = 1),
@@ -22,7 +23,7 @@ CREATE TABLE node_cred (
     session TEXT NOT NULL
 );
 CREATE INDEX node_cred_by_node ON node_cred (node_id);
--- Before a session is released, the credentials that still use it are counted.
+-- For counting the credentials that still use a session before its release.
 CREATE INDEX node_cred_by_session ON node_cred (session);
 
 -- The same for short-lived use.
@@ -37,7 +38,7 @@ CREATE TABLE temp_cred (
 CREATE INDEX temp_cred_by_node ON temp_cred (node_id);
 
 -- Two writers of one new attribute may both find none and insert: the later value stays, and neither
--- of them fails.
+-- fails.
 CREATE TABLE node_attr (
     node_id TEXT NOT NULL,
     app TEXT NOT NULL,

@@ -31,7 +31,7 @@ bool ListRecords(const SqliteTableHandler &table, const std::string &nodeId,
     return true;
 }
 
-/// A table that cannot be read yields fewer records, not a failure: one half of the credentials is
+/// A table that cannot be read yields fewer records, not a failure: half of the credentials is
 /// better than none.
 void listNodes(const std::string &nodeId, std::vector<DRNode> &nodes, DRNodeDB::CredType type) {
     std::vector<SqliteValueList> rows;
@@ -49,7 +49,7 @@ void listNodes(const std::string &nodeId, std::vector<DRNode> &nodes, DRNodeDB::
     }
 }
 
-/// Reads one row, be the record valid or not.
+/// Reads one row, whether or not the record is valid.
 bool readCred(const SqliteTableHandler &table, const std::string &credId, DRNode &node) {
     SelectCommand command;
     command.SelectAll();

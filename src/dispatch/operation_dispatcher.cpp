@@ -61,8 +61,8 @@ bool NodeOperationDispatcher::RemoteRun() {
     return credId.empty() ? RunNodeSender() : RunCredNodeSender(credId);
 }
 
-/// The sender's code goes before the remote's: who runs an operation compares it with the codes of
-/// this library.
+/// The sender's code takes precedence over the remote's: callers compare it with the codes of this
+/// library.
 bool NodeOperationDispatcher::runOver(BaseSender &sender) {
     const Response response = sender.process(GetRequest());
     if (response.isSuccess()) {

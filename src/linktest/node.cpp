@@ -30,7 +30,7 @@ struct ClosePipe {
 };
 using Pipe = std::unique_ptr<std::FILE, ClosePipe>;
 
-/// The first line, as it stands: a newline that the script prints is part of the value.
+/// The first line, unchanged: a newline that the script prints is part of the value.
 std::string readFirstLine(std::FILE *stream) {
     char *line = nullptr;
     std::size_t size = 0;
@@ -91,7 +91,7 @@ std::string Node::TestSyncSpeed(const std::string &nodeId, int retries, int time
     DRNode node;
     if (!DRNodeDB::Get(nodeId, node)) {
         OVRA_ERR("Node [%s] not exists.", nodeId.c_str());
-        return {}; // the file is swept with other old ones
+        return {}; // the file is removed later, with other old ones
     }
     Response response;
     for (const Conn &conn : Conn::listLocal()) {

@@ -13,7 +13,7 @@ using OvraDRCore::SqliteValueList;
 
 namespace {
 
-/// The port of an HTTPS server; a relay endpoint carries it because a record has to have one.
+/// The HTTPS port; a placeholder in relay endpoints, because a record must have a port.
 constexpr int kFarlinkPort = 443;
 
 } // namespace

@@ -105,7 +105,7 @@ Conn Conn::translateFarlink(const Conn &conn) {
     }
     Json::Value info;
     OVRA::CredRequestFarlink::GetConnInfo(conn.addr, info, nullptr);
-    const Json::Value &found = info; // looking for a member adds it where that is allowed
+    const Json::Value &found = info; // a non-const operator[] would add a missing member
     const bool wellFormed = found.isObject() && found["host"].isString() &&
                             found["protocol"].isString() && found["port"].isInt();
     if (!wellFormed) {

@@ -81,8 +81,8 @@ bool DRNode::fromJson(const Json::Value &value) {
             nodeId = value[Word::kNodeId].asString();
         }
     }
-    // A peer's word on the endpoint is looked at, so that a malformed one shows in the log, and
-    // never taken: this node keeps the way by which it reaches the peer.
+    // The endpoint that a peer reports is only checked, so that a malformed one is logged, and
+    // never used: this node keeps the endpoint by which it reaches the peer.
     Conn::fromJson(value);
     return true;
 }

@@ -1,7 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #define OVRA_LOG_FILE "dr_node"
 
-// Who the local node is.
+// The identity of the local node.
 
 #include "ovradrnode/dr_node.h"
 #include "paths.h"
@@ -64,7 +64,7 @@ std::string generateNodeId() {
     return {};
 }
 
-/// Does not look into the file again: of two processes that both found none, the later one decides.
+/// Does not read the file again: of two processes that both found no id, the later one wins.
 std::string CreateNodeId() {
     FileLock lock(Path::kIdentityLock);
     std::string id = generateNodeId();

@@ -29,7 +29,7 @@ constexpr std::size_t kFieldSize = 1024;
 constexpr std::size_t kSessionIdSize = 100;
 constexpr int kNoTimeout = -1;
 
-/// What a test of a removal walk answers.
+/// The results of a test function for OvraCgiRemoveSessionByFunc().
 constexpr int kRemove = 0;
 constexpr int kKeep = 1;
 
@@ -53,7 +53,7 @@ struct PutRecord {
 };
 using Record = std::unique_ptr<json_object, PutRecord>;
 
-/// \return false when the field cannot be read.
+/// \return false if the field cannot be read.
 bool readField(json_object *record, int field, std::string &value) {
     std::array<char, kFieldSize> buffer{};
     if (OvraCgiJsonRecordGet(record, field, buffer.data(), buffer.size()) == 0) {
@@ -69,7 +69,7 @@ std::string nodeIdOf(json_object *record) {
     return readField(record, OVRA_CGI_FIELD_EXTRA, extra) ? NodeSession::NodeIdOf(extra) : "";
 }
 
-/// Removes every session of ours, whoever's it is.
+/// Removes every session of ours, of any user.
 int isOtherApplication(json_object *record, void * /*argument*/) {
     std::string app;
     const bool ours =
@@ -77,7 +77,7 @@ int isOtherApplication(json_object *record, void * /*argument*/) {
     return ours ? kRemove : kKeep;
 }
 
-/// Removes every session of ours of one user; `argument` is his name.
+/// Removes every session of ours of one user; `argument` is the user name.
 int RemoveSessionByUser(json_object *record, void *argument) {
     const auto *user = static_cast<const std::string *>(argument);
     if (user == nullptr || user->empty()) {
@@ -100,7 +100,7 @@ struct SessionSearch {
     std::string sessionId; ///< found
 };
 
-/// Looks for the session of a node and user. It keeps every record: the walk serves as a search.
+/// Finds the session of a node and user. It keeps every record: the iteration serves as a search.
 int GetSessionIDByNodeUser(json_object *record, void *argument) {
     auto *search = static_cast<SessionSearch *>(argument);
     if (search == nullptr) {
@@ -149,7 +149,7 @@ bool isUserExist(const std::string &userName) {
     return !userName.empty() && BaseSender::run(WebAPI::OvraCoreUserGetAPI(userName)).isSuccess();
 }
 
-/// A login that no web client asked for shows this appliance as its client.
+/// A login without a web client has this appliance as its client.
 void SetRemoteIP() {
     std::array<char, kFieldSize> client{};
     if (OvraCgiGetRemoteIP(client.data(), client.size()) != -1) {
@@ -175,7 +175,7 @@ std::string hiddenUi() {
     return OvraDRCore::toString(ui);
 }
 
-/// Options without which there is no session.
+/// Mandatory options.
 bool setLoginOptions(OvraCgi *handle, int timeout) {
     constexpr int kOn = 1;
     return OvraCgiSetOption(handle, OVRA_CGI_OPT_SKIP_PASSWORD, &kOn) != 0 &&
@@ -286,7 +286,7 @@ std::string NodeSession::CreateTempSession(const std::string &userName, unsigned
         return {};
     }
     SetRemoteIP();
-    SetErr(ERR::kNone); // a login that fails shows as an empty id alone
+    SetErr(ERR::kNone); // a failed login shows only as an empty id
     return CgiLogin(userName, static_cast<int>(timeout), "");
 }
 
@@ -352,7 +352,7 @@ void NodeSession::DeleteAllNodeSession() {
     CgiHandle handle;
     const bool removed = OvraCgiRemoveSessionByFunc(handle.get(), isOtherApplication, nullptr) == 0;
     if (!removed) {
-        // The line keeps the name under which it is known.
+        // The log line keeps its original function name.
         OVRA_LOG_IN(OvraDRCore::LogLevel::kErr, "RemoveSessionByUser",
                     "Failed to remove all node session");
     }

@@ -9,7 +9,7 @@
 
 namespace OvraDRNode {
 
-/// The verdict whether an endpoint answers: a JSON bool that lives 5 seconds.
+/// The verdict whether an endpoint answers: a JSON bool with a lifetime of 5 seconds.
 class ConnCache : public OvraDRCore::Cache {
 public:
     ~ConnCache() override;
@@ -17,29 +17,29 @@ public:
     /// Probes.
     bool GetUpdatedData(Json::Value &value) const override;
     bool IsValid(const Json::Value &value) const override;
-    /// The stored verdict: nobody waits for the probe of an endpoint that was dead already.
+    /// The stored verdict: nobody waits for the probe of an endpoint that was already dead.
     bool IsUpdatedDataRequired() const override;
 
     explicit ConnCache(const Conn &conn);
 
-    /// The stored verdict, however old; true when there is none.
+    /// The stored verdict, however old; true if there is none.
     bool getStoredVerdict() const;
-    /// Logs, as a line of `function`, a verdict that differs from the one before.
+    /// Logs a changed verdict under the name `function`.
     void logChange(const char *function, bool oldVerdict, bool newVerdict) const;
 
 private:
     Conn conn;
 };
 
-/// What a probe found out.
+/// The result of a probe.
 struct ProbeResult {
     bool connectable = false;
-    /// False: the probe could not even be set up, which says nothing about the endpoint.
+    /// False: the probe could not be set up, which says nothing about the endpoint.
     bool ran = true;
 };
 
-/// Asks the web-API entry point of the endpoint for any answer; carries no secret; 10 seconds at
-/// most.
+/// Probes the web-API entry point of the endpoint for any answer; sends no secret; waits 10 seconds
+/// at most.
 ProbeResult IsConnectableWithErrCheck(const Conn &conn);
 
 } // namespace OvraDRNode

@@ -72,9 +72,9 @@ bool mayHaveRight(const NodeCandidate &candidate) {
            !isDenied(candidate.privilege);
 }
 
-/// The credential that a sender takes before it goes through the list; "" when there is none. One
-/// that is remembered for too long counts only if it may still have the right, as the sender tests
-/// that first; when it has not, the sender looks for the first of the lasting ones that has.
+/// The credential that a sender tries before it goes through the list; "" if there is none. A stale
+/// remembered one counts only if it may still have the right, which the sender tests first; if it
+/// has not, the sender picks the first lasting one that has.
 std::string firstCredId(const NodeValidCredCache &cache,
                         const std::vector<NodeCandidate> &candidates) {
     const double age = cache.GetCachedAge();

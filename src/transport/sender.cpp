@@ -32,7 +32,7 @@ OvraDRCore::ErrRecorder errorOf(const OvraDRCore::ErrRecorder &sender, const Res
     if (!answer.isValid() && sender.GetErrCode() != OvraDRCore::ERR::kNone) {
         error.SetErr(&sender);
     } else {
-        error.SetErr(answer.getErrCode(), answer.getErrMsg()); // 407 for one that is not valid
+        error.SetErr(answer.getErrCode(), answer.getErrMsg()); // 407 for an invalid one
     }
     return error;
 }

@@ -21,7 +21,7 @@ using OvraDRCore::Response;
 
 namespace {
 
-/// Error numbers of the credential library that have a code of their own.
+/// Error numbers of the credential library that have their own code.
 constexpr int kLibraryNoPermission = 4;
 constexpr int kLibraryCannotConnect = 5;
 constexpr int kLibraryCertificate = 6;
@@ -32,7 +32,7 @@ constexpr int kSend = 0;
 
 /// The remote's answer to a request for which the session has no right.
 constexpr int kRemoteNoPermission = 105;
-/// Remote log-in codes 400 to 404 are 501 to 505 here.
+/// Remote log-in codes 400 to 404 become 501 to 505.
 constexpr int kFirstLoginCode = 400;
 constexpr int kLastLoginCode = 404;
 
@@ -50,7 +50,7 @@ int loginError(int remoteCode) {
 BaseCredSender::BaseCredSender() = default;
 
 BaseCredSender::BaseCredSender(const Conn &conn_) {
-    (void)setConn(conn_); // isValid() tells
+    (void)setConn(conn_); // see isValid()
 }
 
 BaseCredSender::~BaseCredSender() {
@@ -154,7 +154,7 @@ void BaseCredSender::SetCredRequestError(OVRA::CredRequest &request) const {
     }
 }
 
-/// What the log lines of one call show, rendered once, at the first line that needs it.
+/// The texts in the log lines of one call, rendered lazily and once.
 class BaseCredSender::CallTexts {
 public:
     CallTexts(const Request &request, const Conn &conn)
@@ -181,7 +181,7 @@ private:
     std::string connText_;
 };
 
-/// The sending itself, once nothing speaks against it; its lines are those of process().
+/// Sends the request after all checks; logs as process().
 Response BaseCredSender::send(const Request &request, CallTexts &texts,
                               const char *function) const {
     Response response;
@@ -203,7 +203,7 @@ Response BaseCredSender::send(const Request &request, CallTexts &texts,
     if (!request.getUploadPath().empty() && !request.getUploadName().empty()) {
         credRequest.SetUploadFile(request.getUploadPath(), request.getUploadName());
     }
-    const OvraDRCore::ReplyHandOver replyHandOver; // the credential library has read the reply
+    const OvraDRCore::ReplyHandOver replyHandOver; // the credential library parses the reply first
     if (credRequest.Process(true, kSend) == 0) {
         SetCredRequestError(credRequest);
         OVRA_LOG_IN(LogLevel::kNotice, function, "Failed to process cred request [%s]",

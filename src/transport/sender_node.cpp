@@ -1,7 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #define OVRA_LOG_FILE "sender"
 
-// Senders to a node: which credential is used, and what is learnt from the answer.
+// Senders to a node: which credential is used, and what is recorded from the answer.
 
 #include "ovradrnode/cred_permission_cache.h"
 #include "ovradrnode/node_db.h"
@@ -29,7 +29,8 @@ bool isNoPermission(const Response &response) {
            response.getErrCode() == kRemoteNoPermission;
 }
 
-/// The remote answered the request itself, well or badly; another credential would get the same.
+/// The remote answered the request itself, with success or an error; another credential would get
+/// the same answer.
 bool hasGotThrough(const Response &response) {
     return response.isValid() && !isNoPermission(response);
 }
@@ -41,7 +42,7 @@ bool isLocal(const DRNode &node) {
 } // namespace
 
 NodeSender::NodeSender(const std::string &nodeId_) {
-    (void)setNode(nodeId_); // isValid() tells
+    (void)setNode(nodeId_); // see isValid()
 }
 
 NodeSender::~NodeSender() = default;
@@ -83,7 +84,7 @@ Response NodeSender::process(const Request &request) {
     }
     for (const DRNode &node : nodes) {
         if (node.credId == remembered) {
-            continue; // tried already; its error stays unless another attempt follows
+            continue; // already tried; its error stays unless another attempt follows
         }
         SetErr(ERR::kNone);
         if (processByCred(node, request, response)) {
@@ -173,11 +174,11 @@ bool NodeSender::isConnectable() const {
 }
 
 CredNodeSender::CredNodeSender(const DRNode &node_) {
-    (void)setCred(node_); // isValid() tells, and the code says why
+    (void)setCred(node_); // see isValid() and the error code
 }
 
 CredNodeSender::CredNodeSender(const std::string &credId) {
-    (void)setCred(credId); // isValid() tells, and the code says why
+    (void)setCred(credId); // see isValid() and the error code
 }
 
 CredNodeSender::~CredNodeSender() = default;
@@ -239,7 +240,7 @@ bool CredNodeSender::testPrivilege() {
         return false;
     }
     if (isLocal(node)) {
-        return true; // nothing was tested: the code stays
+        return true; // nothing was tested: the error code stays
     }
     if (!BaseSender::GetCachedConnectable(node.conn)) {
         SetErr(ERR::kNotConnectable);

@@ -1,14 +1,14 @@
 #!/bin/bash
 # SPDX-License-Identifier: Apache-2.0
-# options_test.sh PROGRAM PAGE: the page names every option of the program, and no other. OVRA_PAGES names
-# another folder than the source tree.
+# options_test.sh PROGRAM PAGE: the page names exactly the options of the program. OVRA_PAGES overrides
+# the source tree.
 set -euo pipefail
 program=$1 page=$2
 options() { grep -oE -- '--[a-z][a-z-]*' | sort -u; }
 
 cd "${OVRA_PAGES:-$(dirname "$0")/../..}"
 has=$("$program" --help | options)
-# In code, but not where another program is called.
+# In code, but not in calls of other programs.
 # shellcheck disable=SC2016
 named=$(grep -oE '`[^`]*`|^    .*' "$page" | grep -vE '^`ovradr ' | options)
 [[ -n $has && $has == "$named" ]] || {

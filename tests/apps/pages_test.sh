@@ -1,14 +1,14 @@
 #!/bin/bash
 # SPDX-License-Identifier: Apache-2.0
-# pages_test.sh OVRADRD_TEST OVRADR_TEST FARLINKD: the tests that hold the pages to the programs fail when
-# one fact is taken out of a page, and name it.
+# pages_test.sh OVRADRD_TEST OVRADR_TEST FARLINKD: the tests that compare the pages with the programs fail
+# if one fact is removed from a page, and name it.
 set -euo pipefail
 # shellcheck source=tests/lab/expect.sh
 . "$(dirname "$0")/../lab/expect.sh"
 trap 'rm -rf "$scratch"' EXIT
 ovradrdTest=$1 ovradrTest=$2 farlinkd=$3
 
-# fails TEXT PAGE SED COMMAND...: with the change in the page the command fails and says TEXT.
+# fails TEXT PAGE SED COMMAND...: with the change in the page the command fails and prints TEXT.
 fails() {
     local text=$1 page=$2 change=$3
     shift 3

@@ -19,7 +19,7 @@ UniqueFd openLock() {
     return UniqueFd(open(kPath, O_RDWR | O_CREAT | O_CLOEXEC, 0600));
 }
 
-/// A child that holds whatever this process has open, until it is gone.
+/// A child that keeps this process's open files until it exits.
 class ForkedChild {
 public:
     ForkedChild()

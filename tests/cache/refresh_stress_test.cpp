@@ -1,8 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
-// Many processes refresh everything that they share, over endpoints that live, are slow and are
-// dead, while others of them are killed. None may wait for another one that waits for it: a refresh
-// that somebody hinders is waited for up to 30 seconds, so whoever takes longer than kBound was
-// hindered.
+// Many processes refresh all shared entries, over live, slow and dead endpoints, while some of them
+// are killed. There must be no deadlock: a blocked refresh is waited for up to 30 seconds, so a
+// process that takes longer than kBound was blocked.
 #include "clock.h"
 #include "support/local_node.h"
 #include "support/log_capture.h"
@@ -35,7 +34,7 @@ namespace {
 using Millis = std::int64_t;
 
 constexpr int kWorkers = 16;
-/// The first of them are killed; two others that waited for each other would do so for long.
+/// The first of them are killed; two others in a deadlock would stay in it for long.
 constexpr int kMortals = 4;
 constexpr Millis kBound = 10'000;
 constexpr Millis kDefaultDuration = 8'000;
@@ -65,7 +64,7 @@ const std::array<std::function<void(const std::string &node, const Conn &conn)>,
     },
 };
 
-/// What the processes tell each other.
+/// Shared between the processes.
 struct Board {
     std::atomic<bool> stop{false};
     std::array<std::atomic<Millis>, kWorkers> busySince{}; ///< 0: between two operations
@@ -99,8 +98,7 @@ void keepLargest(std::atomic<Millis> &most, Millis value) {
     _exit(0);
 }
 
-/// Keeps the workers at work and kills one of the mortal ones every 20 ms; then waits until the
-/// rest is done.
+/// Keeps the workers running and kills one of the mortal ones every 20 ms; then waits for the rest.
 void playStorm(Board &board, Millis duration, const std::vector<Conn> &conns) {
     std::mt19937 random(1);
     std::array<pid_t, kWorkers> workers{};
@@ -151,7 +149,7 @@ TEST(RefreshStress, NoTwoProcessesWaitForEachOther) {
     provisionNode();
     DRNode::getLocalNodeId();
 
-    // Forked before the servers' threads are there; it begins when it is told their ports.
+    // Forked before the servers' threads exist; starts once it receives their ports.
     std::array<int, 3> ports{};
     const pid_t storm = fork();
     if (storm == 0) {

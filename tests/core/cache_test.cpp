@@ -75,7 +75,7 @@ std::string text(const Json::Value &value) {
     return toString(value);
 }
 
-/// Runs `body` in `count` processes at once. \return how many ended with 0.
+/// Runs `body` in `count` concurrent processes. \return how many exited with 0.
 int inProcesses(int count, const std::function<void(int)> &body) {
     for (int i = 0; i < count; ++i) {
         if (fork() == 0) {
@@ -255,14 +255,14 @@ TEST_F(CacheTest, DamageReadsAsAbsentAndIsMended) {
             std::fstream file(kPath, std::ios::in | std::ios::out | std::ios::binary);
             file.seekg(0, std::ios::end);
             const auto size = static_cast<std::size_t>(file.tellg());
-            if (round % 3 == 0) { // rubbish all over
+            if (round % 3 == 0) { // random data everywhere
                 std::string rubbish(size, '\0');
                 for (char &c : rubbish) {
                     c = static_cast<char>(random());
                 }
                 file.seekp(0);
                 file << rubbish;
-            } else { // some bits
+            } else { // some flipped bits
                 for (int i = 0; i < 20000; ++i) {
                     file.seekp(static_cast<std::streamoff>(random() % size));
                     file.put(static_cast<char>(random()));
@@ -284,7 +284,7 @@ TEST_F(CacheTest, AWriteCutShortLeavesTheOldValue) {
     TestCache cache("a");
     cache.UpdateWithData("one");
     cache.UpdateWithData("two");
-    // Spoil the copy that holds "two": that is what a write killed half way leaves behind.
+    // Corrupt the copy that holds "two", as a write killed halfway would.
     std::fstream file(kPath, std::ios::in | std::ios::out | std::ios::binary);
     std::string content((std::istreambuf_iterator<char>(file)), {});
     const std::size_t at = content.find("\"two\"");
@@ -454,7 +454,7 @@ TEST_F(CacheTest, ARefreshThatDiesIsTakenOver) {
 }
 
 TEST_F(CacheTest, ADamagedCopyWithARightChecksumStaysWithinItsBounds) {
-    // Sizes that point out of the copy, under a checksum that fits.
+    // Sizes that point outside the copy, with a valid checksum.
     BucketImage image(16, 3);
     ASSERT_TRUE(image.add({"name", "\"value\"", 1, 1, 1}));
     const std::string_view bytes = image.finish(1);

@@ -101,7 +101,7 @@ TEST(Response, AnythingElseIsInvalidWithANonZeroCode) {
 
 TEST(Response, AReplyThatWasReadAlreadyIsHandedOverToWhoeverHasItsTextAndWaits) {
     const std::string text = R"({"success":true,"data":{"a":1}})";
-    // Not what the text says, so that it shows where a reply came from.
+    // Differs from the text, to show where a reply came from.
     const auto give = [&text] { ReplyHandOver::give(text, Response(json(R"({"success":true})"))); };
     const auto wasHandedOver = [&text] {
         Response response;

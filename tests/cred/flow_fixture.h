@@ -12,7 +12,7 @@
 
 #include <string>
 
-/// A provisioned local node and a remote node "n1" that grants what it is asked for: log-in session
+/// A provisioned local node and a remote node "n1" that grants every request: log-in session
 /// "login-sid", node session "granted", temporary session "temp-granted", account "joe".
 class CredFlow : public testing::Test {
 protected:

@@ -34,7 +34,7 @@ protected:
                   });
         users.host();
     }
-    /// What the temporary session was good for while the remote had it.
+    /// What the temporary session permitted while the remote had it.
     void noteSession(const std::string &call) {
         Json::Value params;
         EXPECT_TRUE(OvraDRCore::fromString(params, remote.params(call)));

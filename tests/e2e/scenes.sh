@@ -1,6 +1,6 @@
 #!/usr/bin/env bash
 # SPDX-License-Identifier: Apache-2.0
-# scenes.sh SCENE: one scene with two appliances, played with the installed programs
+# scenes.sh SCENE: one scene with two appliances, run with the installed programs
 # (OVRADR_LAB_PREFIX). Node 1 pairs with node 2, whose administrator is "replica".
 set -euo pipefail
 here=$(dirname "$(readlink -f "${BASH_SOURCE[0]}")")
@@ -8,8 +8,8 @@ here=$(dirname "$(readlink -f "${BASH_SOURCE[0]}")")
 # shellcheck source=lab/lib/play.sh
 . "$here/../../lab/lib/play.sh"
 
-# remain NODE CREDENTIALS SESSIONS: how many credentials, temporary ones too, the node holds, and how
-# many sessions it granted.
+# remain NODE CREDENTIALS SESSIONS: how many credentials, including temporary ones, the node holds,
+# and how many sessions it granted.
 remain() {
     on "$1" 0 ovradr --json cred list --temp
     holds ".data.creds | length == $2"
@@ -26,7 +26,7 @@ pairAndTalk() {
     holds '[.. | objects | has("session")] | any | not'
     on 1 0 ovradr call local OVRA.DR.Node info
     holds ".node_id != \"$remote\""
-    # Over plain HTTP everything secret travels sealed.
+    # Over plain HTTP everything secret is sealed.
     on 1 0 ovradr conn test "http://$("$lab" addr 2):5000"
     key=$(fingerprint 2 http)
     url=http://$("$lab" addr 2):5000
@@ -76,7 +76,7 @@ deadEndpoint() {
     info 3
     on 1 7 ovradr call 00000000-dead OVRA.DR.Node info
     startDaemon
-    # The verdict lives five seconds.
+    # The verdict has a lifetime of five seconds.
     for _ in 1 2 3 4 5 6 7 8; do
         "$lab" run 1 -- ovradr call "$remote" OVRA.DR.Node info >/dev/null 2>&1 && return
         sleep 1
@@ -135,11 +135,11 @@ speedOfAShapedLink() {
     [[ $("$lab" addr 2) != 127.* ]] || exit 77 # proot gives nodes no links of their own
     url=https://$("$lab" addr 2 1):5001
     create 0
-    # Slow enough that a busy machine keeps up with it.
+    # Slow enough for a busy machine to keep up.
     "$lab" shape 1 --rate 20mbit --delay 20ms >/dev/null 2>&1 || "$lab" shape 1 --rate 20mbit >/dev/null
     on 1 0 ovradr --json speed "$remote" --timeout 4
     holds '.data.bits_per_second > 18000000 and .data.bits_per_second < 22000000'
-    # The first two of node 1's four endpoints cannot be reached any more, and the third can.
+    # The first two of node 1's four endpoints are unreachable now, the third is not.
     "$lab" drop 1 0 >/dev/null
     on 1 0 ovradr speed "$remote" --timeout 4 --retries 0
     says "https://$("$lab" addr 1 0):5001"
@@ -149,7 +149,7 @@ speedOfAShapedLink() {
     [[ $output == 0 ]] || fail "a test file is left"
 }
 
-# exampleFails CODE ARGUMENT...: the example says that code, and what it is about.
+# exampleFails CODE ARGUMENT...: the example prints that code and what it is about.
 exampleFails() {
     local code=$1
     shift
@@ -174,7 +174,7 @@ operationHereAndThere() {
     on 1 0 env OVRADR_CRED="$there" "$example" "$remote" "$answers"
     OVRADR_CRED=none exampleFails 519 "$remote" "$answers"
     exampleFails 507 stranger "$answers"
-    # Node 2 sends a request on to the node of its own credential.
+    # Node 2 forwards a request to the node of its own credential.
     on 1 0 ovradr user add back --admin --password-file /usr/ovra/pw
     on 2 0 ovradr --json cred create "https://$("$lab" addr 1):5001" --account back \
         --password-file /usr/ovra/pw \
@@ -187,7 +187,7 @@ operationHereAndThere() {
 }
 
 nodeDb=/usr/ovra/etc/ovradr/node.db
-# The credential that the last command made.
+# The credential that the last command created.
 made() { value .data.cred_id; }
 addAdministrators() {
     on 2 0 ovradr user add other --admin --password-file /usr/ovra/pw
@@ -206,7 +206,7 @@ sharedSessions() {
     account=other create 0 --json && cred[other]=$(made)
     remain 1 5 0
     remain 2 0 3
-    # Which is deleted, what becomes of its session, how many sessions are left.
+    # The deleted credential, the outcome for its session, the number of sessions left.
     while read -r which word left; do
         on 1 0 ovradr --json cred delete "${cred[$which]}"
         holds ".data.session == \"$word\""
@@ -232,11 +232,11 @@ failuresSeenFromBothSides() {
     says "granted no session"
     remain 1 1 1
     remain 2 1 1
-    # The endpoint is another node's: this very one.
+    # The endpoint belongs to another node: this one.
     on 1 1 ovradr cred set "$cred" --url "https://$("$lab" addr 1):5001" --account back \
         --password-file /usr/ovra/pw --fingerprint "$(fingerprint 1)"
     says "another node"
-    # An update that cannot be written gives the new session back, a creation leaves it.
+    # An update that cannot be written releases the new session, a creation leaves it.
     on 1 0 sqlite3 $nodeDb "CREATE TRIGGER up BEFORE UPDATE ON node_cred BEGIN SELECT RAISE(FAIL, 'full'); END;
         CREATE TRIGGER ins BEFORE INSERT ON node_cred BEGIN SELECT RAISE(FAIL, 'full'); END"
     on 1 9 ovradr cred set "$cred" --account other --password-file /usr/ovra/pw
@@ -250,7 +250,7 @@ failuresSeenFromBothSides() {
     on 2 0 ovradr session audit "$(value .data.node_id)" --revoke --yes
     says "1 session here"
     remain 2 1 1
-    # A session that was ended over there makes an orphan of its credential.
+    # A session ended on the other node makes its credential an orphan.
     on 1 0 ovradr session revoke --all --yes
     on 1 0 ovradr session audit "$remote" --revoke --yes
     says "1 credential over there"
@@ -273,7 +273,7 @@ leftBehind() {
     says "does not answer"
     startDaemon
     remain 2 0 1
-    # ovradrd looks every 20 seconds; only the pause after the first failure is cut short.
+    # ovradrd checks every 20 seconds; only the pause after the first failure is shortened.
     on 1 0 sqlite3 /usr/ovra/var/ovradr/releases.db "UPDATE release SET next_try = 0"
     for _ in $(seq 60); do
         on 1 0 ovradr --json session pending
@@ -284,7 +284,7 @@ leftBehind() {
     remain 2 0 0
 }
 
-# Node 2 is the relay, and node 3 an appliance that nobody can connect to.
+# Node 2 is the relay, and node 3 an appliance that accepts no inbound connections.
 startRelay() {
     "$lab" run 2 -- sh -c "farlinkd --address $("$lab" addr 2) $* >/usr/ovra/relay.out 2>&1 &
         echo \$! >/usr/ovra/relay.pid"
@@ -329,7 +329,7 @@ callsThroughTheRelay() {
     info 0
     holds '.hostname == "node-3"'
 
-    # A request that takes 20 seconds: it measures a server that says nothing.
+    # A request that takes 20 seconds: it measures a silent server.
     "$lab" run 1 -- perl -MIO::Socket::INET -e '
         my $door = IO::Socket::INET->new(Listen => 9, LocalAddr => $ARGV[0], LocalPort => 5998) or die;
         print "ready\n"; STDOUT->flush; my @kept; while (my $one = $door->accept) { push @kept, $one }' "$("$lab" addr 1)" </dev/null >"$work/silent" &
@@ -348,7 +348,7 @@ callsThroughTheRelay() {
     startRelay
     soon ovradr call "$remote" OVRA.DR.Node info
 
-    # An alias whose owner does not come back is free again.
+    # An alias whose owner does not return becomes free again.
     killRelay
     startRelay --lease 4
     soon ovradr conn test flk:nas-3

@@ -1,7 +1,8 @@
 #!/usr/bin/env bash
 # SPDX-License-Identifier: Apache-2.0
 # Usage: install_test.sh BUILD_DIR SOURCE_DIR
-# Installs into an empty prefix, moves it, and has a foreign project find, build and run against it.
+# Installs into an empty prefix, moves it, and lets an external project find, build and run against
+# it.
 set -euo pipefail
 build=$1
 source=$2
@@ -15,11 +16,11 @@ cmake -S "$source/examples" -B "$work/cmake" -G Ninja -DCMAKE_PREFIX_PATH="$work
 cmake --build "$work/cmake"
 pc=$(dirname "$(find "$work/moved" -name ovradrnode.pc)")
 read -ra flags < <(PKG_CONFIG_PATH=$pc pkg-config --cflags --libs ovradrnode)
-# The program in the README, as it stands there.
+# The unchanged program from the README.
 sed -n '/^```cpp$/,/^```$/{/^```/!p}' "$source/README.md" >"$work/readme.cpp"
 g++ -std=c++17 "$work/readme.cpp" "${flags[@]}" -o "$work/by_pkg_config"
 
-# A node that nothing is known about is a clear error, not a crash.
+# An unknown node is a clear error, not a crash.
 library=$(dirname "$(find "$work/moved" -name libovradrnode.so.1)")
 for program in "$work/cmake/node_info" "$work/by_pkg_config"; do
     if LD_LIBRARY_PATH=$library${LD_LIBRARY_PATH:+:$LD_LIBRARY_PATH} "$source/lab/sandbox" "$program" no-such-node 2>"$work/err"; then

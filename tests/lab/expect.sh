@@ -1,9 +1,9 @@
 # SPDX-License-Identifier: Apache-2.0
 # shellcheck shell=bash
 # shellcheck disable=SC2034 # set for the scenes
-# What the scenes of this folder share: a scratch folder and a few ways to say what must hold.
+# Shared by the scenes of this folder: a scratch folder and a few assertions.
 root=$(cd "$(dirname "${BASH_SOURCE[0]}")/../.." && pwd -P)
-# Under /tmp, and short, whatever TMPDIR says: the lab's proot way needs short paths.
+# Under /tmp, and short, regardless of TMPDIR: proot needs short paths.
 scratch=$(mktemp -d /tmp/ovt.XXXX)
 
 # shellcheck source=lab/lib/trace.sh
@@ -14,7 +14,7 @@ broken() {
     trace "FAILED: $*" >&2
     exit 1
 }
-# A command that nobody expected to fail. In a subshell it is a failure of the command around it, if one.
+# A command failed unexpectedly. In a subshell the enclosing command decides.
 set -E
 trap '((BASH_SUBSHELL)) || broken "exit code $? of: $BASH_COMMAND"' ERR
 

@@ -1,8 +1,8 @@
 #!/bin/bash
 # SPDX-License-Identifier: Apache-2.0
-# lab_test.sh SCENE WAY [PROGRAM]: one scene of the lab or the sandbox, made in that way, PROGRAM being
-# the test program of the node database. Exit code 77 where the machine does not allow the way, or the
-# way has not what the scene is about.
+# lab_test.sh SCENE WAY [PROGRAM]: one scene of the lab or the sandbox in that way; PROGRAM is the test
+# program of the node database. Exit code 77 if the machine does not allow the way, or the way lacks
+# the tested feature.
 set -euo pipefail
 # shellcheck source=tests/lab/expect.sh
 . "$(dirname "$0")/expect.sh"
@@ -12,7 +12,7 @@ set -euo pipefail
 . "$root/lab/lib/view.sh"
 scene=$1 way=$2 testProgram=${3-}
 export OVRADR_LAB_WAY=$way OVRADR_LAB_DIR=$scratch/lab
-# A word by which processes of this scene are known from outside.
+# A word that identifies processes of this scene from outside.
 mark=31${RANDOM}${BASHPID}
 echo "$mark" >"$scratch/mark"
 
@@ -27,7 +27,7 @@ trap finish EXIT
 lab() { "$root/lab/lab" "$@"; }
 sandbox() { "$root/lab/sandbox" "$@"; }
 nothingRuns() { ! grep -sqzF -f "$scratch/mark" /proc/[0-9]*/cmdline; }
-# Of this scene only: other tests have sandboxes of their own at the same time.
+# Of this scene only: other tests have their own sandboxes at the same time.
 noFolderIsLeft() { ! compgen -G "/tmp/ovl.*/root/usr/ovra/$mark" >/dev/null; }
 requireLinks() { [[ $way != proot ]] || skip "nodes made by proot have no links of their own"; }
 skip() {
@@ -61,13 +61,13 @@ sandboxKeepsThePathsPrivate() {
     absent /dev/log.moved
 }
 
-# What the machine's own node has to lose, played in a sandbox: if it went wrong, nobody would be hurt.
+# The machine's own node, simulated in a sandbox, so that a failure harms nobody.
 testProgramsRunInASandboxOnly() {
     local outside case=--gtest_filter=NodeDb.CountsTheCredentialsOfANode
     exitCodeOf sandbox "$testProgram" "$case"
     holds "the case runs inside" "$output" "[  PASSED  ] 1 test"
     same "exit code inside" "$code" 0
-    # Both the variable and the view are asked for; either may be there by itself.
+    # Both the variable and the view are required; either may exist without the other.
     for outside in 'unset OVRADR_SANDBOX' "rmdir $viewMark"; do
         # shellcheck disable=SC2016 # expanded in the sandbox
         exitCodeOf sandbox bash -c "$outside"'
@@ -83,7 +83,7 @@ testProgramsRunInASandboxOnly() {
     done
     exitCodeOf "$testProgram" --gtest_list_tests
     same "exit code of the list outside" "$code" 0
-    # Outside, and no case is selected: there is nothing to do, and yet it is refused.
+    # Outside, with no case selected: there is nothing to do, and still it refuses.
     exitCodeOf env OVRADR_SANDBOX=yes "$testProgram" --gtest_filter=-*
     same "exit code outside" "$code" 2
     holds "how to run it" "$output" "$root/lab/sandbox $testProgram --gtest_filter=-*"
@@ -111,7 +111,7 @@ sandboxPassesFolderInputAndEnvironment() {
 sandboxLeavesNothingAfterASignal() {
     local signal
     for signal in TERM INT HUP KILL; do
-        # A shell starts its background jobs with SIGINT ignored, nohup with SIGHUP; this one must hear them.
+        # A shell starts background jobs with SIGINT ignored, nohup with SIGHUP; this one must receive them.
         perl -e '$SIG{INT} = $SIG{HUP} = "DEFAULT"; exec @ARGV' \
             "$root/lab/sandbox" bash -c "touch '/usr/ovra/$mark' '$scratch/runs'; env -i sleep $mark & sleep $mark" &
         eventually "the command runs" test -e "$scratch/runs"
@@ -209,7 +209,7 @@ lostPackets() {
     tail -n 1 "$scratch/lost"
 }
 
-# A busy machine loses some by itself.
+# A busy machine loses some anyway.
 few() { (($1 < 20)) || broken "of 1000 datagrams $1 were lost $2"; }
 
 linksAreShaped() {

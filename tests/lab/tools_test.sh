@@ -1,6 +1,6 @@
 #!/bin/bash
 # SPDX-License-Identifier: Apache-2.0
-# tools_test.sh SCENE: the repository's own checks find what they are there for.
+# tools_test.sh SCENE: the repository's own checks find the faults that they look for.
 set -euo pipefail
 # shellcheck source=tests/lab/expect.sh
 . "$(dirname "$0")/expect.sh"
@@ -49,7 +49,7 @@ layersRefuseWhatIsAbovePrivateOrASibling() {
 	END
 }
 
-# A checkout of its own: three libraries, each with a header of one class and one function.
+# A minimal checkout: three libraries, each with a header of one class and one function.
 makeLibraries() {
     local part name space folder
     mkdir -p "$scratch/tools"
@@ -113,7 +113,7 @@ exportsMissNothingThatIsDeclared() {
     [[ $output != *'g()'* ]] || broken "a function that needs no library: $output"
 }
 
-# checkFacts TEXT FILE SED: with the change, check-facts fails and says TEXT.
+# checkFacts TEXT FILE SED: with the change, check-facts fails and prints TEXT.
 checkFacts() {
     local text=$1 file=$scratch/$2 change=$3
     cp "$file" "$scratch/before"
@@ -125,7 +125,7 @@ checkFacts() {
     cp "$scratch/before" "$file"
 }
 
-# One fact after the other is taken out of a copy of the checkout.
+# Removes one fact after another from a copy of the checkout.
 factsAreMissedWhereTheyAreForgotten() {
     "$root/tools/sources" all | tar -C "$root" --null -T - -c | tar -C "$scratch" -x
     exitCodeOf "$root/tools/check-facts" "$scratch"

@@ -43,7 +43,7 @@ inline std::string labWay() {
     return way != nullptr ? way : "";
 }
 
-/// A scene with a folder of its own. The fixed paths of the appliance may be used too.
+/// A fixture with its own folder. The fixed paths of the appliance may be used too.
 class OwnFiles : public testing::Test {
 protected:
     void SetUp() override {
@@ -66,7 +66,7 @@ private:
     std::string folder_;
 };
 
-/// Runs `work` in a process of its own. It must not use gtest assertions.
+/// Runs `work` in its own process. It must not use gtest assertions.
 class OtherProcess {
 public:
     explicit OtherProcess(const std::function<int()> &work)
@@ -83,7 +83,7 @@ public:
         }
     }
 
-    /// Its exit code, or -1 when a signal ended it.
+    /// Its exit code, or -1 if ended by a signal.
     int wait() {
         int status = 0;
         waitpid(pid_, &status, 0);

@@ -21,7 +21,7 @@ using OvraPlatform::apiSuccess;
 
 namespace {
 
-/// A session of another application, made behind the library's back.
+/// A session of another application, created without the library.
 std::string foreignSession(const char *user) {
     OvraCgi handle{};
     OvraCgiInit("", &handle);

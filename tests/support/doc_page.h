@@ -6,8 +6,7 @@
 
 namespace OvraTest {
 
-/// A page of docs/, read for the facts that stand in it. OVRA_PAGES names another folder than the
-/// source tree.
+/// A page of docs/, parsed for its facts. OVRA_PAGES overrides the source tree.
 class DocPage {
 public:
     struct Section {
@@ -27,10 +26,10 @@ private:
     std::vector<Section> sections_;
 };
 
-/// The pages that describe what there is now, from the top of the tree.
+/// The pages that describe the current state, relative to the tree.
 std::vector<std::string> docPages();
 
-/// What stands between backticks, and each line of blocks of code.
+/// The text between backticks, and each line of code blocks.
 std::vector<std::string> codeIn(const std::string &text);
 
 } // namespace OvraTest

@@ -8,10 +8,10 @@ namespace OvraTest {
 inline constexpr const char *kNodeDatabase = "/usr/ovra/etc/ovradr/node.db";
 inline constexpr const char *kIdentityFile = "/usr/ovra/etc/ovradr/node.info";
 
-/// Makes the folders and the node database of the view that the test runs in, as set-up would.
+/// Creates the folders and the node database in the test's sandbox, as set-up would.
 void provisionNode();
 
-/// Runs statements on the node database behind the library's back.
+/// Runs statements on the node database without the library.
 void executeSql(const std::string &sql);
 /// The rows of a query, columns joined by '|', rows by '\n'.
 std::string querySql(const std::string &sql);

@@ -24,7 +24,7 @@ __attribute__((format(printf, 2, 0))) void capture(int priority, const char *for
 
 } // namespace
 
-// The program's own definitions go before the C library's, also for the checked form that the
+// The program's own definitions override the C library's, also for the checked variant that the
 // compiler may choose.
 extern "C" {
 __attribute__((format(printf, 2, 3))) void syslog(int priority, const char *format, ...) {

@@ -4,7 +4,7 @@
 #include <string>
 #include <vector>
 
-/// Takes what this process logs while it lives, instead of the system log.
+/// Captures this process's log lines during its lifetime, instead of the system log.
 class LogCapture {
 public:
     LogCapture();
@@ -14,10 +14,9 @@ public:
 
     /// Each as "PRIORITY line".
     std::vector<std::string> lines() const;
-    /// How many lines hold `text`.
+    /// How many lines contain `text`.
     int count(const std::string &text) const;
-    /// How many lines are of `level` ("ERR", ...), from unit `file` and `function`, and say exactly
-    /// `message`.
+    /// How many lines have `level` ("ERR", ...), unit `file`, `function` and exactly `message`.
     int count(const std::string &level, const std::string &file, const std::string &function,
               const std::string &message) const;
     void clear();

@@ -1,7 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 
-// The main function of every test program. Its cases run in a sandbox and nowhere else; what there
-// is to run can be asked anywhere.
+// The main function of every test program. Its cases run only in a sandbox; listing them works
+// anywhere.
 
 #include "support/sandbox.h"
 
@@ -10,7 +10,7 @@
 #include <vector>
 
 int main(int argc, char **argv) {
-    const std::vector<const char *> asGiven(argv, argv + argc); // gtest takes its own away
+    const std::vector<const char *> asGiven(argv, argv + argc); // gtest removes its own
     testing::InitGoogleTest(&argc, argv);
     if (!GTEST_FLAG_GET(list_tests) && !OvraTest::isSandbox()) {
         OvraTest::explainSandbox(static_cast<int>(asGiven.size()), asGiven.data());

@@ -79,7 +79,7 @@ public:
         ssl_.reset(SSL_new(context));
         return ssl_ && SSL_set_fd(ssl_.get(), fd_) == 1 && SSL_accept(ssl_.get()) == 1;
     }
-    /// Appends what comes; false at the end.
+    /// Appends received bytes; false at the end.
     bool readSome(std::string &text) {
         char part[16384];
         const ssize_t got =
@@ -121,7 +121,7 @@ std::size_t contentLength(const std::string &headers) {
                                    : std::strtoul(headers.c_str() + at + kName.size(), nullptr, 10);
 }
 
-/// Takes one request out of `buffer`, reading on as needed.
+/// Extracts one request from `buffer`, reading more as needed.
 std::optional<Received> readRequest(Stream &stream, std::string &buffer) {
     std::size_t end = 0;
     while ((end = buffer.find("\r\n\r\n")) == std::string::npos) {
@@ -241,7 +241,7 @@ struct MisbehavingServer::Impl {
         context = makeContext(*certificate);
     }
 
-    /// Ends the acceptor, then closes the port; once.
+    /// Stops the acceptor, then closes the port; once.
     void refuse() {
         if (acceptor.joinable()) {
             shutdown(listener, SHUT_RDWR);
@@ -273,7 +273,7 @@ struct MisbehavingServer::Impl {
     }
 
     void serve(int fd, int number) {
-        // A peer that hangs up must not end the test with SIGPIPE.
+        // A peer that closes the connection must not end the test with SIGPIPE.
         sigset_t sigpipe;
         sigemptyset(&sigpipe);
         sigaddset(&sigpipe, SIGPIPE);
@@ -442,7 +442,7 @@ void MisbehavingServer::closeConnections() {
 bool MisbehavingServer::vanish() {
     const std::lock_guard<std::mutex> lock(impl_->mutex);
     for (const int fd : impl_->open) {
-        // A socket under repair is taken apart without a segment sent.
+        // A socket in repair mode is closed without sending a segment.
         const int on = 1;
         sockaddr none{};
         none.sa_family = AF_UNSPEC;

@@ -9,7 +9,7 @@
 
 namespace OvraTest {
 
-/// What the server does once it has read a request: bytes, their pace, and what comes after.
+/// The server's reaction to a request: bytes, their pace, and what follows.
 struct Answer {
     enum class Ending { kKeep, kClose, kHang };
 
@@ -18,7 +18,7 @@ struct Answer {
     Ending ending = Ending::kKeep;
     std::size_t blanks = 0; ///< sent after `bytes`; a huge answer is never held in memory
 
-    /// A whole HTTP answer; the connection stays open.
+    /// A complete HTTP answer; the connection stays open.
     static Answer http(int status, const std::string &type, const std::string &body,
                        const std::string &headers = "");
     static Answer json(const std::string &document);
@@ -28,17 +28,17 @@ struct Answer {
     static Answer empty();
     static Answer status(int status);
     static Answer redirect(const std::string &url);
-    /// Nothing, for ever.
+    /// Never answers.
     static Answer silence();
-    /// Closes without a byte.
+    /// Closes without sending a byte.
     static Answer closed();
-    /// Promises `document` and closes in the middle.
+    /// Announces `document` and closes in the middle.
     static Answer truncated(const std::string &document);
-    /// A body of that many bytes. \param announced  its length stands in the header
+    /// A body of that many bytes. \param announced whether the header has its length
     static Answer huge(std::size_t size, bool announced);
-    /// A good answer, a byte at a time.
+    /// A valid answer, one byte at a time.
     static Answer drip(std::chrono::milliseconds pausePerByte);
-    /// These bytes and nothing else, then closes.
+    /// Sends only these bytes, then closes.
     static Answer raw(const std::string &bytes);
 };
 
@@ -51,14 +51,14 @@ struct Received {
     int connection = 0; ///< counted from 1
 };
 
-/// An HTTP server on loopback that does what it is told, for tests of those who have to cope.
+/// An HTTP server on loopback with scripted behaviour, for testing clients.
 ///
 ///     MisbehavingServer server({.tls = true});
 ///     server.answer(Answer::html());
 ///     ... send to 127.0.0.1, server.port() ...
 ///     EXPECT_EQ(server.requests().size(), 1U);
 ///
-/// Threads serve the connections until the object goes. Every operation may be called at any time.
+/// Threads serve the connections until destruction. Every operation may be called at any time.
 class MisbehavingServer {
 public:
     struct Options {
@@ -73,7 +73,7 @@ public:
     ~MisbehavingServer();
 
     int port() const;
-    /// "SHA256:..." of the key of its present certificate; made with OpenSSL alone.
+    /// "SHA256:..." of the key of its current certificate; computed with OpenSSL alone.
     std::string fingerprint() const;
 
     /// The answer to every request from now on; at first it is Answer::success().
@@ -83,20 +83,20 @@ public:
     /// Computes every answer from now on.
     void answerWith(Responder responder);
 
-    /// A new key and certificate for the connections to come.
+    /// A new key and certificate for future connections.
     void changeCertificate();
-    /// Accepts connections from now on, and says nothing on them, not even TLS.
+    /// From now on accepts connections and sends nothing on them, not even TLS.
     void fallSilent();
     /// Closes every open connection.
     void closeConnections();
-    /// Forgets every open connection without a word to the peer, as after a loss of power.
-    /// \return false where that needs a right that this process lacks (CAP_NET_ADMIN).
+    /// Drops every open connection without notifying the peer, as after a power failure.
+    /// \return false if this process lacks CAP_NET_ADMIN.
     bool vanish();
-    /// Closes the port: who connects is refused.
+    /// Closes the port: connections are refused.
     void refuse();
 
     std::vector<Received> requests() const;
-    /// How many connections were accepted.
+    /// The number of accepted connections.
     int connections() const;
 
 private:
@@ -104,7 +104,7 @@ private:
     std::unique_ptr<Impl> impl_;
 };
 
-/// A port on 127.0.0.1 where nobody listens.
+/// A port on 127.0.0.1 where nothing listens.
 int unusedPort();
 
 } // namespace OvraTest

@@ -7,7 +7,7 @@
 
 namespace Json {
 
-/// A value in a failure is one line of JSON; by itself gtest prints its bytes.
+/// Prints a value in a failure as one line of JSON; by default gtest prints its bytes.
 inline void PrintTo(const Value &value, std::ostream *out) {
     StreamWriterBuilder oneLine;
     oneLine["indentation"] = "";

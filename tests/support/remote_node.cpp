@@ -34,7 +34,7 @@ Answer RemoteNode::respond(const Received &received) {
     return document != nullptr ? Answer::json(*document) : std::get<Answer>(reply);
 }
 
-/// Notes the call down and finds its answer.
+/// Records the call and finds its answer.
 SealingDaemon::Reply RemoteNode::record(const std::string &call, const std::string &sid,
                                         const std::string &method, const Json::Value &params) {
     std::function<void()> action;

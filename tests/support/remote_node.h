@@ -13,10 +13,10 @@
 
 namespace OvraTest {
 
-/// A remote node over HTTPS whose answers a test writes down, by session and call or by call alone.
-/// A call without an answer of its own is a success without data. Sealed requests are opened and
-/// their answers sealed; asking for the key to seal with does not count as a call, unless a test
-/// answers it.
+/// A remote node over HTTPS with scripted answers, by session and call or by call alone. A call
+/// without a scripted answer succeeds without data. Sealed requests are opened and their answers
+/// sealed; a request for the sealing key does not count as a call, unless a test scripts its
+/// answer.
 class RemoteNode {
 public:
     RemoteNode();
@@ -25,16 +25,16 @@ public:
     /// \param call      "method" or "session method"; "probe" for a bare request
     /// \param document  the reply
     void answer(const std::string &call, const std::string &document);
-    /// Something else than a reply.
+    /// Something other than a reply.
     void answer(const std::string &call, const Answer &answer);
     /// Runs before the calls of `method` are answered.
     void before(const std::string &method, std::function<void()> action);
-    /// From now on connections are refused, and those that were kept are cut.
+    /// From now on connections are refused, and idle ones are cut.
     void die();
     /// "session method" of each call so far, joined by ", ".
     std::string calls() const;
     void forgetCalls();
-    /// The parameters of the last call of `method`, as JSON text; "" when there was none.
+    /// The parameters of the last call of `method`, as JSON text; "" if there was none.
     std::string params(const std::string &method) const;
 
     MisbehavingServer server;

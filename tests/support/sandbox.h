@@ -10,12 +10,12 @@
 
 namespace OvraTest {
 
-/// What a program returns that refuses to run here.
+/// The exit code of a program that refuses to run here.
 inline constexpr int kNotHere = 2;
 
-/// Whether the fixed paths of the library are this program's own. The variable alone does not say
-/// so, it may have got out into somebody's shell; the folder is nowhere but in such a file view,
-/// where lab/lib/view.sh puts it.
+/// Whether the fixed paths of the library are private to this program. The variable alone does not
+/// prove that, as it may have leaked into a shell; the folder exists only in a sandbox, where
+/// lab/lib/view.sh creates it.
 inline bool isSandbox() {
     const char *const said = std::getenv("OVRADR_SANDBOX");
     struct stat mark {};
@@ -23,7 +23,7 @@ inline bool isSandbox() {
            lstat("/run/host/ovradr-sandbox", &mark) == 0 && S_ISDIR(mark.st_mode);
 }
 
-/// Says why a program does not run outside a sandbox, and how to run it inside.
+/// Prints why a program does not run outside a sandbox, and how to run it inside.
 inline void explainSandbox(int argc, const char *const *argv) {
     std::string command;
     for (int i = 0; i < argc; ++i) {

@@ -16,10 +16,10 @@
 
 namespace OvraTest {
 
-/// The receiving side of the sealed envelope, as a daemon has it, behind a MisbehavingServer.
+/// The receiving side of the sealed envelope, as in a daemon, behind a MisbehavingServer.
 class SealingDaemon {
 public:
-    /// A document, sealed where the call was, or bytes that are sent as they are.
+    /// A document, sealed if the call was, or bytes that are sent unchanged.
     using Reply = std::variant<std::string, Answer>;
     using Handler = std::function<Reply(const OvraPlatform::WireCall &)>;
 
@@ -34,7 +34,7 @@ public:
         newKey(keyFile);
     }
 
-    /// Has another key from now on.
+    /// Uses another key from now on.
     void newKey(const std::string &keyFile) {
         const std::lock_guard<std::mutex> lock(mutex_);
         keys_ = OvraPlatform::SealKeyPair::loadOrCreate(keyFile).value();

@@ -9,7 +9,7 @@
 
 namespace OvraTest {
 
-/// A fresh P-256 key with a certificate that it signed itself, valid for an hour.
+/// A fresh P-256 key with a self-signed certificate, valid for an hour.
 class TestCertificate {
 public:
     /// \param names  as OpenSSL writes a subjectAltName, e.g. "DNS:localhost,IP:127.0.0.1"

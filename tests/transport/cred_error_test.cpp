@@ -1,7 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 
-// How every error number of the credential library is taken, with a double of that library that
-// fails where it is told to: the real one cannot be made to give them all.
+// The handling of every error number of the credential library, with a test double that fails on
+// demand: the real library cannot be made to return them all.
 
 #include "support/log_capture.h"
 #include "transport/conn_cache.h"
@@ -20,7 +20,7 @@ struct _tag_ovra_cred_sess_ {};
 
 namespace {
 
-/// What the double does next.
+/// The double's next behaviour.
 struct Script {
     std::set<std::string> fail; ///< steps that fail
     int error = 0;

@@ -38,7 +38,7 @@ TEST(NodeCandidates, AreListedAsTheSenderThenTriesThem) {
     const struct {
         const char *what;
         const char *remembered;
-        int age;             // of what is remembered, in seconds
+        int age;             // of the remembered credential, in seconds
         const char *refused; // the credential without the right
         const char *dead;    // the credential whose endpoint does not answer
         int verdictAge;

@@ -92,7 +92,7 @@ TEST_F(Probe, AHostThatAcceptsAndSaysNothingCostsTheProbesTimeOutOnce) {
 }
 
 TEST_F(Probe, ManyProcessesThatAskAtOnceSendOneProbe) {
-    // The port is closed while they ask: the refusal is quick, so only the order saves the probes.
+    // The port is closed while they call: the refusal is quick, so only the order saves probes.
     for (int i = 0; i < 20; ++i) {
         if (fork() == 0) {
             _exit(BaseSender::GetCachedConnectable(conn) ? 0 : 1);

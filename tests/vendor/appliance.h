@@ -21,7 +21,7 @@ inline Json::Value json(const std::string &text) {
     return value;
 }
 
-/// A node behind one endpoint, which does what nodes ask of each other. Its account is "joe" with
+/// A node behind one endpoint that handles the requests of other nodes. Its account is "joe" with
 /// the password "pw".
 class PeerNode {
 public:
@@ -33,12 +33,12 @@ public:
         remote.answer = [this](const OvraVendor::Call &call) { return answer(call); };
     }
 
-    /// What "method" or "session method" is answered from now on, as JSON text.
+    /// The answer to "method" or "session method" from now on, as JSON text.
     std::map<std::string, std::string> answers;
     OvraDRNode::Conn conn;
     OvraVendor::Remote &remote;
 
-    /// "session method" of each call since the last time this was asked, joined by ", ".
+    /// "session method" of each call since this was last called, joined by ", ".
     std::string calls() {
         std::string text;
         for (const OvraVendor::Call &call : remote.calls) {
@@ -47,7 +47,7 @@ public:
         remote.calls.clear();
         return text;
     }
-    /// The first call of `method` so far; an empty one when there was none.
+    /// The first call of `method` so far; an empty one if there was none.
     OvraVendor::Call callOf(const std::string &method) const {
         for (const OvraVendor::Call &call : remote.calls) {
             if (call.method == method) {
@@ -56,7 +56,7 @@ public:
         }
         return {};
     }
-    /// Stores a credential for this node whose session it knows.
+    /// Stores a credential for this node with a session known to it.
     void grant(const std::string &credId, const std::string &session) {
         remote.sessions.insert(session);
         executeSql("INSERT INTO node_cred VALUES ('" + conn.addr + "', 'https', 5001, '" + credId +
@@ -100,8 +100,8 @@ private:
     int granted_ = 0;
 };
 
-/// A provisioned node on the stand-ins. Each case ends with every resource of the appliance's
-/// libraries given back, once.
+/// A provisioned node on the stand-ins. Each case must release every resource of the vendor's
+/// libraries, exactly once.
 class Appliance : public testing::Test {
 protected:
     void SetUp() override {

@@ -15,7 +15,7 @@ protected:
         Appliance::SetUp();
         DRNode::getLocalNodeId();
     }
-    /// Creates a credential over the account, and gives its id.
+    /// Creates a credential over the account and returns its id.
     std::string create() {
         DRNodeCredCreate flow;
         EXPECT_TRUE(flow.setCred(peer.conn, "joe", "pw", ""))

@@ -12,7 +12,7 @@ using namespace OvraVendor;
 
 namespace {
 
-/// Requests that are for this node stay here; its own operation reports where it ran.
+/// Requests for this node stay local; its own operation reports where it ran.
 class WhereAmI : public NodeOperationDispatcher {
 public:
     using NodeOperationDispatcher::NodeOperationDispatcher;

@@ -9,7 +9,7 @@ using namespace OvraVendor;
 
 namespace {
 
-/// Of the users only joe exists.
+/// Only the user joe exists.
 class GrantedSession : public Appliance {
 protected:
     static OvraVendor::Session stored(const std::string &id) {

@@ -7,7 +7,7 @@
 #include <string>
 #include <string_view>
 
-// Addresses and host names as text, each in one spelling.
+// Addresses and host names as text, each in canonical form.
 namespace OvraBase {
 
 /// A socket address of either family.
@@ -20,31 +20,31 @@ struct SocketAddress {
 };
 
 /// The socket address of a numeric IPv4 address (four decimal numbers) or IPv6 address, without
-/// brackets or scope; nothing for any other text.
+/// brackets or scope; std::nullopt for any other text.
 std::optional<SocketAddress> parseAddress(const std::string &text, int port);
 bool isNumericAddress(const std::string &text);
 
-/// The one spelling of an IPv6 address (RFC 5952), which may stand in brackets; "" for any other
+/// The canonical form of an IPv6 address (RFC 5952), with or without brackets; "" for any other
 /// text.
 std::string normalizeIpv6(std::string text);
 
-/// The numeric text of a socket's address, without port; that of an IPv4 client on a socket for
-/// both families as IPv4. "" for an address of another family, and for null.
+/// The numeric text of a socket address, without port; an IPv4-mapped address as IPv4. "" for
+/// another family, and for null.
 std::string addressText(const sockaddr *address);
 
-/// What counts as one client: an IPv4 address, or the network of 64 bits of an IPv6 address, which
-/// is what one subscriber has at least (RFC 6177). Any other text stands for itself.
+/// What counts as one client: an IPv4 address, or the /64 network of an IPv6 address, the least
+/// that a subscriber gets (RFC 6177). Any other text is returned unchanged.
 /// \param address  numeric, as addressText() gives it
 std::string clientKey(const std::string &address);
 
-/// Whether the text can be the name of a host: 1 to 253 ASCII letters, digits, '-', '.' and '_'
-/// (RFC 1035, 2.3.4, as text), neither a dot nor a hyphen in front.
+/// Whether the text can be a host name: 1 to 253 ASCII letters, digits, '-', '.' and '_' (RFC 1035,
+/// 2.3.4, as text), with no leading dot or hyphen.
 bool isHostName(std::string_view text);
 
 /// "host:port", with an IPv6 address in brackets.
 std::string joinHostPort(const std::string &host, int port);
 
-/// The ASCII letters of the text in lower case.
+/// The text with its ASCII letters in lower case.
 std::string toLower(std::string_view text);
 
 } // namespace OvraBase

@@ -8,14 +8,14 @@
 
 #include <chrono>
 
-// Advisory locks with a time limit. They are released explicitly: a process that was forked while
-// one was held has the same open file, and closing alone would leave the lock with it.
+// Advisory locks with a time-out. They are released explicitly: a child forked while one is held
+// shares the open file description, so closing alone would not release the lock.
 namespace OvraBase {
 
-/// Takes flock(2) on an open file, or converts one that is held.
+/// Takes flock(2) on an open file, or converts a held lock.
 /// \param operation  LOCK_SH or LOCK_EX; LOCK_NB changes nothing
 /// \param wait       how long to keep trying, on the monotonic clock; 0 tries once
-/// \return the error ETIMEDOUT when another open file keeps the lock.
+/// \return ETIMEDOUT if another open file description keeps the lock.
 [[nodiscard]] Expected<void> lockFile(int fd, int operation, std::chrono::milliseconds wait);
 void unlockFile(int fd);
 
@@ -24,7 +24,7 @@ void unlockFile(int fd);
 [[nodiscard]] Expected<void> lockByte(int fd, off_t offset, std::chrono::milliseconds wait);
 void unlockByte(int fd, off_t offset);
 
-/// An open file under flock(2): the lock is released and the file closed together.
+/// An open file locked with flock(2); unlocking and closing go together.
 class LockedFd {
 public:
     LockedFd() = default;
@@ -34,13 +34,13 @@ public:
     LockedFd &operator=(const LockedFd &) = delete;
     ~LockedFd();
 
-    /// As lockFile(), for a file that is given away.
+    /// As lockFile(), taking ownership of the file.
     [[nodiscard]] static Expected<LockedFd> lock(UniqueFd fd, int operation,
                                                  std::chrono::milliseconds wait);
 
     int get() const { return fd_.get(); }
     explicit operator bool() const { return static_cast<bool>(fd_); }
-    /// Releases and closes.
+    /// Unlocks and closes.
     void reset();
 
 private:

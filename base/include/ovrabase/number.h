@@ -11,7 +11,8 @@ namespace OvraBase {
 
 inline constexpr int kMaxPort = 65535;
 
-/// The decimal number that is the whole of `text`, from `min` to `max`; nothing for any other text.
+/// The decimal number, from `min` to `max`, that `text` consists of; std::nullopt for any other
+/// text.
 template <typename T>
 std::optional<T> parseNumber(std::string_view text, T min = std::numeric_limits<T>::min(),
                              T max = std::numeric_limits<T>::max()) {

@@ -11,17 +11,17 @@
 
 namespace OvraBase {
 
-/// Overwrites what the text holds (explicit_bzero(3)) and empties it.
+/// Overwrites the text (explicit_bzero(3)) and empties it.
 inline void wipe(std::string &text) {
     explicit_bzero(text.data(), text.size());
     text.clear();
 }
 
-/// Text that is wiped when it goes or is replaced. It never grows beyond the room that it was
-/// given, so that no copy stays behind where it lay before.
+/// Text that is wiped on destruction and replacement. It never grows beyond its initial capacity,
+/// so that reallocation leaves no copy behind.
 class Secret {
 public:
-    /// Room for anything that people or peers call a password, in bytes.
+    /// Capacity in bytes, enough for any password.
     static constexpr std::size_t kMaxSize = 1024;
 
     Secret() { text_.reserve(kMaxSize); }
@@ -29,7 +29,7 @@ public:
         text_.reserve(text.size() > kMaxSize ? text.size() : kMaxSize);
         text_.assign(text);
     }
-    /// Takes the text over; `text` is left empty and wiped.
+    /// Takes the text; `text` is wiped and left empty.
     static Secret take(std::string &text) {
         Secret secret(text);
         wipe(text);
@@ -44,7 +44,7 @@ public:
     }
     ~Secret() { wipe(text_); }
 
-    /// False when there is no room for it.
+    /// False if the capacity is exhausted.
     [[nodiscard]] bool append(char c) {
         const bool fits = text_.size() < kMaxSize && text_.size() < text_.capacity();
         if (fits) {
@@ -58,7 +58,7 @@ public:
             text_.pop_back();
         }
     }
-    /// Valid as long as this object is not changed.
+    /// Valid until this object is modified.
     const std::string &get() const { return text_; }
     bool empty() const { return text_.empty(); }
 
@@ -66,7 +66,7 @@ private:
     std::string text_;
 };
 
-/// Bytes that are wiped when they go.
+/// Bytes that are wiped on destruction.
 template <std::size_t Size>
 struct SecretBytes : std::array<unsigned char, Size> {
     SecretBytes()
@@ -76,7 +76,7 @@ struct SecretBytes : std::array<unsigned char, Size> {
     ~SecretBytes() { explicit_bzero(this->data(), Size); }
 };
 
-/// Wipes a text that somebody else owns at the end of the scope.
+/// Wipes a text owned elsewhere at the end of the scope.
 class WipeAtEnd {
 public:
     explicit WipeAtEnd(std::string &text)

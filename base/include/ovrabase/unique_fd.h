@@ -25,9 +25,9 @@ public:
 
     int get() const { return fd_; }
     explicit operator bool() const { return fd_ >= 0; }
-    /// Hands the descriptor over to the caller.
+    /// Passes ownership of the descriptor to the caller.
     int release() { return std::exchange(fd_, -1); }
-    /// Closes what is held and takes `fd`.
+    /// Closes the held descriptor and takes ownership of `fd`.
     void reset(int fd = -1) {
         if (fd_ >= 0) {
             close(fd_);

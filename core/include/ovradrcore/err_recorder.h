@@ -49,7 +49,7 @@ OVRADRCORE_EXPORT std::string ToString(int code);
 } // namespace ERR
 
 /// The outcome of the last operation of a stateful class: a code and, optionally, a JSON message.
-/// Setting is const, because operations that do not change their object fail too.
+/// Setting is const, because const operations can fail too.
 class OVRADRCORE_EXPORT ErrRecorder {
 public:
     /// The error as an object: "err_code", then "err_code_str" and "err_msg" where there is one.
@@ -62,7 +62,7 @@ public:
     ErrRecorder(const ErrRecorder &) = default;
     ErrRecorder &operator=(const ErrRecorder &) = default;
 
-    /// Stores both; no message clears the one before.
+    /// Stores both; without a message, the previous one is cleared.
     void SetErr(int code, const Json::Value &message = Json::Value()) const;
     /// Copies code and message of `other`; null changes nothing and is logged.
     void SetErr(const ErrRecorder *other) const;

@@ -7,12 +7,12 @@
 
 namespace OvraDRCore {
 
-/// An advisory lock between processes, flock(2) on a file of its own.
+/// An advisory lock between processes, flock(2) on a dedicated file.
 ///
-/// A bare name lives under /run/lock; a name with a slash is a path. The file is made when missing
-/// (mode 0600), never followed through a symbolic link, and never removed: every process arrives at
+/// A bare name lives under /run/lock; a name with a slash is a path. The file is created if missing
+/// (mode 0600), never opened through a symbolic link, and never removed, so that every process uses
 /// the same file. The lock belongs to this object, not to the process, so two objects exclude each
-/// other within one process as well; it goes with the process when that dies.
+/// other within one process as well; it is released when the process dies.
 class OVRADRCORE_EXPORT FileLock {
 public:
     /// Binds the object to its file; takes no lock.
@@ -25,7 +25,7 @@ public:
     /// Takes the lock; one that this object already holds is converted.
     /// \param operation  the bits of flock(2): LOCK_SH or LOCK_EX, with or without LOCK_NB
     /// \param wait       seconds to keep trying, on the monotonic clock; 0 tries once
-    /// \return true when held.
+    /// \return true if held.
     [[nodiscard]] bool lock(int operation, unsigned int wait);
     void unlock() const;
 

@@ -12,8 +12,8 @@ namespace OvraDRCore {
 /// Renders `value` as compact JSON text on one line, exactly and completely.
 OVRADRCORE_EXPORT std::string toString(const Json::Value &value);
 
-/// A copy of `value` in which login material (the values of members that hold passwords, one-time
-/// codes, session ids, tokens) is replaced by "***", at any depth, also inside a relayed request.
+/// A copy of `value` with login material (passwords, one-time codes, session ids, tokens) replaced
+/// by "***", at any depth, also inside a relayed request.
 OVRADRCORE_EXPORT Json::Value maskSecrets(const Json::Value &value);
 
 /// toString() of maskSecrets(): what log lines show.
@@ -21,10 +21,10 @@ OVRADRCORE_EXPORT std::string toLogString(const Json::Value &value);
 
 /// Parses JSON text (RFC 8259, strict: no comments, nothing after the document, no duplicate keys,
 /// at most 200 levels deep) into `value`.
-/// \return false, with `value` unchanged, when `text` is not such a document. Never throws.
+/// \return false, with `value` unchanged, if `text` is not such a document. Never throws.
 [[nodiscard]] OVRADRCORE_EXPORT bool fromString(Json::Value &value, const std::string &text);
 
-/// Member `key` of `value` when `value` is an object that has it as a string, otherwise "".
+/// Member `key` of `value` if `value` is an object that has it as a string, otherwise "".
 OVRADRCORE_EXPORT std::string memberString(const Json::Value &value, const char *key);
 
 } // namespace OvraDRCore

@@ -8,29 +8,29 @@ namespace OvraDRCore {
 /// Levels of a log line; the values are the priorities of syslog(3).
 enum class LogLevel { kErr = 3, kWarn = 4, kNotice = 5, kInfo = 6, kDebug = 7 };
 
-/// Writes one line to the system log, with one call of syslog(3):
-/// "file:line(function)[LEVEL][pid]: message".
+/// Writes one line to the system log, with one call of syslog(3): "file:line(function)[LEVEL][pid]:
+/// message".
 ///
 /// \param file      source path; the line shows its stem (no folder, no extension)
 /// \param line      source line
-/// \param function  the name that the line carries
-/// \param format    as for printf(3). Control characters that the arguments bring in are escaped,
-///                  so that one event is one line; a message over 7,000 bytes is cut and says so.
+/// \param function  the function name in the line
+/// \param format    as for printf(3). Control characters in arguments are escaped, so that one
+///                  event is one line; a message over 7,000 bytes is truncated and says so.
 OVRADRCORE_EXPORT void logMessage(LogLevel level, const char *file, int line, const char *function,
                                   const char *format, ...) __attribute__((format(printf, 5, 6)));
 
 } // namespace OvraDRCore
 
-/// The file that the lines below name. A unit that is split into several files defines it, before
-/// it includes anything, so that all of its lines carry the unit's name.
+/// The file name in log lines. A unit that is split into several files defines it before any
+/// include, so that all of its lines carry the unit's name.
 #ifndef OVRA_LOG_FILE
 #define OVRA_LOG_FILE __FILE__
 #endif
 
-/// Logs under a function name of its own: for steps that belong to an operation of another name.
+/// Logs under a given function name, for steps that belong to an operation of another name.
 #define OVRA_LOG_IN(level, function, ...)                                                          \
     ::OvraDRCore::logMessage((level), OVRA_LOG_FILE, __LINE__, (function), __VA_ARGS__)
-/// The usual ways to log: the function name is that of the calling line.
+/// The usual macros: the function name is that of the caller.
 #define OVRA_LOG(level, ...) OVRA_LOG_IN((level), __func__, __VA_ARGS__)
 #define OVRA_ERR(...) OVRA_LOG(::OvraDRCore::LogLevel::kErr, __VA_ARGS__)
 #define OVRA_WARN(...) OVRA_LOG(::OvraDRCore::LogLevel::kWarn, __VA_ARGS__)

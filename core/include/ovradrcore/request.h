@@ -9,16 +9,16 @@
 
 namespace OvraDRCore {
 
-/// A web-API request: what is called, with which parameters, and how it has to travel.
+/// A web-API request: method, parameters and transport options.
 class OVRADRCORE_EXPORT Request {
 public:
-    /// Seconds that the transport waits for a reply unless the request says otherwise. A peer may
-    /// have to probe several endpoints (10 seconds each) before it answers.
+    /// Default time-out for a reply, in seconds. A peer may have to probe several endpoints (10
+    /// seconds each) before it answers.
     static constexpr long kDefaultResponseTimeout = 60;
 
     /// Empty and invalid.
     Request() = default;
-    /// Rebuilds a request from what toJson() produced; anything else gives an invalid request.
+    /// Rebuilds a request from the output of toJson(); anything else gives an invalid request.
     explicit Request(const Json::Value &json);
     Request(const std::string &api, int version, const std::string &method,
             const Json::Value &params);
@@ -33,13 +33,13 @@ public:
     void setVersion(int version) { version_ = version; }
     /// Sets params[key]; a later call with the same key replaces the value.
     void addParam(const std::string &key, const Json::Value &value);
-    /// Merges every member of `object` into the parameters; not an object: nothing is added.
+    /// Merges every member of `object` into the parameters; ignored if it is not an object.
     void addParam(const Json::Value &object);
-    /// The parameters hold login material and have to travel sealed.
+    /// The parameters hold login material and must be sealed.
     void setEncryptRequired(bool required) { encryptRequired_ = required; }
     /// \param seconds  how long the transport waits for the reply
     void setResponseTimeout(long seconds) { responseTimeout_ = seconds; }
-    /// A file to send along, and the name under which it is sent. Both or neither.
+    /// A file to upload, and the name under which it is sent. Both or neither.
     void setUpload(const std::string &path, const std::string &name);
 
     const std::string &getAPI() const { return api_; }

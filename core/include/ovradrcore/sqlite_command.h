@@ -9,7 +9,7 @@
 
 namespace OvraDRCore {
 
-/// Names one table, which provisioning made.
+/// Names one table, created by provisioning.
 class OVRADRCORE_EXPORT SqliteTableHandler {
 public:
     /// \param schema  kept for the layer's interface; a handler never creates its table
@@ -25,7 +25,7 @@ private:
     std::string schema_;
 };
 
-/// A row filter. `text` is its SQL; empty text is an invalid filter, which every statement refuses.
+/// A row filter. `text` is its SQL; empty text is an invalid filter, which every statement rejects.
 class OVRADRCORE_EXPORT SqliteCondition {
 public:
     virtual bool IsValid() const;
@@ -43,7 +43,7 @@ public:
     SqliteEqual(const std::string &field, const SqliteValue &value);
 };
 
-/// Both filters hold. One that is invalid makes the whole invalid.
+/// Both filters hold. If either is invalid, so is the whole.
 class OVRADRCORE_EXPORT SqliteAnd : public SqliteCondition {
 public:
     SqliteAnd(const SqliteCondition &left, const SqliteCondition &right);
@@ -58,10 +58,10 @@ public:
     virtual ~SqliteCommand();
 
     void SetTable(const SqliteTableHandler &table) { table_ = table.GetName(); }
-    /// The full statement, exact; "" when it is not complete (no table, no column, or a condition
-    /// that was set but is empty or invalid).
+    /// The full statement, exact; "" if it is incomplete (no table, no column, or a condition that
+    /// was set but is empty or invalid).
     std::string ToStr() const { return render(false); }
-    /// As ToStr(), for log lines: what is stored in a "session" column shows as '***'.
+    /// As ToStr(), for log lines: values of a "session" column show as '***'.
     std::string ToLogStr() const { return render(true); }
 
 protected:
@@ -123,7 +123,7 @@ private:
     std::string condition_;
 };
 
-/// Deletes the rows that a condition names; without one it is not complete.
+/// Deletes the rows that match a condition; incomplete without one.
 class OVRADRCORE_EXPORT DeleteCommand : public SqliteCommand {
 public:
     void SetCondition(const std::string &text) { condition_ = text; }

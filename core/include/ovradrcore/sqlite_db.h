@@ -14,12 +14,11 @@ struct sqlite3;
 
 namespace OvraDRCore {
 
-/// An open SQLite file. Construction reports nothing: a file that cannot be opened makes every
-/// operation fail. The file is never created here, nor a table in it.
+/// An open SQLite file. Construction reports no error: if the file cannot be opened, every
+/// operation fails. Neither the file nor a table is ever created here.
 ///
-/// Every operation returns false on failure, records 407 with SQLite's own words as the message,
-/// and logs them once at WARN; nothing throws. A file that another process has locked is waited
-/// for.
+/// Every operation returns false on failure, records 407 with SQLite's error text as the message,
+/// and logs it once at WARN; nothing throws. Operations wait for a file locked by another process.
 class OVRADRCORE_EXPORT SqliteDB : public ErrRecorder {
 public:
     /// \param path       the database file
@@ -30,7 +29,7 @@ public:
     SqliteDB &operator=(SqliteDB &&) noexcept;
     ~SqliteDB() override;
 
-    /// The first row of the result, or an empty list when there is none.
+    /// The first row of the result, or an empty list if there is none.
     [[nodiscard]] bool SelectRecord(const SelectCommand &command, SqliteValueList &row);
     /// Appends one list per row, in SQLite's order.
     [[nodiscard]] bool SelectRecords(const SelectCommand &command,
@@ -38,10 +37,10 @@ public:
     [[nodiscard]] bool InsertRecord(const InsertCommand &command);
     /// Success does not depend on how many rows changed.
     [[nodiscard]] bool UpdateRecord(const UpdateCommand &command);
-    /// An empty condition is refused: a delete never means every row.
+    /// An empty condition is rejected: a delete never affects every row.
     [[nodiscard]] bool DeleteRecord(const std::string &condition, const SqliteTableHandler &table);
 
-    /// The schema version that provisioning wrote into the info table; -1 when it cannot be read.
+    /// The schema version that provisioning wrote into the info table; -1 if it cannot be read.
     [[nodiscard]] int GetSchemaVersion();
 
 private:

@@ -11,7 +11,7 @@
 
 namespace OvraDRCore {
 
-/// One cell: text (any bytes, NUL included) or a signed 32-bit integer; or, made by default, none.
+/// One cell: text (any bytes, NUL included), a signed 32-bit integer, or, by default, none.
 class OVRADRCORE_EXPORT SqliteValue {
 public:
     SqliteValue() = default;
@@ -22,9 +22,9 @@ public:
     SqliteValue(int number)
         : value_(number) {} // NOLINT(google-explicit-constructor)
 
-    /// True, and sets `text`, when the value holds text.
+    /// True, and sets `text`, if the value holds text.
     [[nodiscard]] bool GetValue(std::string &text) const;
-    /// True, and sets `number`, when the value holds an integer.
+    /// True, and sets `number`, if the value holds an integer.
     [[nodiscard]] bool GetValue(int &number) const;
     /// The value as an SQL literal; text with a NUL in it as the text of its bytes; none as NULL.
     std::string ToLiteral() const;
@@ -33,16 +33,16 @@ private:
     std::variant<std::monostate, std::string, int> value_;
 };
 
-/// One row: named values in the order in which they were added. Empty means that there is no row.
+/// One row: named values in the order in which they were added. Empty means no row.
 class OVRADRCORE_EXPORT SqliteValueList {
 public:
     using Column = std::pair<std::string, SqliteValue>;
 
-    /// Adds a column; a name that is already there gets the new value.
+    /// Adds a column, or replaces the value of an existing one.
     void AddValue(const std::string &name, const SqliteValue &value);
     /// The column's value; none for an absent column.
     SqliteValue GetValue(const std::string &name) const;
-    /// True, and sets the target, when the column is there and convertible; an integer reads as its
+    /// True, and sets the target, if the column exists and is convertible; an integer reads as its
     /// decimal text, and decimal text that fits reads as an integer.
     [[nodiscard]] bool GetValue(const std::string &name, std::string &text) const;
     [[nodiscard]] bool GetValue(const std::string &name, int &number) const;
@@ -61,9 +61,9 @@ private:
 /// A record class that maps to a table row.
 class OVRADRCORE_EXPORT SqliteRecord {
 public:
-    /// The current values of those listed columns that the record knows.
+    /// The current values of the listed columns that the record has.
     virtual SqliteValueList ToSqliteValues(const std::vector<std::string> &fields) const = 0;
-    /// Loads the columns that the record knows; false when the row has none of them.
+    /// Loads the columns that the record has; false if the row has none of them.
     [[nodiscard]] virtual bool FromSqliteValues(const SqliteValueList &row) = 0;
     /// The record's column names, in its own order.
     virtual std::vector<std::string> ListSqliteField() const = 0;

@@ -9,8 +9,8 @@
 
 namespace OvraDRCore {
 
-/// A random UUID (version 4, RFC 9562) from the kernel's generator, in lower case; "" when the
-/// kernel gives no random bytes.
+/// A random UUID (version 4, RFC 9562) from the kernel's generator, in lower case; "" if the kernel
+/// provides no random bytes.
 [[nodiscard]] OVRADRCORE_EXPORT std::string GenerateUUID();
 
 /// The text of a value as a default string stream writes it. Only `int` is provided.
@@ -21,8 +21,8 @@ OVRADRCORE_EXPORT std::string ToString<int>(const int &value);
 
 namespace File {
 
-/// Makes `path` and the folders above it that are missing, each with exactly `mode`.
-/// \return true when `path` is a directory afterwards; one that exists keeps its mode.
+/// Creates `path` and its missing parent folders, each with exactly `mode`.
+/// \return true if `path` is a directory afterwards; an existing one keeps its mode.
 [[nodiscard]] OVRADRCORE_EXPORT bool CreateDir(const std::string &path, mode_t mode);
 
 } // namespace File

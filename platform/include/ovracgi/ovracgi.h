@@ -46,7 +46,7 @@ typedef struct OvraCgi {
 } OvraCgi;
 
 /* Opens the store. name: always "". A handle serves one thread. Returns 0 on success; a handle that
- * failed to open is safe to use (everything fails) and has to be freed like any other. */
+ * failed to open is safe to use (everything fails) and must be freed like any other. */
 OVRA_CGI_EXPORT int OvraCgiInit(const char *name, OvraCgi *handle);
 OVRA_CGI_EXPORT void OvraCgiFree(OvraCgi *handle);
 
@@ -54,18 +54,18 @@ OVRA_CGI_EXPORT void OvraCgiFree(OvraCgi *handle);
 OVRA_CGI_EXPORT int OvraCgiSetOption(OvraCgi *handle, int option, const void *value);
 /* JSON text of an object; valid for ever. */
 OVRA_CGI_EXPORT const char *OvraCgiLoginUIJsonConfigTemplate(void);
-/* Makes a session for handle->user and writes its id (at most 100 bytes with the closing NUL) into
- * sid. client: the numeric address to record; null takes that of OvraCgiGetRemoteIP. Returns 1 on
- * success. */
+/* Creates a session for handle->user and writes its id (at most 100 bytes with the closing NUL)
+ * into sid. client: the numeric address to record; null takes that of OvraCgiGetRemoteIP. Returns 1
+ * on success. */
 OVRA_CGI_EXPORT int OvraCgiLoginNoAuth(OvraCgi *handle, char *sid, size_t size, const char *client);
 
-/* Calls test(record, argument) for every live session and then removes, together, those for which
- * it returned 0. The record is lent for the call. The store is not locked meanwhile: test may use
- * it. Returns 0 on success; nothing is removed otherwise. */
+/* Calls test(record, argument) for every live session and then removes, in one step, those for
+ * which it returned 0. The record is valid during the call only. The store is not locked meanwhile:
+ * test may use it. Returns 0 on success; otherwise nothing is removed. */
 typedef int (*OvraCgiTest)(struct json_object *record, void *argument);
 OVRA_CGI_EXPORT int OvraCgiRemoveSessionByFunc(OvraCgi *handle, OvraCgiTest test, void *argument);
 /* Removes the session whose field equals value; field: OVRA_CGI_FIELD_SID, no other. Returns 0 on
- * success, also when there was none. */
+ * success, also if there was none. */
 OVRA_CGI_EXPORT int OvraCgiRemoveSessionByIndex(OvraCgi *handle, int field, const char *value);
 /* Finds a live session; *record is then owned by the caller (json_object_put). Returns 1 if found.
  */
@@ -74,8 +74,8 @@ OVRA_CGI_EXPORT int OvraCgiGetSessionBySID(OvraCgi *handle, const char *sid,
 /* Copies a field's text. Returns non-zero on success; 0 when absent or longer than the buffer. */
 OVRA_CGI_EXPORT int OvraCgiJsonRecordGet(struct json_object *record, int field, char *buffer,
                                          size_t size);
-/* The numeric address of the calling web client: the one that the calling thread serves, else the
- * environment variable REMOTE_ADDR. Returns its length, or -1 when there is no client. */
+/* The numeric address of the web client that the calling thread serves, else the environment
+ * variable REMOTE_ADDR. Returns its length, or -1 if there is no client. */
 OVRA_CGI_EXPORT int OvraCgiGetRemoteIP(char *buffer, size_t size);
 
 #ifdef __cplusplus

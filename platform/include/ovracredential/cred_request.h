@@ -10,7 +10,7 @@
 
 /// A credential: endpoint, account and password. Opaque.
 struct _tag_ovra_cred_;
-/// What a login granted: the access token (session id). Opaque.
+/// The result of a login: the access token (session id). Opaque.
 struct _tag_ovra_cred_sess_;
 using OVRACred = _tag_ovra_cred_;
 using OVRACredSess = _tag_ovra_cred_sess_;
@@ -18,13 +18,13 @@ using OVRACredSess = _tag_ovra_cred_sess_;
 #define OVRA_PLATFORM_EXPORT __attribute__((visibility("default")))
 
 extern "C" {
-/// A new empty object, owned by the caller; null when there is no memory. Free accepts null.
+/// A new empty object, owned by the caller; null if out of memory. Free accepts null.
 OVRA_PLATFORM_EXPORT OVRACred *OVRACredAlloc(void);
 OVRA_PLATFORM_EXPORT void OVRACredFree(OVRACred *cred);
 OVRA_PLATFORM_EXPORT OVRACredSess *OVRACredSessAlloc(void);
 OVRA_PLATFORM_EXPORT void OVRACredSessFree(OVRACredSess *sess);
 
-// Items: 0 when the item was taken, otherwise it is refused and the object is unchanged.
+// Items: 0 if the item was accepted; otherwise it is rejected and the object is unchanged.
 OVRA_PLATFORM_EXPORT int OVRACredItemSetProtocol(OVRACred *cred, const char *protocol);
 OVRA_PLATFORM_EXPORT int OVRACredItemSetHost(OVRACred *cred, const char *host);
 OVRA_PLATFORM_EXPORT int OVRACredItemSetPort(OVRACred *cred, int port);
@@ -35,8 +35,9 @@ OVRA_PLATFORM_EXPORT int OVRACredSessItemSetAccessToken(OVRACredSess *sess, cons
 
 namespace OVRA {
 
-/// One request. Operations that return int return non-zero on success; GetError() tells why not.
-/// Nothing throws. An object is for one thread at a time; any number of objects work at once.
+/// One request. Operations that return int return non-zero on success; otherwise GetError() says
+/// why. Nothing throws. An object is for one thread at a time; different objects can be used
+/// concurrently.
 class OVRA_PLATFORM_EXPORT CredRequest {
 public:
     CredRequest();
@@ -44,20 +45,21 @@ public:
     CredRequest(const CredRequest &) = delete;
     CredRequest &operator=(const CredRequest &) = delete;
 
-    /// \param protocol  "http", "https", or "flk" for an alias of the relay service, which is asked
-    ///                  when the request is sent
+    /// \param protocol  "http", "https", or "flk" for a relay alias, which is looked up when the
+    ///                  request is sent
     /// \param address   a host name in ASCII, an IPv4 or an IPv6 address, or the alias
     /// \param path      relative to the root of the host: letters, digits and "-._/"
     int SetURL(const std::string &protocol, const std::string &address, int port,
                const std::string &path);
-    /// \param seconds  bound on the whole exchange, connecting included; 1 to 86,400. 60 unless set
+    /// \param seconds  time-out for the whole exchange, connecting included; 1 to 86,400. 60 unless
+    ///                 set
     int SetDefaultTimeout(long seconds);
-    /// \param seconds  bound on the whole exchange for this request; replaces the default
+    /// \param seconds  time-out for the whole exchange of this request; replaces the default
     int SetResponseTimeout(long seconds);
-    /// Mode 2 seals parameters and session to the receiving appliance; 0 does so over http only,
-    /// and leaves it to TLS over https.
+    /// Mode 2 seals parameters and session to the receiving appliance; 0 does so over http only and
+    /// relies on TLS over https.
     int SetEncryptMode(int mode);
-    /// A regular file to send along, read when the request is sent; over https only.
+    /// A regular file to upload, read when the request is sent; over https only.
     /// \param name  the name under which it is sent
     int SetUploadFile(const std::string &path, const std::string &name);
     /// Makes `req` the call of `api` to the credential's endpoint under the session.
@@ -67,17 +69,16 @@ public:
                                    const std::string &api, int version, const std::string &method,
                                    const Json::Value &params);
     /// Sends and waits for the answer. A certificate that the system's store does not accept is
-    /// trusted on first use and must have the same key ever after (docs/wire.md).
-    /// \param reuse  a kept idle connection may carry it
-    /// \param mode   0: a request, the certificate is judged; 2: a probe, any answer of the entry
-    ///               point with an HTTP status below 500 other than 404 counts, the certificate
-    ///               is not judged, no secret is sent
+    /// trusted on first use and must keep the same key (docs/wire.md).
+    /// \param reuse  may reuse an idle connection
+    /// \param mode   0: a request, the certificate is verified; 2: a probe, any answer of the entry
+    ///               point with an HTTP status below 500 other than 404 counts, the certificate is
+    ///               not verified, no secret is sent
     int Process(bool reuse, int mode);
-    /// The document that the last request was answered with, opened when it came sealed; "" when it
-    /// got none.
+    /// The response document of the last request, unsealed if it was sealed; "" if there was none.
     std::string GetResponse() const;
-    /// The library's error number; 0 when there was none. 4: not permitted (HTTP 401, 403), 5:
-    /// cannot connect, 6: the endpoint's key is not the one trusted for it, 10: timed out.
+    /// The library's error number; 0 if there was none. 4: not permitted (HTTP 401, 403), 5: cannot
+    /// connect, 6: the endpoint's key is not the one trusted for it, 10: timed out.
     int GetError() const;
 
 private:
@@ -89,21 +90,21 @@ class OVRA_PLATFORM_EXPORT CredRequestUtil {
 public:
     /// Logs in with the credential's account and password.
     /// \param otp   one-time code, or ""
-    /// \param sess  takes the granted access token
-    /// \param out   receives the response document, also when the login was refused; when the call
-    ///              did not go through, one with error 100 and the message {"cred_error", "text"}
-    /// \return non-zero when the call went through, whatever the answer says.
+    /// \param sess  receives the granted access token
+    /// \param out   receives the response document, also if the login was refused; if the call
+    ///              failed, one with error 100 and the message {"cred_error", "text"}
+    /// \return non-zero if the call got an answer, whatever it says.
     /// Waits 60 seconds at most.
     static int LoginWithOTP(OVRACred *cred, const std::string &otp, OVRACredSess *sess,
                             Json::Value *out);
-    /// Ends the session that LoginWithOTP() got; the token is gone afterwards in any case. Waits 5
-    /// seconds at most. \return non-zero when the remote confirmed it.
+    /// Ends the session obtained by LoginWithOTP(); the token is cleared in any case. Waits 5
+    /// seconds at most. \return non-zero if the remote confirmed it.
     static int Logout(OVRACred *cred, OVRACredSess *sess);
 };
 
 class OVRA_PLATFORM_EXPORT CredRequestFarlink {
 public:
-    /// Asks the relay service where `alias` is reached now.
+    /// Asks the relay service where `alias` can be reached now.
     /// \param info     receives an object with "host", "protocol" and "port"
     /// \param options  reserved, null
     /// \return non-zero on success.

@@ -18,7 +18,7 @@ extern "C" {
 
 typedef struct OLIBNetInterface {
     char name[64];
-    char address[64]; /* numeric text; "" when it has none */
+    char address[64]; /* numeric text; "" if it has none */
     int status;
 } OLIBNetInterface;
 
@@ -26,7 +26,7 @@ typedef struct OLIBNetInterface {
  * PPP addresses are left out. Returns how many entries were filled, or -1. */
 OVRA_NET_EXPORT int OLIBNetGetInterfaceInfo(OLIBNetInterface *table, int size, int selector);
 
-/* 1 when the PPPoE link `index` (1 is the first) is up, otherwise 0. */
+/* 1 if the PPPoE link `index` (1 is the first) is up, otherwise 0. */
 OVRA_NET_EXPORT int OVRAPPPoECheckStatus(int index);
 /* Writes the local address of the first PPPoE link that is up. The last two: 0. Returns 0 on
  * success. */

@@ -10,7 +10,7 @@ public:
     Talo();
     ~Talo(); // NOLINT(performance-trivially-destructible): the appliance's library exports it
 
-    /// -1 when unknown.
+    /// -1 if unknown.
     int GetHttpPort();
     int GetHttpsPort();
 };

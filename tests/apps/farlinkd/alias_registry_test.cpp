@@ -16,7 +16,7 @@ using Enrolment = AliasRegistry::Enrolment;
 constexpr char kFile[] = "/usr/ovra/aliases";
 constexpr AliasRegistry::Limits kLimits{6000, 6002, std::chrono::seconds(100), 2};
 
-/// The port that the key got for the alias, or minus the enrolment.
+/// The port assigned to the key for the alias, or the negated enrolment result.
 int enrol(AliasRegistry &registry, const std::string &name, const std::string &key,
           std::int64_t now) {
     Alias alias;

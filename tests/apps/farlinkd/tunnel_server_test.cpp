@@ -38,7 +38,7 @@ void say(const UniqueFd &fd, const std::string &text) {
     }
 }
 
-/// What comes until the other end closes, or 10 seconds have passed without a byte ("timeout").
+/// Reads until the other end closes, or 10 seconds pass without a byte ("timeout").
 std::string hearAll(const UniqueFd &fd) {
     std::string all;
     std::string buffer(1 << 16, '\0');
@@ -70,7 +70,7 @@ protected:
         ASSERT_TRUE(server->start(std::move(*tunnel)));
         server->open("nas", std::move(*callers));
     }
-    /// The caller that was announced since the last time.
+    /// The caller announced since the last call.
     std::string caller() {
         std::unique_lock lock(mutex);
         announced.wait_for(lock, std::chrono::seconds(10), [this] { return !rung.empty(); });
@@ -100,7 +100,7 @@ TEST_F(ThroughTheTunnelServer, EveryByteGoesThroughBothWaysAlsoAfterOneEndHasFin
         much[i] = static_cast<char>(i * 2654435761U >> 24U);
     }
     UniqueFd client = dial(callerPort);
-    say(client, "early"); // before anybody is there
+    say(client, "early"); // before the appliance connects
     UniqueFd appliance = answer(caller());
     std::thread talk([&] {
         say(client, much);

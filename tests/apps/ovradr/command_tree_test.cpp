@@ -20,7 +20,7 @@ using Names = std::set<std::string>;
 
 constexpr char kPage[] = "docs/ovradr.md";
 
-/// What a piece of code in a page says about the program.
+/// The statement of a code span in a page about the program.
 struct Usage {
     std::string command; ///< "cred create"; "" for the program itself
     std::string rest;    ///< what follows the command
@@ -37,7 +37,7 @@ Names optionsIn(const std::string &text) {
     return names;
 }
 
-/// What a link to the heading ends with.
+/// The anchor of a heading.
 std::string anchorOf(const std::string &heading) {
     std::string anchor = "#";
     for (const char c : heading) {
@@ -57,7 +57,7 @@ protected:
         collect(app_, "");
     }
 
-    /// Nothing when the code does not begin with the program's name.
+    /// std::nullopt if the code does not begin with the program's name.
     std::optional<Usage> usageIn(const std::string &code) {
         static const std::regex kUsage("^(?:[a-z0-9-]*[#$] )?ovradr( .*)?$");
         static const std::regex kWord("[a-z]+");
@@ -93,7 +93,7 @@ protected:
         return usages;
     }
 
-    /// The options in a section that stand in no usage.
+    /// The options of a section that are in no usage line.
     Names looseOptionsIn(const DocPage::Section &section) {
         Names options;
         for (const std::string &code : codeIn(section.text)) {
@@ -104,8 +104,8 @@ protected:
         return options;
     }
 
-    /// What the page says that the command has: options, and words of its usage.
-    /// \return false when no section names the command
+    /// The options and usage words that the page documents for the command.
+    /// \return false if no section names the command
     bool readAbout(const std::string &command, const DocPage &page, Names &options,
                    std::string &usageText) {
         bool named = false;

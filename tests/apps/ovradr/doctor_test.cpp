@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What the program tells about a paired node that fails as it is told.
+// The program's diagnosis of a paired node with scripted failures.
 #include "program.h"
 #include "support/local_node.h"
 #include "support/remote_node.h"

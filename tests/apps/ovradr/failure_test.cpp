@@ -12,7 +12,7 @@ namespace {
 
 constexpr int kMaxCode = 999;
 
-/// What a code means, as a row of the table.
+/// The meaning of a code, as a row of the table.
 std::string rowOf(const Failure &failure) {
     return "| " + std::to_string(failure.code) + " | `" + failure.name + "` | " +
            std::to_string(static_cast<int>(failure.exit)) + " | " + failure.message + " |";

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What becomes of rows and sessions when a credential is changed, deleted, or half so.
+// The fate of rows and sessions when a credential is changed or deleted, completely or partly.
 #include "program.h"
 #include "shared/pending_releases.h"
 #include "support/local_node.h"
@@ -26,8 +26,8 @@ using OvraTest::RemoteNode;
 
 constexpr const char *kDead = R"({"success":false,"error":{"code":119}})";
 
-/// A credential "c1" with the session "old"; the remote grants "granted" and forgets what it is
-/// told to delete.
+/// A credential "c1" with the session "old"; the remote grants "granted" and deletes sessions on
+/// request.
 class Life : public testing::Test {
 protected:
     Life() {
@@ -52,7 +52,7 @@ protected:
         }
     }
 
-    /// Kills the program at the call that is to be its last one.
+    /// Kills the program at its intended last call.
     void count() {
         if (++calls == fatal) {
             while (victim == 0) {
@@ -74,8 +74,8 @@ protected:
         return change({"create", "https://127.0.0.1:" + std::to_string(remote.port())});
     }
 
-    /// Runs the program and kills it when the remote gets the call with that number, before it is
-    /// answered; 0: never.
+    /// Runs the program and kills it when the remote gets the call with that number, before the
+    /// answer; 0: never.
     void runUntil(const Arguments &arguments, int call) {
         for (const char *method :
              {"probe", "login", "info", "create", "test_privilege", "logout"}) {
@@ -171,7 +171,7 @@ TEST_F(Life, ACommandThatIsKilledAnywhereLeavesTheOldOrTheNewStateAndNoSessionUn
 
 TEST_F(Life, ARemoteThatDiesBetweenTheGrantAndTheRowChangesNothing) {
     for (const bool update : {true, false}) {
-        // Before an update the session of before is looked at; then comes the one that was granted.
+        // An update first looks up the previous session, then the granted one.
         std::atomic<int> looks = update ? 2 : 1;
         RemoteNode dying;
         dying.answer("login", R"({"success":true,"data":{"sid":"login-session"}})");
@@ -191,7 +191,7 @@ TEST_F(Life, ARemoteThatDiesBetweenTheGrantAndTheRowChangesNothing) {
 }
 
 TEST_F(Life, WhatIsStillNeededIsNotReleased) {
-    // As a deletion leaves it that was killed before the row.
+    // The state left by a deletion killed before removing the row.
     PendingRelease note{"old", OvraDRNode::Conn::https("127.0.0.1", remote.port()), "n1", "c1"};
     ASSERT_TRUE(PendingReleases().note(note));
     EXPECT_EQ(
@@ -202,7 +202,7 @@ TEST_F(Life, WhatIsStillNeededIsNotReleased) {
 }
 
 TEST_F(Life, ASessionIsNotReleasedWhileACredentialIsMadeWithIt) {
-    // The remote grants the session again that is still to be released there.
+    // The remote grants the session whose release is still pending.
     ASSERT_TRUE(PendingReleases().note(
         {"granted", OvraDRNode::Conn::https("127.0.0.1", remote.port()), "n1", "c0"}));
     std::optional<Program> releasing;

@@ -22,11 +22,11 @@ TEST(Output, NothingThatATerminalObeysGetsThrough) {
         {"\xC2\x9B"
          "31m",
          "\\u009b31m"},                                              // the one-byte form of ESC [
-        {std::string("\xE2\x80") + "\xAEgpj.exe", "\\u202egpj.exe"}, // turns the rest around
+        {std::string("\xE2\x80") + "\xAEgpj.exe", "\\u202egpj.exe"}, // reverses the rest
         {"a\xE2\x80\xA8"
          "b",
          "a\\u2028b"},                                         // a line break
-        {"\xFF\xC3(", "\\xff\\xc3("},                          // no UTF-8
+        {"\xFF\xC3(", "\\xff\\xc3("},                          // not UTF-8
         {"\xC0\xAF\xED\xA0\x80", "\\xc0\\xaf\\xed\\xa0\\x80"}, // overlong, surrogate
         {"cut \xE2\x82", "cut \\xe2\\x82"},
     };

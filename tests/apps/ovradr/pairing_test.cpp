@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// The program against a node that answers as it is told.
+// The program against a node with scripted answers.
 #include "program.h"
 #include "support/local_node.h"
 #include "support/remote_node.h"
@@ -37,7 +37,7 @@ protected:
         return arguments;
     }
 
-    /// Pairs, and fails the test when that does not work.
+    /// Pairs, and fails the test if that does not work.
     Result pair(const Arguments &more = {}) const {
         Arguments arguments =
             create({"--password-stdin", "--json", "--fingerprint", remote.server.fingerprint()});
@@ -182,7 +182,7 @@ TEST_F(Pairing, TheOneTimeCodeCannotBeSeenByOtherProcesses) {
         arguments.insert(arguments.end(), code.begin(), code.end());
         Program program(arguments, "secret word\n");
         const std::string proc = "/proc/" + std::to_string(program.pid());
-        // It waits for the silent server; a moment after its start the code has to be gone.
+        // It waits for the silent server; shortly after its start the code must be gone.
         std::string seen;
         for (int i = 0; i < 500 && seen.find("******") == std::string::npos; ++i) {
             std::this_thread::sleep_for(std::chrono::milliseconds(10));

@@ -111,8 +111,7 @@ Terminal::Terminal(const Arguments &arguments) {
     if (pid_ == 0) {
         close(master_);
         login_tty(slave_);
-        std::signal(SIGINT,
-                    SIG_DFL); // who starts the tests in the background ignores it, and all below
+        std::signal(SIGINT, SIG_DFL); // inherited as ignored if the tests run in the background
         execute(arguments);
     }
 }

@@ -13,18 +13,17 @@ namespace OvradrTest {
 
 using Arguments = std::vector<std::string>;
 
-/// What the program said and how it ended; exit -1: by a signal, or it had to be killed.
+/// The program's output and exit code; -1: ended by a signal, or killed after the time-out.
 struct Result {
     int exit = -1;
     std::string out;
     std::string err;
 
-    /// Standard output as one JSON document; null when it is anything else.
+    /// Standard output as one JSON document; null if it is anything else.
     Json::Value json() const;
 };
 
-/// The program, running with `input` as its standard input. Killed when it is still running at the
-/// end.
+/// The program, running with `input` as its standard input. Killed if still running on destruction.
 class Program {
 public:
     explicit Program(const Arguments &arguments, const std::string &input = "");
@@ -33,7 +32,7 @@ public:
     ~Program();
 
     pid_t pid() const { return pid_; }
-    /// Waits, 30 seconds at most.
+    /// Waits 30 seconds at most.
     Result finish();
 
 private:
@@ -45,7 +44,7 @@ private:
 /// Runs the program to its end.
 Result run(const Arguments &arguments, const std::string &input = "");
 
-/// The program on a terminal of its own, with somebody who reads and types.
+/// The program on its own terminal, with simulated input.
 class Terminal {
 public:
     explicit Terminal(const Arguments &arguments);
@@ -53,8 +52,8 @@ public:
     Terminal &operator=(const Terminal &) = delete;
     ~Terminal();
 
-    /// Reads on until the screen shows `text` behind what was waited for before; false when it did
-    /// not within 10 seconds.
+    /// Reads until the screen shows `text` after the previously awaited text; false after 10
+    /// seconds.
     bool shows(const std::string &text);
     void type(const std::string &text) const;
     bool echoes() const;

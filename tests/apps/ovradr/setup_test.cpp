@@ -41,7 +41,7 @@ std::map<std::string, std::string> filesOf(const std::string &folder) {
     return files;
 }
 
-/// A made-up step's "made" in a set-up's answer.
+/// The "made" member of a set-up step in the answer.
 bool made(const Json::Value &answer, const std::string &what) {
     for (const Json::Value &step : answer["data"]["steps"]) {
         if (step["what"] == what) {

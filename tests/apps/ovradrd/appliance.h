@@ -13,18 +13,18 @@
 
 namespace OvraTest {
 
-/// What came back from the web server.
+/// The web server's reply.
 struct Reply {
     long status = 0; ///< of HTTP; 0: no answer
     std::string text;
     Json::Value document;
 
-    /// The error code; 0 for a success, -1 when it is no reply document.
+    /// The error code; 0 for success, -1 if it is not a reply document.
     int code() const;
     const Json::Value &data() const { return document["data"]; }
 };
 
-/// What an HTTP client does; by default it posts a form over TLS on a connection of its own.
+/// The behaviour of an HTTP client; by default it posts a form over TLS on a new connection.
 struct HttpCall {
     std::string path = "/webapi/query.cgi";
     std::string body;
@@ -34,13 +34,13 @@ struct HttpCall {
     bool chunked = false;
 };
 
-/// A scene with an appliance that is set up, in the file system view of the test, and a daemon in
-/// this process that serves it on 127.0.0.1 at ports of its own.
+/// A fixture with an appliance set up in the test's sandbox, and a daemon in this process that
+/// serves it on 127.0.0.1 at its own ports.
 class Appliance : public testing::Test {
 public:
     static constexpr char kPassword[] = "correct horse";
 
-    /// Makes what set-up makes. For scenes that need no daemon.
+    /// Creates what set-up creates. For tests that need no daemon.
     static void provision();
     static void addAccount(const std::string &name, bool administrator);
     /// A session without a log-in.
@@ -58,7 +58,7 @@ public:
 protected:
     void SetUp() override;
     void TearDown() override { daemon_.reset(); }
-    /// Starts the daemon anew.
+    /// Restarts the daemon.
     void restart(const OvraService::HttpLimits &limits, std::size_t testFiles = 16);
     Ovradrd::Daemon &daemon() { return *daemon_; }
 
@@ -77,11 +77,11 @@ public:
     RawConnection(const RawConnection &) = delete;
     ~RawConnection();
 
-    /// Whether the other end has neither closed nor said anything.
+    /// Whether the other end has neither closed nor sent anything.
     bool isOpen() const;
-    /// False when the other end is gone.
+    /// False if the other end is gone.
     bool send(const std::string &bytes) const;
-    /// What comes until the other end closes, or until the time is over.
+    /// Reads until the other end closes or the time-out expires.
     std::string readAll(std::chrono::milliseconds time) const;
     /// Whether the other end closes within the time.
     bool closesWithin(std::chrono::milliseconds time) const;

@@ -31,7 +31,7 @@ protected:
         setrlimit(RLIMIT_NOFILE, &limit);
         Appliance::SetUp();
     }
-    /// Whether a call is answered in good time.
+    /// Whether a call is answered in time.
     void expectQuickAnswer() {
         const auto begun = std::chrono::steady_clock::now();
         EXPECT_EQ(http({.body = kGetInfo}).code(), 0);
@@ -137,7 +137,7 @@ protected:
                            changed.notify_all();
                        });
     }
-    /// Whether so many replies had this code within some seconds.
+    /// Whether that many replies had this code within a few seconds.
     bool gets(int code, int count) {
         std::unique_lock lock(mutex);
         return changed.wait_for(lock, 5s, [&] { return replies[code] >= count; });

@@ -13,7 +13,7 @@ using OvraTest::json;
 using OvraTest::querySql;
 using OvraTest::Reply;
 
-/// The appliance, and another node "n1" that grants what it is asked for.
+/// The appliance, and another node "n1" that grants every request.
 class Credential : public Appliance {
 protected:
     void SetUp() override {
@@ -26,7 +26,7 @@ protected:
         remote.answer("login-sid create", R"({"success":true,"data":{"session":"granted"}})");
         remote.answer("temp_create", R"({"success":true,"data":{"session":"temporary"}})");
         remote.answer("get", R"({"success":true,"data":{"account":"joe"}})");
-        // What it answers over the credential to it.
+        // Its answers over the credential.
         remote.answer("granted create",
                       R"({"success":true,"data":{"src_cred":{"cred_id":"back"}}})");
         remote.answer("granted test_connection",
@@ -47,7 +47,7 @@ protected:
         params["cred_direction"] = "unidirection";
         return params;
     }
-    /// Makes a credential and returns its id.
+    /// Creates a credential and returns its id.
     std::string make() const {
         return ask("create", byAccount()).data()["src_cred"]["cred_id"].asString();
     }

@@ -22,7 +22,7 @@ using OvraTest::Reply;
 
 class Login : public Appliance {};
 
-/// What an authenticator shows now.
+/// The authenticator's current code.
 std::string codeOf(const std::string &secret) {
     char *key = nullptr;
     std::size_t size = 0;
@@ -66,7 +66,7 @@ TEST_F(Login, TellsWhyItRefusesOnlyToWhoKnowsThePassword) {
     EXPECT_EQ(login("plain", "wrong password").code(), 400);
     EXPECT_EQ(login("disabled", "wrong password").code(), 400);
     EXPECT_EQ(login("disabled", kPassword).code(), 401);
-    restart({}); // the throttle starts anew
+    restart({}); // resets the throttle
     EXPECT_EQ(login("local", kPassword).code(), 402);
     EXPECT_EQ(login("coded", kPassword).code(), 403);
     EXPECT_EQ(login("coded", kPassword, "000000").code(), 404);
@@ -95,8 +95,7 @@ TEST_F(Login, SlowsGuessesDownWhileOthersAreServed) {
         begun = std::chrono::steady_clock::now();
         EXPECT_EQ(login("alice", "wrong password").code(), 400);
     }
-    // As many as the server has threads for a port. They begin 1 s and 3 s after the last one
-    // began.
+    // As many as the server has threads per port. They begin 1 s and 3 s after the last one began.
     std::array<std::future<Reply>, 2> guesses;
     for (auto &guess : guesses) {
         guess = std::async(std::launch::async, [this] { return login("alice", "wrong password"); });

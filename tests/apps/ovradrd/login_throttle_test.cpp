@@ -14,12 +14,12 @@ using std::chrono::milliseconds;
 namespace {
 
 struct Throttle : testing::Test {
-    /// The milliseconds that a log-in has to wait; -1: it is turned away.
+    /// The delay of a log-in in milliseconds; -1: rejected.
     long admit(const std::string &account, const std::string &address) {
         const auto wait = throttle.admit(account, address);
         return wait ? static_cast<long>(wait->count()) : -1;
     }
-    /// A log-in that waits as it is told and then fails.
+    /// A log-in that waits as required and then fails.
     long fail(const std::string &account, const std::string &address) {
         const long wait = admit(account, address);
         now += milliseconds(wait);
@@ -66,7 +66,7 @@ TEST_F(Throttle, AMinuteTakesOneFailureBack) {
         fail("ann", "192.0.2.1");
     }
     now += std::chrono::seconds(119);
-    EXPECT_EQ(admit("ann", "192.0.2.1"), 0); // long since the last one, but it counts: 4 + 1
+    EXPECT_EQ(admit("ann", "192.0.2.1"), 0); // long after the last one, but it counts: 4 + 1
     EXPECT_EQ(admit("ann", "192.0.2.1"), 1000);
     now += std::chrono::hours(1);
     for (int i = 0; i < 3; ++i) {
@@ -81,7 +81,7 @@ TEST_F(Throttle, ASuccessClearsTheAccountButNotTheAddress) {
     admit("ann", "192.0.2.9");
     throttle.succeeded("ann", "192.0.2.9");
     EXPECT_EQ(admit("ann", "192.0.2.9"), 0);
-    // One's own account does not buy more guesses at others.
+    // Successes with one's own account allow no more guesses at others.
     fail("mallory", "192.0.2.1");
     throttle.succeeded("mallory", "192.0.2.1");
     EXPECT_EQ(admit("bob", "192.0.2.1"), 1000);
@@ -130,7 +130,7 @@ TEST(ThrottleThreads, CountEveryFailure) {
     }
     const auto wait = throttle.admit("ann", "192.0.2.1");
     ASSERT_TRUE(wait);
-    EXPECT_GT(*wait, milliseconds(250)); // the fourth waits for 250 ms, the fifth behind it
+    EXPECT_GT(*wait, milliseconds(250)); // the fourth waits for 250 ms, the fifth after it
 }
 
 } // namespace

@@ -22,7 +22,7 @@ namespace {
 using OvraTest::Appliance;
 using namespace std::chrono_literals;
 
-/// The real program, in a process of its own.
+/// The real program, in its own process.
 class Program {
 public:
     explicit Program(std::string argument = "") {
@@ -34,7 +34,7 @@ public:
         if (pid_ == 0) {
             dup2(ends[1], STDOUT_FILENO);
             dup2(ends[1], STDERR_FILENO);
-            // A daemon that is left by calls under way leaves their threads, on purpose.
+            // A daemon that exits with calls in progress abandons their threads, on purpose.
             setenv("TSAN_OPTIONS", "report_thread_leaks=0", 1);
             char program[] = OVRADRD_PROGRAM;
             std::array<char *, 3> argv{program, argument.empty() ? nullptr : argument.data()};
@@ -58,7 +58,7 @@ public:
         return fgets(text, sizeof(text), output_) != nullptr ? text : "";
     }
     void signal(int number) const { kill(pid_, number); }
-    /// The exit code; -1 when a signal ended it.
+    /// The exit code; -1 if ended by a signal.
     int wait() {
         int status = 0;
         waitpid(pid_, &status, 0);
@@ -90,7 +90,7 @@ protected:
         return "ovradrd: ready, https " + std::to_string(httpsPort()) + ", http " +
                std::to_string(httpPort()) + "\n";
     }
-    /// What a process of the appliance is told through the Unix socket.
+    /// The answer to a process of the appliance through the Unix socket.
     static Json::Value ask(const char *api, const char *method, const Json::Value &params = {}) {
         Json::Value reply;
         OVRA::APIRunner().Exec(reply, api, 1, method, params, "admin");

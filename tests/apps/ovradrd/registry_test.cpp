@@ -13,7 +13,7 @@ using OvraPlatform::APIQueue;
 using OvraPlatform::APIRegistry;
 using OvraPlatform::APIRight;
 
-/// As the table names a method.
+/// A method as named in the table.
 std::string nameOf(const std::string &api, int version, const std::string &method) {
     return "`" + api + "` " + std::to_string(version) + " `" + method + "`";
 }
@@ -58,7 +58,7 @@ TEST_F(Registry, IsDocumentedWithItsRightsAndQueues) {
                           << " | PARAMETERS | DATA |";
             continue;
         }
-        // Behind a semicolon stands what the handler itself asks for.
+        // After a semicolon follow the handler's own requirements.
         EXPECT_EQ(row->second[1].substr(0, row->second[1].find(';')), wordOf(method.right))
             << "docs/ovradrd.md: correct the right of " << name;
         EXPECT_EQ(row->second[2], queueOf(method))

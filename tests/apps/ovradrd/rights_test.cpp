@@ -218,7 +218,7 @@ TEST_F(Node, FindsTheFirstEndpointThatItReaches) {
     EXPECT_EQ(reply.data(), params["conns"][1]);
 }
 
-/// What a process of the appliance asks through the library.
+/// A call by a process of the appliance through the library.
 Json::Value askLocally(const char *api, const char *method, const char *params = "{}") {
     Json::Value reply;
     OVRA::APIRunner().Exec(reply, api, 1, method, json(params), "admin");

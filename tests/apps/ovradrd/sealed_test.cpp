@@ -41,7 +41,7 @@ protected:
     Reply post(const WireCall &outer) const {
         return http({.body = encodeForm(outer).value(), .tls = false});
     }
-    /// The document inside a sealed reply; null when it is none.
+    /// The document inside a sealed reply; null if there is none.
     Json::Value open(const Reply &reply) const {
         const auto text = openReply(replyKey, reply.document);
         return text ? json(*text) : Json::Value();

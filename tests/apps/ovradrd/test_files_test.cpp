@@ -28,7 +28,7 @@ protected:
         std::filesystem::create_directories(kFolder);
         std::ofstream(named('0')) << kContent;
     }
-    /// The whole answer to a request whose path is sent as it stands.
+    /// The whole answer to a request whose path is sent unchanged.
     std::string get(const std::string &path, const std::string &headers = "",
                     const std::string &method = "GET") const {
         const RawConnection client(port(false));

@@ -18,7 +18,7 @@ using OvraService::Connections;
 using Phase = Connections::Phase;
 using namespace std::chrono_literals;
 
-/// One end of a pair of sockets stands for a client's connection.
+/// One end of a socket pair represents a client's connection.
 class Client {
 public:
     Client(Connections &table, const std::string &name)
@@ -36,7 +36,7 @@ public:
 
     void enter(Phase phase) { table_.enter(connection_, phase); }
     void beginRequest() { table_.beginRequest(connection_); }
-    /// Whether the connection was shut down, or is within the time.
+    /// Whether the connection is shut down within the time.
     bool isShut(std::chrono::milliseconds wait = 0ms) const {
         pollfd end{ends_[1], POLLIN, 0};
         return poll(&end, 1, static_cast<int>(wait.count())) == 1;

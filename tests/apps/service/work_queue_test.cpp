@@ -13,7 +13,7 @@ namespace {
 using OvraService::WorkQueue;
 using namespace std::chrono_literals;
 
-/// Holds a thread of a queue until it is told to let go.
+/// Blocks a thread of a queue until released.
 class Plug {
 public:
     WorkQueue::Job job() {

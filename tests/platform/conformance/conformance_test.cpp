@@ -1,8 +1,8 @@
 // SPDX-License-Identifier: Apache-2.0
 
-// What the node library relies on of the platform interfaces, whoever provides them. On an
-// appliance these may be run where they are: they write to a temporary folder only, and their login
-// sessions belong to an application of their own and are removed.
+// The node library's requirements on any implementation of the platform interfaces. These tests may
+// run on an appliance: they write to a temporary folder only, and their login sessions belong to a
+// separate application and are removed.
 
 #include <ovracgi/ovracgi.h>
 #include <ovracore/ovracore.h>
@@ -27,9 +27,9 @@ namespace {
 
 constexpr const char *kApplication = "OvraDRNode conformance";
 
-/// Nobody listens there.
+/// Nothing listens there.
 constexpr int kClosedPort = 1;
-/// Cannot connect, and timed out: one of the two is how an endpoint that does not answer shows.
+/// Cannot connect, or timed out: an endpoint that does not answer gives one of the two.
 const std::set<int> kNoAnswer{5, 10};
 
 using Buffer = std::array<char, 1024>;
@@ -44,7 +44,7 @@ struct Store : OvraCgi {
     Store &operator=(const Store &) = delete;
 };
 
-/// A session as the node library makes them, in the same order.
+/// A session created as by the node library, in the same order.
 std::string login(const char *extra) {
     const int on = 1;
     const int timeout = -1;
@@ -78,7 +78,7 @@ std::string fieldOf(const std::string &sid, int number) {
     return value;
 }
 
-/// Collects the session ids of our application into the set that it is given, and keeps all.
+/// Collects the session ids of our application into the given set, and keeps all.
 int collect(json_object *record, void *argument) {
     if (field(record, 13) == kApplication) {
         static_cast<std::set<std::string> *>(argument)->insert(field(record, 2));
@@ -86,7 +86,7 @@ int collect(json_object *record, void *argument) {
     return 1;
 }
 
-/// Removes what belongs to our application and names this node.
+/// Removes the sessions of our application that name this node.
 int removeNode(json_object *record, void *argument) {
     const bool ours = field(record, 13) == kApplication;
     return ours && field(record, 14) == static_cast<const char *>(argument) ? 0 : 1;

@@ -16,7 +16,7 @@ using namespace OvraPlatform;
 
 constexpr UnixMillis kStart = 1'700'000'000'000;
 
-/// A system clock and a steady clock that stand still until they are moved.
+/// A system clock and a steady clock that stand still until advanced.
 struct FakeTime {
     UnixMillis wall = kStart;
     UnixMillis steady = 5000;
@@ -47,7 +47,7 @@ protected:
         call.sid = "session-1";
         return call;
     }
-    /// What travels: the call with nothing but its envelope.
+    /// The transmitted request: the call with only its envelope.
     static WireCall seal(const SealKeyPair &keys, const WireCall &call, UnixMillis time,
                          ReplyKey &replyKey) {
         WireCall outer{{call.api, call.version, call.method}};
@@ -118,7 +118,7 @@ TEST_F(SealScene, DoesNotShowTheLengthOfAPassword) {
 
 TEST_F(SealScene, BringsTheReplyBackToItsSenderOnly) {
     const std::string document = R"({"success":true,"data":{"sid":"s"}})";
-    newKeys(); // libsodium is ready
+    newKeys(); // initialises libsodium
     randombytes_buf(replyKey_.data(), replyKey_.size());
     const std::string text = sealReply(replyKey_, document);
     EXPECT_EQ(text.find("sid"), std::string::npos);

@@ -24,8 +24,7 @@ struct FreeObjects {
     void operator()(OVRACredSess *sess) const { OVRACredSessFree(sess); }
 };
 
-/// A daemon that grants "granted-sid" to ann with the password hunter2, and answers with what it
-/// was asked.
+/// A daemon that grants "granted-sid" to ann with the password hunter2, and echoes requests.
 std::string serve(const WireCall &call) {
     Json::Value data;
     if (call.method == "login") {

@@ -57,7 +57,7 @@ TEST_F(TrustScene, KeepsLinesThatItDoesNotUnderstand) {
     const std::string strange = "# a comment\n\nhttps://a:1 SHA256:short\nrubbish\n"
                                 "https://b:1  " +
                                 fingerprint("b") + "\n";
-    OvraTest::writeFile(file(), strange + "https://c:1 " + fingerprint("c")); // no end of line
+    OvraTest::writeFile(file(), strange + "https://c:1 " + fingerprint("c")); // no newline
     EXPECT_EQ(store().lookup("https://a:1", fingerprint("a")), TrustVerdict::kUnknown);
     EXPECT_EQ(store().lookup("https://b:1", fingerprint("b")), TrustVerdict::kUnknown);
     EXPECT_EQ(store().lookup("https://c:1", fingerprint("c")), TrustVerdict::kTrusted);

@@ -84,7 +84,7 @@ TEST_F(Program, InheritsNeitherDescriptorsNorSignalSettings) {
     sigaddset(&blocked, SIGTERM);
     pthread_sigmask(SIG_BLOCK, &blocked, nullptr);
     std::signal(SIGPIPE, SIG_IGN);
-    FILE *const outer = OLIBCPopen("/bin/cat", "w", nullptr); // one more pipe that is open
+    FILE *const outer = OLIBCPopen("/bin/cat", "w", nullptr); // another open pipe
     const std::string descriptors = outputOf("/bin/ls", "/proc/self/fd");
     const std::string input = outputOf("/bin/readlink", "/proc/self/fd/0");
     const std::string status = outputOf("/bin/cat", "/proc/self/status");

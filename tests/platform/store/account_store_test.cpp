@@ -90,7 +90,7 @@ TEST_F(Accounts, LogInAsTheirStateAllows) {
 TEST_F(Accounts, AnUnknownNameTakesAsLongAsAWrongPassword) {
     ASSERT_TRUE(store().add("ann", kPassword, false));
     verify("warm", "up");
-    // What this thread works, and not what passes while it waits for a processor.
+    // CPU time of this thread, not wall-clock time spent waiting for a processor.
     const auto cost = [&](const char *name) {
         const double before = threadSeconds();
         verify(name, "wrong password");
@@ -121,7 +121,7 @@ TEST_F(Accounts, ACodeIsAcceptedOnceAndNoEarlierOneAfterIt) {
 
 TEST_F(Accounts, OfTwoLogInsAtOnceWithTheSameCodeOneIsLetIn) {
     ASSERT_TRUE(store().add("ann", kPassword, false) && store().setTotp("ann", kSecret));
-    // The store asks for the time when it has read the account and is about to check the code.
+    // The store reads the clock after it has read the account and before it checks the code.
     LoginResult meanwhile = LoginResult::kStoreFailed;
     AccountStore slower(file(), [&] {
         meanwhile = verify("ann", kPassword, kCode);
@@ -213,7 +213,7 @@ TEST_F(Accounts, ADamagedStoreLetsNobodyIn) {
     EXPECT_FALSE(accounts.exists("ann"));
     EXPECT_FALSE(accounts.add("ann", kPassword, true));
     EXPECT_NE(accounts.error().find("damaged"), std::string::npos);
-    // A session store in its place is refused as well: kinds are told apart.
+    // A session store in its place is refused as well: the kinds are distinguished.
     std::filesystem::remove(file());
     ASSERT_TRUE(RawSqlite(file()).run("CREATE TABLE account (name, hash); PRAGMA user_version = 1; "
                                       "PRAGMA application_id = 1332106085"));

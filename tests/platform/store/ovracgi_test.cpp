@@ -19,7 +19,7 @@ using OvraTest::writeFile;
 
 namespace {
 
-/// An opened handle, as the node library uses it: one for each thing done.
+/// An opened handle, as the node library uses it: one per operation.
 struct Handle : OvraCgi {
     Handle() { opened = OvraCgiInit("", this); }
     ~Handle() { OvraCgiFree(this); }

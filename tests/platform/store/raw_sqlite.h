@@ -8,7 +8,7 @@
 
 namespace OvraTest {
 
-/// A connection of the scene's own, beside the one of the store that is tested.
+/// The test's own connection, besides that of the tested store.
 class RawSqlite {
 public:
     explicit RawSqlite(const std::string &path) {

@@ -134,7 +134,7 @@ TEST_F(Sessions, AreLimitedPerUser) {
     EXPECT_TRUE(sessions.create({"bob", "", "", "", "", -1, true}));
     EXPECT_EQ(sessions.error(), "");
     time += 100;
-    EXPECT_TRUE(sessions.create({"ann", "", "", "", "", -1, true})); // the expired ones are swept
+    EXPECT_TRUE(sessions.create({"ann", "", "", "", "", -1, true})); // removes the expired ones
 }
 
 TEST_F(Sessions, AreLimitedInAll) {

@@ -14,7 +14,7 @@ namespace {
 constexpr char kSecret[] = "GEZDGNBVGY3TQOJQGEZDGNBVGY3TQOJQ"; // "12345678901234567890"
 
 TEST(Totp, AgreesWithTheTestVectorsOfRfc6238) {
-    // RFC 6238, appendix B, SHA-1; of its eight digits the last six.
+    // RFC 6238, appendix B, SHA-1; the last six of its eight digits.
     const struct {
         std::time_t time;
         const char *code;
@@ -26,7 +26,7 @@ TEST(Totp, AgreesWithTheTestVectorsOfRfc6238) {
 }
 
 TEST(Totp, TakesOneStepOfDriftEachWayAndNoStepTwice) {
-    constexpr std::int64_t kStep = 1111111111 / 30; // 1111111109 lies in the step before
+    constexpr std::int64_t kStep = 1111111111 / 30; // 1111111109 is in the previous step
     EXPECT_EQ(matchTotp(kSecret, "050471", (kStep - 1) * 30), kStep);
     EXPECT_EQ(matchTotp(kSecret, "050471", (kStep + 2) * 30 - 1), kStep);
     EXPECT_FALSE(matchTotp(kSecret, "050471", (kStep - 1) * 30 - 1));

@@ -54,7 +54,7 @@ OvraBase::UniqueFd connectRaw() {
                                                               : OvraBase::UniqueFd();
 }
 
-/// What the server answers to these bytes; "" when it just hangs up.
+/// The server's answer to these bytes; "" if it just closes the connection.
 std::string answerTo(const std::string &bytes) {
     const OvraBase::UniqueFd fd = connectRaw();
     send(fd.get(), bytes.data(), bytes.size(), MSG_NOSIGNAL);
@@ -145,7 +145,7 @@ TEST_F(LocalCallScene, RefusesTheProcessesOfOtherUsers) {
     }
     LocalServer server(kSocketFile, echo);
     ASSERT_TRUE(server.start());
-    // The modes alone would keep them out: open them, so that the peer check has to.
+    // The modes alone would deny access: relax them, so that the peer check has to.
     ASSERT_EQ(chmod(kStateDir, 0755), 0);
     ASSERT_EQ(chmod(kSocketFile, 0666), 0);
     constexpr int kNoOtherUser = 99;
@@ -222,7 +222,7 @@ TEST_F(LocalCallScene, StopsAtOnceButAnswersTheCallUnderWay) {
         return echo(call);
     });
     ASSERT_TRUE(server.start());
-    const OvraBase::UniqueFd idle = connectRaw(); // says nothing, and must not hold up the stop
+    const OvraBase::UniqueFd idle = connectRaw(); // sends nothing, and must not delay the stop
     auto caller = std::async(std::launch::async, [] { return ask(); });
     entered.get_future().wait();
     const auto begin = std::chrono::steady_clock::now();

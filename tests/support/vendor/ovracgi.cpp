@@ -46,7 +46,7 @@ json_object *recordOf(const Session &session) {
     return record;
 }
 
-/// Whether the handle's store is open; sessions whose time is over are gone then.
+/// Whether the handle's store is open; removes expired sessions.
 bool open(const OvraCgi *handle) {
     if (handle->store == nullptr) {
         return false;

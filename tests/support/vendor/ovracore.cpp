@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 
-// Key-value files and programs with a pipe, for real.
+// Key-value files and programs with a pipe: real implementations.
 
 #include "stand_in.h"
 

@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 
-// Credential requests to remote appliances that are entries of a table.
+// Credential requests to remote appliances, which are entries of a table.
 
 #include "stand_in.h"
 
@@ -63,7 +63,7 @@ bool isLive(const OVRACredSess *sess) {
     return live;
 }
 
-/// An item as the C functions take it: refused when it is empty.
+/// An item as the C functions take it: rejected if empty.
 template <typename Object>
 int setItem(Object *object, std::string Object::*item, const char *value) {
     if (!isLive(object) || value == nullptr || *value == '\0') {
@@ -86,7 +86,7 @@ Json::Value refusal(int code) {
     return document;
 }
 
-/// 0 when the account may log in, else the code of the refusal.
+/// 0 if the account may log in, else the code of the refusal.
 int judge(const Remote &remote, const OVRACred &cred, const std::string &otp) {
     const auto found = remote.accounts.find(cred.account);
     if (found == remote.accounts.end() || found->second.password != cred.password) {

@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 
-// The appliance's interfaces and its PPPoE link, as the test says.
+// The appliance's interfaces and its PPPoE link, set by the test.
 
 #include "stand_in.h"
 

@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 
-// The appliance's serial number and host name, as the test says.
+// The appliance's serial number and host name, set by the test.
 
 #include "stand_in.h"
 

@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 
-// What the appliance's web server listens on, as the test says.
+// The ports of the appliance's web server, set by the test.
 
 #include "stand_in.h"
 

@@ -1,8 +1,8 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
-// What a test tells the stand-ins of the appliance's libraries, and what they have seen. Each
-// library owns its part; none is meant for several threads.
+// The inputs of the stand-ins for the vendor's libraries, and what they have recorded. Each library
+// owns its part; none is thread-safe.
 
 #include <json/value.h>
 
@@ -18,7 +18,7 @@ namespace OvraVendor {
 
 #define OVRA_VENDOR_EXPORT __attribute__((visibility("default")))
 
-/// Objects of one kind that the library under test has obtained and has to give back.
+/// Objects of one kind that the library under test has acquired and has to release.
 struct Live {
     int now = 0;
     int ever = 0;
@@ -73,7 +73,7 @@ OVRA_VENDOR_EXPORT CredentialLibrary &credentialLibrary();
 
 /// libwebapi-Talo5.so
 struct WebApiLibrary {
-    /// The local appliance's answer; without it there is nobody to ask.
+    /// The local appliance's answer; without it the call fails.
     std::function<Json::Value(const Call &, const std::string &user)> answer;
     Live runners;
 };
@@ -129,8 +129,7 @@ struct NetLibrary {
 };
 OVRA_VENDOR_EXPORT NetLibrary &netLibrary();
 
-/// Everything that was obtained and not given back, or given back wrongly, as text; "" when all is
-/// well.
+/// Everything that was not released, or released wrongly, as text; "" if nothing.
 inline std::string leftOver() {
     std::string text;
     const auto look = [&text](const char *name, const Live &live) {
