@@ -1,8 +1,8 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
-#include "service/startup.h"
 #include "service/http_server.h"
+#include "service/startup.h"
 
 #include <chrono>
 #include <cstddef>
