@@ -21,7 +21,7 @@ constexpr long kReasonSeconds = 5;
 constexpr int kProbe = 2;
 
 /// Asks once more, to learn what the probe of the library leaves out.
-Failure whyNotReachable(const Conn &conn) {
+Refusal whyNotReachable(const Conn &conn) {
     OVRA::CredRequest request;
     const bool answered =
         request.SetURL(conn.protocol, conn.addr, conn.port, "webapi/query.cgi") != 0 &&
@@ -34,7 +34,7 @@ Failure whyNotReachable(const Conn &conn) {
 }
 
 /// Asks the relay service once more, to learn why it named no endpoint.
-Failure relayFailure(const Conn &conn) {
+Refusal relayFailure(const Conn &conn) {
     std::string problem;
     const OvraPlatform::FarlinkSettings settings = OvraPlatform::readFarlinkSettings(problem);
     if (settings.host.empty()) {
@@ -56,8 +56,8 @@ Expected<Conn> directEndpoint(const Conn &conn) {
     return direct.isValid() ? Expected<Conn>(direct) : relayFailure(conn);
 }
 
-Trouble probeEndpoint(const Conn &conn) {
-    return OvraDRNode::BaseSender::IsConnectable(conn) ? Trouble() : whyNotReachable(conn);
+Expected<void> probeEndpoint(const Conn &conn) {
+    return OvraDRNode::BaseSender::IsConnectable(conn) ? Expected<void>() : whyNotReachable(conn);
 }
 
 std::string ownFingerprint(const Conn &conn) {

@@ -61,7 +61,7 @@ Expected<FarlinkSettings> parseServer(const std::string &text) {
     return FarlinkSettings{conn->addr, conn->port, ""};
 }
 
-Failure serviceFailure(const FarlinkSettings &settings, const FarlinkReply &reply) {
+Refusal serviceFailure(const FarlinkSettings &settings, const FarlinkReply &reply) {
     if (reply.error != CredError::kNone) {
         return endpointFailure(serverOf(settings), reply.error);
     }
@@ -69,13 +69,14 @@ Failure serviceFailure(const FarlinkSettings &settings, const FarlinkReply &repl
     const std::string why = reply.why();
     const std::size_t colon = why.rfind(": ");
     const int code = reply.response.getErrCode();
-    Failure found =
+    Refusal refusal =
         failure(code == APIError::kNoPermission ? ExitCode::kNotPermitted : ExitCode::kFailed,
                 "The relay service refuses: " + why.substr(0, colon) + ".",
                 colon == std::string::npos ? "Its log says more." : why.substr(colon + 2) + ".");
-    found.code = code;
-    found.hint.front() = static_cast<char>(std::toupper(found.hint.front()));
-    return found;
+    refusal.value().code = code;
+    std::string &hint = refusal.value().hint;
+    hint.front() = static_cast<char>(std::toupper(static_cast<unsigned char>(hint.front())));
+    return refusal;
 }
 
 Expected<FarlinkKey> ownKey() {
@@ -93,7 +94,7 @@ Response askDaemon() {
         OvraDRCore::Request("OVRA.Core.Farlink", 1, "get", Json::Value(Json::objectValue)));
 }
 
-Failure notWritten() {
+Refusal notWritten() {
     return failure(ExitCode::kNotSetUp,
                    std::string(OvraPlatform::kFarlinkFile) + " cannot be written.",
                    "Run the command as root, on a disk that is not full.");
@@ -102,12 +103,12 @@ Failure notWritten() {
 Outcome enable(const FarlinkOptions &options) {
     const Expected<FarlinkSettings> server = parseServer(options.server);
     if (!server) {
-        return server.failure();
+        return Refusal(server.error());
     }
     FarlinkSettings settings = *server;
     settings.alias = options.alias;
-    if (const Trouble trouble = trustPeer(serverOf(settings), options.fingerprint)) {
-        return *trouble;
+    if (const auto trusted = trustPeer(serverOf(settings), options.fingerprint); !trusted) {
+        return Refusal(trusted.error());
     }
     Report report;
     report.data["server"] = targetText(serverOf(settings));
@@ -115,7 +116,7 @@ Outcome enable(const FarlinkOptions &options) {
         // Whether it can be had is told now, and not in the log of the daemon.
         const Expected<FarlinkKey> key = ownKey();
         if (!key) {
-            return key.failure();
+            return Refusal(key.error());
         }
         const FarlinkReply reply = FarlinkClient(settings).enrol(*key);
         if (!reply.isSuccess()) {
@@ -144,7 +145,7 @@ Outcome disable(const FarlinkOptions &options) {
     if (options.release && !settings.alias.empty()) {
         const Expected<FarlinkKey> key = ownKey();
         if (!key) {
-            return key.failure();
+            return Refusal(key.error());
         }
         const FarlinkClient client(settings);
         FarlinkReply reply = client.enrol(*key);
@@ -152,10 +153,11 @@ Outcome disable(const FarlinkOptions &options) {
             reply = client.release(reply.response.getDataFieldtoStr("token"));
         }
         if (!reply.isSuccess()) {
-            Failure found = serviceFailure(settings, reply);
-            found.message = "The relay service is off, but still keeps the alias \"" +
-                            settings.alias + "\": " + found.message;
-            return found;
+            Refusal refusal = serviceFailure(settings, reply);
+            refusal.value().message.insert(
+                0,
+                "The relay service is off, but still keeps the alias \"" + settings.alias + "\": ");
+            return refusal;
         }
     }
     Report report;
