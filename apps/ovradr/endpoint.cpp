@@ -35,8 +35,8 @@ Refusal whyNotReachable(const Conn &conn) {
 
 /// Asks the relay service once more, to learn why it named no endpoint.
 Refusal relayFailure(const Conn &conn) {
-    std::string problem;
-    const OvraPlatform::FarlinkSettings settings = OvraPlatform::readFarlinkSettings(problem);
+    const auto settings =
+        OvraPlatform::readFarlinkSettings().value_or(OvraPlatform::FarlinkSettings());
     if (settings.host.empty()) {
         return failure(ExitCode::kNotReachable, "No relay service is set up on this appliance.",
                        "Run `ovradr farlink enable --server URL`.");
@@ -45,7 +45,7 @@ Refusal relayFailure(const Conn &conn) {
         OvraPlatform::FarlinkClient(settings).lookUp(conn.addr);
     return failure(ExitCode::kNotReachable,
                    targetText(conn) + " is not reached through " + settings.host +
-                       (reply.isSuccess() ? "" : ": " + reply.why()) + ".",
+                       (reply ? "" : ": " + reply.error().text) + ".",
                    "`ovradr farlink status`, here and over there, says more.");
 }
 

@@ -143,16 +143,18 @@ private:
     Expected<std::string> connect() { return connectAny(addresses_, conn_); }
 
     Expected<std::string> key() {
-        const PeerIdentity peer =
+        const auto met =
             OvraPlatform::peerFingerprint(conn_.protocol, conn_.addr, conn_.port, kMeetSeconds);
-        if (peer.error == CredError::kTrustUnavailable || peer.error == CredError::kOutOfMemory) {
-            return endpointFailure(conn_, peer.error);
+        if (met == tl::unexpected(CredError::kTrustUnavailable) ||
+            met == tl::unexpected(CredError::kOutOfMemory)) {
+            return endpointFailure(conn_, met.error());
         }
-        if (peer.error != CredError::kNone) {
+        if (!met) {
             return failure(ExitCode::kNoAppliance,
                            targetText(conn_) + ": what answers there shows no key.",
                            "Check protocol and port: HTTPS is 5001, HTTP 5000 as a rule.");
         }
+        const PeerIdentity &peer = *met;
         if (subject_.own) {
             return expectedKey(peer);
         }

@@ -126,11 +126,12 @@ std::string trustText(const PeerIdentity &identity) {
 }
 
 Expected<void> trustPeer(const Conn &conn, const std::string &expected) {
-    const PeerIdentity identity =
+    const auto met =
         OvraPlatform::peerFingerprint(conn.protocol, conn.addr, conn.port, kMeetSeconds);
-    if (identity.error != CredError::kNone) {
-        return endpointFailure(conn, identity.error);
+    if (!met) {
+        return endpointFailure(conn, met.error());
     }
+    const PeerIdentity &identity = *met;
     if (!expected.empty() && identity.fingerprint != expected) {
         return keyFailure(conn, identity, "is not the one that --fingerprint names",
                           "Do not go on before you know why.");

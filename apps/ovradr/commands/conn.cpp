@@ -18,7 +18,6 @@ namespace {
 
 using OvraDRNode::Conn;
 using OvraPlatform::CredError;
-using OvraPlatform::PeerIdentity;
 using OvraPlatform::TrustStore;
 
 Outcome local() {
@@ -48,21 +47,20 @@ Outcome test(const Conn &conn) {
     const auto took = std::chrono::duration_cast<std::chrono::milliseconds>(
                           std::chrono::steady_clock::now() - start)
                           .count();
-    const PeerIdentity identity =
+    const auto met =
         OvraPlatform::peerFingerprint(direct->protocol, direct->addr, direct->port, kMeetSeconds);
-    const bool shown = identity.error == CredError::kNone;
     Report report;
     report.data["endpoint"] = targetText(*direct);
     report.data["connectable"] = true;
     report.data["milliseconds"] = Json::Int64(took);
-    if (shown) {
-        report.data["fingerprint"] = identity.fingerprint;
-        report.data["trust"] = trustWord(identity);
+    if (met) {
+        report.data["fingerprint"] = met->fingerprint;
+        report.data["trust"] = trustWord(*met);
     }
     report.text = listing({{"endpoint", targetText(*direct)},
                            {"connectable", "yes, in " + std::to_string(took) + " ms"},
-                           {"key", shown ? identity.fingerprint : "none shown"},
-                           {"trusted", shown ? trustText(identity) : ""}});
+                           {"key", met ? met->fingerprint : "none shown"},
+                           {"trusted", met ? trustText(*met) : ""}});
     return report;
 }
 
