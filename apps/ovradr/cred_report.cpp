@@ -7,7 +7,6 @@
 namespace Ovradr {
 
 using OvraApps::Release;
-using OvraApps::ReleaseOutcome;
 using OvraDRNode::DRNode;
 
 Json::Value credJson(const DRNode &record, bool temporary) {
@@ -25,19 +24,19 @@ std::string credText(const DRNode &record, bool temporary, const std::string &ac
 }
 
 std::string releaseText(const Release &release, bool foreseen) {
-    switch (release.outcome) {
-    case ReleaseOutcome::kReleased:
+    switch (release.state) {
+    case Release::State::kReleased:
         return foreseen ? "would be released on the other appliance"
                         : "released on the other appliance";
-    case ReleaseOutcome::kEndedAlready:
+    case Release::State::kEndedAlready:
         return "had ended on the other appliance already";
-    case ReleaseOutcome::kKept:
+    case Release::State::kKept:
         return foreseen ? "would be kept, because another credential uses it"
                         : "kept, because another credential uses it";
-    case ReleaseOutcome::kLeft:
+    case Release::State::kLeft:
         break;
     }
-    const std::string why = failureOf(release.code, release.detail).message;
+    const std::string why = failureOf(release.code, release.detail).value().message;
     if (foreseen) {
         return "would be left behind: " + why;
     }
@@ -47,11 +46,11 @@ std::string releaseText(const Release &release, bool foreseen) {
 }
 
 void addRelease(Json::Value &data, const Release &release) {
-    data["session"] = OvraApps::releaseWord(release.outcome);
-    if (release.outcome != ReleaseOutcome::kLeft) {
+    data["session"] = OvraApps::releaseWord(release.state);
+    if (release.state != Release::State::kLeft) {
         return;
     }
-    const Failure why = failureOf(release.code, release.detail);
+    const Failure why = failureOf(release.code, release.detail).value();
     data["reason"]["code"] = why.code;
     data["reason"]["name"] = why.name;
     data["reason"]["message"] = why.message;

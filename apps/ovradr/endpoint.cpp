@@ -21,7 +21,7 @@ constexpr long kReasonSeconds = 5;
 constexpr int kProbe = 2;
 
 /// Asks once more, to learn what the probe of the library leaves out.
-Failure whyNotReachable(const Conn &conn) {
+Refusal whyNotReachable(const Conn &conn) {
     OVRA::CredRequest request;
     const bool answered =
         request.SetURL(conn.protocol, conn.addr, conn.port, "webapi/query.cgi") != 0 &&
@@ -34,9 +34,9 @@ Failure whyNotReachable(const Conn &conn) {
 }
 
 /// Asks the relay service once more, to learn why it named no endpoint.
-Failure relayFailure(const Conn &conn) {
-    std::string problem;
-    const OvraPlatform::FarlinkSettings settings = OvraPlatform::readFarlinkSettings(problem);
+Refusal relayFailure(const Conn &conn) {
+    const auto settings =
+        OvraPlatform::readFarlinkSettings().value_or(OvraPlatform::FarlinkSettings());
     if (settings.host.empty()) {
         return failure(ExitCode::kNotReachable, "No relay service is set up on this appliance.",
                        "Run `ovradr farlink enable --server URL`.");
@@ -45,7 +45,7 @@ Failure relayFailure(const Conn &conn) {
         OvraPlatform::FarlinkClient(settings).lookUp(conn.addr);
     return failure(ExitCode::kNotReachable,
                    targetText(conn) + " is not reached through " + settings.host +
-                       (reply.isSuccess() ? "" : ": " + reply.why()) + ".",
+                       (reply ? "" : ": " + reply.error().text) + ".",
                    "`ovradr farlink status`, here and over there, says more.");
 }
 
@@ -56,8 +56,8 @@ Expected<Conn> directEndpoint(const Conn &conn) {
     return direct.isValid() ? Expected<Conn>(direct) : relayFailure(conn);
 }
 
-Trouble probeEndpoint(const Conn &conn) {
-    return OvraDRNode::BaseSender::IsConnectable(conn) ? Trouble() : whyNotReachable(conn);
+Expected<void> probeEndpoint(const Conn &conn) {
+    return OvraDRNode::BaseSender::IsConnectable(conn) ? Expected<void>() : whyNotReachable(conn);
 }
 
 std::string ownFingerprint(const Conn &conn) {

@@ -16,7 +16,7 @@ Expected<OvraDRNode::Conn> directEndpoint(const OvraDRNode::Conn &conn);
 /// Probes a direct endpoint, at most 10 seconds and, to learn why it does not answer, 5 more. All
 /// processes get to know the verdict.
 /// \return why it does not answer; nothing when it does.
-Trouble probeEndpoint(const OvraDRNode::Conn &conn);
+Expected<void> probeEndpoint(const OvraDRNode::Conn &conn);
 
 /// The key that this appliance shows at an endpoint of its own; "" where it cannot be read.
 std::string ownFingerprint(const OvraDRNode::Conn &conn);

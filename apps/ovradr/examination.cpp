@@ -59,12 +59,9 @@ const char *stateWord(Examination::Step::State state) {
     }
 }
 
-Failure withExit(Failure found, ExitCode exit) {
-    const Failure named = failure(exit, found.message, found.hint);
-    found.exit = exit;
-    found.code = named.code;
-    found.name = named.name;
-    return found;
+/// The same failure under another exit code.
+Refusal withExit(const Failure &found, ExitCode exit) {
+    return failure(exit, found.message, found.hint);
 }
 
 /// With one digit behind the point.
@@ -128,12 +125,12 @@ private:
     Expected<std::string> resolve() {
         const Expected<Conn> direct = directEndpoint(subject_.conn);
         if (!direct) {
-            return withExit(direct.failure(), ExitCode::kNameUnknown);
+            return withExit(direct.error(), ExitCode::kNameUnknown);
         }
         conn_ = *direct;
         const Expected<std::vector<HostAddress>> found = resolveHost(conn_.addr, conn_.port);
         if (!found) {
-            return found.failure();
+            return Refusal(found.error());
         }
         addresses_ = *found;
         std::string text = subject_.conn.isFarlink() ? targetText(conn_) + ": " : "";
@@ -146,23 +143,25 @@ private:
     Expected<std::string> connect() { return connectAny(addresses_, conn_); }
 
     Expected<std::string> key() {
-        const PeerIdentity peer =
+        const auto met =
             OvraPlatform::peerFingerprint(conn_.protocol, conn_.addr, conn_.port, kMeetSeconds);
-        if (peer.error == CredError::kTrustUnavailable || peer.error == CredError::kOutOfMemory) {
-            return endpointFailure(conn_, peer.error);
+        if (met == tl::unexpected(CredError::kTrustUnavailable) ||
+            met == tl::unexpected(CredError::kOutOfMemory)) {
+            return endpointFailure(conn_, met.error());
         }
-        if (peer.error != CredError::kNone) {
+        if (!met) {
             return failure(ExitCode::kNoAppliance,
                            targetText(conn_) + ": what answers there shows no key.",
                            "Check protocol and port: HTTPS is 5001, HTTP 5000 as a rule.");
         }
+        const PeerIdentity &peer = *met;
         if (subject_.own) {
             return expectedKey(peer);
         }
         const bool judged = sendsSecrets() || peer.pinned == TrustVerdict::kDifferent;
         if (judged && !peer.acceptedBySystem) {
-            if (const Trouble trouble = trustPeer(conn_, subject_.fingerprint)) {
-                return *trouble;
+            if (const auto trusted = trustPeer(conn_, subject_.fingerprint); !trusted) {
+                return Refusal(trusted.error());
             }
         }
         trusted_ = sendsSecrets() || peer.acceptedBySystem || peer.pinned == TrustVerdict::kTrusted;
@@ -184,15 +183,16 @@ private:
     }
 
     Expected<std::string> answer() const {
-        if (const Trouble trouble = probeEndpoint(conn_)) {
-            return withExit(*trouble, ExitCode::kNoAppliance);
-        }
-        return std::string("a web API");
+        return probeEndpoint(conn_)
+            .map([] { return std::string("a web API"); })
+            .or_else([](const Failure &found) -> Expected<std::string> {
+                return withExit(found, ExitCode::kNoAppliance);
+            });
     }
 
-    Failure senderFailure(const Response &response) const {
-        Failure found = failureOf(errorOf(*sender_, response));
-        found.message = targetText(conn_) + ": " + found.message;
+    Refusal senderFailure(const Response &response) const {
+        Refusal found = failureOf(errorOf(*sender_, response));
+        found.value().message.insert(0, targetText(conn_) + ": ");
         return found;
     }
 
@@ -300,11 +300,11 @@ bool Examination::run(const std::string &name, const Action &action) {
     step.milliseconds =
         std::chrono::duration<double, std::milli>(std::chrono::steady_clock::now() - start).count();
     step.state = found ? Step::State::kOk : Step::State::kFailed;
-    step.detail = found ? *found : found.failure().message;
-    step.hint = found ? "" : found.failure().hint;
+    step.detail = found ? *found : found.error().message;
+    step.hint = found ? "" : found.error().hint;
     steps_.push_back(step);
-    if (!found && !trouble_) {
-        trouble_ = found.failure();
+    if (!found && verdict_) {
+        verdict_ = Refusal(found.error());
     }
     return static_cast<bool>(found);
 }
@@ -354,10 +354,10 @@ void examineAppliance(Examination &examination) {
     examination.run("files", [&nodeId]() -> Expected<std::string> {
         const Expected<std::string> id = localNode();
         if (!id) {
-            return id.failure();
+            return Refusal(id.error());
         }
-        if (const Trouble trouble = checkNodeDatabase()) {
-            return *trouble;
+        if (const auto usable = checkNodeDatabase(); !usable) {
+            return Refusal(usable.error());
         }
         nodeId = *id;
         return "node " + nodeId;

@@ -31,7 +31,7 @@ struct ExaminationSubject {
 };
 
 /// Examines things step by step. A step that fails has the steps that need it skipped; the first
-/// failure is the outcome of the whole.
+/// failure is the verdict on the whole.
 class Examination {
 public:
     struct Step {
@@ -53,8 +53,8 @@ public:
     void skip(const std::string &name, const std::string &why);
 
     const std::string &subject() const { return subject_; }
-    /// The first failure; nothing when every step that was run went well.
-    const Trouble &trouble() const { return trouble_; }
+    /// The first failure, when not every step that was run went well.
+    const Expected<void> &verdict() const { return verdict_; }
     /// Members "subject" and "steps".
     Json::Value toJson() const;
     std::string toText() const;
@@ -62,7 +62,7 @@ public:
 private:
     std::string subject_;
     std::vector<Step> steps_;
-    Trouble trouble_;
+    Expected<void> verdict_;
 };
 
 /// Examines an endpoint: the steps "resolve", "connect", "key", "answer", "session" or "log-in",

@@ -181,12 +181,13 @@ void addDetail(Failure &found, const std::string &detail) {
 
 } // namespace
 
-Failure failure(ExitCode exit, const std::string &message, const std::string &hint) {
+Refusal failure(ExitCode exit, const std::string &message, const std::string &hint) {
     const int number = static_cast<int>(exit);
-    return {exit, number, kExitNames.at(static_cast<std::size_t>(number)), message, hint};
+    return Refusal(Failure{
+        exit, number, kExitNames.at(static_cast<std::size_t>(number)), message, hint, {}, {}});
 }
 
-Failure storeFailure(ExitCode exit, const std::string &sentences) {
+Refusal storeFailure(ExitCode exit, const std::string &sentences) {
     const std::size_t end = sentences.find(". ");
     return failure(exit, sentences.substr(0, end == std::string::npos ? end : end + 1),
                    geteuid() != 0             ? "Run the command as root."
@@ -194,7 +195,7 @@ Failure storeFailure(ExitCode exit, const std::string &sentences) {
                                               : sentences.substr(end + 2));
 }
 
-Failure failureOf(int code, const Json::Value &detail) {
+Refusal failureOf(int code, const Json::Value &detail) {
     const auto *const meaning =
         std::find_if(kMeanings.begin(), kMeanings.end(),
                      [code](const Meaning &entry) { return entry.code == code; });
@@ -204,10 +205,10 @@ Failure failureOf(int code, const Json::Value &detail) {
         found = {meaning->exit, code, meaning->name, meaning->message, meaning->hint};
     }
     addDetail(found, saysItAll(code) ? "" : detailText(code, detail));
-    return found;
+    return Refusal(found);
 }
 
-Failure failureOf(const OvraDRCore::ErrRecorder &error) {
+Refusal failureOf(const OvraDRCore::ErrRecorder &error) {
     return failureOf(error.GetErrCode(), error.GetErrMsg());
 }
 

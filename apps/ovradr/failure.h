@@ -4,11 +4,9 @@
 #include <ovradrcore/err_recorder.h>
 
 #include <json/value.h>
+#include <tl/expected.hpp>
 
-#include <optional>
 #include <string>
-#include <utility>
-#include <variant>
 
 namespace OvraDRCore {
 class ErrRecorder;
@@ -48,40 +46,22 @@ struct Failure {
     std::string text;    ///< the same for people: whole lines, safe for a terminal
 };
 
+/// A value, or why there is none.
+template <typename T>
+using Expected = tl::expected<T, Failure>;
+using Refusal = tl::unexpected<Failure>;
+
 /// A failure that this program found itself.
-Failure failure(ExitCode exit, const std::string &message, const std::string &hint);
+Refusal failure(ExitCode exit, const std::string &message, const std::string &hint);
 
 /// Why a store of this appliance cannot be used.
 /// \param sentences  the first one says what is wrong, the others what to do
-Failure storeFailure(ExitCode exit, const std::string &sentences);
+Refusal storeFailure(ExitCode exit, const std::string &sentences);
 
 /// The failure that an error code of the library or of the web API stands for.
 /// \param detail  what came with the code; null when nothing did
-Failure failureOf(int code, const Json::Value &detail = Json::Value());
-Failure failureOf(const OvraDRCore::ErrRecorder &error);
-
-/// A value, or why there is none.
-template <typename T>
-class Expected {
-public:
-    Expected(T value) // NOLINT(google-explicit-constructor)
-        : held_(std::move(value)) {}
-    Expected(Failure why) // NOLINT(google-explicit-constructor)
-        : held_(std::move(why)) {}
-
-    explicit operator bool() const { return std::holds_alternative<T>(held_); }
-    T &operator*() { return *std::get_if<T>(&held_); }
-    const T &operator*() const { return *std::get_if<T>(&held_); }
-    T *operator->() { return std::get_if<T>(&held_); }
-    const T *operator->() const { return std::get_if<T>(&held_); }
-    const Failure &failure() const { return *std::get_if<Failure>(&held_); }
-
-private:
-    std::variant<T, Failure> held_;
-};
-
-/// Nothing when it went well.
-using Trouble = std::optional<Failure>;
+Refusal failureOf(int code, const Json::Value &detail = Json::Value());
+Refusal failureOf(const OvraDRCore::ErrRecorder &error);
 
 /// What a command found or did, in both forms in which it can be told.
 struct Report {
@@ -89,6 +69,7 @@ struct Report {
     std::string text; ///< for people; whole lines, safe for a terminal
 };
 
+/// The result of a command.
 using Outcome = Expected<Report>;
 
 } // namespace Ovradr

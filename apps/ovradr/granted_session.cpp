@@ -49,17 +49,17 @@ std::string sessionTable(const std::vector<GrantedSession> &sessions) {
     return table({"SESSION", "ACCOUNT", "GRANTED TO NODE", "SINCE", "ENDS", "CLIENT"}, rows);
 }
 
-Trouble endSessions(const std::vector<GrantedSession> &sessions) {
+Expected<void> endSessions(const std::vector<GrantedSession> &sessions) {
     NodeSession store;
     for (const GrantedSession &session : sessions) {
         store.DeleteBySessionId(session.record.id);
         if (store.GetErrCode() != OvraDRCore::ERR::kNone) {
-            Failure found = failureOf(store);
-            found.message = "The session " + session.reference() + ": " + found.message;
+            Refusal found = failureOf(store);
+            found.value().message.insert(0, "The session " + session.reference() + ": ");
             return found;
         }
     }
-    return std::nullopt;
+    return {};
 }
 
 } // namespace Ovradr

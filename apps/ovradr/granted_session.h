@@ -29,6 +29,6 @@ Json::Value sessionJson(const GrantedSession &session);
 std::string sessionTable(const std::vector<GrantedSession> &sessions);
 
 /// Ends the sessions, up to the first that cannot be ended.
-Trouble endSessions(const std::vector<GrantedSession> &sessions);
+Expected<void> endSessions(const std::vector<GrantedSession> &sessions);
 
 } // namespace Ovradr

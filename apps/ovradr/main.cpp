@@ -40,7 +40,7 @@ constexpr const char *kHelpHint =
 
 /// What is wrong with a command line that has more than it should. Nothing of it but the names of
 /// options is repeated: it may be a password that stands in the wrong place.
-Failure surplusFailure(const CLI::App &app) {
+Refusal surplusFailure(const CLI::App &app) {
     std::string names;
     for (const std::string &argument : app.remaining(true)) {
         if (argument.starts_with("-")) {
@@ -83,7 +83,7 @@ int run(int argc, char **argv) {
         if (error.get_exit_code() == 0) {
             return app.exit(error); // the help or the version
         }
-        const Failure wrong = failure(ExitCode::kUsage, std::string(error.what()) + ".", kHelpHint);
+        const Refusal wrong = failure(ExitCode::kUsage, std::string(error.what()) + ".", kHelpHint);
         return static_cast<int>(tell(wrong, json));
     }
     return static_cast<int>(tell(runChosen(chosen), json));

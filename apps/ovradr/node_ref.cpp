@@ -53,10 +53,10 @@ Expected<std::string> localNode() {
 Expected<std::set<std::string>> listNodes() {
     const Expected<std::string> local = localNode();
     if (!local) {
-        return local.failure();
+        return Refusal(local.error());
     }
-    if (const Trouble trouble = checkNodeDatabase()) {
-        return *trouble;
+    if (const auto usable = checkNodeDatabase(); !usable) {
+        return Refusal(usable.error());
     }
     std::vector<DRNode> nodes;
     DRNodeDB::List(nodes, kBothTables);
@@ -71,14 +71,14 @@ Expected<std::string> resolveNode(const std::string &text) {
     if (!local || text == kLocalWord || text == *local) {
         return local;
     }
-    const Expected<std::set<std::string>> ids = listNodes();
-    return ids ? chooseId(*ids, text, "node", "`ovradr node list` shows the nodes that there are.")
-               : ids.failure();
+    return listNodes().and_then([&text](const std::set<std::string> &ids) {
+        return chooseId(ids, text, "node", "`ovradr node list` shows the nodes that there are.");
+    });
 }
 
 Expected<FoundCred> resolveCred(const std::string &text) {
-    if (const Trouble trouble = checkNodeDatabase()) {
-        return *trouble;
+    if (const auto usable = checkNodeDatabase(); !usable) {
+        return Refusal(usable.error());
     }
     std::map<std::string, FoundCred> creds;
     std::set<std::string> ids;
@@ -90,9 +90,8 @@ Expected<FoundCred> resolveCred(const std::string &text) {
             ids.insert(record.credId);
         }
     }
-    const Expected<std::string> id =
-        chooseId(ids, text, "credential", "`ovradr cred list --temp` shows all that there are.");
-    return id ? Expected<FoundCred>(creds.at(*id)) : id.failure();
+    return chooseId(ids, text, "credential", "`ovradr cred list --temp` shows all that there are.")
+        .map([&creds](const std::string &id) { return creds.at(id); });
 }
 
 } // namespace Ovradr

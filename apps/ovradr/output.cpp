@@ -119,7 +119,7 @@ Json::Value documentOf(const Outcome &outcome) {
         document["data"] = outcome->data;
         return document;
     }
-    const Failure &failure = outcome.failure();
+    const Failure &failure = outcome.error();
     document["error"]["code"] = failure.code;
     document["error"]["name"] = failure.name;
     document["error"]["message"] = failure.message;
@@ -219,14 +219,14 @@ std::string timeText(std::int64_t seconds) {
 }
 
 ExitCode tell(const Outcome &outcome, bool json) {
-    const ExitCode exit = outcome ? ExitCode::kOk : outcome.failure().exit;
+    const ExitCode exit = outcome ? ExitCode::kOk : outcome.error().exit;
     bool told = false;
     if (json) {
         told = put(OvraDRCore::toString(documentOf(outcome)) + "\n", stdout);
     } else if (outcome) {
         told = put(outcome->text, stdout);
     } else {
-        const Failure &failure = outcome.failure();
+        const Failure &failure = outcome.error();
         told = put(failure.text, stdout) &&
                put("ovradr: " + printable(failure.message) + "\n" +
                        (failure.hint.empty() ? "" : printable(failure.hint) + "\n"),

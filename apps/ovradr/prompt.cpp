@@ -88,7 +88,7 @@ private:
     std::array<struct sigaction, kSignals.size()> before_{};
 };
 
-Failure unreadable(const std::string &where, const std::string &why) {
+Refusal unreadable(const std::string &where, const std::string &why) {
     return failure(ExitCode::kFailed, "No password can be read from " + where + ": " + why + ".",
                    "Give a file whose first line is the password.");
 }
@@ -176,7 +176,7 @@ Expected<Secret> obtainPassword(const PasswordSource &source, const std::string 
     }
     const Expected<Secret> again = askSecret("Again");
     if (!again) {
-        return again.failure();
+        return Refusal(again.error());
     }
     if (password->get() != again->get()) {
         return failure(ExitCode::kFailed, "The two passwords differ.", "Try again.");

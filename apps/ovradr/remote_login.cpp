@@ -19,8 +19,7 @@ Expected<std::string> askOneTimeCode() {
                        "There is no terminal on which the one-time code could be asked for.",
                        "Give it with --otp.");
     }
-    const Expected<Secret> code = askSecret("One-time code");
-    return code ? Expected<std::string>(code->get()) : code.failure();
+    return askSecret("One-time code").map([](const Secret &given) { return given.get(); });
 }
 
 } // namespace
@@ -42,28 +41,24 @@ void addFingerprintOption(CLI::App &command, std::string &fingerprint) {
 }
 
 Expected<Conn> meet(const Conn &conn, const std::string &fingerprint) {
-    Expected<Conn> direct = directEndpoint(conn);
-    if (!direct) {
-        return direct;
-    }
-    if (const Trouble trouble = trustPeer(*direct, fingerprint)) {
-        return *trouble;
-    }
-    return direct;
+    return directEndpoint(conn).and_then([&fingerprint](const Conn &direct) {
+        return trustPeer(direct, fingerprint).map([&direct] { return direct; });
+    });
 }
 
-Trouble logIn(const RemoteLogin &login, const std::string &host, const LoginAttempt &attempt) {
+Expected<void> logIn(const RemoteLogin &login, const std::string &host,
+                     const LoginAttempt &attempt) {
     const Expected<Secret> password =
         obtainPassword(login.password, "Password of " + login.account + " on " + host, false);
     if (!password) {
-        return password.failure();
+        return Refusal(password.error());
     }
     std::string code = login.oneTimeCode;
     bool mayAsk = code.empty() && isInteractive();
     if (login.askOneTimeCode) {
         const Expected<std::string> asked = askOneTimeCode();
         if (!asked) {
-            return asked.failure();
+            return Refusal(asked.error());
         }
         code = *asked;
         mayAsk = false;
@@ -71,11 +66,11 @@ Trouble logIn(const RemoteLogin &login, const std::string &host, const LoginAtte
     if (attempt(password->get(), code) == OvraDRCore::ERR::kLoginOtpRequired && mayAsk) {
         const Expected<std::string> asked = askOneTimeCode();
         if (!asked) {
-            return asked.failure();
+            return Refusal(asked.error());
         }
         attempt(password->get(), *asked);
     }
-    return std::nullopt;
+    return {};
 }
 
 } // namespace Ovradr

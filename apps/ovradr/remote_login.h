@@ -44,7 +44,8 @@ using LoginAttempt = std::function<int(const std::string &password, const std::s
 /// Obtains password and one-time code and logs in with them. A one-time code that the other end
 /// asks for is asked for here, once, where there is somebody to ask.
 /// \param host  as the question names the other end
-/// \return why there was no attempt, or no second one; the outcome of an attempt is not told.
-Trouble logIn(const RemoteLogin &login, const std::string &host, const LoginAttempt &attempt);
+/// \return why there was no attempt, or no second one; what came of an attempt is not told.
+Expected<void> logIn(const RemoteLogin &login, const std::string &host,
+                     const LoginAttempt &attempt);
 
 } // namespace Ovradr

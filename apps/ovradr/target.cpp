@@ -13,7 +13,7 @@ namespace {
 
 using OvraDRNode::Conn;
 
-Failure refused(const std::string &text, const std::string &why) {
+Refusal refused(const std::string &text, const std::string &why) {
     return failure(ExitCode::kUsage, "\"" + text + "\" is not an endpoint: " + why + ".",
                    "Write https://HOST, https://HOST:PORT, http://HOST:PORT or flk:ALIAS.");
 }

@@ -49,7 +49,7 @@ int tryConnect(const HostAddress &address, Clock::time_point end) {
     return getsockopt(socketFd.get(), SOL_SOCKET, SO_ERROR, &error, &size) == 0 ? error : errno;
 }
 
-Failure connectFailure(const std::string &where, int error) {
+Refusal connectFailure(const std::string &where, int error) {
     if (error == ECONNREFUSED) {
         return failure(ExitCode::kNotReachable, where + " refuses connections.",
                        "Check the port, and that ovradrd runs over there.");

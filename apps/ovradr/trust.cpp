@@ -42,14 +42,14 @@ ExitCode exitOf(CredError error) {
     }
 }
 
-Failure keyFailure(const Conn &conn, const PeerIdentity &identity, const std::string &what,
+Refusal keyFailure(const Conn &conn, const PeerIdentity &identity, const std::string &what,
                    const std::string &hint) {
     return failure(
         ExitCode::kCertificate,
         "The key of " + targetText(conn) + ", " + identity.fingerprint + ", " + what + ".", hint);
 }
 
-Failure changedKey(const Conn &conn, const PeerIdentity &identity) {
+Refusal changedKey(const Conn &conn, const PeerIdentity &identity) {
     return keyFailure(conn, identity, "is not the one that was trusted for it",
                       "Somebody may be in between. When you know that the key was changed, run "
                       "`ovradr conn forget " +
@@ -62,11 +62,11 @@ bool askWhetherToTrust(const Conn &conn, const PeerIdentity &identity) {
     return confirm("`ovradr conn local` over there shows the same. Trust this key?");
 }
 
-Trouble pin(const Conn &conn, const PeerIdentity &identity) {
+Expected<void> pin(const Conn &conn, const PeerIdentity &identity) {
     switch (OvraPlatform::expectFingerprint(conn.protocol, conn.addr, conn.port,
                                             identity.fingerprint)) {
     case TrustVerdict::kTrusted:
-        return std::nullopt;
+        return {};
     case TrustVerdict::kDifferent:
         return changedKey(conn, identity);
     default:
@@ -81,7 +81,7 @@ std::string checkFingerprint(const std::string &text) {
                                          : "a fingerprint is SHA256: and 43 characters of base64";
 }
 
-Failure endpointFailure(const Conn &conn, CredError error) {
+Refusal endpointFailure(const Conn &conn, CredError error) {
     // The sentence of the library says what is wrong and, behind a colon, what to do.
     const std::string text = OvraPlatform::credErrorText(static_cast<int>(error));
     const std::size_t colon = text.find(": ");
@@ -125,18 +125,19 @@ std::string trustText(const PeerIdentity &identity) {
     return word == "changed" ? "no, another key is known" : "the known keys cannot be read";
 }
 
-Trouble trustPeer(const Conn &conn, const std::string &expected) {
-    const PeerIdentity identity =
+Expected<void> trustPeer(const Conn &conn, const std::string &expected) {
+    const auto met =
         OvraPlatform::peerFingerprint(conn.protocol, conn.addr, conn.port, kMeetSeconds);
-    if (identity.error != CredError::kNone) {
-        return endpointFailure(conn, identity.error);
+    if (!met) {
+        return endpointFailure(conn, met.error());
     }
+    const PeerIdentity &identity = *met;
     if (!expected.empty() && identity.fingerprint != expected) {
         return keyFailure(conn, identity, "is not the one that --fingerprint names",
                           "Do not go on before you know why.");
     }
     if (identity.acceptedBySystem || identity.pinned == TrustVerdict::kTrusted) {
-        return std::nullopt;
+        return {};
     }
     if (identity.pinned == TrustVerdict::kDifferent) {
         return changedKey(conn, identity);

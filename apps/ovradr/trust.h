@@ -19,7 +19,7 @@ std::string checkFingerprint(const std::string &text);
 
 /// Why an endpoint could not be asked.
 /// \param error  a number of the credential request library
-Failure endpointFailure(const OvraDRNode::Conn &conn, OvraPlatform::CredError error);
+Refusal endpointFailure(const OvraDRNode::Conn &conn, OvraPlatform::CredError error);
 
 /// What is known about the key that the endpoint shows, for people.
 std::string trustText(const OvraPlatform::PeerIdentity &identity);
@@ -31,6 +31,6 @@ std::string trustWord(const OvraPlatform::PeerIdentity &identity);
 /// the terminal says so.
 /// \param expected  the fingerprint that the key must have, or ""
 /// \return what is in the way; nothing when the key is trusted.
-Trouble trustPeer(const OvraDRNode::Conn &conn, const std::string &expected);
+Expected<void> trustPeer(const OvraDRNode::Conn &conn, const std::string &expected);
 
 } // namespace Ovradr

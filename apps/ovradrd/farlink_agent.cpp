@@ -23,6 +23,7 @@ namespace {
 
 using OvraBase::UniqueFd;
 using OvraPlatform::FarlinkClient;
+using OvraPlatform::FarlinkFailure;
 using OvraPlatform::FarlinkKey;
 using OvraPlatform::FarlinkReply;
 using OvraPlatform::FarlinkSettings;
@@ -110,6 +111,9 @@ struct FarlinkAgent::State {
 
 namespace {
 
+/// Nothing, or what is in the way.
+using Went = tl::expected<void, FarlinkFailure>;
+
 /// One stay at the relay service, under one alias.
 class Stay {
 public:
@@ -119,25 +123,26 @@ public:
 
     bool isFor(const FarlinkSettings &settings) const { return settings_ == settings; }
 
-    /// Proves who we are. \return what is in the way, "" when nothing
-    std::string begin() {
+    /// Proves who we are.
+    Went begin() {
         const auto key = FarlinkKey::loadOrCreate();
         if (!key) {
-            return key.error();
+            return tl::unexpected(FarlinkFailure{key.error()});
         }
         const FarlinkReply reply = client_.enrol(*key);
-        if (!reply.isSuccess()) {
-            return reply.why();
+        if (!reply) {
+            return tl::unexpected(reply.error());
         }
-        token_ = reply.response.getDataFieldtoStr("token");
-        const Json::Value port = reply.response.getDataField("port");
-        const Json::Value tunnel = reply.response.getDataField("tunnel_port");
-        const Json::Value expires = reply.response.getDataField("expires");
+        token_ = reply->getDataFieldtoStr("token");
+        const Json::Value port = reply->getDataField("port");
+        const Json::Value tunnel = reply->getDataField("tunnel_port");
+        const Json::Value expires = reply->getDataField("expires");
         if (token_.empty() || !port.isInt() || !tunnel.isInt() || !expires.isInt64()) {
-            return "the relay service gave an answer that is none: check that the versions fit";
+            return tl::unexpected(FarlinkFailure{
+                "the relay service gave an answer that is none: check that the versions fit"});
         }
         tunnelPort_ = tunnel.asInt();
-        const Json::Value lease = reply.response.getDataField("lease");
+        const Json::Value lease = reply->getDataField("lease");
         const std::chrono::seconds third(lease.isInt64() ? lease.asInt64() / 3 : 0);
         renewAt_ = std::chrono::steady_clock::now() +
                    std::clamp<std::chrono::seconds>(third, kMinPause, kMaxStay);
@@ -153,15 +158,13 @@ public:
 
     /// Waits for callers and connects to each of them.
     /// \param mayDial  asked before, because the settings may have changed while it waited
-    /// \return what is in the way, "" when nothing; `over` when it has to begin anew
     template <typename Dialled, typename MayDial>
-    std::string serve(const MayDial &mayDial, const Dialled &dialled, bool &over) {
+    Went serve(const MayDial &mayDial, const Dialled &dialled) {
         const FarlinkReply reply = client_.wait(token_);
-        over = reply.response.getErrCode() == OvraPlatform::APIError::kNoSession;
-        if (!reply.isSuccess()) {
-            return reply.why();
+        if (!reply) {
+            return tl::unexpected(reply.error());
         }
-        const Json::Value callers = reply.response.getDataField("callers");
+        const Json::Value callers = reply->getDataField("callers");
         for (Json::ArrayIndex i = 0; callers.isArray() && i < std::min(callers.size(), kMaxCallers);
              ++i) {
             if (isCaller(callers[i]) && mayDial()) {
@@ -186,38 +189,35 @@ void FarlinkAgent::run(const std::shared_ptr<State> &state) {
     std::optional<Stay> stay;
     std::chrono::seconds pause{0};
     while (state->pause(pause)) {
-        std::string problem;
-        const FarlinkSettings settings = OvraPlatform::readFarlinkSettings(problem);
-        if (settings.host.empty() || settings.alias.empty()) {
+        const auto settings = OvraPlatform::readFarlinkSettings();
+        if (!settings || settings->host.empty() || settings->alias.empty()) {
             stay.reset();
-            state->tell({false, 0, 0, problem});
+            state->tell({false, 0, 0, settings ? "" : settings.error()});
             pause = kLook;
             continue;
         }
-        if (!stay || !stay->isFor(settings) || stay->isOver()) {
-            stay.emplace(settings);
-            problem = stay->begin();
+        Went went;
+        if (!stay || !stay->isFor(*settings) || stay->isOver()) {
+            stay.emplace(*settings);
+            went = stay->begin();
         }
-        bool over = false;
-        if (problem.empty()) {
+        bool forgotten = false;
+        if (went) {
             state->tell(stay->status());
-            problem = stay->serve(
-                [&settings] {
-                    std::string ignored;
-                    return OvraPlatform::readFarlinkSettings(ignored) == settings;
-                },
-                [&state](OvraService::ConnectedClient client) { state->hand(std::move(client)); },
-                over);
+            went = stay->serve(
+                [&settings] { return OvraPlatform::readFarlinkSettings() == settings; },
+                [&state](OvraService::ConnectedClient client) { state->hand(std::move(client)); });
+            forgotten = !went && went.error().code == OvraPlatform::APIError::kNoSession;
         }
-        if (problem.empty()) {
+        if (went) {
             pause = std::chrono::seconds(0);
             continue;
         }
         // Where it was only forgotten, it comes back at once.
-        state->tell({false, 0, 0, problem});
+        state->tell({false, 0, 0, went.error().text});
         stay.reset();
-        pause =
-            over && pause.count() == 0 ? kMinPause : std::clamp(pause * 2, kMinPause, kMaxPause);
+        pause = forgotten && pause.count() == 0 ? kMinPause
+                                                : std::clamp(pause * 2, kMinPause, kMaxPause);
     }
 }
 

@@ -21,22 +21,22 @@ using OvraDRNode::DRNodeDB;
 namespace {
 
 Release left(int code, const Json::Value &detail = Json::Value()) {
-    return {ReleaseOutcome::kLeft, code, detail, false};
+    return {Release::State::kLeft, code, detail, false};
 }
 
 /// What is the case now; nothing when the session is accepted and no credential uses it.
 /// \param whenGone  how a session that is gone counts
 std::optional<Release> look(const Conn &conn, const std::string &session,
-                            const std::string &exceptCredId, ReleaseOutcome whenGone) {
+                            const std::string &exceptCredId, Release::State whenGone) {
     if (session.empty()) {
-        return Release{ReleaseOutcome::kEndedAlready, 0, {}, false};
+        return Release{Release::State::kEndedAlready, 0, {}, false};
     }
     const int users = OvraDRNode::CredUtils::GetSessionUsedCount(session, exceptCredId);
     if (users < 0) {
         return left(OvraDRCore::ERR::kFailed);
     }
     if (users > 0) {
-        return Release{ReleaseOutcome::kKept, 0, {}, false};
+        return Release{Release::State::kKept, 0, {}, false};
     }
     const SessionAnswer answer = askSession(conn, session);
     switch (answer.state) {
@@ -50,45 +50,45 @@ std::optional<Release> look(const Conn &conn, const std::string &session,
 }
 
 /// After it was to be released.
-Release lookAfter(const Conn &conn, const std::string &session, ReleaseOutcome whenGone) {
+Release lookAfter(const Conn &conn, const std::string &session, Release::State whenGone) {
     return look(conn, session, "", whenGone).value_or(left(OvraDRCore::ERR::kSessionNotRemoved));
 }
 
 /// Brings the memory in line with what became of the session.
 void settle(PendingReleases &store, const PendingRelease &pending, Release &release) {
-    release.remembered = release.outcome == ReleaseOutcome::kLeft &&
-                         store.postpone(pending.reference(), release.code);
-    if (release.outcome != ReleaseOutcome::kLeft) {
+    release.remembered =
+        release.state == Release::State::kLeft && store.postpone(pending.reference(), release.code);
+    if (release.state != Release::State::kLeft) {
         store.remove(pending.reference());
     }
 }
 
 } // namespace
 
-const char *releaseWord(ReleaseOutcome outcome) {
-    switch (outcome) {
-    case ReleaseOutcome::kReleased:
+const char *releaseWord(Release::State state) {
+    switch (state) {
+    case Release::State::kReleased:
         return "released";
-    case ReleaseOutcome::kEndedAlready:
+    case Release::State::kEndedAlready:
         return "ended_already";
-    case ReleaseOutcome::kKept:
+    case Release::State::kKept:
         return "kept";
-    case ReleaseOutcome::kLeft:
+    case Release::State::kLeft:
         break;
     }
     return "left_behind";
 }
 
 Release foreseeRelease(const DRNode &record) {
-    return look(record.conn, record.session, record.credId, ReleaseOutcome::kEndedAlready)
-        .value_or(Release{ReleaseOutcome::kReleased, 0, {}, false});
+    return look(record.conn, record.session, record.credId, Release::State::kEndedAlready)
+        .value_or(Release{Release::State::kReleased, 0, {}, false});
 }
 
 ReleasingFlow runReleasing(const DRNode &record, const Conn &conn,
                            const std::function<bool()> &flow) {
     DRNode superfluous = record;
     superfluous.conn = conn;
-    const bool wasGone = foreseeRelease(superfluous).outcome == ReleaseOutcome::kEndedAlready;
+    const bool wasGone = foreseeRelease(superfluous).state == Release::State::kEndedAlready;
     const PendingRelease pending{record.session, conn, record.nodeId, record.credId};
     PendingReleases store;
     const bool noted = !record.session.empty() && conn.isValid() && store.note(pending);
@@ -100,10 +100,10 @@ ReleasingFlow runReleasing(const DRNode &record, const Conn &conn,
     if (!result.done) {
         // The credential is as it was, and needs its session.
         store.remove(pending.reference());
-        return {false, {ReleaseOutcome::kKept, 0, {}, false}};
+        return {false, {Release::State::kKept, 0, {}, false}};
     }
     result.release = lookAfter(conn, record.session,
-                               wasGone ? ReleaseOutcome::kEndedAlready : ReleaseOutcome::kReleased);
+                               wasGone ? Release::State::kEndedAlready : Release::State::kReleased);
     if (noted) {
         settle(store, pending, result.release);
     }
@@ -121,20 +121,20 @@ Release retryRelease(const PendingRelease &pending, PendingReleases &store) {
     DRNode record;
     const bool inUse = DRNodeDB::GetCred(pending.credId, record) &&
                        record.session == pending.session; // its flow was killed before it changed
-    Release result{ReleaseOutcome::kKept, 0, {}, false};
+    Release result{Release::State::kKept, 0, {}, false};
     if (!inUse) {
-        const auto now = look(pending.conn, pending.session, "", ReleaseOutcome::kReleased);
+        const auto now = look(pending.conn, pending.session, "", Release::State::kReleased);
         if (!now) {
             const SessionLock lock(SessionLock::Purpose::kRelease);
             // What came of it is looked at below.
             (void)OvraDRNode::CredUtils::NotifyRemoteNodeDeleteSessionIfNotUsed(pending.conn,
                                                                                 pending.session);
         }
-        result = now ? *now : lookAfter(pending.conn, pending.session, ReleaseOutcome::kReleased);
+        result = now ? *now : lookAfter(pending.conn, pending.session, Release::State::kReleased);
     }
     settle(store, pending, result);
     OVRA_NOTICE("The session [%s] at node [%s] is [%s], attempt [%d]", pending.reference().c_str(),
-                pending.nodeId.c_str(), releaseWord(result.outcome), pending.attempts + 1);
+                pending.nodeId.c_str(), releaseWord(result.state), pending.attempts + 1);
     return result;
 }
 

@@ -11,22 +11,22 @@
 namespace OvraApps {
 
 /// What became of a session on another node once this one needed it no more.
-enum class ReleaseOutcome {
-    kReleased,     ///< it is gone over there
-    kEndedAlready, ///< it was gone before
-    kKept,         ///< another lasting credential of this node uses it
-    kLeft,         ///< it may still be there: the node did not answer, or refused
-};
-
 struct Release {
-    ReleaseOutcome outcome = ReleaseOutcome::kLeft;
+    enum class State {
+        kReleased,     ///< it is gone over there
+        kEndedAlready, ///< it was gone before
+        kKept,         ///< another lasting credential of this node uses it
+        kLeft,         ///< it may still be there: the node did not answer, or refused
+    };
+
+    State state = State::kLeft;
     int code = 0;            ///< with kLeft: why, a code of the library or of the web API
     Json::Value detail;      ///< with kLeft: what came with it
     bool remembered = false; ///< with kLeft: whether ovradrd will try again
 };
 
 /// "released", "ended_already", "kept" or "left_behind".
-const char *releaseWord(ReleaseOutcome outcome);
+const char *releaseWord(Release::State state);
 
 /// What would become of the session if the credential went now; nothing is changed. kReleased:
 /// the node would be told.

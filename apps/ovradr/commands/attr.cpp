@@ -38,8 +38,8 @@ std::string checkValue(const std::string &value) {
 /// Every attribute that the application keeps about the node; `options.node` is a node id.
 Expected<std::vector<DRNodeAttr>> read(const AttrOptions &options) {
     std::vector<DRNodeAttr> attrs;
-    if (const Trouble trouble = checkNodeDatabase()) {
-        return *trouble;
+    if (const auto usable = checkNodeDatabase(); !usable) {
+        return Refusal(usable.error());
     }
     if (!DRNodeDB::ListAttr(options.node, options.app, attrs)) {
         return failure(ExitCode::kNotSetUp, "The attributes cannot be read.",
@@ -49,8 +49,8 @@ Expected<std::vector<DRNodeAttr>> read(const AttrOptions &options) {
 }
 
 Outcome set(const AttrOptions &options) {
-    if (const Trouble trouble = checkNodeDatabase()) {
-        return *trouble;
+    if (const auto usable = checkNodeDatabase(); !usable) {
+        return Refusal(usable.error());
     }
     const DRNodeAttr attr(options.node, options.app, options.attr, options.value);
     if (!DRNodeDB::SetAttr(attr)) {
@@ -66,7 +66,7 @@ Outcome set(const AttrOptions &options) {
 Outcome get(const AttrOptions &options) {
     const Expected<std::vector<DRNodeAttr>> attrs = read(options);
     if (!attrs) {
-        return attrs.failure();
+        return Refusal(attrs.error());
     }
     const auto found =
         std::find_if(attrs->begin(), attrs->end(),
@@ -83,21 +83,21 @@ Outcome get(const AttrOptions &options) {
     return report;
 }
 
-Outcome list(const AttrOptions &options) {
-    const Expected<std::vector<DRNodeAttr>> attrs = read(options);
-    if (!attrs) {
-        return attrs.failure();
-    }
+Report reportOf(const std::vector<DRNodeAttr> &attrs) {
     Report report;
     report.data["attrs"] = Json::Value(Json::arrayValue);
     std::vector<std::vector<std::string>> rows;
-    for (const DRNodeAttr &attr : *attrs) {
+    for (const DRNodeAttr &attr : attrs) {
         report.data["attrs"].append(attr.toJson());
         rows.push_back({attr.attr, attr.value});
     }
     report.text = rows.empty() ? "The application keeps no attributes about this node.\n"
                                : table({"ATTRIBUTE", "VALUE"}, rows);
     return report;
+}
+
+Outcome list(const AttrOptions &options) {
+    return read(options).map(reportOf);
 }
 
 using Action = Outcome (*)(const AttrOptions &);
@@ -111,13 +111,11 @@ CLI::App *addAction(CLI::App &family, const char *name, const char *description,
         ->required()
         ->check(checkName);
     command->callback([&chosen, options, action] {
-        chosen = [options, action]() -> Outcome {
-            const Expected<std::string> nodeId = resolveNode(options->node);
-            if (!nodeId) {
-                return nodeId.failure();
-            }
-            options->node = *nodeId;
-            return action(*options);
+        chosen = [options, action] {
+            return resolveNode(options->node).and_then([&](const std::string &nodeId) {
+                options->node = nodeId;
+                return action(*options);
+            });
         };
     });
     return command;

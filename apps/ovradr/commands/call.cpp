@@ -38,7 +38,7 @@ struct CallOptions {
     long timeout = 0; ///< seconds; 0: as the library has it
 };
 
-Failure badParameter(const std::string &text, const std::string &why) {
+Refusal badParameter(const std::string &text, const std::string &why) {
     // Of the text only the name: the value may be a secret.
     return failure(ExitCode::kUsage,
                    "The parameter \"" + text.substr(0, text.find('=')) + "\" " + why + ".",
@@ -47,7 +47,7 @@ Failure badParameter(const std::string &text, const std::string &why) {
 
 /// Adds "name=value" (the value is taken as JSON when it is JSON, otherwise as text) or
 /// "name:=json".
-Trouble addParameter(Json::Value &params, const std::string &text) {
+Expected<void> addParameter(Json::Value &params, const std::string &text) {
     const std::size_t equals = text.find('=');
     const bool forced = equals != std::string::npos && equals > 0 && text[equals - 1] == ':';
     const std::string name = text.substr(0, forced ? equals - 1 : equals);
@@ -65,7 +65,7 @@ Trouble addParameter(Json::Value &params, const std::string &text) {
         value = text.substr(equals + 1);
     }
     params[name] = value;
-    return std::nullopt;
+    return {};
 }
 
 /// The JSON object in a file, or in standard input for "-".
@@ -92,13 +92,13 @@ Expected<Json::Value> collectParameters(const CallOptions &options) {
     if (!options.paramsFile.empty()) {
         const Expected<Json::Value> read = readParameters(options.paramsFile);
         if (!read) {
-            return read.failure();
+            return Refusal(read.error());
         }
         params = *read;
     }
     for (const std::string &text : options.params) {
-        if (const Trouble trouble = addParameter(params, text)) {
-            return *trouble;
+        if (const auto added = addParameter(params, text); !added) {
+            return Refusal(added.error());
         }
     }
     return params;
@@ -123,7 +123,7 @@ Expected<Answer> send(const std::string &nodeId, const std::string &credId,
     }
     const Expected<FoundCred> cred = resolveCred(credId);
     if (!cred) {
-        return cred.failure();
+        return Refusal(cred.error());
     }
     if (cred->record.nodeId != nodeId) {
         return failureOf(ERR::kOtherNode);
@@ -156,7 +156,7 @@ bool isRelayed(const std::string &nodeId) {
 Outcome call(const CallOptions &options) {
     const Expected<Json::Value> params = collectParameters(options);
     if (!params) {
-        return params.failure();
+        return Refusal(params.error());
     }
     Request request(options.api, options.version, options.method, *params);
     request.setEncryptRequired(options.encrypt);
@@ -169,11 +169,11 @@ Outcome call(const CallOptions &options) {
     }
     const Expected<std::string> nodeId = resolveNode(options.node);
     if (!nodeId) {
-        return nodeId.failure();
+        return Refusal(nodeId.error());
     }
     const Expected<Answer> answer = send(*nodeId, options.credId, request);
     if (!answer) {
-        return answer.failure();
+        return Refusal(answer.error());
     }
     if (!answer->response.isValid() && answer->error.GetErrCode() == ERR::kBadParameter &&
         isRelayed(*nodeId)) {

@@ -18,7 +18,6 @@ namespace {
 
 using OvraDRNode::Conn;
 using OvraPlatform::CredError;
-using OvraPlatform::PeerIdentity;
 using OvraPlatform::TrustStore;
 
 Outcome local() {
@@ -36,50 +35,41 @@ Outcome local() {
     return report;
 }
 
-Outcome test(const std::string &url) {
-    const Expected<Conn> conn = parseTarget(url);
-    if (!conn) {
-        return conn.failure();
-    }
-    const Expected<Conn> direct = directEndpoint(*conn);
+Outcome test(const Conn &conn) {
+    const Expected<Conn> direct = directEndpoint(conn);
     if (!direct) {
-        return direct.failure();
+        return Refusal(direct.error());
     }
     const auto start = std::chrono::steady_clock::now();
-    if (const Trouble trouble = probeEndpoint(*direct)) {
-        return *trouble;
+    if (const auto answers = probeEndpoint(*direct); !answers) {
+        return Refusal(answers.error());
     }
     const auto took = std::chrono::duration_cast<std::chrono::milliseconds>(
                           std::chrono::steady_clock::now() - start)
                           .count();
-    const PeerIdentity identity =
+    const auto met =
         OvraPlatform::peerFingerprint(direct->protocol, direct->addr, direct->port, kMeetSeconds);
-    const bool shown = identity.error == CredError::kNone;
     Report report;
     report.data["endpoint"] = targetText(*direct);
     report.data["connectable"] = true;
     report.data["milliseconds"] = Json::Int64(took);
-    if (shown) {
-        report.data["fingerprint"] = identity.fingerprint;
-        report.data["trust"] = trustWord(identity);
+    if (met) {
+        report.data["fingerprint"] = met->fingerprint;
+        report.data["trust"] = trustWord(*met);
     }
     report.text = listing({{"endpoint", targetText(*direct)},
                            {"connectable", "yes, in " + std::to_string(took) + " ms"},
-                           {"key", shown ? identity.fingerprint : "none shown"},
-                           {"trusted", shown ? trustText(identity) : ""}});
+                           {"key", met ? met->fingerprint : "none shown"},
+                           {"trusted", met ? trustText(*met) : ""}});
     return report;
 }
 
-Outcome forget(const std::string &url) {
-    const Expected<Conn> conn = parseTarget(url);
-    if (!conn) {
-        return conn.failure();
-    }
-    const std::string endpoint = targetText(*conn);
+Outcome forget(const Conn &conn) {
+    const std::string endpoint = targetText(conn);
     TrustStore store;
     const auto known = store.list();
     if (!known) {
-        return endpointFailure(*conn, CredError::kTrustUnavailable);
+        return endpointFailure(conn, CredError::kTrustUnavailable);
     }
     if (std::none_of(known->begin(), known->end(), [&endpoint](const TrustStore::Entry &entry) {
             return entry.endpoint == endpoint;
@@ -88,7 +78,7 @@ Outcome forget(const std::string &url) {
                        "There is nothing to forget.");
     }
     if (!store.forget(endpoint)) {
-        return endpointFailure(*conn, CredError::kTrustUnavailable);
+        return endpointFailure(conn, CredError::kTrustUnavailable);
     }
     Report report;
     report.data["endpoint"] = endpoint;
@@ -96,7 +86,7 @@ Outcome forget(const std::string &url) {
     return report;
 }
 
-using UrlAction = Outcome (*)(const std::string &);
+using UrlAction = Outcome (*)(const Conn &);
 
 void addUrlCommand(CLI::App &family, const char *name, const char *description, const char *example,
                    Command &chosen, UrlAction action) {
@@ -105,7 +95,9 @@ void addUrlCommand(CLI::App &family, const char *name, const char *description, 
     command->add_option("URL", *url, "https://HOST[:5001], http://HOST[:5000] or flk:ALIAS")
         ->required();
     command->footer(std::string("Example:\n  ") + example);
-    command->callback([&chosen, url, action] { chosen = [url, action] { return action(*url); }; });
+    command->callback([&chosen, url, action] {
+        chosen = [url, action] { return parseTarget(*url).and_then(action); };
+    });
 }
 
 } // namespace

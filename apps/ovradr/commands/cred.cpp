@@ -25,16 +25,13 @@ struct CredOptions {
 };
 
 Outcome list(const CredOptions &options) {
-    std::string nodeId;
-    if (!options.node.empty()) {
-        const Expected<std::string> found = resolveNode(options.node);
-        if (!found) {
-            return found.failure();
-        }
-        nodeId = *found;
+    const Expected<std::string> nodeId =
+        options.node.empty() ? Expected<std::string>("") : resolveNode(options.node);
+    if (!nodeId) {
+        return Refusal(nodeId.error());
     }
-    if (const Trouble trouble = checkNodeDatabase()) {
-        return *trouble;
+    if (const auto usable = checkNodeDatabase(); !usable) {
+        return Refusal(usable.error());
     }
     Report report;
     report.data["creds"] = Json::Value(Json::arrayValue);
@@ -43,8 +40,8 @@ Outcome list(const CredOptions &options) {
         const DRNodeDB::CredType table =
             temporary ? DRNodeDB::CRED_TYPE_TEMP : DRNodeDB::CRED_TYPE_NODE;
         std::vector<DRNode> records;
-        nodeId.empty() ? DRNodeDB::List(records, table)
-                       : DRNodeDB::ListCred(nodeId, records, table);
+        nodeId->empty() ? DRNodeDB::List(records, table)
+                        : DRNodeDB::ListCred(*nodeId, records, table);
         for (const DRNode &record : records) {
             report.data["creds"].append(credJson(record, temporary));
             rows.push_back({record.credId, record.nodeId, targetText(record.conn),
@@ -62,14 +59,10 @@ Outcome list(const CredOptions &options) {
     return report;
 }
 
-Outcome show(const CredOptions &options) {
-    const Expected<FoundCred> cred = resolveCred(options.credId);
-    if (!cred) {
-        return cred.failure();
-    }
+Report show(const FoundCred &cred) {
     Report report;
-    report.data = credJson(cred->record, cred->temporary);
-    report.text = credText(cred->record, cred->temporary);
+    report.data = credJson(cred.record, cred.temporary);
+    report.text = credText(cred.record, cred.temporary);
     return report;
 }
 
@@ -92,7 +85,9 @@ void addCredCommands(CLI::App &app, Command &chosen) {
     showCommand->add_option("CRED_ID", options->credId, "Its id, or the beginning of it")
         ->required();
     showCommand->footer("Example:\n  ovradr cred show 81c0");
-    showCommand->callback([&chosen, options] { chosen = [options] { return show(*options); }; });
+    showCommand->callback([&chosen, options] {
+        chosen = [options] { return resolveCred(options->credId).map(show); };
+    });
 
     addCredTestCommand(*family, chosen);
     addCredSetCommand(*family, chosen);

@@ -34,7 +34,7 @@ struct DeleteOptions {
     bool dryRun = false;
 };
 
-Failure setFailure(const DRNodeCredSet &flow, const Conn &conn) {
+Refusal setFailure(const DRNodeCredSet &flow, const Conn &conn) {
     // The one code with which writing the row fails: the credential was found before.
     if (flow.GetErrCode() == ERR::kCredNotFound) {
         return failure(ExitCode::kNotSetUp,
@@ -42,13 +42,13 @@ Failure setFailure(const DRNodeCredSet &flow, const Conn &conn) {
                        "The credential is as it was. The system log says why; correct that and "
                        "try again.");
     }
-    Failure found = failureOf(flow);
+    Failure found = failureOf(flow).value();
     if (flow.GetErrCode() == ERR::kOtherNode) {
         found.message = "This is another node than the one that the credential is for.";
         found.hint = "Check the URL, or make a new credential with `ovradr cred create`.";
     }
-    found.message = targetText(conn) + ": " + found.message;
-    return found;
+    found.message.insert(0, targetText(conn) + ": ");
+    return Refusal(found);
 }
 
 /// What an update did, by the row as it stands now.
@@ -69,7 +69,7 @@ Outcome reportUpdate(const DRNode &before, const std::string &account,
     } else {
         addRelease(report.data, result.release);
         report.text += "The session of before: " + printable(releaseText(result.release, false)) +
-                       (result.release.outcome == OvraApps::ReleaseOutcome::kLeft ? "\n" : ".\n");
+                       (result.release.state == OvraApps::Release::State::kLeft ? "\n" : ".\n");
     }
     return report;
 }
@@ -94,7 +94,7 @@ Outcome runUpdate(DRNodeCredSet &flow, const DRNode &record, const Conn &conn,
 Outcome set(const SetOptions &options) {
     const Expected<FoundCred> cred = resolveCred(options.credId);
     if (!cred) {
-        return cred.failure();
+        return Refusal(cred.error());
     }
     const DRNode &record = cred->record;
     if (cred->temporary) {
@@ -104,11 +104,11 @@ Outcome set(const SetOptions &options) {
     const Expected<Conn> conn =
         options.url.empty() ? Expected<Conn>(record.conn) : parseTarget(options.url);
     if (!conn) {
-        return conn.failure();
+        return Refusal(conn.error());
     }
     const Expected<Conn> direct = meet(*conn, options.fingerprint);
     if (!direct) {
-        return direct.failure();
+        return Refusal(direct.error());
     }
     DRNodeCredSet flow(record.credId);
     bool proved = false;
@@ -116,8 +116,8 @@ Outcome set(const SetOptions &options) {
         proved = flow.setCred(*conn, options.login.account, password, code);
         return proved ? 0 : flow.GetErrCode();
     };
-    if (const Trouble trouble = logIn(options.login, direct->addr, attempt)) {
-        return *trouble;
+    if (const auto tried = logIn(options.login, direct->addr, attempt); !tried) {
+        return Refusal(tried.error());
     }
     return proved ? runUpdate(flow, record, *direct, options) : setFailure(flow, *conn);
 }
@@ -139,7 +139,7 @@ Report reportDeletion(const DRNode &record, const OvraApps::Release &release, bo
 Outcome remove(const DeleteOptions &options) {
     const Expected<FoundCred> cred = resolveCred(options.credId);
     if (!cred) {
-        return cred.failure();
+        return Refusal(cred.error());
     }
     if (options.dryRun) {
         return reportDeletion(cred->record, OvraApps::foreseeRelease(cred->record), true);

@@ -40,15 +40,15 @@ std::unique_ptr<CredCreate> newFlow(bool temporary) {
     return std::make_unique<OvraDRNode::DRNodeCredCreate>();
 }
 
-Failure flowFailure(const CredCreate &flow, const Conn &conn) {
+Refusal flowFailure(const CredCreate &flow, const Conn &conn) {
     // The one code with which storing the row fails; no other step of a creation has it.
     if (flow.GetErrCode() == ERR::kCredNotFound) {
         return failure(ExitCode::kNotSetUp,
                        "The other appliance granted the credential, but it could not be stored.",
                        "The system log says why; correct that and make the credential again.");
     }
-    Failure found = failureOf(flow);
-    found.message = targetText(conn) + ": " + found.message;
+    Refusal found = failureOf(flow);
+    found.value().message.insert(0, targetText(conn) + ": ");
     return found;
 }
 
@@ -95,8 +95,8 @@ Outcome createByAccount(const CreateOptions &options, const Conn &conn, const Co
         proved = flow->setCred(conn, options.login.account, password, code);
         return proved ? 0 : flow->GetErrCode();
     };
-    if (const Trouble trouble = logIn(options.login, direct.addr, attempt)) {
-        return *trouble;
+    if (const auto tried = logIn(options.login, direct.addr, attempt); !tried) {
+        return Refusal(tried.error());
     }
     return proved ? runFlow(*flow, conn, options) : flowFailure(*flow, conn);
 }
@@ -107,7 +107,7 @@ Outcome createBySession(const CreateOptions &options, const Conn &conn) {
     source.file = source.fromStdin ? "" : options.sessionFile;
     const Expected<Secret> session = obtainPassword(source, "Session", false);
     if (!session) {
-        return session.failure();
+        return Refusal(session.error());
     }
     const std::unique_ptr<CredCreate> flow = newFlow(options.temporary);
     return flow->setCred(conn, session->get()) ? runFlow(*flow, conn, options)
@@ -118,14 +118,14 @@ Outcome createBySession(const CreateOptions &options, const Conn &conn) {
 Outcome createByCred(const CreateOptions &options) {
     const Expected<FoundCred> cred = resolveCred(options.credId);
     if (!cred) {
-        return cred.failure();
+        return Refusal(cred.error());
     }
     const std::unique_ptr<CredCreate> flow = newFlow(options.temporary);
     return flow->setCred(cred->record.credId) ? runFlow(*flow, cred->record.conn, options)
                                               : flowFailure(*flow, cred->record.conn);
 }
 
-Trouble checkProof(const CreateOptions &options) {
+Expected<void> checkProof(const CreateOptions &options) {
     const bool byCred = !options.credId.empty();
     const int proofs = (options.login.account.empty() ? 0 : 1) +
                        (options.sessionFile.empty() ? 0 : 1) + (byCred ? 1 : 0);
@@ -141,26 +141,26 @@ Trouble checkProof(const CreateOptions &options) {
                            ? "Leave the URL out."
                            : "Write for example: ovradr cred create https://HOST --account NAME");
     }
-    return std::nullopt;
+    return {};
 }
 
 Outcome create(const CreateOptions &options) {
-    if (const Trouble trouble = checkProof(options)) {
-        return *trouble;
+    if (const auto done = checkProof(options); !done) {
+        return Refusal(done.error());
     }
     if (!options.credId.empty()) {
         return createByCred(options);
     }
     const Expected<Conn> conn = parseTarget(options.url);
     if (!conn) {
-        return conn.failure();
+        return Refusal(conn.error());
     }
-    if (const Trouble trouble = checkNodeDatabase()) {
-        return *trouble;
+    if (const auto usable = checkNodeDatabase(); !usable) {
+        return Refusal(usable.error());
     }
     const Expected<Conn> direct = meet(*conn, options.fingerprint);
     if (!direct) {
-        return direct.failure();
+        return Refusal(direct.error());
     }
     return options.sessionFile.empty() ? createByAccount(options, *conn, *direct)
                                        : createBySession(options, *conn);

@@ -32,7 +32,7 @@ struct ReverseOptions {
 };
 
 /// The daemon of this appliance has to run, and the account has to be one that may grant sessions.
-Trouble checkAccount(const std::string &account) {
+Expected<void> checkAccount(const std::string &account) {
     const OvraDRCore::Response answer =
         OvraDRNode::BaseSender::run(OvraDRNode::WebAPI::OvraCoreUserGetAPI(account));
     if (answer.getErrCode() == OvraPlatform::APIError::kBadParameter) {
@@ -40,13 +40,13 @@ Trouble checkAccount(const std::string &account) {
                        "`ovradr user list` shows those that it has.");
     }
     if (!answer.isSuccess()) {
-        Failure found = failureOf(answer.getErrCode(), answer.getErrMsg());
-        found.message = "The account " + account + " of this appliance: " + found.message;
+        Refusal found = failureOf(answer.getErrCode(), answer.getErrMsg());
+        found.value().message.insert(0, "The account " + account + " of this appliance: ");
         return found;
     }
     const Json::Value &data = answer.getData();
     if (data["administrator"].isBool() && data["administrator"].asBool()) {
-        return std::nullopt;
+        return {};
     }
     return failure(ExitCode::kNotPermitted,
                    "The account " + account + " of this appliance is not an administrator.",
@@ -59,7 +59,7 @@ Expected<std::vector<Conn>> offeredConns(const std::vector<std::string> &endpoin
     for (const std::string &text : endpoints) {
         const Expected<Conn> conn = parseTarget(text);
         if (!conn) {
-            return conn.failure();
+            return Refusal(conn.error());
         }
         conns.push_back(*conn);
     }
@@ -73,15 +73,15 @@ Expected<std::vector<Conn>> offeredConns(const std::vector<std::string> &endpoin
     return conns;
 }
 
-Failure reverseFailure(const CredReverseCreate &flow) {
+Refusal reverseFailure(const CredReverseCreate &flow) {
     // With words it is what the other appliance said about the endpoints of this one.
     const bool unreachable =
         flow.GetErrCode() == ERR::kNotConnectable && !flow.GetErrMsg().isNull();
-    Failure found = unreachable ? failureOf(ERR::kRemoteConnInvalid)
+    Refusal found = unreachable ? failureOf(ERR::kRemoteConnInvalid)
                                 : failureOf(flow.GetErrCode() == ERR::kNone ? ERR::kCredIncomplete
                                                                             : flow.GetErrCode(),
                                             flow.GetErrMsg());
-    found.message = "No credential back to this appliance: " + found.message;
+    found.value().message.insert(0, "No credential back to this appliance: ");
     return found;
 }
 
@@ -111,14 +111,14 @@ Outcome report(const ReverseOptions &options, const DRNode &via, const CredRever
 Outcome reverse(const ReverseOptions &options) {
     const Expected<FoundCred> cred = resolveCred(options.credId);
     if (!cred) {
-        return cred.failure();
+        return Refusal(cred.error());
     }
     const Expected<std::vector<Conn>> conns = offeredConns(options.endpoints);
     if (!conns) {
-        return conns.failure();
+        return Refusal(conns.error());
     }
-    if (const Trouble trouble = checkAccount(options.account)) {
-        return *trouble;
+    if (const auto permitted = checkAccount(options.account); !permitted) {
+        return Refusal(permitted.error());
     }
     const std::unique_ptr<CredReverseCreate> flow =
         options.temporary ? std::make_unique<OvraDRNode::TempCredReverseCreate>()

@@ -19,19 +19,15 @@ using OvraDRNode::DRNode;
 namespace WebAPI = OvraDRNode::WebAPI;
 
 /// Why a request got no success.
-Failure refusal(const CredNodeSender &sender, const Response &response) {
-    Failure found = failureOf(errorOf(sender, response));
-    found.message = targetText(sender.getNode().conn) + ": " + found.message;
+Refusal refusal(const CredNodeSender &sender, const Response &response) {
+    Refusal found = failureOf(errorOf(sender, response));
+    found.value().message.insert(0, targetText(sender.getNode().conn) + ": ");
     return found;
 }
 
 /// Whether the session is accepted, the node is the right one, and the right is there.
-Outcome test(const std::string &credId) {
-    const Expected<FoundCred> cred = resolveCred(credId);
-    if (!cred) {
-        return cred.failure();
-    }
-    const DRNode &record = cred->record;
+Outcome test(const FoundCred &cred) {
+    const DRNode &record = cred.record;
     CredNodeSender sender(record);
     const Response info = sender.process(WebAPI::getDRNodeInfoAPI({}));
     if (!info.isSuccess()) {
@@ -50,9 +46,9 @@ Outcome test(const std::string &credId) {
     const Response owner = sender.process(WebAPI::getDRNodeSessionGetAPI(record.session));
     const std::string account = owner.getDataFieldtoStr("account");
     Report report;
-    report.data = credJson(record, cred->temporary);
+    report.data = credJson(record, cred.temporary);
     report.data["account"] = account;
-    report.text = credText(record, cred->temporary, account) + "It works.\n";
+    report.text = credText(record, cred.temporary, account) + "It works.\n";
     return report;
 }
 
@@ -65,7 +61,8 @@ void addCredTestCommand(CLI::App &family, Command &chosen) {
     const auto credId = std::make_shared<std::string>();
     command->add_option("CRED_ID", *credId, "Its id, or the beginning of it")->required();
     command->footer("Nothing is changed.\nExample:\n  ovradr cred test 81c0");
-    command->callback([&chosen, credId] { chosen = [credId] { return test(*credId); }; });
+    command->callback(
+        [&chosen, credId] { chosen = [credId] { return resolveCred(*credId).and_then(test); }; });
 }
 
 } // namespace Ovradr

@@ -30,23 +30,23 @@ struct DoctorOptions {
     std::string fingerprint;
 };
 
-/// The outcome of all examinations: the first failure, with everything that was found.
+/// The result of all examinations: the first failure, with everything that was found.
 Outcome conclude(const std::vector<Examination> &examinations) {
     Report report;
     report.data["examinations"] = Json::Value(Json::arrayValue);
-    Trouble trouble;
+    Expected<void> verdict;
     for (const Examination &examination : examinations) {
         report.data["examinations"].append(examination.toJson());
         report.text += (report.text.empty() ? "" : "\n") + examination.toText();
-        trouble = trouble ? trouble : examination.trouble();
+        verdict = verdict ? examination.verdict() : verdict;
     }
-    if (!trouble) {
+    if (verdict) {
         report.text += "\nNothing is wrong.\n";
         return report;
     }
-    trouble->data = report.data;
-    trouble->text = report.text + "\n";
-    return *trouble;
+    verdict.error().data = report.data;
+    verdict.error().text = report.text + "\n";
+    return Refusal(verdict.error());
 }
 
 Outcome examineLocal() {
@@ -82,7 +82,7 @@ std::optional<DRNode> credentialAt(const Conn &conn) {
 Outcome examineUrl(const DoctorOptions &options) {
     const Expected<Conn> conn = parseTarget(options.subject);
     if (!conn) {
-        return conn.failure();
+        return Refusal(conn.error());
     }
     std::vector<Examination> examinations;
     examinations.emplace_back("Endpoint " + targetText(*conn));
@@ -93,7 +93,7 @@ Outcome examineUrl(const DoctorOptions &options) {
     const Expected<Secret> password = obtainPassword(
         options.password, "Password of " + options.account + " on " + conn->addr, false);
     if (!password) {
-        return password.failure();
+        return Refusal(password.error());
     }
     const LoginTrial login{options.account, *password, options.oneTimeCode};
     examineEndpoint({*conn, {}, login, options.fingerprint}, examinations.back());
@@ -115,11 +115,9 @@ Outcome doctor(const DoctorOptions &options) {
     if (options.subject == "local") {
         return examineLocal();
     }
-    const Expected<std::string> nodeId = resolveNode(options.subject);
-    if (!nodeId) {
-        return nodeId.failure();
-    }
-    return DRNode::isLocalNodeId(*nodeId) ? examineLocal() : examineNode(*nodeId);
+    return resolveNode(options.subject).and_then([](const std::string &nodeId) {
+        return DRNode::isLocalNodeId(nodeId) ? examineLocal() : examineNode(nodeId);
+    });
 }
 
 } // namespace

@@ -21,6 +21,7 @@ using OvraDRCore::Response;
 using OvraDRNode::Conn;
 using OvraPlatform::CredError;
 using OvraPlatform::FarlinkClient;
+using OvraPlatform::FarlinkFailure;
 using OvraPlatform::FarlinkKey;
 using OvraPlatform::FarlinkReply;
 using OvraPlatform::FarlinkSettings;
@@ -61,21 +62,20 @@ Expected<FarlinkSettings> parseServer(const std::string &text) {
     return FarlinkSettings{conn->addr, conn->port, ""};
 }
 
-Failure serviceFailure(const FarlinkSettings &settings, const FarlinkReply &reply) {
-    if (reply.error != CredError::kNone) {
-        return endpointFailure(serverOf(settings), reply.error);
+Refusal serviceFailure(const FarlinkSettings &settings, const FarlinkFailure &why) {
+    if (why.error != CredError::kNone) {
+        return endpointFailure(serverOf(settings), why.error);
     }
     // Behind the last colon it says what to do.
-    const std::string why = reply.why();
-    const std::size_t colon = why.rfind(": ");
-    const int code = reply.response.getErrCode();
-    Failure found =
-        failure(code == APIError::kNoPermission ? ExitCode::kNotPermitted : ExitCode::kFailed,
-                "The relay service refuses: " + why.substr(0, colon) + ".",
-                colon == std::string::npos ? "Its log says more." : why.substr(colon + 2) + ".");
-    found.code = code;
-    found.hint.front() = static_cast<char>(std::toupper(found.hint.front()));
-    return found;
+    const std::size_t colon = why.text.rfind(": ");
+    Refusal refusal = failure(
+        why.code == APIError::kNoPermission ? ExitCode::kNotPermitted : ExitCode::kFailed,
+        "The relay service refuses: " + why.text.substr(0, colon) + ".",
+        colon == std::string::npos ? "Its log says more." : why.text.substr(colon + 2) + ".");
+    refusal.value().code = why.code;
+    std::string &hint = refusal.value().hint;
+    hint.front() = static_cast<char>(std::toupper(static_cast<unsigned char>(hint.front())));
+    return refusal;
 }
 
 Expected<FarlinkKey> ownKey() {
@@ -93,7 +93,7 @@ Response askDaemon() {
         OvraDRCore::Request("OVRA.Core.Farlink", 1, "get", Json::Value(Json::objectValue)));
 }
 
-Failure notWritten() {
+Refusal notWritten() {
     return failure(ExitCode::kNotSetUp,
                    std::string(OvraPlatform::kFarlinkFile) + " cannot be written.",
                    "Run the command as root, on a disk that is not full.");
@@ -102,12 +102,12 @@ Failure notWritten() {
 Outcome enable(const FarlinkOptions &options) {
     const Expected<FarlinkSettings> server = parseServer(options.server);
     if (!server) {
-        return server.failure();
+        return Refusal(server.error());
     }
     FarlinkSettings settings = *server;
     settings.alias = options.alias;
-    if (const Trouble trouble = trustPeer(serverOf(settings), options.fingerprint)) {
-        return *trouble;
+    if (const auto trusted = trustPeer(serverOf(settings), options.fingerprint); !trusted) {
+        return Refusal(trusted.error());
     }
     Report report;
     report.data["server"] = targetText(serverOf(settings));
@@ -115,14 +115,14 @@ Outcome enable(const FarlinkOptions &options) {
         // Whether it can be had is told now, and not in the log of the daemon.
         const Expected<FarlinkKey> key = ownKey();
         if (!key) {
-            return key.failure();
+            return Refusal(key.error());
         }
         const FarlinkReply reply = FarlinkClient(settings).enrol(*key);
-        if (!reply.isSuccess()) {
-            return serviceFailure(settings, reply);
+        if (!reply) {
+            return serviceFailure(settings, reply.error());
         }
         report.data["alias"] = settings.alias;
-        report.data["port"] = reply.response.getDataField("port");
+        report.data["port"] = reply->getDataField("port");
     }
     if (!OvraPlatform::writeFarlinkSettings(settings)) {
         return notWritten();
@@ -135,8 +135,7 @@ Outcome enable(const FarlinkOptions &options) {
 }
 
 Outcome disable(const FarlinkOptions &options) {
-    std::string ignored;
-    const FarlinkSettings settings = OvraPlatform::readFarlinkSettings(ignored);
+    const auto settings = OvraPlatform::readFarlinkSettings().value_or(FarlinkSettings());
     // First, so that the daemon does not come back.
     if (!OvraPlatform::writeFarlinkSettings({})) {
         return notWritten();
@@ -144,18 +143,18 @@ Outcome disable(const FarlinkOptions &options) {
     if (options.release && !settings.alias.empty()) {
         const Expected<FarlinkKey> key = ownKey();
         if (!key) {
-            return key.failure();
+            return Refusal(key.error());
         }
         const FarlinkClient client(settings);
-        FarlinkReply reply = client.enrol(*key);
-        if (reply.isSuccess()) {
-            reply = client.release(reply.response.getDataFieldtoStr("token"));
-        }
-        if (!reply.isSuccess()) {
-            Failure found = serviceFailure(settings, reply);
-            found.message = "The relay service is off, but still keeps the alias \"" +
-                            settings.alias + "\": " + found.message;
-            return found;
+        const FarlinkReply reply = client.enrol(*key).and_then([&client](const Response &answer) {
+            return client.release(answer.getDataFieldtoStr("token"));
+        });
+        if (!reply) {
+            Refusal refusal = serviceFailure(settings, reply.error());
+            refusal.value().message.insert(
+                0,
+                "The relay service is off, but still keeps the alias \"" + settings.alias + "\": ");
+            return refusal;
         }
     }
     Report report;
@@ -169,27 +168,27 @@ Outcome disable(const FarlinkOptions &options) {
 }
 
 Outcome status() {
-    std::string problem;
-    const FarlinkSettings settings = OvraPlatform::readFarlinkSettings(problem);
-    if (!problem.empty()) {
-        return failure(ExitCode::kNotSetUp, problem.substr(0, problem.rfind(": ")) + ".",
+    const auto settings = OvraPlatform::readFarlinkSettings();
+    if (!settings) {
+        const std::string &why = settings.error();
+        return failure(ExitCode::kNotSetUp, why.substr(0, why.rfind(": ")) + ".",
                        "Run `ovradr farlink enable` again.");
     }
     Report report;
-    report.data["server"] = settings.host.empty() ? "" : targetText(serverOf(settings));
-    report.data["alias"] = settings.alias;
-    if (settings.host.empty()) {
+    report.data["server"] = settings->host.empty() ? "" : targetText(serverOf(*settings));
+    report.data["alias"] = settings->alias;
+    if (settings->host.empty()) {
         report.text = "No relay service is used; `ovradr farlink enable` sets one up.\n";
         return report;
     }
     const Response daemon = askDaemon();
     const bool connected =
-        OvraDRCore::memberString(daemon.getData(), "server_alias") == settings.alias &&
+        OvraDRCore::memberString(daemon.getData(), "server_alias") == settings->alias &&
         daemon.getDataField("connected").isBool() && daemon.getDataField("connected").asBool();
     std::string state = "not needed: only others are looked up";
-    if (!settings.alias.empty()) {
+    if (!settings->alias.empty()) {
         report.data["connected"] = connected;
-        problem = OvraDRCore::memberString(daemon.getData(), "problem");
+        const std::string problem = OvraDRCore::memberString(daemon.getData(), "problem");
         state = connected             ? "yes, callers at port " + daemon.getDataFieldtoStr("port")
                 : !daemon.isSuccess() ? "no: ovradrd does not run"
                                       : "no: " + (problem.empty() ? "not yet" : problem);
@@ -202,7 +201,7 @@ Outcome status() {
         expires = timeText(daemon.getDataField("expires").asInt64()) + ", unless renewed";
     }
     report.text = listing({{"server", report.data["server"].asString()},
-                           {"alias", settings.alias},
+                           {"alias", settings->alias},
                            {"connected", state},
                            {"expires", expires}});
     return report;

@@ -35,7 +35,7 @@ Json::Value toJson(const CachedVerdict &verdict) {
     return verdict.known ? Json::Value(verdict.value) : Json::Value();
 }
 
-Trouble reset(bool yes) {
+Expected<void> reset(bool yes) {
     if (!yes && !isInteractive()) {
         return failure(ExitCode::kUsage, "There is no terminal on which this could be confirmed.",
                        "Add --yes if you mean it.");
@@ -48,23 +48,21 @@ Trouble reset(bool yes) {
         return failure(ExitCode::kNotSetUp, "The node id could not be reset.",
                        "Try again in a moment; the system log says more.");
     }
-    return std::nullopt;
+    return {};
 }
 
 Outcome nodeId(const NodeIdOptions &options) {
     if (options.reset) {
-        if (const Trouble trouble = reset(options.yes)) {
-            return *trouble;
+        if (const auto done = reset(options.yes); !done) {
+            return Refusal(done.error());
         }
     }
-    const Expected<std::string> id = localNode();
-    if (!id) {
-        return id.failure();
-    }
-    Report report;
-    report.data["node_id"] = *id;
-    report.text = printable(*id) + "\n";
-    return report;
+    return localNode().map([](const std::string &id) {
+        Report report;
+        report.data["node_id"] = id;
+        report.text = printable(id) + "\n";
+        return report;
+    });
 }
 
 /// What a node says about itself, asked now.
@@ -78,35 +76,31 @@ Expected<Json::Value> askNode(const std::string &nodeId) {
     return failureOf(errorOf(sender, answer));
 }
 
-Outcome nodeInfo(const NodeInfoOptions &options) {
-    const Expected<std::string> nodeId = resolveNode(options.node);
-    if (!nodeId) {
-        return nodeId.failure();
-    }
-    const NodeCache cache(*nodeId, true);
+Outcome nodeInfo(const std::string &nodeId, bool refresh) {
+    const NodeCache cache(nodeId, true);
     Json::Value info;
-    if (!options.refresh) {
+    if (!refresh) {
         info = cache.Read();
     }
     if (!info.isObject()) {
-        const Expected<Json::Value> asked = askNode(*nodeId);
+        const Expected<Json::Value> asked = askNode(nodeId);
         if (!asked) {
-            return asked.failure();
+            return Refusal(asked.error());
         }
         info = *asked;
         cache.UpdateWithData(info);
     }
-    const bool local = DRNode::isLocalNodeId(*nodeId);
-    const CachedVerdict reachable = reachability(OvraDRNode::listNodeCandidates(*nodeId));
+    const bool local = DRNode::isLocalNodeId(nodeId);
+    const CachedVerdict reachable = reachability(OvraDRNode::listNodeCandidates(nodeId));
     const double age = cache.GetCachedAge();
     Report report;
-    report.data["node_id"] = *nodeId;
+    report.data["node_id"] = nodeId;
     report.data["local"] = local;
     report.data["info"] = info;
     report.data["age"] = age;
     report.data["reachable"] = local ? Json::Value(true) : toJson(reachable);
     report.text =
-        listing({{"node", *nodeId},
+        listing({{"node", nodeId},
                  {"host name", OvraDRCore::memberString(info, "hostname")},
                  {"serial number", OvraDRCore::memberString(info, "serial")},
                  {"time zone", OvraDRCore::memberString(info.get("additional", {}), "timezone")},
@@ -140,16 +134,12 @@ void addRow(const std::string &nodeId, Report &report,
 }
 
 /// From the caches alone; this node first.
-Outcome nodeList() {
-    const Expected<std::set<std::string>> nodes = listNodes();
-    if (!nodes) {
-        return nodes.failure();
-    }
+Report nodeList(const std::set<std::string> &nodes) {
     Report report;
     report.data["nodes"] = Json::Value(Json::arrayValue);
     std::vector<std::vector<std::string>> rows;
     addRow(DRNode::getLocalNodeId(), report, rows);
-    for (const std::string &nodeId : *nodes) {
+    for (const std::string &nodeId : nodes) {
         if (!DRNode::isLocalNodeId(nodeId)) {
             addRow(nodeId, report, rows);
         }
@@ -167,7 +157,13 @@ void addInfo(CLI::App &family, Command &chosen) {
     info->footer("Without --refresh a node is asked when its last answer is older than a minute, "
                  "and\nshown as it was when it does not answer.\n"
                  "Example:\n  ovradr node info 3f2a --refresh");
-    info->callback([&chosen, options] { chosen = [options] { return nodeInfo(*options); }; });
+    info->callback([&chosen, options] {
+        chosen = [options] {
+            return resolveNode(options->node).and_then([&options](const std::string &nodeId) {
+                return nodeInfo(nodeId, options->refresh);
+            });
+        };
+    });
 }
 
 } // namespace
@@ -187,7 +183,7 @@ void addNodeCommands(CLI::App &app, Command &chosen) {
     CLI::App *list = family->add_subcommand("list", "List the nodes and how they are reached.");
     list->footer("It tells what the processes of this appliance know and sends nothing.\n"
                  "Example:\n  ovradr node list");
-    list->callback([&chosen] { chosen = nodeList; });
+    list->callback([&chosen] { chosen = [] { return listNodes().map(nodeList); }; });
 }
 
 } // namespace Ovradr

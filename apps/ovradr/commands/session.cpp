@@ -23,7 +23,7 @@ struct SelectOptions {
 
 constexpr const char *kListHint = "`ovradr session list` shows all.";
 
-/// The node that is meant; it may be one that no credential reaches.
+/// The node that is meant, "" for ""; it may be one that no credential reaches.
 Expected<std::string> resolveGrantee(const std::vector<GrantedSession> &sessions,
                                      const std::string &text) {
     std::set<std::string> ids;
@@ -32,16 +32,19 @@ Expected<std::string> resolveGrantee(const std::vector<GrantedSession> &sessions
             ids.insert(session.nodeId);
         }
     }
-    return chooseId(ids, text, "node with a session here", kListHint);
+    return text.empty() ? Expected<std::string>("")
+                        : chooseId(ids, text, "node with a session here", kListHint);
 }
 
+/// The session that is meant, "" for "".
 Expected<std::string> resolveReference(const std::vector<GrantedSession> &sessions,
                                        const std::string &text) {
     std::set<std::string> references;
     for (const GrantedSession &session : sessions) {
         references.insert(session.reference());
     }
-    return chooseId(references, text, "session", kListHint);
+    return text.empty() ? Expected<std::string>("")
+                        : chooseId(references, text, "session", kListHint);
 }
 
 /// Those of the sessions that the options name; without any, all.
@@ -50,26 +53,15 @@ Expected<std::vector<GrantedSession>> select(const SelectOptions &options) {
     if (!sessions) {
         return sessions;
     }
-    std::string nodeId;
-    if (!options.node.empty()) {
-        const Expected<std::string> found = resolveGrantee(*sessions, options.node);
-        if (!found) {
-            return found.failure();
-        }
-        nodeId = *found;
-    }
-    std::string reference;
-    if (!options.reference.empty()) {
-        const Expected<std::string> found = resolveReference(*sessions, options.reference);
-        if (!found) {
-            return found.failure();
-        }
-        reference = *found;
+    const Expected<std::string> nodeId = resolveGrantee(*sessions, options.node);
+    const Expected<std::string> reference = resolveReference(*sessions, options.reference);
+    if (!nodeId || !reference) {
+        return Refusal((nodeId ? reference : nodeId).error());
     }
     std::erase_if(*sessions, [&](const GrantedSession &session) {
-        return (!nodeId.empty() && session.nodeId != nodeId) ||
+        return (!nodeId->empty() && session.nodeId != *nodeId) ||
                (!options.account.empty() && session.record.user != options.account) ||
-               (!reference.empty() && session.reference() != reference);
+               (!reference->empty() && session.reference() != *reference);
     });
     return sessions;
 }
@@ -83,21 +75,17 @@ Report reportOf(const std::vector<GrantedSession> &sessions, const char *member)
     return report;
 }
 
-Outcome list(const SelectOptions &options) {
-    const Expected<std::vector<GrantedSession>> sessions = select(options);
-    if (!sessions) {
-        return sessions.failure();
-    }
-    Report report = reportOf(*sessions, "sessions");
+Report list(const std::vector<GrantedSession> &sessions) {
+    Report report = reportOf(sessions, "sessions");
     report.text =
-        sessions->empty() ? "No sessions are granted to other nodes.\n" : sessionTable(*sessions);
+        sessions.empty() ? "No sessions are granted to other nodes.\n" : sessionTable(sessions);
     return report;
 }
 
-Trouble confirmRevocation(const SelectOptions &options,
-                          const std::vector<GrantedSession> &sessions) {
+Expected<void> confirmRevocation(const SelectOptions &options,
+                                 const std::vector<GrantedSession> &sessions) {
     if (!options.reference.empty() || options.yes || sessions.empty()) {
-        return std::nullopt;
+        return {};
     }
     if (!isInteractive()) {
         return failure(ExitCode::kUsage, "There is no terminal on which this could be confirmed.",
@@ -105,7 +93,7 @@ Trouble confirmRevocation(const SelectOptions &options,
     }
     return confirm("Nodes that use these " + std::to_string(sessions.size()) +
                    " sessions will have to pair with this one again. End them?")
-               ? Trouble()
+               ? Expected<void>()
                : failure(ExitCode::kFailed, "The sessions stay.", "");
 }
 
@@ -117,7 +105,7 @@ Outcome revoke(const SelectOptions &options) {
     }
     const Expected<std::vector<GrantedSession>> sessions = select(options);
     if (!sessions) {
-        return sessions.failure();
+        return Refusal(sessions.error());
     }
     if (options.dryRun) {
         Report report = reportOf(*sessions, "would_revoke");
@@ -125,11 +113,11 @@ Outcome revoke(const SelectOptions &options) {
                                         : "These would end:\n" + sessionTable(*sessions);
         return report;
     }
-    if (const Trouble trouble = confirmRevocation(options, *sessions)) {
-        return *trouble;
+    if (const auto confirmed = confirmRevocation(options, *sessions); !confirmed) {
+        return Refusal(confirmed.error());
     }
-    if (const Trouble trouble = endSessions(*sessions)) {
-        return *trouble;
+    if (const auto ended = endSessions(*sessions); !ended) {
+        return Refusal(ended.error());
     }
     Report report = reportOf(*sessions, "revoked");
     report.text = "Ended: " + std::to_string(sessions->size()) +
@@ -153,7 +141,8 @@ void addSessionCommands(CLI::App &app, Command &chosen) {
         family->add_subcommand("list", "List the sessions that were granted to other nodes.");
     addFilters(*listing, *options);
     listing->footer("Example:\n  ovradr session list --node 3f2a");
-    listing->callback([&chosen, options] { chosen = [options] { return list(*options); }; });
+    listing->callback(
+        [&chosen, options] { chosen = [options] { return select(*options).map(list); }; });
 
     CLI::App *revoking = family->add_subcommand(
         "revoke", "End sessions: the credentials that use them stop working.");

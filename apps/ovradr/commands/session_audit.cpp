@@ -76,7 +76,7 @@ Expected<std::vector<HeldCred>> heldCreds(const std::string &nodeId, const std::
     params["node_id"] = localId;
     const Expected<Json::Value> data = ask(nodeId, "list", params);
     if (!data) {
-        return data.failure();
+        return Refusal(data.error());
     }
     std::vector<HeldCred> creds;
     const Json::Value entries = data->isObject() ? (*data)["creds"] : Json::Value();
@@ -102,11 +102,11 @@ Expected<std::vector<HeldCred>> heldCreds(const std::string &nodeId, const std::
 Expected<Audit> look(const std::string &nodeId, const std::string &localId) {
     const Expected<std::vector<HeldCred>> held = heldCreds(nodeId, localId);
     if (!held) {
-        return held.failure();
+        return Refusal(held.error());
     }
     const Expected<std::vector<GrantedSession>> sessions = grantedSessions();
     if (!sessions) {
-        return sessions.failure();
+        return Refusal(sessions.error());
     }
     Audit audit{nodeId, {}, *held, {}};
     for (const GrantedSession &session : *sessions) {
@@ -177,10 +177,10 @@ std::string countText(std::size_t sessions, std::size_t creds) {
            std::to_string(creds) + (creds == 1 ? " credential" : " credentials") + " over there";
 }
 
-Trouble confirmRevocation(bool yes, const std::string &found, std::size_t sessions,
-                          std::size_t creds) {
+Expected<void> confirmRevocation(bool yes, const std::string &found, std::size_t sessions,
+                                 std::size_t creds) {
     if (yes) {
-        return std::nullopt;
+        return {};
     }
     if (!isInteractive()) {
         return failure(ExitCode::kUsage, "There is no terminal on which this could be confirmed.",
@@ -188,7 +188,7 @@ Trouble confirmRevocation(bool yes, const std::string &found, std::size_t sessio
     }
     std::fputs(found.c_str(), stderr);
     return confirm("Remove the orphans, " + countText(sessions, creds) + "?")
-               ? Trouble()
+               ? Expected<void>()
                : failure(ExitCode::kFailed, "Everything stays as it is.", "");
 }
 
@@ -204,8 +204,8 @@ Outcome revoke(const Audit &first, const Audit &second) {
     report.data = toJson(second);
     report.data["revoked"] = Json::Value(Json::arrayValue);
     report.data["deleted"] = Json::Value(Json::arrayValue);
-    if (const Trouble trouble = endSessions(sessions)) {
-        return *trouble;
+    if (const auto ended = endSessions(sessions); !ended) {
+        return Refusal(ended.error());
     }
     for (const GrantedSession &session : sessions) {
         report.data["revoked"].append(session.reference());
@@ -215,7 +215,7 @@ Outcome revoke(const Audit &first, const Audit &second) {
         params["cred_id"] = cred.credId;
         const Expected<Json::Value> done = ask(second.nodeId, "delete", params);
         if (!done) {
-            return done.failure();
+            return Refusal(done.error());
         }
         report.data["deleted"].append(cred.credId);
     }
@@ -227,7 +227,7 @@ Outcome audit(const AuditOptions &options) {
     const Expected<std::string> nodeId = resolveNode(options.node);
     const Expected<std::string> localId = localNode();
     if (!nodeId || !localId) {
-        return nodeId ? localId.failure() : nodeId.failure();
+        return Refusal((nodeId ? localId : nodeId).error());
     }
     if (*nodeId == *localId) {
         return failure(ExitCode::kUsage, "This node grants itself no sessions.",
@@ -235,7 +235,7 @@ Outcome audit(const AuditOptions &options) {
     }
     const Expected<Audit> first = look(*nodeId, *localId);
     if (!first) {
-        return first.failure();
+        return Refusal(first.error());
     }
     const auto looked = std::chrono::steady_clock::now();
     const std::size_t sessions = orphanSessions(*first).size();
@@ -246,12 +246,14 @@ Outcome audit(const AuditOptions &options) {
     if (!options.revoke || sessions + creds == 0) {
         return report;
     }
-    if (const Trouble trouble = confirmRevocation(options.yes, toText(*first), sessions, creds)) {
-        return *trouble;
+    if (const auto confirmed = confirmRevocation(options.yes, toText(*first), sessions, creds);
+        !confirmed) {
+        return Refusal(confirmed.error());
     }
     std::this_thread::sleep_until(looked + kBetweenLooks);
-    const Expected<Audit> second = look(*nodeId, *localId);
-    return second ? revoke(*first, *second) : second.failure();
+    return look(*nodeId, *localId).and_then([&first](const Audit &second) {
+        return revoke(*first, second);
+    });
 }
 
 } // namespace

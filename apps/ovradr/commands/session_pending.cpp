@@ -44,7 +44,7 @@ std::vector<std::string> toRow(const PendingRelease &release) {
             timeText(release.noted),
             std::to_string(release.attempts),
             timeText(release.nextTry),
-            fresh ? "not tried yet" : failureOf(release.code).message};
+            fresh ? "not tried yet" : failureOf(release.code).value().message};
 }
 
 Report reportOf(const std::vector<PendingRelease> &releases) {
@@ -70,7 +70,7 @@ Outcome forget(PendingReleases &store, const std::vector<PendingRelease> &releas
     const Expected<std::string> reference =
         chooseId(references, text, "pending session", "`ovradr session pending` shows all.");
     if (!reference) {
-        return reference.failure();
+        return Refusal(reference.error());
     }
     if (!store.remove(*reference)) {
         return storeFailure(ExitCode::kNotSetUp, store.error());
@@ -86,12 +86,12 @@ Report retry(PendingReleases &store, const std::vector<PendingRelease> &releases
     Report report;
     report.data["tried"] = Json::Value(Json::arrayValue);
     for (const PendingRelease &release : releases) {
-        const OvraApps::Release outcome = OvraApps::retryRelease(release, store);
+        const OvraApps::Release result = OvraApps::retryRelease(release, store);
         Json::Value json = toJson(release);
-        addRelease(json, outcome);
+        addRelease(json, result);
         report.data["tried"].append(json);
         report.text += release.reference() + " at " + printable(targetText(release.conn)) + ": " +
-                       printable(releaseText(outcome, false)) + "\n";
+                       printable(releaseText(result, false)) + "\n";
     }
     if (releases.empty()) {
         report.text = reportOf(releases).text;

@@ -45,7 +45,7 @@ CLI::Validator usableAs(const char *key) {
             ""};
 }
 
-Trouble makeFolders() {
+Expected<void> makeFolders() {
     using OvraPlatform::kConfigDir;
     if (!OvraDRCore::File::CreateDir(kConfigDir, 0755)) {
         return fileFailure(kConfigDir, errno);
@@ -56,7 +56,7 @@ Trouble makeFolders() {
                            " cannot be made, or is not this user's alone.",
                        "Run the command as root; the system log says more.");
     }
-    return std::nullopt;
+    return {};
 }
 
 /// Writes the settings that were given; the others keep their lines.
@@ -102,10 +102,10 @@ Expected<ApplianceConfig> checkSettings(const Settings &settings) {
     return config;
 }
 
-Trouble checkFile() {
+Expected<void> checkFile() {
     const ApplianceConfig config = OvraPlatform::readApplianceConfig();
     if (config.problems.empty()) {
-        return std::nullopt;
+        return {};
     }
     return failure(ExitCode::kNotSetUp,
                    std::string(OvraPlatform::kConfigFile) + ": " + config.problems.front() + ".",
@@ -134,7 +134,7 @@ Expected<SetUpStep> provisionSealKey(std::string &fingerprint) {
     return SetUpStep{"sealing key", !there, OvraPlatform::kSealKeyFile};
 }
 
-Failure keyFailure(const std::string &path, const OvraBase::Error &why) {
+Refusal keyFailure(const std::string &path, const OvraBase::Error &why) {
     if (why.number != 0) {
         return fileFailure(path, why.number);
     }
@@ -151,7 +151,7 @@ Expected<SetUpStep> provisionTlsKey() {
     }
     const Expected<bool> tightened = makePrivate(kTlsKeyFile);
     if (!tightened) {
-        return tightened.failure();
+        return Refusal(tightened.error());
     }
     return SetUpStep{"HTTPS key", *made,
                      std::string(kTlsKeyFile) + (*tightened ? ", now closed to other users" : "")};
@@ -210,14 +210,14 @@ Outcome report(const SetUp &setUp) {
 Outcome setUp(const Settings &settings) {
     const Expected<ApplianceConfig> config = checkSettings(settings);
     if (!config) {
-        return config.failure();
+        return Refusal(config.error());
     }
     const Expected<std::string> schema = findDataFile("node.sql");
     if (!schema) {
-        return schema.failure();
+        return Refusal(schema.error());
     }
-    if (const Trouble trouble = makeFolders()) {
-        return *trouble;
+    if (const auto made = makeFolders(); !made) {
+        return Refusal(made.error());
     }
     SetUp done;
     const std::vector<std::function<Expected<SetUpStep>()>> steps = {
@@ -232,12 +232,12 @@ Outcome setUp(const Settings &settings) {
     for (const auto &step : steps) {
         const Expected<SetUpStep> result = step();
         if (!result) {
-            return result.failure();
+            return Refusal(result.error());
         }
         done.steps.push_back(*result);
     }
-    if (const Trouble trouble = checkFile()) {
-        return *trouble;
+    if (const auto usable = checkFile(); !usable) {
+        return Refusal(usable.error());
     }
     done.httpsFingerprint = OvraService::certificateFingerprint(OvraPlatform::kTlsCertificateFile);
     return report(done);

@@ -36,8 +36,7 @@ struct SpeedOptions {
 /// One endpoint of this appliance, as it went.
 struct Tried {
     std::string endpoint;
-    std::string speed; ///< "" when it failed
-    Failure why;       ///< then
+    Expected<std::string> speed;
 };
 
 /// What a script said before it gave up, without its own name; with `fallback` when it said
@@ -81,24 +80,24 @@ Outcome measureUrl(const SpeedOptions &options) {
     return report;
 }
 
-Failure noneWorked(const std::vector<Tried> &tried) {
+Refusal noneWorked(const std::vector<Tried> &tried) {
     if (tried.empty()) {
         return failure(ExitCode::kNotSetUp, "This appliance serves at no address.",
                        "`ovradr conn local` shows its endpoints.");
     }
-    const Failure &last = tried.back().why;
+    Failure last = tried.back().speed.error();
     // The other appliance was not even asked.
     if (last.exit != ExitCode::kFailed) {
-        return last;
+        return Refusal(last);
     }
     std::string all;
     for (const Tried &one : tried) {
         all += (all.empty() ? "" : ", ") + one.endpoint;
     }
-    Failure none = last;
-    none.message = "The other appliance downloads from none of the endpoints of this one, tried " +
-                   all + ": " + last.message;
-    return none;
+    last.message.insert(
+        0, "The other appliance downloads from none of the endpoints of this one, tried " + all +
+               ": ");
+    return Refusal(last);
 }
 
 Outcome reportOf(const std::string &nodeId, const std::string &speed,
@@ -108,18 +107,18 @@ Outcome reportOf(const std::string &nodeId, const std::string &speed,
     addSpeed(report, speed);
     std::vector<std::vector<std::string>> rows;
     for (const Tried &one : tried) {
-        const bool worked = !one.speed.empty();
         Json::Value item;
         item["endpoint"] = one.endpoint;
-        item["success"] = worked;
-        if (worked) {
-            item["speed"] = one.speed;
+        item["success"] = one.speed.has_value();
+        if (one.speed) {
+            item["speed"] = *one.speed;
         } else {
-            item["code"] = one.why.code;
-            item["message"] = one.why.message;
+            item["code"] = one.speed.error().code;
+            item["message"] = one.speed.error().message;
         }
         report.data["endpoints"].append(item);
-        rows.push_back({one.endpoint, worked ? rateText(one.speed) : one.why.message});
+        rows.push_back(
+            {one.endpoint, one.speed ? rateText(*one.speed) : one.speed.error().message});
     }
     report.text = table({"ENDPOINT OF THIS APPLIANCE", "OUTCOME"}, rows) + "\n" +
                   listing({{"node", nodeId}, {"downloads at", rateText(speed)}});
@@ -129,10 +128,10 @@ Outcome reportOf(const std::string &nodeId, const std::string &speed,
 Outcome measureNode(const SpeedOptions &options) {
     const Expected<std::string> nodeId = resolveNode(options.node);
     if (!nodeId) {
-        return nodeId.failure();
+        return Refusal(nodeId.error());
     }
-    if (const Trouble trouble = checkNodeDatabase()) {
-        return *trouble;
+    if (const auto usable = checkNodeDatabase(); !usable) {
+        return Refusal(usable.error());
     }
     OvraDRNode::Node test;
     std::vector<Tried> tried;
@@ -148,10 +147,12 @@ Outcome measureNode(const SpeedOptions &options) {
                     progress.say(targetText(conn) + ": measuring");
                     return;
                 }
-                const bool worked = answer->isSuccess();
+                const std::string measured = answer->getDataFieldtoStr("speed");
                 tried.push_back(
-                    {targetText(conn), worked ? answer->getDataFieldtoStr("speed") : "",
-                     worked ? Failure() : failureOf(OvraDRNode::errorOf(sender, *answer))});
+                    {targetText(conn), !answer->isSuccess()
+                                           ? failureOf(OvraDRNode::errorOf(sender, *answer))
+                                       : measured.empty() ? failureOf(ERR::kFailed)
+                                                          : Expected<std::string>(measured)});
             });
         said = progress.caught();
     }

@@ -30,14 +30,14 @@ struct UserOptions {
     PasswordSource password;
 };
 
-Trouble checkOpen(const AccountStore &store) {
-    return store.isOpen() ? Trouble() : storeFailure(ExitCode::kNotSetUp, store.error());
+Expected<void> checkOpen(const AccountStore &store) {
+    return store.isOpen() ? Expected<void>() : storeFailure(ExitCode::kNotSetUp, store.error());
 }
 
 /// The account, or why it cannot be had.
 Expected<Account> findAccount(AccountStore &store, const std::string &name) {
-    if (const Trouble trouble = checkOpen(store)) {
-        return *trouble;
+    if (const auto open = checkOpen(store); !open) {
+        return Refusal(open.error());
     }
     const auto account = store.find(name);
     if (account) {
@@ -63,14 +63,12 @@ Json::Value toJson(const Account &account) {
 
 /// What a change of an account tells.
 Outcome changed(AccountStore &store, const std::string &name, const std::string &sentence) {
-    const Expected<Account> account = findAccount(store, name);
-    if (!account) {
-        return account.failure();
-    }
-    Report report;
-    report.data["user"] = toJson(*account);
-    report.text = printable(sentence) + "\n";
-    return report;
+    return findAccount(store, name).map([&sentence](const Account &account) {
+        Report report;
+        report.data["user"] = toJson(account);
+        report.text = printable(sentence) + "\n";
+        return report;
+    });
 }
 
 /// Ends every session of the account: whoever has one would go on acting as the user. A session
@@ -92,8 +90,8 @@ std::string endedText(int sessions) {
 
 Outcome add(const UserOptions &options) {
     AccountStore store;
-    if (const Trouble trouble = checkOpen(store)) {
-        return *trouble;
+    if (const auto open = checkOpen(store); !open) {
+        return Refusal(open.error());
     }
     if (!AccountStore::isName(options.name)) {
         return failure(ExitCode::kUsage, "\"" + options.name + "\" is not an account name.",
@@ -107,7 +105,7 @@ Outcome add(const UserOptions &options) {
     const Expected<Secret> password =
         obtainPassword(options.password, "Password of " + options.name, true);
     if (!password) {
-        return password.failure();
+        return Refusal(password.error());
     }
     if (!store.add(options.name, password->get(), options.administrator)) {
         return storeFailure(ExitCode::kFailed, store.error());
@@ -119,8 +117,8 @@ Outcome add(const UserOptions &options) {
 
 Outcome list() {
     AccountStore store;
-    if (const Trouble trouble = checkOpen(store)) {
-        return *trouble;
+    if (const auto open = checkOpen(store); !open) {
+        return Refusal(open.error());
     }
     std::vector<Account> accounts;
     if (!store.list(accounts)) {
@@ -142,21 +140,16 @@ Outcome list() {
     return report;
 }
 
-Outcome setPassword(const UserOptions &options) {
-    AccountStore store;
-    const Expected<Account> account = findAccount(store, options.name);
-    if (!account) {
-        return account.failure();
-    }
+Outcome setPassword(AccountStore &store, const Account &account, const UserOptions &options) {
     const Expected<Secret> password =
-        obtainPassword(options.password, "New password of " + options.name, true);
+        obtainPassword(options.password, "New password of " + account.name, true);
     if (!password) {
-        return password.failure();
+        return Refusal(password.error());
     }
-    if (!store.setPassword(options.name, password->get())) {
+    if (!store.setPassword(account.name, password->get())) {
         return storeFailure(ExitCode::kFailed, store.error());
     }
-    return changed(store, options.name, "The password of " + options.name + " was set.");
+    return changed(store, account.name, "The password of " + account.name + " was set.");
 }
 
 Outcome switchTotpOff(AccountStore &store, const std::string &name) {
@@ -186,40 +179,29 @@ Outcome switchTotpOn(AccountStore &store, const std::string &name) {
     return report;
 }
 
-Outcome setTotp(const UserOptions &options) {
-    AccountStore store;
-    const Expected<Account> account = findAccount(store, options.name);
-    if (!account) {
-        return account.failure();
-    }
+Outcome setTotp(AccountStore &store, const Account &account, const UserOptions &options) {
     if (options.off) {
-        return switchTotpOff(store, account->name);
+        return switchTotpOff(store, account.name);
     }
-    if (account->oneTimeCode) {
+    if (account.oneTimeCode) {
         return failure(ExitCode::kFailed,
-                       "The account \"" + account->name + "\" needs a one-time code already.",
-                       "For a new secret run `ovradr user totp " + account->name +
-                           " --off` first.");
+                       "The account \"" + account.name + "\" needs a one-time code already.",
+                       "For a new secret run `ovradr user totp " + account.name + " --off` first.");
     }
     if (!options.show && isatty(STDOUT_FILENO) != 1) {
         return failure(ExitCode::kUsage,
                        "The secret is shown once, and the output is not a terminal.",
                        "Add --show if the output goes where it is safe.");
     }
-    return switchTotpOn(store, account->name);
+    return switchTotpOn(store, account.name);
 }
 
-Outcome setDisabled(const UserOptions &options) {
-    AccountStore store;
-    const Expected<Account> account = findAccount(store, options.name);
-    if (!account) {
-        return account.failure();
-    }
-    if (!store.setDisabled(account->name, !options.off)) {
+Outcome setDisabled(AccountStore &store, const Account &account, const UserOptions &options) {
+    if (!store.setDisabled(account.name, !options.off)) {
         return storeFailure(ExitCode::kFailed, store.error());
     }
-    return changed(store, account->name,
-                   "The account " + account->name +
+    return changed(store, account.name,
+                   "The account " + account.name +
                        (options.off
                             ? " can log in again."
                             : " is disabled; its sessions rest until it is enabled again."));
@@ -227,28 +209,32 @@ Outcome setDisabled(const UserOptions &options) {
 
 /// Disabled first: nothing is granted to it meanwhile, and a removal that broke off can be
 /// repeated.
-Outcome remove(const UserOptions &options) {
-    AccountStore store;
-    const Expected<Account> account = findAccount(store, options.name);
-    if (!account) {
-        return account.failure();
-    }
-    if (!store.setDisabled(account->name, true)) {
+Outcome remove(AccountStore &store, const Account &account, const UserOptions & /*options*/) {
+    if (!store.setDisabled(account.name, true)) {
         return storeFailure(ExitCode::kFailed, store.error());
     }
-    const Expected<int> ended = endSessions(account->name);
+    const Expected<int> ended = endSessions(account.name);
     if (!ended) {
-        return ended.failure();
+        return Refusal(ended.error());
     }
-    if (!store.remove(account->name)) {
+    if (!store.remove(account.name)) {
         return storeFailure(ExitCode::kFailed, store.error());
     }
     Report report;
-    report.data["name"] = account->name;
+    report.data["name"] = account.name;
     report.data["ended_sessions"] = *ended;
     report.text =
-        printable("The account " + account->name + " was removed." + endedText(*ended)) + "\n";
+        printable("The account " + account.name + " was removed." + endedText(*ended)) + "\n";
     return report;
+}
+
+/// Does something about the account that is named.
+template <Outcome (*kAction)(AccountStore &, const Account &, const UserOptions &)>
+Outcome onAccount(const UserOptions &options) {
+    AccountStore store;
+    return findAccount(store, options.name).and_then([&](const Account &account) {
+        return kAction(store, account, options);
+    });
 }
 
 using UserAction = Outcome (*)(const UserOptions &);
@@ -291,12 +277,12 @@ void addUserCommands(CLI::App &app, Command &chosen) {
     listing->callback([&chosen] { chosen = list; });
 
     CLI::App *passwd = addUserCommand(*family, "passwd", "Set the password of an account.", options,
-                                      chosen, setPassword);
+                                      chosen, onAccount<setPassword>);
     addPasswordOptions(*passwd, options->password);
     passwd->footer("Example:\n  ovradr user passwd repl");
 
     CLI::App *totp = addUserCommand(*family, "totp", "Have log-ins ask for a one-time code.",
-                                    options, chosen, setTotp);
+                                    options, chosen, onAccount<setTotp>);
     CLI::Option *off = totp->add_flag("--off", options->off, "Do not ask any more");
     totp->add_flag("--show", options->show, "Show the secret although this is not a terminal")
         ->excludes(off);
@@ -304,12 +290,12 @@ void addUserCommands(CLI::App &app, Command &chosen) {
 
     CLI::App *disable =
         addUserCommand(*family, "disable", "Disable an account and rest its sessions.", options,
-                       chosen, setDisabled);
+                       chosen, onAccount<setDisabled>);
     disable->add_flag("--off", options->off, "Enable it again");
     disable->footer("Example:\n  ovradr user disable repl");
 
     CLI::App *removal = addUserCommand(*family, "remove", "Remove an account and end its sessions.",
-                                       options, chosen, remove);
+                                       options, chosen, onAccount<remove>);
     removal->footer("Example:\n  ovradr user remove repl");
 }
 

@@ -35,20 +35,16 @@ std::string conclusion(const std::vector<NodeCandidate> &candidates) {
            "\n";
 }
 
-Outcome why(const std::string &text) {
-    const Expected<std::string> nodeId = resolveNode(text);
-    if (!nodeId) {
-        return nodeId.failure();
-    }
+Report why(const std::string &nodeId) {
     Report report;
-    report.data["node_id"] = *nodeId;
-    report.data["local"] = OvraDRNode::DRNode::isLocalNodeId(*nodeId);
+    report.data["node_id"] = nodeId;
+    report.data["local"] = OvraDRNode::DRNode::isLocalNodeId(nodeId);
     report.data["candidates"] = Json::Value(Json::arrayValue);
     if (report.data["local"].asBool()) {
         report.text = "This is the local node: requests to it need no credential.\n";
         return report;
     }
-    const auto candidates = OvraDRNode::listNodeCandidates(*nodeId);
+    const auto candidates = OvraDRNode::listNodeCandidates(nodeId);
     std::vector<std::vector<std::string>> rows;
     for (std::size_t i = 0; i < candidates.size(); ++i) {
         const NodeCandidate &candidate = candidates[i];
@@ -76,7 +72,7 @@ void addWhyCommand(CLI::App &app, Command &chosen) {
     command->add_option("NODE", *node, "A node id, or the beginning of one")->required();
     command->footer("It reads what the processes of this appliance know and sends nothing.\n"
                     "Example:\n  ovradr why 3f2a");
-    command->callback([&chosen, node] { chosen = [node] { return why(*node); }; });
+    command->callback([&chosen, node] { chosen = [node] { return resolveNode(*node).map(why); }; });
 }
 
 } // namespace Ovradr

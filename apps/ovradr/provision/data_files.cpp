@@ -60,11 +60,11 @@ Expected<SetUpStep> provisionScripts() {
     for (const char *name : {"TestDownloadSpeed.sh", "TestSyncSpeed.sh"}) {
         const Expected<std::string> installed = findDataFile(name);
         if (!installed) {
-            return installed.failure();
+            return Refusal(installed.error());
         }
         const Expected<bool> made = linkTo(*installed, fs::path(kScriptFolder) / name);
         if (!made) {
-            return made.failure();
+            return Refusal(made.error());
         }
         step.made = step.made || *made;
     }

@@ -9,7 +9,7 @@
 
 namespace Ovradr {
 
-Failure fileFailure(const std::string &path, int error) {
+Refusal fileFailure(const std::string &path, int error) {
     const bool denied = error == EACCES || error == EPERM;
     return failure(
         ExitCode::kNotSetUp, path + " cannot be used: " + OvraBase::errnoText(error) + ".",

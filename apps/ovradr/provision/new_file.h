@@ -19,6 +19,6 @@ struct SetUpStep {
 Expected<bool> makePrivate(const std::string &path);
 
 /// The failure of an operation on a file of this appliance, with the reason that errno gives.
-Failure fileFailure(const std::string &path, int error);
+Refusal fileFailure(const std::string &path, int error);
 
 } // namespace Ovradr

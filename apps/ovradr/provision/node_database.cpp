@@ -13,6 +13,7 @@
 
 #include <array>
 #include <cerrno>
+#include <optional>
 
 namespace Ovradr {
 
@@ -27,24 +28,24 @@ constexpr std::array kQueries = {
     "SELECT node_id, app, attr, value FROM node_attr",
 };
 
-Failure unusable(const std::string &path, const std::string &why, const std::string &hint) {
+Refusal unusable(const std::string &path, const std::string &why, const std::string &hint) {
     return failure(ExitCode::kNotSetUp,
                    "The node database " + path + " cannot be used: " + why + ".", hint);
 }
 
-Failure sqliteFailure(const std::string &path, sqlite3 *database) {
+Refusal sqliteFailure(const std::string &path, sqlite3 *database) {
     return unusable(path, OvraBase::sqliteText(database, SQLITE_NOMEM),
                     "Correct that, or restore the file from a backup; setup never replaces it.");
 }
 
-Failure newerSchema(const std::string &path, int version) {
+Refusal newerSchema(const std::string &path, int version) {
     return unusable(path,
                     "its schema " + std::to_string(version) + " is newer than this program's " +
                         std::to_string(kSchemaVersion),
                     "Install the version of this program that made it, or a newer one.");
 }
 
-Failure foreignDatabase(const std::string &path) {
+Refusal foreignDatabase(const std::string &path) {
     return unusable(path, "it is not one that `ovradr setup` made, or it is damaged",
                     "Restore it from a backup, or move it away and run `ovradr setup`.");
 }
@@ -67,7 +68,7 @@ bool execute(sqlite3 *database, const char *sql) {
     return sqlite3_exec(database, sql, nullptr, nullptr, nullptr) == SQLITE_OK;
 }
 
-Trouble checkSchema(sqlite3 *database, const std::string &path) {
+Expected<void> checkSchema(sqlite3 *database, const std::string &path) {
     const auto version = numberOf(database, "SELECT version FROM ovradrcore_db_info");
     if (!version) {
         return foreignDatabase(path);
@@ -80,7 +81,7 @@ Trouble checkSchema(sqlite3 *database, const std::string &path) {
             return foreignDatabase(path);
         }
     }
-    return std::nullopt;
+    return {};
 }
 
 Expected<std::string> readSchema(const std::string &schemaFile) {
@@ -105,20 +106,19 @@ Expected<bool> fill(sqlite3 *database, const std::string &path, const std::strin
     if (empty && !execute(database, schema.c_str())) {
         return sqliteFailure(path, database);
     }
-    if (const Trouble trouble = checkSchema(database, path)) {
-        return *trouble; // closing the database takes everything back
+    if (const auto done = checkSchema(database, path); !done) {
+        return Refusal(done.error()); // closing the database takes everything back
     }
     return execute(database, "COMMIT") ? Expected<bool>(empty) : sqliteFailure(path, database);
 }
 
 /// SQLite would make a file that others can read.
-Trouble touchPrivate(const std::string &path) {
+Expected<void> touchPrivate(const std::string &path) {
     const OvraBase::UniqueFd fd(open(path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0600));
     if (!fd) {
         return fileFailure(path, errno);
     }
-    const Expected<bool> changed = makePrivate(path);
-    return changed ? Trouble() : changed.failure();
+    return makePrivate(path).map([](bool) {});
 }
 
 } // namespace
@@ -130,23 +130,22 @@ std::string nodeDatabasePath() {
 Expected<SetUpStep> provisionNodeDatabase(const std::string &path, const std::string &schemaFile) {
     const Expected<std::string> schema = readSchema(schemaFile);
     if (!schema) {
-        return schema.failure();
+        return Refusal(schema.error());
     }
-    if (const Trouble trouble = touchPrivate(path)) {
-        return *trouble;
+    if (const auto done = touchPrivate(path); !done) {
+        return Refusal(done.error());
     }
     OvraBase::SqliteHandle database;
     if (OvraBase::openSqlite(path, kBusyMilliseconds, database) != SQLITE_OK) {
         return sqliteFailure(path, database.get());
     }
-    const Expected<bool> filled = fill(database.get(), path, *schema);
-    if (!filled) {
-        return filled.failure();
-    }
-    return SetUpStep{"node database", *filled, path + ", schema " + std::to_string(kSchemaVersion)};
+    return fill(database.get(), path, *schema).map([&path](bool filled) {
+        return SetUpStep{"node database", filled,
+                         path + ", schema " + std::to_string(kSchemaVersion)};
+    });
 }
 
-Trouble checkNodeDatabase() {
+Expected<void> checkNodeDatabase() {
     const std::string path = nodeDatabasePath();
     if (access(path.c_str(), F_OK) != 0 && errno == ENOENT) {
         return failure(ExitCode::kNotSetUp,
@@ -159,7 +158,7 @@ Trouble checkNodeDatabase() {
     auto handler = OvraDRNode::NodeDBHandler::GetHandler();
     const int version = handler.GetSchemaVersion();
     if (version == kSchemaVersion) {
-        return std::nullopt;
+        return {};
     }
     if (version > kSchemaVersion) {
         return newerSchema(path, version);

@@ -22,6 +22,6 @@ Expected<SetUpStep> provisionNodeDatabase(const std::string &path, const std::st
 
 /// Whether the node database can be used; the library itself reports a database that it cannot read
 /// as one without rows.
-Trouble checkNodeDatabase();
+Expected<void> checkNodeDatabase();
 
 } // namespace Ovradr

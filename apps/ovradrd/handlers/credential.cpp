@@ -233,7 +233,7 @@ Json::Value remove(const Json::Value &params, const APICaller & /*caller*/) {
     }
     Json::Value data;
     if (!record.session.empty()) {
-        data["release"] = OvraApps::releaseWord(result.release.outcome);
+        data["release"] = OvraApps::releaseWord(result.release.state);
     }
     return apiSuccess(data);
 }

@@ -9,8 +9,8 @@ namespace Ovradrd {
 namespace {
 
 Json::Value getFarlink(const FarlinkAgent &agent) {
-    std::string problem;
-    const OvraPlatform::FarlinkSettings settings = OvraPlatform::readFarlinkSettings(problem);
+    const auto settings =
+        OvraPlatform::readFarlinkSettings().value_or(OvraPlatform::FarlinkSettings());
     Json::Value data(Json::objectValue);
     data["enabled"] = !settings.host.empty() && !settings.alias.empty();
     if (!data["enabled"].asBool()) {

@@ -15,6 +15,7 @@
 namespace OVRA {
 
 using OvraPlatform::CredError;
+using OvraPlatform::CredExpected;
 using OvraPlatform::WebReply;
 using OvraPlatform::WireCall;
 
@@ -41,11 +42,11 @@ Json::Value noAnswer(CredError error) {
     return OvraPlatform::apiError(OvraPlatform::APIError::kInternal, message);
 }
 
-CredError login(const OVRACred &cred, const std::string &otp, OVRACredSess &sess,
-                Json::Value &out) {
+/// The reply document.
+CredExpected<Json::Value> login(const OVRACred &cred, const std::string &otp, OVRACredSess &sess) {
     const auto endpoint = cred.endpoint();
     if (!endpoint || cred.account.empty() || cred.passwd.empty()) {
-        return CredError::kBadArgument;
+        return tl::unexpected(CredError::kBadArgument);
     }
     WireCall call = authCall("login");
     call.params["account"] = cred.account;
@@ -53,33 +54,32 @@ CredError login(const OVRACred &cred, const std::string &otp, OVRACredSess &sess
     if (!otp.empty()) {
         call.params["otp_code"] = otp;
     }
-    const WebReply reply =
-        OvraPlatform::callWebAPI(*endpoint, call, {std::chrono::steady_clock::now() + kLoginTime});
-    if (reply.error != CredError::kNone) {
-        return reply.error;
-    }
-    Json::Value document;
-    const std::string sid = reply.response.getDataFieldtoStr("sid");
-    const bool unusable = reply.response.isSuccess() &&
-                          (sid.empty() || OVRACredSessItemSetAccessToken(&sess, sid.c_str()) != 0);
-    if (unusable || !OvraDRCore::fromString(document, reply.document)) {
-        return CredError::kReplyBroken;
-    }
-    out = std::move(document);
-    return CredError::kNone;
+    return OvraPlatform::callWebAPI(*endpoint, call,
+                                    {std::chrono::steady_clock::now() + kLoginTime})
+        .and_then([&sess](const WebReply &reply) -> CredExpected<Json::Value> {
+            Json::Value document;
+            const std::string sid = reply.response.getDataFieldtoStr("sid");
+            const bool unusable =
+                reply.response.isSuccess() &&
+                (sid.empty() || OVRACredSessItemSetAccessToken(&sess, sid.c_str()) != 0);
+            if (unusable || !OvraDRCore::fromString(document, reply.document)) {
+                return tl::unexpected(CredError::kReplyBroken);
+            }
+            return document;
+        });
 }
 
-CredError logout(const OVRACred &cred, const OVRACredSess &sess, bool &confirmed) {
+/// Whether the other end confirms it.
+CredExpected<bool> logout(const OVRACred &cred, const OVRACredSess &sess) {
     const auto endpoint = cred.endpoint();
     if (!endpoint) {
-        return CredError::kBadArgument;
+        return tl::unexpected(CredError::kBadArgument);
     }
     WireCall call = authCall("logout");
     call.sid = sess.token.get();
-    const WebReply reply =
-        OvraPlatform::callWebAPI(*endpoint, call, {std::chrono::steady_clock::now() + kLogoutTime});
-    confirmed = reply.response.isSuccess();
-    return reply.error;
+    return OvraPlatform::callWebAPI(*endpoint, call,
+                                    {std::chrono::steady_clock::now() + kLogoutTime})
+        .map([](const WebReply &reply) { return reply.response.isSuccess(); });
 }
 
 } // namespace
@@ -89,17 +89,14 @@ int CredRequestUtil::LoginWithOTP(OVRACred *cred, const std::string &otp, OVRACr
     if (cred == nullptr || sess == nullptr || out == nullptr) {
         return 0;
     }
-    CredError error = CredError::kInternal;
     try {
-        error = login(*cred, otp, *sess, *out);
-        if (error != CredError::kNone) {
-            *out = noAnswer(error);
-        }
+        const auto document = login(*cred, otp, *sess);
+        *out = document ? *document : noAnswer(document.error());
+        return document ? 1 : 0;
     } catch (const std::exception &failure) {
         OVRA_ERR("A log-in failed: [%s]", failure.what());
         return 0;
     }
-    return error == CredError::kNone ? 1 : 0;
 }
 
 int CredRequestUtil::Logout(OVRACred *cred, OVRACredSess *sess) {
@@ -108,9 +105,11 @@ int CredRequestUtil::Logout(OVRACred *cred, OVRACredSess *sess) {
     }
     bool confirmed = false;
     try {
-        if (const CredError error = logout(*cred, *sess, confirmed); error != CredError::kNone) {
+        const auto ended = logout(*cred, *sess);
+        confirmed = ended.value_or(false);
+        if (!ended) {
             OVRA_NOTICE("A session could not be ended, it expires by itself: [%s]",
-                        OvraPlatform::credErrorText(static_cast<int>(error)));
+                        OvraPlatform::credErrorText(static_cast<int>(ended.error())));
         }
     } catch (const std::exception &failure) {
         OVRA_ERR("A log-out failed: [%s]", failure.what());

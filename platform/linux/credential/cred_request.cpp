@@ -15,6 +15,7 @@
 namespace OVRA {
 
 using OvraPlatform::CredError;
+using OvraPlatform::CredExpected;
 using OvraPlatform::Endpoint;
 using OvraPlatform::WebReply;
 using OvraPlatform::WireCall;
@@ -71,15 +72,16 @@ struct CredRequest::Impl {
         return std::chrono::steady_clock::now() + std::chrono::seconds(seconds);
     }
 
-    CredError send(bool reuse) {
+    CredExpected<void> send(bool reuse) {
         if (!endpoint || !call) {
-            return CredError::kBadArgument;
+            return tl::unexpected(CredError::kBadArgument);
         }
-        WebReply reply = OvraPlatform::callWebAPI(
-            *endpoint, *call, {deadline(), reuse, encryptMode == kSealed, upload});
-        response = std::move(reply.document);
-        OvraDRCore::ReplyHandOver::give(response, std::move(reply.response));
-        return reply.error;
+        return OvraPlatform::callWebAPI(*endpoint, *call,
+                                        {deadline(), reuse, encryptMode == kSealed, upload})
+            .map([this](WebReply reply) {
+                response = std::move(reply.document);
+                OvraDRCore::ReplyHandOver::give(response, std::move(reply.response));
+            });
     }
 
     bool setEndpoint(const std::string &protocol, const std::string &address, int port) {
@@ -100,19 +102,22 @@ struct CredRequest::Impl {
                            info["port"].asInt());
     }
 
-    CredError process(bool reuse, int mode) {
+    CredExpected<void> process(bool reuse, int mode) {
         if (!alias.empty() && !findAlias()) {
-            return CredError::kCannotConnect;
+            return tl::unexpected(CredError::kCannotConnect);
         }
         switch (mode) {
         case kModeRequest:
             return send(reuse);
         case kModeProbe:
-            return endpoint ? OvraPlatform::probe(*endpoint, url, deadline())
-                            : CredError::kBadArgument;
+            if (endpoint) {
+                return OvraPlatform::probe(*endpoint, url, deadline());
+            }
+            break;
         default:
-            return CredError::kBadArgument;
+            break;
         }
+        return tl::unexpected(CredError::kBadArgument);
     }
 };
 
@@ -192,7 +197,8 @@ int CredRequest::CreateWebAPIRequest(CredRequest &req, OVRACred *cred, OVRACredS
 int CredRequest::Process(bool reuse, int mode) {
     impl_->response.clear();
     try {
-        impl_->error = impl_->process(reuse, mode);
+        const auto done = impl_->process(reuse, mode);
+        impl_->error = done ? CredError::kNone : done.error();
     } catch (const std::exception &error) {
         OVRA_ERR("A request failed: [%s]", error.what());
         impl_->error = CredError::kOutOfMemory;

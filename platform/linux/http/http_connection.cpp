@@ -205,51 +205,58 @@ bool HttpConnection::setUp() {
     return options.ok();
 }
 
-HttpAnswer HttpConnection::get(const std::string &url, Deadline deadline) {
+CredExpected<HttpAnswer> HttpConnection::get(const std::string &url, Deadline deadline) {
     if (!Options(handle_.get()).set(CURLOPT_HTTPGET, 1L).ok()) {
-        return {CredError::kOutOfMemory};
+        return tl::unexpected(CredError::kOutOfMemory);
     }
     return perform(url, deadline);
 }
 
-HttpAnswer HttpConnection::post(const std::string &url, const std::string &body,
-                                Deadline deadline) {
+CredExpected<HttpAnswer> HttpConnection::post(const std::string &url, const std::string &body,
+                                              Deadline deadline) {
     const bool set = Options(handle_.get())
                          .set(CURLOPT_POSTFIELDS, body.c_str())
                          .set(CURLOPT_POSTFIELDSIZE_LARGE, static_cast<curl_off_t>(body.size()))
                          .ok();
-    HttpAnswer answer = set ? perform(url, deadline) : HttpAnswer{CredError::kOutOfMemory};
+    CredExpected<HttpAnswer> answer = tl::unexpected(CredError::kOutOfMemory);
+    if (set) {
+        answer = perform(url, deadline);
+    }
     curl_easy_setopt(handle_.get(), CURLOPT_POSTFIELDS, nullptr);
     return answer;
 }
 
-HttpAnswer HttpConnection::postFile(const std::string &url,
-                                    const std::vector<std::pair<std::string, std::string>> &fields,
-                                    const Upload &upload, Deadline deadline) {
+CredExpected<HttpAnswer>
+HttpConnection::postFile(const std::string &url,
+                         const std::vector<std::pair<std::string, std::string>> &fields,
+                         const Upload &upload, Deadline deadline) {
     if (!isRegularFile(upload.path)) {
-        return {CredError::kUploadUnreadable};
+        return tl::unexpected(CredError::kUploadUnreadable);
     }
     const Mime form = makeForm(handle_.get(), fields, upload);
     if (!form) {
-        return {CredError::kUploadUnreadable};
+        return tl::unexpected(CredError::kUploadUnreadable);
     }
     const bool set = Options(handle_.get()).set(CURLOPT_MIMEPOST, form.get()).ok();
-    HttpAnswer answer = set ? perform(url, deadline) : HttpAnswer{CredError::kOutOfMemory};
+    CredExpected<HttpAnswer> answer = tl::unexpected(CredError::kOutOfMemory);
+    if (set) {
+        answer = perform(url, deadline);
+    }
     curl_easy_setopt(handle_.get(), CURLOPT_MIMEPOST, nullptr);
     return answer;
 }
 
-HttpAnswer HttpConnection::connectOnly(const std::string &url, Deadline deadline) {
+CredExpected<void> HttpConnection::connectOnly(const std::string &url, Deadline deadline) {
     if (!Options(handle_.get()).set(CURLOPT_CONNECT_ONLY, 1L).ok()) {
-        return {CredError::kOutOfMemory};
+        return tl::unexpected(CredError::kOutOfMemory);
     }
-    return perform(url, deadline);
+    return perform(url, deadline).map([](const HttpAnswer &) {});
 }
 
-HttpAnswer HttpConnection::perform(const std::string &url, Deadline deadline) {
+CredExpected<HttpAnswer> HttpConnection::perform(const std::string &url, Deadline deadline) {
     const long left = millisecondsUntil(deadline);
     if (left <= 0) {
-        return {CredError::kTimedOut};
+        return tl::unexpected(CredError::kTimedOut);
     }
     const std::size_t limit = purpose_ == Purpose::kProbe ? kMaxProbeReply : kMaxReply;
     const bool set = Options(handle_.get())
@@ -259,7 +266,7 @@ HttpAnswer HttpConnection::perform(const std::string &url, Deadline deadline) {
                          .set(CURLOPT_MAXFILESIZE_LARGE, static_cast<curl_off_t>(limit))
                          .ok();
     if (!set) {
-        return {CredError::kOutOfMemory};
+        return tl::unexpected(CredError::kOutOfMemory);
     }
     answer_ = HttpAnswer();
     headerBytes_ = 0;
@@ -270,7 +277,7 @@ HttpAnswer HttpConnection::perform(const std::string &url, Deadline deadline) {
     if (code != CURLE_OK) {
         OVRA_INFO("Request to [%s] failed: [%s]", endpoint_.key().c_str(),
                   curl_easy_strerror(code));
-        return {errorOf(code)};
+        return tl::unexpected(errorOf(code));
     }
     curl_easy_getinfo(handle_.get(), CURLINFO_RESPONSE_CODE, &answer_.status);
     return std::move(answer_);

@@ -23,8 +23,8 @@ using Deadline = std::chrono::steady_clock::time_point;
 /// Bound on the body of a reply.
 inline constexpr std::size_t kMaxReply = std::size_t{8} * 1024 * 1024;
 
+/// What came back, with any status.
 struct HttpAnswer {
-    CredError error = CredError::kNone; ///< kNone: an answer came, with any status
     long status = 0;
     std::string body;
 };
@@ -47,20 +47,22 @@ public:
     };
 
     /// Null when there is no memory.
-    static std::unique_ptr<HttpConnection> open(const Endpoint &endpoint, Purpose purpose);
+    [[nodiscard]] static std::unique_ptr<HttpConnection> open(const Endpoint &endpoint,
+                                                              Purpose purpose);
     HttpConnection(const HttpConnection &) = delete;
     HttpConnection &operator=(const HttpConnection &) = delete;
     ~HttpConnection();
 
-    HttpAnswer get(const std::string &url, Deadline deadline);
+    [[nodiscard]] CredExpected<HttpAnswer> get(const std::string &url, Deadline deadline);
     /// \param body  application/x-www-form-urlencoded
-    HttpAnswer post(const std::string &url, const std::string &body, Deadline deadline);
+    [[nodiscard]] CredExpected<HttpAnswer> post(const std::string &url, const std::string &body,
+                                                Deadline deadline);
     /// Sends multipart/form-data: the fields, then the file.
-    HttpAnswer postFile(const std::string &url,
-                        const std::vector<std::pair<std::string, std::string>> &fields,
-                        const Upload &upload, Deadline deadline);
+    [[nodiscard]] CredExpected<HttpAnswer>
+    postFile(const std::string &url, const std::vector<std::pair<std::string, std::string>> &fields,
+             const Upload &upload, Deadline deadline);
     /// Connects, shakes hands, and sends nothing.
-    HttpAnswer connectOnly(const std::string &url, Deadline deadline);
+    [[nodiscard]] CredExpected<void> connectOnly(const std::string &url, Deadline deadline);
 
     const CertificateVerifier &verifier() const { return verifier_; }
 
@@ -82,7 +84,7 @@ private:
 
     HttpConnection(const Endpoint &endpoint, Purpose purpose);
     bool setUp();
-    HttpAnswer perform(const std::string &url, Deadline deadline);
+    CredExpected<HttpAnswer> perform(const std::string &url, Deadline deadline);
     CredError errorOf(CURLcode code) const;
 
     static std::size_t onBody(char *data, std::size_t size, std::size_t count, void *self);

@@ -23,31 +23,32 @@ constexpr long kHttpForbidden = 403;
 constexpr long kHttpNotFound = 404;
 constexpr long kHttpServerError = 500;
 
-WebReply failure(CredError error) {
-    return {error, {}, {}};
-}
-
 /// What came as a reply, read here once for everybody.
-WebReply readReply(std::string text) {
+CredExpected<WebReply> readReply(std::string text) {
     OvraDRCore::Response response;
     response.setResp(text);
-    return response.isValid() ? WebReply{CredError::kNone, std::move(text), std::move(response)}
-                              : failure(CredError::kReplyBroken);
+    if (!response.isValid()) {
+        return tl::unexpected(CredError::kReplyBroken);
+    }
+    return WebReply{std::move(text), std::move(response)};
 }
 
-CredError errorOfStatus(long status) {
-    if (status == kHttpUnauthorized || status == kHttpForbidden) {
-        return CredError::kNoPermission;
+/// The body, when the status says that it is the answer.
+CredExpected<std::string> bodyOf(HttpAnswer answer) {
+    if (answer.status == kHttpOk) {
+        return std::move(answer.body);
     }
-    return status == kHttpOk ? CredError::kNone : CredError::kHttpStatus;
+    const bool denied = answer.status == kHttpUnauthorized || answer.status == kHttpForbidden;
+    return tl::unexpected(denied ? CredError::kNoPermission : CredError::kHttpStatus);
 }
 
 /// One post to the entry point, over a kept connection when there is one.
-HttpAnswer post(const Endpoint &endpoint, const WireCall &call, const WebCallOptions &options) {
+CredExpected<std::string> post(const Endpoint &endpoint, const WireCall &call,
+                               const WebCallOptions &options) {
     const auto url = endpoint.url(kEntryPoint);
     const auto fields = toFormFields(call);
     if (!url || !fields) {
-        return {CredError::kBadArgument};
+        return tl::unexpected(CredError::kBadArgument);
     }
     // From before the request: a key that is replaced while it runs ends the connection's life.
     const TrustStore::Stamp trust = TrustStore().stamp();
@@ -59,43 +60,36 @@ HttpAnswer post(const Endpoint &endpoint, const WireCall &call, const WebCallOpt
         connection = HttpConnection::open(endpoint, HttpConnection::Purpose::kRequests);
     }
     if (!connection) {
-        return {CredError::kOutOfMemory};
+        return tl::unexpected(CredError::kOutOfMemory);
     }
-    HttpAnswer answer = options.upload
-                            ? connection->postFile(*url, *fields, *options.upload, options.deadline)
-                            : connection->post(*url, encodeForm(*fields), options.deadline);
-    if (answer.error != CredError::kNone) {
-        return answer;
-    }
-    if (options.reuse) {
+    CredExpected<HttpAnswer> answer =
+        options.upload ? connection->postFile(*url, *fields, *options.upload, options.deadline)
+                       : connection->post(*url, encodeForm(*fields), options.deadline);
+    if (answer && options.reuse) {
         ConnectionPool::instance().keep(endpoint, trust, std::move(connection));
     }
-    answer.error = errorOfStatus(answer.status);
-    return answer;
+    return std::move(answer).and_then(bodyOf);
 }
 
-WebReply callPlain(const Endpoint &endpoint, const WireCall &call, const WebCallOptions &options) {
-    HttpAnswer answer = post(endpoint, call, options);
-    if (answer.error != CredError::kNone) {
-        return failure(answer.error);
-    }
-    return readReply(std::move(answer.body));
+CredExpected<WebReply> callPlain(const Endpoint &endpoint, const WireCall &call,
+                                 const WebCallOptions &options) {
+    return post(endpoint, call, options).and_then(readReply);
 }
 
 /// Over plain http the key itself has to be the one that was met first.
-CredError judgeSealKey(const Endpoint &endpoint, const PublicKey &key) {
+CredExpected<void> judgeSealKey(const Endpoint &endpoint, const PublicKey &key) {
     TrustStore store;
     const std::string fingerprint = fingerprintOf(key);
     switch (store.pin(endpoint.key(), fingerprint)) {
     case TrustVerdict::kTrusted:
-        return CredError::kNone;
+        return {};
     case TrustVerdict::kDifferent:
         OVRA_ERR("The key [%s] of [%s] is not the one trusted for it: find out why it changed, "
                  "then forget the old one",
                  fingerprint.c_str(), endpoint.key().c_str());
-        return CredError::kCertificateChanged;
+        return tl::unexpected(CredError::kCertificateChanged);
     default:
-        return CredError::kTrustUnavailable;
+        return tl::unexpected(CredError::kTrustUnavailable);
     }
 }
 
@@ -127,10 +121,10 @@ public:
         , call_(call)
         , options_(options) {}
 
-    WebReply run() {
+    CredExpected<WebReply> run() {
         for (;;) {
-            if (const CredError error = findKey(); error != CredError::kNone) {
-                return failure(error);
+            if (const auto found = findKey(); !found) {
+                return tl::unexpected(found.error());
             }
             WireCall outer;
             outer.api = call_.api;
@@ -140,68 +134,66 @@ public:
             outer.sealed =
                 sealRequest(known_.key, call_, wallClock() + known_.clockOffset, replyKey);
             if (outer.sealed.empty()) {
-                return failure(CredError::kSealFailed);
+                return tl::unexpected(CredError::kSealFailed);
             }
-            const HttpAnswer answer = post(endpoint_, outer, options_);
-            if (answer.error != CredError::kNone) {
-                return failure(answer.error);
+            const CredExpected<std::string> body = post(endpoint_, outer, options_);
+            if (!body) {
+                return tl::unexpected(body.error());
             }
-            std::optional<WebReply> reply = read(answer.body, replyKey);
-            if (reply) {
-                return *reply;
+            if (Ending ending = read(*body, replyKey)) {
+                return std::move(*ending);
             }
         }
     }
 
 private:
-    CredError findKey() {
+    /// The end of the call, or nothing when it has to be sent once more.
+    using Ending = std::optional<CredExpected<WebReply>>;
+
+    CredExpected<void> findKey() {
         const std::string key = endpoint_.key();
         if (const auto found = SealKeyCache::instance().find(key, TrustStore().stamp())) {
             known_ = *found;
-            return CredError::kNone;
+            return {};
         }
-        const FetchedKey fetched = fetchSealKey(endpoint_, options_);
-        if (fetched.error != CredError::kNone) {
-            return fetched.error;
-        }
-        if (!endpoint_.isTls()) {
-            if (const CredError error = judgeSealKey(endpoint_, fetched.key);
-                error != CredError::kNone) {
-                return error;
-            }
-        }
-        known_ = {fetched.key, known_.clockOffset};
-        SealKeyCache::instance().put(key, TrustStore().stamp(), known_);
-        return CredError::kNone;
+        return fetchSealKey(endpoint_, options_)
+            .and_then([this](const PublicKey &fetched) -> CredExpected<PublicKey> {
+                const auto judged =
+                    endpoint_.isTls() ? CredExpected<void>() : judgeSealKey(endpoint_, fetched);
+                return judged.map([&fetched] { return fetched; });
+            })
+            .map([&](const PublicKey &fetched) {
+                known_ = {fetched, known_.clockOffset};
+                SealKeyCache::instance().put(key, TrustStore().stamp(), known_);
+            });
     }
 
-    /// The end of the call, or nothing when it has to be sent once more.
-    std::optional<WebReply> read(const std::string &body, const ReplyKey &replyKey) {
+    Ending read(const std::string &body, const ReplyKey &replyKey) {
         Json::Value reply;
         if (!OvraDRCore::fromString(reply, body) || !reply.isObject()) {
-            return failure(CredError::kReplyBroken);
+            return tl::unexpected(CredError::kReplyBroken);
         }
         return reply.isMember("sealed_reply") ? readSealed(reply, replyKey)
                                               : readPlain(std::move(reply), body);
     }
 
-    std::optional<WebReply> readSealed(const Json::Value &reply, const ReplyKey &replyKey) {
+    Ending readSealed(const Json::Value &reply, const ReplyKey &replyKey) {
         std::optional<std::string> text = openReply(replyKey, reply);
         if (!text) {
-            return failure(CredError::kSealFailed);
+            return tl::unexpected(CredError::kSealFailed);
         }
-        WebReply opened = readReply(std::move(*text));
+        CredExpected<WebReply> opened = readReply(std::move(*text));
         // Only a time that came sealed is believed: a wrong one would let somebody who holds the
         // request back deliver it later.
-        if (!realigned_ && sealRefusalReason(opened.response) == "stale" &&
-            realign(opened.response)) {
+        if (!realigned_ && opened && sealRefusalReason(opened->response) == "stale" &&
+            realign(opened->response)) {
             realigned_ = true;
             return std::nullopt;
         }
         return opened;
     }
 
-    std::optional<WebReply> readPlain(Json::Value &&document, const std::string &body) {
+    Ending readPlain(Json::Value &&document, const std::string &body) {
         OvraDRCore::Response response;
         response.setResp(std::move(document));
         if (!rekeyed_ && sealRefusalReason(response) == "key") {
@@ -209,8 +201,10 @@ private:
             SealKeyCache::instance().drop(endpoint_.key());
             return std::nullopt;
         }
-        return isPlainRefusal(response) ? WebReply{CredError::kNone, body, std::move(response)}
-                                        : failure(CredError::kSealFailed);
+        if (!isPlainRefusal(response)) {
+            return tl::unexpected(CredError::kSealFailed);
+        }
+        return WebReply{body, std::move(response)};
     }
 
     /// \param refusal  one with a reason, so that its message is an object
@@ -234,45 +228,46 @@ private:
 
 } // namespace
 
-FetchedKey fetchSealKey(const Endpoint &endpoint, const WebCallOptions &options) {
+CredExpected<PublicKey> fetchSealKey(const Endpoint &endpoint, const WebCallOptions &options) {
     WireCall call;
     call.api = "OVRA.Core.Encryption";
     call.version = 1;
     call.method = "getinfo";
     WebCallOptions plain = options;
     plain.upload.reset();
-    const WebReply reply = callPlain(endpoint, call, plain);
-    if (reply.error != CredError::kNone) {
-        return {reply.error};
-    }
-    const auto key = parsePublicKey(reply.response.getDataFieldtoStr("public_key"));
-    if (!key) {
-        OVRA_NOTICE("[%s] has no key to seal a request to", endpoint.key().c_str());
-        return {CredError::kSealFailed};
-    }
-    return {CredError::kNone, *key};
+    return callPlain(endpoint, call, plain)
+        .and_then([&endpoint](const WebReply &reply) -> CredExpected<PublicKey> {
+            const auto key = parsePublicKey(reply.response.getDataFieldtoStr("public_key"));
+            if (!key) {
+                OVRA_NOTICE("[%s] has no key to seal a request to", endpoint.key().c_str());
+                return tl::unexpected(CredError::kSealFailed);
+            }
+            return *key;
+        });
 }
 
-WebReply callWebAPI(const Endpoint &endpoint, const WireCall &call, const WebCallOptions &options) {
+CredExpected<WebReply> callWebAPI(const Endpoint &endpoint, const WireCall &call,
+                                  const WebCallOptions &options) {
     if (!endpoint.isTls() && options.upload) {
         OVRA_ERR("A file cannot be sealed: use an https endpoint to send it");
-        return failure(CredError::kUploadUnreadable);
+        return tl::unexpected(CredError::kUploadUnreadable);
     }
     return endpoint.isTls() && !options.sealed ? callPlain(endpoint, call, options)
                                                : SealedCall(endpoint, call, options).run();
 }
 
-CredError probe(const Endpoint &endpoint, const std::string &url, Deadline deadline) {
+CredExpected<void> probe(const Endpoint &endpoint, const std::string &url, Deadline deadline) {
     const auto connection = HttpConnection::open(endpoint, HttpConnection::Purpose::kProbe);
     if (!connection) {
-        return CredError::kOutOfMemory;
+        return tl::unexpected(CredError::kOutOfMemory);
     }
-    const HttpAnswer answer = connection->get(url, deadline);
-    if (answer.error != CredError::kNone) {
-        return answer.error;
-    }
-    const bool answered = answer.status < kHttpServerError && answer.status != kHttpNotFound;
-    return answered ? CredError::kNone : CredError::kHttpStatus;
+    return connection->get(url, deadline)
+        .and_then([](const HttpAnswer &answer) -> CredExpected<void> {
+            if (answer.status >= kHttpServerError || answer.status == kHttpNotFound) {
+                return tl::unexpected(CredError::kHttpStatus);
+            }
+            return {};
+        });
 }
 
 } // namespace OvraPlatform

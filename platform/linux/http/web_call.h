@@ -20,9 +20,8 @@ struct WebCallOptions {
 };
 
 struct WebReply {
-    CredError error = CredError::kNone;
-    std::string document;          ///< a reply document when there is no error
-    OvraDRCore::Response response; ///< what it says
+    std::string document;          ///< a reply document
+    OvraDRCore::Response response; ///< what it says, valid
 };
 
 /// Calls a web API of a remote appliance and returns its reply document, opened when it was sealed.
@@ -30,18 +29,16 @@ struct WebReply {
 /// Over plain http every call travels sealed, to the key that the endpoint had when it was first
 /// met. A call that is refused because the clocks differ, or because the appliance has a new key,
 /// is sealed anew and sent once more.
-WebReply callWebAPI(const Endpoint &endpoint, const WireCall &call, const WebCallOptions &options);
+[[nodiscard]] CredExpected<WebReply> callWebAPI(const Endpoint &endpoint, const WireCall &call,
+                                                const WebCallOptions &options);
 
-/// Asks the entry point without any secret, and whoever it is. kNone: it answered.
-CredError probe(const Endpoint &endpoint, const std::string &url, Deadline deadline);
-
-struct FetchedKey {
-    CredError error = CredError::kNone;
-    PublicKey key{};
-};
+/// Asks the entry point without any secret, and whoever it is, whether it answers.
+[[nodiscard]] CredExpected<void> probe(const Endpoint &endpoint, const std::string &url,
+                                       Deadline deadline);
 
 /// Asks the endpoint for the key that requests to it are sealed to. Over plain http anybody may
 /// have answered; nothing is judged here.
-FetchedKey fetchSealKey(const Endpoint &endpoint, const WebCallOptions &options);
+[[nodiscard]] CredExpected<PublicKey> fetchSealKey(const Endpoint &endpoint,
+                                                   const WebCallOptions &options);
 
 } // namespace OvraPlatform

@@ -30,8 +30,21 @@ std::string setting(const char *key) {
     return length > 0 ? std::string(value.data(), static_cast<std::size_t>(length)) : std::string();
 }
 
-std::string messageText(const Json::Value &message) {
-    return message.isString() ? message.asString() : OvraDRCore::memberString(message, "text");
+tl::unexpected<FarlinkFailure> noAnswer(CredError error) {
+    return tl::unexpected(FarlinkFailure{credErrorText(static_cast<int>(error)), error, 0});
+}
+
+/// An answer that is no success is why there is none.
+FarlinkReply judge(WebReply reply) {
+    if (reply.response.isSuccess()) {
+        return std::move(reply.response);
+    }
+    const int code = reply.response.getErrCode();
+    const Json::Value message = reply.response.getErrMsg();
+    const std::string text =
+        message.isString() ? message.asString() : OvraDRCore::memberString(message, "text");
+    return tl::unexpected(FarlinkFailure{text.empty() ? "error " + std::to_string(code) : text,
+                                         CredError::kNone, code});
 }
 
 } // namespace
@@ -43,8 +56,7 @@ bool isFarlinkAlias(const std::string &text) {
            });
 }
 
-FarlinkSettings readFarlinkSettings(std::string &problem) {
-    problem.clear();
+tl::expected<FarlinkSettings, std::string> readFarlinkSettings() {
     FarlinkSettings settings;
     settings.host = setting(FarlinkSetting::kHost);
     settings.alias = setting(FarlinkSetting::kAlias);
@@ -55,9 +67,9 @@ FarlinkSettings readFarlinkSettings(std::string &problem) {
         (settings.host.empty() || Endpoint::make("https", settings.host, settings.port)) &&
         (settings.alias.empty() || isFarlinkAlias(settings.alias));
     if (!usable) {
-        problem = std::string(kFarlinkFile) +
-                  " names no relay service that could be used: run ovradr farlink enable";
-        return {};
+        return tl::unexpected(
+            std::string(kFarlinkFile) +
+            " names no relay service that could be used: run ovradr farlink enable");
     }
     return settings;
 }
@@ -73,27 +85,19 @@ bool writeFarlinkSettings(const FarlinkSettings &settings) {
            (settings.alias.empty() || put(FarlinkSetting::kAlias, settings.alias));
 }
 
-std::string FarlinkReply::why() const {
-    if (error != CredError::kNone) {
-        return credErrorText(static_cast<int>(error));
-    }
-    const std::string text = messageText(response.getErrMsg());
-    return text.empty() ? "error " + std::to_string(response.getErrCode()) : text;
-}
-
 FarlinkReply FarlinkClient::call(const char *method, const Json::Value &params,
                                  std::chrono::seconds time) const {
     const auto endpoint = Endpoint::make("https", settings_.host, settings_.port);
     if (!endpoint) {
-        return {CredError::kBadArgument, {}};
+        return noAnswer(CredError::kBadArgument);
     }
     WireCall wire;
     wire.api = kFarlinkApi;
     wire.version = 1;
     wire.method = method;
     wire.params = params;
-    WebReply reply = callWebAPI(*endpoint, wire, {std::chrono::steady_clock::now() + time});
-    return {reply.error, std::move(reply.response)};
+    auto reply = callWebAPI(*endpoint, wire, {std::chrono::steady_clock::now() + time});
+    return reply ? judge(std::move(*reply)) : noAnswer(reply.error());
 }
 
 FarlinkReply FarlinkClient::lookUp(const std::string &alias) const {
@@ -106,14 +110,12 @@ FarlinkReply FarlinkClient::enrol(const FarlinkKey &key) const {
     Json::Value params(Json::objectValue);
     params["alias"] = settings_.alias;
     params["key"] = key.publicText();
-    FarlinkReply asked = call("challenge", params, kAnswerTime);
-    if (!asked.isSuccess()) {
-        return asked;
-    }
-    const std::string challenge = asked.response.getDataFieldtoStr("challenge");
-    params["challenge"] = challenge;
-    params["signature"] = key.sign(settings_.alias, challenge);
-    return call("enrol", params, kAnswerTime);
+    return call("challenge", params, kAnswerTime).and_then([&](const OvraDRCore::Response &asked) {
+        const std::string challenge = asked.getDataFieldtoStr("challenge");
+        params["challenge"] = challenge;
+        params["signature"] = key.sign(settings_.alias, challenge);
+        return call("enrol", params, kAnswerTime);
+    });
 }
 
 FarlinkReply FarlinkClient::wait(const std::string &token) const {
@@ -137,25 +139,25 @@ namespace OVRA {
 int CredRequestFarlink::GetConnInfo(const std::string &alias, Json::Value &info, const void *) {
     info = Json::Value();
     try {
-        std::string problem;
-        const OvraPlatform::FarlinkSettings settings = OvraPlatform::readFarlinkSettings(problem);
-        if (settings.host.empty()) {
+        const auto settings = OvraPlatform::readFarlinkSettings();
+        if (!settings || settings->host.empty()) {
             OVRA_NOTICE("[%s] cannot be looked up: %s", alias.c_str(),
-                        problem.empty() ? "no relay service is set up on this appliance; run "
-                                          "ovradr farlink enable, or use a direct endpoint"
-                                        : problem.c_str());
+                        settings ? "no relay service is set up on this appliance; run "
+                                   "ovradr farlink enable, or use a direct endpoint"
+                                 : settings.error().c_str());
             return 0;
         }
         const OvraPlatform::FarlinkReply reply =
-            OvraPlatform::FarlinkClient(settings).lookUp(OvraBase::toLower(alias));
-        const Json::Value port = reply.response.getDataField("port");
-        if (!reply.isSuccess() || !port.isInt()) {
+            OvraPlatform::FarlinkClient(*settings).lookUp(OvraBase::toLower(alias));
+        const Json::Value port = reply ? reply->getDataField("port") : Json::Value();
+        if (!port.isInt()) {
             OVRA_NOTICE("The relay service [%s] does not tell where [%s] is reached: [%s]",
-                        settings.host.c_str(), alias.c_str(), reply.why().c_str());
+                        settings->host.c_str(), alias.c_str(),
+                        reply ? "its answer has no port" : reply.error().text.c_str());
             return 0;
         }
-        const std::string host = reply.response.getDataFieldtoStr("host");
-        info["host"] = host.empty() ? settings.host : host;
+        const std::string host = reply->getDataFieldtoStr("host");
+        info["host"] = host.empty() ? settings->host : host;
         info["protocol"] = "https";
         info["port"] = port.asInt();
         return 1;

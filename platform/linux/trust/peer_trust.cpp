@@ -15,51 +15,51 @@ namespace {
 
 constexpr long kMaxSeconds = 24L * 60 * 60;
 
-PeerIdentity identityOverTls(const Endpoint &endpoint, Deadline deadline) {
+CredExpected<PeerIdentity> identityOverTls(const Endpoint &endpoint, Deadline deadline) {
     const auto connection = HttpConnection::open(endpoint, HttpConnection::Purpose::kObserve);
     if (!connection) {
-        return {CredError::kOutOfMemory};
+        return tl::unexpected(CredError::kOutOfMemory);
     }
-    const CredError error = connection->connectOnly(endpoint.key(), deadline).error;
+    if (const auto met = connection->connectOnly(endpoint.key(), deadline); !met) {
+        return tl::unexpected(met.error());
+    }
     const CertificateVerifier &verifier = connection->verifier();
-    if (error != CredError::kNone || verifier.fingerprint().empty()) {
-        return {error == CredError::kNone ? CredError::kCannotConnect : error};
+    if (verifier.fingerprint().empty()) {
+        return tl::unexpected(CredError::kCannotConnect);
     }
-    const bool accepted = verifier.verdict() == CertificateVerifier::Verdict::kSystem;
-    return {CredError::kNone, verifier.fingerprint(), accepted};
+    return PeerIdentity{verifier.fingerprint(),
+                        verifier.verdict() == CertificateVerifier::Verdict::kSystem};
 }
 
-PeerIdentity identityOverHttp(const Endpoint &endpoint, Deadline deadline) {
-    const FetchedKey fetched = fetchSealKey(endpoint, {deadline, false});
-    if (fetched.error != CredError::kNone) {
-        return {fetched.error};
-    }
-    return {CredError::kNone, fingerprintOf(fetched.key)};
+CredExpected<PeerIdentity> identityOverHttp(const Endpoint &endpoint, Deadline deadline) {
+    return fetchSealKey(endpoint, {deadline, false}).map([](const PublicKey &key) {
+        return PeerIdentity{fingerprintOf(key)};
+    });
 }
 
-PeerIdentity identify(const Endpoint &endpoint, Deadline deadline) {
-    PeerIdentity identity = endpoint.isTls() ? identityOverTls(endpoint, deadline)
-                                             : identityOverHttp(endpoint, deadline);
-    if (identity.error == CredError::kNone) {
-        identity.pinned = TrustStore().lookup(endpoint.key(), identity.fingerprint);
+CredExpected<PeerIdentity> identify(const Endpoint &endpoint, Deadline deadline) {
+    auto identity = endpoint.isTls() ? identityOverTls(endpoint, deadline)
+                                     : identityOverHttp(endpoint, deadline);
+    if (identity) {
+        identity->pinned = TrustStore().lookup(endpoint.key(), identity->fingerprint);
     }
     return identity;
 }
 
 } // namespace
 
-PeerIdentity peerFingerprint(const std::string &protocol, const std::string &host, int port,
-                             long seconds) {
+CredExpected<PeerIdentity> peerFingerprint(const std::string &protocol, const std::string &host,
+                                           int port, long seconds) {
     try {
         const auto endpoint = Endpoint::make(protocol, host, port);
         if (!endpoint || seconds < 1 || seconds > kMaxSeconds) {
-            return {CredError::kBadArgument};
+            return tl::unexpected(CredError::kBadArgument);
         }
         return identify(*endpoint,
                         std::chrono::steady_clock::now() + std::chrono::seconds(seconds));
     } catch (const std::exception &error) {
         OVRA_ERR("An endpoint could not be met: [%s]", error.what());
-        return {CredError::kOutOfMemory};
+        return tl::unexpected(CredError::kOutOfMemory);
     }
 }
 

@@ -30,7 +30,7 @@ TEST(Failure, IsDocumentedWithWhatItsCodeMeans) {
     }
     for (int code = 1; code <= kMaxCode; ++code) {
         const std::string number = std::to_string(code);
-        const Failure failure = failureOf(code);
+        const Failure failure = failureOf(code).value();
         if (failure.name != "error_" + number) {
             EXPECT_EQ(rows[number], rowOf(failure))
                 << "docs/ovradr.md, \"Error codes\" has to have the row\n"

@@ -50,7 +50,7 @@ TEST(Output, ColumnsLineUpWhateverTheCellsHold) {
 TEST(Output, EveryErrorOfTheLibraryHasItsSentence) {
     for (int code = 1; code < 1000; ++code) {
         const bool known = OvraDRCore::ERR::ToString(code) != "unknown error";
-        const Failure found = failureOf(code);
+        const Failure found = failureOf(code).value();
         EXPECT_TRUE(!known || found.name.find("error_") == std::string::npos) << code;
         EXPECT_EQ(found.code, code);
         EXPECT_NE(found.exit, ExitCode::kOk) << code;
@@ -78,7 +78,7 @@ TEST(Output, WhatComesWithAnErrorIsToldAndBecomesAdviceWhereItIsSome) {
         {9999, Json::Value(), "Error 9999.", nullptr},
     };
     for (const auto &each : cases) {
-        const Failure found = failureOf(each.code, each.detail);
+        const Failure found = failureOf(each.code, each.detail).value();
         EXPECT_EQ(found.message, each.message);
         EXPECT_TRUE(each.hint == nullptr || found.hint == each.hint) << found.hint;
     }
@@ -88,7 +88,7 @@ TEST(Output, WhatComesWithAnErrorIsToldButNoSecretInIt) {
     Json::Value detail;
     detail["session"] = "s3cret";
     detail["reason"] = "gone";
-    const std::string message = failureOf(105, detail).message;
+    const std::string message = failureOf(105, detail).value().message;
     EXPECT_NE(message.find("gone"), std::string::npos) << message;
     EXPECT_EQ(message.find("s3cret"), std::string::npos) << message;
 }

@@ -25,7 +25,7 @@ TEST(Target, IsReadAsPeopleWriteIt) {
     };
     for (const auto &each : cases) {
         const auto conn = parseTarget(each.text);
-        ASSERT_TRUE(conn) << each.text << ": " << conn.failure().message;
+        ASSERT_TRUE(conn) << each.text << ": " << conn.error().message;
         EXPECT_EQ(*conn, each.conn) << each.text;
         EXPECT_EQ(targetText(*conn), each.written);
     }
@@ -68,7 +68,7 @@ TEST(Target, IsRefusedWhenAnythingInItWouldBeLost) {
          }) {
         const auto conn = parseTarget(text);
         ASSERT_FALSE(conn) << text;
-        EXPECT_EQ(conn.failure().exit, ExitCode::kUsage) << text;
+        EXPECT_EQ(conn.error().exit, ExitCode::kUsage) << text;
     }
 }
 

@@ -290,19 +290,19 @@ TEST_F(CredRequestScene, SendsNothingWhenAKeyCannotBePinned) {
 
 TEST_F(CredRequestScene, ShowsTheFingerprintWithoutTrustingIt) {
     MisbehavingServer server({.tls = true});
-    const PeerIdentity identity = peerFingerprint("https", "127.0.0.1", server.port(), 5);
-    EXPECT_EQ(identity.error, CredError::kNone);
-    EXPECT_EQ(identity.fingerprint, server.fingerprint());
-    EXPECT_FALSE(identity.acceptedBySystem);
-    EXPECT_EQ(identity.pinned, TrustVerdict::kUnknown);
+    const auto identity = peerFingerprint("https", "127.0.0.1", server.port(), 5);
+    ASSERT_TRUE(identity);
+    EXPECT_EQ(identity->fingerprint, server.fingerprint());
+    EXPECT_FALSE(identity->acceptedBySystem);
+    EXPECT_EQ(identity->pinned, TrustVerdict::kUnknown);
     EXPECT_TRUE(TrustStore().list()->empty());
     EXPECT_TRUE(server.requests().empty());
 
     EXPECT_EQ(expectFingerprint("https", "127.0.0.1", server.port(), server.fingerprint()),
               TrustVerdict::kTrusted);
-    EXPECT_EQ(peerFingerprint("https", "127.0.0.1", server.port(), 5).pinned,
+    EXPECT_EQ(peerFingerprint("https", "127.0.0.1", server.port(), 5).value().pinned,
               TrustVerdict::kTrusted);
-    EXPECT_EQ(peerFingerprint("https", "127.0.0.1", unusedPort(), 5).error,
+    EXPECT_EQ(peerFingerprint("https", "127.0.0.1", unusedPort(), 5).error(),
               CredError::kCannotConnect);
     EXPECT_EQ(expectFingerprint("https", "127.0.0.1", server.port(), "SHA256:x"),
               TrustVerdict::kUnavailable);

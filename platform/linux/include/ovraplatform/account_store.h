@@ -25,7 +25,7 @@ struct Account {
     std::int64_t created = 0; ///< seconds of the system clock
 };
 
-/// The outcome of a log-in; the numbers are the log-in codes of the web API.
+/// What came of a log-in; the numbers are the log-in codes of the web API.
 enum class LoginResult : int {
     kOk = 0,
     kStoreFailed = 100,  ///< nothing is known: AccountStore::error() says why

@@ -3,6 +3,8 @@
 
 #include "ovraplatform/export.h"
 
+#include <tl/expected.hpp>
+
 namespace OvraPlatform {
 
 /// The error numbers of the credential request library, as OVRA::CredRequest::GetError() gives
@@ -24,6 +26,10 @@ enum class CredError : int {
     kSealFailed = 13,        ///< the request could not be sealed, or the reply not opened
     kTrustUnavailable = 14,  ///< the file of trusted keys can be neither read nor written
 };
+
+/// A value, or why there is none; never kNone.
+template <typename T>
+using CredExpected = tl::expected<T, CredError>;
 
 /// What the number means and what to do, for people; never null.
 OVRAPLATFORM_EXPORT const char *credErrorText(int error);

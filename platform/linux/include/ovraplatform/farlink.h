@@ -33,21 +33,22 @@ struct FarlinkSettings {
     }
 };
 
-/// The lines host="...", port="..." and alias="..." of kFarlinkFile. A file that is missing or
-/// cannot be used is an appliance without relay service.
-/// \param problem  takes one sentence when the file cannot be used, otherwise ""
-OVRAPLATFORM_EXPORT FarlinkSettings readFarlinkSettings(std::string &problem);
+/// The lines host="...", port="..." and alias="..." of kFarlinkFile. A file that is missing is an
+/// appliance without relay service.
+/// \return one sentence when the file cannot be used.
+[[nodiscard]] OVRAPLATFORM_EXPORT tl::expected<FarlinkSettings, std::string> readFarlinkSettings();
 /// \return false when the file cannot be written.
-OVRAPLATFORM_EXPORT bool writeFarlinkSettings(const FarlinkSettings &settings);
+[[nodiscard]] OVRAPLATFORM_EXPORT bool writeFarlinkSettings(const FarlinkSettings &settings);
 
-struct OVRAPLATFORM_EXPORT FarlinkReply {
-    CredError error = CredError::kNone; ///< otherwise no answer came
-    OvraDRCore::Response response;
-
-    bool isSuccess() const { return error == CredError::kNone && response.isSuccess(); }
-    /// What went wrong and what to do, for people.
-    std::string why() const;
+/// Why a call to the relay service had no success.
+struct FarlinkFailure {
+    std::string text;                   ///< what went wrong and what to do, for people
+    CredError error = CredError::kNone; ///< why no answer came
+    int code = 0;                       ///< otherwise: of the web API, why the service refused
 };
+
+/// An answer of success, or why there is none.
+using FarlinkReply = tl::expected<OvraDRCore::Response, FarlinkFailure>;
 
 /// The calls of an appliance to its relay service. Its key is trusted on first use.
 class OVRAPLATFORM_EXPORT FarlinkClient {
@@ -56,14 +57,14 @@ public:
         : settings_(std::move(settings)) {}
 
     /// Where the alias is reached now: "port", and "host" where it is not that of the service.
-    FarlinkReply lookUp(const std::string &alias) const;
+    [[nodiscard]] FarlinkReply lookUp(const std::string &alias) const;
     /// Proves that this appliance has the key of its alias, or takes a free alias: "port",
     /// "tunnel_port", "token" and "expires".
-    FarlinkReply enrol(const FarlinkKey &key) const;
+    [[nodiscard]] FarlinkReply enrol(const FarlinkKey &key) const;
     /// Waits for callers of the alias: "callers", maybe none. Error 119: enrol anew.
-    FarlinkReply wait(const std::string &token) const;
+    [[nodiscard]] FarlinkReply wait(const std::string &token) const;
     /// Gives the alias up.
-    FarlinkReply release(const std::string &token) const;
+    [[nodiscard]] FarlinkReply release(const std::string &token) const;
 
 private:
     FarlinkReply call(const char *method, const Json::Value &params,

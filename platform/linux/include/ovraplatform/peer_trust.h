@@ -11,7 +11,6 @@ namespace OvraPlatform {
 
 /// How an endpoint shows itself now.
 struct PeerIdentity {
-    CredError error = CredError::kNone;
     std::string fingerprint;       ///< "SHA256:...", as `ssh-keygen -l` shows keys
     bool acceptedBySystem = false; ///< the system's store accepts its certificate
     /// What the pinned keys say about it.
@@ -22,8 +21,8 @@ struct PeerIdentity {
 /// nothing is pinned. Over https it is the fingerprint of the certificate's key, over http that of
 /// the key to which requests are sealed.
 /// \param seconds  1 to 86,400
-OVRAPLATFORM_EXPORT PeerIdentity peerFingerprint(const std::string &protocol,
-                                                 const std::string &host, int port, long seconds);
+[[nodiscard]] OVRAPLATFORM_EXPORT CredExpected<PeerIdentity>
+peerFingerprint(const std::string &protocol, const std::string &host, int port, long seconds);
 
 /// Trusts the fingerprint for the endpoint from now on, before it is met.
 /// \return kTrusted; kDifferent when another one is pinned, which stays; kUnavailable when the
