@@ -23,11 +23,12 @@ public:
     /// \param timeout  seconds
     [[nodiscard]] std::string TestDownloadSpeed(const std::string &url, int retries, int timeout);
     /// The speed at which the remote node downloads from this one, over the first local endpoint
-    /// that works, as the remote prints it; "" on failure (401, 407). \param timeout seconds
+    /// that works, as the remote prints it; "" on failure (401, 407).
+    /// \param timeout  seconds
     [[nodiscard]] std::string TestSyncSpeed(const std::string &nodeId, int retries, int timeout);
 
-    /// Called for each endpoint, before (`answer` null) and after the attempt. \param sender holds
-    /// the reason if there is no valid answer
+    /// Called for each endpoint, before (`answer` null) and after the attempt.
+    /// \param sender  holds the reason if there is no valid answer
     using EndpointWatcher = std::function<void(const Conn &conn, const OvraDRCore::Response *answer,
                                                const OvraDRCore::ErrRecorder &sender)>;
     /// The same test, reporting progress to `watcher`.

@@ -34,7 +34,8 @@ struct Answer {
     static Answer closed();
     /// Announces `document` and closes in the middle.
     static Answer truncated(const std::string &document);
-    /// A body of that many bytes. \param announced whether the header has its length
+    /// A body of that many bytes.
+    /// \param announced  whether the header has its length
     static Answer huge(std::size_t size, bool announced);
     /// A valid answer, one byte at a time.
     static Answer drip(std::chrono::milliseconds pausePerByte);

@@ -34,8 +34,9 @@ enum class Links { kFollow, kRefuse };
 [[nodiscard]] Expected<Secret> readPrivateFile(const std::string &path, Links links);
 
 /// Creates a file atomically and durably unless it exists: an existing one is never replaced, even
-/// if another process creates it at the same time. \param mode regardless of the umask \return
-/// whether this call created it.
+/// if another process creates it at the same time.
+/// \param mode  regardless of the umask
+/// \return whether this call created it.
 [[nodiscard]] Expected<bool> createFile(const std::string &path, std::string_view content,
                                         mode_t mode);
 

@@ -29,8 +29,8 @@ using SqliteStatement = std::unique_ptr<sqlite3_stmt, FinalizeSqlite>;
 /// \return SQLITE_OK, or the error code.
 int openSqlite(const std::string &path, int busyMilliseconds, SqliteHandle &database);
 
-/// Prepares the first statement of `sql`; null on failure, and sqliteText() says why. \param tail
-/// receives the rest of `sql`; may be null
+/// Prepares the first statement of `sql`; null on failure, and sqliteText() says why.
+/// \param tail  receives the rest of `sql`; may be null
 SqliteStatement prepareSqlite(sqlite3 *database, const std::string &sql,
                               const char **tail = nullptr);
 

@@ -20,8 +20,8 @@ struct Free {
     void operator()(SSL *ssl) const { SSL_free(ssl); }
 };
 
-/// Does a handshake with a server of that certificate, in memory. \param system the contents of the
-/// client's certificate store
+/// Does a handshake with a server of that certificate, in memory.
+/// \param system  the contents of the client's certificate store
 bool shakeHands(CertificateVerifier &judge, const OvraTest::TestCertificate &server,
                 const OvraTest::TestCertificate *system) {
     const std::unique_ptr<SSL_CTX, Free> serverContext(SSL_CTX_new(TLS_server_method()));
