@@ -52,13 +52,14 @@ OvraBase::Expected<void> AliasRegistry::load() {
     return {};
 }
 
-AliasRegistry::Enrolment AliasRegistry::enrol(const std::string &name, const std::string &key,
-                                              std::int64_t now, Alias &alias) {
+tl::expected<AliasRegistry::Enrolment, AliasRegistry::Refusal>
+AliasRegistry::enrol(const std::string &name, const std::string &key, std::int64_t now) {
+    Alias alias;
     Entries changed = entries_;
     const auto found = changed.find(name);
     const bool isNew = found == changed.end() || found->second.expires <= now;
     if (!isNew && found->second.key != key) {
-        return Enrolment::kTaken;
+        return tl::unexpected(Refusal::kTaken);
     }
     int nextPort = nextPort_;
     if (found == changed.end()) {
@@ -66,11 +67,11 @@ AliasRegistry::Enrolment AliasRegistry::enrol(const std::string &name, const std
             return entry.second.key == key;
         });
         if (static_cast<std::size_t>(ofKey) >= limits_.perKey) {
-            return Enrolment::kTooMany;
+            return tl::unexpected(Refusal::kTooMany);
         }
         alias.port = freePort();
         if (alias.port == 0) {
-            return Enrolment::kFull;
+            return tl::unexpected(Refusal::kFull);
         }
         nextPort = alias.port + 1;
     } else {
@@ -81,11 +82,11 @@ AliasRegistry::Enrolment AliasRegistry::enrol(const std::string &name, const std
     alias.expires = now + limits_.lease.count();
     changed[name] = alias;
     if (!store(changed, nextPort)) {
-        return Enrolment::kNotStored;
+        return tl::unexpected(Refusal::kNotStored);
     }
     entries_ = std::move(changed);
     nextPort_ = nextPort;
-    return isNew ? Enrolment::kMade : Enrolment::kRenewed;
+    return Enrolment{alias, isNew};
 }
 
 const Alias *AliasRegistry::find(const std::string &name) const {
@@ -117,7 +118,7 @@ std::vector<Alias> AliasRegistry::dropExpired(std::int64_t now) {
         }
     }
     // What could not be stored has expired all the same, and is dropped again after a restart.
-    store(changed, nextPort_);
+    (void)store(changed, nextPort_);
     entries_ = std::move(changed);
     return dropped;
 }

@@ -31,9 +31,11 @@ public:
         std::chrono::seconds lease{};
         std::size_t perKey = 4;
     };
-    enum class Enrolment {
-        kMade,
-        kRenewed,
+    struct Enrolment {
+        Alias alias;
+        bool isNew = false; ///< otherwise it was renewed
+    };
+    enum class Refusal {
         kTaken,     ///< another key has it
         kFull,      ///< no port is left
         kTooMany,   ///< the key has as many as it may
@@ -44,14 +46,13 @@ public:
 
     /// Reads the file; a missing one is an empty registry. Entries outside the ports are dropped.
     [[nodiscard]] OvraBase::Expected<void> load();
-    /// \param now    seconds since 1970, here and below
-    /// \param alias  takes the entry when it was made or renewed
-    Enrolment enrol(const std::string &name, const std::string &key, std::int64_t now,
-                    Alias &alias);
+    /// \param now  seconds since 1970, here and below
+    [[nodiscard]] tl::expected<Enrolment, Refusal> enrol(const std::string &name,
+                                                         const std::string &key, std::int64_t now);
     /// Null for an alias that nobody has.
     const Alias *find(const std::string &name) const;
     /// \return false when there is none, or the file cannot be written
-    bool release(const std::string &name);
+    [[nodiscard]] bool release(const std::string &name);
     /// Takes out what has expired. \return what that was
     std::vector<Alias> dropExpired(std::int64_t now);
     std::vector<Alias> list() const;
@@ -59,7 +60,7 @@ public:
 private:
     using Entries = std::map<std::string, Alias>;
 
-    bool store(const Entries &entries, int nextPort) const;
+    [[nodiscard]] bool store(const Entries &entries, int nextPort) const;
     int freePort() const;
 
     std::string path_;

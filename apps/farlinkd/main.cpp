@@ -69,10 +69,14 @@ std::string ownName() {
                                                                               : "farlinkd";
 }
 
+std::string certificateIn(const Options &options) {
+    return options.state + "/farlinkd.crt";
+}
+
 /// The key and certificate of the service, made when there are none.
-Expected<TlsIdentity> identityIn(const Options &options, std::string &fingerprint) {
+Expected<TlsIdentity> identityIn(const Options &options) {
     const std::string key = options.state + "/farlinkd.key";
-    const std::string certificate = options.state + "/farlinkd.crt";
+    const std::string certificate = certificateIn(options);
     if (!OvraPlatform::ensureStateDir(options.state)) {
         return OvraBase::Unexpected({options.state + " cannot be made or is not this user's alone: "
                                                      "name another folder with --state"});
@@ -84,7 +88,6 @@ Expected<TlsIdentity> identityIn(const Options &options, std::string &fingerprin
             return OvraBase::Unexpected(made.error());
         }
     }
-    fingerprint = OvraService::certificateFingerprint(certificate);
     return TlsIdentity::load(key, certificate);
 }
 
@@ -98,8 +101,7 @@ int serve(const Options &options) {
     const sigset_t signals = OvraService::blockEndSignals();
     OvraService::raiseDescriptorLimit(kDescriptors);
 
-    std::string fingerprint;
-    const auto identity = identityIn(options, fingerprint);
+    const auto identity = identityIn(options);
     if (!identity) {
         return fail(identity.error());
     }
@@ -145,7 +147,8 @@ int serve(const Options &options) {
     OVRA_NOTICE("Serves at port [%d], for appliances at port [%d], for callers at ports [%d-%d]",
                 port, tunnelPort, options.firstPort, options.lastPort);
     std::printf("farlinkd: ready, https %d, tunnels %d, aliases %d-%d\nfarlinkd: key %s\n", port,
-                tunnelPort, options.firstPort, options.lastPort, fingerprint.c_str());
+                tunnelPort, options.firstPort, options.lastPort,
+                OvraService::certificateFingerprint(certificateIn(options)).c_str());
     std::fflush(stdout);
 
     waitForEnd(signals, api);

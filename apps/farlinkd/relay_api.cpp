@@ -44,6 +44,22 @@ Json::Value badAlias() {
         "alias", "an alias has 3 to 63 lower-case letters, digits and inner hyphens");
 }
 
+Json::Value refusalOf(AliasRegistry::Refusal refusal) {
+    switch (refusal) {
+    case AliasRegistry::Refusal::kTaken:
+        return apiError(APIError::kNoPermission,
+                        "the alias belongs to another appliance: choose another one");
+    case AliasRegistry::Refusal::kTooMany:
+        return apiError(APIError::kNoPermission,
+                        "this appliance has as many aliases as it may: release one");
+    case AliasRegistry::Refusal::kFull:
+        return apiError(APIError::kTooBusy, "the relay service has no alias left");
+    case AliasRegistry::Refusal::kNotStored:
+        break;
+    }
+    return apiError(APIError::kInternal, "the relay service cannot store the alias: see its log");
+}
+
 std::string randomText() {
     std::array<unsigned char, kTokenBytes> bytes{};
     randombytes_buf(bytes.data(), bytes.size());
@@ -76,7 +92,7 @@ void RelayApi::connect(TunnelServer &tunnelServer) {
     const std::lock_guard lock(mutex_);
     tunnelServer_ = &tunnelServer;
     for (const Alias &alias : aliases_.list()) {
-        openPort(alias);
+        (void)openPort(alias); // the log says why; the others are served
     }
 }
 
@@ -204,34 +220,25 @@ Json::Value RelayApi::enrol(const Json::Value &params, const std::string &addres
     if (aliases_.find(name) == nullptr && !newAliases_.allow(address, Clock::now())) {
         return apiError(APIError::kTooBusy, "too many new aliases from this address: wait an hour");
     }
-    Alias alias;
-    switch (aliases_.enrol(name, key, std::time(nullptr), alias)) {
-    case AliasRegistry::Enrolment::kMade:
+    const auto enrolled = aliases_.enrol(name, key, std::time(nullptr));
+    if (!enrolled) {
+        if (enrolled.error() == AliasRegistry::Refusal::kTaken) {
+            OVRA_NOTICE("[%s] asked for the alias [%s] with another key than its owner's",
+                        address.c_str(), name.c_str());
+        }
+        return refusalOf(enrolled.error());
+    }
+    const Alias &alias = enrolled->alias;
+    if (enrolled->isNew) {
         OVRA_NOTICE("[%s] took the alias [%s] at port [%d]", address.c_str(), name.c_str(),
                     alias.port);
         leave(name); // an owner whose time was over
         if (!openPort(alias)) {
-            aliases_.release(name);
+            (void)aliases_.release(name); // it says so itself in the log
             return apiError(APIError::kInternal,
                             "the port of the alias cannot be opened: the log of the service says "
                             "why");
         }
-        break;
-    case AliasRegistry::Enrolment::kRenewed:
-        break;
-    case AliasRegistry::Enrolment::kTaken:
-        OVRA_NOTICE("[%s] asked for the alias [%s] with another key than its owner's",
-                    address.c_str(), name.c_str());
-        return apiError(APIError::kNoPermission,
-                        "the alias belongs to another appliance: choose another one");
-    case AliasRegistry::Enrolment::kTooMany:
-        return apiError(APIError::kNoPermission,
-                        "this appliance has as many aliases as it may: release one");
-    case AliasRegistry::Enrolment::kFull:
-        return apiError(APIError::kTooBusy, "the relay service has no alias left");
-    case AliasRegistry::Enrolment::kNotStored:
-        return apiError(APIError::kInternal,
-                        "the relay service cannot store the alias: see its log");
     }
     Agent &agent = agents_[name];
     if (agent.waiting) {

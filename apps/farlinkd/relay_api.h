@@ -41,7 +41,7 @@ public:
     /// Carries out one request; does not wait.
     void serve(OvraService::HttpRequest request, const OvraService::HttpServer::Answer &answer);
     /// Tells the appliance of the alias about a caller; false when it is not there.
-    bool announce(const std::string &alias, const std::string &caller);
+    [[nodiscard]] bool announce(const std::string &alias, const std::string &caller);
     /// Ends what has lasted long enough: questions for callers, and aliases. Now and then.
     void endOverdue();
     /// Drops the requests that wait, and waits for those under way.
@@ -74,7 +74,7 @@ private:
     Agent *agentOf(const Json::Value &params);
     bool isThere(const Agent &agent) const;
     static void tellCallers(Agent &agent, const Answer &answer);
-    bool openPort(const Alias &alias);
+    [[nodiscard]] bool openPort(const Alias &alias);
     void leave(const std::string &alias);
 
     Settings settings_;

@@ -11,12 +11,12 @@ namespace Ovradr {
 
 /// The endpoint at which to connect: a relay endpoint as the relay service knows it now, any other
 /// as it is.
-Expected<OvraDRNode::Conn> directEndpoint(const OvraDRNode::Conn &conn);
+[[nodiscard]] Expected<OvraDRNode::Conn> directEndpoint(const OvraDRNode::Conn &conn);
 
 /// Probes a direct endpoint, at most 10 seconds and, to learn why it does not answer, 5 more. All
 /// processes get to know the verdict.
 /// \return why it does not answer; nothing when it does.
-Expected<void> probeEndpoint(const OvraDRNode::Conn &conn);
+[[nodiscard]] Expected<void> probeEndpoint(const OvraDRNode::Conn &conn);
 
 /// The key that this appliance shows at an endpoint of its own; "" where it cannot be read.
 std::string ownFingerprint(const OvraDRNode::Conn &conn);

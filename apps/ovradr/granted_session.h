@@ -20,7 +20,7 @@ struct GrantedSession {
 };
 
 /// All of them, the oldest first. Log-ins of people are not among them.
-Expected<std::vector<GrantedSession>> grantedSessions();
+[[nodiscard]] Expected<std::vector<GrantedSession>> grantedSessions();
 
 /// As scripts see it; never its id.
 Json::Value sessionJson(const GrantedSession &session);
@@ -29,6 +29,6 @@ Json::Value sessionJson(const GrantedSession &session);
 std::string sessionTable(const std::vector<GrantedSession> &sessions);
 
 /// Ends the sessions, up to the first that cannot be ended.
-Expected<void> endSessions(const std::vector<GrantedSession> &sessions);
+[[nodiscard]] Expected<void> endSessions(const std::vector<GrantedSession> &sessions);
 
 } // namespace Ovradr

@@ -11,20 +11,21 @@
 namespace Ovradr {
 
 /// The id of this node, made when there is none.
-Expected<std::string> localNode();
+[[nodiscard]] Expected<std::string> localNode();
 
 /// The ids of all nodes that a credential reaches, and of this one.
-Expected<std::set<std::string>> listNodes();
+[[nodiscard]] Expected<std::set<std::string>> listNodes();
 
 /// The one of `ids` that is `text` or, alone among them, begins with it.
 /// \param what  what the ids name, e.g. "node"
 /// \param hint  what to do when there is none
-Expected<std::string> chooseId(const std::set<std::string> &ids, const std::string &text,
-                               const std::string &what, const std::string &hint);
+[[nodiscard]] Expected<std::string> chooseId(const std::set<std::string> &ids,
+                                             const std::string &text, const std::string &what,
+                                             const std::string &hint);
 
 /// The node id that a person means: "local", a node id, or the beginning of only one. Only nodes
 /// that a credential reaches are known, and this one.
-Expected<std::string> resolveNode(const std::string &text);
+[[nodiscard]] Expected<std::string> resolveNode(const std::string &text);
 
 struct FoundCred {
     OvraDRNode::DRNode record;
@@ -33,6 +34,6 @@ struct FoundCred {
 
 /// The credential, lasting or temporary, that a person means by its id or by the beginning of only
 /// one.
-Expected<FoundCred> resolveCred(const std::string &text);
+[[nodiscard]] Expected<FoundCred> resolveCred(const std::string &text);
 
 } // namespace Ovradr

@@ -24,11 +24,11 @@ bool isInteractive();
 /// echo. An empty one, and one of more than Secret::kMaxSize bytes, is refused.
 /// \param question  e.g. "Password of bob"
 /// \param twice     a password that is typed in has to be typed in again
-Expected<Secret> obtainPassword(const PasswordSource &source, const std::string &question,
-                                bool twice);
+[[nodiscard]] Expected<Secret> obtainPassword(const PasswordSource &source,
+                                              const std::string &question, bool twice);
 
 /// Asks for a secret on the terminal, without echo. Only where isInteractive().
-Expected<Secret> askSecret(const std::string &question);
+[[nodiscard]] Expected<Secret> askSecret(const std::string &question);
 
 /// Asks a question on the terminal that only "y" or "yes" answers with true. Only where
 /// isInteractive().

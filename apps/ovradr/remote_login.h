@@ -36,7 +36,8 @@ void addFingerprintOption(CLI::App &command, std::string &fingerprint);
 /// \param conn         may be one of the relay service
 /// \param fingerprint  the key that it must have, or ""
 /// \return the direct endpoint
-Expected<OvraDRNode::Conn> meet(const OvraDRNode::Conn &conn, const std::string &fingerprint);
+[[nodiscard]] Expected<OvraDRNode::Conn> meet(const OvraDRNode::Conn &conn,
+                                              const std::string &fingerprint);
 
 /// Logs in; answers with the library's error code, 0 when it succeeded.
 using LoginAttempt = std::function<int(const std::string &password, const std::string &code)>;
@@ -45,7 +46,7 @@ using LoginAttempt = std::function<int(const std::string &password, const std::s
 /// asks for is asked for here, once, where there is somebody to ask.
 /// \param host  as the question names the other end
 /// \return why there was no attempt, or no second one; what came of an attempt is not told.
-Expected<void> logIn(const RemoteLogin &login, const std::string &host,
-                     const LoginAttempt &attempt);
+[[nodiscard]] Expected<void> logIn(const RemoteLogin &login, const std::string &host,
+                                   const LoginAttempt &attempt);
 
 } // namespace Ovradr

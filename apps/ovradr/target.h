@@ -16,7 +16,7 @@ inline constexpr int kDefaultHttpsPort = 5001;
 /// is a name in ASCII, an IPv4 address, or an IPv6 address in brackets, which the endpoint then
 /// holds without them; one endpoint gets one spelling. Anything more (a user, a path, a query) is
 /// refused: it would be lost unseen.
-Expected<OvraDRNode::Conn> parseTarget(const std::string &text);
+[[nodiscard]] Expected<OvraDRNode::Conn> parseTarget(const std::string &text);
 
 /// The endpoint as parseTarget() reads it, its port always shown; of a direct endpoint also the
 /// name under which its key is kept.

@@ -19,13 +19,13 @@ struct HostAddress {
 };
 
 /// The addresses of a host, each once. Waits as long as the system's resolver does.
-Expected<std::vector<HostAddress>> resolveHost(const std::string &host, int port);
+[[nodiscard]] Expected<std::vector<HostAddress>> resolveHost(const std::string &host, int port);
 
 /// Makes a bare TCP connection to the first of the addresses that takes one, and ends it again; 10
 /// seconds at most for all of them.
 /// \param conn  whose addresses they are, for the message
 /// \return the address that was reached.
-Expected<std::string> connectAny(const std::vector<HostAddress> &addresses,
-                                 const OvraDRNode::Conn &conn);
+[[nodiscard]] Expected<std::string> connectAny(const std::vector<HostAddress> &addresses,
+                                               const OvraDRNode::Conn &conn);
 
 } // namespace Ovradr

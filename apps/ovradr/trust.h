@@ -31,6 +31,6 @@ std::string trustWord(const OvraPlatform::PeerIdentity &identity);
 /// the terminal says so.
 /// \param expected  the fingerprint that the key must have, or ""
 /// \return what is in the way; nothing when the key is trusted.
-Expected<void> trustPeer(const OvraDRNode::Conn &conn, const std::string &expected);
+[[nodiscard]] Expected<void> trustPeer(const OvraDRNode::Conn &conn, const std::string &expected);
 
 } // namespace Ovradr

@@ -79,7 +79,7 @@ struct Daemon::Impl {
 
     Expected<void> loadKeys();
     void addHandlers();
-    Expected<std::vector<Listener>> openPorts(int &port) const;
+    Expected<std::vector<Listener>> openPorts(int port) const;
 
     Settings settings;
     int httpsPort = 0;
@@ -126,8 +126,8 @@ void Daemon::Impl::addHandlers() {
 }
 
 /// One socket for each address, all at the same port.
-/// \param port  0: takes the port that was free
-Expected<std::vector<Listener>> Daemon::Impl::openPorts(int &port) const {
+/// \param port  0: one that is free
+Expected<std::vector<Listener>> Daemon::Impl::openPorts(int port) const {
     const std::vector<std::string> everywhere = {""};
     std::vector<Listener> listeners;
     for (const std::string &address :
@@ -161,16 +161,16 @@ tl::expected<void, StartError> Daemon::start() {
     if (const Expected<void> loaded = self.loadKeys(); !loaded) {
         return failed(loaded.error());
     }
-    self.httpsPort = self.settings.httpsPort;
-    self.httpPort = self.settings.httpPort;
-    Expected<std::vector<Listener>> https = self.openPorts(self.httpsPort);
+    Expected<std::vector<Listener>> https = self.openPorts(self.settings.httpsPort);
     if (!https) {
         return failed(https.error());
     }
-    Expected<std::vector<Listener>> http = self.openPorts(self.httpPort);
+    Expected<std::vector<Listener>> http = self.openPorts(self.settings.httpPort);
     if (!http) {
         return failed(http.error());
     }
+    self.httpsPort = https->front().port;
+    self.httpPort = http->front().port;
     self.farlink.emplace([&self](ConnectedClient client) { self.http->adopt(std::move(client)); });
     self.addHandlers();
     self.queues.emplace();
@@ -203,7 +203,7 @@ int Daemon::httpPort() const {
 }
 
 void Daemon::doPeriodicWork() {
-    OvraPlatform::SessionStore().sweep();
+    (void)OvraPlatform::SessionStore().sweep(); // the log says why not; the next one is soon
     impl_->retries->begin();
 }
 

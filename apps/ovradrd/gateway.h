@@ -50,8 +50,8 @@ private:
     struct Call;
 
     void open(Call &call, std::string &body);
-    bool unseal(Call &call);
-    bool admit(Call &call);
+    [[nodiscard]] bool unseal(Call &call);
+    [[nodiscard]] bool admit(Call &call);
     void route(Call call);
     void login(Call call);
     void run(const Call &call) const;

@@ -35,7 +35,9 @@ void ReleaseRetries::begin() {
 void ReleaseRetries::round() {
     OvraApps::PendingReleases store;
     std::vector<OvraApps::PendingRelease> due;
-    store.listDue(due, kMaxInARound);
+    if (!store.listDue(due, kMaxInARound)) {
+        return; // the log says why
+    }
     for (const OvraApps::PendingRelease &pending : due) {
         OvraApps::retryRelease(pending, store);
     }

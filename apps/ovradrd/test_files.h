@@ -17,7 +17,7 @@ inline constexpr std::string_view kTestFilesUrl = "/webman/modules/ovradr/";
 /// scripts/TestSyncSpeed.sh gives, in its one folder, are opened, no link is followed, and the file
 /// has to be a regular one of our own user: whatever the URL says, nothing else is reached.
 /// \param path  as it is once its escapes were resolved
-std::optional<OvraService::ServedFile> openTestFile(std::string_view path);
+[[nodiscard]] std::optional<OvraService::ServedFile> openTestFile(std::string_view path);
 
 /// Those files for the HTTP server.
 /// \param atOnce  how many are sent at the same time

@@ -49,7 +49,7 @@ public:
     ~Connections();
 
     /// Whether a connection of the client may be opened; makes room when that is needed.
-    bool admit(const std::string &client);
+    [[nodiscard]] bool admit(const std::string &client);
     /// \param fd  stays the caller's, open until close() has returned
     Connection *open(int fd, const std::string &client);
     void close(Connection *connection);
@@ -67,7 +67,7 @@ private:
     std::optional<std::chrono::milliseconds> limitOf(Phase phase) const;
     void uncount(Connection &connection);
     void shut(Connection &connection);
-    bool makeRoom(const std::string *client);
+    [[nodiscard]] bool makeRoom(const std::string *client);
 
     const ConnectionLimits limits_;
     std::mutex mutex_;

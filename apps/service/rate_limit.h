@@ -18,7 +18,7 @@ public:
         , period_(period) {}
 
     /// Counts one event; false when there were too many, and then it does not count.
-    bool allow(const std::string &address, TimePoint now) {
+    [[nodiscard]] bool allow(const std::string &address, TimePoint now) {
         if (windows_.size() >= kMaxAddresses) {
             forgetOld(now);
         }

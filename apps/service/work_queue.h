@@ -25,7 +25,7 @@ public:
     /// Hands over a job. It runs once, in a thread of the queue; what it throws is logged.
     /// \param delay  for how long it waits in the queue at least; no thread waits with it
     /// \return false when the queue is full or the queue stops; the job does not run then.
-    bool submit(Job job, std::chrono::milliseconds delay = {});
+    [[nodiscard]] bool submit(Job job, std::chrono::milliseconds delay = {});
 
     /// Takes no more jobs and drops the waiting ones.
     /// \return whether all jobs under way ended by `deadline`.

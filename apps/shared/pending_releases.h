@@ -58,20 +58,21 @@ public:
     /// Remembers a release before its flow begins, so that a flow that is killed leaves it noted.
     /// One that is known already gets the new endpoint. \return false on failure, and when there
     /// are kMaxReleases already.
-    bool note(const PendingRelease &release);
+    [[nodiscard]] bool note(const PendingRelease &release);
     /// The release failed once more: it is due again after a pause. \return false on failure.
-    bool postpone(const std::string &reference, int code);
+    [[nodiscard]] bool postpone(const std::string &reference, int code);
     /// Forgets the release; one that is not there is forgotten. \return false on failure.
-    bool remove(const std::string &reference);
+    [[nodiscard]] bool remove(const std::string &reference);
     /// All, the oldest first. \return false on failure.
-    bool list(std::vector<PendingRelease> &releases);
+    [[nodiscard]] bool list(std::vector<PendingRelease> &releases);
     /// At most `most` of those that are due, the longest due first. Also those whose time lies
     /// further ahead than any pause reaches: the clock was set back. \return false on failure.
-    bool listDue(std::vector<PendingRelease> &releases, int most);
+    [[nodiscard]] bool listDue(std::vector<PendingRelease> &releases, int most);
 
 private:
     std::int64_t now() const;
-    bool collect(OvraPlatform::Statement &rows, std::vector<PendingRelease> &releases);
+    [[nodiscard]] bool collect(OvraPlatform::Statement &rows,
+                               std::vector<PendingRelease> &releases);
 
     OvraPlatform::Database database_;
     Clock clock_;

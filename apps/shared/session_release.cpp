@@ -59,7 +59,7 @@ void settle(PendingReleases &store, const PendingRelease &pending, Release &rele
     release.remembered =
         release.state == Release::State::kLeft && store.postpone(pending.reference(), release.code);
     if (release.state != Release::State::kLeft) {
-        store.remove(pending.reference());
+        (void)store.remove(pending.reference()); // what stays is found settled when it is due
     }
 }
 
@@ -98,8 +98,8 @@ ReleasingFlow runReleasing(const DRNode &record, const Conn &conn,
         result.done = flow();
     }
     if (!result.done) {
-        // The credential is as it was, and needs its session.
-        store.remove(pending.reference());
+        // The credential is as it was, and needs its session; a note that stays is found so.
+        (void)store.remove(pending.reference());
         return {false, {Release::State::kKept, 0, {}, false}};
     }
     result.release = lookAfter(conn, record.session,

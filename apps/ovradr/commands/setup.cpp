@@ -123,14 +123,13 @@ OvraService::ServerNames serverNames() {
     return names;
 }
 
-Expected<SetUpStep> provisionSealKey(std::string &fingerprint) {
+Expected<SetUpStep> provisionSealKey() {
     const bool there = access(OvraPlatform::kSealKeyFile, F_OK) == 0;
     const auto keys = OvraPlatform::SealKeyPair::loadOrCreate(OvraPlatform::kSealKeyFile);
     if (!keys) {
         return failure(ExitCode::kNotSetUp, "No sealing key: " + keys.error() + ".",
                        "Correct that and run `ovradr setup` again.");
     }
-    fingerprint = OvraPlatform::fingerprintOf(keys->publicKey());
     return SetUpStep{"sealing key", !there, OvraPlatform::kSealKeyFile};
 }
 
@@ -167,10 +166,10 @@ Expected<SetUpStep> provisionCertificate() {
     return SetUpStep{"HTTPS certificate", *made, kTlsCertificateFile};
 }
 
-Expected<SetUpStep> provisionNodeId(std::string &nodeId) {
+Expected<SetUpStep> provisionNodeId() {
     const std::string file = std::string(OvraPlatform::kConfigDir) + "/node.info";
     const bool there = OLIBCFileExist(file.c_str()) != 0;
-    nodeId = OvraDRNode::DRNode::getLocalNodeId();
+    const std::string nodeId = OvraDRNode::DRNode::getLocalNodeId();
     if (nodeId.empty()) {
         return failure(ExitCode::kNotSetUp, "The node id can be neither read nor made.",
                        "The system log says why.");
@@ -178,17 +177,10 @@ Expected<SetUpStep> provisionNodeId(std::string &nodeId) {
     return SetUpStep{"node id", !there, nodeId};
 }
 
-struct SetUp {
-    std::vector<SetUpStep> steps;
-    std::string nodeId;
-    std::string httpsFingerprint;
-    std::string httpFingerprint;
-};
-
-Outcome report(const SetUp &setUp) {
+Report reportOf(const std::vector<SetUpStep> &steps) {
     Report report;
     std::vector<std::vector<std::string>> rows;
-    for (const SetUpStep &step : setUp.steps) {
+    for (const SetUpStep &step : steps) {
         const char *state = step.made ? "made" : "kept";
         rows.push_back({step.what, state, step.detail});
         Json::Value item;
@@ -197,13 +189,16 @@ Outcome report(const SetUp &setUp) {
         item["detail"] = step.detail;
         report.data["steps"].append(item);
     }
-    report.data["node_id"] = setUp.nodeId;
-    report.data["fingerprints"]["https"] = setUp.httpsFingerprint;
-    report.data["fingerprints"]["http"] = setUp.httpFingerprint;
-    report.text =
-        table({"WHAT", "STATE", "DETAIL"}, rows) +
-        "\nWho pairs with this appliance is shown one of these keys:\n" +
-        listing({{"  over https", setUp.httpsFingerprint}, {"  over http", setUp.httpFingerprint}});
+    report.data["node_id"] = OvraDRNode::DRNode::getLocalNodeId();
+    const auto sealing = OvraPlatform::SealKeyPair::load(OvraPlatform::kSealKeyFile);
+    const std::string https =
+        OvraService::certificateFingerprint(OvraPlatform::kTlsCertificateFile);
+    const std::string http = sealing ? OvraPlatform::fingerprintOf(sealing->publicKey()) : "";
+    report.data["fingerprints"]["https"] = https;
+    report.data["fingerprints"]["http"] = http;
+    report.text = table({"WHAT", "STATE", "DETAIL"}, rows) +
+                  "\nWho pairs with this appliance is shown one of these keys:\n" +
+                  listing({{"  over https", https}, {"  over http", http}});
     return report;
 }
 
@@ -219,28 +214,27 @@ Outcome setUp(const Settings &settings) {
     if (const auto made = makeFolders(); !made) {
         return Refusal(made.error());
     }
-    SetUp done;
+    std::vector<SetUpStep> done;
     const std::vector<std::function<Expected<SetUpStep>()>> steps = {
         [&settings] { return writeSettings(settings); },
         [&schema] { return provisionNodeDatabase(nodeDatabasePath(), *schema); },
         provisionTlsKey,
         provisionCertificate,
-        [&done] { return provisionSealKey(done.httpFingerprint); },
-        [&done] { return provisionNodeId(done.nodeId); },
-        [] { return provisionScripts(); },
+        provisionSealKey,
+        provisionNodeId,
+        provisionScripts,
     };
     for (const auto &step : steps) {
         const Expected<SetUpStep> result = step();
         if (!result) {
             return Refusal(result.error());
         }
-        done.steps.push_back(*result);
+        done.push_back(*result);
     }
     if (const auto usable = checkFile(); !usable) {
         return Refusal(usable.error());
     }
-    done.httpsFingerprint = OvraService::certificateFingerprint(OvraPlatform::kTlsCertificateFile);
-    return report(done);
+    return reportOf(done);
 }
 
 } // namespace

@@ -10,11 +10,11 @@ namespace Ovradr {
 
 /// Finds a file that was installed with the program: beside it (../share/ovradrnode), else where it
 /// was installed.
-Expected<std::string> findDataFile(const std::string &name);
+[[nodiscard]] Expected<std::string> findDataFile(const std::string &name);
 
 /// Puts the scripts that measure the speed of a link where the library looks for them, as links to
 /// the installed ones, so that they are renewed with the program. Files that somebody else has put
 /// there stay.
-Expected<SetUpStep> provisionScripts();
+[[nodiscard]] Expected<SetUpStep> provisionScripts();
 
 } // namespace Ovradr

@@ -16,7 +16,7 @@ struct SetUpStep {
 
 /// Takes away what others may do with a file that is only ours.
 /// \return whether they could do something
-Expected<bool> makePrivate(const std::string &path);
+[[nodiscard]] Expected<bool> makePrivate(const std::string &path);
 
 /// The failure of an operation on a file of this appliance, with the reason that errno gives.
 Refusal fileFailure(const std::string &path, int error);

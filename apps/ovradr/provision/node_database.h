@@ -18,10 +18,11 @@ std::string nodeDatabasePath();
 /// one transaction, so that a crash leaves an empty file, which the next call fills; what holds
 /// anything is never changed. Refused: another program's file, and a schema that is newer than this
 /// program.
-Expected<SetUpStep> provisionNodeDatabase(const std::string &path, const std::string &schemaFile);
+[[nodiscard]] Expected<SetUpStep> provisionNodeDatabase(const std::string &path,
+                                                        const std::string &schemaFile);
 
 /// Whether the node database can be used; the library itself reports a database that it cannot read
 /// as one without rows.
-Expected<void> checkNodeDatabase();
+[[nodiscard]] Expected<void> checkNodeDatabase();
 
 } // namespace Ovradr

@@ -40,7 +40,7 @@ struct Proof {
     Proof(Params &in, bool withCredId);
 
     /// Gives the proof to the flow; false: the flow says why not.
-    bool giveTo(OvraDRNode::CredCreate &flow) const;
+    [[nodiscard]] bool giveTo(OvraDRNode::CredCreate &flow) const;
 };
 
 } // namespace Ovradrd

@@ -25,7 +25,7 @@ std::vector<KeyValueLine> parseKeyValueLines(std::string_view text);
 
 /// The value of `key`. Of several lines with the key the last one counts; one that is not
 /// well-formed does not.
-std::optional<std::string> findKeyValue(std::string_view text, std::string_view key);
+[[nodiscard]] std::optional<std::string> findKeyValue(std::string_view text, std::string_view key);
 
 /// `text` with `line` (which ends in a newline) in place of the line that findKeyValue() takes, or
 /// at the end when there is none. Every other line stays as it is, byte for byte.

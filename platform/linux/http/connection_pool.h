@@ -30,7 +30,8 @@ public:
     static ConnectionPool &instance();
 
     /// The connection that was idle for the shortest time, or null.
-    std::unique_ptr<HttpConnection> take(const Endpoint &endpoint, const TrustStore::Stamp &trust);
+    [[nodiscard]] std::unique_ptr<HttpConnection> take(const Endpoint &endpoint,
+                                                       const TrustStore::Stamp &trust);
     /// Keeps a connection on which a request has just ended well.
     /// \param trust  the stamp of the trusted keys from before that request
     void keep(const Endpoint &endpoint, const TrustStore::Stamp &trust,

@@ -18,8 +18,8 @@ public:
     ///                  IPv6 address with or without brackets
     /// \param port      1 to 65535
     /// \return nothing when one of them is something else.
-    static std::optional<Endpoint> make(const std::string &protocol, const std::string &host,
-                                        int port);
+    [[nodiscard]] static std::optional<Endpoint> make(const std::string &protocol,
+                                                      const std::string &host, int port);
 
     bool isTls() const { return protocol_ == "https"; }
     /// The host, in lower case, without brackets.
@@ -29,7 +29,7 @@ public:
     std::string key() const;
     /// \param path  relative to the root; nothing when a character in it would not be part of a
     /// path
-    std::optional<std::string> url(const std::string &path) const;
+    [[nodiscard]] std::optional<std::string> url(const std::string &path) const;
 
 private:
     Endpoint() = default;

@@ -83,8 +83,8 @@ private:
     };
 
     HttpConnection(const Endpoint &endpoint, Purpose purpose);
-    bool setUp();
-    CredExpected<HttpAnswer> perform(const std::string &url, Deadline deadline);
+    [[nodiscard]] bool setUp();
+    [[nodiscard]] CredExpected<HttpAnswer> perform(const std::string &url, Deadline deadline);
     CredError errorOf(CURLcode code) const;
 
     static std::size_t onBody(char *data, std::size_t size, std::size_t count, void *self);

@@ -130,17 +130,16 @@ public:
             outer.api = call_.api;
             outer.version = call_.version;
             outer.method = call_.method;
-            ReplyKey replyKey;
-            outer.sealed =
-                sealRequest(known_.key, call_, wallClock() + known_.clockOffset, replyKey);
-            if (outer.sealed.empty()) {
+            auto sealed = sealRequest(known_.key, call_, wallClock() + known_.clockOffset);
+            if (!sealed) {
                 return tl::unexpected(CredError::kSealFailed);
             }
+            outer.sealed = std::move(sealed->envelope);
             const CredExpected<std::string> body = post(endpoint_, outer, options_);
             if (!body) {
                 return tl::unexpected(body.error());
             }
-            if (Ending ending = read(*body, replyKey)) {
+            if (Ending ending = read(*body, sealed->replyKey)) {
                 return std::move(*ending);
             }
         }

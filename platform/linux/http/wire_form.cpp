@@ -102,13 +102,9 @@ std::optional<FormFields> splitForm(std::string_view body) {
     return fields;
 }
 
-bool parseVersion(const std::string &text, int &version) {
-    version = OvraBase::parseNumber(text, 1).value_or(0);
-    return version > 0;
-}
-
-/// Puts one field where it belongs. \return why it does not belong anywhere; null when it does
-const char *takeField(WireCall &call, const std::string &name, std::string &value) {
+/// Puts one field where it belongs, or says why it does not belong anywhere.
+tl::expected<void, std::string> takeField(WireCall &call, const std::string &name,
+                                          std::string &value) {
     if (name == kApi) {
         call.api = std::move(value);
     } else if (name == kMethod) {
@@ -118,13 +114,14 @@ const char *takeField(WireCall &call, const std::string &name, std::string &valu
     } else if (name == kSealed) {
         call.sealed = std::move(value);
     } else if (name == kVersion) {
-        if (!parseVersion(value, call.version)) {
-            return "version is not a positive number";
+        call.version = OvraBase::parseNumber(value, 1).value_or(0);
+        if (call.version <= 0) {
+            return tl::unexpected(std::string("version is not a positive number"));
         }
     } else if (!OvraDRCore::fromString(call.params[name], value)) {
-        return "a parameter is not JSON text";
+        return tl::unexpected(std::string("a parameter is not JSON text"));
     }
-    return nullptr;
+    return {};
 }
 
 } // namespace
@@ -182,8 +179,8 @@ tl::expected<WireCall, std::string> decodeForm(std::string_view body) {
         if (!seen.insert(name).second) {
             return refused("a field stands twice");
         }
-        if (const char *why = takeField(call, name, value); why != nullptr) {
-            return refused(why);
+        if (const auto taken = takeField(call, name, value); !taken) {
+            return tl::unexpected(taken.error());
         }
     }
     if (call.api.empty() || call.method.empty() || call.version == 0) {

@@ -111,11 +111,11 @@ UnixMillis ReplayGuard::now() {
 ReplayGuard::Verdict ReplayGuard::admit(UnixMillis time, const SealNonce &nonce) {
     const std::lock_guard<std::mutex> lock(mutex_);
     const UnixMillis now = nowLocked();
-    floor_ = std::max(floor_, now - kPast);
+    floor_ = std::max(floor_, now - kMaxPast);
     seen_.erase(seen_.begin(), std::find_if(seen_.begin(), seen_.end(), [this](const auto &entry) {
                     return entry.first > floor_;
                 }));
-    if (time <= floor_ || time > now + kFuture) {
+    if (time <= floor_ || time > now + kMaxFuture) {
         return Verdict::kStale;
     }
     if (!seen_.emplace(time, nonce).second) {
@@ -128,14 +128,15 @@ ReplayGuard::Verdict ReplayGuard::admit(UnixMillis time, const SealNonce &nonce)
     return Verdict::kFresh;
 }
 
-std::string sealRequest(const PublicKey &receiver, const WireCall &call, UnixMillis time,
-                        ReplyKey &replyKey) {
+std::optional<SealedRequest> sealRequest(const PublicKey &receiver, const WireCall &call,
+                                         UnixMillis time) {
     if (!OvraBase::sodiumReady()) {
-        return {};
+        return std::nullopt;
     }
+    SealedRequest request;
     SealNonce nonce{};
     randombytes_buf(nonce.data(), nonce.size());
-    randombytes_buf(replyKey.data(), replyKey.size());
+    randombytes_buf(request.replyKey.data(), request.replyKey.size());
 
     Json::Value plain(Json::objectValue);
     plain["api"] = call.api;
@@ -145,16 +146,17 @@ std::string sealRequest(const PublicKey &receiver, const WireCall &call, UnixMil
     plain["nonce"] = OvraBase::toBase64Url(nonce.data(), nonce.size());
     plain["params"] = call.params;
     plain["sid"] = call.sid;
-    plain["reply_key"] = OvraBase::toBase64Url(replyKey.data(), replyKey.size());
+    plain["reply_key"] = OvraBase::toBase64Url(request.replyKey.data(), request.replyKey.size());
     std::string text = OvraDRCore::toString(plain);
     const OvraBase::WipeAtEnd wipe(text);
     text.append((kPadding - text.size() % kPadding) % kPadding, ' ');
 
     std::vector<unsigned char> sealed(text.size() + crypto_box_SEALBYTES);
     if (crypto_box_seal(sealed.data(), bytesOf(text), text.size(), receiver.data()) != 0) {
-        return {};
+        return std::nullopt;
     }
-    return OvraBase::toBase64Url(sealed.data(), sealed.size());
+    request.envelope = OvraBase::toBase64Url(sealed.data(), sealed.size());
+    return request;
 }
 
 SealVerdict openRequest(const SealKeyPair &keys, const WireCall &visible, ReplayGuard &guard,

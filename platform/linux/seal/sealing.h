@@ -16,14 +16,18 @@ UnixMillis wallClock();
 /// Nothing when the text is no public key.
 std::optional<PublicKey> parsePublicKey(const std::string &text);
 
+struct SealedRequest {
+    std::string envelope; ///< the text of the field "sealed"
+    ReplyKey replyKey;    ///< for the reply
+};
+
 /// Seals parameters and session id of `call` to `receiver`.
-/// \param time      the receiver's time
-/// \param replyKey  takes the key for the reply
-/// \return the text of the field "sealed"; "" when libsodium cannot be used.
-std::string sealRequest(const PublicKey &receiver, const WireCall &call, UnixMillis time,
-                        ReplyKey &replyKey);
+/// \param time  the receiver's time
+/// \return nothing when libsodium cannot be used.
+[[nodiscard]] std::optional<SealedRequest> sealRequest(const PublicKey &receiver,
+                                                       const WireCall &call, UnixMillis time);
 
 /// The document inside `reply` (an object with "sealed_reply"); nothing when it does not open.
-std::optional<std::string> openReply(const ReplyKey &key, const Json::Value &reply);
+[[nodiscard]] std::optional<std::string> openReply(const ReplyKey &key, const Json::Value &reply);
 
 } // namespace OvraPlatform

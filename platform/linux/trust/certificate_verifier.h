@@ -38,7 +38,7 @@ public:
     /// do.
     void install(SSL_CTX *context);
     /// Pins a key that is new; false when that failed, and then the verdict says why.
-    bool pinNewKey();
+    [[nodiscard]] bool pinNewKey();
 
     Verdict verdict() const { return verdict_; }
     /// Of the key that was judged last.
@@ -47,7 +47,7 @@ public:
 private:
     static int verify(X509_STORE_CTX *chain, void *self);
     Verdict judge(X509_STORE_CTX *chain);
-    bool systemAccepts(X509_STORE_CTX *chain) const;
+    [[nodiscard]] bool systemAccepts(X509_STORE_CTX *chain) const;
 
     Endpoint endpoint_;
     bool observe_;

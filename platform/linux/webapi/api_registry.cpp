@@ -60,21 +60,18 @@ void APIRegistry::add(const std::string &api, int version, const std::string &me
     apis_[api][method].insert_or_assign(version, Entry{right, queue, std::move(handler)});
 }
 
-const APIRegistry::Entry *APIRegistry::find(const APICall &call, int &error) const {
+tl::expected<const APIRegistry::Entry *, int> APIRegistry::find(const APICall &call) const {
     const auto methods = apis_.find(call.api);
     if (methods == apis_.end()) {
-        error = APIError::kNoSuchAPI;
-        return nullptr;
+        return tl::unexpected<int>(APIError::kNoSuchAPI);
     }
     const auto versions = methods->second.find(call.method);
     if (versions == methods->second.end()) {
-        error = APIError::kNoSuchMethod;
-        return nullptr;
+        return tl::unexpected<int>(APIError::kNoSuchMethod);
     }
     const auto entry = versions->second.find(call.version);
     if (entry == versions->second.end()) {
-        error = APIError::kNoSuchVersion;
-        return nullptr;
+        return tl::unexpected<int>(APIError::kNoSuchVersion);
     }
     return &entry->second;
 }
@@ -92,17 +89,16 @@ std::vector<APIRegistry::Method> APIRegistry::methods() const {
 }
 
 APIQueue APIRegistry::queue(const APICall &call) const {
-    int error = 0;
-    const Entry *entry = find(call, error);
-    return entry == nullptr ? APIQueue::kQuick : entry->queue;
+    const auto entry = find(call);
+    return entry ? (*entry)->queue : APIQueue::kQuick;
 }
 
 Json::Value APIRegistry::dispatch(const APICall &call, const APICaller &caller) const {
-    int error = 0;
-    const Entry *entry = find(call, error);
-    if (entry == nullptr) {
-        return apiError(error, refusalText(error));
+    const auto found = find(call);
+    if (!found) {
+        return apiError(found.error(), refusalText(found.error()));
     }
+    const Entry *const entry = *found;
     if (entry->right != APIRight::kNone && caller.user.empty()) {
         return apiError(APIError::kNoSession, "the session is unknown or expired: log in again");
     }

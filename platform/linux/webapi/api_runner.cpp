@@ -31,18 +31,20 @@ namespace APIError = OvraPlatform::APIError;
 constexpr std::chrono::seconds kCallTime{120};
 constexpr std::chrono::milliseconds kRetryPause{10};
 
-Json::Value failure(const std::string &text) {
-    return apiError(APIError::kInternal, text);
+/// An answer, or the document that says why there is none.
+using Answer = tl::expected<Json::Value, Json::Value>;
+
+tl::unexpected<Json::Value> failure(const std::string &text) {
+    return tl::unexpected(apiError(APIError::kInternal, text));
 }
 
-/// Connects to the daemon; nothing, with the reason in `why`, when nobody answers.
-UniqueFd connectToDaemon(OvraPlatform::Deadline deadline, std::string &why) {
+/// Connects to the daemon, or says why it is not asked.
+tl::expected<UniqueFd, std::string> connectToDaemon(OvraPlatform::Deadline deadline) {
     const std::string path = OvraPlatform::kSocketFile;
     const std::optional<sockaddr_un> address = OvraPlatform::localAddress(path);
     UniqueFd fd(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
     if (!address || !fd) {
-        why = "no socket for asking the daemon: " + OvraBase::errnoText(errno);
-        return {};
+        return tl::unexpected("no socket for asking the daemon: " + OvraBase::errnoText(errno));
     }
     while (!OvraPlatform::connectLocal(fd.get(), *address)) {
         // The queue of callers is full: the only case that passes by waiting.
@@ -51,58 +53,51 @@ UniqueFd connectToDaemon(OvraPlatform::Deadline deadline, std::string &why) {
             continue;
         }
         if (errno == EACCES || errno == EPERM) {
-            why = "ovradrd may not be asked by this user: run the command as root";
-        } else {
-            why = "ovradrd does not answer on " + path + " (" + OvraBase::errnoText(errno) +
-                  "): start it";
+            return tl::unexpected(
+                std::string("ovradrd may not be asked by this user: run the command as root"));
         }
-        return {};
+        return tl::unexpected("ovradrd does not answer on " + path + " (" +
+                              OvraBase::errnoText(errno) + "): start it");
     }
     if (!OvraPlatform::isPeerTrusted(fd.get())) {
-        why = "the process that answers on " + path + " is neither root's nor this user's: stop it";
-        return {};
+        return tl::unexpected("the process that answers on " + path +
+                              " is neither root's nor this user's: stop it");
     }
     return fd;
 }
 
-bool askDaemon(Json::Value &out, const OvraPlatform::LocalCall &call) {
+Answer askDaemon(const OvraPlatform::LocalCall &call) {
     const auto deadline = std::chrono::steady_clock::now() + kCallTime;
-    std::string why;
-    const UniqueFd fd = connectToDaemon(deadline, why);
+    const auto fd = connectToDaemon(deadline);
     if (!fd) {
-        out = failure(why);
-        return false;
+        return failure(fd.error());
     }
     const std::string request = OvraPlatform::toLocalRequest(call);
     if (request.size() > OvraPlatform::kMaxFrame) {
-        out = apiError(APIError::kTooLarge, "the request is too large: send less at once");
-        return false;
+        return tl::unexpected(
+            apiError(APIError::kTooLarge, "the request is too large: send less at once"));
     }
     // A daemon that refuses us answers without reading: sending fails then, and the answer is
     // there.
-    OvraPlatform::sendFrame(fd.get(), request, deadline);
-    const std::optional<std::string> reply = OvraPlatform::receiveFrame(fd.get(), deadline);
+    (void)OvraPlatform::sendFrame(fd->get(), request, deadline);
+    const std::optional<std::string> reply = OvraPlatform::receiveFrame(fd->get(), deadline);
     if (!reply) {
-        out = failure("ovradrd gave no answer, or none in time: its log says why");
-        return false;
+        return failure("ovradrd gave no answer, or none in time: its log says why");
     }
     Json::Value document;
     if (!OvraDRCore::fromString(document, *reply) || !document.isObject()) {
-        out = failure("ovradrd gave an answer that is not a document: is it the same version?");
-        return false;
+        return failure("ovradrd gave an answer that is not a document: is it the same version?");
     }
-    out = std::move(document);
-    return true;
+    return document;
 }
 
-bool runHere(Json::Value &out, const OvraPlatform::LocalCall &call,
-             const OvraPlatform::APIRegistry &registry) {
+Json::Value runHere(const OvraPlatform::LocalCall &call,
+                    const OvraPlatform::APIRegistry &registry) {
     OvraPlatform::APICaller caller;
     caller.user = call.user;
     caller.administrator = true;
     caller.local = true;
-    out = registry.dispatch(call, caller);
-    return true;
+    return registry.dispatch(call, caller);
 }
 
 } // namespace
@@ -121,9 +116,11 @@ bool APIRunner::Exec(Json::Value &out, const char *api, int version, const char 
         }
         const OvraPlatform::LocalCall call{{api, version, method, params}, user};
         const OvraPlatform::APIRegistry *registry = OvraPlatform::APIRegistry::hosted();
-        return registry != nullptr ? runHere(out, call, *registry) : askDaemon(out, call);
+        const Answer answer = registry != nullptr ? runHere(call, *registry) : askDaemon(call);
+        out = answer ? *answer : answer.error();
+        return answer.has_value();
     } catch (const std::exception &error) {
-        out = failure(std::string("the call failed: ") + error.what());
+        out = failure(std::string("the call failed: ") + error.what()).value();
         return false;
     }
 }

@@ -157,7 +157,7 @@ void LocalServer::Impl::serve(int peer) {
                 apiError(APIError::kTooLarge, "the reply is too large: ask for less at once"));
         }
         // A stop does not cut this short: the call was carried out, its caller should know.
-        sendFrame(peer, reply, std::chrono::steady_clock::now() + kWriteTime);
+        (void)sendFrame(peer, reply, std::chrono::steady_clock::now() + kWriteTime);
     } catch (const std::exception &error) {
         OVRA_ERR("A local call could not be served: [%s]", error.what());
     }

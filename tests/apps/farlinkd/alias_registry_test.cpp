@@ -11,23 +11,20 @@ namespace {
 
 using Farlinkd::Alias;
 using Farlinkd::AliasRegistry;
-using Enrolment = AliasRegistry::Enrolment;
+using Refusal = AliasRegistry::Refusal;
 
 constexpr char kFile[] = "/usr/ovra/aliases";
 constexpr AliasRegistry::Limits kLimits{6000, 6002, std::chrono::seconds(100), 2};
 
-/// The port assigned to the key for the alias, or the negated enrolment result.
-int enrol(AliasRegistry &registry, const std::string &name, const std::string &key,
-          std::int64_t now) {
-    Alias alias;
-    const Enrolment enrolment = registry.enrol(name, key, now, alias);
-    return enrolment == Enrolment::kMade || enrolment == Enrolment::kRenewed
-               ? alias.port
-               : -static_cast<int>(enrolment);
+constexpr int refused(Refusal refusal) {
+    return -1 - static_cast<int>(refusal);
 }
 
-constexpr int refused(Enrolment enrolment) {
-    return -static_cast<int>(enrolment);
+/// The port assigned to the key for the alias, or refused() of the refusal.
+int enrol(AliasRegistry &registry, const std::string &name, const std::string &key,
+          std::int64_t now) {
+    const auto enrolled = registry.enrol(name, key, now);
+    return enrolled ? enrolled->alias.port : refused(enrolled.error());
 }
 
 } // namespace
@@ -35,10 +32,10 @@ constexpr int refused(Enrolment enrolment) {
 TEST(AliasRegistry, AnAliasStaysWithItsKeyUntilTheLeaseIsOver) {
     AliasRegistry registry(kFile, kLimits);
     EXPECT_EQ(enrol(registry, "nas", "key1", 0), 6000);
-    EXPECT_EQ(enrol(registry, "nas", "key2", 99), refused(Enrolment::kTaken));
+    EXPECT_EQ(enrol(registry, "nas", "key2", 99), refused(Refusal::kTaken));
     EXPECT_EQ(enrol(registry, "nas", "key1", 99), 6000) << "renewed";
     EXPECT_TRUE(registry.dropExpired(198).empty());
-    EXPECT_EQ(enrol(registry, "nas", "key2", 198), refused(Enrolment::kTaken));
+    EXPECT_EQ(enrol(registry, "nas", "key2", 198), refused(Refusal::kTaken));
     EXPECT_EQ(registry.dropExpired(199).size(), 1U);
     EXPECT_EQ(registry.find("nas"), nullptr);
     EXPECT_EQ(enrol(registry, "nas", "key2", 199), 6001)
@@ -49,11 +46,11 @@ TEST(AliasRegistry, PortsGoRoundAndAreBounded) {
     AliasRegistry registry(kFile, kLimits);
     EXPECT_EQ(enrol(registry, "one", "key1", 0), 6000);
     EXPECT_EQ(enrol(registry, "two", "key1", 0), 6001);
-    EXPECT_EQ(enrol(registry, "three", "key1", 0), refused(Enrolment::kTooMany));
+    EXPECT_EQ(enrol(registry, "three", "key1", 0), refused(Refusal::kTooMany));
     EXPECT_TRUE(registry.release("one"));
     EXPECT_EQ(enrol(registry, "three", "key2", 0), 6002);
     EXPECT_EQ(enrol(registry, "four", "key2", 0), 6000);
-    EXPECT_EQ(enrol(registry, "five", "key3", 0), refused(Enrolment::kFull));
+    EXPECT_EQ(enrol(registry, "five", "key3", 0), refused(Refusal::kFull));
 }
 
 TEST(AliasRegistry, IsTheSameAfterARestartAndRefusesRubbish) {
@@ -62,14 +59,14 @@ TEST(AliasRegistry, IsTheSameAfterARestartAndRefusesRubbish) {
         EXPECT_TRUE(registry.load()) << "a missing file is an empty registry";
         enrol(registry, "nas", "key1", 0);
         enrol(registry, "gone", "key2", 0);
-        registry.release("gone");
+        EXPECT_TRUE(registry.release("gone"));
     }
     struct stat status {};
     ASSERT_EQ(stat(kFile, &status), 0);
     EXPECT_EQ(status.st_mode & 0777U, 0600U);
     AliasRegistry registry(kFile, kLimits);
     ASSERT_TRUE(registry.load());
-    EXPECT_EQ(enrol(registry, "nas", "key2", 0), refused(Enrolment::kTaken));
+    EXPECT_EQ(enrol(registry, "nas", "key2", 0), refused(Refusal::kTaken));
     EXPECT_EQ(enrol(registry, "new", "key2", 0), 6002);
 
     std::ofstream(kFile) << "rubbish";
@@ -78,6 +75,6 @@ TEST(AliasRegistry, IsTheSameAfterARestartAndRefusesRubbish) {
     EXPECT_NE(refusedFile.error().text.find(kFile), std::string::npos);
     std::filesystem::remove(kFile);
     std::filesystem::create_directory(kFile);
-    EXPECT_EQ(enrol(registry, "more", "key3", 0), refused(Enrolment::kNotStored));
+    EXPECT_EQ(enrol(registry, "more", "key3", 0), refused(Refusal::kNotStored));
     EXPECT_EQ(registry.find("more"), nullptr) << "what is not stored does not hold";
 }

@@ -115,11 +115,11 @@ TEST_F(Login, SlowsGuessesDownWhileOthersAreServed) {
 TEST_F(Login, WritesNoSecretToTheLog) {
     const LogCapture log;
     addAccount("alice", false);
-    AccountStore().setTotp("alice", OvraPlatform::newTotpSecret());
+    EXPECT_TRUE(AccountStore().setTotp("alice", OvraPlatform::newTotpSecret()));
     login("alice", kPassword, "135790");
     login("alice", "another password");
     login("my password\ttyped here", "x");
-    AccountStore().clearTotp("alice");
+    EXPECT_TRUE(AccountStore().clearTotp("alice"));
     const Reply granted = login("alice", kPassword);
     ASSERT_EQ(granted.code(), 0);
     for (const std::string &secret :

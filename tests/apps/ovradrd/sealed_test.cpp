@@ -35,7 +35,9 @@ protected:
         outer.api = inner.api;
         outer.version = inner.version;
         outer.method = inner.method;
-        outer.sealed = sealRequest(keys->publicKey(), inner, time, replyKey);
+        const auto sealed = sealRequest(keys->publicKey(), inner, time).value();
+        outer.sealed = sealed.envelope;
+        replyKey = sealed.replyKey;
         return outer;
     }
     Reply post(const WireCall &outer) const {

@@ -271,7 +271,7 @@ TEST_F(CredRequestScene, DropsKeptConnectionsWhenTrustIsTakenBack) {
     call(server);
     call(server);
     const std::string endpoint = "https://127.0.0.1:" + std::to_string(server.port());
-    TrustStore().forget(endpoint);
+    EXPECT_TRUE(TrustStore().forget(endpoint));
     EXPECT_EQ(
         expectFingerprint("https", "127.0.0.1", server.port(), "SHA256:" + std::string(43, 'A')),
         TrustVerdict::kTrusted);

@@ -51,7 +51,9 @@ protected:
     static WireCall seal(const SealKeyPair &keys, const WireCall &call, UnixMillis time,
                          ReplyKey &replyKey) {
         WireCall outer{{call.api, call.version, call.method}};
-        outer.sealed = sealRequest(keys.publicKey(), call, time, replyKey);
+        const auto sealed = sealRequest(keys.publicKey(), call, time).value();
+        outer.sealed = sealed.envelope;
+        replyKey = sealed.replyKey;
         return outer;
     }
     SealVerdict open(const SealKeyPair &keys, const WireCall &outer) {
@@ -179,10 +181,10 @@ TEST(ReplayGuard, TakesWhatIsStampedWithinItsWindow) {
     time.pass(100'000);
     const UnixMillis now = guard.now();
     using V = ReplayGuard::Verdict;
-    EXPECT_EQ(guard.admit(now - ReplayGuard::kPast + 1, nonce(1)), V::kFresh);
-    EXPECT_EQ(guard.admit(now - ReplayGuard::kPast, nonce(2)), V::kStale);
-    EXPECT_EQ(guard.admit(now + ReplayGuard::kFuture, nonce(3)), V::kFresh);
-    EXPECT_EQ(guard.admit(now + ReplayGuard::kFuture + 1, nonce(4)), V::kStale);
+    EXPECT_EQ(guard.admit(now - ReplayGuard::kMaxPast + 1, nonce(1)), V::kFresh);
+    EXPECT_EQ(guard.admit(now - ReplayGuard::kMaxPast, nonce(2)), V::kStale);
+    EXPECT_EQ(guard.admit(now + ReplayGuard::kMaxFuture, nonce(3)), V::kFresh);
+    EXPECT_EQ(guard.admit(now + ReplayGuard::kMaxFuture + 1, nonce(4)), V::kStale);
 }
 
 TEST(ReplayGuard, TakesNothingFromBeforeItsStart) {
@@ -195,7 +197,7 @@ TEST(ReplayGuard, TakesNothingFromBeforeItsStart) {
 TEST(ReplayGuard, RefusesARepetitionAsLongAsItIsFreshAndAfterwards) {
     FakeTime time;
     ReplayGuard guard(time.clocks());
-    const UnixMillis stamp = kStart + ReplayGuard::kFuture;
+    const UnixMillis stamp = kStart + ReplayGuard::kMaxFuture;
     ASSERT_EQ(guard.admit(stamp, nonce(1)), ReplayGuard::Verdict::kFresh);
     for (int i = 0; i < 100; ++i) {
         time.pass(1000);

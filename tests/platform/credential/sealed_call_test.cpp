@@ -210,7 +210,7 @@ TEST_F(SealedCallScene, RefusesAnHttpEndpointWhoseKeyHasChanged) {
     EXPECT_EQ(call(), CredError::kCertificateChanged);
     EXPECT_EQ(peerFingerprint("http", "127.0.0.1", server->port(), 5).value().fingerprint,
               daemon_->fingerprint());
-    TrustStore().forget("http://127.0.0.1:" + std::to_string(server->port()));
+    EXPECT_TRUE(TrustStore().forget("http://127.0.0.1:" + std::to_string(server->port())));
     EXPECT_EQ(call(), CredError::kNone);
 }
 

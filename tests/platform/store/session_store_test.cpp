@@ -80,10 +80,10 @@ TEST_F(Sessions, EndAtTheirTimeAndAreThenSwept) {
     EXPECT_FALSE(store().find(timed));
     EXPECT_EQ(count(), 1U);
     bool walked = false;
-    store().removeIf([&](const SessionRecord &session) {
+    EXPECT_TRUE(store().removeIf([&](const SessionRecord &session) {
         walked = walked || session.id == timed;
         return false;
-    });
+    }));
     EXPECT_FALSE(walked);
     EXPECT_EQ(RawSqlite(file()).cell("SELECT count(*) FROM session"), "2");
     create("bob", 10);

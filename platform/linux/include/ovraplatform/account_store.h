@@ -63,20 +63,20 @@ public:
     static bool isName(std::string_view name);
 
     /// \param password  kMinPassword to kMaxPassword bytes; stays the caller's, to wipe
-    bool add(const std::string &name, std::string_view password, bool administrator);
-    bool setPassword(const std::string &name, std::string_view password);
-    bool setAdministrator(const std::string &name, bool administrator);
-    bool setDisabled(const std::string &name, bool disabled);
-    bool setRemoteLogin(const std::string &name, bool permitted);
+    [[nodiscard]] bool add(const std::string &name, std::string_view password, bool administrator);
+    [[nodiscard]] bool setPassword(const std::string &name, std::string_view password);
+    [[nodiscard]] bool setAdministrator(const std::string &name, bool administrator);
+    [[nodiscard]] bool setDisabled(const std::string &name, bool disabled);
+    [[nodiscard]] bool setRemoteLogin(const std::string &name, bool permitted);
     /// From now on a log-in needs a code made with `secret` (base32, see totp.h).
-    bool setTotp(const std::string &name, const std::string &secret);
-    bool clearTotp(const std::string &name);
-    bool remove(const std::string &name);
+    [[nodiscard]] bool setTotp(const std::string &name, const std::string &secret);
+    [[nodiscard]] bool clearTotp(const std::string &name);
+    [[nodiscard]] bool remove(const std::string &name);
 
     bool exists(const std::string &name) { return find(name).has_value(); }
-    std::optional<Account> find(const std::string &name);
+    [[nodiscard]] std::optional<Account> find(const std::string &name);
     /// Every account, by name.
-    bool list(std::vector<Account> &accounts);
+    [[nodiscard]] bool list(std::vector<Account> &accounts);
 
     /// Checks a log-in over the network. It takes as long for an account that does not exist as for
     /// a wrong password, and tells nothing about an account before the password is right. A code is
@@ -87,9 +87,9 @@ public:
                        std::string_view oneTimeCode);
 
 private:
-    bool checkPassword(std::string_view password);
-    bool setColumn(const char *sql, const std::string &name, std::int64_t value);
-    bool changedOne(const std::string &name);
+    [[nodiscard]] bool checkPassword(std::string_view password);
+    [[nodiscard]] bool setColumn(const char *sql, const std::string &name, std::int64_t value);
+    [[nodiscard]] bool changedOne(const std::string &name);
     LoginResult checkAccount(const std::string &name, const std::string &hash,
                              std::string_view oneTimeCode);
     LoginResult spendCode(const std::string &name, const std::string &secret, std::int64_t lastStep,

@@ -5,6 +5,7 @@
 #include "ovraplatform/export.h"
 
 #include <json/value.h>
+#include <tl/expected.hpp>
 
 #include <functional>
 #include <map>
@@ -88,7 +89,8 @@ private:
     using Versions = std::map<int, Entry>;
     using Methods = std::map<std::string, Versions>;
 
-    const Entry *find(const APICall &call, int &error) const;
+    /// The entry, or the error code that the call gets.
+    [[nodiscard]] tl::expected<const Entry *, int> find(const APICall &call) const;
 
     std::map<std::string, Methods> apis_;
 };

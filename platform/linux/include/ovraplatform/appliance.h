@@ -74,6 +74,6 @@ OVRAPLATFORM_EXPORT std::string settingProblem(const std::string &key, const std
 /// must be a directory of our own user that nobody else can write to.
 /// \param path  kStateDir, or a path that stands for it
 /// \return false, after an ERR log line that says what to do, when it cannot be used.
-OVRAPLATFORM_EXPORT bool ensureStateDir(const std::string &path = kStateDir);
+[[nodiscard]] OVRAPLATFORM_EXPORT bool ensureStateDir(const std::string &path = kStateDir);
 
 } // namespace OvraPlatform

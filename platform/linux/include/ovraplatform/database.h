@@ -32,9 +32,9 @@ public:
     Statement &bindOptional(int index, std::string_view text);
 
     /// \return true when there is a row; false at the end and on failure (Database::failed()).
-    bool step();
+    [[nodiscard]] bool step();
     /// Runs a statement that gives no row; false on failure.
-    bool run();
+    [[nodiscard]] bool run();
 
     std::string text(int column) const; ///< NULL reads as ""
     std::int64_t number(int column) const;
@@ -56,7 +56,9 @@ private:
 
 /// One connection to a store's SQLite file. Not shared between threads, nor kept across a fork.
 /// Everything fails, harmlessly, when the file could not be opened. A failure is remembered as one
-/// sentence that says what was wrong and what to do, and is logged once at ERR.
+/// sentence that says what was wrong and what to do, and is logged once at ERR. The stores built on
+/// it answer in the same way, false and error(), as SQLite does itself: a statement of several
+/// steps and a transaction of several statements have one failure, which belongs to the connection.
 class OVRAPLATFORM_EXPORT Database {
 public:
     /// Opens the file; makes it, mode 0600, and its folder (ensureStateDir()) when missing.
@@ -75,7 +77,7 @@ public:
     bool refuse(const std::string &sentence);
 
     Statement prepare(const char *sql);
-    bool execute(const char *sql);
+    [[nodiscard]] bool execute(const char *sql);
     /// Rows that the last statement changed.
     int changes() const;
 
@@ -86,10 +88,10 @@ private:
         void operator()(sqlite3 *database) const;
     };
 
-    bool makeFile();
-    bool setUp();
+    [[nodiscard]] bool makeFile();
+    [[nodiscard]] bool setUp();
     bool isOurs();
-    bool makeTables();
+    [[nodiscard]] bool makeTables();
     bool failSqlite(int code);
     void rollback();
     std::optional<std::int64_t> pragma(const char *sql);
@@ -110,7 +112,7 @@ public:
     ~Transaction();
 
     bool isOpen() const { return open_; }
-    bool commit();
+    [[nodiscard]] bool commit();
 
 private:
     Database &database_;

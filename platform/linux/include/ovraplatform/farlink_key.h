@@ -32,7 +32,9 @@ private:
 };
 
 /// Whether sign() of the key that belongs to `publicText` made the signature.
-OVRAPLATFORM_EXPORT bool verifyFarlink(const std::string &publicText, const std::string &alias,
-                                       const std::string &challenge, const std::string &signature);
+[[nodiscard]] OVRAPLATFORM_EXPORT bool verifyFarlink(const std::string &publicText,
+                                                     const std::string &alias,
+                                                     const std::string &challenge,
+                                                     const std::string &signature);
 
 } // namespace OvraPlatform

@@ -44,7 +44,7 @@ public:
 
     const PublicKey &publicKey() const { return public_; }
     /// The JSON object inside an envelope; nothing when it was not sealed to these keys.
-    std::optional<Json::Value> unseal(const std::string &envelope) const;
+    [[nodiscard]] std::optional<Json::Value> unseal(const std::string &envelope) const;
 
 private:
     SealKeyPair() = default;
@@ -65,10 +65,10 @@ using SealNonce = std::array<unsigned char, 16>;
 class OVRAPLATFORM_EXPORT ReplayGuard {
 public:
     /// How far behind this clock a request may be stamped: it is stamped before it connects.
-    static constexpr UnixMillis kPast = 60'000;
+    static constexpr UnixMillis kMaxPast = 60'000;
     /// How far ahead of it: what a clock that was just aligned may drift.
-    static constexpr UnixMillis kFuture = 10'000;
-    static constexpr std::size_t kCapacity = 65'536;
+    static constexpr UnixMillis kMaxFuture = 10'000;
+    static constexpr std::size_t kMaxSeen = 65'536;
 
     /// Where the time comes from: milliseconds of the system clock and of a steady one.
     struct Clocks {
@@ -80,7 +80,7 @@ public:
     ReplayGuard();
     /// \param capacity  how many requests are remembered; when more come within the window, the
     ///                  oldest are forgotten and everything as old as they were is stale
-    explicit ReplayGuard(Clocks clocks, std::size_t capacity = kCapacity);
+    explicit ReplayGuard(Clocks clocks, std::size_t capacity = kMaxSeen);
 
     /// Judges a request and remembers a fresh one.
     Verdict admit(UnixMillis time, const SealNonce &nonce);

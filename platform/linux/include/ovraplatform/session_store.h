@@ -71,29 +71,29 @@ public:
     static bool isData(const std::string &text);
 
     /// Makes a session. \return its id, 43 characters (256 random bits); nothing on failure.
-    std::optional<std::string> create(const SessionRequest &request);
+    [[nodiscard]] std::optional<std::string> create(const SessionRequest &request);
     /// The live session with this id. The time that it takes tells nothing about the ids that
     /// exist.
     std::optional<SessionRecord> find(const std::string &id);
     /// Every live session, the oldest first. \return false on failure.
-    bool list(std::vector<SessionRecord> &sessions);
+    [[nodiscard]] bool list(std::vector<SessionRecord> &sessions);
     /// Removes the session with this id. \return false on failure; one that is not there is
     /// removed.
-    bool remove(const std::string &id);
+    [[nodiscard]] bool remove(const std::string &id);
     /// Removes the expired sessions. \return false on failure.
-    bool sweep();
+    [[nodiscard]] bool sweep();
     /// Removes, together, the live sessions for which `test` answers true. `test` is called while
     /// the store is not locked: it may use the store itself.
     /// \return false on failure; nothing is removed then.
-    bool removeIf(const std::function<bool(const SessionRecord &)> &test);
+    [[nodiscard]] bool removeIf(const std::function<bool(const SessionRecord &)> &test);
 
 private:
     std::int64_t now() const;
-    bool checkRequest(const SessionRequest &request);
+    [[nodiscard]] bool checkRequest(const SessionRequest &request);
     std::optional<std::int64_t> count(const char *sql, const std::string &user);
-    bool removeExpired();
-    bool makeRoom(const SessionRequest &request);
-    bool insert(const SessionRequest &request, const std::string &id);
+    [[nodiscard]] bool removeExpired();
+    [[nodiscard]] bool makeRoom(const SessionRequest &request);
+    [[nodiscard]] bool insert(const SessionRequest &request, const std::string &id);
 
     Database database_;
     Clock clock_;

@@ -49,7 +49,7 @@ public:
     TrustVerdict pin(const std::string &endpoint, const std::string &fingerprint);
     /// Drops the key of the endpoint. \return false when the file could not be changed; an endpoint
     /// without a key is no failure.
-    bool forget(const std::string &endpoint);
+    [[nodiscard]] bool forget(const std::string &endpoint);
     /// Every pinned key in the order of the file; nothing when the file cannot be read.
     std::optional<std::vector<Entry>> list() const;
     /// For those who keep what they looked up: it holds while the stamp is the same.
@@ -59,7 +59,8 @@ private:
     struct Line;
 
     std::optional<std::vector<Line>> read() const;
-    bool write(const OvraBase::FileUpdate &file, const std::vector<Line> &lines) const;
+    [[nodiscard]] bool write(const OvraBase::FileUpdate &file,
+                             const std::vector<Line> &lines) const;
 
     std::string path_;
 };
