@@ -19,7 +19,7 @@ bool isAlphanumeric(char c) {
 /// The host in its one spelling, "" when it is none. What is left out keeps control characters,
 /// blanks, user parts, paths and escapes out of the URL.
 std::string normalizeHost(const std::string &host) {
-    const std::string ipv6 = OvraBase::normalizeIpv6(host);
+    std::string ipv6 = OvraBase::normalizeIpv6(host);
     if (!ipv6.empty()) {
         return ipv6;
     }

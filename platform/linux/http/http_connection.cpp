@@ -159,7 +159,7 @@ bool HttpConnection::setUp() {
         if (longer == nullptr) {
             return false;
         }
-        headers_.release();
+        static_cast<void>(headers_.release()); // it is part of the longer list
         headers_.reset(longer);
     }
     Options options(handle_.get());

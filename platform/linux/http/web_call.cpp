@@ -234,15 +234,16 @@ CredExpected<PublicKey> fetchSealKey(const Endpoint &endpoint, const WebCallOpti
     call.method = "getinfo";
     WebCallOptions plain = options;
     plain.upload.reset();
-    return callPlain(endpoint, call, plain)
-        .and_then([&endpoint](const WebReply &reply) -> CredExpected<PublicKey> {
-            const auto key = parsePublicKey(reply.response.getDataFieldtoStr("public_key"));
-            if (!key) {
-                OVRA_NOTICE("[%s] has no key to seal a request to", endpoint.key().c_str());
-                return tl::unexpected(CredError::kSealFailed);
-            }
-            return *key;
-        });
+    const CredExpected<WebReply> reply = callPlain(endpoint, call, plain);
+    if (!reply) {
+        return tl::unexpected(reply.error());
+    }
+    const auto key = parsePublicKey(reply->response.getDataFieldtoStr("public_key"));
+    if (!key) {
+        OVRA_NOTICE("[%s] has no key to seal a request to", endpoint.key().c_str());
+        return tl::unexpected(CredError::kSealFailed);
+    }
+    return *key;
 }
 
 CredExpected<WebReply> callWebAPI(const Endpoint &endpoint, const WireCall &call,

@@ -150,8 +150,8 @@ TEST_F(Pairing, EachRefusalHasItsExitCode) {
         {"info", R"({"success":true,"data":{"node_id":"x"}})", 1, 519},
         {"create", R"({"success":false,"error":{"code":105}})", 1, 509},
     };
+    RemoteNode refusing; // one for all: the port of another could be one whose key is known already
     for (const auto &each : cases) {
-        RemoteNode refusing;
         refusing.answer("login", R"({"success":true,"data":{"sid":"login-session"}})");
         refusing.answer("info", R"({"success":true,"data":{"node_id":"n","serial":"S"}})");
         refusing.answer(each.call, std::string(each.answer));
