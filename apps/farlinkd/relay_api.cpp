@@ -71,7 +71,7 @@ bool sameSecret(const std::string &a, const std::string &b) {
     return a.size() == b.size() && sodium_memcmp(a.data(), b.data(), a.size()) == 0;
 }
 
-/// The text of a parameter; "" when it is none, or too long to be one.
+/// The text of a parameter; "" if it is none, or too long to be one.
 std::string textOf(const Json::Value &params, const char *name) {
     std::string text = memberString(params, name);
     return text.size() <= kMaxText ? text : std::string();
@@ -108,7 +108,7 @@ bool RelayApi::openPort(const Alias &alias) {
 }
 
 void RelayApi::serve(OvraService::HttpRequest request, const Answer &answer) {
-    // std::function has to be copyable.
+    // std::function must be copyable.
     const auto held = std::make_shared<OvraService::HttpRequest>(std::move(request));
     if (!queue_.submit([this, held, answer] { handle(*held, answer); })) {
         answer(OvraDRCore::toString(

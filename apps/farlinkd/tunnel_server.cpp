@@ -276,7 +276,7 @@ void TunnelServer::Impl::setInterest(Socket &socket) const {
     epoll_ctl(epoll.get(), EPOLL_CTL_MOD, socket.fd.get(), &event);
 }
 
-/// Writes what waits for this end; false when the end is gone.
+/// Writes what waits for this end; false if the end is gone.
 bool TunnelServer::Impl::flush(Socket &to) {
     while (to.written < to.out.size()) {
         const ssize_t size =

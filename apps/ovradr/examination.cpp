@@ -170,7 +170,7 @@ private:
                                                          : trustText(peer));
     }
 
-    /// An endpoint of this appliance has to show the key that is in its file.
+    /// An endpoint of this appliance must show the key that is in its file.
     Expected<std::string> expectedKey(const PeerIdentity &peer) {
         if (peer.fingerprint != subject_.fingerprint) {
             return failure(ExitCode::kCertificate,

@@ -24,13 +24,13 @@ struct Settings {
 /// The whole daemon: web server, local socket, queues and handlers. One a process.
 class Daemon {
 public:
-    /// How long calls under way may go on once the daemon is to stop.
+    /// How long calls in progress may go on once the daemon is to stop.
     static constexpr std::chrono::milliseconds kGrace{2500};
 
     explicit Daemon(Settings settings);
     Daemon(const Daemon &) = delete;
     Daemon &operator=(const Daemon &) = delete;
-    /// Stops, and waits for the calls that are still under way.
+    /// Stops, and waits for the calls still in progress.
     ~Daemon();
 
     /// Takes what `ovradr setup` made, binds the ports and begins to serve.
@@ -39,12 +39,13 @@ public:
     int httpsPort() const;
     int httpPort() const;
 
-    /// What has to be done every few seconds: sweeps expired sessions and has pending releases
-    /// tried. Returns at once.
+    /// What must be done every few seconds: sweeps expired sessions and has pending releases tried.
+    /// Returns at once.
     void doPeriodicWork();
 
-    /// Ends serving: calls under way get kGrace, then their callers are told that the daemon stops.
-    /// \return false when calls still run (they wait for another appliance): the process may then
+    /// Ends serving: calls in progress get kGrace, then their callers are told that the daemon
+    /// stops.
+    /// \return false if calls still run (they wait for another appliance): the process may then
     ///         only leave with _exit(2), at once.
     bool stop();
 

@@ -85,7 +85,7 @@ struct FarlinkAgent::State {
     Status status;
     std::function<void(OvraService::ConnectedClient)> take; ///< empty once it stops
 
-    /// Waits; false when the agent is to stop.
+    /// Waits; false if the agent is to stop.
     bool pause(std::chrono::seconds time) {
         std::unique_lock lock(mutex);
         return !changed.wait_for(lock, time, [this] { return stopping; });
@@ -153,7 +153,7 @@ public:
     }
 
     const FarlinkAgent::Status &status() const { return status_; }
-    /// The lease of the alias has to be renewed now and then.
+    /// The lease of the alias must be renewed now and then.
     bool isOver() const { return std::chrono::steady_clock::now() >= renewAt_; }
 
     /// Waits for callers and connects to each of them.

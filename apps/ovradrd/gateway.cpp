@@ -80,7 +80,7 @@ Gateway::Gateway(const OvraPlatform::APIRegistry &registry, const OvraPlatform::
 
 void Gateway::serve(OvraService::HttpRequest request,
                     const OvraService::HttpServer::Answer &answer) {
-    // std::function has to be copyable.
+    // std::function must be copyable.
     const auto held = std::make_shared<OvraService::HttpRequest>(std::move(request));
     const bool taken = queues_.quick.submit([this, held, answer] {
         Call call;
@@ -113,7 +113,7 @@ void Gateway::open(Call &call, std::string &body) {
     }
 }
 
-/// Puts the sealed call in the place of the visible one; false when it was refused.
+/// Puts the sealed call in the place of the visible one; false if it was refused.
 bool Gateway::unseal(Call &call) {
     const bool sealed = !call.wire.sealed.empty();
     if (!sealed) {
@@ -138,7 +138,7 @@ bool Gateway::unseal(Call &call) {
     return true;
 }
 
-/// Finds out who calls; false when it was refused. A session that is not known is a caller without
+/// Finds out who calls; false if it was refused. A session that is not known is a caller without
 /// one.
 bool Gateway::admit(Call &call) {
     if (call.wire.sid.empty()) {

@@ -30,7 +30,7 @@ struct WorkQueues {
 /// choose the queue, run the handler, seal the reply.
 class Gateway {
 public:
-    /// Everything has to outlive the gateway and the jobs in the queues.
+    /// Everything must outlive the gateway and the jobs in the queues.
     Gateway(const OvraPlatform::APIRegistry &registry, const OvraPlatform::SealKeyPair &keys,
             OvraPlatform::ReplayGuard &guard, LoginApi &api, WorkQueues &queues);
     Gateway(const Gateway &) = delete;
@@ -43,7 +43,7 @@ public:
     /// reply. Safe for threads.
     Json::Value serveLocal(const OvraPlatform::LocalCall &call);
 
-    /// Nobody waits for local calls under way any more; they are answered with a refusal.
+    /// Nobody waits for local calls in progress any more; they are answered with a refusal.
     void leaveLocal() { leaving_ = true; }
 
 private:

@@ -16,8 +16,8 @@ namespace Ovradrd {
 /// 8 s. A minute takes one failure back.
 ///
 /// Log-ins that come at once get places behind each other, so that many connections guess no faster
-/// than one; who would have to wait longer than kMaxWait is turned away. Nothing is kept when
-/// the process ends. All operations are safe for threads.
+/// than one; who would must wait longer than kMaxWait is turned away. Nothing is kept when the
+/// process ends. All operations are safe for threads.
 class LoginThrottle {
 public:
     using TimePoint = std::chrono::steady_clock::time_point;

@@ -13,9 +13,9 @@ namespace Ovradrd {
 /// in the file system: "/webman/modules/ovradr/" + "/usr/ovra/var/ovradr/speedtest/speed-...".
 inline constexpr std::string_view kTestFilesUrl = "/webman/modules/ovradr/";
 
-/// Opens the file that a URL path names; nothing when it is any other path. Only the names that
+/// Opens the file that a URL path names; std::nullopt if it is any other path. Only the names that
 /// scripts/TestSyncSpeed.sh gives, in its one folder, are opened, no link is followed, and the file
-/// has to be a regular one of our own user: whatever the URL says, nothing else is reached.
+/// must be a regular one of our own user: whatever the URL says, nothing else is reached.
 /// \param path  as it is once its escapes were resolved
 [[nodiscard]] std::optional<OvraService::ServedFile> openTestFile(std::string_view path);
 

@@ -13,7 +13,7 @@ struct TimezoneFiles {
 
 /// The IANA name of the machine's time zone, e.g. "Europe/Zurich": from the environment variable
 /// TZ, the link, or the file, in that order, as the C library finds the zone itself (tzset(3));
-/// "Etc/UTC" when none is set. "" when a zone is set whose name cannot be told.
+/// "Etc/UTC" if none is set. "" if a zone is set whose name cannot be told.
 std::string localTimezone(const TimezoneFiles &files = {});
 
 } // namespace Ovradrd

@@ -23,13 +23,13 @@ struct ServerNames {
 
 /// Makes a certificate for the key, signed by itself and good for ten years (PEM, mode 0644), or
 /// checks that the one that is there belongs to the key. Who connects trusts the key, not the
-/// names: one that is there stays also when the appliance has got another name.
+/// names: one that is there stays even if the appliance has got another name.
 /// \return whether this call made it
 [[nodiscard]] OvraBase::Expected<bool>
 createCertificate(const std::string &path, const std::string &keyPath, const ServerNames &names);
 
 /// The fingerprint of the certificate's public key as those who connect see it ("SHA256:..."); ""
-/// when the file holds none.
+/// if the file holds none.
 std::string certificateFingerprint(const std::string &path);
 
 } // namespace OvraService

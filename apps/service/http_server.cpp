@@ -503,7 +503,7 @@ OvraBase::Expected<void> HttpServer::start(std::vector<Listener> https, std::vec
 void HttpServer::adopt(ConnectedClient client) {
     for (const auto &endpoint : impl_->endpoints) {
         if (endpoint->secure) {
-            // The library closes it, also when it does not take it.
+            // The library closes it, even if it does not take it.
             MHD_add_connection(endpoint->daemon.get(), client.fd.release(),
                                reinterpret_cast<const sockaddr *>(&client.address), client.size);
             return;

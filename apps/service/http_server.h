@@ -42,10 +42,10 @@ struct ServedFile {
 /// Files that a program serves beside the web API.
 struct FileSource {
     std::string prefix; ///< of the URL paths that it is asked for
-    /// Opens the file that a URL path names, its escapes resolved; nothing when there is none.
+    /// Opens the file that a URL path names, its escapes resolved; std::nullopt if there is none.
     std::function<std::optional<ServedFile>(std::string_view path)> open;
     std::size_t atOnce = 0; ///< how many are sent at the same time
-    std::string absentText; ///< what clients are told when there is no such file
+    std::string absentText; ///< what clients are told if there is no such file
     std::string busyText;   ///< and when as many as may be are being sent
 };
 
@@ -78,16 +78,16 @@ public:
     ~HttpServer();
 
     /// Begins to serve on the sockets.
-    /// \param identity  for those that speak TLS; has to live as long as the server does
+    /// \param identity  for those that speak TLS; must live as long as the server does
     [[nodiscard]] OvraBase::Expected<void>
     start(std::vector<Listener> https, std::vector<Listener> http, const TlsIdentity &identity);
     /// Serves a client that is connected already, as one of the https sockets. In any thread while
     /// the server is started and not stopped.
     void adopt(ConnectedClient client);
-    /// Takes no further connections and refuses further requests; those under way go on.
+    /// Takes no further connections and refuses further requests; those in progress go on.
     void quiesce();
-    /// Ends every request still under way with a refusal, gives the replies half a second to leave,
-    /// and closes all connections.
+    /// Ends every request still in progress with a refusal, gives the replies half a second to
+    /// leave, and closes all connections.
     void stop();
 
 private:

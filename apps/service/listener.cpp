@@ -44,7 +44,7 @@ int portOf(int fd) {
     return ntohs(reinterpret_cast<const sockaddr_in *>(&address.storage)->sin_port);
 }
 
-/// An open socket at the place; none, and errno says why, when it cannot be.
+/// An open socket at the place; none, and errno says why, if it cannot be.
 /// \param bothFamilies  an IPv6 socket takes IPv4 clients too
 UniqueFd listenAt(const SocketAddress &place, bool bothFamilies) {
     UniqueFd fd(socket(place.storage.ss_family, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));

@@ -17,7 +17,7 @@ public:
         : most_(most)
         , period_(period) {}
 
-    /// Counts one event; false when there were too many, and then it does not count.
+    /// Counts one event; false if there were too many, and then it does not count.
     [[nodiscard]] bool allow(const std::string &address, TimePoint now) {
         if (windows_.size() >= kMaxAddresses) {
             forgetOld(now);

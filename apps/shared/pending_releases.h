@@ -15,8 +15,8 @@ namespace OvraApps {
 /// Mode 0600: it holds sessions. docs/files.md describes it.
 inline constexpr char kPendingReleasesFile[] = "/usr/ovra/var/ovradr/releases.db";
 
-/// By which both nodes name a session to people: 16 hexadecimal digits of its SHA-256. It opens
-/// nothing.
+/// By which both nodes name a session to people: 16 hexadecimal digits of its SHA-256. It grants no
+/// access.
 std::string referenceOf(const std::string &session);
 
 /// A session on another node that nothing needs any more and that perhaps is still there.
@@ -48,11 +48,11 @@ public:
 
     using Clock = std::function<std::time_t()>;
 
-    /// Opens the store; makes file and folder when missing.
+    /// Opens the store; creates the file and its folder if missing.
     explicit PendingReleases(const std::string &path = kPendingReleasesFile, Clock clock = {});
 
     bool isOpen() const { return database_.isOpen(); }
-    /// Why the last operation failed, in sentences; "" when it did not.
+    /// Why the last operation failed; "" if it succeeded.
     const std::string &error() const { return database_.error(); }
 
     /// Remembers a release before its flow begins, so that a flow that is killed leaves it noted.

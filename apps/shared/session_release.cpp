@@ -24,7 +24,7 @@ Release left(int code, const Json::Value &detail = Json::Value()) {
     return {Release::State::kLeft, code, detail, false};
 }
 
-/// What is the case now; nothing when the session is accepted and no credential uses it.
+/// What is the case now; std::nullopt if the session is accepted and no credential uses it.
 /// \param whenGone  how a session that is gone counts
 std::optional<Release> look(const Conn &conn, const std::string &session,
                             const std::string &exceptCredId, Release::State whenGone) {

@@ -37,10 +37,10 @@ struct ReleasingFlow {
     Release release;
 };
 
-/// Runs a flow of the library that makes the session of `record` superfluous, releasing it where
-/// it can, and finds out what became of the session, which the flow itself does not tell. The
-/// release is noted before the flow and stays noted when it did not come about, also when this
-/// process is killed on the way; memory that cannot be written stops nothing.
+/// Runs a flow of the library that makes the session of `record` superfluous, releasing it where it
+/// can, and finds out what became of the session, which the flow itself does not tell. The release
+/// is noted before the flow and stays noted when it did not come about, even if this process is
+/// killed on the way; memory that cannot be written stops nothing.
 ///
 /// \param conn  the endpoint over which the flow releases
 ReleasingFlow runReleasing(const OvraDRNode::DRNode &record, const OvraDRNode::Conn &conn,

@@ -68,7 +68,7 @@ Outcome reportUpdate(const DRNode &before, const std::string &account,
         report.text += "The other appliance granted the same session as before.\n";
     } else {
         addRelease(report.data, result.release);
-        report.text += "The session of before: " + printable(releaseText(result.release, false)) +
+        report.text += "The previous session: " + printable(releaseText(result.release, false)) +
                        (result.release.state == OvraApps::Release::State::kLeft ? "\n" : ".\n");
     }
     return report;

@@ -31,7 +31,7 @@ struct ReverseOptions {
     bool dryRun = false;
 };
 
-/// The daemon of this appliance has to run, and the account has to be one that may grant sessions.
+/// The daemon of this appliance must run, and the account must be one that may grant sessions.
 Expected<void> checkAccount(const std::string &account) {
     const OvraDRCore::Response answer =
         OvraDRNode::BaseSender::run(OvraDRNode::WebAPI::OvraCoreUserGetAPI(account));

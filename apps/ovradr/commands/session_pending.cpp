@@ -36,7 +36,7 @@ Json::Value toJson(const PendingRelease &release) {
 }
 
 std::vector<std::string> toRow(const PendingRelease &release) {
-    // Noted by a command that is still under way, or was killed.
+    // Noted by a command that is still in progress, or was killed.
     const bool fresh = release.attempts == 0;
     return {release.reference(),
             release.nodeId,

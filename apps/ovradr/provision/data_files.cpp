@@ -17,7 +17,7 @@ constexpr const char *kDataFolder = "ovradrnode";
 /// Where the library runs them.
 constexpr const char *kScriptFolder = "/usr/ovra/ovradr/sbin";
 
-/// Makes `path` a link to `target`; true when it was none before.
+/// Makes `path` a link to `target`; true if it was none before.
 Expected<bool> linkTo(const std::string &target, const fs::path &path) {
     std::error_code error;
     if (fs::read_symlink(path, error) == target || fs::is_regular_file(fs::symlink_status(path))) {

@@ -26,13 +26,13 @@ public:
     static bool isLogin(const OvraPlatform::APICall &call);
 
     /// Asks for a log-in with these parameters from this address.
-    /// \return how long it has to wait; nothing: refuse it.
+    /// \return how long it must wait; nothing: refuse it.
     std::optional<std::chrono::milliseconds> admit(const Json::Value &params,
                                                    const std::string &address);
     /// The log-in that was admitted is not carried out after all.
     void forgive(const Json::Value &params, const std::string &address);
 
-    /// Registers the methods; the api has to outlive the registry.
+    /// Registers the methods; the api must outlive the registry.
     void addTo(OvraPlatform::APIRegistry &registry);
 
 private:

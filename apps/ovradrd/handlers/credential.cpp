@@ -39,7 +39,7 @@ Json::Value noSuchCredential() {
     return apiError(ERR::kCredNotFound, "this node has no such credential: list those that it has");
 }
 
-/// Where other nodes reach this one; an error reply in `refusal` when there is no such place.
+/// Where other nodes reach this one; an error reply in `refusal` if there is no such place.
 std::vector<Conn> localConns(Json::Value &refusal) {
     std::vector<Conn> conns = DRNode::getLocalConn();
     if (conns.empty()) {
@@ -76,7 +76,7 @@ Json::Value addReverse(Json::Value data, const std::string &credId, const APICal
 }
 
 /// Makes the credential, unless it would be one to this node itself.
-/// \return an error reply; null when it was made
+/// \return an error reply; null if it was made
 Json::Value carryOut(OvraDRNode::CredCreate &flow, const Proof &proof) {
     if (!proof.giveTo(flow) || !flow.getRemoteNodeInfo()) {
         return flowError(flow, ERR::kCredIncomplete);
@@ -157,7 +157,7 @@ void appendRecords(Json::Value &list, const std::string &nodeId, DRNodeDB::CredT
     }
     for (const DRNode &record : records) {
         Json::Value entry = record.toJson();
-        // By which the node that granted it names the session; it opens nothing.
+        // By which the node that granted it names the session; it grants no access.
         entry["session_reference"] = OvraApps::referenceOf(record.session);
         entry["temporary"] = type == DRNodeDB::CRED_TYPE_TEMP;
         list.append(entry);
@@ -184,7 +184,7 @@ Json::Value list(const Json::Value &params, const APICaller & /*caller*/) {
 }
 
 /// A new log-in, perhaps over another endpoint, for an existing credential.
-/// \param dryRun  whether it only has to be tried
+/// \param dryRun  whether it only must be tried
 Json::Value set(const Json::Value &params, bool dryRun) {
     Params in(params);
     const std::string credId = readCredId(in);

@@ -10,14 +10,14 @@
 /// rights and replies.
 namespace Ovradrd {
 
-/// "OVRA.Core.Encryption": the key that requests are sealed to. \param keys, guard  have to outlive
+/// "OVRA.Core.Encryption": the key that requests are sealed to. \param keys, guard  must outlive
 /// the registry
 void addEncryptionAPI(OvraPlatform::APIRegistry &registry, const OvraPlatform::SealKeyPair &keys,
                       OvraPlatform::ReplayGuard &guard);
 /// "OVRA.Core.User": accounts of the appliance.
 void addUserAPI(OvraPlatform::APIRegistry &registry);
-/// "OVRA.Core.Farlink": how this appliance is reached through the relay service. \param agent  has
-/// to outlive the registry
+/// "OVRA.Core.Farlink": how this appliance is reached through the relay service. \param agent  must
+/// outlive the registry
 void addFarlinkAPI(OvraPlatform::APIRegistry &registry, const FarlinkAgent &agent);
 /// "OVRA.DR.Node": facts about this node, and tests.
 void addNodeAPI(OvraPlatform::APIRegistry &registry);

@@ -28,7 +28,7 @@ public:
     static constexpr std::size_t kMaxPassword = 1024;
     static constexpr std::size_t kMaxCode = 64; ///< of a one-time code
 
-    /// \param params  an object; has to outlive this
+    /// \param params  an object; must outlive this
     explicit Params(const Json::Value &params)
         : params_(params) {}
 
@@ -36,7 +36,7 @@ public:
 
     /// 1 to `longest` bytes without control characters.
     std::string text(const char *name, std::size_t longest);
-    /// As text(), or "" when it is absent or empty.
+    /// As text(), or "" if it is absent or empty.
     std::string optionalText(const char *name, std::size_t longest);
     /// A whole number from 0.
     int number(const char *name);
@@ -44,7 +44,7 @@ public:
     std::string word(const char *name, const std::vector<std::string> &words);
     /// 1 to `longest` bytes, none of them NUL; error texts never repeat it.
     OvraBase::Secret secret(const char *name, std::size_t longest);
-    /// As secret(), or "" when it is absent or empty.
+    /// As secret(), or "" if it is absent or empty.
     std::string optionalSecret(const char *name, std::size_t longest);
     /// An array of at most `most` texts; none when it is absent.
     std::vector<std::string> optionalTexts(const char *name, std::size_t most, std::size_t longest);
@@ -58,7 +58,7 @@ public:
     Json::Value object(const char *name);
 
     /// Remembers that a parameter which was read cannot be used after all.
-    /// \param text  what it has to be; never a value of it
+    /// \param text  what it must be; never a value of it
     void refuse(const std::string &name, const std::string &text);
 
     bool ok() const { return error_.isNull(); }

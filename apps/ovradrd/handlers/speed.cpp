@@ -41,7 +41,7 @@ Bounds boundsIn(Params &in) {
 }
 
 /// The URL as a download takes it: an alias of the relay service is replaced by where it is reached
-/// now, and a bare IPv6 address gets its brackets. "" when it is no URL of a test.
+/// now, and a bare IPv6 address gets its brackets. "" if it is no URL of a test.
 std::string downloadableUrl(const std::string &url) {
     const std::size_t host = url.find(kSchemeEnd);
     const std::size_t path = host == std::string::npos ? host : url.find('/', host + 3);

@@ -22,7 +22,7 @@ struct KeyFileKind {
 [[nodiscard]] OvraBase::Expected<void> readKeyFile(const std::string &path, const KeyFileKind &kind,
                                                    unsigned char *key);
 
-/// Makes the file, whole and durable. One that is there stays as it is, also when another process
+/// Makes the file, whole and durable. One that is there stays as it is, even if another process
 /// makes it at the same time; that is no failure.
 [[nodiscard]] OvraBase::Expected<void>
 createKeyFile(const std::string &path, const KeyFileKind &kind, const unsigned char *key);

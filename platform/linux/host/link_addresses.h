@@ -17,7 +17,7 @@ struct LinkAddress {
     std::string address;    ///< numeric text, without a scope
 };
 
-/// What the kernel has now, in its order; empty when it cannot be asked.
+/// What the kernel has now, in its order; empty if it cannot be asked.
 std::vector<LinkAddress> listLinkAddresses();
 
 /// Of these addresses the ones at which the appliance is reached, IPv4 before IPv6: all that are
@@ -27,7 +27,7 @@ std::vector<LinkAddress> listLinkAddresses();
 std::vector<OLIBNetInterface> selectAddresses(const std::vector<LinkAddress> &links,
                                               const ApplianceConfig &config, int selector);
 
-/// The local IPv4 address of the PPP link `pppUNIT`; "" when it is not up, or when the appliance
+/// The local IPv4 address of the PPP link `pppUNIT`; "" if it is not up, or when the appliance
 /// serves at certain addresses only (what selectAddresses() gives is then all there is).
 std::string pppAddress(const std::vector<LinkAddress> &links, const ApplianceConfig &config,
                        int unit);

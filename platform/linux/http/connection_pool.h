@@ -37,7 +37,7 @@ public:
     void keep(const Endpoint &endpoint, const TrustStore::Stamp &trust,
               std::unique_ptr<HttpConnection> connection);
 
-    /// A socket that a forked child closes; -1 when there is none to be had.
+    /// A socket that a forked child closes; -1 if there is none to be had.
     int openSocket(int family, int type, int protocol);
     void closeSocket(int fd);
 

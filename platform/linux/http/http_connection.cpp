@@ -58,8 +58,8 @@ struct FreeMime {
 };
 using Mime = std::unique_ptr<curl_mime, FreeMime>;
 
-/// How many bytes the peer's kernel has acknowledged on this connection (tcp(7), RFC 4898); nothing
-/// when this kernel does not tell.
+/// How many bytes the peer's kernel has acknowledged on this connection (tcp(7), RFC 4898);
+/// std::nullopt if this kernel does not tell.
 std::optional<std::uint64_t> deliveredBytes(int socket) {
     tcp_info info{};
     socklen_t size = sizeof(info);
@@ -104,7 +104,7 @@ bool isRegularFile(const std::string &path) {
     return stat(path.c_str(), &status) == 0 && S_ISREG(status.st_mode);
 }
 
-/// The form of an upload; null when there is no memory or the file cannot be read.
+/// The form of an upload; null if there is no memory or the file cannot be read.
 Mime makeForm(CURL *handle, const std::vector<std::pair<std::string, std::string>> &fields,
               const Upload &upload) {
     Mime form(curl_mime_init(handle));
@@ -355,7 +355,7 @@ CURLcode HttpConnection::onTlsContext(CURL *, void *context, void *self) {
 
 /// Called when a connection is ready (TLS included) and before anything of the request is sent.
 ///
-/// libcurl repeats a request by itself when a kept connection ends without an answer, also when the
+/// libcurl repeats a request by itself when a kept connection ends without an answer, even if the
 /// peer may have carried it out. Here it is repeated only when the peer's kernel had acknowledged
 /// none of its bytes, and not when the peer fell silent.
 int HttpConnection::onRequest(void *self, char *, char *, int, int) {

@@ -46,7 +46,7 @@ public:
         kObserve,  ///< the certificate is judged but passes anyway; nothing is sent
     };
 
-    /// Null when there is no memory.
+    /// Null if there is no memory.
     [[nodiscard]] static std::unique_ptr<HttpConnection> open(const Endpoint &endpoint,
                                                               Purpose purpose);
     HttpConnection(const HttpConnection &) = delete;

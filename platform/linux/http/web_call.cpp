@@ -42,7 +42,7 @@ CredExpected<std::string> bodyOf(HttpAnswer answer) {
     return tl::unexpected(denied ? CredError::kNoPermission : CredError::kHttpStatus);
 }
 
-/// One post to the entry point, over a kept connection when there is one.
+/// One post to the entry point, over a kept connection if there is one.
 CredExpected<std::string> post(const Endpoint &endpoint, const WireCall &call,
                                const WebCallOptions &options) {
     const auto url = endpoint.url(kEntryPoint);
@@ -76,7 +76,7 @@ CredExpected<WebReply> callPlain(const Endpoint &endpoint, const WireCall &call,
     return post(endpoint, call, options).and_then(readReply);
 }
 
-/// Over plain http the key itself has to be the one that was met first.
+/// Over plain http the key itself must be the one that was met first.
 CredExpected<void> judgeSealKey(const Endpoint &endpoint, const PublicKey &key) {
     TrustStore store;
     const std::string fingerprint = fingerprintOf(key);
@@ -146,7 +146,7 @@ public:
     }
 
 private:
-    /// The end of the call, or nothing when it has to be sent once more.
+    /// The end of the call, or std::nullopt if it must be sent once more.
     using Ending = std::optional<CredExpected<WebReply>>;
 
     CredExpected<void> findKey() {

@@ -22,7 +22,7 @@ constexpr std::size_t kMinAlias = 3;
 constexpr std::size_t kMaxAlias = 63;
 constexpr std::chrono::seconds kAnswerTime{10};
 
-/// "" when the file has no such line.
+/// "" if the file has no such line.
 std::string setting(const char *key) {
     std::array<char, 300> value{};
     const int length =

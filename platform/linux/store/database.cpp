@@ -204,7 +204,7 @@ bool Database::isOurs() {
            pragma("PRAGMA application_id") == layout_.applicationId;
 }
 
-/// \return false also when the file has somebody else's tables.
+/// \return false even if the file has somebody else's tables.
 bool Database::makeTables() {
     Transaction transaction(*this);
     if (!transaction.isOpen()) {

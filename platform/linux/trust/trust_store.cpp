@@ -33,7 +33,7 @@ bool isEndpoint(const std::string &text) {
 
 } // namespace
 
-/// A line as it stands in the file, and what it says when it is one of ours.
+/// A line as it stands in the file, and what it says if it is one of ours.
 struct TrustStore::Line {
     std::string text;
     std::optional<Entry> entry;

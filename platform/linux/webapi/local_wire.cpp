@@ -27,7 +27,7 @@ int millisecondsUntil(Deadline deadline) {
     return static_cast<int>(std::clamp<std::int64_t>(left, 0, kMaxMilliseconds));
 }
 
-/// Waits until `fd` is ready for `events`; false when the time is over or `stop` is readable.
+/// Waits until `fd` is ready for `events`; false if the time is over or `stop` is readable.
 bool waitFor(int fd, short events, Deadline deadline, int stop) {
     std::array<pollfd, 2> fds{{{fd, events, 0}, {stop, POLLIN, 0}}};
     for (;;) {
