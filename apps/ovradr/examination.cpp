@@ -209,7 +209,7 @@ private:
         return "as " + subject_.login->account;
     }
 
-    /// Any answer but that the session is unknown shows that it is known.
+    /// Any answer other than an unknown session shows that it is known.
     Expected<std::string> session() {
         sender_ = std::make_unique<OvraDRNode::CredNodeSender>(*subject_.cred);
         info_ = sender_->process(WebAPI::getDRNodeInfoAPI({}));

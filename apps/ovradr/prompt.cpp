@@ -68,7 +68,7 @@ public:
         }
     }
     bool works() const { return changed_; }
-    /// False when a signal came instead.
+    /// False if a signal came instead.
     bool waitForInput() const {
         pollfd input{STDIN_FILENO, POLLIN, 0};
         while (ppoll(&input, 1, nullptr, &mask_) < 0 && errno == EINTR) {

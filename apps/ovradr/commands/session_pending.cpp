@@ -81,7 +81,7 @@ Outcome forget(PendingReleases &store, const std::vector<PendingRelease> &releas
     return report;
 }
 
-/// Tries each once, whatever its next time is, and tells what became of it.
+/// Tries each once, even if not due, and reports the result.
 Report retry(PendingReleases &store, const std::vector<PendingRelease> &releases) {
     Report report;
     report.data["tried"] = Json::Value(Json::arrayValue);

@@ -112,7 +112,7 @@ Expected<bool> fill(sqlite3 *database, const std::string &path, const std::strin
     return execute(database, "COMMIT") ? Expected<bool>(empty) : sqliteFailure(path, database);
 }
 
-/// SQLite would make a file that others can read.
+/// SQLite would create a file readable by others.
 Expected<void> touchPrivate(const std::string &path) {
     const OvraBase::UniqueFd fd(open(path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0600));
     if (!fd) {

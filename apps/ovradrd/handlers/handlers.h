@@ -6,8 +6,8 @@
 #include <ovraplatform/api_registry.h>
 #include <ovraplatform/sealed_box.h>
 
-/// What the daemon answers, one function a family of calls. docs/ovradrd.md lists parameters,
-/// rights and replies.
+/// The daemon's calls, one function per family. docs/ovradrd.md lists parameters, rights and
+/// replies.
 namespace Ovradrd {
 
 /// "OVRA.Core.Encryption": the key that requests are sealed to. \param keys, guard  must outlive

@@ -8,7 +8,7 @@
 
 namespace OvraPlatform {
 
-/// Where a machine says who it is.
+/// Where a machine's identity is found.
 struct HostFiles {
     std::string serial = "/sys/class/dmi/id/product_serial"; ///< readable for root only
     std::vector<std::string> machineIds = {"/etc/machine-id", "/var/lib/dbus/machine-id"};
@@ -16,7 +16,7 @@ struct HostFiles {
 
 /// The serial number: the configured one; else the one in the firmware, unless it is one of the
 /// texts that makers leave there for lack of a number; else an id of 24 hexadecimal digits made
-/// from the machine id, which itself must not be published (machine-id(5)) and cannot be had back
+/// from the machine id, which itself must not be published (machine-id(5)) and cannot be recovered
 /// from it. "" if the machine has none of them.
 std::string serialNumber(const ApplianceConfig &config, const HostFiles &files = {});
 

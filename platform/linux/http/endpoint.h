@@ -17,7 +17,7 @@ public:
     /// an
     ///                  IPv6 address with or without brackets
     /// \param port      1 to 65535
-    /// \return nothing if one of them is something else.
+    /// \return std::nullopt if one of them is something else.
     [[nodiscard]] static std::optional<Endpoint> make(const std::string &protocol,
                                                       const std::string &host, int port);
 

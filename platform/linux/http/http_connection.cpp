@@ -23,7 +23,7 @@ namespace {
 /// connection.
 constexpr char kCertificateDir[] = "/etc/ssl/certs";
 constexpr long kConnectMillis = 10'000;
-/// A peer whose kernel says nothing for so long is gone, however long the answer may take.
+/// A peer whose kernel is silent for this long is gone, however long the answer may take.
 constexpr unsigned kSilenceMillis = 10'000;
 constexpr int kKeepAliveSeconds = 3;
 constexpr std::size_t kMaxHeader = std::size_t{64} * 1024;
@@ -196,7 +196,7 @@ bool HttpConnection::setUp() {
             .set(CURLOPT_SSL_SESSIONID_CACHE, 0L)
             .set(CURLOPT_FORBID_REUSE, 1L);
     } else {
-        // The judge replaces libcurl's check of the chain, and checks the host as well.
+        // The verifier replaces libcurl's check of the chain, and checks the host as well.
         options.set(CURLOPT_SSL_VERIFYPEER, 1L)
             .set(CURLOPT_SSL_VERIFYHOST, 0L)
             .set(CURLOPT_SSL_CTX_FUNCTION, &HttpConnection::onTlsContext)

@@ -41,9 +41,9 @@ struct Upload {
 class HttpConnection {
 public:
     enum class Purpose {
-        kRequests, ///< the certificate is judged, new keys are pinned, the connection is kept
-        kProbe,    ///< the certificate is not looked at; nothing secret may be sent
-        kObserve,  ///< the certificate is judged but passes anyway; nothing is sent
+        kRequests, ///< the certificate is verified, new keys are pinned, the connection is kept
+        kProbe,    ///< the certificate is not checked; nothing secret may be sent
+        kObserve,  ///< the certificate is verified but passes anyway; nothing is sent
     };
 
     /// Null if there is no memory.

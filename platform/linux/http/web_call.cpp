@@ -23,7 +23,7 @@ constexpr long kHttpForbidden = 403;
 constexpr long kHttpNotFound = 404;
 constexpr long kHttpServerError = 500;
 
-/// What came as a reply, read here once for everybody.
+/// What came as a reply, parsed once for all callers.
 CredExpected<WebReply> readReply(std::string text) {
     OvraDRCore::Response response;
     response.setResp(text);
@@ -76,7 +76,7 @@ CredExpected<WebReply> callPlain(const Endpoint &endpoint, const WireCall &call,
     return post(endpoint, call, options).and_then(readReply);
 }
 
-/// Over plain http the key itself must be the one that was met first.
+/// Over plain http the key itself must be the first one seen.
 CredExpected<void> judgeSealKey(const Endpoint &endpoint, const PublicKey &key) {
     TrustStore store;
     const std::string fingerprint = fingerprintOf(key);

@@ -32,12 +32,12 @@ struct WebReply {
 [[nodiscard]] CredExpected<WebReply> callWebAPI(const Endpoint &endpoint, const WireCall &call,
                                                 const WebCallOptions &options);
 
-/// Asks the entry point without any secret, and whoever it is, whether it answers.
+/// Checks without any secret or trust whether the entry point answers.
 [[nodiscard]] CredExpected<void> probe(const Endpoint &endpoint, const std::string &url,
                                        Deadline deadline);
 
 /// Asks the endpoint for the key that requests to it are sealed to. Over plain http anybody may
-/// have answered; nothing is judged here.
+/// have answered; nothing is verified here.
 [[nodiscard]] CredExpected<PublicKey> fetchSealKey(const Endpoint &endpoint,
                                                    const WebCallOptions &options);
 

@@ -13,7 +13,7 @@ namespace OvraPlatform {
 
 UnixMillis wallClock();
 
-/// Nothing if the text is no public key.
+/// std::nullopt if the text is not a public key.
 std::optional<PublicKey> parsePublicKey(const std::string &text);
 
 struct SealedRequest {

@@ -259,8 +259,8 @@ LoginResult AccountStore::verify(const std::string &name, std::string_view passw
     return result;
 }
 
-/// Everything behind the password, as the account is now: it may have changed while the password
-/// was hashed, which is why `hash` must be there still.
+/// Everything after the password, for the account as it is now: it may have changed while the
+/// password was hashed, so `hash` must still match.
 LoginResult AccountStore::checkAccount(const std::string &name, const std::string &hash,
                                        std::string_view oneTimeCode) {
     std::string secret;
@@ -290,7 +290,7 @@ LoginResult AccountStore::checkAccount(const std::string &name, const std::strin
     return result;
 }
 
-/// Two processes may have found the same code right: the one whose update changes the row has it.
+/// Two processes may have found the same code right: the one whose update changes the row wins.
 LoginResult AccountStore::spendCode(const std::string &name, const std::string &secret,
                                     std::int64_t lastStep, std::string_view oneTimeCode) {
     const std::optional<std::int64_t> step =

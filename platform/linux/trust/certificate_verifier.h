@@ -15,7 +15,7 @@ namespace OvraPlatform {
 /// The key and not the certificate, so that a certificate that is renewed on its key stays trusted.
 std::string fingerprintOf(const X509 *certificate);
 
-/// Judges the certificate of one endpoint in the TLS handshake.
+/// Verifies the certificate of one endpoint in the TLS handshake.
 ///
 /// What the system's store accepts for the host is accepted, whatever is pinned. Otherwise the key
 /// must be the pinned one. A key met for the first time passes the handshake, and must be pinned
@@ -34,13 +34,13 @@ public:
     /// \param observe  every certificate passes; the verdict is only told
     CertificateVerifier(Endpoint endpoint, bool observe);
 
-    /// Makes the connections of the context ask this verifier, which must live as long as they do.
+    /// Makes the connections of the context use this verifier, which must outlive them.
     void install(SSL_CTX *context);
     /// Pins a key that is new; false if that failed, and then the verdict says why.
     [[nodiscard]] bool pinNewKey();
 
     Verdict verdict() const { return verdict_; }
-    /// Of the key that was judged last.
+    /// Of the key verified last.
     const std::string &fingerprint() const { return fingerprint_; }
 
 private:

@@ -33,7 +33,7 @@ using Deadline = std::chrono::steady_clock::time_point;
 bool isPeerTrusted(int fd);
 
 std::string toLocalRequest(const LocalCall &call);
-/// Nothing if the text is not a request.
+/// std::nullopt if the text is not a request.
 [[nodiscard]] std::optional<LocalCall> parseLocalRequest(const std::string &text);
 
 } // namespace OvraPlatform
