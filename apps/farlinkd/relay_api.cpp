@@ -66,7 +66,7 @@ std::string randomText() {
     return OvraBase::toBase64Url(bytes.data(), bytes.size());
 }
 
-/// In constant time.
+/// Takes the same time wherever the two differ.
 bool sameSecret(const std::string &a, const std::string &b) {
     return a.size() == b.size() && sodium_memcmp(a.data(), b.data(), a.size()) == 0;
 }

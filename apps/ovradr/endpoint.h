@@ -15,7 +15,7 @@ namespace Ovradr {
 
 /// Probes a direct endpoint, at most 10 seconds and 5 more to learn why it does not answer. All
 /// processes share the verdict.
-/// \return why it does not answer; empty if it does.
+/// \return success, or why it does not answer.
 [[nodiscard]] Expected<void> probeEndpoint(const OvraDRNode::Conn &conn);
 
 /// The key that this appliance shows at its own endpoint; "" if it cannot be read.

@@ -153,7 +153,7 @@ Expected<Secret> askSecret(const std::string &question) {
     if (!noEcho.waitForInput()) {
         return failure(ExitCode::kFailed, "The question was interrupted.", "");
     }
-    // A terminal gives a line at once, when it is complete.
+    // A terminal delivers a line only once it is complete.
     return readLine(STDIN_FILENO, "the terminal");
 }
 

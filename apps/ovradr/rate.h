@@ -7,7 +7,8 @@
 namespace Ovradr {
 
 /// The bits per second of a speed as scripts/TestDownloadSpeed.sh words it, "NUMBER Mbit/s", or
-/// with another prefix or in bytes ("MB/s"); empty for another wording, which an appliance may use.
+/// with another prefix or in bytes ("MB/s"); std::nullopt for another wording, which an appliance
+/// may use.
 std::optional<double> bitsPerSecond(const std::string &speed);
 
 /// The speed for people, "94.1 Mbit/s (11.8 MB/s)"; another wording unchanged.

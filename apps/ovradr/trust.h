@@ -30,7 +30,7 @@ std::string trustWord(const OvraPlatform::PeerIdentity &identity);
 /// key seen for the first time is trusted if it is the expected one, or if the user at the terminal
 /// confirms it.
 /// \param expected  the required fingerprint, or ""
-/// \return what is in the way; empty if the key is trusted.
+/// \return success if the key is trusted, else what is in the way.
 [[nodiscard]] Expected<void> trustPeer(const OvraDRNode::Conn &conn, const std::string &expected);
 
 } // namespace Ovradr

@@ -110,7 +110,7 @@ struct FarlinkAgent::State {
 
 namespace {
 
-/// Nothing, or what is in the way.
+/// Success, or what is in the way.
 using Went = tl::expected<void, FarlinkFailure>;
 
 /// One session with the relay service, under one alias.

@@ -13,7 +13,7 @@ namespace Ovradrd {
 /// file system path: "/webman/modules/ovradr/" + "/usr/ovra/var/ovradr/speedtest/speed-...".
 inline constexpr std::string_view kTestFilesUrl = "/webman/modules/ovradr/";
 
-/// Opens the file that a URL path names; std::nullopt if it is any other path. Opens only names as
+/// Opens the test file that a URL path names; std::nullopt for any other path. Opens only names as
 /// given by scripts/TestSyncSpeed.sh, in its one folder, follows no link, and requires a regular
 /// file of our own user: no URL reaches anything else.
 /// \param path  with its escapes resolved

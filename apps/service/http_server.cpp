@@ -55,7 +55,7 @@ std::string errorText(int code, const std::string &message) {
     return OvraDRCore::toString(OvraPlatform::apiError(code, message));
 }
 
-/// Who counts as one client.
+/// What counts as one client.
 std::string clientOf(const sockaddr *address) {
     return OvraBase::clientKey(OvraBase::addressText(address));
 }
@@ -65,7 +65,7 @@ std::string_view headerOf(MHD_Connection *connection, const char *name) {
     return value == nullptr ? std::string_view() : std::string_view(value);
 }
 
-/// 0 when the length is not announced. One that is not a number, or overflows, exceeds every limit.
+/// 0 if the length is not announced. One that is not a number, or overflows, exceeds every limit.
 std::uint64_t announcedLength(MHD_Connection *connection) {
     const std::string_view text = headerOf(connection, MHD_HTTP_HEADER_CONTENT_LENGTH);
     return text.empty() ? 0 : OvraBase::parseNumber<std::uint64_t>(text).value_or(UINT64_MAX);

@@ -39,8 +39,8 @@ struct ReleasingFlow {
 
 /// Runs a flow of the library that makes the session of `record` superfluous and releases it if it
 /// can, and finds out what happened to the session, which the flow itself does not report. The
-/// release is noted before the flow and stays noted if it did not happen, even if this process is
-/// killed; if it cannot be noted, the flow runs anyway.
+/// release is noted before the flow and stays noted if it failed, even if this process is killed;
+/// if it cannot be noted, the flow runs anyway.
 ///
 /// \param conn  the endpoint over which the flow releases
 ReleasingFlow runReleasing(const OvraDRNode::DRNode &record, const OvraDRNode::Conn &conn,

@@ -45,7 +45,7 @@ Refusal badParameter(const std::string &text, const std::string &why) {
                    "Write --param NAME=VALUE, or --param NAME:=JSON.");
 }
 
-/// Adds "name=value" (the value is taken as JSON when it is JSON, otherwise as text) or
+/// Adds "name=value" (the value is taken as JSON if it is valid JSON, otherwise as text) or
 /// "name:=json".
 Expected<void> addParameter(Json::Value &params, const std::string &text) {
     const std::size_t equals = text.find('=');

@@ -87,7 +87,7 @@ Expected<FarlinkKey> ownKey() {
     return *key;
 }
 
-/// What the daemon says about the relay service; invalid when no daemon runs.
+/// What the daemon says about the relay service; invalid if no daemon runs.
 Response askDaemon() {
     return OvraDRNode::BaseSender::run(
         OvraDRCore::Request("OVRA.Core.Farlink", 1, "get", Json::Value(Json::objectValue)));

@@ -39,7 +39,7 @@ struct Tried {
     Expected<std::string> speed;
 };
 
-/// A script's last words before it failed, without its own name; `fallback` if there are none.
+/// A script's last message before it failed, without its own name; `fallback` if there are none.
 std::string reasonOf(const std::string &said, const std::string &fallback) {
     const std::size_t colon = said.find(".sh: ");
     const std::string reason = colon == std::string::npos ? said : said.substr(colon + 5);

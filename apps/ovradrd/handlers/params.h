@@ -46,7 +46,7 @@ public:
     OvraBase::Secret secret(const char *name, std::size_t longest);
     /// As secret(), or "" if it is absent or empty.
     std::string optionalSecret(const char *name, std::size_t longest);
-    /// An array of at most `most` texts; none when it is absent.
+    /// An array of at most `most` texts; empty if it is absent.
     std::vector<std::string> optionalTexts(const char *name, std::size_t most, std::size_t longest);
     /// An endpoint: an object with "addr", "protocol" and "port".
     OvraDRNode::Conn conn(const char *name);

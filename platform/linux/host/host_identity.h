@@ -15,9 +15,9 @@ struct HostFiles {
 };
 
 /// The serial number: the configured one; else the one in the firmware, unless it is one of the
-/// texts that makers leave there for lack of a number; else an id of 24 hexadecimal digits made
-/// from the machine id, which itself must not be published (machine-id(5)) and cannot be recovered
-/// from it. "" if the machine has none of them.
+/// placeholder texts of makers; else an id of 24 hexadecimal digits made from the machine id, which
+/// itself must not be published (machine-id(5)) and cannot be recovered from it. "" if the machine
+/// has none of them.
 std::string serialNumber(const ApplianceConfig &config, const HostFiles &files = {});
 
 /// The configured host name, else the system's; "" if that cannot be read.

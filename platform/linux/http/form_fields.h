@@ -13,7 +13,7 @@ namespace OvraPlatform {
 /// The fields of a form in their order, not yet escaped.
 using FormFields = std::vector<std::pair<std::string, std::string>>;
 
-/// Nothing if a parameter has the name of one of the form's own fields.
+/// std::nullopt if a parameter has the name of one of the form's own fields.
 std::optional<FormFields> toFormFields(const WireCall &call);
 std::string encodeForm(const FormFields &fields);
 

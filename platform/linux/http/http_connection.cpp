@@ -70,8 +70,8 @@ std::optional<std::uint64_t> deliveredBytes(int socket) {
     return info.tcpi_bytes_acked;
 }
 
-/// Has the kernel end the connection when the peer's does not acknowledge what is sent, nor answer
-/// when it is asked whether it is still there (tcp(7), RFC 5482).
+/// Makes the kernel end the connection if the peer's kernel neither acknowledges what is sent nor
+/// answers keep-alive probes (tcp(7), RFC 5482).
 void endWhenSilent(int socket) {
     const auto set = [socket](int level, int option, int value) {
         setsockopt(socket, level, option, &value, sizeof value);
@@ -82,8 +82,8 @@ void endWhenSilent(int socket) {
     set(SOL_SOCKET, SO_KEEPALIVE, 1);
 }
 
-/// Whether the connection ended because nothing came from the peer any more; the kernel's clocks
-/// are a little apart.
+/// Whether the connection ended because the peer fell silent; the kernel's clocks are a little
+/// apart.
 bool endedInSilence(int socket) {
     constexpr unsigned kTolerance = 500; // milliseconds
     constexpr unsigned kClosed = 7;      // TCP_CLOSE of a header that excludes linux/tcp.h
@@ -355,9 +355,9 @@ CURLcode HttpConnection::onTlsContext(CURL *, void *context, void *self) {
 
 /// Called when a connection is ready (TLS included) and before anything of the request is sent.
 ///
-/// libcurl repeats a request by itself when a kept connection ends without an answer, even if the
-/// peer may have carried it out. Here it is repeated only when the peer's kernel had acknowledged
-/// none of its bytes, and not when the peer fell silent.
+/// libcurl repeats a request by itself if a kept connection ends without an answer, even if the
+/// peer may have carried it out. Here it is repeated only if the peer's kernel had acknowledged
+/// none of its bytes, and not if the peer fell silent.
 int HttpConnection::onRequest(void *self, char *, char *, int, int) {
     auto *connection = static_cast<HttpConnection *>(self);
     Attempt &attempt = connection->attempt_;

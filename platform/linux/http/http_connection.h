@@ -73,7 +73,7 @@ private:
         int socket = -1;
         std::optional<std::uint64_t> delivered; ///< bytes that had arrived when it began
         bool mayHaveArrived = true;             ///< something of a request that failed
-        bool endedInSilence = false;            ///< the peer said nothing any more
+        bool endedInSilence = false;            ///< the peer fell silent
     };
     struct FreeHandle {
         void operator()(CURL *handle) const { curl_easy_cleanup(handle); }

@@ -33,7 +33,7 @@ CredExpected<WebReply> readReply(std::string text) {
     return WebReply{std::move(text), std::move(response)};
 }
 
-/// The body, when the status says that it is the answer.
+/// The body, if the status says that it is the answer.
 CredExpected<std::string> bodyOf(HttpAnswer answer) {
     if (answer.status == kHttpOk) {
         return std::move(answer.body);
@@ -182,8 +182,8 @@ private:
             return tl::unexpected(CredError::kSealFailed);
         }
         CredExpected<WebReply> opened = readReply(std::move(*text));
-        // Only a time that came sealed is believed: a wrong one would let somebody who holds the
-        // request back deliver it later.
+        // Only a time that came sealed is believed: a wrong one would let an attacker hold the
+        // request back and deliver it later.
         if (!realigned_ && opened && sealRefusalReason(opened->response) == "stale" &&
             realign(opened->response)) {
             realigned_ = true;

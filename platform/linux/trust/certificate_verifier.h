@@ -18,8 +18,9 @@ std::string fingerprintOf(const X509 *certificate);
 /// Verifies the certificate of one endpoint in the TLS handshake.
 ///
 /// What the system's store accepts for the host is accepted, whatever is pinned. Otherwise the key
-/// must be the pinned one. A key met for the first time passes the handshake, and must be pinned
-/// (pinNewKey) before anything is sent: only then has the peer proved that it holds the key.
+/// must be the pinned one. A key seen for the first time passes the handshake, and must be pinned
+/// (pinNewKey) before anything is sent: only after the handshake has the peer proved that it holds
+/// the key.
 class CertificateVerifier {
 public:
     enum class Verdict {

@@ -45,7 +45,7 @@ bool waitFor(int fd, short events, Deadline deadline, int stop) {
     }
 }
 
-/// Moves all of `size` bytes with `step` (send or recv of a part), waiting when the socket is not
+/// Moves all of `size` bytes with `step` (send or recv of a part), waiting while the socket is not
 /// ready.
 template <typename Step>
 bool transfer(int fd, short events, std::size_t size, Deadline deadline, int stop, Step step) {

@@ -21,7 +21,7 @@ using Deadline = std::chrono::steady_clock::time_point;
 
 /// Sends one frame.
 /// \param fd    a non-blocking stream socket
-/// \param stop  a descriptor that ends the wait when it is readable; -1: none
+/// \param stop  a descriptor that ends the wait once readable; -1: none
 /// \return false if the peer is gone, the time is over, or it was told to stop.
 [[nodiscard]] bool sendFrame(int fd, const std::string &text, Deadline deadline, int stop = -1);
 
