@@ -145,7 +145,7 @@ bool AliasRegistry::store(const Entries &entries, int nextPort) const {
     return stored.has_value();
 }
 
-/// 0 when all are taken.
+/// 0 if all are taken.
 int AliasRegistry::freePort() const {
     std::set<int> taken;
     for (const auto &[name, alias] : entries_) {

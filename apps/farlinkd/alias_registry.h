@@ -15,18 +15,18 @@ namespace Farlinkd {
 /// A name under which an appliance is reached.
 struct Alias {
     std::string name;
-    std::string key; ///< the public key whose owner has it, base64url
+    std::string key; ///< its owner's public key, base64url
     int port = 0;    ///< where its callers connect
     std::int64_t expires = 0;
 };
 
-/// Who has which alias: a text file of mode 0600, replaced whole with every change. An alias
-/// belongs to the first key that asks for it, until it has not been enrolled for the lease. For one
-/// thread at a time.
+/// The owners of aliases: a text file of mode 0600, replaced whole with every change. An alias
+/// belongs to the first key that claims it, until it has not been enrolled for the length of the
+/// lease. For one thread at a time.
 class AliasRegistry {
 public:
     struct Limits {
-        int firstPort = 0; ///< one port an alias, so as many aliases as ports
+        int firstPort = 0; ///< one port per alias, so as many aliases as ports
         int lastPort = 0;
         std::chrono::seconds lease{};
         std::size_t perKey = 4;
@@ -38,22 +38,22 @@ public:
     enum class Refusal {
         kTaken,     ///< another key has it
         kFull,      ///< no port is left
-        kTooMany,   ///< the key has as many as it may
+        kTooMany,   ///< the key has reached its limit
         kNotStored, ///< the file cannot be written; nothing changed
     };
 
     AliasRegistry(std::string path, const Limits &limits);
 
-    /// Reads the file; a missing one is an empty registry. Entries outside the ports are dropped.
+    /// Reads the file; a missing one is an empty registry. Drops entries outside the port range.
     [[nodiscard]] OvraBase::Expected<void> load();
     /// \param now  seconds since 1970, here and below
     [[nodiscard]] tl::expected<Enrolment, Refusal> enrol(const std::string &name,
                                                          const std::string &key, std::int64_t now);
-    /// Null for an alias that nobody has.
+    /// Null for an unowned alias.
     const Alias *find(const std::string &name) const;
-    /// \return false when there is none, or the file cannot be written
+    /// \return false if there is none, or the file cannot be written
     [[nodiscard]] bool release(const std::string &name);
-    /// Takes out what has expired. \return what that was
+    /// Removes expired entries. \return those removed
     std::vector<Alias> dropExpired(std::int64_t now);
     std::vector<Alias> list() const;
 
@@ -66,8 +66,8 @@ private:
     std::string path_;
     Limits limits_;
     Entries entries_;
-    /// Ports go round, so that one that becomes free stays so for as long as possible: those who
-    /// called its last owner know a key there.
+    /// Ports rotate, so that a freed one stays free for as long as possible: callers of its last
+    /// owner have pinned a key there.
     int nextPort_;
 };
 

@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 
-// farlinkd: the relay service, by which appliances without a way in are reached under an alias.
+// farlinkd: the relay service, which makes appliances without incoming connections reachable under
+// an alias.
 
 #include "alias_registry.h"
 #include "relay_api.h"
@@ -73,7 +74,7 @@ std::string certificateIn(const Options &options) {
     return options.state + "/farlinkd.crt";
 }
 
-/// The key and certificate of the service, made when there are none.
+/// The key and certificate of the service, created if there are none.
 Expected<TlsIdentity> identityIn(const Options &options) {
     const std::string key = options.state + "/farlinkd.key";
     const std::string certificate = certificateIn(options);

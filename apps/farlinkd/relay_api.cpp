@@ -25,12 +25,12 @@ using OvraPlatform::apiSuccess;
 
 constexpr std::size_t kMaxText = 256;
 constexpr std::chrono::seconds kChallengeTime{60};
-/// An appliance that has not asked for so long is not there; it asks anew when it was answered.
+/// An appliance that has not polled for this long is gone; it polls again after each answer.
 constexpr std::chrono::seconds kGoneAfter{15};
 constexpr std::size_t kMaxQueued = 64;
 constexpr std::size_t kTokenBytes = 32;
 
-// For one client address. An appliance that is called often asks once for each caller.
+// For one client address. A busy appliance polls once for each caller.
 constexpr std::size_t kCallsPerMinute = 3000;
 constexpr std::size_t kProofsPerMinute = 30;
 constexpr std::size_t kAliasesPerHour = 10;
@@ -66,12 +66,12 @@ std::string randomText() {
     return OvraBase::toBase64Url(bytes.data(), bytes.size());
 }
 
-/// In a time that does not tell how much of it is right.
+/// Takes the same time wherever the two differ.
 bool sameSecret(const std::string &a, const std::string &b) {
     return a.size() == b.size() && sodium_memcmp(a.data(), b.data(), a.size()) == 0;
 }
 
-/// The text of a parameter; "" when it is none, or too long to be one.
+/// The text of a parameter; "" if it is none, or too long to be one.
 std::string textOf(const Json::Value &params, const char *name) {
     std::string text = memberString(params, name);
     return text.size() <= kMaxText ? text : std::string();
@@ -108,7 +108,7 @@ bool RelayApi::openPort(const Alias &alias) {
 }
 
 void RelayApi::serve(OvraService::HttpRequest request, const Answer &answer) {
-    // std::function has to be copyable.
+    // std::function must be copyable.
     const auto held = std::make_shared<OvraService::HttpRequest>(std::move(request));
     if (!queue_.submit([this, held, answer] { handle(*held, answer); })) {
         answer(OvraDRCore::toString(
@@ -244,7 +244,7 @@ Json::Value RelayApi::enrol(const Json::Value &params, const std::string &addres
     if (agent.waiting) {
         agent.waiting(OvraDRCore::toString(apiError(APIError::kNoSession)));
     }
-    // Callers who wait already stay; it is there once it asks for them.
+    // Waiting callers stay; it is present once it polls for them.
     agent.waiting = nullptr;
     agent.token = randomText();
     agent.seen = Clock::now() - kGoneAfter;
@@ -257,7 +257,7 @@ Json::Value RelayApi::enrol(const Json::Value &params, const std::string &addres
     return apiSuccess(data);
 }
 
-/// The appliance whose token came with the call; null for anybody else.
+/// The appliance whose token came with the call, or null.
 RelayApi::Agent *RelayApi::agentOf(const Json::Value &params) {
     const auto found = agents_.find(memberString(params, "alias"));
     const bool ours =
@@ -269,7 +269,7 @@ bool RelayApi::isThere(const Agent &agent) const {
     return agent.waiting || Clock::now() - agent.seen < kGoneAfter;
 }
 
-/// Answers with all callers that there are.
+/// Answers with all waiting callers.
 void RelayApi::tellCallers(Agent &agent, const Answer &answer) {
     Json::Value data(Json::objectValue);
     data["callers"] = Json::Value(Json::arrayValue);
@@ -289,7 +289,7 @@ void RelayApi::wait(const Json::Value &params, const Answer &answer) {
         return;
     }
     if (agent->waiting) {
-        // The connection of the earlier question was lost.
+        // The connection of the earlier poll was lost.
         tellCallers(*agent, std::exchange(agent->waiting, nullptr));
     }
     if (!agent->callers.empty()) {

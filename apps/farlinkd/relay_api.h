@@ -22,12 +22,12 @@
 
 namespace Farlinkd {
 
-/// The calls of the relay service, and which appliances are there; docs/wire.md describes both.
+/// The calls of the relay service, and the appliances present; docs/wire.md describes both.
 class RelayApi {
 public:
     struct Settings {
         std::string address; ///< where the aliases' ports are opened; "": everywhere
-        std::string host;    ///< that callers are told; "": the one they know the service by
+        std::string host;    ///< told to callers; "": the one they use for the service
         int tunnelPort = 0;
     };
 
@@ -35,28 +35,27 @@ public:
     RelayApi(const RelayApi &) = delete;
     RelayApi &operator=(const RelayApi &) = delete;
 
-    /// Opens the ports of the aliases in the book. The tunnelServer has to outlive everything
-    /// below.
+    /// Opens the ports of the aliases in the book. The tunnelServer must outlive everything below.
     void connect(TunnelServer &tunnelServer);
-    /// Carries out one request; does not wait.
+    /// Handles one request; does not wait.
     void serve(OvraService::HttpRequest request, const OvraService::HttpServer::Answer &answer);
-    /// Tells the appliance of the alias about a caller; false when it is not there.
+    /// Announces a caller to the appliance of the alias; false if it is not present.
     [[nodiscard]] bool announce(const std::string &alias, const std::string &caller);
-    /// Ends what has lasted long enough: questions for callers, and aliases. Now and then.
+    /// Ends overdue polls for callers and expired aliases. Call it now and then.
     void endOverdue();
-    /// Drops the requests that wait, and waits for those under way.
+    /// Drops waiting requests, and waits for those in progress.
     void stop();
 
 private:
     using Clock = std::chrono::steady_clock;
     using Answer = OvraService::HttpServer::Answer;
 
-    /// An appliance that has proved whose alias it is.
+    /// An appliance that has proved its ownership of an alias.
     struct Agent {
         std::string token;
         Clock::time_point seen;
-        std::deque<std::string> callers; ///< that it was not told about yet
-        Answer waiting;                  ///< its question, held back until there is a caller
+        std::deque<std::string> callers; ///< not announced to it yet
+        Answer waiting;                  ///< its poll, held back until there is a caller
         Clock::time_point waitingSince;
     };
 
@@ -79,7 +78,7 @@ private:
 
     Settings settings_;
     TunnelServer *tunnelServer_ = nullptr;
-    /// Proves that a challenge is one of ours without remembering it.
+    /// Proves that a challenge is ours without storing it.
     OvraBase::SecretBytes<crypto_auth_KEYBYTES> secret_;
     std::mutex mutex_; ///< of everything below
     AliasRegistry aliases_;
@@ -87,7 +86,7 @@ private:
     OvraService::RateLimit calls_;
     OvraService::RateLimit proofs_;
     OvraService::RateLimit newAliases_;
-    // Last, so that it goes first: its jobs use everything above.
+    // Last, so that it is destroyed first: its jobs use everything above.
     OvraService::WorkQueue queue_{2, 512};
 };
 

@@ -35,7 +35,7 @@ constexpr std::size_t kIdBytes = 16;
 constexpr std::string_view kGreeting = "FARLINK1 ";
 constexpr std::size_t kLineSize = kGreeting.size() + 2 * kIdBytes + 1;
 constexpr std::size_t kChunk = std::size_t{64} * 1024;
-/// Not yet taken by the other end; then this end is not read any further.
+/// Not yet taken by the other end; above this, this end is not read.
 constexpr std::size_t kMaxBuffered = 2 * kChunk;
 
 std::string newCaller() {
@@ -46,7 +46,7 @@ std::string newCaller() {
     return text.data();
 }
 
-/// Small writes must not wait for each other; a peer that is gone is found out.
+/// Small writes must not wait for each other; a dead peer is noticed.
 void tune(int fd) {
     const int on = 1;
     setsockopt(fd, IPPROTO_TCP, TCP_NODELAY, &on, sizeof on);
@@ -144,7 +144,7 @@ Socket *TunnelServer::Impl::findWaiting(const std::string &caller) {
     return nullptr;
 }
 
-/// Both ends of a call go together.
+/// Both ends of a call close together.
 void TunnelServer::Impl::drop(Socket &socket) {
     const int fd = socket.fd.get();
     const int other = socket.peer == nullptr ? -1 : socket.peer->fd.get();
@@ -205,7 +205,7 @@ void TunnelServer::Impl::acceptCaller(const std::string &alias, UniqueFd fd) {
     }
     tune(fd.get());
     const int number = fd.get();
-    // Nothing is read before there is somebody who takes it.
+    // Nothing is read before there is a receiver.
     add(std::move(fd), Kind::kWaiting, alias, EPOLLRDHUP);
     if (const auto added = sockets.find(number); added != sockets.end()) {
         added->second->text = caller;
@@ -276,7 +276,7 @@ void TunnelServer::Impl::setInterest(Socket &socket) const {
     epoll_ctl(epoll.get(), EPOLL_CTL_MOD, socket.fd.get(), &event);
 }
 
-/// Writes what waits for this end; false when the end is gone.
+/// Writes what waits for this end; false if the end is gone.
 bool TunnelServer::Impl::flush(Socket &to) {
     while (to.written < to.out.size()) {
         const ssize_t size =
@@ -298,7 +298,7 @@ bool TunnelServer::Impl::flush(Socket &to) {
     return true;
 }
 
-/// Carries what `from` says to its peer, as far as that takes it.
+/// Carries data from `from` to its peer, as far as the peer accepts it.
 void TunnelServer::Impl::pass(Socket &from) {
     Socket &to = *from.peer;
     thread_local std::array<char, kChunk> buffer;
@@ -343,7 +343,7 @@ void TunnelServer::Impl::handle(int fd, std::uint32_t events) {
         readLine(socket);
         break;
     case Kind::kWaiting:
-        // A caller who hangs up before anybody answers.
+        // A caller that hangs up before an answer.
         drop(socket);
         break;
     case Kind::kConnected:

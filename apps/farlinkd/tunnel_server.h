@@ -11,24 +11,23 @@
 
 namespace Farlinkd {
 
-/// Puts callers through to appliances that cannot be connected to.
+/// Puts callers through to appliances that accept no incoming connections.
 ///
-/// Every alias has a port. A caller who connects there is kept waiting and announced; the appliance
-/// then connects to the tunnel port, says in its first line which caller it means, and from there
-/// on the bytes of both pass to and fro unread, until both ends have closed. One thread carries
-/// them all, with a buffer of bounded size for each direction.
+/// Every alias has a port. A caller that connects there waits and is announced; the appliance then
+/// connects to the tunnel port and names the caller in its first line. From then on the bytes pass
+/// both ways unread until both ends have closed. One thread carries all calls, with a bounded
+/// buffer for each direction.
 class TunnelServer {
 public:
     struct Limits {
-        std::size_t calls = 512; ///< callers in all, waiting or put through
+        std::size_t calls = 512; ///< all callers, waiting or put through
         std::size_t perAlias = 64;
-        std::size_t arriving = 128;               ///< appliances that have not said whom they mean
+        std::size_t arriving = 128;               ///< appliances that have not named a caller
         std::chrono::milliseconds line{5'000};    ///< for saying it
         std::chrono::milliseconds answer{10'000}; ///< how long a caller waits for the appliance
         std::chrono::milliseconds idle{120'000};
     };
-    /// Announces a caller, in the thread of the tunnel server; false when the appliance is not
-    /// there.
+    /// Announces a caller, in the tunnel server's thread; false if the appliance is not present.
     using Announce = std::function<bool(const std::string &alias, const std::string &caller)>;
 
     TunnelServer(Announce announce, const Limits &limits);
@@ -39,9 +38,9 @@ public:
 
     /// Begins.
     [[nodiscard]] OvraBase::Expected<void> start(OvraService::Listener tunnel);
-    /// Takes callers of the alias at the socket from now on, instead of at an earlier one.
+    /// Accepts callers of the alias on this socket from now on, instead of an earlier one.
     void open(const std::string &alias, OvraService::Listener listener);
-    /// Takes no more callers of the alias, and ends the calls under way.
+    /// Accepts no more callers of the alias, and ends the calls in progress.
     void close(const std::string &alias);
 
 private:

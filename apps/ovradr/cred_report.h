@@ -15,12 +15,12 @@ namespace Ovradr {
 Json::Value credJson(const OvraDRNode::DRNode &record, bool temporary);
 
 /// A credential as people see it.
-/// \param account  on the other appliance, or "" when it is not known
+/// \param account  on the other appliance, or "" if unknown
 std::string credText(const OvraDRNode::DRNode &record, bool temporary,
                      const std::string &account = "");
 
-/// What became of the session of a credential, in one sentence for people.
-/// \param foreseen  nothing was done yet; the sentence says what would become of it
+/// What happened to the session of a credential, in one sentence for people.
+/// \param foreseen  nothing was done yet; the sentence says what would happen to it
 std::string releaseText(const OvraApps::Release &release, bool foreseen);
 
 /// The same for scripts: "session", and with a session that was left behind "reason" (code, name,

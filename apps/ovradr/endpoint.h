@@ -9,16 +9,16 @@
 
 namespace Ovradr {
 
-/// The endpoint at which to connect: a relay endpoint as the relay service knows it now, any other
-/// as it is.
+/// The endpoint to connect to: for a relay endpoint what the relay service names now, any other
+/// unchanged.
 [[nodiscard]] Expected<OvraDRNode::Conn> directEndpoint(const OvraDRNode::Conn &conn);
 
-/// Probes a direct endpoint, at most 10 seconds and, to learn why it does not answer, 5 more. All
-/// processes get to know the verdict.
-/// \return why it does not answer; nothing when it does.
+/// Probes a direct endpoint, at most 10 seconds and 5 more to learn why it does not answer. All
+/// processes share the verdict.
+/// \return success, or why it does not answer.
 [[nodiscard]] Expected<void> probeEndpoint(const OvraDRNode::Conn &conn);
 
-/// The key that this appliance shows at an endpoint of its own; "" where it cannot be read.
+/// The key that this appliance shows at its own endpoint; "" if it cannot be read.
 std::string ownFingerprint(const OvraDRNode::Conn &conn);
 
 } // namespace Ovradr

@@ -170,7 +170,7 @@ private:
                                                          : trustText(peer));
     }
 
-    /// An endpoint of this appliance has to show the key that is in its file.
+    /// An endpoint of this appliance must show the key that is in its file.
     Expected<std::string> expectedKey(const PeerIdentity &peer) {
         if (peer.fingerprint != subject_.fingerprint) {
             return failure(ExitCode::kCertificate,
@@ -209,7 +209,7 @@ private:
         return "as " + subject_.login->account;
     }
 
-    /// Any answer but that the session is unknown shows that it is known.
+    /// Any answer other than an unknown session shows that it is known.
     Expected<std::string> session() {
         sender_ = std::make_unique<OvraDRNode::CredNodeSender>(*subject_.cred);
         info_ = sender_->process(WebAPI::getDRNodeInfoAPI({}));

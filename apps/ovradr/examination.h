@@ -14,7 +14,7 @@
 
 namespace Ovradr {
 
-/// The log-in that an examination tries.
+/// The log-in tried by an examination.
 struct LoginTrial {
     std::string account;
     const Secret &password;
@@ -26,12 +26,12 @@ struct ExaminationSubject {
     OvraDRNode::Conn conn;
     std::optional<OvraDRNode::DRNode> cred; ///< its session is used
     std::optional<LoginTrial> login;        ///< tried instead of a session
-    std::string fingerprint;                ///< the key that it must have, or ""
+    std::string fingerprint;                ///< the required key, or ""
     bool own = false;                       ///< of this appliance: only the steps up to "answer"
 };
 
-/// Examines things step by step. A step that fails has the steps that need it skipped; the first
-/// failure is the verdict on the whole.
+/// Examines things step by step. If a step fails, the steps that need it are skipped; the first
+/// failure is the overall verdict.
 class Examination {
 public:
     struct Step {
@@ -42,18 +42,18 @@ public:
         std::string detail; ///< what was found, what was wrong, or why it was skipped
         std::string hint;   ///< what to do
     };
-    /// What a step finds out, or why it fails.
+    /// What a step found, or why it failed.
     using Action = std::function<Expected<std::string>()>;
 
     /// \param subject  what is examined, for people
     explicit Examination(std::string subject);
 
-    /// Runs and times a step. \return whether it went well.
+    /// Runs and times a step. \return whether it succeeded.
     bool run(const std::string &name, const Action &action);
     void skip(const std::string &name, const std::string &why);
 
     const std::string &subject() const { return subject_; }
-    /// The first failure, when not every step that was run went well.
+    /// The first failure, if any step failed.
     const Expected<void> &verdict() const { return verdict_; }
     /// Members "subject" and "steps".
     Json::Value toJson() const;
@@ -67,7 +67,7 @@ private:
 
 /// Examines an endpoint: the steps "resolve", "connect", "key", "answer", "session" or "log-in",
 /// "identity", "right" and "clock". Nothing secret is sent before the key is trusted, and nothing
-/// is trusted that nobody has asked for. Takes at most 10 seconds a step, and 60 for a request.
+/// is trusted without being asked for. Takes at most 10 seconds per step, and 60 for a request.
 void examineEndpoint(const ExaminationSubject &subject, Examination &examination);
 
 /// Examines what this appliance itself needs: the steps "files" and "daemon".

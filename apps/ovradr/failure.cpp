@@ -18,7 +18,7 @@ namespace Ovradr {
 
 namespace {
 
-/// The names of what this program finds itself, in the order of the exit codes.
+/// The names of this program's own failures, in the order of the exit codes.
 constexpr std::array kExitNames = {
     "ok",          "failed",    "usage",         "not_reachable", "login_refused", "one_time_code",
     "certificate", "not_found", "not_permitted", "not_set_up",    "name_unknown",  "no_appliance",
@@ -153,7 +153,7 @@ std::string detailText(int code, const Json::Value &detail) {
     return detail.isNull() ? std::string() : OvraDRCore::toLogString(detail);
 }
 
-/// Codes that leave nothing to add: what comes with them says the same once more.
+/// Codes that need no detail: it would only repeat them.
 bool saysItAll(int code) {
     return code == APIError::kNoSuchAPI || code == APIError::kNoSuchMethod ||
            code == APIError::kNoSuchVersion || code == APIError::kNoSession;

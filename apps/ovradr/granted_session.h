@@ -13,22 +13,22 @@ namespace Ovradr {
 /// A session that this node granted to others.
 struct GrantedSession {
     OvraPlatform::SessionRecord record;
-    std::string nodeId; ///< the node that it was granted to; "": tied to none, it ends by itself
+    std::string nodeId; ///< the node it was granted to; "": tied to no node, ends by itself
 
-    /// By which people name it; it opens nothing.
+    /// By which people name it; it grants no access.
     std::string reference() const { return record.reference(); }
 };
 
-/// All of them, the oldest first. Log-ins of people are not among them.
+/// All of them, oldest first, without log-ins of people.
 [[nodiscard]] Expected<std::vector<GrantedSession>> grantedSessions();
 
-/// As scripts see it; never its id.
+/// As scripts see it; never contains its id.
 Json::Value sessionJson(const GrantedSession &session);
 
 /// A table for people.
 std::string sessionTable(const std::vector<GrantedSession> &sessions);
 
-/// Ends the sessions, up to the first that cannot be ended.
+/// Ends the sessions, stopping at the first failure.
 [[nodiscard]] Expected<void> endSessions(const std::vector<GrantedSession> &sessions);
 
 } // namespace Ovradr

@@ -18,7 +18,7 @@ namespace {
 
 constexpr std::string_view kOneTimeCodeOption = "--otp";
 
-/// Takes the arguments over and wipes a one-time code from where every process can see it.
+/// Copies the arguments and wipes a one-time code from where every process can see it.
 std::vector<std::string> takeArguments(int argc, char **argv) {
     std::vector<std::string> arguments;
     bool codeFollows = false;
@@ -38,8 +38,8 @@ std::vector<std::string> takeArguments(int argc, char **argv) {
 constexpr const char *kHelpHint =
     "`ovradr --help`, or --help behind a command, shows what there is.";
 
-/// What is wrong with a command line that has more than it should. Nothing of it but the names of
-/// options is repeated: it may be a password that stands in the wrong place.
+/// The error for surplus arguments. Repeats only option names: the rest may be a misplaced
+/// password.
 Refusal surplusFailure(const CLI::App &app) {
     std::string names;
     for (const std::string &argument : app.remaining(true)) {
@@ -94,7 +94,7 @@ int run(int argc, char **argv) {
 } // namespace Ovradr
 
 int main(int argc, char **argv) {
-    // A reader that goes away is told by the failed write.
+    // A vanished reader shows as a failed write.
     std::signal(SIGPIPE, SIG_IGN);
     try {
         return Ovradr::run(argc, argv);

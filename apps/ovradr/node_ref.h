@@ -10,21 +10,21 @@
 
 namespace Ovradr {
 
-/// The id of this node, made when there is none.
+/// The id of this node, created if there is none.
 [[nodiscard]] Expected<std::string> localNode();
 
-/// The ids of all nodes that a credential reaches, and of this one.
+/// The ids of this node and of all nodes that a credential reaches.
 [[nodiscard]] Expected<std::set<std::string>> listNodes();
 
-/// The one of `ids` that is `text` or, alone among them, begins with it.
+/// The one of `ids` that equals `text` or is the only one to begin with it.
 /// \param what  what the ids name, e.g. "node"
-/// \param hint  what to do when there is none
+/// \param hint  what to do if there is none
 [[nodiscard]] Expected<std::string> chooseId(const std::set<std::string> &ids,
                                              const std::string &text, const std::string &what,
                                              const std::string &hint);
 
-/// The node id that a person means: "local", a node id, or the beginning of only one. Only nodes
-/// that a credential reaches are known, and this one.
+/// The node id for what a person typed: "local", a node id, or a unique prefix of one. Only this
+/// node and nodes that a credential reaches are known.
 [[nodiscard]] Expected<std::string> resolveNode(const std::string &text);
 
 struct FoundCred {
@@ -32,8 +32,7 @@ struct FoundCred {
     bool temporary = false;
 };
 
-/// The credential, lasting or temporary, that a person means by its id or by the beginning of only
-/// one.
+/// The credential, lasting or temporary, for its id or a unique prefix of it.
 [[nodiscard]] Expected<FoundCred> resolveCred(const std::string &text);
 
 } // namespace Ovradr

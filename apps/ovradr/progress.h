@@ -8,11 +8,11 @@
 
 namespace Ovradr {
 
-/// Tells the person at the terminal what is going on and for how long already, in one line of
-/// standard error that is gone at the end. Says nothing where standard error is no terminal.
+/// Shows what is going on and for how long, in one line on standard error that is erased at the
+/// end. Silent if standard error is not a terminal.
 ///
-/// Standard error belongs to it while it lives: what programs that are started meanwhile write
-/// there is caught, to be said in our own words.
+/// It owns standard error while it lives: output of programs started meanwhile is captured, to be
+/// reported in our own words.
 class Progress {
 public:
     Progress();
@@ -20,15 +20,15 @@ public:
     Progress &operator=(const Progress &) = delete;
     ~Progress();
 
-    /// What is going on from now on; the seconds count anew.
+    /// Sets what is going on; the seconds restart.
     void say(const std::string &what);
-    /// The last line that a program wrote, without an end of line; "" when none wrote anything.
+    /// The last line that a program wrote, without its newline; "" if there was none.
     std::string caught() const;
 
 private:
     void show();
 
-    int screen_ = -1; ///< what standard error was before; -1 when it could not be taken
+    int screen_ = -1; ///< the original standard error; -1 if it could not be captured
     int caught_ = -1;
     bool terminal_ = false;
     std::mutex mutex_;

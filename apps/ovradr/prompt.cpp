@@ -68,7 +68,7 @@ public:
         }
     }
     bool works() const { return changed_; }
-    /// False when a signal came instead.
+    /// False if a signal came instead.
     bool waitForInput() const {
         pollfd input{STDIN_FILENO, POLLIN, 0};
         while (ppoll(&input, 1, nullptr, &mask_) < 0 && errno == EINTR) {
@@ -153,7 +153,7 @@ Expected<Secret> askSecret(const std::string &question) {
     if (!noEcho.waitForInput()) {
         return failure(ExitCode::kFailed, "The question was interrupted.", "");
     }
-    // A terminal gives a line at once, when it is complete.
+    // A terminal delivers a line only once it is complete.
     return readLine(STDIN_FILENO, "the terminal");
 }
 

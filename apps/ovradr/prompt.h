@@ -11,19 +11,19 @@ namespace Ovradr {
 
 using OvraBase::Secret;
 
-/// Where a password comes from. Neither: it is asked for on the terminal.
+/// Where a password comes from. If neither is set, it is prompted for on the terminal.
 struct PasswordSource {
     std::string file;
     bool fromStdin = false;
 };
 
-/// Whether there is somebody to ask: standard input and standard error are a terminal.
+/// Whether a user can be prompted: standard input and standard error are a terminal.
 bool isInteractive();
 
 /// Gets a password: the first line of the file or of standard input, or what is typed in without
 /// echo. An empty one, and one of more than Secret::kMaxSize bytes, is refused.
 /// \param question  e.g. "Password of bob"
-/// \param twice     a password that is typed in has to be typed in again
+/// \param twice     a typed password must be typed again
 [[nodiscard]] Expected<Secret> obtainPassword(const PasswordSource &source,
                                               const std::string &question, bool twice);
 

@@ -24,28 +24,28 @@ struct RemoteLogin {
     bool askOneTimeCode = false;
 };
 
-/// --account, --password-file, --password-stdin, --otp and --otp-prompt; `login` has to live as
-/// long as `command`. \return --account
+/// --account, --password-file, --password-stdin, --otp and --otp-prompt; `login` must outlive
+/// `command`. \return --account
 CLI::Option *addRemoteLoginOptions(CLI::App &command, RemoteLogin &login);
 
-/// --fingerprint; `fingerprint` has to live as long as `command`.
+/// --fingerprint; `fingerprint` must outlive `command`.
 void addFingerprintOption(CLI::App &command, std::string &fingerprint);
 
-/// Finds out where an endpoint is, and makes sure that its key is trusted, before anything secret
-/// is sent to it.
-/// \param conn         may be one of the relay service
-/// \param fingerprint  the key that it must have, or ""
+/// Resolves an endpoint and makes sure that its key is trusted before anything secret is sent to
+/// it.
+/// \param conn         may be a relay endpoint
+/// \param fingerprint  the required key, or ""
 /// \return the direct endpoint
 [[nodiscard]] Expected<OvraDRNode::Conn> meet(const OvraDRNode::Conn &conn,
                                               const std::string &fingerprint);
 
-/// Logs in; answers with the library's error code, 0 when it succeeded.
+/// Logs in; returns the library's error code, 0 on success.
 using LoginAttempt = std::function<int(const std::string &password, const std::string &code)>;
 
-/// Obtains password and one-time code and logs in with them. A one-time code that the other end
-/// asks for is asked for here, once, where there is somebody to ask.
-/// \param host  as the question names the other end
-/// \return why there was no attempt, or no second one; what came of an attempt is not told.
+/// Obtains password and one-time code and logs in with them. If the other end requires a one-time
+/// code, prompts for it once where that is possible.
+/// \param host  the other end's name in the prompt
+/// \return why there was no attempt, or no second one; does not report the result of an attempt.
 [[nodiscard]] Expected<void> logIn(const RemoteLogin &login, const std::string &host,
                                    const LoginAttempt &attempt);
 

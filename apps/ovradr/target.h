@@ -13,13 +13,13 @@ inline constexpr int kDefaultHttpPort = 5000;
 inline constexpr int kDefaultHttpsPort = 5001;
 
 /// Reads an endpoint as people write it: https://HOST[:PORT], http://HOST[:PORT] or flk:ALIAS. HOST
-/// is a name in ASCII, an IPv4 address, or an IPv6 address in brackets, which the endpoint then
-/// holds without them; one endpoint gets one spelling. Anything more (a user, a path, a query) is
-/// refused: it would be lost unseen.
+/// is a name in ASCII, an IPv4 address, or an IPv6 address in brackets, which the endpoint drops;
+/// each endpoint has one spelling. Anything more (a user, a path, a query) is refused: it would be
+/// lost silently.
 [[nodiscard]] Expected<OvraDRNode::Conn> parseTarget(const std::string &text);
 
-/// The endpoint as parseTarget() reads it, its port always shown; of a direct endpoint also the
-/// name under which its key is kept.
+/// The endpoint as parseTarget() reads it, always with its port; for a direct endpoint also the
+/// name under which its key is stored.
 std::string targetText(const OvraDRNode::Conn &conn);
 
 } // namespace Ovradr

@@ -18,11 +18,11 @@ struct HostAddress {
     std::string text; ///< as a number
 };
 
-/// The addresses of a host, each once. Waits as long as the system's resolver does.
+/// The addresses of a host without duplicates. Waits as long as the system's resolver does.
 [[nodiscard]] Expected<std::vector<HostAddress>> resolveHost(const std::string &host, int port);
 
-/// Makes a bare TCP connection to the first of the addresses that takes one, and ends it again; 10
-/// seconds at most for all of them.
+/// Opens a bare TCP connection to the first address that accepts one, and closes it; 10 seconds at
+/// most for all.
 /// \param conn  whose addresses they are, for the message
 /// \return the address that was reached.
 [[nodiscard]] Expected<std::string> connectAny(const std::vector<HostAddress> &addresses,

@@ -10,14 +10,14 @@
 
 namespace Ovradr {
 
-/// How long to wait for an endpoint that shows its key, in seconds.
+/// How long to wait for an endpoint to show its key, in seconds.
 inline constexpr long kMeetSeconds = 10;
 
-/// For command lines: "" when the text is a fingerprint ("SHA256:" and 43 characters of base64, as
-/// setup and `conn local` show it), otherwise what it lacks.
+/// For command lines: "" if the text is a fingerprint ("SHA256:" and 43 characters of base64, as
+/// setup and `conn local` show it), otherwise what is wrong.
 std::string checkFingerprint(const std::string &text);
 
-/// Why an endpoint could not be asked.
+/// Why an endpoint could not be contacted.
 /// \param error  a number of the credential request library
 Refusal endpointFailure(const OvraDRNode::Conn &conn, OvraPlatform::CredError error);
 
@@ -27,10 +27,10 @@ std::string trustText(const OvraPlatform::PeerIdentity &identity);
 std::string trustWord(const OvraPlatform::PeerIdentity &identity);
 
 /// Makes sure that the key of a direct endpoint is trusted before anything secret is sent to it. A
-/// key that is met for the first time is trusted when it is the expected one, or when the person at
-/// the terminal says so.
-/// \param expected  the fingerprint that the key must have, or ""
-/// \return what is in the way; nothing when the key is trusted.
+/// key seen for the first time is trusted if it is the expected one, or if the user at the terminal
+/// confirms it.
+/// \param expected  the required fingerprint, or ""
+/// \return success if the key is trusted, else what is in the way.
 [[nodiscard]] Expected<void> trustPeer(const OvraDRNode::Conn &conn, const std::string &expected);
 
 } // namespace Ovradr

@@ -57,7 +57,7 @@ tl::unexpected<StartError> notSetUp(const std::string &what) {
                                                               "): run ovradr setup"));
 }
 
-/// Whether `ovradr setup` has been here.
+/// Whether `ovradr setup` has run.
 tl::expected<void, StartError> checkSetUp() {
     for (const char *path : {OvraPlatform::kTlsKeyFile, OvraPlatform::kTlsCertificateFile,
                              OvraPlatform::kSealKeyFile}) {
@@ -121,7 +121,7 @@ void Daemon::Impl::addHandlers() {
     addSpeedAPI(registry);
     addNodeSessionAPI(registry);
     addCredentialAPI(registry);
-    // From here on what the library asks of its own appliance is answered in this process.
+    // From here on this process answers the library's calls to its own appliance.
     registry.host();
 }
 

@@ -12,39 +12,40 @@
 
 namespace Ovradrd {
 
-/// What the daemon serves at.
+/// Where the daemon serves.
 struct Settings {
     std::vector<std::string> addresses; ///< numeric; empty: every address of the machine
-    int httpPort = 0;                   ///< 0: any that is free
+    int httpPort = 0;                   ///< 0: any free port
     int httpsPort = 0;
     OvraService::HttpLimits limits;
     std::size_t testFiles = 16; ///< sent at the same time
 };
 
-/// The whole daemon: web server, local socket, queues and handlers. One a process.
+/// The whole daemon: web server, local socket, queues and handlers. One per process.
 class Daemon {
 public:
-    /// How long calls under way may go on once the daemon is to stop.
+    /// How long calls in progress may continue once the daemon stops.
     static constexpr std::chrono::milliseconds kGrace{2500};
 
     explicit Daemon(Settings settings);
     Daemon(const Daemon &) = delete;
     Daemon &operator=(const Daemon &) = delete;
-    /// Stops, and waits for the calls that are still under way.
+    /// Stops, and waits for the calls still in progress.
     ~Daemon();
 
-    /// Takes what `ovradr setup` made, binds the ports and begins to serve.
+    /// Loads what `ovradr setup` created, binds the ports and begins to serve.
     [[nodiscard]] tl::expected<void, OvraService::StartError> start();
-    /// The ports that it serves at, once it has started.
+    /// The ports that it serves on, once started.
     int httpsPort() const;
     int httpPort() const;
 
-    /// What has to be done every few seconds: sweeps expired sessions and has pending releases
+    /// The periodic work of every few seconds: sweeps expired sessions and has pending releases
     /// tried. Returns at once.
     void doPeriodicWork();
 
-    /// Ends serving: calls under way get kGrace, then their callers are told that the daemon stops.
-    /// \return false when calls still run (they wait for another appliance): the process may then
+    /// Ends serving: calls in progress get kGrace, then their callers are told that the daemon
+    /// stops.
+    /// \return false if calls still run (they wait for another appliance): the process may then
     ///         only leave with _exit(2), at once.
     bool stop();
 

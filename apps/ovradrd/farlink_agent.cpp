@@ -35,12 +35,11 @@ constexpr std::chrono::seconds kMaxPause{60};
 constexpr timeval kDialTime{5, 0};
 /// Between two enrolments.
 constexpr std::chrono::hours kMaxStay{1};
-/// Callers taken from one answer; a service that keeps to docs/wire.md never tells more at once.
+/// Callers taken from one answer; a service that follows docs/wire.md never names more at once.
 constexpr Json::ArrayIndex kMaxCallers = 64;
 constexpr std::size_t kCallerSize = 32;
 
-/// Connects to the tunnel port and says which caller is meant; without a descriptor when that
-/// fails.
+/// Connects to the tunnel port and names the caller; without a descriptor on failure.
 OvraService::ConnectedClient dial(const std::string &host, int port, const std::string &caller) {
     OvraService::ConnectedClient call;
     addrinfo hints{};
@@ -85,7 +84,7 @@ struct FarlinkAgent::State {
     Status status;
     std::function<void(OvraService::ConnectedClient)> take; ///< empty once it stops
 
-    /// Waits; false when the agent is to stop.
+    /// Waits; false if the agent must stop.
     bool pause(std::chrono::seconds time) {
         std::unique_lock lock(mutex);
         return !changed.wait_for(lock, time, [this] { return stopping; });
@@ -111,10 +110,10 @@ struct FarlinkAgent::State {
 
 namespace {
 
-/// Nothing, or what is in the way.
+/// Success, or what is in the way.
 using Went = tl::expected<void, FarlinkFailure>;
 
-/// One stay at the relay service, under one alias.
+/// One session with the relay service, under one alias.
 class Stay {
 public:
     explicit Stay(FarlinkSettings settings)
@@ -153,11 +152,11 @@ public:
     }
 
     const FarlinkAgent::Status &status() const { return status_; }
-    /// The lease of the alias has to be renewed now and then.
+    /// The lease of the alias must be renewed now and then.
     bool isOver() const { return std::chrono::steady_clock::now() >= renewAt_; }
 
     /// Waits for callers and connects to each of them.
-    /// \param mayDial  asked before, because the settings may have changed while it waited
+    /// \param mayDial  checked first, because the settings may have changed meanwhile
     template <typename Dialled, typename MayDial>
     Went serve(const MayDial &mayDial, const Dialled &dialled) {
         const FarlinkReply reply = client_.wait(token_);
@@ -213,7 +212,7 @@ void FarlinkAgent::run(const std::shared_ptr<State> &state) {
             pause = std::chrono::seconds(0);
             continue;
         }
-        // Where it was only forgotten, it comes back at once.
+        // If it was only forgotten, it comes back at once.
         state->tell({false, 0, 0, went.error().text});
         stay.reset();
         pause = forgotten && pause.count() == 0 ? kMinPause

@@ -11,9 +11,9 @@
 
 namespace Ovradrd {
 
-/// Keeps the appliance reachable under its alias, for as long as the settings name one: a thread of
-/// its own asks the relay service for callers, and connects to it once for each. A change of the
-/// settings takes effect by itself, within 20 seconds.
+/// Keeps the appliance reachable under its alias as long as the settings name one: its own thread
+/// polls the relay service for callers and connects to it once for each. Changed settings take
+/// effect within 20 seconds.
 class FarlinkAgent {
 public:
     struct Status {
@@ -23,11 +23,11 @@ public:
         std::string problem; ///< why it is not connected; "" while it is
     };
 
-    /// \param take  gets every caller, in the thread of the agent
+    /// \param take  receives every caller, in the agent's thread
     explicit FarlinkAgent(std::function<void(OvraService::ConnectedClient)> take);
     FarlinkAgent(const FarlinkAgent &) = delete;
     FarlinkAgent &operator=(const FarlinkAgent &) = delete;
-    /// The thread may end later: it then touches nothing but its own.
+    /// The thread may outlive the object; it then touches only its own state.
     ~FarlinkAgent();
 
     /// Begins.

@@ -34,7 +34,7 @@ Json::Value busy() {
                     "the appliance has too much to do, nothing was done: try again later");
 }
 
-/// The refusal of a call that everybody on the way could read.
+/// The refusal of a call that anybody on the way could read.
 Json::Value unsealed(OvraPlatform::UnixMillis now) {
     Json::Value message(Json::objectValue);
     message["reason"] = "unsealed";
@@ -80,7 +80,7 @@ Gateway::Gateway(const OvraPlatform::APIRegistry &registry, const OvraPlatform::
 
 void Gateway::serve(OvraService::HttpRequest request,
                     const OvraService::HttpServer::Answer &answer) {
-    // std::function has to be copyable.
+    // std::function must be copyable.
     const auto held = std::make_shared<OvraService::HttpRequest>(std::move(request));
     const bool taken = queues_.quick.submit([this, held, answer] {
         Call call;
@@ -95,7 +95,7 @@ void Gateway::serve(OvraService::HttpRequest request,
     }
 }
 
-/// Reads the call and brings it on its way.
+/// Reads the call and starts processing it.
 void Gateway::open(Call &call, std::string &body) {
     auto wire = OvraPlatform::decodeForm(body);
     OvraBase::wipe(body);
@@ -113,7 +113,7 @@ void Gateway::open(Call &call, std::string &body) {
     }
 }
 
-/// Puts the sealed call in the place of the visible one; false when it was refused.
+/// Replaces the visible call with the sealed one; false if it was refused.
 bool Gateway::unseal(Call &call) {
     const bool sealed = !call.wire.sealed.empty();
     if (!sealed) {
@@ -138,8 +138,7 @@ bool Gateway::unseal(Call &call) {
     return true;
 }
 
-/// Finds out who calls; false when it was refused. A session that is not known is a caller without
-/// one.
+/// Identifies the caller; false if it was refused. An unknown session counts as none.
 bool Gateway::admit(Call &call) {
     if (call.wire.sid.empty()) {
         return true;

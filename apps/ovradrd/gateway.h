@@ -26,24 +26,24 @@ struct WorkQueues {
         2, 64}; ///< log-ins: each hashes a password, with 64 MiB and a tenth of a second
 };
 
-/// The way of a call from its arrival to its reply: read, unseal, find the session and its rights,
-/// choose the queue, run the handler, seal the reply.
+/// The path of a call from arrival to reply: read, unseal, find the session and its rights, choose
+/// the queue, run the handler, seal the reply.
 class Gateway {
 public:
-    /// Everything has to outlive the gateway and the jobs in the queues.
+    /// Everything must outlive the gateway and the jobs in the queues.
     Gateway(const OvraPlatform::APIRegistry &registry, const OvraPlatform::SealKeyPair &keys,
             OvraPlatform::ReplayGuard &guard, LoginApi &api, WorkQueues &queues);
     Gateway(const Gateway &) = delete;
     Gateway &operator=(const Gateway &) = delete;
 
-    /// Carries out the call in `request`. Does not wait; safe for threads.
+    /// Carries out the call in `request`. Does not wait; thread-safe.
     void serve(OvraService::HttpRequest request, const OvraService::HttpServer::Answer &answer);
 
     /// Carries out the call of a local process, with an administrator's rights, and waits for its
-    /// reply. Safe for threads.
+    /// reply. Thread-safe.
     Json::Value serveLocal(const OvraPlatform::LocalCall &call);
 
-    /// Nobody waits for local calls under way any more; they are answered with a refusal.
+    /// Stops waiting for local calls in progress; they are answered with a refusal.
     void leaveLocal() { leaving_ = true; }
 
 private:

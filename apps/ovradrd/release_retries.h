@@ -10,11 +10,11 @@ namespace Ovradrd {
 /// Tries again to release sessions on other nodes that could not be released before.
 class ReleaseRetries {
 public:
-    /// \param queue  where the tries run; has to end before this object does
+    /// \param queue  where the attempts run; must end before this object does
     explicit ReleaseRetries(OvraService::WorkQueue &queue)
         : queue_(queue) {}
 
-    /// Has what is due tried, unless the last round is still under way. Returns at once.
+    /// Queues the due attempts, unless the last round is still in progress. Returns at once.
     void begin();
 
 private:

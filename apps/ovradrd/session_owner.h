@@ -7,21 +7,20 @@
 
 namespace Ovradrd {
 
-/// Who stands behind a session.
+/// The user of a session.
 struct SessionOwner {
     enum class State {
         kFound,
         kUnknown,  ///< no such session, or it has expired, or its account is gone
-        kNotKnown, ///< the stores cannot be read now; the log says why
+        kNotKnown, ///< the stores cannot be read; the log says why
     };
 
     State state = State::kUnknown;
-    OvraPlatform::Account account; ///< as it is now, with kFound
+    OvraPlatform::Account account; ///< its current state, with kFound
 };
 
 /// Looks a session up, as every call does. Each thread keeps the two stores open, because opening
-/// them costs ten times as much as asking them; a file that was replaced, or that failed, is opened
-/// anew.
+/// them costs ten times as much as a query; a file that was replaced or failed is reopened.
 SessionOwner findSessionOwner(const std::string &sid);
 
 } // namespace Ovradrd

@@ -9,18 +9,18 @@
 
 namespace Ovradrd {
 
-/// Below this URL path lie the files by which peers measure the link, each under its absolute path
-/// in the file system: "/webman/modules/ovradr/" + "/usr/ovra/var/ovradr/speedtest/speed-...".
+/// Below this URL path are the files with which peers measure the link, each under its absolute
+/// file system path: "/webman/modules/ovradr/" + "/usr/ovra/var/ovradr/speedtest/speed-...".
 inline constexpr std::string_view kTestFilesUrl = "/webman/modules/ovradr/";
 
-/// Opens the file that a URL path names; nothing when it is any other path. Only the names that
-/// scripts/TestSyncSpeed.sh gives, in its one folder, are opened, no link is followed, and the file
-/// has to be a regular one of our own user: whatever the URL says, nothing else is reached.
-/// \param path  as it is once its escapes were resolved
+/// Opens the test file that a URL path names; std::nullopt for any other path. Opens only names as
+/// given by scripts/TestSyncSpeed.sh, in its one folder, follows no link, and requires a regular
+/// file of our own user: no URL reaches anything else.
+/// \param path  with its escapes resolved
 [[nodiscard]] std::optional<OvraService::ServedFile> openTestFile(std::string_view path);
 
 /// Those files for the HTTP server.
-/// \param atOnce  how many are sent at the same time
+/// \param atOnce  how many are sent at once
 OvraService::FileSource testFiles(std::size_t atOnce);
 
 } // namespace Ovradrd

@@ -16,7 +16,7 @@ constexpr char kUtc[] = "Etc/UTC";
 constexpr char kZoneFolder[] = "/zoneinfo/";
 constexpr std::size_t kMaxName = 64;
 
-/// The text when it has the form of a zone's name, otherwise "".
+/// The text if it has the form of a zone name, otherwise "".
 std::string zoneName(std::string text) {
     text.erase(std::min(text.find_first_of("\r\n"), text.size()));
     const bool named =

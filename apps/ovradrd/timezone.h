@@ -5,7 +5,7 @@
 
 namespace Ovradrd {
 
-/// Where a machine says what its time zone is.
+/// Where a machine's time zone is set.
 struct TimezoneFiles {
     std::string link = "/etc/localtime"; ///< points below a folder "zoneinfo" (tzfile(5))
     std::string name = "/etc/timezone";  ///< holds the name itself, on Debian
@@ -13,7 +13,7 @@ struct TimezoneFiles {
 
 /// The IANA name of the machine's time zone, e.g. "Europe/Zurich": from the environment variable
 /// TZ, the link, or the file, in that order, as the C library finds the zone itself (tzset(3));
-/// "Etc/UTC" when none is set. "" when a zone is set whose name cannot be told.
+/// "Etc/UTC" if none is set. "" if a zone is set but its name cannot be determined.
 std::string localTimezone(const TimezoneFiles &files = {});
 
 } // namespace Ovradrd

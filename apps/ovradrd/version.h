@@ -3,7 +3,7 @@
 
 namespace Ovradrd {
 
-/// Of the whole project; the build says it.
+/// The project's version, set by the build.
 inline constexpr char kVersion[] = OVRADRD_VERSION;
 
 } // namespace Ovradrd

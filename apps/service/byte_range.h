@@ -6,7 +6,7 @@
 
 namespace OvraService {
 
-/// Which part of a file a client gets.
+/// The part of a file that a client gets.
 struct FilePart {
     enum class Kind { kWhole, kPart, kUnsatisfiable };
 
@@ -15,9 +15,9 @@ struct FilePart {
     std::uint64_t length = 0;
 };
 
-/// Reads a header "Range" (RFC 9110, 14.1.2 and 14.2): one range of bytes. Whatever else it may say
-/// is passed over, as a server may, and the client gets the whole file.
-/// \param range  "" where the client sent none
+/// Reads a header "Range" (RFC 9110, 14.1.2 and 14.2): one range of bytes. Anything else is
+/// ignored, as a server may, and the client gets the whole file.
+/// \param range  "" if the client sent none
 FilePart partOf(std::string_view range, std::uint64_t size);
 
 } // namespace OvraService

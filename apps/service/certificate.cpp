@@ -57,7 +57,7 @@ Unexpected unusable(const std::string &path, const std::string &why) {
     return Unexpected({path + " cannot be used: " + why});
 }
 
-/// A key that needs a pass phrase is refused: the daemon has nobody to ask.
+/// A key that needs a pass phrase is refused: the daemon cannot prompt.
 int noPassPhrase(char *, int, int, void *) {
     return -1;
 }

@@ -114,7 +114,7 @@ void Connections::shut(Connection &connection) {
     shutdown(connection.fd, SHUT_RDWR);
 }
 
-/// Shuts down the connection that has been waiting for its client for the longest time.
+/// Shuts down the connection that has waited longest for its client.
 /// \param client  among those of this client; null: of everybody
 bool Connections::makeRoom(const std::string *client) {
     Connection *victim = nullptr;

@@ -13,13 +13,13 @@
 
 namespace OvraService {
 
-/// How many connections there may be, and how long each phase of one may last.
+/// The limit of connections, and of the time each phase may take.
 struct ConnectionLimits {
-    /// From the connection, or the first header, to the end of the request: a time-out of
-    /// inactivity alone would let a client send a byte now and then for ever.
+    /// From the connection, or the first header, to the end of the request: an inactivity time-out
+    /// alone would let a client send a byte now and then forever.
     std::chrono::milliseconds arriving{20'000};
-    /// Between two requests, until the header of the second is complete. Longer than clients of
-    /// this system keep an idle connection, so that it is they who close it.
+    /// Between two requests, until the header of the second is complete. Longer than this system's
+    /// clients keep an idle connection, so that the client closes it.
     std::chrono::milliseconds idle{60'000};
     std::chrono::milliseconds replying{30'000}; ///< from the reply's first byte to its last
     std::chrono::milliseconds sending{600'000}; ///< the same of a test file
@@ -27,11 +27,10 @@ struct ConnectionLimits {
     std::size_t perClient = 768;
 };
 
-/// The open connections, and a thread that shuts down those whose time is over.
+/// The open connections, and a thread that shuts down overdue ones.
 ///
-/// When there are as many as there may be, the one that has been waiting for its client for the
-/// longest time makes room for the next: a client that says nothing, or says it slowly, never keeps
-/// another one out. All operations are safe for threads.
+/// At the limit, the connection that has waited longest for its client makes room for the next: a
+/// silent or slow client never keeps another one out. Thread-safe.
 class Connections {
 public:
     enum class Phase {
@@ -48,9 +47,9 @@ public:
     Connections &operator=(const Connections &) = delete;
     ~Connections();
 
-    /// Whether a connection of the client may be opened; makes room when that is needed.
+    /// Whether a connection of the client may be opened; makes room if needed.
     [[nodiscard]] bool admit(const std::string &client);
-    /// \param fd  stays the caller's, open until close() has returned
+    /// \param fd  owned by the caller, open until close() has returned
     Connection *open(int fd, const std::string &client);
     void close(Connection *connection);
 
@@ -74,7 +73,7 @@ private:
     std::condition_variable stopped_;
     bool stopping_ = false;
     std::unordered_map<const Connection *, std::unique_ptr<Connection>> open_;
-    std::size_t live_ = 0; ///< of the open ones, those that were not shut down
+    std::size_t live_ = 0; ///< open ones not yet shut down
     std::unordered_map<std::string, std::size_t> liveOfClient_;
     std::thread thread_;
 };

@@ -40,8 +40,8 @@ constexpr std::string_view kFormType = "application/x-www-form-urlencoded";
 constexpr unsigned int kThreadsPerListener = 2;
 /// Of one connection, for header and buffers: what does not fit is refused.
 constexpr std::size_t kConnectionMemory = std::size_t{32} * 1024;
-/// Seconds; closes idle connections in good order. A connection on which something stirs is bounded
-/// by the deadlines instead.
+/// Seconds; closes idle connections in good order. An active connection is bounded by the deadlines
+/// instead.
 constexpr unsigned int kInactivity = 40;
 constexpr std::chrono::milliseconds kFlushTime{500};
 /// A body up to this size is taken in and thrown away before it is refused: a client that is still
@@ -55,7 +55,7 @@ std::string errorText(int code, const std::string &message) {
     return OvraDRCore::toString(OvraPlatform::apiError(code, message));
 }
 
-/// Who counts as one client.
+/// What counts as one client.
 std::string clientOf(const sockaddr *address) {
     return OvraBase::clientKey(OvraBase::addressText(address));
 }
@@ -65,8 +65,7 @@ std::string_view headerOf(MHD_Connection *connection, const char *name) {
     return value == nullptr ? std::string_view() : std::string_view(value);
 }
 
-/// 0 when the length is not announced. One that is no number, or too large for one, is more than
-/// any that is allowed.
+/// 0 if the length is not announced. One that is not a number, or overflows, exceeds every limit.
 std::uint64_t announcedLength(MHD_Connection *connection) {
     const std::string_view text = headerOf(connection, MHD_HTTP_HEADER_CONTENT_LENGTH);
     return text.empty() ? 0 : OvraBase::parseNumber<std::uint64_t>(text).value_or(UINT64_MAX);
@@ -118,7 +117,7 @@ struct Exchange {
     std::optional<ServedFile> file; ///< what is replied instead of the document
     FilePart part;
 
-    /// Refuses the request; takes effect when its body is through.
+    /// Refuses the request; takes effect once its body has arrived.
     void refuse(unsigned int httpStatus, int code, const std::string &message) {
         status = httpStatus;
         document = errorText(code, message);
@@ -191,7 +190,7 @@ struct HttpServer::Impl {
     std::mutex mutex;
     std::condition_variable ended;
     std::unordered_map<Exchange *, std::shared_ptr<Exchange>> exchanges;
-    // Last, so that they go first: a stopping daemon calls back.
+    // Last, so that they are destroyed first: a stopping daemon calls back.
     std::vector<std::unique_ptr<Endpoint>> endpoints;
 };
 
@@ -260,7 +259,7 @@ void HttpServer::Impl::onCompleted(void *endpoint, MHD_Connection * /*connection
     }
 }
 
-/// The header is there.
+/// The header has arrived.
 MHD_Result HttpServer::Impl::begin(MHD_Connection *connection, bool secure, std::string_view url,
                                    std::string_view method, void **context) {
     auto exchange = std::make_shared<Exchange>();
@@ -301,7 +300,7 @@ MHD_Result HttpServer::Impl::begin(MHD_Connection *connection, bool secure, std:
         exchanges.emplace(handle, std::move(exchange));
     }
     *context = handle;
-    // A reply before the body is through ends the connection.
+    // A reply before the end of the body ends the connection.
     return handle->discard && length > kMaxThrownAway ? reply(*handle) : MHD_YES;
 }
 
@@ -331,7 +330,7 @@ void HttpServer::Impl::giveBack(Exchange &exchange) {
     exchange.body = std::string();
 }
 
-/// The request is whole.
+/// The request is complete.
 void HttpServer::Impl::handOver(Exchange &exchange) {
     std::shared_ptr<Exchange> shared;
     {
@@ -348,7 +347,7 @@ void HttpServer::Impl::handOver(Exchange &exchange) {
         connections.enter(exchange.watched, Phase::kWorking);
         MHD_suspend_connection(exchange.connection);
     }
-    // From here on the exchange may be answered, and even be gone, at any moment.
+    // From here on the exchange may be answered, or even destroyed, at any moment.
     const Answer answer = [shared](std::string document) { shared->answer(std::move(document)); };
     if (closing) {
         answer(errorText(APIError::kTooBusy, "the daemon stops: try again later"));
@@ -425,7 +424,7 @@ MHD_Result HttpServer::Impl::reply(Exchange &exchange) {
     return MHD_queue_response(exchange.connection, exchange.status, response.get());
 }
 
-/// The reply has left, or the connection is gone.
+/// The reply was sent, or the connection is gone.
 void HttpServer::Impl::end(Exchange *exchange) {
     giveBack(*exchange);
     files -= exchange->file ? 1 : 0;
@@ -503,7 +502,7 @@ OvraBase::Expected<void> HttpServer::start(std::vector<Listener> https, std::vec
 void HttpServer::adopt(ConnectedClient client) {
     for (const auto &endpoint : impl_->endpoints) {
         if (endpoint->secure) {
-            // The library closes it, also when it does not take it.
+            // The library closes it, even if it does not take it.
             MHD_add_connection(endpoint->daemon.get(), client.fd.release(),
                                reinterpret_cast<const sockaddr *>(&client.address), client.size);
             return;

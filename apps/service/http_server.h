@@ -22,7 +22,7 @@ namespace OvraService {
 struct HttpLimits {
     ConnectionLimits connections;
     std::size_t body = std::size_t{1} * 1024 * 1024;
-    /// Of all bodies together that have not been handed over yet.
+    /// For all bodies not handed over yet, together.
     std::size_t bodies = std::size_t{64} * 1024 * 1024;
 };
 
@@ -33,23 +33,23 @@ struct HttpRequest {
     bool secure = false; ///< came over TLS
 };
 
-/// A file that is sent as it is.
+/// A file that is sent unchanged.
 struct ServedFile {
     OvraBase::UniqueFd fd;
     std::uint64_t size = 0;
 };
 
-/// Files that a program serves beside the web API.
+/// Files that a program serves besides the web API.
 struct FileSource {
-    std::string prefix; ///< of the URL paths that it is asked for
-    /// Opens the file that a URL path names, its escapes resolved; nothing when there is none.
+    std::string prefix; ///< of its URL paths
+    /// Opens the file that a URL path names, its escapes resolved; std::nullopt if there is none.
     std::function<std::optional<ServedFile>(std::string_view path)> open;
-    std::size_t atOnce = 0; ///< how many are sent at the same time
-    std::string absentText; ///< what clients are told when there is no such file
-    std::string busyText;   ///< and when as many as may be are being sent
+    std::size_t atOnce = 0; ///< how many are sent at once
+    std::string absentText; ///< what clients are told if there is no such file
+    std::string busyText;   ///< and if too many are being sent already
 };
 
-/// A client whose connection came another way than through a listening socket.
+/// A client whose connection did not come through a listening socket.
 struct ConnectedClient {
     OvraBase::UniqueFd fd;
     sockaddr_storage address{};
@@ -57,17 +57,17 @@ struct ConnectedClient {
 };
 
 /// The HTTP side of a daemon: POST of a form to /webapi/query.cgi, answered with a JSON document,
-/// and GET of the files of a source, where the daemon has one. Everything else is refused here,
-/// also with a JSON document.
+/// and GET of the files of a source, if the daemon has one. Everything else is refused, also with a
+/// JSON document.
 ///
-/// A few threads wait for the network, none for a handler. While a request is being worked on its
-/// connection sleeps.
+/// A few threads wait for the network, none for a handler. A connection sleeps while its request is
+/// handled.
 class HttpServer {
 public:
-    /// Ends the request with a JSON text; called once, in any thread, also after the server is
+    /// Ends the request with a JSON text; called once, in any thread, even after the server is
     /// gone.
     using Answer = std::function<void(std::string document)>;
-    /// Gets every request that is whole, in a thread of the server: it must not wait.
+    /// Receives every complete request, in a thread of the server: it must not wait.
     using Handler = std::function<void(HttpRequest request, Answer answer)>;
 
     HttpServer(Handler handler, const HttpLimits &limits,
@@ -78,16 +78,16 @@ public:
     ~HttpServer();
 
     /// Begins to serve on the sockets.
-    /// \param identity  for those that speak TLS; has to live as long as the server does
+    /// \param identity  for those that speak TLS; must outlive the server
     [[nodiscard]] OvraBase::Expected<void>
     start(std::vector<Listener> https, std::vector<Listener> http, const TlsIdentity &identity);
-    /// Serves a client that is connected already, as one of the https sockets. In any thread while
-    /// the server is started and not stopped.
+    /// Serves an already connected client like one of the https sockets. In any thread while the
+    /// server runs.
     void adopt(ConnectedClient client);
-    /// Takes no further connections and refuses further requests; those under way go on.
+    /// Accepts no further connections and refuses further requests; those in progress go on.
     void quiesce();
-    /// Ends every request still under way with a refusal, gives the replies half a second to leave,
-    /// and closes all connections.
+    /// Ends every request still in progress with a refusal, gives the replies half a second to
+    /// leave, and closes all connections.
     void stop();
 
 private:

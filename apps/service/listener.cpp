@@ -40,12 +40,12 @@ int portOf(int fd) {
     if (getsockname(fd, reinterpret_cast<sockaddr *>(&address.storage), &address.size) != 0) {
         return 0;
     }
-    // The port stands at the same place in both families.
+    // The port is at the same offset in both families.
     return ntohs(reinterpret_cast<const sockaddr_in *>(&address.storage)->sin_port);
 }
 
-/// An open socket at the place; none, and errno says why, when it cannot be.
-/// \param bothFamilies  an IPv6 socket takes IPv4 clients too
+/// An open socket on the address; on failure none, and errno says why.
+/// \param bothFamilies  an IPv6 socket accepts IPv4 clients too
 UniqueFd listenAt(const SocketAddress &place, bool bothFamilies) {
     UniqueFd fd(socket(place.storage.ss_family, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
     if (!fd || !setOption(fd.get(), SOL_SOCKET, SO_REUSEADDR, 1) ||

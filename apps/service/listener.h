@@ -8,15 +8,15 @@
 
 namespace OvraService {
 
-/// A socket that listens, and the port that it got.
+/// A listening socket and its port.
 struct Listener {
     OvraBase::UniqueFd socket;
     int port = 0;
 
     /// \param address  numeric; "" stands for every address of the machine, IPv4 and IPv6. One that
-    ///                 the machine does not have yet is served as soon as it has it.
-    /// \param port     0: any that is free
-    /// \return EADDRINUSE when another program has the port
+    ///                 the machine does not have yet is served as soon as it does.
+    /// \param port     0: any free port
+    /// \return EADDRINUSE if another program has the port
     [[nodiscard]] static OvraBase::Expected<Listener> listen(const std::string &address, int port);
 };
 

@@ -8,7 +8,7 @@
 
 namespace OvraService {
 
-/// At most so many events of one address in a period. Not safe for threads.
+/// Limits the events per address in a period. Not thread-safe.
 class RateLimit {
 public:
     using TimePoint = std::chrono::steady_clock::time_point;
@@ -17,7 +17,7 @@ public:
         : most_(most)
         , period_(period) {}
 
-    /// Counts one event; false when there were too many, and then it does not count.
+    /// Counts one event; false, without counting it, if there were too many.
     [[nodiscard]] bool allow(const std::string &address, TimePoint now) {
         if (windows_.size() >= kMaxAddresses) {
             forgetOld(now);
@@ -40,7 +40,7 @@ private:
         std::erase_if(windows_,
                       [&](const auto &entry) { return now - entry.second.begin >= period_; });
         if (windows_.size() >= kMaxAddresses) {
-            windows_.clear(); // rather than refuse everybody new
+            windows_.clear(); // rather than refuse every new one
         }
     }
 

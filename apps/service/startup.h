@@ -8,13 +8,13 @@
 
 namespace OvraService {
 
-/// What a daemon exits with.
+/// A daemon's exit codes.
 enum class ExitCode : int {
     kOk = 0,
     kFailed = 1,
     kUsage = 2,
     kPortInUse = 3,
-    kNotSetUp = 9, ///< the same number as ovradr has for it
+    kNotSetUp = 9, ///< the same number as in ovradr
 };
 
 /// Why a daemon does not start.
@@ -29,7 +29,7 @@ struct StartError {
         : text(std::move(why.text)) {}
 };
 
-/// Tells on standard error and in the log why `program` does not start. \return its exit status
+/// Reports on standard error and in the log why `program` does not start. \return its exit status
 int reportStartError(const char *program, const StartError &why);
 
 /// Raises the soft limit of open file descriptors to `count`, as far as the hard limit allows; a

@@ -8,7 +8,7 @@
 
 namespace OvraService {
 
-/// What a daemon shows to TLS clients, as PEM text.
+/// A daemon's TLS key and certificate, as PEM text.
 struct TlsIdentity {
     OvraBase::Secret key;
     std::string certificate;

@@ -18,7 +18,7 @@ struct WorkQueue::Impl {
         : capacity(most) {}
 
     void work();
-    /// The next job that is due, or an empty one when the queue stops. Waits.
+    /// Waits for the next due job; an empty one if the queue stops.
     Job take(std::unique_lock<std::mutex> &lock);
 
     const std::size_t capacity;
@@ -46,7 +46,7 @@ WorkQueue::Job WorkQueue::Impl::take(std::unique_lock<std::mutex> &lock) {
         Job job = std::move(next->second);
         waiting.erase(next);
         if (!waiting.empty()) {
-            // Who was woken for it may have been this very thread.
+            // The thread woken for it may have been this one.
             jobsChanged.notify_one();
         }
         return job;
@@ -64,7 +64,7 @@ void WorkQueue::Impl::work() {
         } catch (const std::exception &error) {
             OVRA_ERR("A job failed: [%s]", error.what());
         }
-        // What the job holds goes before it counts as ended.
+        // What the job holds is released before it counts as ended.
         job = nullptr;
         lock.lock();
         --running;
@@ -104,7 +104,8 @@ bool WorkQueue::stop(TimePoint deadline) {
     impl_->stopping = true;
     dropped.swap(impl_->waiting);
     impl_->jobsChanged.notify_all();
-    // Somebody may wait for what a dropped job holds, or hold a lock that its end takes.
+    // Another thread may wait for what a dropped job holds, or hold a lock that its destructor
+    // takes.
     lock.unlock();
     dropped.clear();
     lock.lock();

@@ -8,8 +8,8 @@
 
 namespace OvraService {
 
-/// A fixed number of threads with a bounded queue before them: one kind of work cannot take what
-/// another kind needs, and more work than fits is refused at once instead of piling up.
+/// A fixed number of threads with a bounded queue: one kind of work cannot starve another, and
+/// excess work is refused at once instead of piling up.
 class WorkQueue {
 public:
     using Job = std::function<void()>;
@@ -19,16 +19,16 @@ public:
     WorkQueue(unsigned int threads, std::size_t capacity);
     WorkQueue(const WorkQueue &) = delete;
     WorkQueue &operator=(const WorkQueue &) = delete;
-    /// Stops, and waits for the jobs under way however long they take.
+    /// Stops, and waits for the jobs in progress however long they take.
     ~WorkQueue();
 
-    /// Hands over a job. It runs once, in a thread of the queue; what it throws is logged.
-    /// \param delay  for how long it waits in the queue at least; no thread waits with it
-    /// \return false when the queue is full or the queue stops; the job does not run then.
+    /// Adds a job. It runs once, in a thread of the queue; exceptions are logged.
+    /// \param delay  its minimum time in the queue; occupies no thread
+    /// \return false if the queue is full or the queue stops; the job does not run then.
     [[nodiscard]] bool submit(Job job, std::chrono::milliseconds delay = {});
 
-    /// Takes no more jobs and drops the waiting ones.
-    /// \return whether all jobs under way ended by `deadline`.
+    /// Accepts no more jobs and drops the waiting ones.
+    /// \return whether all jobs in progress ended by `deadline`.
     bool stop(TimePoint deadline);
 
 private:

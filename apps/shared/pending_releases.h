@@ -15,29 +15,29 @@ namespace OvraApps {
 /// Mode 0600: it holds sessions. docs/files.md describes it.
 inline constexpr char kPendingReleasesFile[] = "/usr/ovra/var/ovradr/releases.db";
 
-/// By which both nodes name a session to people: 16 hexadecimal digits of its SHA-256. It opens
-/// nothing.
+/// Both nodes' name for a session towards people: 16 hexadecimal digits of its SHA-256. It grants
+/// no access.
 std::string referenceOf(const std::string &session);
 
-/// A session on another node that nothing needs any more and that perhaps is still there.
+/// A session on another node that is no longer needed but may still exist.
 struct PendingRelease {
     std::string session; ///< a secret
     OvraDRNode::Conn conn;
     std::string nodeId;
     std::string credId;       ///< the credential that it came from
     std::int64_t noted = 0;   ///< seconds of the system clock
-    int attempts = 0;         ///< how often the release was tried in vain
+    int attempts = 0;         ///< failed attempts so far
     std::int64_t nextTry = 0; ///< seconds of the system clock
     int code = 0;             ///< why the last attempt failed; 0: there was none
 
     std::string reference() const { return referenceOf(session); }
 };
 
-/// The releases that could not be done, in a SQLite file that all processes share. An object holds
-/// one connection: short-lived, for one thread. Every change is one transaction.
+/// The releases still to be done, in a SQLite file that all processes share. An object holds one
+/// connection: short-lived, for one thread. Every change is one transaction.
 class PendingReleases {
 public:
-    /// How many are remembered. More are not: they are found by an audit at the other node.
+    /// How many are remembered. Any more are left to an audit at the other node.
     static constexpr int kMaxReleases = 4096;
     /// How long a release that has just been noted is left to the process that noted it, in
     /// seconds: longer than a flow takes.
@@ -48,25 +48,25 @@ public:
 
     using Clock = std::function<std::time_t()>;
 
-    /// Opens the store; makes file and folder when missing.
+    /// Opens the store; creates the file and its folder if missing.
     explicit PendingReleases(const std::string &path = kPendingReleasesFile, Clock clock = {});
 
     bool isOpen() const { return database_.isOpen(); }
-    /// Why the last operation failed, in sentences; "" when it did not.
+    /// Why the last operation failed; "" if it succeeded.
     const std::string &error() const { return database_.error(); }
 
-    /// Remembers a release before its flow begins, so that a flow that is killed leaves it noted.
-    /// One that is known already gets the new endpoint. \return false on failure, and when there
-    /// are kMaxReleases already.
+    /// Remembers a release before its flow begins, so that a flow that is killed leaves it noted. A
+    /// known one gets the new endpoint. \return false on failure, and if there are kMaxReleases
+    /// already.
     [[nodiscard]] bool note(const PendingRelease &release);
     /// The release failed once more: it is due again after a pause. \return false on failure.
     [[nodiscard]] bool postpone(const std::string &reference, int code);
-    /// Forgets the release; one that is not there is forgotten. \return false on failure.
+    /// Forgets the release; a missing one counts as forgotten. \return false on failure.
     [[nodiscard]] bool remove(const std::string &reference);
-    /// All, the oldest first. \return false on failure.
+    /// All, oldest first. \return false on failure.
     [[nodiscard]] bool list(std::vector<PendingRelease> &releases);
-    /// At most `most` of those that are due, the longest due first. Also those whose time lies
-    /// further ahead than any pause reaches: the clock was set back. \return false on failure.
+    /// At most `most` of the due ones, the longest due first, including those due later than any
+    /// pause allows: the clock was set back. \return false on failure.
     [[nodiscard]] bool listDue(std::vector<PendingRelease> &releases, int most);
 
 private:

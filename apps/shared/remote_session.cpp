@@ -18,7 +18,7 @@ SessionAnswer askSession(const OvraDRNode::Conn &conn, const std::string &sessio
     }
     const OvraDRCore::ErrRecorder error = errorOf(sender, response);
     if (!response.isValid()) {
-        // The endpoint, which comes with this code, is known to who asks.
+        // The endpoint, which comes with this code, is known to the caller.
         const bool bare = error.GetErrCode() == OvraDRCore::ERR::kNotConnectable;
         return {SessionState::kSilent, error.GetErrCode(),
                 bare ? Json::Value() : error.GetErrMsg()};

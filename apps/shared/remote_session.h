@@ -9,12 +9,12 @@
 
 namespace OvraApps {
 
-/// What the other node says about a session that it granted to this one.
+/// The other node's view of a session that it granted to this one.
 enum class SessionState {
     kLive,    ///< it is accepted, and may change things there
-    kGone,    ///< the node does not know it, or not any more
-    kRefused, ///< the node knows it but does not let it do anything
-    kSilent,  ///< no answer, or none that can be trusted
+    kGone,    ///< the node does not know it, or no longer
+    kRefused, ///< the node knows it but denies it every right
+    kSilent,  ///< no answer, or an untrusted one
 };
 
 struct SessionAnswer {
@@ -26,8 +26,8 @@ struct SessionAnswer {
 };
 
 /// Asks the node at `conn` about the session, under that session. Takes as long as a request, and
-/// at most 10 seconds where nobody answers; an endpoint that was found dead in the last 5 seconds
-/// is not asked.
+/// at most 10 seconds if there is no answer; an endpoint found dead in the last 5 seconds is not
+/// asked.
 SessionAnswer askSession(const OvraDRNode::Conn &conn, const std::string &session);
 
 } // namespace OvraApps

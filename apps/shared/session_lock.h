@@ -5,11 +5,11 @@
 
 namespace OvraApps {
 
-/// Keeps two kinds of flows of this appliance apart: another node hands out the session of before
-/// as long as it has it, and between that and the row that uses it nobody may release it.
+/// Keeps two kinds of flows of this appliance apart: another node hands out the previous session as
+/// long as it has it, and until the row that uses it is stored nothing may release it.
 ///
-/// Held for the flow's own time and never while somebody is asked for something. Who does not get
-/// it within 30 seconds goes on without it, because a stuck process must not block the others.
+/// Held only during the flow itself, never during a prompt. A flow that does not get it within 30
+/// seconds goes on without it, because a stuck process must not block the others.
 class SessionLock {
 public:
     enum class Purpose {

@@ -24,7 +24,7 @@ Release left(int code, const Json::Value &detail = Json::Value()) {
     return {Release::State::kLeft, code, detail, false};
 }
 
-/// What is the case now; nothing when the session is accepted and no credential uses it.
+/// The current state; std::nullopt if the session is accepted and no credential uses it.
 /// \param whenGone  how a session that is gone counts
 std::optional<Release> look(const Conn &conn, const std::string &session,
                             const std::string &exceptCredId, Release::State whenGone) {
@@ -54,7 +54,7 @@ Release lookAfter(const Conn &conn, const std::string &session, Release::State w
     return look(conn, session, "", whenGone).value_or(left(OvraDRCore::ERR::kSessionNotRemoved));
 }
 
-/// Brings the memory in line with what became of the session.
+/// Updates the note to what happened to the session.
 void settle(PendingReleases &store, const PendingRelease &pending, Release &release) {
     release.remembered =
         release.state == Release::State::kLeft && store.postpone(pending.reference(), release.code);
@@ -126,7 +126,7 @@ Release retryRelease(const PendingRelease &pending, PendingReleases &store) {
         const auto now = look(pending.conn, pending.session, "", Release::State::kReleased);
         if (!now) {
             const SessionLock lock(SessionLock::Purpose::kRelease);
-            // What came of it is looked at below.
+            // Its result is checked below.
             (void)OvraDRNode::CredUtils::NotifyRemoteNodeDeleteSessionIfNotUsed(pending.conn,
                                                                                 pending.session);
         }

@@ -10,11 +10,11 @@
 
 namespace OvraApps {
 
-/// What became of a session on another node once this one needed it no more.
+/// What happened to a session on another node once this one no longer needed it.
 struct Release {
     enum class State {
-        kReleased,     ///< it is gone over there
-        kEndedAlready, ///< it was gone before
+        kReleased,     ///< it was released
+        kEndedAlready, ///< it had already ended
         kKept,         ///< another lasting credential of this node uses it
         kLeft,         ///< it may still be there: the node did not answer, or refused
     };
@@ -28,7 +28,7 @@ struct Release {
 /// "released", "ended_already", "kept" or "left_behind".
 const char *releaseWord(Release::State state);
 
-/// What would become of the session if the credential went now; nothing is changed. kReleased:
+/// What would happen to the session if the credential were deleted now; changes nothing. kReleased:
 /// the node would be told.
 Release foreseeRelease(const OvraDRNode::DRNode &record);
 
@@ -37,10 +37,10 @@ struct ReleasingFlow {
     Release release;
 };
 
-/// Runs a flow of the library that makes the session of `record` superfluous, releasing it where
-/// it can, and finds out what became of the session, which the flow itself does not tell. The
-/// release is noted before the flow and stays noted when it did not come about, also when this
-/// process is killed on the way; memory that cannot be written stops nothing.
+/// Runs a flow of the library that makes the session of `record` superfluous and releases it if it
+/// can, and finds out what happened to the session, which the flow itself does not report. The
+/// release is noted before the flow and stays noted if it failed, even if this process is killed;
+/// if it cannot be noted, the flow runs anyway.
 ///
 /// \param conn  the endpoint over which the flow releases
 ReleasingFlow runReleasing(const OvraDRNode::DRNode &record, const OvraDRNode::Conn &conn,

@@ -35,7 +35,7 @@ std::string checkValue(const std::string &value) {
     return value.size() > kMaxValue ? "a value has at most 64 KiB" : "";
 }
 
-/// Every attribute that the application keeps about the node; `options.node` is a node id.
+/// All of the application's attributes of the node; `options.node` is a node id.
 Expected<std::vector<DRNodeAttr>> read(const AttrOptions &options) {
     std::vector<DRNodeAttr> attrs;
     if (const auto usable = checkNodeDatabase(); !usable) {

@@ -35,17 +35,17 @@ struct CallOptions {
     std::string paramsFile;
     std::string credId;
     bool encrypt = false;
-    long timeout = 0; ///< seconds; 0: as the library has it
+    long timeout = 0; ///< seconds; 0: the library's default
 };
 
 Refusal badParameter(const std::string &text, const std::string &why) {
-    // Of the text only the name: the value may be a secret.
+    // Only the name: the value may be a secret.
     return failure(ExitCode::kUsage,
                    "The parameter \"" + text.substr(0, text.find('=')) + "\" " + why + ".",
                    "Write --param NAME=VALUE, or --param NAME:=JSON.");
 }
 
-/// Adds "name=value" (the value is taken as JSON when it is JSON, otherwise as text) or
+/// Adds "name=value" (the value is taken as JSON if it is valid JSON, otherwise as text) or
 /// "name:=json".
 Expected<void> addParameter(Json::Value &params, const std::string &text) {
     const std::size_t equals = text.find('=');
@@ -138,7 +138,7 @@ Outcome report(const Answer &answer) {
         return failureOf(answer.error);
     }
     Report report;
-    // A granted session is as good as a password.
+    // A granted session is worth as much as a password.
     report.data = OvraDRCore::maskSecrets(response.getData());
     report.text = prettyJson(report.data);
     return report;

@@ -10,11 +10,11 @@
 
 namespace Ovradr {
 
-/// What the command line asks for, ready to run.
+/// The command from the command line, ready to run.
 using Command = std::function<Outcome()>;
 
-// Each adds a family of commands to the program. Parsing one of them sets `chosen`, which has to
-// live as long as `app`.
+// Each adds a family of commands to the program. Parsing one of them sets `chosen`, which must
+// outlive `app`.
 void addSetupCommand(CLI::App &app, Command &chosen);
 void addNodeCommands(CLI::App &app, Command &chosen);
 void addUserCommands(CLI::App &app, Command &chosen);
@@ -28,7 +28,7 @@ void addDoctorCommand(CLI::App &app, Command &chosen);
 void addSpeedCommand(CLI::App &app, Command &chosen);
 void addFarlinkCommands(CLI::App &app, Command &chosen);
 
-/// --password-file and --password-stdin; `source` has to live as long as `command`.
+/// --password-file and --password-stdin; `source` must outlive `command`.
 void addPasswordOptions(CLI::App &command, PasswordSource &source);
 
 } // namespace Ovradr

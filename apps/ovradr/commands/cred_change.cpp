@@ -51,7 +51,7 @@ Refusal setFailure(const DRNodeCredSet &flow, const Conn &conn) {
     return Refusal(found);
 }
 
-/// What an update did, by the row as it stands now.
+/// What an update did, according to the current row.
 Outcome reportUpdate(const DRNode &before, const std::string &account,
                      const ReleasingFlow &result) {
     DRNode now;
@@ -68,7 +68,7 @@ Outcome reportUpdate(const DRNode &before, const std::string &account,
         report.text += "The other appliance granted the same session as before.\n";
     } else {
         addRelease(report.data, result.release);
-        report.text += "The session of before: " + printable(releaseText(result.release, false)) +
+        report.text += "The previous session: " + printable(releaseText(result.release, false)) +
                        (result.release.state == OvraApps::Release::State::kLeft ? "\n" : ".\n");
     }
     return report;
@@ -122,7 +122,7 @@ Outcome set(const SetOptions &options) {
     return proved ? runUpdate(flow, record, *direct, options) : setFailure(flow, *conn);
 }
 
-/// What a deletion did to the row and to the session, or would do.
+/// What a deletion did, or would do, to the row and the session.
 Report reportDeletion(const DRNode &record, const OvraApps::Release &release, bool foreseen) {
     Report report;
     report.data["cred_id"] = record.credId;

@@ -5,7 +5,7 @@
 
 namespace Ovradr {
 
-// Each adds a command to the family `cred`, in the way of addCredCommands().
+// Each adds a command to the family `cred`, like addCredCommands().
 void addCredCreateCommand(CLI::App &family, Command &chosen);
 void addCredSetCommand(CLI::App &family, Command &chosen);
 void addCredDeleteCommand(CLI::App &family, Command &chosen);

@@ -31,7 +31,7 @@ struct ReverseOptions {
     bool dryRun = false;
 };
 
-/// The daemon of this appliance has to run, and the account has to be one that may grant sessions.
+/// This appliance's daemon must run, and the account must be allowed to grant sessions.
 Expected<void> checkAccount(const std::string &account) {
     const OvraDRCore::Response answer =
         OvraDRNode::BaseSender::run(OvraDRNode::WebAPI::OvraCoreUserGetAPI(account));
@@ -53,7 +53,7 @@ Expected<void> checkAccount(const std::string &account) {
                    "The other appliance would get no session with it; use another account.");
 }
 
-/// The endpoints to offer: those that were named, or all of this appliance.
+/// The endpoints to offer: the named ones, or all of this appliance.
 Expected<std::vector<Conn>> offeredConns(const std::vector<std::string> &endpoints) {
     std::vector<Conn> conns;
     for (const std::string &text : endpoints) {

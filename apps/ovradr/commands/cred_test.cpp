@@ -18,7 +18,7 @@ using OvraDRNode::CredNodeSender;
 using OvraDRNode::DRNode;
 namespace WebAPI = OvraDRNode::WebAPI;
 
-/// Why a request got no success.
+/// Why a request failed.
 Refusal refusal(const CredNodeSender &sender, const Response &response) {
     Refusal found = failureOf(errorOf(sender, response));
     found.value().message.insert(0, targetText(sender.getNode().conn) + ": ");

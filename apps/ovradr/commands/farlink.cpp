@@ -44,7 +44,7 @@ Conn serverOf(const FarlinkSettings &settings) {
     return Conn::https(settings.host, settings.port);
 }
 
-/// The service that a person means: https://HOST[:5443].
+/// The service named by the user: https://HOST[:5443].
 Expected<FarlinkSettings> parseServer(const std::string &text) {
     const std::size_t host = text.find("://");
     const bool hasPort =
@@ -66,7 +66,7 @@ Refusal serviceFailure(const FarlinkSettings &settings, const FarlinkFailure &wh
     if (why.error != CredError::kNone) {
         return endpointFailure(serverOf(settings), why.error);
     }
-    // Behind the last colon it says what to do.
+    // The text after the last colon says what to do.
     const std::size_t colon = why.text.rfind(": ");
     Refusal refusal = failure(
         why.code == APIError::kNoPermission ? ExitCode::kNotPermitted : ExitCode::kFailed,
@@ -87,7 +87,7 @@ Expected<FarlinkKey> ownKey() {
     return *key;
 }
 
-/// What the daemon says about the relay service; invalid when no daemon runs.
+/// What the daemon says about the relay service; invalid if no daemon runs.
 Response askDaemon() {
     return OvraDRNode::BaseSender::run(
         OvraDRCore::Request("OVRA.Core.Farlink", 1, "get", Json::Value(Json::objectValue)));
@@ -112,7 +112,7 @@ Outcome enable(const FarlinkOptions &options) {
     Report report;
     report.data["server"] = targetText(serverOf(settings));
     if (!settings.alias.empty()) {
-        // Whether it can be had is told now, and not in the log of the daemon.
+        // Reports now whether it is available, rather than in the daemon's log.
         const Expected<FarlinkKey> key = ownKey();
         if (!key) {
             return Refusal(key.error());

@@ -23,7 +23,7 @@ struct SelectOptions {
 
 constexpr const char *kListHint = "`ovradr session list` shows all.";
 
-/// The node that is meant, "" for ""; it may be one that no credential reaches.
+/// The selected node, "" for ""; possibly one that no credential reaches.
 Expected<std::string> resolveGrantee(const std::vector<GrantedSession> &sessions,
                                      const std::string &text) {
     std::set<std::string> ids;
@@ -36,7 +36,7 @@ Expected<std::string> resolveGrantee(const std::vector<GrantedSession> &sessions
                         : chooseId(ids, text, "node with a session here", kListHint);
 }
 
-/// The session that is meant, "" for "".
+/// The selected session, "" for "".
 Expected<std::string> resolveReference(const std::vector<GrantedSession> &sessions,
                                        const std::string &text) {
     std::set<std::string> references;

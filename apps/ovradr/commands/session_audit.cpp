@@ -45,12 +45,12 @@ struct HeldCred {
     bool temporary = false;
 };
 
-/// What is on either side.
+/// What each side has.
 struct Audit {
     std::string nodeId;
     std::vector<GrantedSession> granted; ///< to that node
     std::vector<HeldCred> held;
-    /// Every session that this node granted to anybody: its account by its reference.
+    /// Every session granted by this node: its account by its reference.
     std::map<std::string, std::string> live;
 
     bool isOrphan(const GrantedSession &session) const {
@@ -91,7 +91,7 @@ Expected<std::vector<HeldCred>> heldCreds(const std::string &nodeId, const std::
             creds.push_back(cred);
         }
     }
-    // Half an answer would make orphans of sessions that are in use.
+    // Half an answer would make sessions in use look like orphans.
     return complete
                ? Expected<std::vector<HeldCred>>(creds)
                : failure(ExitCode::kFailed,

@@ -5,7 +5,7 @@
 
 namespace Ovradr {
 
-// Each adds a command to the family `session`, in the way of addSessionCommands().
+// Each adds a command to the family `session`, like addSessionCommands().
 void addSessionAuditCommand(CLI::App &family, Command &chosen);
 void addSessionPendingCommand(CLI::App &family, Command &chosen);
 

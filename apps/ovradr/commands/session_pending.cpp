@@ -36,7 +36,7 @@ Json::Value toJson(const PendingRelease &release) {
 }
 
 std::vector<std::string> toRow(const PendingRelease &release) {
-    // Noted by a command that is still under way, or was killed.
+    // Noted by a command that is still in progress, or was killed.
     const bool fresh = release.attempts == 0;
     return {release.reference(),
             release.nodeId,
@@ -81,7 +81,7 @@ Outcome forget(PendingReleases &store, const std::vector<PendingRelease> &releas
     return report;
 }
 
-/// Tries each once, whatever its next time is, and tells what became of it.
+/// Tries each once, even if not due, and reports the result.
 Report retry(PendingReleases &store, const std::vector<PendingRelease> &releases) {
     Report report;
     report.data["tried"] = Json::Value(Json::arrayValue);

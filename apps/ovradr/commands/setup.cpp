@@ -30,7 +30,7 @@ namespace Setting = OvraPlatform::Setting;
 
 constexpr int kMaxInterfaces = 32;
 
-/// The settings that were given; those that were not stay as they are.
+/// The given settings; the others stay as they are.
 struct Settings {
     std::optional<std::string> hostname;
     std::optional<std::string> serial;
@@ -59,7 +59,7 @@ Expected<void> makeFolders() {
     return {};
 }
 
-/// Writes the settings that were given; the others keep their lines.
+/// Writes the given settings; the others keep their lines.
 Expected<SetUpStep> writeSettings(const Settings &settings) {
     std::vector<std::pair<const char *, std::string>> given;
     const auto add = [&given](const char *key, const std::optional<std::string> &value) {
@@ -88,7 +88,7 @@ Expected<SetUpStep> writeSettings(const Settings &settings) {
     return SetUpStep{"settings", !given.empty(), OvraPlatform::kConfigFile + names};
 }
 
-/// The settings that will hold; refused when the appliance could not serve with them.
+/// The resulting settings; refused if the appliance could not serve with them.
 Expected<ApplianceConfig> checkSettings(const Settings &settings) {
     ApplianceConfig config = OvraPlatform::readApplianceConfig();
     config.httpPort = settings.httpPort.value_or(config.httpPort);

@@ -33,14 +33,13 @@ struct SpeedOptions {
     int seconds = 15;
 };
 
-/// One endpoint of this appliance, as it went.
+/// The result for one endpoint of this appliance.
 struct Tried {
     std::string endpoint;
     Expected<std::string> speed;
 };
 
-/// What a script said before it gave up, without its own name; with `fallback` when it said
-/// nothing.
+/// A script's last message before it failed, without its own name; `fallback` if there are none.
 std::string reasonOf(const std::string &said, const std::string &fallback) {
     const std::size_t colon = said.find(".sh: ");
     const std::string reason = colon == std::string::npos ? said : said.substr(colon + 5);
@@ -86,7 +85,7 @@ Refusal noneWorked(const std::vector<Tried> &tried) {
                        "`ovradr conn local` shows its endpoints.");
     }
     Failure last = tried.back().speed.error();
-    // The other appliance was not even asked.
+    // The other appliance was not asked.
     if (last.exit != ExitCode::kFailed) {
         return Refusal(last);
     }

@@ -34,7 +34,7 @@ Expected<void> checkOpen(const AccountStore &store) {
     return store.isOpen() ? Expected<void>() : storeFailure(ExitCode::kNotSetUp, store.error());
 }
 
-/// The account, or why it cannot be had.
+/// The account, or why it is not available.
 Expected<Account> findAccount(AccountStore &store, const std::string &name) {
     if (const auto open = checkOpen(store); !open) {
         return Refusal(open.error());
@@ -61,7 +61,7 @@ Json::Value toJson(const Account &account) {
     return json;
 }
 
-/// What a change of an account tells.
+/// The report of a changed account.
 Outcome changed(AccountStore &store, const std::string &name, const std::string &sentence) {
     return findAccount(store, name).map([&sentence](const Account &account) {
         Report report;
@@ -71,8 +71,8 @@ Outcome changed(AccountStore &store, const std::string &name, const std::string 
     });
 }
 
-/// Ends every session of the account: whoever has one would go on acting as the user. A session
-/// that a node was granted is among them.
+/// Ends every session of the account, including those granted to nodes: their holders could still
+/// act as the user.
 Expected<int> endSessions(const std::string &user) {
     SessionStore sessions;
     int ended = 0;
@@ -207,8 +207,7 @@ Outcome setDisabled(AccountStore &store, const Account &account, const UserOptio
                             : " is disabled; its sessions rest until it is enabled again."));
 }
 
-/// Disabled first: nothing is granted to it meanwhile, and a removal that broke off can be
-/// repeated.
+/// Disabled first: nothing is granted to it meanwhile, and an interrupted removal can be repeated.
 Outcome remove(AccountStore &store, const Account &account, const UserOptions & /*options*/) {
     if (!store.setDisabled(account.name, true)) {
         return storeFailure(ExitCode::kFailed, store.error());
@@ -228,7 +227,7 @@ Outcome remove(AccountStore &store, const Account &account, const UserOptions & 
     return report;
 }
 
-/// Does something about the account that is named.
+/// Performs an operation on the named account.
 template <Outcome (*kAction)(AccountStore &, const Account &, const UserOptions &)>
 Outcome onAccount(const UserOptions &options) {
     AccountStore store;
@@ -239,7 +238,7 @@ Outcome onAccount(const UserOptions &options) {
 
 using UserAction = Outcome (*)(const UserOptions &);
 
-/// A command of the family that is about one account.
+/// A command of the family for one account.
 CLI::App *addUserCommand(CLI::App &family, const char *name, const char *description,
                          const std::shared_ptr<UserOptions> &options, Command &chosen,
                          UserAction action) {

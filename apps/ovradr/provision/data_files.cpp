@@ -17,13 +17,13 @@ constexpr const char *kDataFolder = "ovradrnode";
 /// Where the library runs them.
 constexpr const char *kScriptFolder = "/usr/ovra/ovradr/sbin";
 
-/// Makes `path` a link to `target`; true when it was none before.
+/// Makes `path` a link to `target`; true if it was not one before.
 Expected<bool> linkTo(const std::string &target, const fs::path &path) {
     std::error_code error;
     if (fs::read_symlink(path, error) == target || fs::is_regular_file(fs::symlink_status(path))) {
         return false;
     }
-    // Made aside and renamed: there is never a moment without a script.
+    // Created aside and renamed, so that there is always a script.
     const std::string aside = path.string() + "." + std::to_string(getpid());
     unlink(aside.c_str());
     if (symlink(target.c_str(), aside.c_str()) != 0 || rename(aside.c_str(), path.c_str()) != 0) {

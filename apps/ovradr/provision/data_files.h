@@ -8,13 +8,12 @@
 
 namespace Ovradr {
 
-/// Finds a file that was installed with the program: beside it (../share/ovradrnode), else where it
-/// was installed.
+/// Finds a file that was installed with the program: beside it (../share/ovradrnode), else at the
+/// installed location.
 [[nodiscard]] Expected<std::string> findDataFile(const std::string &name);
 
-/// Puts the scripts that measure the speed of a link where the library looks for them, as links to
-/// the installed ones, so that they are renewed with the program. Files that somebody else has put
-/// there stay.
+/// Links the scripts that measure the speed of a link to where the library looks for them, so that
+/// they are updated with the program. Foreign files there stay.
 [[nodiscard]] Expected<SetUpStep> provisionScripts();
 
 } // namespace Ovradr

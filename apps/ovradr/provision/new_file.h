@@ -7,18 +7,18 @@
 
 namespace Ovradr {
 
-/// What a step of the set-up did.
+/// The result of a set-up step.
 struct SetUpStep {
     std::string what;   ///< e.g. "node database"
-    bool made = false;  ///< otherwise it was there, and stays as it was
-    std::string detail; ///< where it is, and what else is worth knowing
+    bool made = false;  ///< otherwise it existed and is unchanged
+    std::string detail; ///< its location and other details
 };
 
-/// Takes away what others may do with a file that is only ours.
-/// \return whether they could do something
+/// Removes other users' permissions on a private file.
+/// \return whether there were any
 [[nodiscard]] Expected<bool> makePrivate(const std::string &path);
 
-/// The failure of an operation on a file of this appliance, with the reason that errno gives.
+/// The failure of an operation on a file of this appliance, with the reason from errno.
 Refusal fileFailure(const std::string &path, int error);
 
 } // namespace Ovradr

@@ -50,7 +50,7 @@ Refusal foreignDatabase(const std::string &path) {
                     "Restore it from a backup, or move it away and run `ovradr setup`.");
 }
 
-/// The number that a query gives; nothing when it cannot be run or gives none.
+/// The number that a query gives; std::nullopt if it cannot be run or gives none.
 std::optional<int> numberOf(sqlite3 *database, const char *sql) {
     const OvraBase::SqliteStatement statement = OvraBase::prepareSqlite(database, sql);
     if (!statement || sqlite3_step(statement.get()) != SQLITE_ROW ||
@@ -93,7 +93,7 @@ Expected<std::string> readSchema(const std::string &schemaFile) {
     return *text;
 }
 
-/// Fills an empty database; true when it was empty.
+/// Fills an empty database; true if it was empty.
 Expected<bool> fill(sqlite3 *database, const std::string &path, const std::string &schema) {
     if (!execute(database, "BEGIN IMMEDIATE")) {
         return sqliteFailure(path, database);
@@ -112,7 +112,7 @@ Expected<bool> fill(sqlite3 *database, const std::string &path, const std::strin
     return execute(database, "COMMIT") ? Expected<bool>(empty) : sqliteFailure(path, database);
 }
 
-/// SQLite would make a file that others can read.
+/// SQLite would create a file readable by others.
 Expected<void> touchPrivate(const std::string &path) {
     const OvraBase::UniqueFd fd(open(path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0600));
     if (!fd) {

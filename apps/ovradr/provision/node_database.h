@@ -8,21 +8,20 @@
 
 namespace Ovradr {
 
-/// The schema that node.sql makes and that this program works with.
+/// The schema version that node.sql creates and this program uses.
 inline constexpr int kSchemaVersion = 1;
 
 /// The node database of this appliance.
 std::string nodeDatabasePath();
 
-/// Makes the node database, mode 0600, or checks the one that is there. The schema is applied in
-/// one transaction, so that a crash leaves an empty file, which the next call fills; what holds
-/// anything is never changed. Refused: another program's file, and a schema that is newer than this
-/// program.
+/// Creates the node database, mode 0600, or checks the existing one. The schema is applied in one
+/// transaction, so that a crash leaves an empty file, which the next call fills; a non-empty one is
+/// never changed. Refuses another program's file and a schema newer than this program.
 [[nodiscard]] Expected<SetUpStep> provisionNodeDatabase(const std::string &path,
                                                         const std::string &schemaFile);
 
-/// Whether the node database can be used; the library itself reports a database that it cannot read
-/// as one without rows.
+/// Whether the node database can be used; the library itself treats an unreadable database as one
+/// without rows.
 [[nodiscard]] Expected<void> checkNodeDatabase();
 
 } // namespace Ovradr

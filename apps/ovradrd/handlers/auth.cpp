@@ -47,7 +47,7 @@ std::string countedAccount(const Json::Value &params) {
     return OvraDRCore::memberString(params, kAccount).substr(0, Params::kMaxAccount);
 }
 
-/// What a log line shows: people sometimes type their password in the place of the account.
+/// The form for log lines: people sometimes type their password as the account.
 std::string loggable(const std::string &account) {
     return AccountStore::isName(account) ? account : "(no account name)";
 }
@@ -97,7 +97,7 @@ void LoginApi::forgive(const Json::Value &params, const std::string &address) {
 
 Json::Value LoginApi::login(const Json::Value &params, const APICaller &caller) {
     if (caller.local) {
-        // Nor was it admitted: it came in no queue of its own, and counts for nothing.
+        // It was not admitted either: it was not in the log-in queue, and does not count.
         return apiError(OvraPlatform::APIError::kBadRequest, "a local caller needs no log-in");
     }
     Params in(params);

@@ -17,22 +17,22 @@ namespace Ovradrd {
 /// "OVRA.Core.Auth": log-in and log-out. Keeps count of the failed log-ins.
 class LoginApi {
 public:
-    /// How long a session of a log-in lasts, in seconds.
+    /// The lifetime of a log-in's session, in seconds.
     static constexpr int kSessionTime = 1800;
-    /// The application that its sessions belong to.
+    /// The application its sessions belong to.
     static constexpr char kApplication[] = "ovradrd";
 
-    /// Whether the call is a log-in: it hashes a password, so it has a queue of its own.
+    /// Whether the call is a log-in, which has its own queue because it hashes a password.
     static bool isLogin(const OvraPlatform::APICall &call);
 
     /// Asks for a log-in with these parameters from this address.
-    /// \return how long it has to wait; nothing: refuse it.
+    /// \return how long it must wait; std::nullopt: refuse it.
     std::optional<std::chrono::milliseconds> admit(const Json::Value &params,
                                                    const std::string &address);
-    /// The log-in that was admitted is not carried out after all.
+    /// The admitted log-in is not carried out after all.
     void forgive(const Json::Value &params, const std::string &address);
 
-    /// Registers the methods; the api has to outlive the registry.
+    /// Registers the methods; the api must outlive the registry.
     void addTo(OvraPlatform::APIRegistry &registry);
 
 private:

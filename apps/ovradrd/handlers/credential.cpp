@@ -39,7 +39,7 @@ Json::Value noSuchCredential() {
     return apiError(ERR::kCredNotFound, "this node has no such credential: list those that it has");
 }
 
-/// Where other nodes reach this one; an error reply in `refusal` when there is no such place.
+/// Where other nodes reach this one; an error reply in `refusal` if there is no such place.
 std::vector<Conn> localConns(Json::Value &refusal) {
     std::vector<Conn> conns = DRNode::getLocalConn();
     if (conns.empty()) {
@@ -51,14 +51,15 @@ std::vector<Conn> localConns(Json::Value &refusal) {
     return conns;
 }
 
-/// Has the node behind a credential make one back to this node.
+/// Has the node behind a credential create one back to this node.
 bool reverse(CredReverseCreate &flow, const std::string &credId, const std::string &account,
              const std::vector<Conn> &conns) {
     return flow.setCredId(credId) && flow.setLocalAccount(account) && flow.addLocalConns(conns) &&
            flow.process() && flow.getCredInfo().isObject();
 }
 
-/// A credential in both directions is one whole: when the way back fails, the way there goes too.
+/// A credential in both directions is one unit: if the way back fails, the way there is removed
+/// too.
 Json::Value addReverse(Json::Value data, const std::string &credId, const APICaller &caller,
                        const std::vector<Conn> &conns) {
     CredReverseCreate flow;
@@ -75,8 +76,8 @@ Json::Value addReverse(Json::Value data, const std::string &credId, const APICal
     return apiSuccess(data);
 }
 
-/// Makes the credential, unless it would be one to this node itself.
-/// \return an error reply; null when it was made
+/// Creates the credential, unless it would be for this node itself.
+/// \return an error reply; null if it was created
 Json::Value carryOut(OvraDRNode::CredCreate &flow, const Proof &proof) {
     if (!proof.giveTo(flow) || !flow.getRemoteNodeInfo()) {
         return flowError(flow, ERR::kCredIncomplete);
@@ -157,7 +158,7 @@ void appendRecords(Json::Value &list, const std::string &nodeId, DRNodeDB::CredT
     }
     for (const DRNode &record : records) {
         Json::Value entry = record.toJson();
-        // By which the node that granted it names the session; it opens nothing.
+        // The granting node's name for the session; it grants no access.
         entry["session_reference"] = OvraApps::referenceOf(record.session);
         entry["temporary"] = type == DRNodeDB::CRED_TYPE_TEMP;
         list.append(entry);
@@ -171,7 +172,7 @@ Json::Value list(const Json::Value &params, const APICaller & /*caller*/) {
     if (!in.ok()) {
         return in.error();
     }
-    // Unreadable tables read as empty ones, and who audits sessions would end those in use.
+    // Unreadable tables read as empty ones, and a session audit would end those in use.
     if (OvraDRNode::NodeDBHandler::GetHandler().GetSchemaVersion() < 0) {
         return apiError(OvraPlatform::APIError::kInternal,
                         "the node database cannot be read now: see the log of the appliance");
@@ -184,7 +185,7 @@ Json::Value list(const Json::Value &params, const APICaller & /*caller*/) {
 }
 
 /// A new log-in, perhaps over another endpoint, for an existing credential.
-/// \param dryRun  whether it only has to be tried
+/// \param dryRun  whether it is only tried
 Json::Value set(const Json::Value &params, bool dryRun) {
     Params in(params);
     const std::string credId = readCredId(in);
@@ -214,7 +215,7 @@ Json::Value set(const Json::Value &params, bool dryRun) {
     return apiSuccess(record.toJson());
 }
 
-/// A credential that is not there is deleted too.
+/// A missing credential counts as deleted.
 Json::Value remove(const Json::Value &params, const APICaller & /*caller*/) {
     Params in(params);
     const std::string credId = readCredId(in);

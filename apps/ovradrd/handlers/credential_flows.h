@@ -25,8 +25,8 @@ struct RemoteLogin {
     explicit RemoteLogin(Params &in);
 };
 
-/// How a new credential is proved to the other node: the parameter "auth" names which of the other
-/// parameters do that.
+/// How a new credential is proved to the other node: the parameter "auth" says which other
+/// parameters are the proof.
 struct Proof {
     enum class Kind { kAccount, kSession, kCredId };
 
@@ -39,7 +39,7 @@ struct Proof {
     /// \param withCredId  whether "cred_id" may be the proof
     Proof(Params &in, bool withCredId);
 
-    /// Gives the proof to the flow; false: the flow says why not.
+    /// Gives the proof to the flow; if false, the flow says why.
     [[nodiscard]] bool giveTo(OvraDRNode::CredCreate &flow) const;
 };
 

@@ -7,13 +7,13 @@
 
 namespace Ovradrd {
 
-/// The error reply of an operation of the library that failed: its code, and its message or else
-/// the name of the code.
+/// The error reply for a failed library operation: its code, and its message or the name of the
+/// code.
 ///
-/// \param otherwise  the code when the operation recorded none
+/// \param otherwise  the code if the operation recorded none
 ///
 /// A remote node's own refusals 105 and 119 concern the credential that was used there. They come
-/// back as kNoPrivilege, so that the caller does not take them for refusals of its own session.
+/// back as kNoPrivilege, so that the caller does not mistake them for refusals of its own session.
 Json::Value flowError(const OvraDRCore::ErrRecorder &flow, int otherwise);
 
 } // namespace Ovradrd

@@ -6,18 +6,18 @@
 #include <ovraplatform/api_registry.h>
 #include <ovraplatform/sealed_box.h>
 
-/// What the daemon answers, one function a family of calls. docs/ovradrd.md lists parameters,
-/// rights and replies.
+/// The daemon's calls, one function per family. docs/ovradrd.md lists parameters, rights and
+/// replies.
 namespace Ovradrd {
 
-/// "OVRA.Core.Encryption": the key that requests are sealed to. \param keys, guard  have to outlive
+/// "OVRA.Core.Encryption": the key that requests are sealed to. \param keys, guard  must outlive
 /// the registry
 void addEncryptionAPI(OvraPlatform::APIRegistry &registry, const OvraPlatform::SealKeyPair &keys,
                       OvraPlatform::ReplayGuard &guard);
 /// "OVRA.Core.User": accounts of the appliance.
 void addUserAPI(OvraPlatform::APIRegistry &registry);
-/// "OVRA.Core.Farlink": how this appliance is reached through the relay service. \param agent  has
-/// to outlive the registry
+/// "OVRA.Core.Farlink": how this appliance is reached through the relay service. \param agent  must
+/// outlive the registry
 void addFarlinkAPI(OvraPlatform::APIRegistry &registry, const FarlinkAgent &agent);
 /// "OVRA.DR.Node": facts about this node, and tests.
 void addNodeAPI(OvraPlatform::APIRegistry &registry);

@@ -29,11 +29,11 @@ using OvraPlatform::apiSuccess;
 constexpr std::size_t kMaxFacts = 32;
 constexpr std::size_t kMaxFact = 64;
 constexpr std::size_t kMaxEndpoints = 32;
-/// After this time no further endpoint is probed, which may take 10 seconds each: who asks waits 60
+/// After this time no further endpoint is probed, which may take 10 seconds each: callers wait 60
 /// seconds for the answer.
 constexpr std::chrono::seconds kProbeTime{45};
 
-/// What a caller may ask for beside the facts that every answer has.
+/// What callers may request besides the facts in every answer.
 const std::map<std::string, std::function<std::string()>> &furtherFacts() {
     static const std::map<std::string, std::function<std::string()>> kFacts = {
         {"timezone", [] { return localTimezone(); }},

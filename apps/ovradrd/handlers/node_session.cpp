@@ -14,7 +14,7 @@ using OvraDRNode::NodeSession;
 using OvraPlatform::APICaller;
 
 /// How long a session that is tied to no node lasts, in seconds: as long as a task that needs a
-/// temporary credential reasonably takes, because nobody gives it back when the task was killed.
+/// temporary credential reasonably takes, because a killed task never gives it back.
 constexpr unsigned int kTemporaryTime = 3600;
 
 Json::Value granted(const NodeSession &sessions, const std::string &session) {
@@ -83,7 +83,7 @@ void addNodeSessionAPI(OvraPlatform::APIRegistry &registry) {
     registry.add(kApi, 2, "create", APIRight::kAdministrator, APIQueue::kQuick, create);
     registry.add(kApi, 1, "temp_create", APIRight::kAdministrator, APIQueue::kQuick,
                  createTemporary);
-    // Who knows a session id may act as its user anyway.
+    // The holder of a session id may act as its user anyway.
     registry.add(kApi, 1, "get", APIRight::kSession, APIQueue::kQuick, get);
     registry.add(kApi, 1, "delete", APIRight::kAdministrator, APIQueue::kQuick, remove);
 }

@@ -9,11 +9,11 @@
 
 namespace Ovradrd {
 
-/// Carries a whole request of the caller to the node of a credential, over that credential.
+/// Relays a whole request of the caller to the node of a credential, over that credential.
 class RelayOperation : public OvraDRNode::NodeOperationDispatcher {
 public:
     /// \param via      the credential
-    /// \param request  what is carried; a relay is not carried any further
+    /// \param request  the relayed request; a relay is not relayed further
     RelayOperation(const OvraDRNode::DRNode &via, const OvraDRCore::Request &request);
     ~RelayOperation() override;
 

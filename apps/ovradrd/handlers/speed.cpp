@@ -21,7 +21,7 @@ using OvraPlatform::apiError;
 
 constexpr std::size_t kMaxUrl = 2048;
 constexpr int kMaxRetries = 10;
-/// Who asks waits 60 seconds for the answer.
+/// Callers wait 60 seconds for the answer.
 constexpr int kMaxSeconds = 45;
 constexpr int kUsualSeconds = 15;
 constexpr char kSchemeEnd[] = "://";
@@ -31,7 +31,7 @@ struct Bounds {
     int seconds = 0;
 };
 
-/// What exceeds a bound counts as the bound, because callers do not know them.
+/// Excess values are clamped, because callers do not know the bounds.
 Bounds boundsIn(Params &in) {
     Bounds bounds;
     bounds.retries = std::min(in.number("retries"), kMaxRetries);
@@ -40,8 +40,8 @@ Bounds boundsIn(Params &in) {
     return bounds;
 }
 
-/// The URL as a download takes it: an alias of the relay service is replaced by where it is reached
-/// now, and a bare IPv6 address gets its brackets. "" when it is no URL of a test.
+/// The URL for a download: a relay alias is replaced by its current address, and a bare IPv6
+/// address gets brackets. "" if it is not a test URL.
 std::string downloadableUrl(const std::string &url) {
     const std::size_t host = url.find(kSchemeEnd);
     const std::size_t path = host == std::string::npos ? host : url.find('/', host + 3);
@@ -73,7 +73,7 @@ Json::Value speedReply(const OvraDRNode::Node &test, const std::string &speed, c
     return OvraPlatform::apiSuccess(data);
 }
 
-/// How fast this node downloads what another one offers.
+/// How fast this node downloads from another one.
 Json::Value testDownloadSpeed(const Json::Value &params, const APICaller & /*caller*/) {
     Params in(params);
     const std::string url = in.text("url", kMaxUrl);

@@ -1,7 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
-/// Names that more than one family of calls uses.
+/// Names used by more than one family of calls.
 namespace Ovradrd {
 
 inline constexpr char kNodeApi[] = "OVRA.DR.Node";

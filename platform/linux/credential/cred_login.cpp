@@ -34,7 +34,7 @@ WireCall authCall(const char *method) {
     return call;
 }
 
-/// The document that stands for an answer when there was none.
+/// The document used if there was no answer.
 Json::Value noAnswer(CredError error) {
     Json::Value message(Json::objectValue);
     message["cred_error"] = static_cast<int>(error);

@@ -109,7 +109,7 @@ void takeSettings(const Lines &lines, ApplianceConfig &config) {
     readText(lines, Setting::kSerial, kMaxSerial, isPrintable, config.serial, config.problems);
 }
 
-/// The settings are read often: the same problems are logged once a process.
+/// The settings are read often: the same problems are logged once per process.
 void logOnce(const std::string &path, const std::vector<std::string> &problems) {
     static std::mutex mutex;
     static std::string lastLogged;

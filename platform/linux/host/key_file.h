@@ -6,11 +6,11 @@
 #include <cstddef>
 #include <string>
 
-// A secret key in a file of mode 0600: one line, a heading that says which kind it is, and the
-// bytes in base64url.
+// A secret key in a file of mode 0600: one line, a heading that names its kind, and the bytes in
+// base64url.
 namespace OvraPlatform {
 
-/// What a kind of key file looks like.
+/// The format of a kind of key file.
 struct KeyFileKind {
     const char *heading;
     std::size_t size;   ///< bytes of the key
@@ -22,8 +22,8 @@ struct KeyFileKind {
 [[nodiscard]] OvraBase::Expected<void> readKeyFile(const std::string &path, const KeyFileKind &kind,
                                                    unsigned char *key);
 
-/// Makes the file, whole and durable. One that is there stays as it is, also when another process
-/// makes it at the same time; that is no failure.
+/// Creates the file atomically and durably. An existing one is kept, even if another process
+/// creates it at the same time; that is not a failure.
 [[nodiscard]] OvraBase::Expected<void>
 createKeyFile(const std::string &path, const KeyFileKind &kind, const unsigned char *key);
 

@@ -26,7 +26,7 @@ std::string_view trim(std::string_view text) {
     return text.substr(first, text.find_last_not_of(kBlanks) - first + 1);
 }
 
-/// Where a comment starts, which has a blank before it; the end when there is none.
+/// Where a comment starts, which has a blank before it; the end if there is none.
 std::size_t findComment(std::string_view text) {
     for (std::size_t i = 1; i < text.size(); ++i) {
         if (text[i] == '#' && kBlanks.find(text[i - 1]) != std::string_view::npos) {
@@ -36,7 +36,7 @@ std::size_t findComment(std::string_view text) {
     return text.size();
 }
 
-/// The value behind the sign `=`; nothing when it is not well-formed.
+/// The value behind the sign `=`; std::nullopt if it is not well-formed.
 std::optional<std::string> parseValue(std::string_view text) {
     const std::size_t first = text.find_first_not_of(kBlanks);
     if (first == std::string_view::npos || text[first] != '"') {
@@ -70,7 +70,7 @@ void parseLine(std::string_view text, KeyValueLine &line) {
     }
 }
 
-/// `format` with its two %s replaced; nothing when it has other conversions or not just two.
+/// `format` with its two %s replaced; std::nullopt if it has other conversions or not just two.
 std::optional<std::string> formatLine(std::string_view format, const char *key, const char *value) {
     const char *const arguments[] = {key, value};
     std::size_t used = 0;

@@ -28,7 +28,7 @@ std::vector<KeyValueLine> parseKeyValueLines(std::string_view text);
 [[nodiscard]] std::optional<std::string> findKeyValue(std::string_view text, std::string_view key);
 
 /// `text` with `line` (which ends in a newline) in place of the line that findKeyValue() takes, or
-/// at the end when there is none. Every other line stays as it is, byte for byte.
+/// at the end if there is none. Every other line stays as it is, byte for byte.
 std::string replaceKeyValue(std::string_view text, std::string_view key, std::string_view line);
 
 } // namespace OvraPlatform

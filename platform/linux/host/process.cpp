@@ -26,8 +26,8 @@ namespace {
 
 constexpr std::size_t kMaxArguments = 255;
 
-/// Which program is behind which stream. Never destroyed: a thread may still close a stream while
-/// the process ends.
+/// The program behind each stream. Never destroyed: a thread may still close a stream while the
+/// process ends.
 struct RunningPrograms {
     std::mutex mutex;
     std::map<FILE *, pid_t> pids;

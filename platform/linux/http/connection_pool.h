@@ -15,11 +15,11 @@
 
 namespace OvraPlatform {
 
-/// The idle connections of this process, judged and ready for the next request to their endpoint.
+/// The idle connections of this process, verified and ready for the next request to their endpoint.
 ///
 /// Safe for threads. A forked child starts with none: it closes its copies of the sockets, so that
-/// it neither uses nor ends the parent's TLS connections, and leaves their handles alone for ever.
-/// A connection is dropped once it was idle for 30 seconds, or when the trusted keys have changed.
+/// it neither uses nor ends the parent's TLS connections, and never touches their handles. A
+/// connection is dropped after 30 idle seconds, or if the trusted keys have changed.
 class ConnectionPool {
 public:
     static constexpr std::size_t kMaxIdle = 32;
@@ -29,7 +29,7 @@ public:
     /// The pool of this process; it is never destroyed, because threads may outlive main().
     static ConnectionPool &instance();
 
-    /// The connection that was idle for the shortest time, or null.
+    /// The most recently used connection, or null.
     [[nodiscard]] std::unique_ptr<HttpConnection> take(const Endpoint &endpoint,
                                                        const TrustStore::Stamp &trust);
     /// Keeps a connection on which a request has just ended well.
@@ -37,7 +37,7 @@ public:
     void keep(const Endpoint &endpoint, const TrustStore::Stamp &trust,
               std::unique_ptr<HttpConnection> connection);
 
-    /// A socket that a forked child closes; -1 when there is none to be had.
+    /// A socket that a forked child closes; -1 if none is available.
     int openSocket(int family, int type, int protocol);
     void closeSocket(int fd);
 

@@ -16,8 +16,8 @@ bool isAlphanumeric(char c) {
     return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z') || (c >= '0' && c <= '9');
 }
 
-/// The host in its one spelling, "" when it is none. What is left out keeps control characters,
-/// blanks, user parts, paths and escapes out of the URL.
+/// The host in its canonical spelling, "" if it is not one. What is left out keeps control
+/// characters, blanks, user parts, paths and escapes out of the URL.
 std::string normalizeHost(const std::string &host) {
     std::string ipv6 = OvraBase::normalizeIpv6(host);
     if (!ipv6.empty()) {

@@ -17,7 +17,7 @@ public:
     /// an
     ///                  IPv6 address with or without brackets
     /// \param port      1 to 65535
-    /// \return nothing when one of them is something else.
+    /// \return std::nullopt if one of them is something else.
     [[nodiscard]] static std::optional<Endpoint> make(const std::string &protocol,
                                                       const std::string &host, int port);
 
@@ -27,7 +27,7 @@ public:
     bool isIpv6() const { return host_.find(':') != std::string::npos; }
     /// "https://host:5001": the same text for the same endpoint.
     std::string key() const;
-    /// \param path  relative to the root; nothing when a character in it would not be part of a
+    /// \param path  relative to the root; std::nullopt if a character in it would not be part of a
     /// path
     [[nodiscard]] std::optional<std::string> url(const std::string &path) const;
 

@@ -13,7 +13,7 @@ namespace OvraPlatform {
 /// The fields of a form in their order, not yet escaped.
 using FormFields = std::vector<std::pair<std::string, std::string>>;
 
-/// Nothing when a parameter has the name of a field of the form itself.
+/// std::nullopt if a parameter has the name of one of the form's own fields.
 std::optional<FormFields> toFormFields(const WireCall &call);
 std::string encodeForm(const FormFields &fields);
 

@@ -23,7 +23,7 @@ namespace {
 /// connection.
 constexpr char kCertificateDir[] = "/etc/ssl/certs";
 constexpr long kConnectMillis = 10'000;
-/// A peer whose kernel says nothing for so long is gone, however long the answer may take.
+/// A peer whose kernel is silent for this long is gone, however long the answer may take.
 constexpr unsigned kSilenceMillis = 10'000;
 constexpr int kKeepAliveSeconds = 3;
 constexpr std::size_t kMaxHeader = std::size_t{64} * 1024;
@@ -58,8 +58,8 @@ struct FreeMime {
 };
 using Mime = std::unique_ptr<curl_mime, FreeMime>;
 
-/// How many bytes the peer's kernel has acknowledged on this connection (tcp(7), RFC 4898); nothing
-/// when this kernel does not tell.
+/// How many bytes the peer's kernel has acknowledged on this connection (tcp(7), RFC 4898);
+/// std::nullopt if this kernel does not tell.
 std::optional<std::uint64_t> deliveredBytes(int socket) {
     tcp_info info{};
     socklen_t size = sizeof(info);
@@ -70,8 +70,8 @@ std::optional<std::uint64_t> deliveredBytes(int socket) {
     return info.tcpi_bytes_acked;
 }
 
-/// Has the kernel end the connection when the peer's does not acknowledge what is sent, nor answer
-/// when it is asked whether it is still there (tcp(7), RFC 5482).
+/// Makes the kernel end the connection if the peer's kernel neither acknowledges what is sent nor
+/// answers keep-alive probes (tcp(7), RFC 5482).
 void endWhenSilent(int socket) {
     const auto set = [socket](int level, int option, int value) {
         setsockopt(socket, level, option, &value, sizeof value);
@@ -82,8 +82,8 @@ void endWhenSilent(int socket) {
     set(SOL_SOCKET, SO_KEEPALIVE, 1);
 }
 
-/// Whether the connection ended because nothing came from the peer any more; the kernel's clocks
-/// are a little apart.
+/// Whether the connection ended because the peer fell silent; the kernel's clocks are a little
+/// apart.
 bool endedInSilence(int socket) {
     constexpr unsigned kTolerance = 500; // milliseconds
     constexpr unsigned kClosed = 7;      // TCP_CLOSE of a header that excludes linux/tcp.h
@@ -104,7 +104,7 @@ bool isRegularFile(const std::string &path) {
     return stat(path.c_str(), &status) == 0 && S_ISREG(status.st_mode);
 }
 
-/// The form of an upload; null when there is no memory or the file cannot be read.
+/// The form of an upload; null if there is no memory or the file cannot be read.
 Mime makeForm(CURL *handle, const std::vector<std::pair<std::string, std::string>> &fields,
               const Upload &upload) {
     Mime form(curl_mime_init(handle));
@@ -196,7 +196,7 @@ bool HttpConnection::setUp() {
             .set(CURLOPT_SSL_SESSIONID_CACHE, 0L)
             .set(CURLOPT_FORBID_REUSE, 1L);
     } else {
-        // The judge replaces libcurl's check of the chain, and checks the host as well.
+        // The verifier replaces libcurl's check of the chain, and checks the host as well.
         options.set(CURLOPT_SSL_VERIFYPEER, 1L)
             .set(CURLOPT_SSL_VERIFYHOST, 0L)
             .set(CURLOPT_SSL_CTX_FUNCTION, &HttpConnection::onTlsContext)
@@ -355,9 +355,9 @@ CURLcode HttpConnection::onTlsContext(CURL *, void *context, void *self) {
 
 /// Called when a connection is ready (TLS included) and before anything of the request is sent.
 ///
-/// libcurl repeats a request by itself when a kept connection ends without an answer, also when the
-/// peer may have carried it out. Here it is repeated only when the peer's kernel had acknowledged
-/// none of its bytes, and not when the peer fell silent.
+/// libcurl repeats a request by itself if a kept connection ends without an answer, even if the
+/// peer may have carried it out. Here it is repeated only if the peer's kernel had acknowledged
+/// none of its bytes, and not if the peer fell silent.
 int HttpConnection::onRequest(void *self, char *, char *, int, int) {
     auto *connection = static_cast<HttpConnection *>(self);
     Attempt &attempt = connection->attempt_;

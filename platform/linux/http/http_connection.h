@@ -41,12 +41,12 @@ struct Upload {
 class HttpConnection {
 public:
     enum class Purpose {
-        kRequests, ///< the certificate is judged, new keys are pinned, the connection is kept
-        kProbe,    ///< the certificate is not looked at; nothing secret may be sent
-        kObserve,  ///< the certificate is judged but passes anyway; nothing is sent
+        kRequests, ///< the certificate is verified, new keys are pinned, the connection is kept
+        kProbe,    ///< the certificate is not checked; nothing secret may be sent
+        kObserve,  ///< the certificate is verified but passes anyway; nothing is sent
     };
 
-    /// Null when there is no memory.
+    /// Null if there is no memory.
     [[nodiscard]] static std::unique_ptr<HttpConnection> open(const Endpoint &endpoint,
                                                               Purpose purpose);
     HttpConnection(const HttpConnection &) = delete;
@@ -73,7 +73,7 @@ private:
         int socket = -1;
         std::optional<std::uint64_t> delivered; ///< bytes that had arrived when it began
         bool mayHaveArrived = true;             ///< something of a request that failed
-        bool endedInSilence = false;            ///< the peer said nothing any more
+        bool endedInSilence = false;            ///< the peer fell silent
     };
     struct FreeHandle {
         void operator()(CURL *handle) const { curl_easy_cleanup(handle); }

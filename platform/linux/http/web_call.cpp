@@ -23,7 +23,7 @@ constexpr long kHttpForbidden = 403;
 constexpr long kHttpNotFound = 404;
 constexpr long kHttpServerError = 500;
 
-/// What came as a reply, read here once for everybody.
+/// What came as a reply, parsed once for all callers.
 CredExpected<WebReply> readReply(std::string text) {
     OvraDRCore::Response response;
     response.setResp(text);
@@ -33,7 +33,7 @@ CredExpected<WebReply> readReply(std::string text) {
     return WebReply{std::move(text), std::move(response)};
 }
 
-/// The body, when the status says that it is the answer.
+/// The body, if the status says that it is the answer.
 CredExpected<std::string> bodyOf(HttpAnswer answer) {
     if (answer.status == kHttpOk) {
         return std::move(answer.body);
@@ -42,7 +42,7 @@ CredExpected<std::string> bodyOf(HttpAnswer answer) {
     return tl::unexpected(denied ? CredError::kNoPermission : CredError::kHttpStatus);
 }
 
-/// One post to the entry point, over a kept connection when there is one.
+/// One post to the entry point, over a kept connection if there is one.
 CredExpected<std::string> post(const Endpoint &endpoint, const WireCall &call,
                                const WebCallOptions &options) {
     const auto url = endpoint.url(kEntryPoint);
@@ -76,7 +76,7 @@ CredExpected<WebReply> callPlain(const Endpoint &endpoint, const WireCall &call,
     return post(endpoint, call, options).and_then(readReply);
 }
 
-/// Over plain http the key itself has to be the one that was met first.
+/// Over plain http the key itself must be the first one seen.
 CredExpected<void> judgeSealKey(const Endpoint &endpoint, const PublicKey &key) {
     TrustStore store;
     const std::string fingerprint = fingerprintOf(key);
@@ -146,7 +146,7 @@ public:
     }
 
 private:
-    /// The end of the call, or nothing when it has to be sent once more.
+    /// The end of the call, or std::nullopt if it must be sent once more.
     using Ending = std::optional<CredExpected<WebReply>>;
 
     CredExpected<void> findKey() {
@@ -182,8 +182,8 @@ private:
             return tl::unexpected(CredError::kSealFailed);
         }
         CredExpected<WebReply> opened = readReply(std::move(*text));
-        // Only a time that came sealed is believed: a wrong one would let somebody who holds the
-        // request back deliver it later.
+        // Only a time that came sealed is believed: a wrong one would let an attacker hold the
+        // request back and deliver it later.
         if (!realigned_ && opened && sealRefusalReason(opened->response) == "stale" &&
             realign(opened->response)) {
             realigned_ = true;

@@ -24,20 +24,20 @@ struct WebReply {
     OvraDRCore::Response response; ///< what it says, valid
 };
 
-/// Calls a web API of a remote appliance and returns its reply document, opened when it was sealed.
+/// Calls a web API of a remote appliance and returns its reply document, opened if it was sealed.
 ///
-/// Over plain http every call travels sealed, to the key that the endpoint had when it was first
-/// met. A call that is refused because the clocks differ, or because the appliance has a new key,
-/// is sealed anew and sent once more.
+/// Over plain http every call is sealed to the key that the endpoint had at first contact. A call
+/// refused because the clocks differ, or because the appliance has a new key, is sealed again and
+/// sent once more.
 [[nodiscard]] CredExpected<WebReply> callWebAPI(const Endpoint &endpoint, const WireCall &call,
                                                 const WebCallOptions &options);
 
-/// Asks the entry point without any secret, and whoever it is, whether it answers.
+/// Checks without any secret or trust whether the entry point answers.
 [[nodiscard]] CredExpected<void> probe(const Endpoint &endpoint, const std::string &url,
                                        Deadline deadline);
 
-/// Asks the endpoint for the key that requests to it are sealed to. Over plain http anybody may
-/// have answered; nothing is judged here.
+/// Asks the endpoint for the key that requests to it are sealed to. Over plain http the answer may
+/// come from anybody; nothing is verified here.
 [[nodiscard]] CredExpected<PublicKey> fetchSealKey(const Endpoint &endpoint,
                                                    const WebCallOptions &options);
 

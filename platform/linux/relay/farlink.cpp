@@ -22,7 +22,7 @@ constexpr std::size_t kMinAlias = 3;
 constexpr std::size_t kMaxAlias = 63;
 constexpr std::chrono::seconds kAnswerTime{10};
 
-/// "" when the file has no such line.
+/// "" if the file has no such line.
 std::string setting(const char *key) {
     std::array<char, 300> value{};
     const int length =
@@ -78,8 +78,8 @@ bool writeFarlinkSettings(const FarlinkSettings &settings) {
     const auto put = [](const char *key, const std::string &value) {
         return OLIBCFileSetKeyValue(kFarlinkFile, key, value.c_str(), "%s=\"%s\"\n") >= 0;
     };
-    // The alias goes first and comes last: what is half written never offers this appliance at
-    // another service.
+    // The alias is removed first and written last: a half-written file never offers this appliance
+    // at another service.
     return put(FarlinkSetting::kAlias, "") && put(FarlinkSetting::kHost, settings.host) &&
            put(FarlinkSetting::kPort, std::to_string(settings.port)) &&
            (settings.alias.empty() || put(FarlinkSetting::kAlias, settings.alias));

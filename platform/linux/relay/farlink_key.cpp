@@ -13,7 +13,7 @@ namespace OvraPlatform {
 
 namespace {
 
-/// Stands before the key in its file and before what is signed.
+/// Precedes the key in its file and the signed text.
 constexpr char kHeading[] = "ovradr-farlink-1 ";
 constexpr KeyFileKind kKind = {kHeading, crypto_sign_SECRETKEYBYTES,
                                "restore it, or remove it and choose another alias"};

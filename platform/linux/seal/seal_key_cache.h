@@ -13,7 +13,7 @@
 
 namespace OvraPlatform {
 
-/// The sealing keys of endpoints that this process met lately. Safe for threads.
+/// The sealing keys of endpoints that this process contacted lately. Thread-safe.
 class SealKeyCache {
 public:
     static constexpr std::size_t kMaxEndpoints = 64;

@@ -13,7 +13,7 @@ namespace OvraPlatform {
 
 UnixMillis wallClock();
 
-/// Nothing when the text is no public key.
+/// std::nullopt if the text is not a public key.
 std::optional<PublicKey> parsePublicKey(const std::string &text);
 
 struct SealedRequest {
@@ -23,11 +23,11 @@ struct SealedRequest {
 
 /// Seals parameters and session id of `call` to `receiver`.
 /// \param time  the receiver's time
-/// \return nothing when libsodium cannot be used.
+/// \return std::nullopt if libsodium cannot be used.
 [[nodiscard]] std::optional<SealedRequest> sealRequest(const PublicKey &receiver,
                                                        const WireCall &call, UnixMillis time);
 
-/// The document inside `reply` (an object with "sealed_reply"); nothing when it does not open.
+/// The document inside `reply` (an object with "sealed_reply"); std::nullopt if it does not open.
 [[nodiscard]] std::optional<std::string> openReply(const ReplyKey &key, const Json::Value &reply);
 
 } // namespace OvraPlatform

@@ -34,7 +34,7 @@ constexpr DatabaseLayout kLayout = {"account store", 0x4F764163, 1, R"(
 constexpr unsigned long long kOpsLimit = crypto_pwhash_OPSLIMIT_INTERACTIVE;
 constexpr std::size_t kMemLimit = crypto_pwhash_MEMLIMIT_INTERACTIVE;
 
-/// The Argon2id hash of a password; "" when there is no memory for it.
+/// The Argon2id hash of a password; "" if there is no memory for it.
 std::string hashPassword(std::string_view password) {
     std::array<char, crypto_pwhash_STRBYTES> hash{};
     if (!OvraBase::sodiumReady() || crypto_pwhash_str(hash.data(), password.data(), password.size(),
@@ -259,8 +259,8 @@ LoginResult AccountStore::verify(const std::string &name, std::string_view passw
     return result;
 }
 
-/// Everything behind the password, as the account is now: it may have changed while the password
-/// was hashed, which is why `hash` has to be there still.
+/// Everything after the password, for the account as it is now: it may have changed while the
+/// password was hashed, so `hash` must still match.
 LoginResult AccountStore::checkAccount(const std::string &name, const std::string &hash,
                                        std::string_view oneTimeCode) {
     std::string secret;
@@ -290,7 +290,7 @@ LoginResult AccountStore::checkAccount(const std::string &name, const std::strin
     return result;
 }
 
-/// Two processes may have found the same code right: the one whose update changes the row has it.
+/// Two processes may have found the same code right: the one whose update changes the row wins.
 LoginResult AccountStore::spendCode(const std::string &name, const std::string &secret,
                                     std::int64_t lastStep, std::string_view oneTimeCode) {
     const std::optional<std::int64_t> step =

@@ -144,7 +144,7 @@ bool Database::failSqlite(int code) {
                 OvraBase::sqliteText(database_.get(), code) + ". " + adviceFor(code));
 }
 
-/// The file is made without being opened: closing a descriptor of it would drop the locks that
+/// The file is created without being opened: closing a descriptor of it would drop the locks that
 /// SQLite connections of this process hold on it (fcntl(2), record locks).
 bool Database::makeFile() {
     if (!ensureStateDir(OvraBase::folderOf(path_))) {
@@ -204,14 +204,14 @@ bool Database::isOurs() {
            pragma("PRAGMA application_id") == layout_.applicationId;
 }
 
-/// \return false also when the file has somebody else's tables.
+/// \return false also if the file has another program's tables.
 bool Database::makeTables() {
     Transaction transaction(*this);
     if (!transaction.isOpen()) {
         return false;
     }
     if (pragma("SELECT count(*) FROM sqlite_schema") != 0) {
-        return isOurs(); // another process was quicker, or it is no file of ours
+        return isOurs(); // another process was faster, or it is not our file
     }
     const std::string stamp = "PRAGMA application_id = " + std::to_string(layout_.applicationId) +
                               "; PRAGMA user_version = " + std::to_string(layout_.version);

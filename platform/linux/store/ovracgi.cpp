@@ -18,7 +18,7 @@ using OvraPlatform::SessionRecord;
 using OvraPlatform::SessionRequest;
 using OvraPlatform::SessionStore;
 
-/// What is behind a handle: the opened store and the login that is being put together.
+/// The data of a handle: the opened store and the login being built.
 struct OvraCgiStore {
     SessionStore sessions;
     SessionRequest login;

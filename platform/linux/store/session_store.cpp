@@ -156,7 +156,7 @@ bool SessionStore::removeExpired() {
         .run();
 }
 
-/// Sweeps, ends what has to end, and checks the limits; inside the transaction of the insert.
+/// Sweeps, ends what must end, and checks the limits; inside the transaction of the insert.
 bool SessionStore::makeRoom(const SessionRequest &request) {
     if (!removeExpired()) {
         return false;

@@ -28,7 +28,7 @@ bool initialize() {
     return done;
 }
 
-/// Memory that liboath gave out for a secret; wiped when it goes.
+/// Memory allocated by liboath for a secret; wiped on release.
 class SecretBuffer {
 public:
     SecretBuffer() = default;

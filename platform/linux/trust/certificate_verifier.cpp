@@ -94,7 +94,7 @@ CertificateVerifier::Verdict CertificateVerifier::judge(X509_STORE_CTX *chain) {
 bool CertificateVerifier::systemAccepts(X509_STORE_CTX *chain) const {
     X509_VERIFY_PARAM *wanted = X509_STORE_CTX_get0_param(chain);
     const std::string &host = endpoint_.host();
-    // An address has to stand in the certificate as an address, a name as a name.
+    // The certificate must list an address as an address, a name as a name.
     const bool set = X509_VERIFY_PARAM_set1_ip_asc(wanted, host.c_str()) == 1 ||
                      X509_VERIFY_PARAM_set1_host(wanted, host.c_str(), host.size()) == 1;
     return set && X509_verify_cert(chain) == 1;

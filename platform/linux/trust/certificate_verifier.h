@@ -11,15 +11,16 @@
 
 namespace OvraPlatform {
 
-/// "SHA256:..." of the certificate's public key (its SubjectPublicKeyInfo); "" when there is none.
+/// "SHA256:..." of the certificate's public key (its SubjectPublicKeyInfo); "" if there is none.
 /// The key and not the certificate, so that a certificate that is renewed on its key stays trusted.
 std::string fingerprintOf(const X509 *certificate);
 
-/// Judges the certificate of one endpoint in the TLS handshake.
+/// Verifies the certificate of one endpoint in the TLS handshake.
 ///
 /// What the system's store accepts for the host is accepted, whatever is pinned. Otherwise the key
-/// must be the pinned one. A key met for the first time passes the handshake, and has to be pinned
-/// (pinNewKey) before anything is sent: only then has the peer proved that it holds the key.
+/// must be the pinned one. A key seen for the first time passes the handshake, and must be pinned
+/// (pinNewKey) before anything is sent: only after the handshake has the peer proved that it holds
+/// the key.
 class CertificateVerifier {
 public:
     enum class Verdict {
@@ -34,14 +35,13 @@ public:
     /// \param observe  every certificate passes; the verdict is only told
     CertificateVerifier(Endpoint endpoint, bool observe);
 
-    /// Makes the connections of the context ask this verifier, which has to live as long as they
-    /// do.
+    /// Makes the connections of the context use this verifier, which must outlive them.
     void install(SSL_CTX *context);
-    /// Pins a key that is new; false when that failed, and then the verdict says why.
+    /// Pins a key that is new; false if that failed, and then the verdict says why.
     [[nodiscard]] bool pinNewKey();
 
     Verdict verdict() const { return verdict_; }
-    /// Of the key that was judged last.
+    /// Of the key verified last.
     const std::string &fingerprint() const { return fingerprint_; }
 
 private:

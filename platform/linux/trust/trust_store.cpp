@@ -17,8 +17,8 @@ namespace OvraPlatform {
 
 namespace {
 
-/// When the file changed whose damage was logged last, so that a damaged line costs one log line
-/// and not one a request.
+/// When the file changed whose damage was logged last, so that a damaged line is logged once, not
+/// at every request.
 std::atomic<std::int64_t> toldOf{0};
 
 std::int64_t nanoseconds(const timespec &time) {
@@ -33,7 +33,7 @@ bool isEndpoint(const std::string &text) {
 
 } // namespace
 
-/// A line as it stands in the file, and what it says when it is one of ours.
+/// A line as it is in the file, and its content if it is ours.
 struct TrustStore::Line {
     std::string text;
     std::optional<Entry> entry;

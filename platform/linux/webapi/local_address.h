@@ -10,7 +10,7 @@
 
 namespace OvraPlatform {
 
-/// The address of a Unix socket; nothing when the path does not fit (unix(7): 107 bytes).
+/// The address of a Unix socket; std::nullopt if the path does not fit (unix(7): 107 bytes).
 inline std::optional<sockaddr_un> localAddress(const std::string &path) {
     sockaddr_un address{};
     address.sun_family = AF_UNIX;

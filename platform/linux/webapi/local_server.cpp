@@ -44,8 +44,8 @@ constexpr std::chrono::seconds kWriteTime{10};
 constexpr std::chrono::milliseconds kPauseWithoutDescriptors{50};
 constexpr int kQueue = 128;
 
-/// Removes a socket file that nobody serves any more.
-/// \return why not: the place is taken by something else.
+/// Removes a socket file that is no longer served.
+/// \return why not: the path is taken by something else.
 Started clearPlace(const std::string &path, const sockaddr_un &address) {
     struct stat status {};
     if (lstat(path.c_str(), &status) != 0) {
@@ -156,7 +156,7 @@ void LocalServer::Impl::serve(int peer) {
             reply = OvraDRCore::toString(
                 apiError(APIError::kTooLarge, "the reply is too large: ask for less at once"));
         }
-        // A stop does not cut this short: the call was carried out, its caller should know.
+        // A stop does not cut this short: the call was carried out, and its caller should know.
         (void)sendFrame(peer, reply, std::chrono::steady_clock::now() + kWriteTime);
     } catch (const std::exception &error) {
         OVRA_ERR("A local call could not be served: [%s]", error.what());

@@ -27,7 +27,7 @@ int millisecondsUntil(Deadline deadline) {
     return static_cast<int>(std::clamp<std::int64_t>(left, 0, kMaxMilliseconds));
 }
 
-/// Waits until `fd` is ready for `events`; false when the time is over or `stop` is readable.
+/// Waits until `fd` is ready for `events`; false if the time is over or `stop` is readable.
 bool waitFor(int fd, short events, Deadline deadline, int stop) {
     std::array<pollfd, 2> fds{{{fd, events, 0}, {stop, POLLIN, 0}}};
     for (;;) {
@@ -45,7 +45,7 @@ bool waitFor(int fd, short events, Deadline deadline, int stop) {
     }
 }
 
-/// Moves all of `size` bytes with `step` (send or recv of a part), waiting when the socket is not
+/// Moves all of `size` bytes with `step` (send or recv of a part), waiting while the socket is not
 /// ready.
 template <typename Step>
 bool transfer(int fd, short events, std::size_t size, Deadline deadline, int stop, Step step) {

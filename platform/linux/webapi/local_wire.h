@@ -21,18 +21,19 @@ using Deadline = std::chrono::steady_clock::time_point;
 
 /// Sends one frame.
 /// \param fd    a non-blocking stream socket
-/// \param stop  a descriptor that ends the wait when it is readable; -1: none
-/// \return false when the peer is gone, the time is over, or it was told to stop.
+/// \param stop  a descriptor that ends the wait once readable; -1: none
+/// \return false if the peer is gone, the time is over, or it was told to stop.
 [[nodiscard]] bool sendFrame(int fd, const std::string &text, Deadline deadline, int stop = -1);
 
-/// Receives one frame; nothing when it is longer than kMaxFrame or for the reasons of sendFrame().
+/// Receives one frame; std::nullopt if it is longer than kMaxFrame or for the reasons of
+/// sendFrame().
 [[nodiscard]] std::optional<std::string> receiveFrame(int fd, Deadline deadline, int stop = -1);
 
 /// Whether the process at the other end of a connected Unix socket is root's or our own user's.
 bool isPeerTrusted(int fd);
 
 std::string toLocalRequest(const LocalCall &call);
-/// Nothing when the text is not a request.
+/// std::nullopt if the text is not a request.
 [[nodiscard]] std::optional<LocalCall> parseLocalRequest(const std::string &text);
 
 } // namespace OvraPlatform

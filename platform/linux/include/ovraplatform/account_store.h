@@ -25,11 +25,11 @@ struct Account {
     std::int64_t created = 0; ///< seconds of the system clock
 };
 
-/// What came of a log-in; the numbers are the log-in codes of the web API.
+/// The result of a log-in; the numbers are the log-in codes of the web API.
 enum class LoginResult : int {
     kOk = 0,
-    kStoreFailed = 100,  ///< nothing is known: AccountStore::error() says why
-    kWrong = 400,        ///< no such account, or not its password
+    kStoreFailed = 100,  ///< unknown: AccountStore::error() says why
+    kWrong = 400,        ///< no such account, or wrong password
     kDisabled = 401,     ///< the password is right, the account is disabled
     kNotPermitted = 402, ///< the password is right, the account may not log in over the network
     kCodeRequired = 403, ///< the password is right, the one-time code is missing
@@ -40,8 +40,8 @@ enum class LoginResult : int {
 /// kept as Argon2id hashes.
 ///
 /// An object holds one connection: short-lived, for one thread, not kept across a fork. Operations
-/// that return bool return false on failure, also when there is no such account; error() then says
-/// why in one sentence, which never holds a secret.
+/// that return bool return false on failure, including for an unknown account; error() then gives
+/// the reason, which never contains a secret.
 class OVRAPLATFORM_EXPORT AccountStore {
 public:
     static constexpr int kMaxAccounts = 4096;
@@ -51,38 +51,38 @@ public:
 
     using Clock = std::function<std::time_t()>;
 
-    /// Opens the store; makes file and folder when missing.
+    /// Opens the store; creates the file and its folder if missing.
     explicit AccountStore(const std::string &path = kAccountsFile, Clock clock = {});
 
     bool isOpen() const { return database_.isOpen(); }
-    /// Why the last operation failed, one sentence; "" when it did not.
+    /// Why the last operation failed; "" if it succeeded.
     const std::string &error() const { return database_.error(); }
 
-    /// 1 to 64 characters, letters and digits of ASCII and "." "_" "-" "@", the first one a letter,
-    /// a digit or "_". Names differ when a letter differs in case.
+    /// 1 to 64 characters, ASCII letters, digits, ".", "_", "-" and "@"; the first is a letter, a
+    /// digit or "_". Names are case-sensitive.
     static bool isName(std::string_view name);
 
-    /// \param password  kMinPassword to kMaxPassword bytes; stays the caller's, to wipe
+    /// \param password  kMinPassword to kMaxPassword bytes; the caller keeps it and wipes it
     [[nodiscard]] bool add(const std::string &name, std::string_view password, bool administrator);
     [[nodiscard]] bool setPassword(const std::string &name, std::string_view password);
     [[nodiscard]] bool setAdministrator(const std::string &name, bool administrator);
     [[nodiscard]] bool setDisabled(const std::string &name, bool disabled);
     [[nodiscard]] bool setRemoteLogin(const std::string &name, bool permitted);
-    /// From now on a log-in needs a code made with `secret` (base32, see totp.h).
+    /// From now on a log-in needs a code generated from `secret` (base32, see totp.h).
     [[nodiscard]] bool setTotp(const std::string &name, const std::string &secret);
     [[nodiscard]] bool clearTotp(const std::string &name);
     [[nodiscard]] bool remove(const std::string &name);
 
     bool exists(const std::string &name) { return find(name).has_value(); }
     [[nodiscard]] std::optional<Account> find(const std::string &name);
-    /// Every account, by name.
+    /// All accounts, sorted by name.
     [[nodiscard]] bool list(std::vector<Account> &accounts);
 
-    /// Checks a log-in over the network. It takes as long for an account that does not exist as for
-    /// a wrong password, and tells nothing about an account before the password is right. A code is
-    /// accepted once, whatever number of processes check it at the same moment. No lock is held
-    /// while the password is hashed, which takes about a tenth of a second and 64 MiB: the caller
-    /// bounds how many do that at once.
+    /// Checks a log-in over the network. An unknown account takes as long as a wrong password, and
+    /// nothing about an account is revealed before the password is right. A code is accepted only
+    /// once, even if several processes check it at the same moment. No lock is held while the
+    /// password is hashed, which takes about a tenth of a second and 64 MiB: the caller limits how
+    /// many run at once.
     LoginResult verify(const std::string &name, std::string_view password,
                        std::string_view oneTimeCode);
 

@@ -7,7 +7,7 @@
 
 namespace OvraPlatform {
 
-/// What is called, and with which parameters.
+/// The call and its parameters.
 struct APICall {
     std::string api;
     int version = 0;
@@ -15,7 +15,7 @@ struct APICall {
     Json::Value params{Json::objectValue}; ///< an object; a null counts as the empty one
 };
 
-/// A call of a process of this appliance, with the rights of `user`.
+/// A call from a process of this appliance, with the rights of `user`.
 struct LocalCall : APICall {
     std::string user;
 };

@@ -12,8 +12,8 @@ namespace OvraPlatform {
 namespace APIError {
 
 enum Code : int {
-    kInternal = 100,      ///< the handler failed, or the local daemon cannot be asked
-    kBadRequest = 101,    ///< not a call of the wire form
+    kInternal = 100,      ///< the handler failed, or the local daemon cannot be reached
+    kBadRequest = 101,    ///< not a well-formed call
     kNoSuchAPI = 102,     ///< the appliance has no such API
     kNoSuchMethod = 103,  ///< the API has no such method
     kNoSuchVersion = 104, ///< the method has no such version

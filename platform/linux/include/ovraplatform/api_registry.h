@@ -16,13 +16,13 @@ namespace OvraPlatform {
 
 /// Who may call.
 enum class APIRight {
-    kNone,          ///< anybody, also without a session
+    kNone,          ///< anybody, even without a session
     kSession,       ///< any user who is logged in
     kAdministrator, ///< an administrator who is logged in
     kLocal,         ///< a process of this appliance
 };
 
-/// Where a call has to run.
+/// Which queue a call runs in.
 enum class APIQueue {
     kQuick, ///< answers from this machine alone
     kSlow,  ///< may wait on the network; must not hold up the quick ones
@@ -37,12 +37,12 @@ struct APICaller {
     bool local = false;  ///< a process of this appliance, not a remote client
 };
 
-/// Gets the parameters (always an object) and returns a reply document (webapi/api_errors.h).
+/// Receives the parameters (always an object) and returns a reply document (webapi/api_errors.h).
 using APIHandler = std::function<Json::Value(const Json::Value &params, const APICaller &caller)>;
 
 /// The web-API handlers of a process, found by API, version and method.
 ///
-/// Filled by one thread first, then used by any number of them.
+/// Filled by one thread first, then used by any number of threads.
 class OVRAPLATFORM_EXPORT APIRegistry {
 public:
     struct Entry {
@@ -54,10 +54,10 @@ public:
     APIRegistry() = default;
     APIRegistry(const APIRegistry &) = delete;
     APIRegistry &operator=(const APIRegistry &) = delete;
-    /// A hosted registry is no longer hosted; no call may be under way.
+    /// Stops hosting the registry if it is hosted; no call may be in progress.
     ~APIRegistry();
 
-    /// Registers a handler; one that was there under the same names is replaced.
+    /// Registers a handler; replaces an earlier one under the same names.
     void add(const std::string &api, int version, const std::string &method, APIRight right,
              APIQueue queue, APIHandler handler);
 
@@ -69,27 +69,27 @@ public:
         APIRight right;
         APIQueue queue;
     };
-    /// All that is registered, in the order of API, method and version.
+    /// All registered methods, sorted by API, method and version.
     std::vector<Method> methods() const;
 
-    /// The queue of the call. One that nobody registered is quick: it is refused at once.
+    /// The queue of the call. An unregistered call is quick: it is refused at once.
     APIQueue queue(const APICall &call) const;
 
-    /// Runs the handler of the call and returns its reply. Never throws: errors 102, 103, 104 for a
-    /// call that nobody registered, 119 and 105 for a caller without the right, 101 for parameters
-    /// that are no object, 100 for a handler that threw or returned no reply document.
+    /// Runs the handler of the call and returns its reply. Never throws: errors 102, 103, 104 for
+    /// an unregistered call, 119 and 105 for a caller without the right, 101 for parameters that
+    /// are not an object, 100 for a handler that threw or returned no reply document.
     Json::Value dispatch(const APICall &call, const APICaller &caller) const;
 
-    /// Makes this registry the one in which OVRA::APIRunner runs the calls of this process.
+    /// Hosts this registry: OVRA::APIRunner runs the calls of this process in it.
     void host();
-    /// The registry that this process hosts, or null.
+    /// The registry hosted by this process, or null.
     static const APIRegistry *hosted();
 
 private:
     using Versions = std::map<int, Entry>;
     using Methods = std::map<std::string, Versions>;
 
-    /// The entry, or the error code that the call gets.
+    /// The entry, or the error code for the call.
     [[nodiscard]] tl::expected<const Entry *, int> find(const APICall &call) const;
 
     std::map<std::string, Methods> apis_;

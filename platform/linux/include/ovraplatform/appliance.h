@@ -6,8 +6,8 @@
 #include <string>
 #include <vector>
 
-/// Everything that the platform for stand-alone Linux has fixed: its files, and the settings of the
-/// appliance. Formats, modes and recovery of the files: docs/files.md.
+/// What the stand-alone Linux platform fixes: its files and the appliance's settings. Formats,
+/// modes and recovery of the files: docs/files.md.
 namespace OvraPlatform {
 
 /// Settings, keys and certificate: written by `ovradr setup` and by the operator. Mode 0755,
@@ -43,37 +43,37 @@ inline constexpr char kPort[] = "port";
 inline constexpr char kAlias[] = "alias";
 } // namespace FarlinkSetting
 
-/// The settings of this appliance, the lines key="value" of kConfigFile. A key that is missing or
-/// empty has the value given here.
+/// The settings of this appliance, the lines key="value" of kConfigFile. A missing or empty key has
+/// the default given here.
 struct ApplianceConfig {
     int httpPort = 5000;
     int httpsPort = 5001;
-    /// Whether the appliance serves at every address of the machine: no address is set.
+    /// Whether the appliance serves on every address of the machine: no address is set.
     bool servesAllAddresses = true;
-    /// Otherwise the addresses that it serves at, numeric text, in the order of the file. Empty
-    /// when the setting holds nothing usable.
+    /// Otherwise the addresses it serves on, as numeric text, in file order. Empty if the setting
+    /// holds nothing usable.
     std::vector<std::string> addresses;
     std::string hostname; ///< empty: the system's
     std::string serial;   ///< empty: the machine's
 
-    /// One sentence for everything in the file that could not be taken; a program that serves
-    /// should not start while there are any.
+    /// One sentence for each unusable part of the file; a server should not start while there are
+    /// any.
     std::vector<std::string> problems;
 };
 
-/// Reads the settings. A value that is not usable is named in `problems` and in one ERR log line
-/// and counts as not set, except that an unusable `address` never widens to every address. A file
-/// that does not exist is an appliance with defaults.
+/// Reads the settings. An unusable value is named in `problems` and in one ERR log line, and counts
+/// as not set, except that an unusable `address` never widens to every address. A missing file
+/// means defaults.
 OVRAPLATFORM_EXPORT ApplianceConfig readApplianceConfig(const std::string &path = kConfigFile);
 
-/// What is wrong with a value for a setting: one sentence, "" when nothing is.
+/// What is wrong with a value for a setting; "" if it is valid.
 /// \param key  one of namespace Setting
 OVRAPLATFORM_EXPORT std::string settingProblem(const std::string &key, const std::string &value);
 
-/// Makes the state directory, mode 0700, and what is missing above it, mode 0755. One that exists
-/// must be a directory of our own user that nobody else can write to.
-/// \param path  kStateDir, or a path that stands for it
-/// \return false, after an ERR log line that says what to do, when it cannot be used.
+/// Creates the state directory, mode 0700, and missing parents, mode 0755. An existing one must be
+/// a directory owned by our own user that nobody else can write to.
+/// \param path  kStateDir, or a path used in its place
+/// \return false, after an ERR log line that says what to do, if it cannot be used.
 [[nodiscard]] OVRAPLATFORM_EXPORT bool ensureStateDir(const std::string &path = kStateDir);
 
 } // namespace OvraPlatform

@@ -7,8 +7,8 @@
 
 namespace OvraPlatform {
 
-/// While it lives, `address` is the web client for which this thread works: what the login-session
-/// library records and reports. Scopes nest; they are destroyed in the thread that made them.
+/// While it lives, `address` is the web client this thread works for, as the login-session library
+/// records and reports it. Scopes nest; destroy each in the thread that created it.
 class OVRAPLATFORM_EXPORT ClientScope {
 public:
     /// \param address  numeric text; anything else counts as "no client"

@@ -7,27 +7,28 @@
 
 namespace OvraPlatform {
 
-/// The error numbers of the credential request library, as OVRA::CredRequest::GetError() gives
-/// them. 4, 5, 6 and 10 are a contract with the node library; the others tell failures apart.
+/// The error numbers of the credential request library, as returned by
+/// OVRA::CredRequest::GetError(). 4, 5, 6 and 10 are a contract with the node library; the others
+/// tell failures apart.
 enum class CredError : int {
     kNone = 0,
-    kBadArgument = 1,        ///< an endpoint, a path or a call that cannot be used
-    kOutOfMemory = 2,        ///< no memory, or no descriptor
-    kInternal = 3,           ///< a failure that has no number of its own
+    kBadArgument = 1,        ///< an unusable endpoint, path or call
+    kOutOfMemory = 2,        ///< out of memory or descriptors
+    kInternal = 3,           ///< a failure without a number of its own
     kNoPermission = 4,       ///< HTTP status 401 or 403
     kCannotConnect = 5,      ///< no such name, refused, unreachable, or no TLS on that port
     kCertificateChanged = 6, ///< the endpoint's key is not the one trusted for it
     kReplyTooLarge = 7,      ///< over 8 MiB
     kReplyBroken = 8,        ///< empty, not HTTP, or not a reply document
     kConnectionLost = 9,     ///< the connection ended before the reply was complete
-    kTimedOut = 10,          ///< not done within the time that was given
-    kHttpStatus = 11,        ///< an HTTP status that is no answer
-    kUploadUnreadable = 12,  ///< the file to send cannot be read, or cannot travel as it must
+    kTimedOut = 10,          ///< not done within the given time
+    kHttpStatus = 11,        ///< an HTTP status that is not an answer
+    kUploadUnreadable = 12,  ///< the file to send cannot be read, or cannot be sent as required
     kSealFailed = 13,        ///< the request could not be sealed, or the reply not opened
     kTrustUnavailable = 14,  ///< the file of trusted keys can be neither read nor written
 };
 
-/// A value, or why there is none; never kNone.
+/// A value, or the error; never kNone.
 template <typename T>
 using CredExpected = tl::expected<T, CredError>;
 

@@ -16,10 +16,10 @@ namespace OvraPlatform {
 
 /// What kind of file a store has.
 struct DatabaseLayout {
-    const char *name;   ///< as messages call it, e.g. "session store"
+    const char *name;   ///< as named in messages, e.g. "session store"
     int applicationId;  ///< SQLite's application_id: another program's file is refused
     int version;        ///< SQLite's user_version: a newer program's file is refused
-    const char *schema; ///< makes the tables in a new file
+    const char *schema; ///< creates the tables in a new file
 };
 
 /// A prepared statement. Text and blobs are bound, never pasted.
@@ -28,12 +28,12 @@ public:
     Statement &bind(int index, std::string_view text);
     Statement &bind(int index, std::int64_t number);
     Statement &bindBlob(int index, std::string_view bytes);
-    /// Binds nothing, i.e. NULL, for an absent text.
+    /// Binds NULL for an absent text.
     Statement &bindOptional(int index, std::string_view text);
 
-    /// \return true when there is a row; false at the end and on failure (Database::failed()).
+    /// \return true if there is a row; false at the end and on failure (Database::failed()).
     [[nodiscard]] bool step();
-    /// Runs a statement that gives no row; false on failure.
+    /// Runs a statement that returns no row; false on failure.
     [[nodiscard]] bool run();
 
     std::string text(int column) const; ///< NULL reads as ""
@@ -54,14 +54,14 @@ private:
     std::unique_ptr<sqlite3_stmt, Finalize> statement_;
 };
 
-/// One connection to a store's SQLite file. Not shared between threads, nor kept across a fork.
-/// Everything fails, harmlessly, when the file could not be opened. A failure is remembered as one
+/// One connection to a store's SQLite file. Not shared between threads, nor kept across a fork. If
+/// the file could not be opened, every operation fails harmlessly. A failure is kept as one
 /// sentence that says what was wrong and what to do, and is logged once at ERR. The stores built on
-/// it answer in the same way, false and error(), as SQLite does itself: a statement of several
+/// it report errors the same way, with false and error(), as SQLite does: a statement of several
 /// steps and a transaction of several statements have one failure, which belongs to the connection.
 class OVRAPLATFORM_EXPORT Database {
 public:
-    /// Opens the file; makes it, mode 0600, and its folder (ensureStateDir()) when missing.
+    /// Opens the file; creates it, mode 0600, and its folder (ensureStateDir()) if missing.
     Database(std::string path, const DatabaseLayout &layout);
     Database(const Database &) = delete;
     Database &operator=(const Database &) = delete;
@@ -71,14 +71,14 @@ public:
     bool failed() const { return !error_.empty(); }
     const std::string &error() const { return error_; }
     void clearError() { error_.clear(); }
-    /// Remembers a failure and logs it at ERR. Always false.
+    /// Records a failure and logs it at ERR. Always returns false.
     bool fail(const std::string &sentence);
-    /// Remembers why the store does not do what it was asked to; the asker tells. Always false.
+    /// Records why the store refuses a request; the caller reports it. Always returns false.
     bool refuse(const std::string &sentence);
 
     Statement prepare(const char *sql);
     [[nodiscard]] bool execute(const char *sql);
-    /// Rows that the last statement changed.
+    /// Rows changed by the last statement.
     int changes() const;
 
 private:
@@ -102,10 +102,10 @@ private:
     std::string error_;
 };
 
-/// A write transaction: nothing is written unless commit() says so.
+/// A write transaction: nothing is written without commit().
 class OVRAPLATFORM_EXPORT Transaction {
 public:
-    /// Waits for another process's transaction as long as the connection's busy time-out.
+    /// Waits for another process's transaction up to the connection's busy time-out.
     explicit Transaction(Database &database);
     Transaction(const Transaction &) = delete;
     Transaction &operator=(const Transaction &) = delete;

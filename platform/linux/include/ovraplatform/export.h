@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
-/// Marks what the daemon and the command line use of libovradrplatform.so beside the platform
-/// interfaces themselves.
+/// Marks what the daemon and the command line use from libovradrplatform.so besides the platform
+/// interfaces.
 #define OVRAPLATFORM_EXPORT __attribute__((visibility("default")))

@@ -15,39 +15,39 @@ namespace OvraPlatform {
 
 inline constexpr char kFarlinkApi[] = "OVRA.Farlink";
 inline constexpr int kFarlinkPort = 5443;
-/// How long the relay service holds a question for callers back when there are none.
+/// How long the relay service holds back a poll for callers while there are none.
 inline constexpr std::chrono::seconds kFarlinkHold{20};
 
-/// Whether the text can be an alias: 3 to 63 lower-case letters, digits and inner hyphens, as a
-/// label of a host name (RFC 1123, 2.1).
+/// Whether the text can be an alias: 3 to 63 lower-case letters, digits and inner hyphens, like a
+/// host name label (RFC 1123, 2.1).
 OVRAPLATFORM_EXPORT bool isFarlinkAlias(const std::string &text);
 
-/// Which relay service the appliance uses, and under which name it is reached there.
+/// The relay service that the appliance uses, and its name there.
 struct FarlinkSettings {
-    std::string host; ///< "": none is used
+    std::string host; ///< "": none
     int port = kFarlinkPort;
-    std::string alias; ///< "": others are looked up, this appliance is not reached
+    std::string alias; ///< "": only looks others up, is not reachable itself
 
     bool operator==(const FarlinkSettings &other) const {
         return host == other.host && port == other.port && alias == other.alias;
     }
 };
 
-/// The lines host="...", port="..." and alias="..." of kFarlinkFile. A file that is missing is an
-/// appliance without relay service.
-/// \return one sentence when the file cannot be used.
+/// The lines host="...", port="..." and alias="..." of kFarlinkFile. A missing file means no relay
+/// service.
+/// \return the reason if the file cannot be used.
 [[nodiscard]] OVRAPLATFORM_EXPORT tl::expected<FarlinkSettings, std::string> readFarlinkSettings();
-/// \return false when the file cannot be written.
+/// \return false if the file cannot be written.
 [[nodiscard]] OVRAPLATFORM_EXPORT bool writeFarlinkSettings(const FarlinkSettings &settings);
 
-/// Why a call to the relay service had no success.
+/// Why a call to the relay service failed.
 struct FarlinkFailure {
     std::string text;                   ///< what went wrong and what to do, for people
     CredError error = CredError::kNone; ///< why no answer came
-    int code = 0;                       ///< otherwise: of the web API, why the service refused
+    int code = 0; ///< otherwise the web-API code with which the service refused
 };
 
-/// An answer of success, or why there is none.
+/// A successful answer, or why there is none.
 using FarlinkReply = tl::expected<OvraDRCore::Response, FarlinkFailure>;
 
 /// The calls of an appliance to its relay service. Its key is trusted on first use.
@@ -56,12 +56,12 @@ public:
     explicit FarlinkClient(FarlinkSettings settings)
         : settings_(std::move(settings)) {}
 
-    /// Where the alias is reached now: "port", and "host" where it is not that of the service.
+    /// Where the alias is reached now: "port", and "host" if it differs from that of the service.
     [[nodiscard]] FarlinkReply lookUp(const std::string &alias) const;
-    /// Proves that this appliance has the key of its alias, or takes a free alias: "port",
+    /// Proves that this appliance holds the key of its alias, or claims a free alias: "port",
     /// "tunnel_port", "token" and "expires".
     [[nodiscard]] FarlinkReply enrol(const FarlinkKey &key) const;
-    /// Waits for callers of the alias: "callers", maybe none. Error 119: enrol anew.
+    /// Waits for callers of the alias: "callers", possibly empty. Error 119: enrol again.
     [[nodiscard]] FarlinkReply wait(const std::string &token) const;
     /// Gives the alias up.
     [[nodiscard]] FarlinkReply release(const std::string &token) const;

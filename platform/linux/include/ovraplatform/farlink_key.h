@@ -13,16 +13,16 @@
 
 namespace OvraPlatform {
 
-/// The key by which the relay service knows whose an alias is: Ed25519 (RFC 8032).
+/// The key that identifies the owner of an alias to the relay service: Ed25519 (RFC 8032).
 class OVRAPLATFORM_EXPORT FarlinkKey {
 public:
-    /// Reads the key, and makes it when there is none. \return why not, in one sentence
+    /// Reads the key; creates it if there is none. \return the reason on failure
     [[nodiscard]] static tl::expected<FarlinkKey, std::string>
     loadOrCreate(const std::string &path = kFarlinkKeyFile);
 
     /// The public key, base64url.
     std::string publicText() const;
-    /// The signature of what enrols `alias` with the answer to `challenge`, base64url.
+    /// The signature that enrols `alias` in answer to `challenge`, base64url.
     std::string sign(const std::string &alias, const std::string &challenge) const;
 
 private:
@@ -31,7 +31,7 @@ private:
     OvraBase::SecretBytes<crypto_sign_SECRETKEYBYTES> secret_;
 };
 
-/// Whether sign() of the key that belongs to `publicText` made the signature.
+/// Whether the signature is from sign() with the key that belongs to `publicText`.
 [[nodiscard]] OVRAPLATFORM_EXPORT bool verifyFarlink(const std::string &publicText,
                                                      const std::string &alias,
                                                      const std::string &challenge,

@@ -24,7 +24,7 @@
 namespace OvraPlatform {
 
 using PublicKey = std::array<unsigned char, crypto_box_PUBLICKEYBYTES>;
-/// The key under which the reply to one request comes back.
+/// The key that seals the reply to one request.
 struct ReplyKey : OvraBase::SecretBytes<crypto_secretbox_KEYBYTES> {};
 
 /// The text form of a public key on the wire.
@@ -35,15 +35,15 @@ OVRAPLATFORM_EXPORT std::string fingerprintOf(const PublicKey &key);
 /// The key pair of an appliance.
 class OVRAPLATFORM_EXPORT SealKeyPair {
 public:
-    /// Reads a key file. \return why not: it is missing, damaged, or readable by others
+    /// Reads a key file. \return why it failed: missing, damaged, or readable by others
     [[nodiscard]] static tl::expected<SealKeyPair, std::string> load(const std::string &path);
-    /// Makes a key pair and its file, mode 0600. A file that is there already is never replaced: it
-    /// is loaded, also when another process made it at the same time.
+    /// Creates a key pair and its file, mode 0600. An existing file is never replaced but loaded,
+    /// even if another process created it at the same time.
     [[nodiscard]] static tl::expected<SealKeyPair, std::string>
     loadOrCreate(const std::string &path);
 
     const PublicKey &publicKey() const { return public_; }
-    /// The JSON object inside an envelope; nothing when it was not sealed to these keys.
+    /// The JSON object inside an envelope; std::nullopt if it was not sealed to these keys.
     [[nodiscard]] std::optional<Json::Value> unseal(const std::string &envelope) const;
 
 private:
@@ -58,15 +58,15 @@ using UnixMillis = std::int64_t;
 
 using SealNonce = std::array<unsigned char, 16>;
 
-/// Refuses sealed requests that are old, and those that were seen before. Safe for threads.
+/// Refuses sealed requests that are old or were seen before. Thread-safe.
 ///
 /// Its clock follows the system's forwards but never runs back, so that setting the clock back does
 /// not make old requests fresh again. After a restart nothing older than the start is accepted.
 class OVRAPLATFORM_EXPORT ReplayGuard {
 public:
-    /// How far behind this clock a request may be stamped: it is stamped before it connects.
+    /// How far behind this clock a request's stamp may be: it is stamped before connecting.
     static constexpr UnixMillis kMaxPast = 60'000;
-    /// How far ahead of it: what a clock that was just aligned may drift.
+    /// How far ahead of it: the drift of a clock that was just aligned.
     static constexpr UnixMillis kMaxFuture = 10'000;
     static constexpr std::size_t kMaxSeen = 65'536;
 
@@ -78,13 +78,13 @@ public:
     enum class Verdict { kFresh, kStale, kSeen };
 
     ReplayGuard();
-    /// \param capacity  how many requests are remembered; when more come within the window, the
-    ///                  oldest are forgotten and everything as old as they were is stale
+    /// \param capacity  how many requests are remembered; if more come within the window, the
+    ///                  oldest are forgotten and anything that old is stale
     explicit ReplayGuard(Clocks clocks, std::size_t capacity = kMaxSeen);
 
-    /// Judges a request and remembers a fresh one.
+    /// Checks a request and remembers a fresh one.
     Verdict admit(UnixMillis time, const SealNonce &nonce);
-    /// The time that a request has to be stamped with.
+    /// The time to stamp a request with.
     UnixMillis now();
 
 private:
@@ -94,7 +94,7 @@ private:
     std::size_t capacity_;
     std::mutex mutex_;
     UnixMillis offset_;
-    UnixMillis floor_; ///< what is stamped up to here is stale
+    UnixMillis floor_; ///< stamps up to here are stale
     std::set<std::pair<UnixMillis, SealNonce>> seen_;
 };
 
@@ -112,7 +112,7 @@ struct OpenedRequest {
 };
 
 /// Opens the envelope `visible.sealed`.
-/// \param opened  takes the whole call when it was opened, and the reply key unless it was
+/// \param opened  receives the whole call if it was opened, and the reply key unless it was
 /// unreadable
 OVRAPLATFORM_EXPORT SealVerdict openRequest(const SealKeyPair &keys, const WireCall &visible,
                                             ReplayGuard &guard, OpenedRequest &opened);

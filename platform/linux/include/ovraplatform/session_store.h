@@ -14,25 +14,25 @@
 
 namespace OvraPlatform {
 
-/// A login session. The id is a secret: whoever has it acts as the user.
+/// A login session. The id is a secret: its holder acts as the user.
 struct OVRAPLATFORM_EXPORT SessionRecord {
     std::string id;
     std::string user;
-    std::string app;          ///< "" when none was given
-    std::string extra;        ///< JSON text, or ""
-    std::string ui;           ///< JSON text, or ""
-    std::string remote;       ///< numeric address of the client, or "" when it is not known
-    std::int64_t created = 0; ///< seconds of the system clock
+    std::string app;                     ///< "" if none was given
+    std::string extra;                   ///< JSON text, or ""
+    std::string ui;                      ///< JSON text, or ""
+    std::string remote;                  ///< numeric address of the client, or "" if unknown
+    std::int64_t created = 0;            ///< seconds of the system clock
     std::optional<std::int64_t> expires; ///< absent: never
 
-    /// Names the session to people and in logs: 16 hexadecimal digits of the id's SHA-256. It opens
-    /// nothing.
+    /// Names the session to people and in logs: 16 hexadecimal digits of the id's SHA-256. It
+    /// grants no access.
     std::string reference() const;
     /// One line for people and logs, without the id.
     std::string toString() const;
 };
 
-/// What a new session is made of.
+/// The properties of a new session.
 struct SessionRequest {
     std::string user;
     std::string app;
@@ -44,8 +44,8 @@ struct SessionRequest {
 };
 
 /// The appliance's login sessions, in a SQLite file that all processes share. Expired sessions are
-/// never handed out; they are swept when a session is made, and by sweep(). The clock set back by
-/// more than a minute ends the timed sessions that lie in its future.
+/// never handed out; they are swept by sweep() and whenever a session is created. If the clock is
+/// set back by more than a minute, timed sessions from its future end.
 ///
 /// An object holds one connection: short-lived, for one thread, not kept across a fork. Every
 /// change is one transaction.
@@ -60,31 +60,30 @@ public:
 
     using Clock = std::function<std::time_t()>;
 
-    /// Opens the store; makes file and folder when missing.
+    /// Opens the store; creates the file and its folder if missing.
     explicit SessionStore(const std::string &path = kSessionsFile, Clock clock = {});
 
     bool isOpen() const { return database_.isOpen(); }
-    /// Why the last operation failed, one sentence; "" when it did not.
+    /// Why the last operation failed; "" if it succeeded.
     const std::string &error() const { return database_.error(); }
 
     /// Whether `text` can be the extra or ui text of a session: a JSON object, not too long.
     static bool isData(const std::string &text);
 
-    /// Makes a session. \return its id, 43 characters (256 random bits); nothing on failure.
+    /// Creates a session. \return its id, 43 characters (256 random bits); std::nullopt on failure.
     [[nodiscard]] std::optional<std::string> create(const SessionRequest &request);
-    /// The live session with this id. The time that it takes tells nothing about the ids that
-    /// exist.
+    /// The live session with this id. The time taken reveals nothing about existing ids.
     std::optional<SessionRecord> find(const std::string &id);
-    /// Every live session, the oldest first. \return false on failure.
+    /// All live sessions, oldest first. \return false on failure.
     [[nodiscard]] bool list(std::vector<SessionRecord> &sessions);
-    /// Removes the session with this id. \return false on failure; one that is not there is
+    /// Removes the session with this id. \return false on failure; a missing session counts as
     /// removed.
     [[nodiscard]] bool remove(const std::string &id);
     /// Removes the expired sessions. \return false on failure.
     [[nodiscard]] bool sweep();
-    /// Removes, together, the live sessions for which `test` answers true. `test` is called while
-    /// the store is not locked: it may use the store itself.
-    /// \return false on failure; nothing is removed then.
+    /// Removes together the live sessions for which `test` returns true. The store is not locked
+    /// during `test`, which may use it.
+    /// \return false on failure; then nothing is removed.
     [[nodiscard]] bool removeIf(const std::function<bool(const SessionRecord &)> &test);
 
 private:

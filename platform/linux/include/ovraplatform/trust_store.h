@@ -18,7 +18,7 @@ class FileUpdate;
 
 namespace OvraPlatform {
 
-/// What the store says about a key of an endpoint.
+/// What the store says about an endpoint's key.
 enum class TrustVerdict {
     kTrusted,     ///< it is the pinned one
     kUnknown,     ///< no key is pinned for the endpoint
@@ -26,12 +26,12 @@ enum class TrustVerdict {
     kUnavailable, ///< the file cannot be read or written; an ERR line says why
 };
 
-/// The keys that endpoints had when they were first met: a text file of mode 0600, one line
-/// "ENDPOINT FINGERPRINT" each, shared by all processes of the appliance.
+/// The keys that endpoints had at first contact: a text file of mode 0600 with a line "ENDPOINT
+/// FINGERPRINT" for each, shared by all processes of the appliance.
 ///
-/// A change is made under a lock and replaces the file at once, so that a reader needs no lock and
-/// a crash leaves the old file or the new one. Lines that are none of ours stay where they are and
-/// count for nothing; of two lines for one endpoint the first counts.
+/// A change is made under a lock and replaces the file atomically, so that readers need no lock and
+/// a crash leaves either the old file or the new one. Foreign lines are kept and ignored; of two
+/// lines for one endpoint the first counts.
 class OVRAPLATFORM_EXPORT TrustStore {
 public:
     struct Entry {
@@ -47,12 +47,12 @@ public:
     /// Trusts the key from now on, unless another one is pinned.
     /// \return kTrusted, kDifferent or kUnavailable
     TrustVerdict pin(const std::string &endpoint, const std::string &fingerprint);
-    /// Drops the key of the endpoint. \return false when the file could not be changed; an endpoint
-    /// without a key is no failure.
+    /// Drops the key of the endpoint. \return false if the file could not be changed; an endpoint
+    /// without a key is not a failure.
     [[nodiscard]] bool forget(const std::string &endpoint);
-    /// Every pinned key in the order of the file; nothing when the file cannot be read.
+    /// Every pinned key in file order; std::nullopt if the file cannot be read.
     std::optional<std::vector<Entry>> list() const;
-    /// For those who keep what they looked up: it holds while the stamp is the same.
+    /// For callers that cache a lookup: it is valid as long as the stamp is unchanged.
     Stamp stamp() const;
 
 private:
