@@ -270,7 +270,7 @@ bool RelayApi::isThere(const Agent &agent) const {
 }
 
 /// Answers with all waiting callers.
-void RelayApi::tellCallers(Agent &agent, const Answer &answer) {
+void RelayApi::deliverCallers(Agent &agent, const Answer &answer) {
     Json::Value data(Json::objectValue);
     data["callers"] = Json::Value(Json::arrayValue);
     for (const std::string &caller : agent.callers) {
@@ -290,10 +290,10 @@ void RelayApi::wait(const Json::Value &params, const Answer &answer) {
     }
     if (agent->waiting) {
         // The connection of the earlier poll was lost.
-        tellCallers(*agent, std::exchange(agent->waiting, nullptr));
+        deliverCallers(*agent, std::exchange(agent->waiting, nullptr));
     }
     if (!agent->callers.empty()) {
-        tellCallers(*agent, answer);
+        deliverCallers(*agent, answer);
         return;
     }
     agent->waiting = answer;
@@ -336,7 +336,7 @@ bool RelayApi::announce(const std::string &alias, const std::string &caller) {
     Agent &agent = found->second;
     agent.callers.push_back(caller);
     if (agent.waiting) {
-        tellCallers(agent, std::exchange(agent.waiting, nullptr));
+        deliverCallers(agent, std::exchange(agent.waiting, nullptr));
     }
     return true;
 }
@@ -345,7 +345,7 @@ void RelayApi::endOverdue() {
     const std::lock_guard lock(mutex_);
     for (auto &[name, agent] : agents_) {
         if (agent.waiting && Clock::now() - agent.waitingSince >= OvraPlatform::kFarlinkHold) {
-            tellCallers(agent, std::exchange(agent.waiting, nullptr));
+            deliverCallers(agent, std::exchange(agent.waiting, nullptr));
         }
     }
     for (const Alias &alias : aliases_.dropExpired(std::time(nullptr))) {

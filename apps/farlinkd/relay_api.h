@@ -72,7 +72,7 @@ private:
                  const std::string &key) const;
     Agent *agentOf(const Json::Value &params);
     bool isThere(const Agent &agent) const;
-    static void tellCallers(Agent &agent, const Answer &answer);
+    static void deliverCallers(Agent &agent, const Answer &answer);
     [[nodiscard]] bool openPort(const Alias &alias);
     void leave(const std::string &alias);
 

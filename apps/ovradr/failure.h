@@ -27,7 +27,7 @@ enum class ExitCode : int {
     kNotFound = 7,
     kNotPermitted = 8,
     kNotSetUp = 9, ///< not set up, or the files of this appliance cannot be used
-    // Distinguished only by an examination.
+    // Distinguished only by a diagnosis.
     kNameUnknown = 10, ///< unknown host name
     kNoAppliance = 11, ///< what answers is not an appliance
     kWrongNode = 12,   ///< a different node than the paired one answers

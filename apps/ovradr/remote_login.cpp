@@ -40,7 +40,7 @@ void addFingerprintOption(CLI::App &command, std::string &fingerprint) {
         ->check(checkFingerprint);
 }
 
-Expected<Conn> meet(const Conn &conn, const std::string &fingerprint) {
+Expected<Conn> trustedEndpoint(const Conn &conn, const std::string &fingerprint) {
     return directEndpoint(conn).and_then([&fingerprint](const Conn &direct) {
         return trustPeer(direct, fingerprint).map([&direct] { return direct; });
     });

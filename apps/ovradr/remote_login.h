@@ -36,8 +36,8 @@ void addFingerprintOption(CLI::App &command, std::string &fingerprint);
 /// \param conn         may be a relay endpoint
 /// \param fingerprint  the required key, or ""
 /// \return the direct endpoint
-[[nodiscard]] Expected<OvraDRNode::Conn> meet(const OvraDRNode::Conn &conn,
-                                              const std::string &fingerprint);
+[[nodiscard]] Expected<OvraDRNode::Conn> trustedEndpoint(const OvraDRNode::Conn &conn,
+                                                         const std::string &fingerprint);
 
 /// Logs in; returns the library's error code, 0 on success.
 using LoginAttempt = std::function<int(const std::string &password, const std::string &code)>;

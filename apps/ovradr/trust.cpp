@@ -127,7 +127,7 @@ std::string trustText(const PeerIdentity &identity) {
 
 Expected<void> trustPeer(const Conn &conn, const std::string &expected) {
     const auto met =
-        OvraPlatform::peerFingerprint(conn.protocol, conn.addr, conn.port, kMeetSeconds);
+        OvraPlatform::peerFingerprint(conn.protocol, conn.addr, conn.port, kKeySeconds);
     if (!met) {
         return endpointFailure(conn, met.error());
     }

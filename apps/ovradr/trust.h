@@ -11,7 +11,7 @@
 namespace Ovradr {
 
 /// How long to wait for an endpoint to show its key, in seconds.
-inline constexpr long kMeetSeconds = 10;
+inline constexpr long kKeySeconds = 10;
 
 /// For command lines: "" if the text is a fingerprint ("SHA256:" and 43 characters of base64, as
 /// setup and `conn local` show it), otherwise what is wrong.

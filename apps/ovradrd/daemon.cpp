@@ -1,8 +1,8 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "daemon.h"
 
+#include "call_dispatcher.h"
 #include "farlink_agent.h"
-#include "gateway.h"
 #include "handlers/auth.h"
 #include "handlers/handlers.h"
 #include "release_retries.h"
@@ -89,7 +89,7 @@ struct Daemon::Impl {
     OvraPlatform::ReplayGuard guard;
     LoginApi loginApi;
     OvraPlatform::APIRegistry registry;
-    std::optional<Gateway> gateway;
+    std::optional<CallDispatcher> dispatcher;
     std::optional<FarlinkAgent> farlink;
     // Their threads use everything above.
     std::optional<ReleaseRetries> retries;
@@ -175,15 +175,16 @@ tl::expected<void, StartError> Daemon::start() {
     self.addHandlers();
     self.queues.emplace();
     self.retries.emplace(self.queues->slow);
-    self.gateway.emplace(self.registry, *self.keys, self.guard, self.loginApi, *self.queues);
-    self.local.emplace(OvraPlatform::kSocketFile,
-                       [&self](const LocalCall &call) { return self.gateway->serveLocal(call); });
+    self.dispatcher.emplace(self.registry, *self.keys, self.guard, self.loginApi, *self.queues);
+    self.local.emplace(OvraPlatform::kSocketFile, [&self](const LocalCall &call) {
+        return self.dispatcher->serveLocal(call);
+    });
     if (const auto started = self.local->start(); !started) {
         return failed({started.error()});
     }
     self.http.emplace(
         [&self](HttpRequest request, const HttpServer::Answer &answer) {
-            self.gateway->serve(std::move(request), answer);
+            self.dispatcher->serve(std::move(request), answer);
         },
         self.settings.limits, testFiles(self.settings.testFiles));
     if (const auto started = self.http->start(std::move(*https), std::move(*http), *self.identity);
@@ -223,8 +224,8 @@ bool Daemon::stop() {
             ended = queue->stop(deadline) && ended;
         }
     }
-    if (self.gateway) {
-        self.gateway->leaveLocal();
+    if (self.dispatcher) {
+        self.dispatcher->leaveLocal();
     }
     if (self.local) {
         self.local->stop();

@@ -114,9 +114,9 @@ namespace {
 using Went = tl::expected<void, FarlinkFailure>;
 
 /// One session with the relay service, under one alias.
-class Stay {
+class RelayRegistration {
 public:
-    explicit Stay(FarlinkSettings settings)
+    explicit RelayRegistration(FarlinkSettings settings)
         : settings_(std::move(settings))
         , client_(settings_) {}
 
@@ -185,25 +185,25 @@ private:
 } // namespace
 
 void FarlinkAgent::run(const std::shared_ptr<State> &state) {
-    std::optional<Stay> stay;
+    std::optional<RelayRegistration> registration;
     std::chrono::seconds pause{0};
     while (state->pause(pause)) {
         const auto settings = OvraPlatform::readFarlinkSettings();
         if (!settings || settings->host.empty() || settings->alias.empty()) {
-            stay.reset();
+            registration.reset();
             state->tell({false, 0, 0, settings ? "" : settings.error()});
             pause = kLook;
             continue;
         }
         Went went;
-        if (!stay || !stay->isFor(*settings) || stay->isOver()) {
-            stay.emplace(*settings);
-            went = stay->begin();
+        if (!registration || !registration->isFor(*settings) || registration->isOver()) {
+            registration.emplace(*settings);
+            went = registration->begin();
         }
         bool forgotten = false;
         if (went) {
-            state->tell(stay->status());
-            went = stay->serve(
+            state->tell(registration->status());
+            went = registration->serve(
                 [&settings] { return OvraPlatform::readFarlinkSettings() == settings; },
                 [&state](OvraService::ConnectedClient client) { state->hand(std::move(client)); });
             forgotten = !went && went.error().code == OvraPlatform::APIError::kNoSession;
@@ -214,7 +214,7 @@ void FarlinkAgent::run(const std::shared_ptr<State> &state) {
         }
         // If it was only forgotten, it comes back at once.
         state->tell({false, 0, 0, went.error().text});
-        stay.reset();
+        registration.reset();
         pause = forgotten && pause.count() == 0 ? kMinPause
                                                 : std::clamp(pause * 2, kMinPause, kMaxPause);
     }

@@ -29,7 +29,7 @@ std::chrono::milliseconds delayAfter(int failures) {
 LoginThrottle::LoginThrottle(Clock clock)
     : clock_(std::move(clock)) {}
 
-void LoginThrottle::makeRoom(Entries &entries, TimePoint now) {
+void LoginThrottle::dropSmallest(Entries &entries, TimePoint now) {
     std::erase_if(entries, [now](const auto &item) {
         return now - item.second.counted >= item.second.failures * kDecay;
     });
@@ -47,7 +47,7 @@ LoginThrottle::Entry &LoginThrottle::entryOf(Entries &entries, const std::string
     auto found = entries.find(key);
     if (found == entries.end()) {
         if (entries.size() >= kMaxEntries) {
-            makeRoom(entries, now);
+            dropSmallest(entries, now);
         }
         found = entries.emplace(key, Entry{0, now, TimePoint::min()}).first;
     }
@@ -87,23 +87,23 @@ std::optional<std::chrono::milliseconds> LoginThrottle::admit(const std::string 
     return wait;
 }
 
-void LoginThrottle::takeBack(Entries &entries, const std::string &key) {
+void LoginThrottle::undoFailure(Entries &entries, const std::string &key) {
     const auto found = entries.find(key);
     if (found != entries.end() && found->second.failures > 0) {
         --found->second.failures;
     }
 }
 
-void LoginThrottle::forgive(const std::string &account, const std::string &address) {
+void LoginThrottle::withdraw(const std::string &account, const std::string &address) {
     const std::lock_guard lock(mutex_);
-    takeBack(accounts_, account);
-    takeBack(addresses_, OvraBase::clientKey(address));
+    undoFailure(accounts_, account);
+    undoFailure(addresses_, OvraBase::clientKey(address));
 }
 
-void LoginThrottle::succeeded(const std::string &account, const std::string &address) {
+void LoginThrottle::recordSuccess(const std::string &account, const std::string &address) {
     const std::lock_guard lock(mutex_);
     accounts_.erase(account);
-    takeBack(addresses_, OvraBase::clientKey(address));
+    undoFailure(addresses_, OvraBase::clientKey(address));
 }
 
 } // namespace Ovradrd

@@ -29,16 +29,16 @@ public:
 
     explicit LoginThrottle(Clock clock = std::chrono::steady_clock::now);
 
-    /// Asks for a log-in. It counts as failed until forgive() or succeeded() says otherwise.
+    /// Asks for a log-in. It counts as failed until withdraw() or recordSuccess() says otherwise.
     /// \return how long to wait before the password is checked; std::nullopt: refuse it unchecked
     ///         (then it is not counted).
     std::optional<std::chrono::milliseconds> admit(const std::string &account,
                                                    const std::string &address);
     /// The log-in was no guess: it lacked the one-time code only, or could not be checked.
-    void forgive(const std::string &account, const std::string &address);
+    void withdraw(const std::string &account, const std::string &address);
     /// The log-in was right: the failures of the account are forgotten. Those of the address stay,
     /// so that a log-in to one's own account does not pay for guessing others.
-    void succeeded(const std::string &account, const std::string &address);
+    void recordSuccess(const std::string &account, const std::string &address);
 
 private:
     struct Entry {
@@ -49,8 +49,8 @@ private:
     using Entries = std::map<std::string, Entry>;
 
     static Entry &entryOf(Entries &entries, const std::string &key, TimePoint now);
-    static void makeRoom(Entries &entries, TimePoint now);
-    static void takeBack(Entries &entries, const std::string &key);
+    static void dropSmallest(Entries &entries, TimePoint now);
+    static void undoFailure(Entries &entries, const std::string &key);
 
     Clock clock_;
     std::mutex mutex_;

@@ -14,9 +14,9 @@ namespace {
 
 /// A store of this thread.
 template <typename Store>
-class KeptStore {
+class ThreadStore {
 public:
-    explicit KeptStore(const char *path)
+    explicit ThreadStore(const char *path)
         : path_(path) {}
 
     Store &get() {
@@ -48,8 +48,8 @@ private:
 } // namespace
 
 SessionOwner findSessionOwner(const std::string &sid) {
-    thread_local KeptStore<OvraPlatform::SessionStore> keptSessions(OvraPlatform::kSessionsFile);
-    thread_local KeptStore<OvraPlatform::AccountStore> keptAccounts(OvraPlatform::kAccountsFile);
+    thread_local ThreadStore<OvraPlatform::SessionStore> keptSessions(OvraPlatform::kSessionsFile);
+    thread_local ThreadStore<OvraPlatform::AccountStore> keptAccounts(OvraPlatform::kAccountsFile);
 
     OvraPlatform::SessionStore &sessions = keptSessions.get();
     const auto session = sessions.find(sid);

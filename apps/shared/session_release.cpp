@@ -55,7 +55,7 @@ Release lookAfter(const Conn &conn, const std::string &session, Release::State w
 }
 
 /// Updates the note to what happened to the session.
-void settle(PendingReleases &store, const PendingRelease &pending, Release &release) {
+void recordOutcome(PendingReleases &store, const PendingRelease &pending, Release &release) {
     release.remembered =
         release.state == Release::State::kLeft && store.postpone(pending.reference(), release.code);
     if (release.state != Release::State::kLeft) {
@@ -79,20 +79,20 @@ const char *releaseWord(Release::State state) {
     return "left_behind";
 }
 
-Release foreseeRelease(const DRNode &record) {
+Release predictRelease(const DRNode &record) {
     return look(record.conn, record.session, record.credId, Release::State::kEndedAlready)
         .value_or(Release{Release::State::kReleased, 0, {}, false});
 }
 
-ReleasingFlow runReleasing(const DRNode &record, const Conn &conn,
-                           const std::function<bool()> &flow) {
+FlowResult runWithRelease(const DRNode &record, const Conn &conn,
+                          const std::function<bool()> &flow) {
     DRNode superfluous = record;
     superfluous.conn = conn;
-    const bool wasGone = foreseeRelease(superfluous).state == Release::State::kEndedAlready;
+    const bool wasGone = predictRelease(superfluous).state == Release::State::kEndedAlready;
     const PendingRelease pending{record.session, conn, record.nodeId, record.credId};
     PendingReleases store;
     const bool noted = !record.session.empty() && conn.isValid() && store.note(pending);
-    ReleasingFlow result;
+    FlowResult result;
     {
         const SessionLock lock(SessionLock::Purpose::kRelease);
         result.done = flow();
@@ -105,13 +105,13 @@ ReleasingFlow runReleasing(const DRNode &record, const Conn &conn,
     result.release = lookAfter(conn, record.session,
                                wasGone ? Release::State::kEndedAlready : Release::State::kReleased);
     if (noted) {
-        settle(store, pending, result.release);
+        recordOutcome(store, pending, result.release);
     }
     return result;
 }
 
-ReleasingFlow deleteCredential(const DRNode &record, bool temporary) {
-    return runReleasing(record, record.conn, [&record, temporary] {
+FlowResult deleteCredential(const DRNode &record, bool temporary) {
+    return runWithRelease(record, record.conn, [&record, temporary] {
         return temporary ? OvraDRNode::TempCredDelete(record.credId).process()
                          : OvraDRNode::DRNodeCredDelete(record.credId).process();
     });
@@ -132,7 +132,7 @@ Release retryRelease(const PendingRelease &pending, PendingReleases &store) {
         }
         result = now ? *now : lookAfter(pending.conn, pending.session, Release::State::kReleased);
     }
-    settle(store, pending, result);
+    recordOutcome(store, pending, result);
     OVRA_NOTICE("The session [%s] at node [%s] is [%s], attempt [%d]", pending.reference().c_str(),
                 pending.nodeId.c_str(), releaseWord(result.state), pending.attempts + 1);
     return result;

@@ -30,9 +30,9 @@ const char *releaseWord(Release::State state);
 
 /// What would happen to the session if the credential were deleted now; changes nothing. kReleased:
 /// the node would be told.
-Release foreseeRelease(const OvraDRNode::DRNode &record);
+Release predictRelease(const OvraDRNode::DRNode &record);
 
-struct ReleasingFlow {
+struct FlowResult {
     bool done = false; ///< what the flow answered
     Release release;
 };
@@ -43,12 +43,12 @@ struct ReleasingFlow {
 /// if it cannot be noted, the flow runs anyway.
 ///
 /// \param conn  the endpoint over which the flow releases
-ReleasingFlow runReleasing(const OvraDRNode::DRNode &record, const OvraDRNode::Conn &conn,
-                           const std::function<bool()> &flow);
+FlowResult runWithRelease(const OvraDRNode::DRNode &record, const OvraDRNode::Conn &conn,
+                          const std::function<bool()> &flow);
 
 /// Deletes a credential, lasting or temporary: its row, then its session on the other node unless
 /// a lasting credential still uses it. `done`: the row is gone, whatever the other node says.
-ReleasingFlow deleteCredential(const OvraDRNode::DRNode &record, bool temporary);
+FlowResult deleteCredential(const OvraDRNode::DRNode &record, bool temporary);
 
 /// Tries a release that is pending, and forgets or postpones it in the store.
 Release retryRelease(const PendingRelease &pending, PendingReleases &store);

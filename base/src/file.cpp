@@ -18,13 +18,13 @@ namespace {
 constexpr std::chrono::seconds kLockWait{5};
 
 /// Removes a temporary file unless it has been renamed.
-class Aside {
+class TemporaryFile {
 public:
-    explicit Aside(std::string path)
+    explicit TemporaryFile(std::string path)
         : path_(std::move(path)) {}
-    Aside(const Aside &) = delete;
-    Aside &operator=(const Aside &) = delete;
-    ~Aside() {
+    TemporaryFile(const TemporaryFile &) = delete;
+    TemporaryFile &operator=(const TemporaryFile &) = delete;
+    ~TemporaryFile() {
         if (!path_.empty()) {
             unlink(path_.c_str());
         }
@@ -148,17 +148,17 @@ Expected<bool> createFile(const std::string &path, std::string_view content, mod
         return false;
     }
     // Written under a temporary name and then linked: the file is complete when its name appears.
-    std::string asidePath = path + ".XXXXXX";
-    const UniqueFd fd(mkostemp(asidePath.data(), O_CLOEXEC));
+    std::string temporaryPath = path + ".XXXXXX";
+    const UniqueFd fd(mkostemp(temporaryPath.data(), O_CLOEXEC));
     if (!fd) {
         return lastSystemError();
     }
-    const Aside aside(asidePath);
+    const TemporaryFile temporary(temporaryPath);
     const Expected<void> written = writeAndSync(fd.get(), content, mode);
     if (!written) {
         return Unexpected(written.error());
     }
-    if (link(asidePath.c_str(), path.c_str()) != 0) {
+    if (link(temporaryPath.c_str(), path.c_str()) != 0) {
         return errno == EEXIST ? Expected<bool>(false) : lastSystemError();
     }
     const UniqueFd folder(open(folderOf(path).c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
@@ -187,14 +187,14 @@ Expected<void> FileUpdate::commit(std::string_view content, mode_t modeWhenNew) 
     if (exists && !S_ISREG(old.st_mode)) {
         return systemError(EINVAL);
     }
-    const std::string asidePath = path_ + ".new";
-    unlink(asidePath.c_str());
+    const std::string temporaryPath = path_ + ".new";
+    unlink(temporaryPath.c_str());
     UniqueFd fd(
-        open(asidePath.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC | O_NOFOLLOW, 0600));
+        open(temporaryPath.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC | O_NOFOLLOW, 0600));
     if (!fd) {
         return lastSystemError();
     }
-    Aside aside(asidePath);
+    TemporaryFile temporary(temporaryPath);
     if (exists) {
         mode = old.st_mode & 07777U;
         // Only the superuser can change the owner; for others the file becomes their own.
@@ -205,7 +205,7 @@ Expected<void> FileUpdate::commit(std::string_view content, mode_t modeWhenNew) 
     if (Expected<void> written = writeAndSync(fd.get(), content, mode); !written) {
         return written;
     }
-    if (close(fd.release()) != 0 || !aside.renameTo(path_) || fsync(directory_.get()) != 0) {
+    if (close(fd.release()) != 0 || !temporary.renameTo(path_) || fsync(directory_.get()) != 0) {
         return lastSystemError();
     }
     return {};

@@ -48,7 +48,7 @@ Outcome test(const Conn &conn) {
                           std::chrono::steady_clock::now() - start)
                           .count();
     const auto met =
-        OvraPlatform::peerFingerprint(direct->protocol, direct->addr, direct->port, kMeetSeconds);
+        OvraPlatform::peerFingerprint(direct->protocol, direct->addr, direct->port, kKeySeconds);
     Report report;
     report.data["endpoint"] = targetText(*direct);
     report.data["connectable"] = true;

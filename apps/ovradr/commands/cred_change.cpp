@@ -15,7 +15,7 @@ namespace Ovradr {
 
 namespace {
 
-using OvraApps::ReleasingFlow;
+using OvraApps::FlowResult;
 using OvraDRNode::Conn;
 using OvraDRNode::DRNode;
 using OvraDRNode::DRNodeCredSet;
@@ -52,8 +52,7 @@ Refusal setFailure(const DRNodeCredSet &flow, const Conn &conn) {
 }
 
 /// What an update did, according to the current row.
-Outcome reportUpdate(const DRNode &before, const std::string &account,
-                     const ReleasingFlow &result) {
+Outcome reportUpdate(const DRNode &before, const std::string &account, const FlowResult &result) {
     DRNode now;
     if (!OvraDRNode::DRNodeDB::GetCred(before.credId, now)) {
         return failureOf(ERR::kCredNotFound);
@@ -77,8 +76,8 @@ Outcome reportUpdate(const DRNode &before, const std::string &account,
 Outcome runUpdate(DRNodeCredSet &flow, const DRNode &record, const Conn &conn,
                   const SetOptions &options) {
     if (!options.dryRun) {
-        const ReleasingFlow result =
-            OvraApps::runReleasing(record, conn, [&flow] { return flow.process(); });
+        const FlowResult result =
+            OvraApps::runWithRelease(record, conn, [&flow] { return flow.process(); });
         return result.done ? reportUpdate(record, options.login.account, result)
                            : setFailure(flow, conn);
     }
@@ -106,7 +105,7 @@ Outcome set(const SetOptions &options) {
     if (!conn) {
         return Refusal(conn.error());
     }
-    const Expected<Conn> direct = meet(*conn, options.fingerprint);
+    const Expected<Conn> direct = trustedEndpoint(*conn, options.fingerprint);
     if (!direct) {
         return Refusal(direct.error());
     }
@@ -142,9 +141,9 @@ Outcome remove(const DeleteOptions &options) {
         return Refusal(cred.error());
     }
     if (options.dryRun) {
-        return reportDeletion(cred->record, OvraApps::foreseeRelease(cred->record), true);
+        return reportDeletion(cred->record, OvraApps::predictRelease(cred->record), true);
     }
-    const ReleasingFlow result = OvraApps::deleteCredential(cred->record, cred->temporary);
+    const FlowResult result = OvraApps::deleteCredential(cred->record, cred->temporary);
     if (!result.done) {
         return failure(ExitCode::kNotSetUp,
                        "The credential could not be deleted from the node database.",

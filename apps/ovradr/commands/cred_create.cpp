@@ -158,7 +158,7 @@ Outcome create(const CreateOptions &options) {
     if (const auto usable = checkNodeDatabase(); !usable) {
         return Refusal(usable.error());
     }
-    const Expected<Conn> direct = meet(*conn, options.fingerprint);
+    const Expected<Conn> direct = trustedEndpoint(*conn, options.fingerprint);
     if (!direct) {
         return Refusal(direct.error());
     }

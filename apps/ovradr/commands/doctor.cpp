@@ -1,7 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "commands/commands.h"
+#include "diagnosis.h"
 #include "endpoint.h"
-#include "examination.h"
 #include "node_ref.h"
 #include "node_view.h"
 #include "output.h"
@@ -30,15 +30,15 @@ struct DoctorOptions {
     std::string fingerprint;
 };
 
-/// The result of all examinations: the first failure, with everything that was found.
-Outcome conclude(const std::vector<Examination> &examinations) {
+/// The result of all diagnoses: the first failure, with everything that was found.
+Outcome conclude(const std::vector<Diagnosis> &diagnoses) {
     Report report;
     report.data["examinations"] = Json::Value(Json::arrayValue);
     Expected<void> verdict;
-    for (const Examination &examination : examinations) {
-        report.data["examinations"].append(examination.toJson());
-        report.text += (report.text.empty() ? "" : "\n") + examination.toText();
-        verdict = verdict ? examination.verdict() : verdict;
+    for (const Diagnosis &diagnosis : diagnoses) {
+        report.data["examinations"].append(diagnosis.toJson());
+        report.text += (report.text.empty() ? "" : "\n") + diagnosis.toText();
+        verdict = verdict ? diagnosis.verdict() : verdict;
     }
     if (verdict) {
         report.text += "\nNothing is wrong.\n";
@@ -50,24 +50,24 @@ Outcome conclude(const std::vector<Examination> &examinations) {
 }
 
 Outcome examineLocal() {
-    std::vector<Examination> examinations;
-    examinations.emplace_back("This appliance");
-    examineAppliance(examinations.back());
+    std::vector<Diagnosis> diagnoses;
+    diagnoses.emplace_back("This appliance");
+    diagnoseAppliance(diagnoses.back());
     for (const Conn &conn : Conn::listLocal()) {
-        examinations.emplace_back("Own endpoint " + targetText(conn));
-        examineEndpoint({conn, {}, {}, ownFingerprint(conn), true}, examinations.back());
+        diagnoses.emplace_back("Own endpoint " + targetText(conn));
+        diagnoseEndpoint({conn, {}, {}, ownFingerprint(conn), true}, diagnoses.back());
     }
-    return conclude(examinations);
+    return conclude(diagnoses);
 }
 
 Outcome examineNode(const std::string &nodeId) {
-    std::vector<Examination> examinations;
+    std::vector<Diagnosis> diagnoses;
     for (const auto &candidate : OvraDRNode::listNodeCandidates(nodeId)) {
-        examinations.emplace_back("Credential " + shortId(candidate.node.credId) + ", " +
-                                  targetText(candidate.node.conn));
-        examineEndpoint({candidate.node.conn, candidate.node, {}, ""}, examinations.back());
+        diagnoses.emplace_back("Credential " + shortId(candidate.node.credId) + ", " +
+                               targetText(candidate.node.conn));
+        diagnoseEndpoint({candidate.node.conn, candidate.node, {}, ""}, diagnoses.back());
     }
-    return conclude(examinations);
+    return conclude(diagnoses);
 }
 
 /// A credential with this endpoint, the lasting ones first.
@@ -84,11 +84,11 @@ Outcome examineUrl(const DoctorOptions &options) {
     if (!conn) {
         return Refusal(conn.error());
     }
-    std::vector<Examination> examinations;
-    examinations.emplace_back("Endpoint " + targetText(*conn));
+    std::vector<Diagnosis> diagnoses;
+    diagnoses.emplace_back("Endpoint " + targetText(*conn));
     if (options.account.empty()) {
-        examineEndpoint({*conn, credentialAt(*conn), {}, ""}, examinations.back());
-        return conclude(examinations);
+        diagnoseEndpoint({*conn, credentialAt(*conn), {}, ""}, diagnoses.back());
+        return conclude(diagnoses);
     }
     const Expected<Secret> password = obtainPassword(
         options.password, "Password of " + options.account + " on " + conn->addr, false);
@@ -96,8 +96,8 @@ Outcome examineUrl(const DoctorOptions &options) {
         return Refusal(password.error());
     }
     const LoginTrial login{options.account, *password, options.oneTimeCode};
-    examineEndpoint({*conn, {}, login, options.fingerprint}, examinations.back());
-    return conclude(examinations);
+    diagnoseEndpoint({*conn, {}, login, options.fingerprint}, diagnoses.back());
+    return conclude(diagnoses);
 }
 
 bool isUrl(const std::string &text) {

@@ -91,8 +91,8 @@ std::optional<std::chrono::milliseconds> LoginApi::admit(const Json::Value &para
     return throttle_.admit(countedAccount(params), address);
 }
 
-void LoginApi::forgive(const Json::Value &params, const std::string &address) {
-    throttle_.forgive(countedAccount(params), address);
+void LoginApi::withdraw(const Json::Value &params, const std::string &address) {
+    throttle_.withdraw(countedAccount(params), address);
 }
 
 Json::Value LoginApi::login(const Json::Value &params, const APICaller &caller) {
@@ -105,20 +105,20 @@ Json::Value LoginApi::login(const Json::Value &params, const APICaller &caller) 
     const OvraBase::Secret password = in.secret("passwd", Params::kMaxPassword);
     const std::string code = in.optionalSecret("otp_code", Params::kMaxCode);
     if (!in.ok()) {
-        forgive(params, caller.address);
+        withdraw(params, caller.address);
         return in.error();
     }
     const LoginResult result = AccountStore().verify(account, password.get(), code);
     switch (result) {
     case LoginResult::kOk:
-        throttle_.succeeded(account, caller.address);
+        throttle_.recordSuccess(account, caller.address);
         OVRA_NOTICE("[%s] logged in from [%s]", account.c_str(), caller.address.c_str());
         return openSession(account, caller);
     case LoginResult::kWrong:
     case LoginResult::kCodeWrong:
         break;
     default:
-        forgive(params, caller.address);
+        withdraw(params, caller.address);
         break;
     }
     OVRA_NOTICE("A log-in of [%s] from [%s] was refused with [%d]", loggable(account).c_str(),

@@ -30,7 +30,7 @@ public:
     std::optional<std::chrono::milliseconds> admit(const Json::Value &params,
                                                    const std::string &address);
     /// The admitted log-in is not carried out after all.
-    void forgive(const Json::Value &params, const std::string &address);
+    void withdraw(const Json::Value &params, const std::string &address);
 
     /// Registers the methods; the api must outlive the registry.
     void addTo(OvraPlatform::APIRegistry &registry);

@@ -206,7 +206,7 @@ Json::Value set(const Json::Value &params, bool dryRun) {
     const bool armed = flow.setCredId(credId) &&
                        flow.setCred(conn, login.account, login.password.get(), login.otpCode);
     const auto change = [&flow] { return flow.process(); };
-    if (!armed || !(dryRun ? flow.check() : OvraApps::runReleasing(record, conn, change).done)) {
+    if (!armed || !(dryRun ? flow.check() : OvraApps::runWithRelease(record, conn, change).done)) {
         return flowError(flow, ERR::kCredIncomplete);
     }
     if (!DRNodeDB::GetCred(credId, record)) {
@@ -227,7 +227,7 @@ Json::Value remove(const Json::Value &params, const APICaller & /*caller*/) {
     if (!temporary && !DRNodeDB::GetCred(credId, record)) {
         record.credId = credId;
     }
-    const OvraApps::ReleasingFlow result = OvraApps::deleteCredential(record, temporary);
+    const OvraApps::FlowResult result = OvraApps::deleteCredential(record, temporary);
     if (!result.done) {
         return apiError(ERR::kFailed, "the credential cannot be deleted: see the log of the "
                                       "appliance, and check that its disk is not full");

@@ -35,7 +35,7 @@ tl::unexpected<FarlinkFailure> noAnswer(CredError error) {
 }
 
 /// An answer that is no success is why there is none.
-FarlinkReply judge(WebReply reply) {
+FarlinkReply verdictOn(WebReply reply) {
     if (reply.response.isSuccess()) {
         return std::move(reply.response);
     }
@@ -97,7 +97,7 @@ FarlinkReply FarlinkClient::call(const char *method, const Json::Value &params,
     wire.method = method;
     wire.params = params;
     auto reply = callWebAPI(*endpoint, wire, {std::chrono::steady_clock::now() + time});
-    return reply ? judge(std::move(*reply)) : noAnswer(reply.error());
+    return reply ? verdictOn(std::move(*reply)) : noAnswer(reply.error());
 }
 
 FarlinkReply FarlinkClient::lookUp(const std::string &alias) const {

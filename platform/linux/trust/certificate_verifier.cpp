@@ -59,7 +59,7 @@ int CertificateVerifier::verify(X509_STORE_CTX *chain, void *self) {
     auto *verifier = static_cast<CertificateVerifier *>(self);
     verifier->verdict_ = Verdict::kUnavailable;
     try {
-        verifier->verdict_ = verifier->judge(chain);
+        verifier->verdict_ = verifier->verdictOn(chain);
     } catch (const std::exception &error) {
         OVRA_ERR("A certificate cannot be judged: [%s]", error.what());
     }
@@ -74,7 +74,7 @@ int CertificateVerifier::verify(X509_STORE_CTX *chain, void *self) {
     return 0;
 }
 
-CertificateVerifier::Verdict CertificateVerifier::judge(X509_STORE_CTX *chain) {
+CertificateVerifier::Verdict CertificateVerifier::verdictOn(X509_STORE_CTX *chain) {
     fingerprint_ = fingerprintOf(X509_STORE_CTX_get0_cert(chain));
     if (fingerprint_.empty()) {
         return Verdict::kUnavailable;

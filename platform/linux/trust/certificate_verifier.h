@@ -46,7 +46,7 @@ public:
 
 private:
     static int verify(X509_STORE_CTX *chain, void *self);
-    Verdict judge(X509_STORE_CTX *chain);
+    Verdict verdictOn(X509_STORE_CTX *chain);
     [[nodiscard]] bool systemAccepts(X509_STORE_CTX *chain) const;
 
     Endpoint endpoint_;

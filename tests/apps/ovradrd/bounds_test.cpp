@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "appliance.h"
-#include "gateway.h"
+#include "call_dispatcher.h"
 
 #include <ovraplatform/api_errors.h>
 #include <ovraplatform/appliance.h>
@@ -127,15 +127,15 @@ protected:
                      });
         Appliance::provision();
         keys = OvraPlatform::SealKeyPair::load(OvraPlatform::kSealKeyFile).value();
-        gateway.emplace(registry, *keys, guard, api, *queues);
+        dispatcher.emplace(registry, *keys, guard, api, *queues);
     }
     void serve(const std::string &method) {
-        gateway->serve({"api=Test&version=1&method=" + method, "127.0.0.1", true},
-                       [this](const std::string &document) {
-                           const std::lock_guard lock(mutex);
-                           ++replies[OvraTest::json(document)["error"]["code"].asInt()];
-                           changed.notify_all();
-                       });
+        dispatcher->serve({"api=Test&version=1&method=" + method, "127.0.0.1", true},
+                          [this](const std::string &document) {
+                              const std::lock_guard lock(mutex);
+                              ++replies[OvraTest::json(document)["error"]["code"].asInt()];
+                              changed.notify_all();
+                          });
     }
     /// Whether that many replies had this code within a few seconds.
     bool gets(int code, int count) {
@@ -152,7 +152,7 @@ protected:
     std::optional<OvraPlatform::SealKeyPair> keys;
     OvraPlatform::ReplayGuard guard;
     Ovradrd::LoginApi api;
-    std::optional<Ovradrd::Gateway> gateway;
+    std::optional<Ovradrd::CallDispatcher> dispatcher;
     std::optional<Ovradrd::WorkQueues> queues{std::in_place};
 };
 
@@ -188,9 +188,9 @@ TEST_F(FullLanes, LetLocalCallersGoWhenTheDaemonStops) {
     call.user = "admin";
     std::thread stopper([this] {
         std::this_thread::sleep_for(200ms);
-        gateway->leaveLocal();
+        dispatcher->leaveLocal();
     });
-    EXPECT_EQ(gateway->serveLocal(call)["error"]["code"], 107);
+    EXPECT_EQ(dispatcher->serveLocal(call)["error"]["code"], 107);
     stopper.join();
     {
         const std::lock_guard lock(mutex);

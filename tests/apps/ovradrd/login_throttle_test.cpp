@@ -79,11 +79,11 @@ TEST_F(Throttle, ASuccessClearsTheAccountButNotTheAddress) {
         fail("ann", "192.0.2.1");
     }
     admit("ann", "192.0.2.9");
-    throttle.succeeded("ann", "192.0.2.9");
+    throttle.recordSuccess("ann", "192.0.2.9");
     EXPECT_EQ(admit("ann", "192.0.2.9"), 0);
     // Successes with one's own account allow no more guesses at others.
     fail("mallory", "192.0.2.1");
-    throttle.succeeded("mallory", "192.0.2.1");
+    throttle.recordSuccess("mallory", "192.0.2.1");
     EXPECT_EQ(admit("bob", "192.0.2.1"), 1000);
 }
 
@@ -93,7 +93,7 @@ TEST_F(Throttle, AForgivenLoginIsNotCountedAndClearsNothing) {
     }
     for (int i = 0; i < 5; ++i) {
         EXPECT_EQ(fail("ann", "192.0.2.1"), 500);
-        throttle.forgive("ann", "192.0.2.1");
+        throttle.withdraw("ann", "192.0.2.1");
     }
 }
 

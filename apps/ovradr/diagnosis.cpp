@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-#include "examination.h"
+#include "diagnosis.h"
 
 #include "endpoint.h"
 #include "node_ref.h"
@@ -37,22 +37,22 @@ namespace WebAPI = OvraDRNode::WebAPI;
 constexpr double kMaxClockSeconds = 30;
 constexpr long kClockTimeout = 10; // seconds
 
-const char *stateText(Examination::Step::State state) {
+const char *stateText(Diagnosis::Step::State state) {
     switch (state) {
-    case Examination::Step::State::kOk:
+    case Diagnosis::Step::State::kOk:
         return "ok";
-    case Examination::Step::State::kFailed:
+    case Diagnosis::Step::State::kFailed:
         return "FAILED";
     default:
         return "-";
     }
 }
 
-const char *stateWord(Examination::Step::State state) {
+const char *stateWord(Diagnosis::Step::State state) {
     switch (state) {
-    case Examination::Step::State::kOk:
+    case Diagnosis::Step::State::kOk:
         return "ok";
-    case Examination::Step::State::kFailed:
+    case Diagnosis::Step::State::kFailed:
         return "failed";
     default:
         return "skipped";
@@ -79,23 +79,23 @@ double wallClock() {
 /// The steps that examine one endpoint; each uses what those before it have found.
 class EndpointSteps {
 public:
-    EndpointSteps(const ExaminationSubject &subject, Examination &examination)
+    EndpointSteps(const DiagnosisSubject &subject, Diagnosis &diagnosis)
         : subject_(subject)
-        , examination_(examination) {}
+        , diagnosis_(diagnosis) {}
 
     void run() {
-        const bool reached = examination_.run("resolve", [this] { return resolve(); }) &&
-                             examination_.run("connect", [this] { return connect(); }) &&
-                             examination_.run("key", [this] { return key(); }) &&
-                             examination_.run("answer", [this] { return answer(); });
+        const bool reached = diagnosis_.run("resolve", [this] { return resolve(); }) &&
+                             diagnosis_.run("connect", [this] { return connect(); }) &&
+                             diagnosis_.run("key", [this] { return key(); }) &&
+                             diagnosis_.run("answer", [this] { return answer(); });
         if (!reached || subject_.own) {
             return;
         }
         runSession();
         if (trusted_) {
-            examination_.run("clock", [this] { return clock(); });
+            diagnosis_.run("clock", [this] { return clock(); });
         } else {
-            examination_.skip("clock", "its key is not trusted yet");
+            diagnosis_.skip("clock", "its key is not trusted yet");
         }
     }
 
@@ -104,22 +104,22 @@ private:
 
     void runSession() {
         if (!sendsSecrets()) {
-            examination_.skip("session", "no credential has this endpoint; --account tries a "
-                                         "log-in");
+            diagnosis_.skip("session", "no credential has this endpoint; --account tries a "
+                                       "log-in");
             return;
         }
         const bool granted = subject_.login
-                                 ? examination_.run("log-in", [this] { return logIn(); })
-                                 : examination_.run("session", [this] { return session(); });
+                                 ? diagnosis_.run("log-in", [this] { return logIn(); })
+                                 : diagnosis_.run("session", [this] { return session(); });
         if (!granted) {
             return;
         }
         if (info_.isSuccess()) {
-            examination_.run("identity", [this] { return identity(); });
+            diagnosis_.run("identity", [this] { return identity(); });
         } else {
-            examination_.skip("identity", "it does not say who it is");
+            diagnosis_.skip("identity", "it does not say who it is");
         }
-        examination_.run("right", [this] { return right(); });
+        diagnosis_.run("right", [this] { return right(); });
     }
 
     Expected<std::string> resolve() {
@@ -144,7 +144,7 @@ private:
 
     Expected<std::string> key() {
         const auto met =
-            OvraPlatform::peerFingerprint(conn_.protocol, conn_.addr, conn_.port, kMeetSeconds);
+            OvraPlatform::peerFingerprint(conn_.protocol, conn_.addr, conn_.port, kKeySeconds);
         if (met == tl::unexpected(CredError::kTrustUnavailable) ||
             met == tl::unexpected(CredError::kOutOfMemory)) {
             return endpointFailure(conn_, met.error());
@@ -278,8 +278,8 @@ private:
         return text;
     }
 
-    const ExaminationSubject &subject_;
-    Examination &examination_;
+    const DiagnosisSubject &subject_;
+    Diagnosis &diagnosis_;
     Conn conn_; ///< the direct endpoint
     std::vector<HostAddress> addresses_;
     bool trusted_ = false;
@@ -289,10 +289,10 @@ private:
 
 } // namespace
 
-Examination::Examination(std::string subject)
+Diagnosis::Diagnosis(std::string subject)
     : subject_(std::move(subject)) {}
 
-bool Examination::run(const std::string &name, const Action &action) {
+bool Diagnosis::run(const std::string &name, const Action &action) {
     const auto start = std::chrono::steady_clock::now();
     const Expected<std::string> found = action();
     Step step;
@@ -309,14 +309,14 @@ bool Examination::run(const std::string &name, const Action &action) {
     return static_cast<bool>(found);
 }
 
-void Examination::skip(const std::string &name, const std::string &why) {
+void Diagnosis::skip(const std::string &name, const std::string &why) {
     Step step;
     step.name = name;
     step.detail = why;
     steps_.push_back(step);
 }
 
-Json::Value Examination::toJson() const {
+Json::Value Diagnosis::toJson() const {
     Json::Value json;
     json["subject"] = subject_;
     json["steps"] = Json::Value(Json::arrayValue);
@@ -332,7 +332,7 @@ Json::Value Examination::toJson() const {
     return json;
 }
 
-std::string Examination::toText() const {
+std::string Diagnosis::toText() const {
     std::vector<std::vector<std::string>> rows;
     for (const Step &step : steps_) {
         const bool skipped = step.state == Step::State::kSkipped;
@@ -345,13 +345,13 @@ std::string Examination::toText() const {
     return printable(subject_) + "\n" + table({"STEP", "", "TIME", "FOUND"}, rows);
 }
 
-void examineEndpoint(const ExaminationSubject &subject, Examination &examination) {
-    EndpointSteps(subject, examination).run();
+void diagnoseEndpoint(const DiagnosisSubject &subject, Diagnosis &diagnosis) {
+    EndpointSteps(subject, diagnosis).run();
 }
 
-void examineAppliance(Examination &examination) {
+void diagnoseAppliance(Diagnosis &diagnosis) {
     std::string nodeId;
-    examination.run("files", [&nodeId]() -> Expected<std::string> {
+    diagnosis.run("files", [&nodeId]() -> Expected<std::string> {
         const Expected<std::string> id = localNode();
         if (!id) {
             return Refusal(id.error());
@@ -362,7 +362,7 @@ void examineAppliance(Examination &examination) {
         nodeId = *id;
         return "node " + nodeId;
     });
-    examination.run("daemon", [&nodeId]() -> Expected<std::string> {
+    diagnosis.run("daemon", [&nodeId]() -> Expected<std::string> {
         const Response info = BaseSender::run(WebAPI::getDRNodeInfoAPI({}));
         if (!info.isSuccess()) {
             return failure(ExitCode::kNotReachable, "The daemon of this appliance does not answer.",

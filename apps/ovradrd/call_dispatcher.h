@@ -28,13 +28,13 @@ struct WorkQueues {
 
 /// The path of a call from arrival to reply: read, unseal, find the session and its rights, choose
 /// the queue, run the handler, seal the reply.
-class Gateway {
+class CallDispatcher {
 public:
-    /// Everything must outlive the gateway and the jobs in the queues.
-    Gateway(const OvraPlatform::APIRegistry &registry, const OvraPlatform::SealKeyPair &keys,
-            OvraPlatform::ReplayGuard &guard, LoginApi &api, WorkQueues &queues);
-    Gateway(const Gateway &) = delete;
-    Gateway &operator=(const Gateway &) = delete;
+    /// Everything must outlive the dispatcher and the jobs in the queues.
+    CallDispatcher(const OvraPlatform::APIRegistry &registry, const OvraPlatform::SealKeyPair &keys,
+                   OvraPlatform::ReplayGuard &guard, LoginApi &api, WorkQueues &queues);
+    CallDispatcher(const CallDispatcher &) = delete;
+    CallDispatcher &operator=(const CallDispatcher &) = delete;
 
     /// Carries out the call in `request`. Does not wait; thread-safe.
     void serve(OvraService::HttpRequest request, const OvraService::HttpServer::Answer &answer);

@@ -14,7 +14,7 @@
 
 namespace Ovradr {
 
-/// The log-in tried by an examination.
+/// The log-in tried by a diagnosis.
 struct LoginTrial {
     std::string account;
     const Secret &password;
@@ -22,7 +22,7 @@ struct LoginTrial {
 };
 
 /// What is known about an endpoint beforehand.
-struct ExaminationSubject {
+struct DiagnosisSubject {
     OvraDRNode::Conn conn;
     std::optional<OvraDRNode::DRNode> cred; ///< its session is used
     std::optional<LoginTrial> login;        ///< tried instead of a session
@@ -32,7 +32,7 @@ struct ExaminationSubject {
 
 /// Examines things step by step. If a step fails, the steps that need it are skipped; the first
 /// failure is the overall verdict.
-class Examination {
+class Diagnosis {
 public:
     struct Step {
         enum class State { kOk, kFailed, kSkipped };
@@ -46,7 +46,7 @@ public:
     using Action = std::function<Expected<std::string>()>;
 
     /// \param subject  what is examined, for people
-    explicit Examination(std::string subject);
+    explicit Diagnosis(std::string subject);
 
     /// Runs and times a step. \return whether it succeeded.
     bool run(const std::string &name, const Action &action);
@@ -68,9 +68,9 @@ private:
 /// Examines an endpoint: the steps "resolve", "connect", "key", "answer", "session" or "log-in",
 /// "identity", "right" and "clock". Nothing secret is sent before the key is trusted, and nothing
 /// is trusted without being asked for. Takes at most 10 seconds per step, and 60 for a request.
-void examineEndpoint(const ExaminationSubject &subject, Examination &examination);
+void diagnoseEndpoint(const DiagnosisSubject &subject, Diagnosis &diagnosis);
 
 /// Examines what this appliance itself needs: the steps "files" and "daemon".
-void examineAppliance(Examination &examination);
+void diagnoseAppliance(Diagnosis &diagnosis);
 
 } // namespace Ovradr

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-#include "gateway.h"
+#include "call_dispatcher.h"
 
 #include "session_owner.h"
 
@@ -52,7 +52,7 @@ int codeOf(const Json::Value &reply) {
 } // namespace
 
 /// A call on its way, and where its reply goes.
-struct Gateway::Call {
+struct CallDispatcher::Call {
     OvraPlatform::WireCall wire;
     std::optional<OvraPlatform::ReplyKey> replyKey;
     bool secure = false;
@@ -70,16 +70,17 @@ struct Gateway::Call {
     }
 };
 
-Gateway::Gateway(const OvraPlatform::APIRegistry &registry, const OvraPlatform::SealKeyPair &keys,
-                 OvraPlatform::ReplayGuard &guard, LoginApi &api, WorkQueues &queues)
+CallDispatcher::CallDispatcher(const OvraPlatform::APIRegistry &registry,
+                               const OvraPlatform::SealKeyPair &keys,
+                               OvraPlatform::ReplayGuard &guard, LoginApi &api, WorkQueues &queues)
     : registry_(registry)
     , keys_(keys)
     , guard_(guard)
     , loginApi_(api)
     , queues_(queues) {}
 
-void Gateway::serve(OvraService::HttpRequest request,
-                    const OvraService::HttpServer::Answer &answer) {
+void CallDispatcher::serve(OvraService::HttpRequest request,
+                           const OvraService::HttpServer::Answer &answer) {
     // std::function must be copyable.
     const auto held = std::make_shared<OvraService::HttpRequest>(std::move(request));
     const bool taken = queues_.quick.submit([this, held, answer] {
@@ -96,7 +97,7 @@ void Gateway::serve(OvraService::HttpRequest request,
 }
 
 /// Reads the call and starts processing it.
-void Gateway::open(Call &call, std::string &body) {
+void CallDispatcher::open(Call &call, std::string &body) {
     auto wire = OvraPlatform::decodeForm(body);
     OvraBase::wipe(body);
     if (!wire) {
@@ -114,7 +115,7 @@ void Gateway::open(Call &call, std::string &body) {
 }
 
 /// Replaces the visible call with the sealed one; false if it was refused.
-bool Gateway::unseal(Call &call) {
+bool CallDispatcher::unseal(Call &call) {
     const bool sealed = !call.wire.sealed.empty();
     if (!sealed) {
         const bool hasSomething = !call.wire.sid.empty() || !call.wire.params.empty();
@@ -139,7 +140,7 @@ bool Gateway::unseal(Call &call) {
 }
 
 /// Identifies the caller; false if it was refused. An unknown session counts as none.
-bool Gateway::admit(Call &call) {
+bool CallDispatcher::admit(Call &call) {
     if (call.wire.sid.empty()) {
         return true;
     }
@@ -164,7 +165,7 @@ bool Gateway::admit(Call &call) {
     return true;
 }
 
-void Gateway::route(Call call) {
+void CallDispatcher::route(Call call) {
     if (LoginApi::isLogin(call.wire)) {
         login(std::move(call));
         return;
@@ -179,7 +180,7 @@ void Gateway::route(Call call) {
     }
 }
 
-void Gateway::login(Call call) {
+void CallDispatcher::login(Call call) {
     const auto held = std::make_shared<Call>(std::move(call));
     const auto wait = loginApi_.admit(held->wire.params, held->caller.address);
     if (!wait) {
@@ -188,12 +189,12 @@ void Gateway::login(Call call) {
         return;
     }
     if (!queues_.login.submit([this, held] { run(*held); }, *wait)) {
-        loginApi_.forgive(held->wire.params, held->caller.address);
+        loginApi_.withdraw(held->wire.params, held->caller.address);
         held->reply(busy());
     }
 }
 
-void Gateway::run(const Call &call) const {
+void CallDispatcher::run(const Call &call) const {
     const OvraPlatform::ClientScope scope(call.caller.address);
     const auto begun = std::chrono::steady_clock::now();
     const Json::Value reply = registry_.dispatch(call.wire, call.caller);
@@ -204,7 +205,7 @@ void Gateway::run(const Call &call) const {
     call.reply(reply);
 }
 
-Json::Value Gateway::serveLocal(const OvraPlatform::LocalCall &call) {
+Json::Value CallDispatcher::serveLocal(const OvraPlatform::LocalCall &call) {
     const auto promise = std::make_shared<std::promise<Json::Value>>();
     std::future<Json::Value> reply = promise->get_future();
     APICaller caller;
