@@ -5,7 +5,6 @@
 #include "handlers/params.h"
 #include "handlers/relay.h"
 #include "handlers/words.h"
-#include "shared/session_lock.h"
 #include "shared/session_release.h"
 
 #include <ovradrcore/log.h>
@@ -24,6 +23,7 @@ namespace Ovradrd {
 namespace {
 
 namespace ERR = OvraDRCore::ERR;
+using OvraApps::FlowState;
 using OvraDRNode::Conn;
 using OvraDRNode::CredReverseCreate;
 using OvraDRNode::DRNode;
@@ -37,6 +37,13 @@ constexpr char kBidirection[] = "bidirection";
 
 Json::Value noSuchCredential() {
     return apiError(ERR::kCredNotFound, "this node has no such credential: list those that it has");
+}
+
+/// The reply of a flow behind another one that does not end.
+Json::Value busy() {
+    return apiError(OvraPlatform::APIError::kTooBusy,
+                    "another flow changes credentials of the same node, nothing was done: try "
+                    "again later");
 }
 
 /// Where other nodes reach this one; an error reply in `refusal` if there is no such place.
@@ -67,7 +74,8 @@ Json::Value addReverse(Json::Value data, const std::string &credId, const APICal
         OVRA_NOTICE("The credential [%s] is deleted again: none could be made back to this node",
                     credId.c_str());
         DRNode record;
-        if (!DRNodeDB::GetCred(credId, record) || !OvraApps::deleteCredential(record, false).done) {
+        if (!DRNodeDB::GetCred(credId, record) ||
+            OvraApps::deleteCredential(record, false).state != FlowState::kDone) {
             OVRA_ERR("The credential [%s] could not be deleted: delete it by hand", credId.c_str());
         }
         return flowError(flow, ERR::kCredIncomplete);
@@ -85,8 +93,14 @@ Json::Value carryOut(OvraDRNode::CredCreate &flow, const Proof &proof) {
     if (flow.isLocalNode()) {
         return OvraPlatform::apiBadParameter("conn", "conn is this node itself: name another one");
     }
-    const OvraApps::SessionLock lock(OvraApps::SessionLock::Purpose::kObtain);
-    return flow.processKnownNode() ? Json::Value() : flowError(flow, ERR::kCredIncomplete);
+    switch (OvraApps::createCredential(flow)) {
+    case FlowState::kDone:
+        return {};
+    case FlowState::kBusy:
+        return busy();
+    default:
+        return flowError(flow, ERR::kCredIncomplete);
+    }
 }
 
 Json::Value create(const Json::Value &params, const APICaller &caller) {
@@ -205,14 +219,24 @@ Json::Value set(const Json::Value &params, bool dryRun) {
     OvraDRNode::DRNodeCredSet flow;
     const bool armed = flow.setCredId(credId) &&
                        flow.setCred(conn, login.account, login.password.get(), login.otpCode);
-    const auto change = [&flow] { return flow.process(); };
-    if (!armed || !(dryRun ? flow.check() : OvraApps::runWithRelease(record, conn, change).done)) {
+    if (!armed || (dryRun && !flow.check())) {
         return flowError(flow, ERR::kCredIncomplete);
     }
-    if (!DRNodeDB::GetCred(credId, record)) {
-        return noSuchCredential();
+    if (dryRun) {
+        return apiSuccess(record.toJson());
     }
-    return apiSuccess(record.toJson());
+    const OvraApps::FlowResult result = OvraApps::changeCredential(flow, record, conn);
+    switch (result.state) {
+    case FlowState::kDone:
+        return apiSuccess(result.after.toJson());
+    case FlowState::kGone:
+        return noSuchCredential();
+    case FlowState::kBusy:
+        return busy();
+    case FlowState::kFailed:
+        break;
+    }
+    return flowError(flow, ERR::kCredIncomplete);
 }
 
 /// A missing credential counts as deleted.
@@ -228,12 +252,15 @@ Json::Value remove(const Json::Value &params, const APICaller & /*caller*/) {
         record.credId = credId;
     }
     const OvraApps::FlowResult result = OvraApps::deleteCredential(record, temporary);
-    if (!result.done) {
+    if (result.state == FlowState::kBusy) {
+        return busy();
+    }
+    if (result.state != FlowState::kDone) {
         return apiError(ERR::kFailed, "the credential cannot be deleted: see the log of the "
                                       "appliance, and check that its disk is not full");
     }
     Json::Value data;
-    if (!record.session.empty()) {
+    if (!result.before.session.empty()) {
         data["release"] = OvraApps::releaseWord(result.release.state);
     }
     return apiSuccess(data);
