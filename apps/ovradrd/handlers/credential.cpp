@@ -13,6 +13,7 @@
 #include <ovradrnode/node_create.h>
 #include <ovradrnode/node_db.h>
 #include <ovradrnode/node_set.h>
+#include <ovraplatform/account_store.h>
 #include <ovraplatform/api_errors.h>
 
 #include <string>
@@ -58,6 +59,23 @@ std::vector<Conn> localConns(Json::Value &refusal) {
     return conns;
 }
 
+/// The account of this appliance with whose rights another node comes back.
+std::string readLocalAccount(Params &in, const APICaller &caller) {
+    constexpr char kName[] = "local_account";
+    const std::string named = in.optionalText(kName, Params::kMaxAccount);
+    if (named.empty() && !caller.local) {
+        return caller.user;
+    }
+    OvraPlatform::AccountStore accounts;
+    const auto account = accounts.find(named);
+    if (!account || !account->administrator || account->disabled) {
+        in.refuse(kName, "local_account has to name an administrator of this appliance, with whose "
+                         "rights the other node comes back; only a caller with a session of its "
+                         "own may leave it out");
+    }
+    return named;
+}
+
 /// Has the node behind a credential create one back to this node.
 bool reverse(CredReverseCreate &flow, const std::string &credId, const std::string &account,
              const std::vector<Conn> &conns) {
@@ -67,12 +85,15 @@ bool reverse(CredReverseCreate &flow, const std::string &credId, const std::stri
 
 /// A credential in both directions is one unit: if the way back fails, the way there is removed
 /// too.
-Json::Value addReverse(Json::Value data, const std::string &credId, const APICaller &caller,
+Json::Value addReverse(Json::Value data, const std::string &credId, const std::string &account,
                        const std::vector<Conn> &conns) {
     CredReverseCreate flow;
-    if (!reverse(flow, credId, caller.user, conns)) {
-        OVRA_NOTICE("The credential [%s] is deleted again: none could be made back to this node",
-                    credId.c_str());
+    if (!reverse(flow, credId, account, conns)) {
+        OVRA_NOTICE(
+            "The credential [%s] is deleted again: none could be made back to this node. If "
+            "the answer of the other node was lost, it holds one all the same: see `ovradr "
+            "session list`",
+            credId.c_str());
         DRNode record;
         if (!DRNodeDB::GetCred(credId, record) ||
             OvraApps::deleteCredential(record, false).state != FlowState::kDone) {
@@ -107,10 +128,11 @@ Json::Value create(const Json::Value &params, const APICaller &caller) {
     Params in(params);
     const Proof proof(in, true);
     const std::string direction = in.word("cred_direction", {kUnidirection, kBidirection});
+    const bool bothWays = direction == kBidirection;
+    const std::string account = bothWays ? readLocalAccount(in, caller) : "";
     if (!in.ok()) {
         return in.error();
     }
-    const bool bothWays = direction == kBidirection;
     Json::Value refusal;
     const std::vector<Conn> conns = bothWays ? localConns(refusal) : std::vector<Conn>();
     if (!refusal.isNull()) {
@@ -123,7 +145,7 @@ Json::Value create(const Json::Value &params, const APICaller &caller) {
     }
     Json::Value data(Json::objectValue);
     data["src_cred"] = flow.getNode().toJson();
-    return bothWays ? addReverse(data, flow.getNode().credId, caller, conns) : apiSuccess(data);
+    return bothWays ? addReverse(data, flow.getNode().credId, account, conns) : apiSuccess(data);
 }
 
 Json::Value createTemporary(const Json::Value &params, const APICaller & /*caller*/) {
@@ -276,6 +298,7 @@ Json::Value runReverse(const Json::Value &params, const APICaller &caller, Run r
     if (in.has("conn")) {
         conns.push_back(in.conn("conn"));
     }
+    const std::string account = readLocalAccount(in, caller);
     if (!in.ok()) {
         return in.error();
     }
@@ -290,7 +313,7 @@ Json::Value runReverse(const Json::Value &params, const APICaller &caller, Run r
             return refusal;
         }
     }
-    if (!flow.setLocalAccount(caller.user) || !flow.addLocalConns(conns) || !run(flow)) {
+    if (!flow.setLocalAccount(account) || !flow.addLocalConns(conns) || !run(flow)) {
         return flowError(flow, ERR::kCredIncomplete);
     }
     Json::Value data(Json::objectValue);
