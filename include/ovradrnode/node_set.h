@@ -30,6 +30,9 @@ public:
     [[nodiscard]] bool setCred(const Conn &conn, const std::string &account,
                                const std::string &password, const std::string &otp);
     bool IsSessionChanged() const;
+    /// The session that the remote node granted for this change, a secret; "" before
+    /// requestRemoteSession().
+    const std::string &getNewSession() const { return newSession; }
     /// Whether the new login reaches the node that the credential belongs to (518 if another).
     [[nodiscard]] bool check();
     [[nodiscard]] bool checkRemoteNodeInfo();

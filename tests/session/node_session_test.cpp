@@ -80,8 +80,10 @@ TEST_F(Session, OneNodeAndUserHaveOneSession) {
 }
 
 TEST_F(Session, BadArgumentsAndUnknownUsersGetNone) {
-    EXPECT_EQ(create("", "joe") + create("n1", ""), "");
-    EXPECT_EQ(session.GetErrCode(), 401);
+    for (const std::string &node : {std::string(), std::string("n\xFF"), std::string(1020, 'n')}) {
+        EXPECT_EQ(create(node, "joe") + create("n1", ""), "") << "never found again";
+        EXPECT_EQ(session.GetErrCode(), 401);
+    }
     EXPECT_EQ(create("n1", "nobody"), "");
     EXPECT_EQ(session.GetErrCode(), 527);
     EXPECT_EQ(session.GetErrMsg().asString(), "nobody");

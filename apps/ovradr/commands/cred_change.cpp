@@ -6,7 +6,6 @@
 #include "remote_login.h"
 #include "target.h"
 
-#include <ovradrnode/node_db.h>
 #include <ovradrnode/node_set.h>
 
 #include <memory>
@@ -16,6 +15,7 @@ namespace Ovradr {
 namespace {
 
 using OvraApps::FlowResult;
+using OvraApps::FlowState;
 using OvraDRNode::Conn;
 using OvraDRNode::DRNode;
 using OvraDRNode::DRNodeCredSet;
@@ -51,18 +51,15 @@ Refusal setFailure(const DRNodeCredSet &flow, const Conn &conn) {
     return Refusal(found);
 }
 
-/// What an update did, according to the current row.
-Outcome reportUpdate(const DRNode &before, const std::string &account, const FlowResult &result) {
-    DRNode now;
-    if (!OvraDRNode::DRNodeDB::GetCred(before.credId, now)) {
-        return failureOf(ERR::kCredNotFound);
-    }
+/// What an update did.
+Report reportUpdate(const FlowResult &result, const std::string &account) {
+    const DRNode &now = result.after;
     Report report;
     report.data = credJson(now, false);
     report.data["account"] = account;
-    report.data["endpoint_changed"] = now.conn != before.conn;
+    report.data["endpoint_changed"] = now.conn != result.before.conn;
     report.text = credText(now, false, account);
-    if (now.session == before.session) {
+    if (now.session == result.before.session) {
         report.data["session"] = "unchanged";
         report.text += "The other appliance granted the same session as before.\n";
     } else {
@@ -76,10 +73,18 @@ Outcome reportUpdate(const DRNode &before, const std::string &account, const Flo
 Outcome runUpdate(DRNodeCredSet &flow, const DRNode &record, const Conn &conn,
                   const SetOptions &options) {
     if (!options.dryRun) {
-        const FlowResult result =
-            OvraApps::runWithRelease(record, conn, [&flow] { return flow.process(); });
-        return result.done ? reportUpdate(record, options.login.account, result)
-                           : setFailure(flow, conn);
+        const FlowResult result = OvraApps::changeCredential(flow, record, conn);
+        switch (result.state) {
+        case FlowState::kDone:
+            return reportUpdate(result, options.login.account);
+        case FlowState::kGone:
+            return failureOf(ERR::kCredNotFound);
+        case FlowState::kBusy:
+            return busyFailure();
+        case FlowState::kFailed:
+            break;
+        }
+        return setFailure(flow, conn);
     }
     if (!flow.check()) {
         return setFailure(flow, conn);
@@ -118,7 +123,7 @@ Outcome set(const SetOptions &options) {
     if (const auto tried = logIn(options.login, direct->addr, attempt); !tried) {
         return Refusal(tried.error());
     }
-    return proved ? runUpdate(flow, record, *direct, options) : setFailure(flow, *conn);
+    return proved ? runUpdate(flow, record, *conn, options) : setFailure(flow, *conn);
 }
 
 /// What a deletion did, or would do, to the row and the session.
@@ -144,7 +149,10 @@ Outcome remove(const DeleteOptions &options) {
         return reportDeletion(cred->record, OvraApps::predictRelease(cred->record), true);
     }
     const FlowResult result = OvraApps::deleteCredential(cred->record, cred->temporary);
-    if (!result.done) {
+    if (result.state == FlowState::kBusy) {
+        return busyFailure();
+    }
+    if (result.state != FlowState::kDone) {
         return failure(ExitCode::kNotSetUp,
                        "The credential could not be deleted from the node database.",
                        "It is as it was. The system log says why; look for a full or read-only "

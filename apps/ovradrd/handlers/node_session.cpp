@@ -6,6 +6,8 @@
 #include <ovradrnode/node_session.h>
 #include <ovraplatform/api_errors.h>
 
+#include <mutex>
+
 namespace Ovradrd {
 
 namespace {
@@ -33,6 +35,10 @@ Json::Value create(const Json::Value &params, const APICaller &caller) {
     if (!in.ok()) {
         return in.error();
     }
+    // The search for the previous session and the grant of a new one are two steps. Only this
+    // process grants any.
+    static std::mutex granting;
+    const std::lock_guard<std::mutex> lock(granting);
     NodeSession sessions;
     const std::string session = sessions.CreateNodeSession(nodeId, caller.user);
     return granted(sessions, session);

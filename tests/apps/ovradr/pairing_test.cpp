@@ -166,15 +166,6 @@ TEST_F(Pairing, EachRefusalHasItsExitCode) {
     EXPECT_EQ(credentials(), "");
 }
 
-TEST_F(Pairing, AFullOrBrokenDatabaseIsToldAsSuch) {
-    OvraTest::executeSql("CREATE TRIGGER full BEFORE INSERT ON node_cred BEGIN "
-                         "SELECT RAISE(ABORT, 'database or disk is full'); END");
-    const Result result =
-        run(create({"--password-stdin", "--fingerprint", remote.server.fingerprint()}),
-            "secret word\n");
-    EXPECT_EQ(result.exit, 9) << result.err;
-}
-
 TEST_F(Pairing, TheOneTimeCodeCannotBeSeenByOtherProcesses) {
     remote.server.fallSilent();
     for (const Arguments &code : {Arguments{"--otp", "731946"}, {"--otp=731946"}}) {
