@@ -175,6 +175,9 @@ TEST_F(TheRelayApi, BoundsWhatOneClientMayDo) {
     EXPECT_EQ(attempts, 30);
     address = "192.0.2.2";
     EXPECT_EQ(code(call("challenge", named("nas"))), 0) << "others are not held up";
+    const auto taken = OvraService::Listener::listen("127.0.0.1", 20100);
+    EXPECT_EQ(code(call("enrol", proof(key("owner"), "nas"))), 100) << "its port is in use";
+    EXPECT_EQ(code(call("lookup", named("nas"))), 106) << "so it is nobody's";
     for (const char *alias : {"", "ab", "-ab", "ab-", "a b", "a/b", "NAS", "../aliases"}) {
         EXPECT_EQ(code(call("enrol", named(alias))), 106) << alias;
     }
