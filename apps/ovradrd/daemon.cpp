@@ -65,8 +65,10 @@ tl::expected<void, StartError> checkSetUp() {
             return notSetUp(std::string(path) + " is missing");
         }
     }
-    if (OvraDRNode::NodeDBHandler::GetHandler().GetSchemaVersion() < 0) {
-        return notSetUp("the node database cannot be read");
+    auto database = OvraDRNode::NodeDBHandler::GetHandler();
+    if (database.GetSchemaVersion() < 0) {
+        return notSetUp("the node database cannot be read (" + database.GetErrMsg().asString() +
+                        ")");
     }
     return {};
 }

@@ -36,6 +36,11 @@ bool areIdentifiers(const SqliteValueList &values) {
     return !values.empty();
 }
 
+/// Empty, which every statement rejects, if the condition says that it is invalid.
+std::string textOf(const SqliteCondition &condition) {
+    return condition.IsValid() ? condition.text : "";
+}
+
 std::string whereClause(bool filtered, const std::string &condition) {
     return filtered ? " WHERE " + condition : "";
 }
@@ -67,7 +72,7 @@ SqliteTableHandler::~SqliteTableHandler() = default;
 SqliteCommand::~SqliteCommand() = default;
 
 void SelectCommand::SetCondition(const SqliteCondition &condition) {
-    SetCondition(condition.text);
+    SetCondition(textOf(condition));
 }
 
 void SelectCommand::SetCondition(const std::string &text) {
@@ -125,7 +130,7 @@ void UpdateCommand::AddFieldValue(const std::string &field, int value) {
 }
 
 void UpdateCommand::SetCondition(const SqliteCondition &condition) {
-    SetCondition(condition.text);
+    SetCondition(textOf(condition));
 }
 
 void UpdateCommand::SetCondition(const std::string &text) {

@@ -217,9 +217,11 @@ Json::Value list(const Json::Value &params, const APICaller & /*caller*/) {
         return in.error();
     }
     // Unreadable tables read as empty ones, and a session audit would end those in use.
-    if (OvraDRNode::NodeDBHandler::GetHandler().GetSchemaVersion() < 0) {
+    auto database = OvraDRNode::NodeDBHandler::GetHandler();
+    if (database.GetSchemaVersion() < 0) {
         return apiError(OvraPlatform::APIError::kInternal,
-                        "the node database cannot be read now: see the log of the appliance");
+                        "the node database of the appliance cannot be read (" +
+                            database.GetErrMsg().asString() + "): try again");
     }
     Json::Value data(Json::objectValue);
     data["creds"] = Json::Value(Json::arrayValue);
