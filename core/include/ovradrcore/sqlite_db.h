@@ -3,6 +3,7 @@
 
 #include "ovradrcore/err_recorder.h"
 #include "ovradrcore/export.h"
+#include "ovradrcore/no_fork.h"
 #include "ovradrcore/sqlite_command.h"
 #include "ovradrcore/sqlite_value.h"
 
@@ -19,6 +20,7 @@ namespace OvraDRCore {
 ///
 /// Every operation returns false on failure, records 407 with SQLite's error text as the message,
 /// and logs it once at WARN; nothing throws. Operations wait for a file locked by another process.
+/// An object is for one thread at a time, and a forked child does not use that of its parent.
 class OVRADRCORE_EXPORT SqliteDB : public ErrRecorder {
 public:
     /// \param path       the database file
@@ -53,6 +55,7 @@ private:
 
     std::string path_;
     std::string infoTable_;
+    std::unique_ptr<SqliteWait> wait_;
     std::unique_ptr<sqlite3, Close> db_;
 };
 
