@@ -1,6 +1,8 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "ovradrcore/log.h"
 
+#include "ovradrcore/no_fork.h"
+
 #include <syslog.h>
 #include <unistd.h>
 
@@ -89,6 +91,7 @@ void logMessage(LogLevel level, const char *file, int line, const char *function
     const std::string message = oneLine(vformat(format, args));
     va_end(args);
     const std::string stem(stemOf(file));
+    const NoFork noFork; // syslog(3) has a lock of its own
     syslog(static_cast<int>(level), "%s:%d(%s)[%s][%d]: %s", stem.c_str(), line, function,
            levelWord(level), static_cast<int>(getpid()), message.c_str());
 }

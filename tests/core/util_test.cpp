@@ -2,16 +2,21 @@
 #include <ovradrcore/file_lock.h>
 #include <ovradrcore/util.h>
 
+#include <fcntl.h>
 #include <gtest/gtest.h>
 #include <sys/file.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <cerrno>
 #include <chrono>
 #include <climits>
+#include <filesystem>
+#include <functional>
 #include <regex>
 #include <set>
+#include <utility>
 
 using namespace OvraDRCore;
 
@@ -62,6 +67,10 @@ TEST(FileLock, GivesUpAfterTheWaitAndGoesWithItsProcess) {
     if (child == 0) {
         FileLock held("b.lock");
         const char ok = held.lock(LOCK_EX | LOCK_NB, 0) ? 'y' : 'n';
+        if (fork() == 0) { // has no part in the lock
+            sleep(30);
+            _exit(0);
+        }
         (void)!write(ready[1], &ok, 1);
         pause();
         _exit(0);
@@ -80,9 +89,33 @@ TEST(FileLock, GivesUpAfterTheWaitAndGoesWithItsProcess) {
     EXPECT_TRUE(lock.lock(LOCK_SH | LOCK_NB, 0));
 }
 
-TEST(FileLock, DoesNotFollowASymbolicLink) {
-    ASSERT_EQ(symlink("/usr/ovra/target", "/run/lock/c.lock"), 0);
-    FileLock lock("c.lock");
-    EXPECT_FALSE(lock.lock(LOCK_EX | LOCK_NB, 0));
+TEST(FileLock, ReplacesWhateverSomebodyElsePutInItsPlace) {
+    const std::string path = "/run/lock/c.lock";
+    const std::pair<const char *, std::function<bool()>> planted[] = {
+        {"link", [&] { return symlink("/usr/ovra/target", path.c_str()) == 0; }},
+        {"FIFO", [&] { return mkfifo(path.c_str(), 0600) == 0; }},
+        {"folder", [&] { return File::CreateDir(path + "/x", 0755); }},
+        {"open to all",
+         [&] { return mknod(path.c_str(), 0600, 0) == 0 && !chmod(path.c_str(), 0644); }},
+        {"second name",
+         [&] { return mknod("/run/lock/d", 0600, 0) == 0 && !link("/run/lock/d", path.c_str()); }},
+        // Only the superuser can make it.
+        {"other owner",
+         [&] {
+             return mknod(path.c_str(), 0600, 0) == 0 &&
+                    (chown(path.c_str(), 65534, 0) == 0 || errno == EINVAL);
+         }},
+        {"folder is missing", [] { return std::filesystem::remove_all("/run/lock") > 0; }},
+    };
+    for (const auto &[what, plant] : planted) {
+        ASSERT_TRUE(plant()) << what;
+        const int theirs = open(path.c_str(), O_RDONLY | O_NONBLOCK);
+        flock(theirs, LOCK_EX | LOCK_NB);
+        FileLock lock("c.lock");
+        EXPECT_TRUE(lock.lock(LOCK_EX | LOCK_NB, 0)) << what;
+        EXPECT_FALSE(FileLock("c.lock").lock(LOCK_EX | LOCK_NB, 0)) << what;
+        close(theirs);
+        unlink(path.c_str());
+    }
     EXPECT_NE(access("/usr/ovra/target", F_OK), 0) << "nothing was made through the link";
 }

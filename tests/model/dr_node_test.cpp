@@ -14,9 +14,11 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <chrono>
 #include <filesystem>
 #include <fstream>
 #include <iterator>
+#include <thread>
 
 using namespace OvraDRNode;
 
@@ -149,7 +151,7 @@ TEST(Identity, AFileWithoutAUsableIdIsMended) {
     EXPECT_EQ(DRNode::getLocalNodeId(), DRNode::getLocalNodeId());
 }
 
-TEST(Identity, ALockThatStaysHeldMeansNoIdNotAWrongOne) {
+TEST(Identity, ALockThatStaysHeldMeansNoIdAndNeverAWrongOne) {
     const std::string id = DRNode::getLocalNodeId();
     OvraDRCore::FileLock held("drnode.info.lock");
     ASSERT_TRUE(held.lock(LOCK_EX | LOCK_NB, 0));
@@ -159,8 +161,14 @@ TEST(Identity, ALockThatStaysHeldMeansNoIdNotAWrongOne) {
         log.count("ERR", "dr_node", "ReadNodeIdFromConf", "Failed to lock [drnode.info.lock]"), 1);
     EXPECT_EQ(log.count("ERR", "dr_node", "CreateNodeId", "Failed to lock [drnode.info.lock]"), 1);
     EXPECT_EQ(log.count("ERR", "dr_node", "getLocalNodeId", "Failed to create nodeId"), 1);
-    held.unlock();
+    std::thread late([&held] {
+        std::this_thread::sleep_for(
+            std::chrono::milliseconds(6500)); // the reader gives up after 5 s
+        held.unlock();
+    });
     EXPECT_EQ(DRNode::getLocalNodeId(), id);
+    late.join();
+    EXPECT_EQ(identityFile(), "node_id=\"" + id + "\"\n");
 }
 
 TEST(Identity, ProcessesThatStartTogetherEndUpWithOneId) {

@@ -7,6 +7,7 @@
 #include <ovrabase/file.h>
 #include <ovrabase/number.h>
 #include <ovradrcore/log.h>
+#include <ovradrcore/no_fork.h>
 #include <ovradrcore/util.h>
 
 #include <sys/stat.h>
@@ -111,7 +112,7 @@ void takeSettings(const Lines &lines, ApplianceConfig &config) {
 
 /// The settings are read often: the same problems are logged once per process.
 void logOnce(const std::string &path, const std::vector<std::string> &problems) {
-    static std::mutex mutex;
+    static OvraDRCore::ForkSafeMutex mutex;
     static std::string lastLogged;
     std::string text;
     for (const std::string &problem : problems) {

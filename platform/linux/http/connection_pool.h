@@ -4,11 +4,12 @@
 #include "http/http_connection.h"
 #include "ovraplatform/trust_store.h"
 
+#include <ovradrcore/no_fork.h>
+
 #include <chrono>
 #include <cstddef>
 #include <list>
 #include <memory>
-#include <mutex>
 #include <set>
 #include <string>
 #include <vector>
@@ -52,7 +53,7 @@ private:
     ConnectionPool();
     void dropAllInChild();
 
-    std::mutex mutex_;
+    OvraDRCore::ForkSafeMutex mutex_;
     std::list<Idle> idle_; ///< the longest idle first
     std::set<int> sockets_;
     std::list<Idle> parents_; ///< a child's copies of its parent's, out of use

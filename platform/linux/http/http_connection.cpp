@@ -5,6 +5,7 @@
 #include "http/sigpipe_guard.h"
 
 #include <ovradrcore/log.h>
+#include <ovradrcore/no_fork.h>
 
 #include <linux/tcp.h>
 #include <netinet/in.h>
@@ -130,6 +131,7 @@ Mime makeForm(CURL *handle, const std::vector<std::pair<std::string, std::string
 } // namespace
 
 std::unique_ptr<HttpConnection> HttpConnection::open(const Endpoint &endpoint, Purpose purpose) {
+    const OvraDRCore::NoFork noFork;
     if (!curlReady()) {
         return nullptr;
     }
@@ -145,7 +147,9 @@ HttpConnection::HttpConnection(const Endpoint &endpoint, Purpose purpose)
 
 HttpConnection::~HttpConnection() {
     const SigpipeGuard noSigpipe; // TLS says good-bye to a peer that may be gone
+    const OvraDRCore::NoFork noFork;
     handle_.reset();
+    transfer_.close();
 }
 
 bool HttpConnection::setUp() {
@@ -273,7 +277,7 @@ CredExpected<HttpAnswer> HttpConnection::perform(const std::string &url, Deadlin
     attempt_ = Attempt();
     replyTooLarge_ = false;
     const SigpipeGuard noSigpipe;
-    const CURLcode code = curl_easy_perform(handle_.get());
+    const CURLcode code = transfer_.perform(handle_.get());
     if (code != CURLE_OK) {
         OVRA_INFO("Request to [%s] failed: [%s]", endpoint_.key().c_str(),
                   curl_easy_strerror(code));

@@ -2,6 +2,7 @@
 #pragma once
 
 #include "http/endpoint.h"
+#include "http/transfer.h"
 #include "ovraplatform/cred_errors.h"
 #include "trust/certificate_verifier.h"
 
@@ -104,8 +105,9 @@ private:
     std::vector<int> sockets_; ///< more than one only while several addresses are tried
     bool replyTooLarge_ = false;
     bool endsWhenSilent_ = false; ///< the present socket has been told to
-    // Last, so that it goes first: closing a connection calls back.
+    // Last, so that they go first: closing a connection calls back.
     std::unique_ptr<CURL, FreeHandle> handle_;
+    Transfer transfer_;
 };
 
 } // namespace OvraPlatform

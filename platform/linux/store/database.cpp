@@ -12,13 +12,14 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <chrono>
 
 namespace OvraPlatform {
 
 namespace {
 
 /// Changes take milliseconds; a process that holds the file longer than this is stuck.
-constexpr int kBusyTimeoutMs = 5000;
+constexpr std::chrono::seconds kBusyTimeout{5};
 
 const char *adviceFor(int code) {
     switch (code & 0xFF) {
@@ -107,6 +108,7 @@ bool Statement::isNull(int column) const {
 }
 
 void Database::Close::operator()(sqlite3 *database) const {
+    const OvraDRCore::NoFork noFork;
     OvraBase::CloseSqlite()(database);
 }
 
@@ -116,9 +118,11 @@ Database::Database(std::string path, const DatabaseLayout &layout)
     if (!makeFile()) {
         return;
     }
+    const OvraDRCore::NoFork noFork;
     OvraBase::SqliteHandle opened;
-    const int code = OvraBase::openSqlite(path_, kBusyTimeoutMs, opened);
+    const int code = OvraBase::openSqlite(path_, 0, opened);
     database_.reset(opened.release());
+    wait_ = std::make_unique<OvraDRCore::SqliteWait>(database_.get(), kBusyTimeout);
     if (code != SQLITE_OK) {
         failSqlite(code);
         database_.reset();
@@ -219,6 +223,7 @@ bool Database::makeTables() {
 }
 
 Statement Database::prepare(const char *sql) {
+    const OvraDRCore::NoFork noFork;
     sqlite3_stmt *raw = nullptr;
     if (database_ != nullptr) {
         const int code = sqlite3_prepare_v2(database_.get(), sql, -1, &raw, nullptr);
@@ -233,6 +238,7 @@ bool Database::execute(const char *sql) {
     if (database_ == nullptr) {
         return false;
     }
+    const OvraDRCore::NoFork noFork;
     const int code = sqlite3_exec(database_.get(), sql, nullptr, nullptr, nullptr);
     return code == SQLITE_OK || failSqlite(code);
 }

@@ -3,6 +3,8 @@
 
 #include "ovraplatform/export.h"
 
+#include <ovradrcore/no_fork.h>
+
 #include <cstdint>
 #include <memory>
 #include <optional>
@@ -22,7 +24,8 @@ struct DatabaseLayout {
     const char *schema; ///< creates the tables in a new file
 };
 
-/// A prepared statement. Text and blobs are bound, never pasted.
+/// A prepared statement. Text and blobs are bound, never pasted. Short-lived: while it exists, it
+/// may hold a lock of the file, and forks wait.
 class OVRAPLATFORM_EXPORT Statement {
 public:
     Statement &bind(int index, std::string_view text);
@@ -50,6 +53,7 @@ private:
         : database_(database)
         , statement_(statement) {}
 
+    OvraDRCore::NoFork noFork_;
     class Database *database_;
     std::unique_ptr<sqlite3_stmt, Finalize> statement_;
 };
@@ -98,11 +102,12 @@ private:
 
     std::string path_;
     DatabaseLayout layout_;
+    std::unique_ptr<OvraDRCore::SqliteWait> wait_;
     std::unique_ptr<sqlite3, Close> database_;
     std::string error_;
 };
 
-/// A write transaction: nothing is written without commit().
+/// A write transaction: nothing is written without commit(). Short-lived: forks wait for its end.
 class OVRAPLATFORM_EXPORT Transaction {
 public:
     /// Waits for another process's transaction up to the connection's busy time-out.
@@ -115,6 +120,7 @@ public:
     [[nodiscard]] bool commit();
 
 private:
+    OvraDRCore::NoFork noFork_;
     Database &database_;
     bool open_;
 };
