@@ -9,13 +9,18 @@
 
 #include <fcntl.h>
 #include <gtest/gtest.h>
-#include <sys/file.h>
+#include <linux/filter.h>
+#include <linux/seccomp.h>
 #include <sys/mman.h>
+#include <sys/prctl.h>
 #include <sys/stat.h>
+#include <sys/syscall.h>
 #include <sys/wait.h>
 #include <unistd.h>
+#include <xxhash.h>
 
 #include <atomic>
+#include <cerrno>
 #include <chrono>
 #include <csignal>
 #include <cstring>
@@ -39,15 +44,12 @@ std::int64_t fakeNow = 0;
 /// Shared by the test process and its children.
 struct Counters {
     std::atomic<int> refreshes;
-    std::atomic<int> refreshed;
-    std::atomic<int> running;
-    std::atomic<int> wrong;
 };
 
 class TestCache : public Cache {
 public:
-    explicit TestCache(const std::string &name, bool flag = false)
-        : Cache(kPath, name, kLifetime, flag, 3) {}
+    explicit TestCache(const std::string &name, bool flag = false, const char *path = kPath)
+        : Cache(path, name, kLifetime, flag, 3) {}
     Json::Value GetInfo() const override { return {}; }
     bool GetUpdatedData(Json::Value &value) const override { return refresh(value); }
     bool IsValid(const Json::Value &value) const override { return value.isString(); }
@@ -75,14 +77,18 @@ std::string text(const Json::Value &value) {
     return toString(value);
 }
 
-/// Runs `body` in `count` concurrent processes. \return how many exited with 0.
-int inProcesses(int count, const std::function<void(int)> &body) {
+/// Runs `body` in `count` concurrent processes, and `meanwhile` in this one. \return how many
+/// exited with 0.
+int inProcesses(
+    int count, const std::function<void(int)> &body,
+    const std::function<void()> &meanwhile = [] {}) {
     for (int i = 0; i < count; ++i) {
         if (fork() == 0) {
             body(i);
             _exit(0);
         }
     }
+    meanwhile();
     int good = 0;
     int status = 0;
     while (wait(&status) > 0) {
@@ -99,6 +105,23 @@ Counters *sharedCounters() {
 
 void sleepMs(int milliseconds) {
     std::this_thread::sleep_for(std::chrono::milliseconds(milliseconds));
+}
+
+/// Makes every lock of an open file description fail in this process, as on some file systems.
+void breakRefreshLocks() {
+    sock_filter filter[] = {
+        BPF_STMT(BPF_LD | BPF_W | BPF_ABS, offsetof(seccomp_data, nr)),
+        BPF_JUMP(BPF_JMP | BPF_JEQ | BPF_K, SYS_fcntl, 0, 3),
+        BPF_STMT(BPF_LD | BPF_W | BPF_ABS, offsetof(seccomp_data, args[1])),
+        BPF_JUMP(BPF_JMP | BPF_JEQ | BPF_K, F_OFD_SETLK, 0, 1),
+        BPF_STMT(BPF_RET | BPF_K, SECCOMP_RET_ERRNO | ENOLCK),
+        BPF_STMT(BPF_RET | BPF_K, SECCOMP_RET_ALLOW),
+    };
+    const sock_fprog program = {std::size(filter), filter};
+    if (prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0) != 0 ||
+        prctl(PR_SET_SECCOMP, SECCOMP_MODE_FILTER, &program) != 0) {
+        _exit(2);
+    }
 }
 
 } // namespace
@@ -163,6 +186,35 @@ TEST_F(CacheTest, ARefreshThatYieldsNothingLeavesTheStoredValue) {
     EXPECT_EQ(text(cache.Read()), "\"stored\"");
     EXPECT_FALSE(cache.Update());
     EXPECT_EQ(text(cache.GetCachedData()), "\"stored\"");
+    cache.refresh = [&](Json::Value &) { return cache.UpdateWithData("on the way") && false; };
+    EXPECT_EQ(text(cache.Read()), "\"on the way\"");
+}
+
+TEST_F(CacheTest, ARefreshedValueIsAsOldAsTheFindingBehindIt) {
+    const struct {
+        long took;
+        bool otherMeanwhile; // another process stores a second before the end
+        const char *read;
+        long age;
+    } cases[] = {
+        {10, false, "\"found\"", 0},
+        {10, true, "\"found\"", 0},
+        {120, false, "\"found\"", 120 - Cache::kLongestRefresh}, // the process was stopped
+        {120, true, "\"other\"", 1},
+    };
+    for (const auto &each : cases) {
+        TestCache cache("a");
+        cache.Remove();
+        cache.refresh = [&](Json::Value &value) {
+            fakeNow += each.took - 1;
+            EXPECT_TRUE(!each.otherMeanwhile || TestCache("a").UpdateWithData("other"));
+            fakeNow += 1;
+            value = "found";
+            return true;
+        };
+        EXPECT_EQ(text(cache.Read()), each.read) << each.took;
+        EXPECT_EQ(cache.GetCachedAge(), each.age) << each.took << each.otherMeanwhile;
+    }
 }
 
 TEST_F(CacheTest, UpdateFetchesWhateverIsStored) {
@@ -197,6 +249,8 @@ TEST_F(CacheTest, RemoveTakesOneEntryAndMayFindNone) {
 
 TEST_F(CacheTest, TheFileGrowsKeepsEverythingAndForgetsWhatIsLongPast) {
     constexpr int kEntries = 5000;
+    mkdir(kDir, 0700);
+    std::ofstream((std::string(kPath) + ".new").c_str()) << "left behind by a process that died";
     const auto name = [](const char *kind, int i) { return kind + std::to_string(i); };
     for (int i = 0; i < kEntries; ++i) {
         ASSERT_TRUE(TestCache(name("old", i)).UpdateWithData(i));
@@ -298,24 +352,34 @@ TEST_F(CacheTest, AWriteCutShortLeavesTheOldValue) {
     EXPECT_EQ(text(cache.GetCachedData()), "\"three\"");
 }
 
-TEST_F(CacheTest, AStrangeFileUnderTheNameIsReplaced) {
-    const std::vector<std::function<void()>> strange = {
-        [] { EXPECT_EQ(symlink(kTarget, kPath), 0); },
-        [] { EXPECT_EQ(mkfifo(kPath, 0600), 0); },
-        [] {
-            std::ofstream(kPath) << "x";
-            EXPECT_EQ(chmod(kPath, 0666), 0);
+TEST_F(CacheTest, WhateverElseHasTheNameOfTheFileOrItsLockIsReplaced) {
+    const std::function<void(const char *)> strange[] = {
+        [](const char *path) { EXPECT_EQ(symlink(kTarget, path), 0); },
+        [](const char *path) { EXPECT_EQ(mkfifo(path, 0600), 0); },
+        [](const char *path) {
+            std::ofstream(path) << "x";
+            EXPECT_EQ(chmod(path, 0666), 0);
+        },
+        [](const char *path) {
+            EXPECT_EQ(mkdir(path, 0700), 0);
+            std::ofstream(std::string(path) + "/x") << "x";
         },
     };
     mkdir(kDir, 0700);
     for (const auto &make : strange) {
-        unlink(kPath);
-        make();
-        TestCache cache("a");
-        EXPECT_EQ(text(cache.GetCachedData()), "null");
-        EXPECT_TRUE(cache.UpdateWithData("ours"));
-        EXPECT_EQ(text(cache.GetCachedData()), "\"ours\"");
-        EXPECT_NE(access(kTarget, F_OK), 0) << "nothing was made through a link";
+        for (const std::string path : {kPath, "/tmp/.ovradrcache//c.lock"}) {
+            unlink(kPath);
+            unlink(path.c_str());
+            make(path.c_str());
+            TestCache cache("a");
+            EXPECT_EQ(text(cache.GetCachedData()), "null");
+            EXPECT_EQ(text(cache.Read()), "\"fresh\"");
+            EXPECT_EQ(text(cache.GetCachedData()), "\"fresh\"");
+            struct stat status {};
+            EXPECT_EQ(lstat(path.c_str(), &status), 0);
+            EXPECT_EQ(status.st_mode, S_IFREG | 0600U);
+            EXPECT_NE(access(kTarget, F_OK), 0) << "nothing was made through a link";
+        }
     }
 }
 
@@ -324,9 +388,12 @@ TEST_F(CacheTest, ADirectoryThatIsNotOursAloneIsRefusedOnceAndTheValueFetched) {
     ASSERT_EQ(chmod(kDir, 0777), 0);
     TestCache cache("a");
     EXPECT_FALSE(cache.UpdateWithData("x"));
+    EXPECT_FALSE(cache.Update());
     EXPECT_EQ(text(cache.Read()), "\"fresh\"");
     EXPECT_EQ(text(cache.GetCachedData()), "null");
+    EXPECT_EQ(text(TestCache("a", true, "/proc/none/c").Read()), "\"fresh\"");
     EXPECT_EQ(log.count("going on without a cache"), 1);
+    EXPECT_EQ(log.lines().size(), 1U);
     ASSERT_EQ(rmdir(kDir), 0) << "nothing was written there";
     ASSERT_EQ(mkdir("/tmp/elsewhere", 0700), 0);
     ASSERT_EQ(symlink("/tmp/elsewhere", kDir), 0);
@@ -334,127 +401,147 @@ TEST_F(CacheTest, ADirectoryThatIsNotOursAloneIsRefusedOnceAndTheValueFetched) {
     EXPECT_EQ(rmdir("/tmp/elsewhere"), 0);
 }
 
-TEST_F(CacheTest, ManyProcessesUpdateWithoutLosingAnEntry) {
-    constexpr int kProcesses = 6;
+TEST_F(CacheTest, WritersThatAreKilledBesideOthersLoseAndTearNothing) {
+    constexpr int kProcesses = 4;
     constexpr int kEach = 400;
-    const int good = inProcesses(kProcesses, [](int process) {
-        for (int i = 0; i < kEach; ++i) {
-            const TestCache cache("p" + std::to_string(process) + "_" + std::to_string(i));
-            if (!cache.UpdateWithData(i) || cache.GetCachedData() != Json::Value(i)) {
-                _exit(1);
-            }
-        }
-    });
-    ASSERT_EQ(good, kProcesses);
-    for (int process = 0; process < kProcesses; ++process) {
-        for (int i = 0; i < kEach; ++i) {
-            const TestCache cache("p" + std::to_string(process) + "_" + std::to_string(i));
-            ASSERT_EQ(cache.GetCachedData(), Json::Value(i));
-        }
-    }
-}
-
-TEST_F(CacheTest, AReaderBesideWritersAlwaysSeesAWholeValue) {
-    TestCache("a").UpdateWithData(std::string(3000, '0'));
-    const int good = inProcesses(4, [](int process) {
-        const auto end = std::chrono::steady_clock::now() + std::chrono::milliseconds(700);
-        const TestCache cache("a");
-        for (int i = 0; std::chrono::steady_clock::now() < end; ++i) {
-            if (process < 2) {
-                cache.UpdateWithData(std::string(3000, static_cast<char>('0' + i % 10)));
-                continue;
-            }
-            const Json::Value value = cache.GetCachedData();
-            const std::string read = value.isString() ? value.asString() : "";
-            if (read != std::string(3000, read.empty() ? 'x' : read[0])) {
-                _exit(1);
-            }
-        }
-    });
-    EXPECT_EQ(good, 4);
-}
-
-TEST_F(CacheTest, ProcessesKilledAtAnyMomentLeaveEveryOtherEntryWhole) {
-    for (int i = 0; i < 50; ++i) {
-        TestCache("keep" + std::to_string(i)).UpdateWithData(i);
-    }
+    const auto name = [](int process, int i) {
+        return "p" + std::to_string(process) + "_" + std::to_string(i);
+    };
     std::mt19937 random(11);
-    for (int round = 0; round < 60; ++round) {
-        const pid_t child = fork();
-        if (child == 0) {
-            for (int i = 0;; ++i) {
-                TestCache("mine" + std::to_string(i % 500)).UpdateWithData(std::string(200, 'm'));
+    const int good = inProcesses(
+        kProcesses,
+        [&](int process) {
+            const TestCache shared("shared");
+            for (int i = 0; i < kEach; ++i) {
+                const TestCache cache(name(process, i));
+                bool whole =
+                    cache.UpdateWithData(i) && cache.GetCachedData() == Json::Value(i) &&
+                    shared.UpdateWithData(std::string(3000, static_cast<char>('0' + i % 10)));
+                const Json::Value value = shared.GetCachedData();
+                whole = whole && value.isString() && value.asString().size() == 3000 &&
+                        value.asString() == std::string(3000, value.asString()[0]);
+                if (!whole) {
+                    _exit(1);
+                }
             }
-        }
-        std::this_thread::sleep_for(std::chrono::microseconds(500 + random() % 20000));
-        kill(child, SIGKILL);
-        waitpid(child, nullptr, 0);
-        ASSERT_TRUE(TestCache("after").UpdateWithData(round)) << "no lock is left behind";
+        },
+        [&] {
+            for (int round = 0; round < 60; ++round) {
+                const pid_t victim = fork();
+                if (victim == 0) {
+                    for (int i = 0;; ++i) {
+                        TestCache(name(99, i % 500)).UpdateWithData(std::string(200, 'm'));
+                    }
+                }
+                std::this_thread::sleep_for(std::chrono::microseconds(500 + random() % 20000));
+                kill(victim, SIGKILL);
+                waitpid(victim, nullptr, 0);
+                ASSERT_TRUE(TestCache("after").UpdateWithData(round)) << "no lock is left behind";
+            }
+        });
+    ASSERT_EQ(good, kProcesses);
+    for (int i = 0; i < kProcesses * kEach; ++i) {
+        ASSERT_EQ(TestCache(name(i / kEach, i % kEach)).GetCachedData(), Json::Value(i % kEach));
     }
-    for (int i = 0; i < 50; ++i) {
-        EXPECT_EQ(text(TestCache("keep" + std::to_string(i)).GetCachedData()), std::to_string(i));
+}
+
+TEST_F(CacheTest, OfManyReadersOneRefreshesAndTheOthersShareItsResultOrItsFailure) {
+    for (const bool success : {true, false}) {
+        Counters *counters = sharedCounters();
+        TestCache("a").UpdateWithData("old");
+        fakeNow += kLifetime + 1;
+        const int good = inProcesses(8, [&](int) {
+            TestCache cache("a", true);
+            cache.refresh = [&](Json::Value &value) {
+                ++counters->refreshes;
+                sleepMs(500);
+                value = "new";
+                return success;
+            };
+            _exit(text(cache.Read()) == (success ? "\"new\"" : "\"old\"") ? 0 : 1);
+        });
+        EXPECT_EQ(good, 8);
+        EXPECT_GE(counters->refreshes, 1);
+        EXPECT_LE(counters->refreshes, success ? 1 : 3) << "those that came late had missed it";
     }
 }
 
-TEST_F(CacheTest, AnExpiredEntryIsRefreshedByOneProcessAndTheOthersTakeItsResult) {
-    Counters *counters = sharedCounters();
+TEST_F(CacheTest, ARefreshThatHangsHoldsOthersUpOnceAndNotForLong) {
+    constexpr const char *kOther = "/tmp/.ovradrcache//d";
     TestCache("a").UpdateWithData("old");
-    fakeNow += kLifetime + 1;
-    const int good = inProcesses(8, [&](int) {
-        TestCache cache("a", true);
-        cache.refresh = [&](Json::Value &value) {
-            ++counters->refreshes;
-            sleepMs(200);
-            value = "new";
-            return true;
-        };
-        _exit(text(cache.Read()) == "\"new\"" ? 0 : 1);
-    });
-    EXPECT_EQ(good, 8);
-    EXPECT_EQ(counters->refreshes, 1);
-}
-
-TEST_F(CacheTest, WhoDoesNotNeedFreshDataTakesTheStoredValueAtOnce) {
-    Counters *counters = sharedCounters();
-    TestCache("a").UpdateWithData("old");
-    fakeNow += kLifetime + 1;
-    inProcesses(8, [&](int) {
-        TestCache cache("a", false);
-        cache.refresh = [&](Json::Value &value) {
-            ++counters->refreshes;
-            sleepMs(700);
-            ++counters->refreshed;
-            value = "new";
-            return true;
-        };
-        const std::string read = text(cache.Read());
-        counters->wrong += read == (counters->refreshed == 0 ? "\"old\"" : "\"new\"") ? 0 : 1;
-    });
-    EXPECT_EQ(counters->refreshes, 1);
-    EXPECT_EQ(counters->wrong, 0);
-}
-
-TEST_F(CacheTest, ARefreshThatDiesIsTakenOver) {
-    TestCache("a").UpdateWithData("old");
-    fakeNow += kLifetime + 1;
-    const pid_t child = fork();
-    if (child == 0) {
-        TestCache cache("a");
-        cache.refresh = [](Json::Value &) -> bool {
-            std::raise(SIGKILL);
-            _exit(1);
-        };
-        cache.Read();
+    TestCache("b", false, kOther).UpdateWithData("old");
+    fakeNow += kLifetime + Cache::kLongestRefresh;
+    int ready[2];
+    ASSERT_EQ(pipe(ready), 0);
+    const pid_t hung = fork();
+    if (hung == 0) {
+        TestCache outer("a");
+        TestCache inner("b", false, kOther);
+        outer.refresh = [&](Json::Value &) { return inner.Read().isNull(); };
+        inner.refresh = [&](Json::Value &) { return write(ready[1], "x", 1) == 1 && pause() == 0; };
+        outer.Read();
         _exit(1);
     }
-    int status = 0;
-    waitpid(child, &status, 0);
-    ASSERT_TRUE(WIFSIGNALED(status));
+    char byte = 0;
+    ASSERT_EQ(read(ready[0], &byte, 1), 1);
+    EXPECT_EQ(text(TestCache("a").Read()), "\"old\"") << "at once: it has not expired long ago";
+    EXPECT_EQ(text(TestCache("c", true).Read()), "\"fresh\"") << "every entry has its own lock";
+    EXPECT_EQ(log.count("Waited too long"), 0);
+    fakeNow += 1;
+    for (const bool again : {false, true}) {
+        const CacheWaitScope request;
+        const auto start = std::chrono::steady_clock::now();
+        EXPECT_EQ(text(TestCache("a", again).Read()), "\"fresh\"");
+        EXPECT_EQ(text(TestCache("b", again, kOther).Read()), "\"fresh\"");
+        const std::chrono::duration<double> took = std::chrono::steady_clock::now() - start;
+        EXPECT_GE(took.count(), again ? 0 : Cache::kLongestRefresh - 1);
+        EXPECT_LT(took.count(),
+                  again ? Cache::kLongestRefresh - 2 : 2 * Cache::kLongestRefresh - 2);
+        fakeNow += kLifetime + 1;
+    }
+    EXPECT_EQ(log.count("Waited too long"), 2);
+    kill(hung, SIGKILL);
+    waitpid(hung, nullptr, 0);
+}
+
+TEST_F(CacheTest, ARefreshThatDiesIsTakenOverAtOnceThoughItsChildrenLive) {
+    TestCache("a").UpdateWithData("old");
+    fakeNow += kLifetime + 1;
+    const int good = inProcesses(1, [](int) {
+        TestCache cache("a");
+        cache.refresh = [](Json::Value &) -> bool {
+            for (const bool exec : {true, false}) {
+                if (fork() == 0) {
+                    alarm(60);
+                    exec ? execlp("sleep", "sleep", "60", nullptr) : pause();
+                    _exit(0);
+                }
+            }
+            std::raise(SIGKILL);
+            _exit(0);
+        };
+        cache.Read();
+    });
+    ASSERT_EQ(good, 0);
     EXPECT_EQ(text(TestCache("a", true).Read()), "\"fresh\"");
+    EXPECT_EQ(log.count("Waited too long"), 0);
+}
+
+TEST_F(CacheTest, WhereLocksFailEveryReaderRefreshes) {
+    const int good = inProcesses(1, [&](int) {
+        breakRefreshLocks();
+        for (const char *name : {"a", "b"}) {
+            const bool fresh = text(TestCache(name, true).Read()) == "\"fresh\"";
+            if (!fresh || TestCache(name).GetCachedData().isNull()) {
+                _exit(1);
+            }
+        }
+        _exit(log.lines().size() == 1 && log.count("No locks available") == 1 ? 0 : 1);
+    });
+    EXPECT_EQ(good, 1);
 }
 
 TEST_F(CacheTest, ADamagedCopyWithARightChecksumStaysWithinItsBounds) {
-    // Sizes that point outside the copy, with a valid checksum.
     BucketImage image(16, 3);
     ASSERT_TRUE(image.add({"name", "\"value\"", 1, 1, 1}));
     const std::string_view bytes = image.finish(1);
@@ -463,11 +550,14 @@ TEST_F(CacheTest, ADamagedCopyWithARightChecksumStaysWithinItsBounds) {
     ASSERT_EQ(BucketImage::check(copy.data(), 16, 3), 1U);
     EXPECT_FALSE(BucketImage::check(copy.data(), 16, 4)) << "a copy of another bucket";
     EXPECT_FALSE(BucketImage::check(copy.data(), 32, 3)) << "a copy of a smaller file";
-    for (std::size_t at = 32 + 24; at < 32 + 32; ++at) {
+    for (std::size_t at = 32 + 24; at < 32 + 32; ++at) { // the sizes of name and value
         auto bent = copy;
         bent[at] = std::byte{0xFF};
         EXPECT_FALSE(BucketImage::check(bent.data(), 16, 3));
-        EXPECT_LE(BucketImage::entries(bent.data()).size(), 1U);
-        BucketImage::find(bent.data(), "name");
+        const std::uint64_t sum = XXH3_64bits(bent.data() + 8, bytes.size() - 8);
+        std::memcpy(bent.data(), &sum, sizeof(sum));
+        ASSERT_EQ(BucketImage::check(bent.data(), 16, 3), 1U);
+        EXPECT_EQ(BucketImage::entries(bent.data()).size(), 0U);
+        EXPECT_FALSE(BucketImage::find(bent.data(), "name"));
     }
 }
