@@ -64,6 +64,7 @@ bool NodeSender::setNode(const DRNode &node) {
 }
 
 Response NodeSender::process(const Request &request) {
+    const OvraDRCore::CacheWaitScope scope;
     SetErr(ERR::kNone);
     Response response;
     if (!request.isValid()) {
@@ -138,6 +139,7 @@ bool NodeSender::processByCred(const DRNode &node, const Request &request, Respo
 }
 
 std::string NodeSender::getValidCredId() const {
+    const OvraDRCore::CacheWaitScope scope;
     std::vector<DRNode> nodes;
     if (nodeId.empty() || DRNode::isLocalNodeId(nodeId) ||
         !DRNodeDB::ListCred(nodeId, nodes, DRNodeDB::CRED_TYPE_NODE)) {
@@ -157,6 +159,7 @@ std::string NodeSender::getCachedCredId() const {
 }
 
 bool NodeSender::isConnectable() const {
+    const OvraDRCore::CacheWaitScope scope;
     const std::string id = getValidCredId();
     if (!id.empty()) {
         return BaseSender::IsConnectable(CredNodeSender(id).getNode().conn);
@@ -234,6 +237,7 @@ Response CredNodeSender::process(const Request &request) {
 }
 
 bool CredNodeSender::testPrivilege() {
+    const OvraDRCore::CacheWaitScope scope;
     SetErr(ERR::kFailed);
     if (!node.isValid()) {
         SetErr(ERR::kCredInvalid);
