@@ -9,7 +9,6 @@
 #include <unistd.h>
 
 #include <chrono>
-#include <climits>
 #include <regex>
 #include <set>
 
@@ -23,10 +22,6 @@ TEST(Util, UuidsAreVersionFourAndDiffer) {
         EXPECT_TRUE(std::regex_match(id, form)) << id;
         EXPECT_TRUE(seen.insert(id).second);
     }
-}
-
-TEST(Util, SmallestIntHasElevenCharacters) {
-    EXPECT_EQ(ToString<int>(INT_MIN), "-2147483648");
 }
 
 TEST(Util, CreateDirMakesWhatIsMissingWithTheModeWhateverTheUmask) {
