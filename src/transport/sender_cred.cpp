@@ -45,6 +45,13 @@ int loginError(int remoteCode) {
     return listed ? ERR::kLoginFailed + (remoteCode - kFirstLoginCode) : ERR::kLoginFailed;
 }
 
+/// Hands a text to the credential library, unless it would be cut at a NUL. \return whether it took
+/// it
+template <typename Object>
+bool setItem(int (*set)(Object *, const char *), Object *object, const std::string &item) {
+    return item.find('\0') == std::string::npos && set(object, item.c_str()) == 0;
+}
+
 } // namespace
 
 BaseCredSender::BaseCredSender() = default;
@@ -75,8 +82,8 @@ bool BaseCredSender::initConn() const {
         SetErr(ERR::kBadParameter, "conn");
         return false;
     }
-    if (OVRACredItemSetProtocol(cred, conn.protocol.c_str()) != 0 ||
-        OVRACredItemSetHost(cred, conn.addr.c_str()) != 0 ||
+    if (!setItem(OVRACredItemSetProtocol, cred, conn.protocol) ||
+        !setItem(OVRACredItemSetHost, cred, conn.addr) ||
         OVRACredItemSetPort(cred, conn.port) != 0) {
         SetErr(ERR::kCredItemRefused);
         return false;
@@ -223,7 +230,7 @@ Response BaseCredSender::process(const Request &request) {
     Response response;
     CallTexts texts(request, conn);
     if (!request.isValid()) {
-        SetErr(ERR::kBadParameter, OvraDRCore::maskSecrets(request.toJson()));
+        SetErr(ERR::kBadParameter, request.toJson());
         OVRA_ERR("Invalid api");
     } else if (!isValid()) {
         SetErr(ERR::kBadParameter);
@@ -289,8 +296,8 @@ bool CredAccountSender::initCred() {
         OVRA_ERR("Bad parameter of credHost [%s]", conn.addr.c_str());
         return false;
     }
-    if (OVRACredItemSetRemoteAccount(cred, account.c_str()) != 0 ||
-        OVRACredItemSetRemotePasswd(cred, passwd.c_str()) != 0) {
+    if (!setItem(OVRACredItemSetRemoteAccount, cred, account) ||
+        !setItem(OVRACredItemSetRemotePasswd, cred, passwd)) {
         SetErr(ERR::kCredItemRefused);
         OVRA_ERR("Failed to set the credential infomation of host [%s]", account.c_str());
         return false;
@@ -356,7 +363,7 @@ bool CredSessionSender::initCred() {
         OVRA_ERR("Bad parameter [%s]", session.c_str());
         return false;
     }
-    if (OVRACredSessItemSetAccessToken(credSess, session.c_str()) != 0) {
+    if (!setItem(OVRACredSessItemSetAccessToken, credSess, session)) {
         SetErr(ERR::kCredItemRefused);
         OVRA_ERR("Failed to set the credential session of host [%s]", conn.addr.c_str());
         return false;

@@ -42,9 +42,11 @@ TEST_F(CredSender, CarriesTheRequestUnderTheSession) {
 
 TEST_F(CredSender, WhatCannotBeSentIsRefusedWithoutAWordToTheRemote) {
     CredSessionSender good(conn, "s1");
-    EXPECT_FALSE(good.process(Request()).isValid());
+    Request request("a", 1, "", Json::Value());
+    request.addParam("password", "exact");
+    EXPECT_FALSE(good.process(request).isValid());
     EXPECT_EQ(good.GetErrCode(), 401);
-    EXPECT_TRUE(good.GetErrMsg().isObject()) << "the request";
+    EXPECT_EQ(good.GetErrMsg(), request.toJson());
     EXPECT_EQ(log.count("ERR", "sender", "process", "Invalid api"), 1);
     CredSessionSender noSession(conn);
     send(noSession);
@@ -60,7 +62,45 @@ TEST_F(CredSender, WhatCannotBeSentIsRefusedWithoutAWordToTheRemote) {
     send(noPassword);
     EXPECT_EQ(noPassword.GetErrCode(), 401);
     EXPECT_EQ(log.count("invalid conn ["), 3);
+    const auto cut = [](const std::string &text) { return text + std::string("\0x", 2); };
+    CredSessionSender host(Conn::https(cut("127.0.0.1"), remote.port()), "s1");
+    CredSessionSender token(conn, cut("s1"));
+    CredAccountSender account(conn, cut("joe"), "pw", "");
+    CredAccountSender password(conn, "joe", cut("pw"), "");
+    for (BaseSender *sender :
+         std::initializer_list<BaseSender *>{&host, &token, &account, &password}) {
+        send(*sender);
+        EXPECT_EQ(sender->GetErrCode(), 506) << "never the text up to the NUL";
+    }
     EXPECT_EQ(remote.calls(), "");
+}
+
+TEST_F(CredSender, NoFailureWritesASecretIntoTheLog) {
+    const Request request = WebAPI::getDRNodeTestCredCreateAPI(conn, "joe", "canary", "canary");
+    Request invalid = request;
+    invalid.setMethod("");
+    remote.answer("login", R"({"success":true,"data":{"sid":"canary"}})");
+    for (const char *answer :
+         {"", "<canary>", R"({"success":false,"error":{"code":105}})",
+          R"({"success":false,"error":{"code":120,"msg":{"token":"canary"}}})"}) {
+        remote.answer("test_create", answer);
+        CredAccountSender account(conn, "joe", "canary", "canary");
+        CredSessionSender session(conn, "canary");
+        for (BaseSender *sender : std::initializer_list<BaseSender *>{&account, &session}) {
+            ConnCache(conn).UpdateWithData(true);
+            EXPECT_FALSE(sender->process(request).isSuccess());
+            EXPECT_FALSE(sender->process(invalid).isSuccess());
+            ConnCache(conn).UpdateWithData(false);
+            EXPECT_FALSE(sender->process(request).isSuccess());
+        }
+    }
+    remote.answer("login", R"({"success":false,"error":{"code":400,"msg":{"passwd":"canary"}}})");
+    EXPECT_FALSE(CredAccountSender(conn, "joe", "canary", "canary").init());
+    EXPECT_GT(log.count("Failed to process cred request ["), 0);
+    EXPECT_GT(log.count("since error ["), 0);
+    EXPECT_GT(log.count("not connectable"), 0);
+    EXPECT_GT(log.count("Failed to login"), 0);
+    EXPECT_EQ(log.count("canary"), 0);
 }
 
 TEST_F(CredSender, WhyACallFailedIsToldByTheRemoteOrElseByTheSender) {

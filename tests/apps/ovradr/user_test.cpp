@@ -147,6 +147,8 @@ TEST(Password, IsRefusedWhenItCannotBeRead) {
         {"an empty line", {"--password-stdin"}, "\ncorrect horse\n", 1},
         {"too short", {"--password-stdin"}, "short\n", 1},
         {"too long", {"--password-stdin"}, std::string(1025, 'x') + "\n", 1},
+        {"not UTF-8", {"--password-stdin"}, "correct h\xf6rse\n", 1},
+        {"a NUL", {"--password-stdin"}, std::string("correct \0horse\n", 15), 1},
         {"no such file", {"--password-file", "/nowhere/at/all"}, "", 1},
         {"a folder", {"--password-file", "/"}, "", 1},
         {"nobody to ask", {}, "correct horse\n", 2},
