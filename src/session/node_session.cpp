@@ -205,9 +205,7 @@ std::string CgiLogin(const std::string &userName, int timeout, const std::string
         }
     }
     if (!nodeId.empty()) {
-        Json::Value extra(Json::objectValue);
-        extra[Word::kNodeId] = nodeId;
-        const std::string text = OvraDRCore::toString(extra);
+        const std::string text = NodeSession::ExtraOf(nodeId);
         if (OvraCgiSetOption(handle.get(), OVRA_CGI_OPT_EXTRA, text.c_str()) == 0) {
             OVRA_WARN("Failed to set extra opt[%s] of user[%s] login", text.c_str(),
                       userName.c_str());
@@ -239,6 +237,12 @@ std::string NodeSession::NodeIdOf(const std::string &extra) {
     Json::Value parsed;
     return OvraDRCore::fromString(parsed, extra) ? OvraDRCore::memberString(parsed, Word::kNodeId)
                                                  : "";
+}
+
+std::string NodeSession::ExtraOf(const std::string &nodeId) {
+    Json::Value extra(Json::objectValue);
+    extra[Word::kNodeId] = nodeId;
+    return OvraDRCore::toString(extra);
 }
 
 std::string NodeSession::CreateNodeSession(const std::string &nodeId, const std::string &userName) {

@@ -5,6 +5,7 @@
 
 #include <ovradrnode/node_session.h>
 #include <ovraplatform/api_errors.h>
+#include <ovraplatform/session_walk.h>
 
 namespace Ovradrd {
 
@@ -33,6 +34,8 @@ Json::Value create(const Json::Value &params, const APICaller &caller) {
     if (!in.ok()) {
         return in.error();
     }
+    const OvraPlatform::SessionWalk walk(
+        {caller.user, NodeSession::kApplication, NodeSession::ExtraOf(nodeId)});
     NodeSession sessions;
     const std::string session = sessions.CreateNodeSession(nodeId, caller.user);
     return granted(sessions, session);
