@@ -123,7 +123,7 @@ int serve(const Options &options) {
     const int port = https->port;
     const int tunnelPort = tunnel->port;
 
-    RelayApi api(std::move(aliases), {options.address, options.host, tunnelPort});
+    RelayApi api(aliases, {options.address, options.host, tunnelPort}, {});
     TunnelServer tunnelServer(
         [&api](const std::string &alias, const std::string &caller) {
             return api.announce(alias, caller);

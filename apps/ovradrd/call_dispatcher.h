@@ -21,9 +21,13 @@ namespace Ovradrd {
 struct WorkQueues {
     OvraService::WorkQueue quick{
         4, 512}; ///< reads calls, and runs those that answer from this machine alone
-    OvraService::WorkQueue slow{16, 64}; ///< calls that may wait on the network
+    OvraService::WorkQueue outbound{16, 64};
+    OvraService::WorkQueue twoWay{16, 64};
+    OvraService::WorkQueue relay{8, 64};
     OvraService::WorkQueue login{
         2, 64}; ///< log-ins: each hashes a password, with 64 MiB and a tenth of a second
+
+    OvraService::WorkQueue &of(OvraPlatform::APIQueue queue);
 };
 
 /// The path of a call from arrival to reply: read, unseal, find the session and its rights, choose

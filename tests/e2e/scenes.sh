@@ -194,6 +194,30 @@ addAdministrators() {
     on 1 0 ovradr user add back --admin --password-file /usr/ovra/pw
 }
 
+# Both nodes are asked for forty credentials in both directions at the same moment.
+flowsAtOnce() {
+    local node there
+    local -A cred sid entry
+    on 1 0 ovradr user add replica --admin --password-file /usr/ovra/pw
+    for node in 1 2; do
+        there=$((3 - node)) entry[$node]="https://$("$lab" addr "$node"):5001/webapi/query.cgi"
+        on "$node" 0 ovradr --json cred create "https://$("$lab" addr $there):5001" --account replica \
+            --password-file /usr/ovra/pw --fingerprint "$(fingerprint $there)"
+        cred[$node]=$(made)
+        on "$node" 0 curl -qsk "${entry[$node]}" \
+            -d "api=OVRA.Core.Auth&version=1&method=login&account=\"replica\"&passwd=\"$password\""
+        sid[$node]=$(value .data.sid)
+    done
+    for node in 1 2; do
+        on "$node" 0 curl -qskZ --parallel-immediate --parallel-max 40 "${entry[$node]}?[1-40]" \
+            -d "api=OVRA.DR.Node.Credential&version=1&method=create&_sid=${sid[$node]}" \
+            -d "auth=\"cred_id\"&cred_id=\"${cred[$node]}\"&cred_direction=\"bidirection\"" &
+    done
+    wait
+    remain 1 81 1
+    remain 2 81 1
+}
+
 sharedSessions() {
     local which word left
     local -A cred

@@ -7,6 +7,7 @@
 #include "handlers/words.h"
 #include "shared/session_release.h"
 
+#include <ovradrcore/json.h>
 #include <ovradrcore/log.h>
 #include <ovradrnode/cred_reverse_create.h>
 #include <ovradrnode/dr_node.h>
@@ -33,6 +34,7 @@ using OvraPlatform::APICaller;
 using OvraPlatform::apiError;
 using OvraPlatform::apiSuccess;
 
+constexpr char kDirection[] = "cred_direction";
 constexpr char kUnidirection[] = "unidirection";
 constexpr char kBidirection[] = "bidirection";
 
@@ -127,7 +129,7 @@ Json::Value carryOut(OvraDRNode::CredCreate &flow, const Proof &proof) {
 Json::Value create(const Json::Value &params, const APICaller &caller) {
     Params in(params);
     const Proof proof(in, true);
-    const std::string direction = in.word("cred_direction", {kUnidirection, kBidirection});
+    const std::string direction = in.word(kDirection, {kUnidirection, kBidirection});
     const bool bothWays = direction == kBidirection;
     const std::string account = bothWays ? readLocalAccount(in, caller) : "";
     if (!in.ok()) {
@@ -146,6 +148,12 @@ Json::Value create(const Json::Value &params, const APICaller &caller) {
     Json::Value data(Json::objectValue);
     data["src_cred"] = flow.getNode().toJson();
     return bothWays ? addReverse(data, flow.getNode().credId, account, conns) : apiSuccess(data);
+}
+
+OvraPlatform::APIQueue queueOfCreate(const Json::Value &params) {
+    return OvraDRCore::memberString(params, kDirection) == kBidirection
+               ? OvraPlatform::APIQueue::kTwoWay
+               : OvraPlatform::APIQueue::kOutbound;
 }
 
 Json::Value createTemporary(const Json::Value &params, const APICaller & /*caller*/) {
@@ -209,9 +217,11 @@ Json::Value list(const Json::Value &params, const APICaller & /*caller*/) {
         return in.error();
     }
     // Unreadable tables read as empty ones, and a session audit would end those in use.
-    if (OvraDRNode::NodeDBHandler::GetHandler().GetSchemaVersion() < 0) {
+    auto database = OvraDRNode::NodeDBHandler::GetHandler();
+    if (database.GetSchemaVersion() < 0) {
         return apiError(OvraPlatform::APIError::kInternal,
-                        "the node database cannot be read now: see the log of the appliance");
+                        "the node database of the appliance cannot be read (" +
+                            database.GetErrMsg().asString() + "): try again");
     }
     Json::Value data(Json::objectValue);
     data["creds"] = Json::Value(Json::arrayValue);
@@ -371,18 +381,19 @@ void addCredentialAPI(OvraPlatform::APIRegistry &registry) {
     };
     add("get", APIQueue::kQuick, get);
     add("list", APIQueue::kQuick, list);
-    add("create", APIQueue::kSlow, create);
-    add("temp_create", APIQueue::kSlow, createTemporary);
-    add("test_create", APIQueue::kSlow, testCreate);
-    add("set", APIQueue::kSlow,
+    registry.add(kCredentialApi, 1, "create", OvraPlatform::APIRight::kAdministrator,
+                 APIQueue::kTwoWay, create, queueOfCreate);
+    add("temp_create", APIQueue::kOutbound, createTemporary);
+    add("test_create", APIQueue::kOutbound, testCreate);
+    add("set", APIQueue::kOutbound,
         [](const Json::Value &params, const APICaller & /*caller*/) { return set(params, false); });
-    add("test_set", APIQueue::kSlow,
+    add("test_set", APIQueue::kOutbound,
         [](const Json::Value &params, const APICaller & /*caller*/) { return set(params, true); });
-    add("delete", APIQueue::kSlow, remove);
-    add("reverse_create", APIQueue::kSlow, createReverse<CredReverseCreate>);
-    add("temp_reverse_create", APIQueue::kSlow, createReverse<OvraDRNode::TempCredReverseCreate>);
-    add("test_reverse_create", APIQueue::kSlow, testReverse);
-    add(kRelay, APIQueue::kSlow, relay);
+    add("delete", APIQueue::kOutbound, remove);
+    add("reverse_create", APIQueue::kTwoWay, createReverse<CredReverseCreate>);
+    add("temp_reverse_create", APIQueue::kTwoWay, createReverse<OvraDRNode::TempCredReverseCreate>);
+    add("test_reverse_create", APIQueue::kTwoWay, testReverse);
+    add(kRelay, APIQueue::kRelay, relay);
 }
 
 } // namespace Ovradrd

@@ -16,6 +16,8 @@ using Farlinkd::TunnelServer;
 using OvraBase::UniqueFd;
 using OvraService::Listener;
 
+constexpr std::chrono::seconds kLong{120};
+
 UniqueFd dial(int port) {
     UniqueFd fd(socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0));
     sockaddr_in address{};
@@ -36,6 +38,12 @@ void say(const UniqueFd &fd, const std::string &text) {
         }
         done += static_cast<std::size_t>(size);
     }
+}
+
+std::string hear(const UniqueFd &fd) {
+    std::string text(100, '\0');
+    const ssize_t size = recv(fd.get(), text.data(), text.size(), 0);
+    return size < 0 ? "timeout" : text.substr(0, static_cast<std::size_t>(size));
 }
 
 /// Reads until the other end closes, or 10 seconds pass without a byte ("timeout").
@@ -132,14 +140,45 @@ TEST_F(ThroughTheTunnelServer, NobodyIsConnectedToSomebodyElse) {
 }
 
 TEST_F(ThroughTheTunnelServer, AreBoundedAndEndWithTheAlias) {
-    begin({.perAlias = 1, .idle = std::chrono::milliseconds(500)});
-    UniqueFd client = dial(callerPort);
-    UniqueFd appliance = answer(caller());
-    EXPECT_EQ(hearAll(dial(callerPort)), "") << "one too many";
+    // Longer than anybody listens here: only the bounds end a connection.
+    TunnelServer::Limits perAlias{.perAlias = 1, .arriving = 1, .line = kLong, .answer = kLong};
+    TunnelServer::Limits all = perAlias;
+    all.perAlias = 64;
+    all.calls = 1;
+    for (TunnelServer::Limits limits : {perAlias, all}) {
+        begin(limits);
+        UniqueFd client = dial(callerPort);
+        const std::string first = caller();
+        EXPECT_EQ(hearAll(dial(callerPort)), "") << "one too many, while the first one waits";
+        UniqueFd appliance = answer(first);
+        say(appliance, "through");
+        EXPECT_EQ(hear(client), "through");
+        EXPECT_EQ(hearAll(dial(callerPort)), "") << "and once it is put through";
+        const UniqueFd silent = dial(tunnelPort);
+        EXPECT_EQ(hearAll(dial(tunnelPort)), "") << "an appliance too many that says nothing";
+        server->close("nas");
+        EXPECT_EQ(hearAll(client), "");
+        EXPECT_EQ(hearAll(appliance), "");
+    }
+    begin({.idle = std::chrono::milliseconds(500)});
+    const UniqueFd client = dial(callerPort);
+    const UniqueFd appliance = answer(caller());
     EXPECT_EQ(hearAll(client), "") << "in silence for too long";
-    client = dial(callerPort);
-    appliance = answer(caller());
-    server->close("nas");
-    EXPECT_EQ(hearAll(client), "");
-    EXPECT_EQ(hearAll(appliance), "");
+}
+
+TEST_F(ThroughTheTunnelServer, WhatTheOtherEndDoesNotTakeStaysWithTheSender) {
+    begin({});
+    const UniqueFd client = dial(callerPort);
+    UniqueFd appliance = answer(caller());
+    const timeval patience{1, 0};
+    setsockopt(client.get(), SOL_SOCKET, SO_SNDTIMEO, &patience, sizeof patience);
+    const std::string chunk(1 << 20, 'x');
+    std::size_t taken = 0;
+    for (ssize_t size = 1; size > 0 && taken < (128U << 20U);) {
+        size = send(client.get(), chunk.data(), chunk.size(), MSG_NOSIGNAL);
+        taken += size > 0 ? static_cast<std::size_t>(size) : 0;
+    }
+    EXPECT_LT(taken, 64U << 20U) << "the kernel's buffers, of four sockets";
+    shutdown(client.get(), SHUT_WR);
+    EXPECT_EQ(hearAll(appliance).size(), taken);
 }

@@ -108,19 +108,23 @@ TEST_F(Bounds, HoldWhenMoreConnectionsComeThanThereMayBe) {
 }
 
 /// A registry with one call that waits and one that does not.
-class FullLanes : public testing::Test {
+class FullQueues : public testing::Test {
 protected:
-    FullLanes() {
+    FullQueues() {
         using OvraPlatform::APIQueue;
         using OvraPlatform::APIRight;
-        registry.add("Test", 1, "wait", APIRight::kNone, APIQueue::kSlow,
-                     [this](const Json::Value &, const OvraPlatform::APICaller &) {
-                         std::unique_lock lock(mutex);
-                         ++inside;
-                         changed.notify_all();
-                         changed.wait(lock, [this] { return open; });
-                         return OvraPlatform::apiSuccess();
-                     });
+        for (const auto &[method, queue] :
+             {std::pair("relay", APIQueue::kRelay), std::pair("twoWay", APIQueue::kTwoWay),
+              std::pair("outbound", APIQueue::kOutbound)}) {
+            registry.add("Test", 1, method, APIRight::kNone, queue,
+                         [this](const Json::Value &, const OvraPlatform::APICaller &) {
+                             std::unique_lock lock(mutex);
+                             ++inside;
+                             changed.notify_all();
+                             changed.wait(lock, [this] { return open; });
+                             return OvraPlatform::apiSuccess();
+                         });
+        }
         registry.add("Test", 1, "quick", APIRight::kNone, APIQueue::kQuick,
                      [](const Json::Value &, const OvraPlatform::APICaller &) {
                          return OvraPlatform::apiSuccess();
@@ -156,18 +160,25 @@ protected:
     std::optional<Ovradrd::WorkQueues> queues{std::in_place};
 };
 
-TEST_F(FullLanes, RefuseAtOnceAndDoNotHoldUpQuickCalls) {
-    for (int i = 0; i < 16; ++i) {
-        serve("wait");
+TEST_F(FullQueues, RefuseAtOnceAndDoNotHoldUpTheLowerOnes) {
+    int places = 0;
+    int refused = 0;
+    for (const auto &[method, threads] :
+         {std::pair("relay", 8), std::pair("twoWay", 16), std::pair("outbound", 16)}) {
+        places += threads;
+        for (int i = 0; i < threads; ++i) {
+            serve(method);
+        }
+        {
+            std::unique_lock lock(mutex);
+            ASSERT_TRUE(changed.wait_for(lock, 5s, [&] { return inside == places; })) << method;
+        }
+        for (int i = 0; i < 64 + 5; ++i) {
+            serve(method);
+        }
+        refused += 5;
+        EXPECT_TRUE(gets(107, refused)) << method;
     }
-    {
-        std::unique_lock lock(mutex);
-        ASSERT_TRUE(changed.wait_for(lock, 5s, [this] { return inside == 16; }));
-    }
-    for (int i = 0; i < 64 + 5; ++i) {
-        serve("wait");
-    }
-    EXPECT_TRUE(gets(107, 5));
     serve("quick");
     EXPECT_TRUE(gets(0, 1));
     {
@@ -175,16 +186,16 @@ TEST_F(FullLanes, RefuseAtOnceAndDoNotHoldUpQuickCalls) {
         open = true;
     }
     changed.notify_all();
-    EXPECT_TRUE(gets(0, 16 + 64 + 1));
-    EXPECT_EQ(replies[107], 5);
+    EXPECT_TRUE(gets(0, places + 3 * 64 + 1));
+    EXPECT_EQ(replies[107], refused);
     queues.reset();
 }
 
-TEST_F(FullLanes, LetLocalCallersGoWhenTheDaemonStops) {
+TEST_F(FullQueues, LetLocalCallersGoWhenTheDaemonStops) {
     OvraPlatform::LocalCall call;
     call.api = "Test";
     call.version = 1;
-    call.method = "wait";
+    call.method = "outbound";
     call.user = "admin";
     std::thread stopper([this] {
         std::this_thread::sleep_for(200ms);

@@ -48,7 +48,7 @@ TEST_P(Dispatch, AnswersWithTheCodeOfTheWireForm) {
     APIRegistry registry;
     registry.add("Open", 1, "get", APIRight::kNone, APIQueue::kQuick, echo);
     registry.add("Mine", 2, "get", APIRight::kSession, APIQueue::kQuick, echo);
-    registry.add("All", 1, "set", APIRight::kAdministrator, APIQueue::kSlow, echo);
+    registry.add("All", 1, "set", APIRight::kAdministrator, APIQueue::kOutbound, echo);
     registry.add("Here", 1, "get", APIRight::kLocal, APIQueue::kQuick, echo);
     registry.add("Bad", 1, "throw", APIRight::kNone, APIQueue::kQuick,
                  [](const Json::Value &params, const APICaller &) -> Json::Value {
@@ -96,12 +96,16 @@ TEST(APIRegistry, GivesAHandlerAnObjectForNullParameters) {
     EXPECT_EQ(reply["data"]["params"], Json::Value(Json::objectValue));
 }
 
-TEST(APIRegistry, KnowsTheLaneOfEachVersion) {
+TEST(APIRegistry, KnowsTheQueueOfEachVersionAndOfWhatItIsAskedFor) {
     APIRegistry registry;
     registry.add("A", 1, "get", APIRight::kNone, APIQueue::kQuick, echo);
-    registry.add("A", 2, "get", APIRight::kNone, APIQueue::kSlow, echo);
+    registry.add("A", 2, "get", APIRight::kNone, APIQueue::kRelay, echo,
+                 [](const Json::Value &params) {
+                     return params.isString() ? APIQueue::kRelay : APIQueue::kOutbound;
+                 });
     EXPECT_EQ(registry.queue({"A", 1, "get"}), APIQueue::kQuick);
-    EXPECT_EQ(registry.queue({"A", 2, "get"}), APIQueue::kSlow);
+    EXPECT_EQ(registry.queue({"A", 2, "get"}), APIQueue::kOutbound);
+    EXPECT_EQ(registry.queue({"A", 2, "get", "text"}), APIQueue::kRelay);
     EXPECT_EQ(registry.queue({"B", 1, "get"}), APIQueue::kQuick);
 }
 
