@@ -14,7 +14,8 @@ namespace OvraDRNode {
 
 /// Changes a node credential: a new login, possibly over another endpoint, to the same node. The
 /// row is rewritten first; then a session that nothing uses any more is released. Construct with
-/// the credential id, setCred(), process().
+/// the credential id, setCred(), process(). Takes no lock, see CredCreate: the session that is
+/// released is that of the row as setCredId() read it.
 class OVRADRNODE_EXPORT DRNodeCredSet : public OvraDRCore::ErrRecorder {
 public:
     DRNodeCredSet() = default;

@@ -161,7 +161,7 @@ public:
     [[nodiscard]] bool setNode(const std::string &id);
     [[nodiscard]] bool setNode(const DRNode &node);
     /// Builds the request, sends it to `nodeId` and copies the answer's data into `out`.
-    /// \return whether an answer came; an error answer gives the empty object.
+    /// \return whether an answer came; `out` is null if it was an error, or none came.
     [[nodiscard]] static bool process(const std::string &nodeId, const std::string &api,
                                       const std::string &method, int version,
                                       const Json::Value &params, Json::Value &out);

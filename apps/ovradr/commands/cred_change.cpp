@@ -1,12 +1,19 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "commands/cred_commands.h"
 #include "cred_report.h"
+#include "endpoint.h"
 #include "node_ref.h"
 #include "output.h"
 #include "remote_login.h"
+#include "shared/session_lock.h"
 #include "target.h"
+#include "trust.h"
 
+#include <ovradrnode/cred_permission_cache.h>
+#include <ovradrnode/node_cache.h>
+#include <ovradrnode/node_db.h>
 #include <ovradrnode/node_set.h>
+#include <ovradrnode/sender.h>
 
 #include <memory>
 
@@ -19,6 +26,7 @@ using OvraApps::FlowState;
 using OvraDRNode::Conn;
 using OvraDRNode::DRNode;
 using OvraDRNode::DRNodeCredSet;
+using OvraDRNode::DRNodeDB;
 namespace ERR = OvraDRCore::ERR;
 
 struct SetOptions {
@@ -70,6 +78,13 @@ Report reportUpdate(const FlowResult &result, const std::string &account) {
     return report;
 }
 
+Report wouldWork() {
+    Report report;
+    report.data["would_work"] = true;
+    report.text = "It would work; nothing was changed.\n";
+    return report;
+}
+
 Outcome runUpdate(DRNodeCredSet &flow, const DRNode &record, const Conn &conn,
                   const SetOptions &options) {
     if (!options.dryRun) {
@@ -89,13 +104,74 @@ Outcome runUpdate(DRNodeCredSet &flow, const DRNode &record, const Conn &conn,
     if (!flow.check()) {
         return setFailure(flow, conn);
     }
-    Report report;
-    report.data["would_work"] = true;
-    report.text = "It would work; nothing was changed.\n";
-    return report;
+    return wouldWork();
+}
+
+/// The fingerprint that the new endpoint must have: the required one, or that of the key by which
+/// the credential's present endpoint is known, if the new one shows the same; else "".
+Expected<std::string> expectedKey(const SetOptions &options, const Conn &present,
+                                  const Conn &direct) {
+    if (!options.fingerprint.empty()) {
+        return options.fingerprint;
+    }
+    const auto met =
+        OvraPlatform::peerFingerprint(direct.protocol, direct.addr, direct.port, kKeySeconds);
+    if (!met) {
+        return endpointFailure(direct, met.error());
+    }
+    const std::string known = targetText(Conn::translateFarlink(present));
+    const bool same = OvraPlatform::TrustStore().lookup(known, met->fingerprint) ==
+                      OvraPlatform::TrustVerdict::kTrusted;
+    return same ? met->fingerprint : "";
+}
+
+/// Takes a credential with its session to another endpoint of its node.
+Outcome move(const SetOptions &options, const DRNode &known, const Conn &conn) {
+    const Expected<void> trusted = directEndpoint(conn).and_then([&](const Conn &direct) {
+        return expectedKey(options, known.conn, direct).and_then([&](const std::string &key) {
+            return trustPeer(direct, key).and_then([&] { return probeEndpoint(direct); });
+        });
+    });
+    if (!trusted) {
+        return Refusal(trusted.error());
+    }
+    const OvraApps::SessionLock lock(known.nodeId, OvraApps::SessionLock::Purpose::kRelease);
+    if (lock.isBusy()) {
+        return busyFailure();
+    }
+    FoundCred cred;
+    if (!DRNodeDB::GetCred(known.credId, cred.record)) {
+        return failureOf(ERR::kCredNotFound);
+    }
+    const bool changed = cred.record.conn != conn;
+    cred.record.conn = conn;
+    OvraDRNode::CredSessionSender sender(conn, cred.record.session);
+    Outcome tested = testCred(sender, cred);
+    if (!tested || options.dryRun) {
+        return tested ? wouldWork() : tested;
+    }
+    if (!DRNodeDB::SetConn(known.credId, conn)) {
+        return failure(ExitCode::kNotSetUp, "The new endpoint could not be stored.",
+                       "The credential is as it was. The system log says why; correct that and "
+                       "try again.");
+    }
+    OvraDRNode::CredPermissionCache(known.credId).Update();
+    OvraDRNode::NodeCache(known.nodeId, true).Update();
+    tested->data["endpoint_changed"] = changed;
+    tested->data["session"] = "unchanged";
+    return tested;
 }
 
 Outcome set(const SetOptions &options) {
+    const RemoteLogin &login = options.login;
+    const bool moves = login.account.empty();
+    const bool proof = login.password.fromStdin || !login.password.file.empty() ||
+                       !login.oneTimeCode.empty() || login.askOneTimeCode;
+    if (moves && (proof || options.url.empty())) {
+        return failure(
+            ExitCode::kUsage, "The account for the new log-in is missing.",
+            "Give --account, or --url alone to move the credential to another endpoint.");
+    }
     const Expected<FoundCred> cred = resolveCred(options.credId);
     if (!cred) {
         return Refusal(cred.error());
@@ -109,6 +185,9 @@ Outcome set(const SetOptions &options) {
         options.url.empty() ? Expected<Conn>(record.conn) : parseTarget(options.url);
     if (!conn) {
         return Refusal(conn.error());
+    }
+    if (moves) {
+        return move(options, record, *conn);
     }
     const Expected<Conn> direct = trustedEndpoint(*conn, options.fingerprint);
     if (!direct) {
@@ -165,16 +244,20 @@ Outcome remove(const DeleteOptions &options) {
 
 void addCredSetCommand(CLI::App &family, Command &chosen) {
     CLI::App *command = family.add_subcommand(
-        "set", "Log in anew for a credential, perhaps at another endpoint of the same node.");
+        "set", "Log in anew for a credential, or move it to another endpoint of the same node.");
     const auto options = std::make_shared<SetOptions>();
     command->add_option("CRED_ID", options->credId, "Its id, or the beginning of it")->required();
     command->add_option("--url", options->url, "The new endpoint; without it the present one");
-    addRemoteLoginOptions(*command, options->login)->required();
+    addRemoteLoginOptions(*command, options->login);
     addFingerprintOption(*command, options->fingerprint);
     command->add_flag("--dry-run", options->dryRun, "Only try whether it would work");
-    command->footer("Examples:\n"
-                    "  ovradr cred set 81c0 --account repl\n"
-                    "  ovradr cred set 81c0 --url https://192.0.2.21 --account repl --dry-run");
+    command->footer(
+        "Without --account the session stays. Nobody is asked for anything then if the new\n"
+        "endpoint shows the key of the present one.\n"
+        "Examples:\n"
+        "  ovradr cred set 81c0 --url https://192.0.2.21\n"
+        "  ovradr cred set 81c0 --account repl\n"
+        "  ovradr cred set 81c0 --url https://192.0.2.21 --account repl --dry-run");
     command->callback([&chosen, options] { chosen = [options] { return set(*options); }; });
 }
 

@@ -283,6 +283,52 @@ TEST_F(Life, ASessionWhoseRowCannotBeStoredIsNotedForRelease) {
     }
 }
 
+TEST_F(Life, ACredentialMovesWithItsSessionToAnEndpointOfItsNode) {
+    addCred("node_cred", "n1", "c2", "https", remote.port(), "old");
+    EXPECT_EQ(run(create(), "secret word\n").exit, 0) << "the key is known from here on";
+    const auto at = [this](const char *host) {
+        return std::string("https://") + host + ":" + std::to_string(remote.port());
+    };
+    const auto move = [](const std::string &url) {
+        return run({"cred", "set", "c1", "--url", url, "--json"});
+    };
+    const auto row = [] {
+        return querySql("SELECT addr, session FROM node_cred WHERE cred_id = 'c1'");
+    };
+    remote.answer("get", R"({"success":true,"data":{"account":"joe"}})");
+    const struct {
+        const char *call;
+        const char *answer;
+        int exit;
+    } refusals[] = {
+        {"info", R"({"success":true,"data":{"node_id":"n2","serial":"S"}})", 1},
+        {"info", kDead, 4},
+        {"old test_privilege", R"({"success":false,"error":{"code":105}})", 8},
+    };
+    for (const auto &each : refusals) {
+        remote.answer("info", R"({"success":true,"data":{"node_id":"n1","serial":"S1"}})");
+        remote.answer(each.call, std::string(each.answer));
+        EXPECT_EQ(move(at("localhost")).exit, each.exit) << each.answer;
+    }
+    EXPECT_EQ(run({"cred", "set", "c1"}).exit, 2);
+    EXPECT_EQ(run({"cred", "set", "c1", "--url", at("localhost"), "--password-stdin"}).exit, 2);
+    EXPECT_EQ(row(), "127.0.0.1|old\n");
+    remote.answer("old test_privilege", R"({"success":true})");
+    const Json::Value moved = move(at("localhost")).json()["data"];
+    EXPECT_EQ(moved["session"].asString() + moved["account"].asString(), "unchangedjoe");
+    EXPECT_TRUE(moved["endpoint_changed"].asBool());
+    EXPECT_EQ(row(), "localhost|old\n");
+    EXPECT_EQ(querySql("SELECT addr FROM node_cred WHERE cred_id = 'c2'"), "127.0.0.1\n");
+
+    remote.server.changeCertificate();
+    remote.server.closeConnections();
+    remote.forgetCalls();
+    EXPECT_EQ(move(at("[::ffff:127.0.0.1]")).exit, 6)
+        << "another key, and nobody who vouches for it";
+    EXPECT_EQ(remote.calls(), "");
+    EXPECT_EQ(row(), "localhost|old\n");
+}
+
 TEST_F(Life, WhatIsStillNeededIsNotReleased) {
     // The state left by a deletion killed before removing the row.
     PendingRelease note{"old", OvraDRNode::Conn::https("127.0.0.1", remote.port()), "n1", "c1"};
