@@ -2,6 +2,7 @@
 #include "ovradrnode/sender.h"
 
 #include "transport/conn_cache.h"
+#include "transport/request_scope.h"
 #include "words.h"
 
 #include <ovradrcore/json.h>
@@ -45,6 +46,9 @@ bool BaseSender::IsConnectable(const Conn &conn) {
         OVRA_NOTICE("Failed to check connectable of conn[%s]",
                     OvraDRCore::toString(conn.toJson()).c_str());
     }
+    if (probe.lacked) {
+        return false;
+    }
     const ConnCache cache(conn);
     cache.logChange(__func__, cache.getStoredVerdict(), probe.connectable);
     cache.UpdateWithData(probe.connectable, start, end);
@@ -52,6 +56,9 @@ bool BaseSender::IsConnectable(const Conn &conn) {
 }
 
 bool BaseSender::GetCachedConnectable(const Conn &conn) {
+    if (RequestScope::isUnreachable(conn)) {
+        return false;
+    }
     const ConnCache cache(conn);
     const Json::Value verdict = cache.Read();
     return !cache.IsValid(verdict) || verdict.asBool();
