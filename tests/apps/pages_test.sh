@@ -28,7 +28,7 @@ for page in README.md CONTRIBUTING.md SECURITY.md lab/README.md $(cd "$root" && 
 done
 registry 'no row for `OVRA.Core.User` 1 `get`' '/^| `OVRA.Core.User`/d'
 registry 'correct the right of `OVRA.Core.Farlink` 1 `get`' 's/| local | quick/| session | quick/'
-registry 'correct the queue of `OVRA.DR.Node.Credential` 1 `set`' '/1 `set`/s/slow/quick/'
+registry 'correct the queue of `OVRA.DR.Node.Credential` 1 `set`' '/1 `set`/s/outbound/quick/'
 registry 'describes `OVRA.DR.Node` 1 `infos`' 's/^| `OVRA.DR.Node` 1 `info` .*/&\n| `OVRA.DR.Node` 1 `infos` | session | quick | | |/'
 tree 'does not describe `ovradr attr list`' 's/`ovradr attr list [^`]*`//' CommandTree.IsDocumentedAsAWhole
 tree 'has an option --retry' '/^| `--retry`/d' CommandTree.IsDocumentedAsAWhole

@@ -27,6 +27,7 @@ public:
     void answer(const std::string &call, const std::string &document);
     /// Something other than a reply.
     void answer(const std::string &call, const Answer &answer);
+    void forgetAnswers();
     /// Runs before the calls of `method` are answered.
     void before(const std::string &method, std::function<void()> action);
     /// From now on connections are refused, and idle ones are cut.

@@ -162,6 +162,8 @@ TEST_F(Pairing, EachRefusalHasItsExitCode) {
                 "secret word\n");
         EXPECT_EQ(result.exit, each.exit) << each.answer << result.out;
         EXPECT_EQ(result.json()["error"]["code"], each.code) << each.answer;
+        EXPECT_EQ((result.out + result.err).find("secret word"), std::string::npos);
+        EXPECT_EQ((result.out + result.err).find("login-session"), std::string::npos);
     }
     EXPECT_EQ(credentials(), "");
 }
