@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "appliance.h"
 #include "call_dispatcher.h"
+#include "support/misbehaving_server.h"
 
 #include <ovraplatform/api_errors.h>
 #include <ovraplatform/appliance.h>
@@ -8,6 +9,7 @@
 #include <sys/resource.h>
 
 #include <condition_variable>
+#include <future>
 #include <list>
 #include <map>
 #include <mutex>
@@ -17,6 +19,7 @@
 namespace {
 
 using OvraTest::Appliance;
+using OvraTest::json;
 using OvraTest::RawConnection;
 using namespace std::chrono_literals;
 
@@ -105,6 +108,23 @@ TEST_F(Bounds, HoldWhenMoreConnectionsComeThanThereMayBe) {
         flood.emplace_back(port(i % 2 == 0));
     }
     expectQuickAnswer();
+}
+
+TEST_F(Bounds, OfAStoppingDaemonEndTheConnectionWithoutAnAnswer) {
+    addAccount("root", true);
+    OvraTest::MisbehavingServer silent;
+    silent.fallSilent();
+    Json::Value params;
+    params["conns"][0] = json(R"({"addr":"127.0.0.1","protocol":"http"})");
+    params["conns"][0]["port"] = silent.port();
+    auto waiting = std::async(std::launch::async, [&] {
+        return call("OVRA.DR.Node", 1, "test_connection", params, session("root"));
+    });
+    while (silent.connections() == 0) {
+        std::this_thread::sleep_for(5ms);
+    }
+    EXPECT_FALSE(daemon().stop());
+    EXPECT_EQ(waiting.get().status, 0);
 }
 
 /// A registry with one call that waits and one that does not.
