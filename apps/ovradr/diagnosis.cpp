@@ -146,9 +146,11 @@ private:
     Expected<std::string> key() {
         const auto met =
             OvraPlatform::peerFingerprint(conn_.protocol, conn_.addr, conn_.port, kKeySeconds);
-        if (met == tl::unexpected(CredError::kTrustUnavailable) ||
-            met == tl::unexpected(CredError::kOutOfMemory)) {
-            return endpointFailure(conn_, met.error());
+        for (const CredError told :
+             {CredError::kTrustUnavailable, CredError::kOutOfMemory, CredError::kTimedOut}) {
+            if (met == tl::unexpected(told)) {
+                return endpointFailure(conn_, told);
+            }
         }
         if (!met) {
             return failure(ExitCode::kNoAppliance,

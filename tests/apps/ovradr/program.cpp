@@ -37,6 +37,7 @@ constexpr int kCannotStart = 127;
         argv.push_back(const_cast<char *>(argument.c_str())); // NOLINT
     }
     argv.push_back(nullptr);
+    std::signal(SIGINT, SIG_DFL); // nohup ignores it, for whatever it starts
     execv(OVRADR_PROGRAM, argv.data());
     _exit(kCannotStart);
 }
