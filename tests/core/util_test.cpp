@@ -1,4 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
+#include "support/other_process.h"
+
 #include <ovradrcore/file_lock.h>
 #include <ovradrcore/util.h>
 
@@ -6,7 +8,6 @@
 #include <gtest/gtest.h>
 #include <sys/file.h>
 #include <sys/stat.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include <cerrno>
@@ -55,32 +56,28 @@ TEST(FileLock, IsOnePerNameForAllProcesses) {
     EXPECT_TRUE(exclusive.lock(LOCK_EX | LOCK_NB, 0));
 }
 
-TEST(FileLock, GivesUpAfterTheWaitAndGoesWithItsProcess) {
-    int ready[2];
-    ASSERT_EQ(pipe(ready), 0);
-    const pid_t child = fork();
-    if (child == 0) {
+TEST(FileLock, GivesUpAfterTheWaitAndGoesWithItsProcessButNotWithAChildOfThat) {
+    OvraTest::OtherProcess holder([] {
         FileLock held("b.lock");
-        const char ok = held.lock(LOCK_EX | LOCK_NB, 0) ? 'y' : 'n';
-        if (fork() == 0) { // has no part in the lock
+        const bool ok = held.lock(LOCK_EX | LOCK_NB, 10);
+        if (fork() == 0) { // it outlives its parent
             sleep(30);
             _exit(0);
         }
-        (void)!write(ready[1], &ok, 1);
-        pause();
-        _exit(0);
-    }
-    char ok = 0;
-    ASSERT_EQ(read(ready[0], &ok, 1), 1);
-    ASSERT_EQ(ok, 'y');
+        return ok ? pause() : 1;
+    });
     FileLock lock("b.lock");
+    while (lock.lock(LOCK_SH | LOCK_NB, 0)) {
+        lock.unlock();
+        usleep(1000);
+    }
     const auto start = std::chrono::steady_clock::now();
     EXPECT_FALSE(lock.lock(LOCK_SH | LOCK_NB, 1));
     const std::chrono::duration<double> waited = std::chrono::steady_clock::now() - start;
     EXPECT_GE(waited.count(), 1.0);
     EXPECT_LT(waited.count(), 5.0);
-    kill(child, SIGKILL);
-    waitpid(child, nullptr, 0);
+    usleep(100'000);
+    holder.end(SIGKILL);
     EXPECT_TRUE(lock.lock(LOCK_SH | LOCK_NB, 0));
 }
 

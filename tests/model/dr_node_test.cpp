@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "support/local_node.h"
 #include "support/log_capture.h"
+#include "support/other_process.h"
 #include "support/print_json.h"
 
 #include <ovradrcore/file_lock.h>
@@ -11,13 +12,13 @@
 #include <gtest/gtest.h>
 #include <sys/file.h>
 #include <sys/stat.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include <chrono>
 #include <filesystem>
 #include <fstream>
 #include <iterator>
+#include <list>
 #include <thread>
 
 using namespace OvraDRNode;
@@ -172,18 +173,12 @@ TEST(Identity, ALockThatStaysHeldMeansNoIdAndNeverAWrongOne) {
 }
 
 TEST(Identity, ProcessesThatStartTogetherEndUpWithOneId) {
-    std::vector<pid_t> children;
+    std::list<OvraTest::OtherProcess> processes;
     for (int i = 0; i < 12; ++i) {
-        const pid_t child = fork();
-        if (child == 0) {
-            _exit(DRNode::getLocalNodeId().size() == 36 ? 0 : 1);
-        }
-        children.push_back(child);
+        processes.emplace_back([] { return DRNode::getLocalNodeId().size() == 36 ? 0 : 1; });
     }
-    for (const pid_t child : children) {
-        int status = 1;
-        waitpid(child, &status, 0);
-        EXPECT_EQ(status, 0);
+    for (OvraTest::OtherProcess &each : processes) {
+        EXPECT_EQ(each.wait(), 0);
     }
     const std::string id = DRNode::getLocalNodeId();
     EXPECT_EQ(identityFile(), "node_id=\"" + id + "\"\n") << "one line, whoever came last";

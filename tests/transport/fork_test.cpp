@@ -1,21 +1,20 @@
 // SPDX-License-Identifier: Apache-2.0
-#include "platform/own_files.h"
 #include "support/local_node.h"
 #include "support/misbehaving_server.h"
+#include "support/other_process.h"
 
 #include <ovracore/ovracore.h>
 #include <ovradrcore/cache.h>
-#include <ovradrcore/file_lock.h>
 #include <ovradrcore/log.h>
 #include <ovradrnode/node_db.h>
 #include <ovradrnode/sender.h>
 #include <ovraplatform/session_store.h>
 
-#include <sys/file.h>
+#include <gtest/gtest.h>
 #include <sys/mman.h>
 
 #include <atomic>
-#include <chrono>
+#include <iterator>
 #include <thread>
 #include <vector>
 
@@ -72,76 +71,47 @@ const struct {
     {"program", [] { return OLIBCPclose(OLIBCPopen("/bin/true", "r", nullptr)) == 0; }},
 };
 
-/// A process with its own fate; what it shares with this one is where it stands.
-struct Child {
-    std::atomic<int> *step;
-    pid_t pid;
-
-    template <typename Work>
-    explicit Child(Work work)
-        : step(new (mmap(nullptr, sizeof(*step), PROT_READ | PROT_WRITE, MAP_SHARED | MAP_ANONYMOUS,
-                         -1, 0)) std::atomic<int>(-1))
-        , pid(fork()) {
-        if (pid == 0) {
-            _exit(work(*step));
-        }
-    }
-    Child(const Child &) = delete;
-    Child &operator=(const Child &) = delete;
-    ~Child() {
-        kill(pid, SIGKILL);
-        waitpid(pid, nullptr, 0);
-        munmap(step, sizeof(*step));
-    }
-    /// Its exit status; -1 if it does not end.
-    int status() const {
-        int found = 0;
-        const auto end = std::chrono::steady_clock::now() + 30s;
-        while (waitpid(pid, &found, WNOHANG) == 0) {
-            if (std::chrono::steady_clock::now() > end) {
-                return -1;
-            }
-            std::this_thread::sleep_for(1ms);
-        }
-        return found;
-    }
-};
+/// Memory that child processes share with this one.
+std::atomic<int> &shared() {
+    static auto *const number = new (mmap(nullptr, sizeof(std::atomic<int>), PROT_READ | PROT_WRITE,
+                                          MAP_SHARED | MAP_ANONYMOUS, -1, 0)) std::atomic<int>(0);
+    return *number;
+}
 
 } // namespace
 
 TEST(Fork, AChildOfAProcessWithThreadsAtWorkDoesWhatItsParentCan) {
     provisionNode();
-    const Child remote([](std::atomic<int> &shared) {
-        MisbehavingServer server({.tls = true});
-        shared = server.port();
-        pause();
-        return 0;
+    std::atomic<int> &step = shared();
+    const OtherProcess remote([&step] {
+        const MisbehavingServer server({.tls = true});
+        step = server.port();
+        return pause();
     });
-    while ((port = *remote.step) < 0) {
+    while ((port = step) == 0) {
         std::this_thread::sleep_for(1ms);
     }
     addCred("node_cred", "n1", "c1", "https", port, "s1");
     addCred("node_cred", "n2", "c2", "https", port, "s2");
     std::atomic<bool> stop{false};
     std::vector<std::thread> threads;
-    for (const auto &step : kSteps) {
+    for (const auto &each : kSteps) {
         threads.emplace_back([&] {
             while (!stop) {
-                EXPECT_TRUE(step.run()) << step.name;
+                EXPECT_TRUE(each.run()) << each.name;
             }
         });
     }
     for (int round = 0; round < 40 && !HasFailure(); ++round) {
-        const Child child([](std::atomic<int> &where) {
-            for (const auto &step : kSteps) {
-                ++where;
-                if (!step.run()) {
-                    return 1;
-                }
+        step = 0;
+        OtherProcess child([&step] {
+            while (step < std::ssize(kSteps) && kSteps[step].run()) {
+                ++step;
             }
-            return 0;
+            return step < std::ssize(kSteps) ? 1 : 0;
         });
-        EXPECT_EQ(child.status(), 0) << "in round " << round << ": " << kSteps[*child.step].name;
+        EXPECT_EQ(child.wait(), 0)
+            << "in round " << round << ": " << kSteps[step % std::ssize(kSteps)].name;
     }
     stop = true;
     for (std::thread &thread : threads) {
