@@ -128,14 +128,15 @@ private:
             return withExit(direct.error(), ExitCode::kNameUnknown);
         }
         conn_ = *direct;
-        const Expected<std::vector<HostAddress>> found = resolveHost(conn_.addr, conn_.port);
+        const auto found = resolveHost(conn_.addr, conn_.port);
         if (!found) {
             return Refusal(found.error());
         }
         addresses_ = *found;
         std::string text = subject_.conn.isFarlink() ? targetText(conn_) + ": " : "";
-        for (const HostAddress &address : addresses_) {
-            text += (&address == addresses_.data() ? "" : ", ") + address.text;
+        for (const OvraBase::SocketAddress &address : addresses_) {
+            text +=
+                (&address == addresses_.data() ? "" : ", ") + OvraBase::addressText(address.get());
         }
         return text;
     }
@@ -281,7 +282,7 @@ private:
     const DiagnosisSubject &subject_;
     Diagnosis &diagnosis_;
     Conn conn_; ///< the direct endpoint
-    std::vector<HostAddress> addresses_;
+    std::vector<OvraBase::SocketAddress> addresses_;
     bool trusted_ = false;
     std::unique_ptr<BaseSender> sender_;
     Response info_;

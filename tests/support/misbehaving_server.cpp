@@ -58,7 +58,10 @@ sockaddr_in loopback(const std::string &address) {
 
 int listenOn(const std::string &address, int &port) {
     const int fd = socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0);
+    const int on = 1;
+    setsockopt(fd, SOL_SOCKET, SO_REUSEADDR, &on, sizeof on);
     sockaddr_in bound = loopback(address);
+    bound.sin_port = htons(static_cast<std::uint16_t>(port));
     socklen_t size = sizeof(bound);
     auto *generic = reinterpret_cast<sockaddr *>(&bound);
     if (fd < 0 || bind(fd, generic, size) != 0 || listen(fd, 64) != 0 ||
@@ -190,6 +193,10 @@ Answer Answer::closed() {
     return {"", {}, Ending::kClose};
 }
 
+Answer Answer::reset() {
+    return {"", {}, Ending::kReset};
+}
+
 Answer Answer::truncated(const std::string &document) {
     Answer whole = json(document);
     whole.bytes.resize(whole.bytes.size() - document.size() / 2);
@@ -225,6 +232,7 @@ struct MisbehavingServer::Impl {
         if (options.tls) {
             newCertificate();
         }
+        port = options.port;
         listener = listenOn(options.address, port);
         acceptor = std::thread([this] { acceptAll(); });
     }
@@ -312,6 +320,11 @@ struct MisbehavingServer::Impl {
             const Answer answer = answerTo(*request);
             if (!sendAnswer(stream, answer) || answer.ending == Answer::Ending::kClose) {
                 stream.end();
+                return;
+            }
+            if (answer.ending == Answer::Ending::kReset) {
+                const linger reset{1, 0};
+                setsockopt(fd, SOL_SOCKET, SO_LINGER, &reset, sizeof reset);
                 return;
             }
             if (answer.ending == Answer::Ending::kHang) {
@@ -437,21 +450,6 @@ void MisbehavingServer::fallSilent() {
 
 void MisbehavingServer::closeConnections() {
     impl_->closeAll();
-}
-
-bool MisbehavingServer::vanish() {
-    const std::lock_guard<std::mutex> lock(impl_->mutex);
-    for (const int fd : impl_->open) {
-        // A socket in repair mode is closed without sending a segment.
-        const int on = 1;
-        sockaddr none{};
-        none.sa_family = AF_UNSPEC;
-        if (setsockopt(fd, IPPROTO_TCP, TCP_REPAIR, &on, sizeof(on)) != 0 ||
-            connect(fd, &none, sizeof(none)) != 0) {
-            return false;
-        }
-    }
-    return true;
 }
 
 void MisbehavingServer::refuse() {

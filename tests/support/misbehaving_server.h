@@ -11,7 +11,7 @@ namespace OvraTest {
 
 /// The server's reaction to a request: bytes, their pace, and what follows.
 struct Answer {
-    enum class Ending { kKeep, kClose, kHang };
+    enum class Ending { kKeep, kClose, kReset, kHang };
 
     std::string bytes;
     std::chrono::milliseconds pausePerByte{0};
@@ -32,6 +32,8 @@ struct Answer {
     static Answer silence();
     /// Closes without sending a byte.
     static Answer closed();
+    /// Resets the connection without sending a byte.
+    static Answer reset();
     /// Announces `document` and closes in the middle.
     static Answer truncated(const std::string &document);
     /// A body of that many bytes.
@@ -65,6 +67,7 @@ public:
     struct Options {
         bool tls = false;
         std::string address = "127.0.0.1";
+        int port = 0; ///< 0: a free one
     };
     using Responder = std::function<Answer(const Received &)>;
 
@@ -90,9 +93,6 @@ public:
     void fallSilent();
     /// Closes every open connection.
     void closeConnections();
-    /// Drops every open connection without notifying the peer, as after a power failure.
-    /// \return false if this process lacks CAP_NET_ADMIN.
-    bool vanish();
     /// Closes the port: connections are refused.
     void refuse();
 
