@@ -3,8 +3,10 @@
 
 // Senders over one endpoint and one credential.
 
+#include "library_errors.h"
 #include "ovradrnode/sender.h"
 #include "transport/conn_cache.h"
+#include "transport/request_scope.h"
 
 #include <ovracredential/cred_request.h>
 #include <ovradrcore/json.h>
@@ -20,12 +22,6 @@ using OvraDRCore::Request;
 using OvraDRCore::Response;
 
 namespace {
-
-/// Error numbers of the credential library that have their own code.
-constexpr int kLibraryNoPermission = 4;
-constexpr int kLibraryCannotConnect = 5;
-constexpr int kLibraryCertificate = 6;
-constexpr int kLibraryTimedOut = 10;
 
 constexpr int kSealParameters = 2;
 constexpr int kSend = 0;
@@ -135,20 +131,24 @@ void BaseCredSender::SetCredRequestError(OVRA::CredRequest &request) const {
     }
     OVRA_NOTICE("cred error [%d]", error);
     switch (error) {
-    case kLibraryNoPermission:
+    case LibraryError::kNoPermission:
         SetErr(ERR::kNoPrivilege);
         return;
-    case kLibraryCertificate:
+    case LibraryError::kCertificate:
         SetErr(ERR::kCertificateChanged);
         return;
-    case kLibraryCannotConnect:
-    case kLibraryTimedOut: {
+    case LibraryError::kCannotConnect:
+    case LibraryError::kTimedOut: {
         SetErr(ERR::kNotConnectable);
+        RequestScope::noteUnreachable(conn);
         const ConnCache cache(conn);
         cache.logChange(__func__, cache.getStoredVerdict(), false);
         cache.UpdateWithData(false);
         return;
     }
+    case LibraryError::kUnanswered:
+        RequestScope::noteUnreachable(conn);
+        [[fallthrough]];
     default:
         SetErr(ERR::kCredLibrary, error);
     }
