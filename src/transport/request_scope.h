@@ -9,8 +9,8 @@ namespace OvraDRNode {
 
 /// One whole request of this thread, with all the attempts and refreshes that it takes: an endpoint
 /// that was found unreachable in it is not asked again, so that the credentials of a node, however
-/// many there are, cost one time-out an endpoint and not one each; and it waits once for refreshes
-/// of others. A scope within another one is part of it.
+/// many there are, cost one time-out an endpoint and not one each. It bounds the waits for other
+/// processes as well. A scope within another one is part of it.
 class RequestScope {
 public:
     RequestScope();
@@ -23,7 +23,7 @@ public:
     static bool isUnreachable(const Conn &conn);
 
 private:
-    OvraDRCore::CacheWaitScope wait_;
+    OvraDRCore::CacheWaitScope waits_;
     bool outermost_;
 };
 

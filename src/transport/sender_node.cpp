@@ -85,6 +85,7 @@ bool NodeSender::setNode(const DRNode &node) {
 }
 
 Response NodeSender::process(const Request &request) {
+    const RequestScope scope;
     SetErr(ERR::kNone);
     Response response;
     if (!request.isValid()) {
@@ -95,7 +96,6 @@ Response NodeSender::process(const Request &request) {
     if (!nodeId.empty() && nodeId == DRNode::getLocalNodeId()) {
         return run(request);
     }
-    const RequestScope scope;
     const std::string remembered = getCachedCredId();
     if (processByCredId(remembered, request, response)) {
         return response;
@@ -192,7 +192,7 @@ std::string NodeSender::getCachedCredId() const {
 }
 
 bool NodeSender::isConnectable() const {
-    const RequestScope scope;
+    const OvraDRCore::CacheWaitScope waits;
     const std::string id = getValidCredId();
     if (!id.empty()) {
         return BaseSender::IsConnectable(CredNodeSender(id).getNode().conn);
@@ -201,6 +201,7 @@ bool NodeSender::isConnectable() const {
     if (!DRNodeDB::ListCred(nodeId, nodes, DRNodeDB::CRED_TYPE_NODE)) {
         return false;
     }
+    const RequestScope scope;
     for (const DRNode &node : nodes) {
         if (!RequestScope::isUnreachable(node.conn) && BaseSender::IsConnectable(node.conn)) {
             return true;
@@ -282,7 +283,7 @@ Response CredNodeSender::process(const Request &request) {
 }
 
 bool CredNodeSender::testPrivilege() {
-    const RequestScope scope;
+    const OvraDRCore::CacheWaitScope scope;
     SetErr(ERR::kFailed);
     if (!node.isValid()) {
         SetErr(ERR::kCredInvalid);

@@ -3,6 +3,7 @@
 
 #include <ovradrcore/cache.h>
 #include <ovradrcore/log.h>
+#include <ovradrcore/no_fork.h>
 
 #include <algorithm>
 #include <cerrno>
@@ -33,6 +34,12 @@ public:
     bool IsValid(const Json::Value &value) const override { return value.isString(); }
 };
 
+OvraBase::Expected<std::vector<OvraBase::SocketAddress>> resolve(const Endpoint &endpoint,
+                                                                 OvraBase::Deadline deadline) {
+    const OvraDRCore::NoFork::Pause forksPass;
+    return OvraBase::resolveHost(endpoint.host(), endpoint.port(), deadline);
+}
+
 CredError errorOf(const OvraBase::Error &error) {
     if (OvraBase::isShortage(error.number)) {
         return CredError::kOutOfMemory;
@@ -47,7 +54,7 @@ CredExpected<OvraBase::UniqueFd> dial(const Endpoint &endpoint, OvraBase::Deadli
     const AddressCache cache(endpoint);
     std::string last;
     bool several = false;
-    return OvraBase::resolveHost(endpoint.host(), endpoint.port(), deadline)
+    return resolve(endpoint, deadline)
         .and_then([&](std::vector<SocketAddress> addresses) {
             several = addresses.size() > 1;
             if (several) {
@@ -58,6 +65,7 @@ CredExpected<OvraBase::UniqueFd> dial(const Endpoint &endpoint, OvraBase::Deadli
                                           return OvraBase::addressText(each.get()) == last;
                                       });
             }
+            const OvraDRCore::NoFork::Pause forksPass;
             return OvraBase::connectFirst(std::move(addresses), deadline);
         })
         .map([&](OvraBase::Connection connection) {
