@@ -1,8 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
-#include "support/print_json.h"
-
 #include <ovraplatform/appliance.h>
 
 #include <gtest/gtest.h>

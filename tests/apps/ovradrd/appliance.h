@@ -2,7 +2,6 @@
 #pragma once
 
 #include "daemon.h"
-#include "support/print_json.h"
 
 #include <gtest/gtest.h>
 #include <json/json.h>
