@@ -1,6 +1,4 @@
 // SPDX-License-Identifier: Apache-2.0
-#include "support/print_json.h"
-
 #include <ovradrcore/json.h>
 #include <ovradrcore/util.h>
 

@@ -33,10 +33,10 @@ TEST(Log, ForeignTextCannotForgeALine) {
 }
 
 TEST(Log, HugeMessageIsCutAtACharacterAndSaysSo) {
-    for (const char *unit : {"a", "\n", "\x80", "\xbf", "\u00e4", "\U0001f600"}) {
-        std::string text;
-        for (int i = 0; i < 100000; ++i) {
-            text += unit;
+    for (const std::string unit : {"a", "\n", "\x80", "\xbf", "\u00e4", "\U0001f600"}) {
+        std::string text = unit;
+        while (text.size() < 1000000) {
+            text += text;
         }
         LogCapture log;
         OVRA_ERR("%s", text.c_str());
@@ -50,41 +50,23 @@ TEST(Log, HugeMessageIsCutAtACharacterAndSaysSo) {
 }
 
 TEST(ErrRecorder, NamesEveryCode) {
-    // In the order of their numbers.
-    const std::pair<int, const char *> texts[] = {
-        {0, "no error"},
-        {401, "bad parameter"},
-        {402, "out of memory"},
-        {403, "no sender"},
-        {404, "credential not found"},
-        {407, "failed"},
-        {500, "endpoint not connectable"},
-        {501, "login failed"},
-        {502, "account disabled"},
-        {503, "login not permitted"},
-        {504, "one-time code required"},
-        {505, "one-time code wrong"},
-        {506, "credential item refused"},
-        {507, "unknown node"},
-        {509, "credential not completed"},
-        {511, "session not created"},
-        {512, "session not removed"},
-        {516, "credential record invalid"},
-        {518, "belongs to another node"},
-        {519, "node information not obtained"},
-        {520, "credential check failed"},
-        {522, "endpoint chosen by the remote node invalid"},
-        {523, "login call failed"},
-        {524, "credential library error"},
-        {525, "no privilege"},
-        {526, "certificate not the trusted one"},
-        {527, "no such user"},
-        {528, "user of the session unknown"},
-        {400, "unknown error"},
-        {-1, "unknown error"}};
-    for (const auto &[code, text] : texts) {
-        EXPECT_EQ(ERR::ToString(code), text) << code;
+    std::string names;
+    for (int code = -1; code < 1000; ++code) {
+        const std::string name = ERR::ToString(code);
+        names += name == "unknown error" ? "" : std::to_string(code) + " " + name + "; ";
     }
+    EXPECT_EQ(
+        names,
+        "0 no error; 401 bad parameter; 402 out of memory; 403 no sender; 404 credential not "
+        "found; "
+        "407 failed; 500 endpoint not connectable; 501 login failed; 502 account disabled; "
+        "503 login not permitted; 504 one-time code required; 505 one-time code wrong; "
+        "506 credential item refused; 507 unknown node; 509 credential not completed; "
+        "511 session not created; 512 session not removed; 516 credential record invalid; "
+        "518 belongs to another node; 519 node information not obtained; "
+        "520 credential check failed; 522 endpoint chosen by the remote node invalid; "
+        "523 login call failed; 524 credential library error; 525 no privilege; "
+        "526 certificate not the trusted one; 527 no such user; 528 user of the session unknown; ");
 }
 
 TEST(ErrRecorder, RendersCodeAndMessage) {

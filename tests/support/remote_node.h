@@ -2,7 +2,6 @@
 #pragma once
 
 #include "support/misbehaving_server.h"
-#include "support/print_json.h"
 #include "support/sealing_daemon.h"
 
 #include <functional>

@@ -1,6 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "relay_api.h"
-#include "support/print_json.h"
 
 #include <ovradrcore/json.h>
 #include <ovraplatform/farlink_key.h>

@@ -1,8 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
-#include "support/print_json.h"
-
 #include <json/value.h>
 #include <sys/types.h>
 

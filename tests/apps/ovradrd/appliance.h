@@ -2,7 +2,6 @@
 #pragma once
 
 #include "daemon.h"
-#include "support/print_json.h"
 
 #include <ovrabase/unique_fd.h>
 

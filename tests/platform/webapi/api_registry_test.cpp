@@ -1,6 +1,4 @@
 // SPDX-License-Identifier: Apache-2.0
-#include "support/print_json.h"
-
 #include <ovraplatform/api_errors.h>
 #include <ovraplatform/api_registry.h>
 #include <ovrawebapi/api_runner.h>
