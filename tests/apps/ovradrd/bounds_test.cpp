@@ -218,24 +218,4 @@ TEST_F(FullQueues, RefuseAtOnceAndDoNotHoldUpTheLowerOnes) {
     queues.reset();
 }
 
-TEST_F(FullQueues, LetLocalCallersGoWhenTheDaemonStops) {
-    OvraPlatform::LocalCall call;
-    call.api = "Test";
-    call.version = 1;
-    call.method = "outbound";
-    call.user = "admin";
-    std::thread stopper([this] {
-        std::this_thread::sleep_for(200ms);
-        dispatcher->leaveLocal();
-    });
-    EXPECT_EQ(dispatcher->serveLocal(call)["error"]["code"], 107);
-    stopper.join();
-    {
-        const std::lock_guard lock(mutex);
-        open = true;
-    }
-    changed.notify_all();
-    queues.reset();
-}
-
 } // namespace

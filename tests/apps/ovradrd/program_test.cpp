@@ -137,16 +137,6 @@ TEST_F(TheProgram, DoesNotStartWithWhatItCannotUse) {
     says("not a key and its certificate");
 }
 
-TEST_F(TheProgram, SaysThatAPortIsInUse) {
-    Appliance::provision();
-    configure();
-    Program first;
-    ASSERT_EQ(first.line(), ready());
-    Program second;
-    EXPECT_NE(second.line().find("in use"), std::string::npos);
-    EXPECT_EQ(second.wait(), 3);
-}
-
 TEST_F(TheProgram, SaysSoWhenItsThreadsCannotAllBeStarted) {
 #if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
     GTEST_SKIP() << "a sanitizer needs more memory than any limit would leave";
@@ -192,32 +182,22 @@ TEST_F(TheProgram, KnowsItsArguments) {
     EXPECT_EQ(Program("--unknown").wait(), 2);
 }
 
-TEST_F(TheProgram, ServesUntilItIsToldToEnd) {
+TEST_F(TheProgram, ServesUntilItIsToldToEndAndAgainAfterItWasKilled) {
     Appliance::provision();
     configure();
-    for (const int signal : {SIGTERM, SIGINT}) {
+    for (const int signal : {SIGKILL, SIGTERM, SIGINT}) {
         Program program;
         ASSERT_EQ(program.line(), ready());
+        Program second;
+        EXPECT_NE(second.line().find("in use"), std::string::npos);
+        EXPECT_EQ(second.wait(), 3);
         EXPECT_EQ(ask("OVRA.DR.Node", "info")["success"], true);
         EXPECT_EQ(ask("OVRA.Core.Farlink", "get")["data"]["enabled"], false);
         program.signal(signal);
-        EXPECT_EQ(program.wait(), 0);
-        EXPECT_FALSE(std::filesystem::exists(OvraPlatform::kSocketFile));
+        EXPECT_EQ(program.wait(), signal == SIGKILL ? -1 : 0);
+        EXPECT_EQ(std::filesystem::exists(OvraPlatform::kSocketFile), signal == SIGKILL);
     }
     EXPECT_EQ(ask("OVRA.DR.Node", "info")["error"]["code"], 100);
-}
-
-TEST_F(TheProgram, StartsAgainAfterItWasKilled) {
-    Appliance::provision();
-    configure();
-    {
-        Program program;
-        ASSERT_EQ(program.line(), ready());
-    }
-    EXPECT_TRUE(std::filesystem::exists(OvraPlatform::kSocketFile));
-    Program program;
-    EXPECT_EQ(program.line(), ready());
-    EXPECT_EQ(ask("OVRA.DR.Node", "info")["success"], true);
 }
 
 TEST_F(TheProgram, EndsInTimeWhileACallWaitsForAnotherAppliance) {
