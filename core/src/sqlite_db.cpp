@@ -1,8 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "ovradrcore/sqlite_db.h"
 
-#include "ovradrcore/log.h"
-
 #include <ovrabase/sqlite.h>
 
 #include <sqlite3.h>
@@ -49,19 +47,18 @@ bool isBlank(const char *tail, const char *end) {
 } // namespace
 
 void SqliteDB::Close::operator()(sqlite3 *db) const {
+    const NoFork noFork;
     OvraBase::CloseSqlite()(db);
 }
 
 SqliteDB::SqliteDB(const std::string &path, unsigned int busyTime, const std::string &infoTable)
-    : path_(path)
-    , infoTable_(infoTable) {
-    constexpr unsigned int kMilliseconds = 1000;
-    const unsigned int limit = INT_MAX / kMilliseconds;
+    : infoTable_(infoTable) {
+    const NoFork noFork;
     OvraBase::SqliteHandle database;
     // The first statement reports a failure to open.
-    OvraBase::openSqlite(path, static_cast<int>(std::min(busyTime, limit) * kMilliseconds),
-                         database);
+    OvraBase::openSqlite(path, 0, database);
     db_.reset(database.release());
+    wait_ = std::make_unique<SqliteWait>(db_.get(), std::chrono::seconds(busyTime));
 }
 
 SqliteDB::SqliteDB(SqliteDB &&) noexcept = default;
@@ -70,7 +67,6 @@ SqliteDB::~SqliteDB() = default;
 
 bool SqliteDB::fail(const std::string &what) const {
     SetErr(ERR::kFailed, what);
-    OVRA_WARN("Failed to use database [%s]: %s", path_.c_str(), what.c_str());
     return false;
 }
 
@@ -85,6 +81,7 @@ bool SqliteDB::run(const std::string &sql, std::vector<SqliteValueList> *rows, b
     if (sql.size() > INT_MAX) {
         return fail("the statement is too large");
     }
+    const NoFork noFork;
     const char *tail = nullptr;
     const OvraBase::SqliteStatement statement = OvraBase::prepareSqlite(db_.get(), sql, &tail);
     if (!statement && sqlite3_errcode(db_.get()) != SQLITE_OK) {
@@ -145,7 +142,10 @@ int SqliteDB::GetSchemaVersion() {
     select.SetTable(SqliteTableHandler(infoTable_, ""));
     SqliteValueList row;
     int version = -1;
-    return SelectRecord(select, row) && row.GetValue("version", version) ? version : -1;
+    if (SelectRecord(select, row) && !row.GetValue("version", version)) {
+        fail("it holds no schema version");
+    }
+    return version;
 }
 
 } // namespace OvraDRCore

@@ -2,6 +2,7 @@
 #include "ovradrnode/sender.h"
 
 #include "transport/conn_cache.h"
+#include "transport/request_scope.h"
 #include "words.h"
 
 #include <ovradrcore/json.h>
@@ -48,6 +49,9 @@ bool BaseSender::IsConnectable(const Conn &conn) {
         OVRA_NOTICE("Failed to check connectable of conn[%s]",
                     OvraDRCore::toString(conn.toJson()).c_str());
     }
+    if (probe.lacked) {
+        return false;
+    }
     const ConnCache cache(conn);
     cache.logChange(__func__, cache.getStoredVerdict(), probe.connectable);
     const double age = cache.GetCachedAge();
@@ -58,6 +62,9 @@ bool BaseSender::IsConnectable(const Conn &conn) {
 }
 
 bool BaseSender::GetCachedConnectable(const Conn &conn) {
+    if (RequestScope::isUnreachable(conn)) {
+        return false;
+    }
     const ConnCache cache(conn);
     const Json::Value verdict = cache.Read();
     return !cache.IsValid(verdict) || verdict.asBool();

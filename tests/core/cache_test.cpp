@@ -2,7 +2,6 @@
 #include "cache_bucket.h"
 #include "clock.h"
 #include "support/log_capture.h"
-#include "support/print_json.h"
 
 #include <ovradrcore/cache.h>
 #include <ovradrcore/json.h>

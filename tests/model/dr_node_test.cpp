@@ -1,7 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "support/local_node.h"
 #include "support/log_capture.h"
-#include "support/print_json.h"
+#include "support/other_process.h"
 
 #include <ovradrcore/file_lock.h>
 #include <ovradrcore/json.h>
@@ -11,12 +11,15 @@
 #include <gtest/gtest.h>
 #include <sys/file.h>
 #include <sys/stat.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
+#include <chrono>
 #include <filesystem>
 #include <fstream>
+#include <functional>
 #include <iterator>
+#include <list>
+#include <thread>
 
 using namespace OvraDRNode;
 
@@ -42,15 +45,14 @@ void writeIdentity(const std::string &text) {
 
 TEST(DRNode, IsValidWithBothIdsAnEndpointAndASession) {
     EXPECT_TRUE(example().isValid());
-    DRNode node = example();
-    node.session.clear();
-    EXPECT_FALSE(node.isValid());
-    node = example();
-    node.conn.port = -1;
-    EXPECT_FALSE(node.isValid());
-    node = example();
-    node.credId.clear();
-    EXPECT_FALSE(node.isValid());
+    const std::function<void(DRNode &)> lacking[] = {
+        [](DRNode &node) { node.session.clear(); }, [](DRNode &node) { node.conn.port = -1; },
+        [](DRNode &node) { node.credId.clear(); }, [](DRNode &node) { node.nodeId.clear(); }};
+    for (const auto &lack : lacking) {
+        DRNode node = example();
+        lack(node);
+        EXPECT_FALSE(node.isValid()) << node.toJson();
+    }
     EXPECT_FALSE(DRNode("x", "x").isValid()) << "equal ids that are not the local one";
     EXPECT_TRUE(DRNode::getLocalNode().isValid()) << "needs no endpoint and no session";
 }
@@ -103,8 +105,9 @@ TEST(DRNodeAttr, NeedsNodeAppAndNameButNoValue) {
               R"({"app":"","attr":"","node_id":"","value":""})");
 }
 
-TEST(Identity, IsMadeOnceAndKept) {
+TEST(Identity, IsMadeOnceAndKeptUntilAResetOfWhichThisProcessHearsNothing) {
     LogCapture log;
+    EXPECT_TRUE(DRNode::resetLocalNodeId()) << "nothing to reset";
     const std::string id = DRNode::getLocalNodeId();
     EXPECT_EQ(id.size(), 36U);
     EXPECT_EQ(identityFile(), "node_id=\"" + id + "\"\n");
@@ -115,13 +118,6 @@ TEST(Identity, IsMadeOnceAndKept) {
     struct stat status {};
     stat("/usr/ovra/etc/ovradr", &status);
     EXPECT_EQ(status.st_mode & 07777U, 0755U);
-}
-
-TEST(Identity, AResetMakesANewOneButThisProcessKeepsWhatItKnew) {
-    EXPECT_TRUE(DRNode::resetLocalNodeId()) << "nothing to reset";
-    const std::string id = DRNode::getLocalNodeId();
-    EXPECT_TRUE(DRNode::isLocalNodeId(id));
-    LogCapture log;
     EXPECT_TRUE(DRNode::resetLocalNodeId());
     EXPECT_EQ(log.count("WARN", "dr_node", "resetLocalNodeId", "Reset local nodeId: [success]"), 1);
     EXPECT_NE(DRNode::getLocalNodeId(), id);
@@ -149,7 +145,7 @@ TEST(Identity, AFileWithoutAUsableIdIsMended) {
     EXPECT_EQ(DRNode::getLocalNodeId(), DRNode::getLocalNodeId());
 }
 
-TEST(Identity, ALockThatStaysHeldMeansNoIdNotAWrongOne) {
+TEST(Identity, ALockThatStaysHeldMeansNoIdAndNeverAWrongOne) {
     const std::string id = DRNode::getLocalNodeId();
     OvraDRCore::FileLock held("drnode.info.lock");
     ASSERT_TRUE(held.lock(LOCK_EX | LOCK_NB, 0));
@@ -159,23 +155,23 @@ TEST(Identity, ALockThatStaysHeldMeansNoIdNotAWrongOne) {
         log.count("ERR", "dr_node", "ReadNodeIdFromConf", "Failed to lock [drnode.info.lock]"), 1);
     EXPECT_EQ(log.count("ERR", "dr_node", "CreateNodeId", "Failed to lock [drnode.info.lock]"), 1);
     EXPECT_EQ(log.count("ERR", "dr_node", "getLocalNodeId", "Failed to create nodeId"), 1);
-    held.unlock();
+    std::thread late([&held] {
+        std::this_thread::sleep_for(
+            std::chrono::milliseconds(6500)); // the reader gives up after 5 s
+        held.unlock();
+    });
     EXPECT_EQ(DRNode::getLocalNodeId(), id);
+    late.join();
+    EXPECT_EQ(identityFile(), "node_id=\"" + id + "\"\n");
 }
 
 TEST(Identity, ProcessesThatStartTogetherEndUpWithOneId) {
-    std::vector<pid_t> children;
+    std::list<OvraTest::OtherProcess> processes;
     for (int i = 0; i < 12; ++i) {
-        const pid_t child = fork();
-        if (child == 0) {
-            _exit(DRNode::getLocalNodeId().size() == 36 ? 0 : 1);
-        }
-        children.push_back(child);
+        processes.emplace_back([] { return DRNode::getLocalNodeId().size() == 36 ? 0 : 1; });
     }
-    for (const pid_t child : children) {
-        int status = 1;
-        waitpid(child, &status, 0);
-        EXPECT_EQ(status, 0);
+    for (OvraTest::OtherProcess &each : processes) {
+        EXPECT_EQ(each.wait(), 0);
     }
     const std::string id = DRNode::getLocalNodeId();
     EXPECT_EQ(identityFile(), "node_id=\"" + id + "\"\n") << "one line, whoever came last";
