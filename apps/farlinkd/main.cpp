@@ -12,6 +12,7 @@
 #include "service/tls_identity.h"
 #include "tunnel_server.h"
 
+#include <ovrabase/file.h>
 #include <ovrabase/number.h>
 #include <ovracore/ovracore.h>
 #include <ovradrcore/log.h>
@@ -200,10 +201,11 @@ int run(int argc, char **argv) {
 } // namespace Farlinkd
 
 int main(int argc, char **argv) {
+    OvraBase::fillStandardDescriptors();
     openlog("farlinkd", LOG_NDELAY, LOG_DAEMON);
     try {
         return Farlinkd::run(argc, argv);
     } catch (const std::exception &error) {
-        return Farlinkd::fail({OvraService::ExitCode::kFailed, error.what()});
+        return OvraService::reportStartError("farlinkd", error);
     }
 }

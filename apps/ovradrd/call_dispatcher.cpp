@@ -106,7 +106,9 @@ void CallDispatcher::serve(OvraService::HttpRequest request,
     });
     if (!taken) {
         OvraBase::wipe(held->body);
-        answer(OvraDRCore::toString(busy()));
+        Call call;
+        call.answer = answer;
+        refuse(call);
     }
 }
 
@@ -191,7 +193,7 @@ void CallDispatcher::route(Call call) {
     }
     const auto held = std::make_shared<Call>(std::move(call));
     if (!queues_.of(queue).submit([this, held] { run(*held); })) {
-        held->reply(busy());
+        refuse(*held);
     }
 }
 
@@ -205,7 +207,14 @@ void CallDispatcher::login(Call call) {
     }
     if (!queues_.login.submit([this, held] { run(*held); }, *wait)) {
         loginApi_.withdraw(held->wire.params, held->caller.address);
-        held->reply(busy());
+        refuse(*held);
+    }
+}
+
+/// There is no place for the call.
+void CallDispatcher::refuse(const Call &call) const {
+    if (!stopping_) {
+        call.reply(busy());
     }
 }
 

@@ -47,6 +47,9 @@ public:
     /// reply. Thread-safe.
     Json::Value serveLocal(const OvraPlatform::LocalCall &call);
 
+    /// From here on leaves remote calls for which there is no place without an answer: "too busy"
+    /// would end the caller's search for another way.
+    void beginStop() { stopping_ = true; }
     /// Stops waiting for local calls in progress; they are answered with a refusal.
     void leaveLocal() { leaving_ = true; }
 
@@ -58,6 +61,7 @@ private:
     [[nodiscard]] bool admit(Call &call);
     void route(Call call);
     void login(Call call);
+    void refuse(const Call &call) const;
     void run(const Call &call) const;
 
     const OvraPlatform::APIRegistry &registry_;
@@ -65,6 +69,7 @@ private:
     OvraPlatform::ReplayGuard &guard_;
     LoginApi &loginApi_;
     WorkQueues &queues_;
+    std::atomic<bool> stopping_ = false;
     std::atomic<bool> leaving_ = false;
 };
 

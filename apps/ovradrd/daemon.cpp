@@ -215,6 +215,9 @@ bool Daemon::stop() {
     if (self.http) {
         self.http->quiesce();
     }
+    if (self.dispatcher) {
+        self.dispatcher->beginStop();
+    }
     const auto deadline = std::chrono::steady_clock::now() + kGrace;
     bool ended = true;
     if (self.farlink) {

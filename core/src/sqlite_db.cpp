@@ -47,18 +47,18 @@ bool isBlank(const char *tail, const char *end) {
 } // namespace
 
 void SqliteDB::Close::operator()(sqlite3 *db) const {
+    const NoFork noFork;
     OvraBase::CloseSqlite()(db);
 }
 
 SqliteDB::SqliteDB(const std::string &path, unsigned int busyTime, const std::string &infoTable)
     : infoTable_(infoTable) {
-    constexpr unsigned int kMilliseconds = 1000;
-    const unsigned int limit = INT_MAX / kMilliseconds;
+    const NoFork noFork;
     OvraBase::SqliteHandle database;
     // The first statement reports a failure to open.
-    OvraBase::openSqlite(path, static_cast<int>(std::min(busyTime, limit) * kMilliseconds),
-                         database);
+    OvraBase::openSqlite(path, 0, database);
     db_.reset(database.release());
+    wait_ = std::make_unique<SqliteWait>(db_.get(), std::chrono::seconds(busyTime));
 }
 
 SqliteDB::SqliteDB(SqliteDB &&) noexcept = default;
@@ -81,6 +81,7 @@ bool SqliteDB::run(const std::string &sql, std::vector<SqliteValueList> *rows, b
     if (sql.size() > INT_MAX) {
         return fail("the statement is too large");
     }
+    const NoFork noFork;
     const char *tail = nullptr;
     const OvraBase::SqliteStatement statement = OvraBase::prepareSqlite(db_.get(), sql, &tail);
     if (!statement && sqlite3_errcode(db_.get()) != SQLITE_OK) {

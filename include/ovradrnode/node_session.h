@@ -43,6 +43,9 @@ public:
     /// The node of a granted session; "" if it has none.
     /// \param extra  the session's extra data in the store
     static std::string NodeIdOf(const std::string &extra);
+    /// The extra data of a session that is granted to the node. It is searched for as text, so it
+    /// never changes.
+    static std::string ExtraOf(const std::string &nodeId);
 };
 
 } // namespace OvraDRNode

@@ -2,6 +2,10 @@
 #pragma once
 
 /// All public headers of the library.
+///
+/// An object is for one thread at a time; different threads use different objects. A process may
+/// fork at any time, with other threads at work, and the child may use the whole library, but none
+/// of the objects that its parent had made (ovradrcore/no_fork.h).
 
 #include "ovradrnode/conn.h"
 #include "ovradrnode/cred_permission_cache.h"

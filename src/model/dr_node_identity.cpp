@@ -16,6 +16,9 @@
 #include <unistd.h>
 
 #include <array>
+#include <atomic>
+#include <memory>
+#include <optional>
 
 namespace OvraDRNode {
 
@@ -31,27 +34,35 @@ constexpr int kUuidAttempts = 7;
 constexpr int kTextSize = 1024;
 constexpr int kNodeIdSize = 128;
 
-std::string ReadNodeIdFromConf() {
-    FileLock lock(Path::kIdentityLock);
-    if (OLIBCFileExist(Path::kIdentityFile) == 0) {
-        return {};
-    }
-    if (!lock.lock(kReadLock, kLockWait)) {
-        OVRA_ERR("Failed to lock [%s]", Path::kIdentityLock);
-        return {};
-    }
+/// What the identity file holds; std::nullopt if it cannot be read.
+std::optional<std::string> storedNodeId() {
     std::array<char, kNodeIdSize> buffer{};
     if (OLIBCFileGetKeyValue(Path::kIdentityFile, Word::kNodeId, buffer.data(), kNodeIdSize, 0) <
         0) {
-        OVRA_ERR("Failed to get nodeId");
-        return {};
+        return std::nullopt;
     }
     buffer.back() = '\0';
-    std::string id = buffer.data();
-    if (id.empty()) {
-        OVRA_WARN("Invalid nodeId [%s]", id.c_str());
+    return buffer.data();
+}
+
+/// The stored id, or "" if there is none; std::nullopt if the lock could not be had, so that nobody
+/// knows.
+std::optional<std::string> ReadNodeIdFromConf() {
+    FileLock lock(Path::kIdentityLock);
+    if (OLIBCFileExist(Path::kIdentityFile) == 0) {
+        return "";
     }
-    return id;
+    if (!lock.lock(kReadLock, kLockWait)) {
+        OVRA_ERR("Failed to lock [%s]", Path::kIdentityLock);
+        return std::nullopt;
+    }
+    const std::optional<std::string> id = storedNodeId();
+    if (!id) {
+        OVRA_ERR("Failed to get nodeId");
+    } else if (id->empty()) {
+        OVRA_WARN("Invalid nodeId [%s]", id->c_str());
+    }
+    return id.value_or("");
 }
 
 std::string generateNodeId() {
@@ -64,8 +75,9 @@ std::string generateNodeId() {
     return {};
 }
 
-/// Does not read the file again: of two processes that both found no id, the later one wins.
-std::string CreateNodeId() {
+/// Does not read again what was read: of two processes that both found no id, the later one wins.
+/// \param unread  the file could not be read for want of the lock: an id that it holds is kept
+std::string CreateNodeId(bool unread) {
     FileLock lock(Path::kIdentityLock);
     std::string id = generateNodeId();
     if (id.empty()) {
@@ -79,6 +91,11 @@ std::string CreateNodeId() {
     if (!lock.lock(kWriteLock, kLockWait)) {
         OVRA_ERR("Failed to lock [%s]", Path::kIdentityLock);
         return {};
+    }
+    if (unread) {
+        if (std::optional<std::string> stored = storedNodeId(); stored && !stored->empty()) {
+            return *stored;
+        }
     }
     if (OLIBCFileSetKeyValue(Path::kIdentityFile, Word::kNodeId, id.c_str(), "%s=\"%s\"\n") < 0) {
         OVRA_ERR("Failed to set node_id");
@@ -108,11 +125,11 @@ std::string DRNode::getLocalSerial() {
 }
 
 std::string DRNode::getLocalNodeId() {
-    std::string id = ReadNodeIdFromConf();
-    if (!id.empty()) {
-        return id;
+    const std::optional<std::string> stored = ReadNodeIdFromConf();
+    if (stored && !stored->empty()) {
+        return *stored;
     }
-    id = CreateNodeId();
+    const std::string id = CreateNodeId(!stored);
     if (id.empty()) {
         OVRA_ERR("Failed to create nodeId");
     }
@@ -148,8 +165,16 @@ bool DRNode::isLocalNodeId(const std::string &id) {
     if (id.empty()) {
         return false;
     }
-    static const std::string localId = getLocalNodeId();
-    return id == localId;
+    // Not a static of its own: a child forked during its initialisation would wait for it for ever.
+    static std::atomic<const std::string *> known{nullptr};
+    const std::string *localId = known.load();
+    if (localId == nullptr) {
+        auto first = std::make_unique<const std::string>(getLocalNodeId());
+        if (known.compare_exchange_strong(localId, first.get())) {
+            localId = first.release(); // as long as the process
+        }
+    }
+    return id == *localId;
 }
 
 } // namespace OvraDRNode

@@ -184,17 +184,10 @@ bool setLoginOptions(OvraCgi *handle, int timeout) {
            OvraCgiSetOption(handle, OVRA_CGI_OPT_TIMEOUT, &timeout) != 0;
 }
 
-/// The extra data of a session that is tied to the node.
-std::string extraOf(const std::string &nodeId) {
-    Json::Value extra(Json::objectValue);
-    extra[Word::kNodeId] = nodeId;
-    return OvraDRCore::toString(extra);
-}
-
 /// Whether a session tied to the node is found again. One that is not (the id is no UTF-8, or too
 /// long) would be made anew with every call.
 bool isTraceable(const std::string &nodeId) {
-    const std::string extra = extraOf(nodeId);
+    const std::string extra = NodeSession::ExtraOf(nodeId);
     return extra.size() < kFieldSize && NodeSession::NodeIdOf(extra) == nodeId;
 }
 
@@ -219,7 +212,7 @@ std::string CgiLogin(const std::string &userName, int timeout, const std::string
         }
     }
     if (!nodeId.empty()) {
-        const std::string text = extraOf(nodeId);
+        const std::string text = NodeSession::ExtraOf(nodeId);
         if (OvraCgiSetOption(handle.get(), OVRA_CGI_OPT_EXTRA, text.c_str()) == 0) {
             OVRA_WARN("Failed to set extra opt[%s] of user[%s] login", text.c_str(),
                       userName.c_str());
@@ -251,6 +244,12 @@ std::string NodeSession::NodeIdOf(const std::string &extra) {
     Json::Value parsed;
     return OvraDRCore::fromString(parsed, extra) ? OvraDRCore::memberString(parsed, Word::kNodeId)
                                                  : "";
+}
+
+std::string NodeSession::ExtraOf(const std::string &nodeId) {
+    Json::Value extra(Json::objectValue);
+    extra[Word::kNodeId] = nodeId;
+    return OvraDRCore::toString(extra);
 }
 
 std::string NodeSession::CreateNodeSession(const std::string &nodeId, const std::string &userName) {

@@ -1,10 +1,11 @@
 // SPDX-License-Identifier: Apache-2.0
+#include "support/other_process.h"
+
 #include <ovrabase/lock.h>
 
 #include <fcntl.h>
 #include <gtest/gtest.h>
 #include <sys/file.h>
-#include <sys/wait.h>
 
 #include <cerrno>
 
@@ -18,27 +19,6 @@ constexpr char kPath[] = "/tmp/lock_test.lock";
 UniqueFd openLock() {
     return UniqueFd(open(kPath, O_RDWR | O_CREAT | O_CLOEXEC, 0600));
 }
-
-/// A child that keeps this process's open files until it exits.
-class ForkedChild {
-public:
-    ForkedChild()
-        : pid_(fork()) {
-        if (pid_ == 0) {
-            pause();
-            _exit(0);
-        }
-    }
-    ForkedChild(const ForkedChild &) = delete;
-    ForkedChild &operator=(const ForkedChild &) = delete;
-    ~ForkedChild() {
-        kill(pid_, SIGKILL);
-        waitpid(pid_, nullptr, 0);
-    }
-
-private:
-    pid_t pid_;
-};
 
 } // namespace
 
@@ -59,7 +39,7 @@ TEST(Lock, IsNotLeftWithAChildThatWasForkedMeanwhile) {
     const UniqueFd byte = openLock();
     ASSERT_TRUE(held);
     ASSERT_TRUE(lockByte(byte.get(), 7, 0ms));
-    const ForkedChild child;
+    const OvraTest::OtherProcess child(pause); // keeps the open files of this one
     held->reset();
     unlockByte(byte.get(), 7);
     EXPECT_TRUE(LockedFd::lock(openLock(), LOCK_EX, 0ms));

@@ -45,8 +45,16 @@ TEST(Request, IncompleteOrForeignJsonIsInvalidAndNeverThrows) {
           R"({"api":"a","method":"m","version":"1"})", R"({"api":"a","method":"m","version":0})",
           R"({"api":"a","method":"m","version":9999999999})",
           R"({"api":"a","method":"m","version":1,"params":[]})",
+          R"({"api":"a\u0000","method":"m","version":1})",
+          R"({"api":"a","method":"m\u0000","version":1})",
           R"({"api":"a","method":"m","version":1,"encrypt":"yes"})"}) {
         EXPECT_FALSE(Request(json(text)).isValid()) << text;
+    }
+    Request request("a", 1, "m", Json::Value());
+    for (const auto &[seconds, valid] :
+         {std::pair(0L, false), {1, true}, {86400, true}, {86401, false}, {-1, false}}) {
+        request.setResponseTimeout(seconds);
+        EXPECT_EQ(request.isValid(), valid) << seconds;
     }
 }
 

@@ -1,17 +1,22 @@
 // SPDX-License-Identifier: Apache-2.0
+#include "support/other_process.h"
+
 #include <ovradrcore/file_lock.h>
 #include <ovradrcore/util.h>
 
+#include <fcntl.h>
 #include <gtest/gtest.h>
 #include <sys/file.h>
 #include <sys/stat.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
+#include <cerrno>
 #include <chrono>
-#include <climits>
+#include <filesystem>
+#include <functional>
 #include <regex>
 #include <set>
+#include <utility>
 
 using namespace OvraDRCore;
 
@@ -23,10 +28,6 @@ TEST(Util, UuidsAreVersionFourAndDiffer) {
         EXPECT_TRUE(std::regex_match(id, form)) << id;
         EXPECT_TRUE(seen.insert(id).second);
     }
-}
-
-TEST(Util, SmallestIntHasElevenCharacters) {
-    EXPECT_EQ(ToString<int>(INT_MIN), "-2147483648");
 }
 
 TEST(Util, CreateDirMakesWhatIsMissingWithTheModeWhateverTheUmask) {
@@ -55,34 +56,58 @@ TEST(FileLock, IsOnePerNameForAllProcesses) {
     EXPECT_TRUE(exclusive.lock(LOCK_EX | LOCK_NB, 0));
 }
 
-TEST(FileLock, GivesUpAfterTheWaitAndGoesWithItsProcess) {
-    int ready[2];
-    ASSERT_EQ(pipe(ready), 0);
-    const pid_t child = fork();
-    if (child == 0) {
+TEST(FileLock, GivesUpAfterTheWaitAndGoesWithItsProcessButNotWithAChildOfThat) {
+    OvraTest::OtherProcess holder([] {
         FileLock held("b.lock");
-        const char ok = held.lock(LOCK_EX | LOCK_NB, 0) ? 'y' : 'n';
-        (void)!write(ready[1], &ok, 1);
-        pause();
-        _exit(0);
-    }
-    char ok = 0;
-    ASSERT_EQ(read(ready[0], &ok, 1), 1);
-    ASSERT_EQ(ok, 'y');
+        const bool ok = held.lock(LOCK_EX | LOCK_NB, 10);
+        if (fork() == 0) { // it outlives its parent
+            sleep(30);
+            _exit(0);
+        }
+        return ok ? pause() : 1;
+    });
     FileLock lock("b.lock");
+    while (lock.lock(LOCK_SH | LOCK_NB, 0)) {
+        lock.unlock();
+        usleep(1000);
+    }
     const auto start = std::chrono::steady_clock::now();
     EXPECT_FALSE(lock.lock(LOCK_SH | LOCK_NB, 1));
     const std::chrono::duration<double> waited = std::chrono::steady_clock::now() - start;
     EXPECT_GE(waited.count(), 1.0);
     EXPECT_LT(waited.count(), 5.0);
-    kill(child, SIGKILL);
-    waitpid(child, nullptr, 0);
+    usleep(100'000);
+    holder.end(SIGKILL);
     EXPECT_TRUE(lock.lock(LOCK_SH | LOCK_NB, 0));
 }
 
-TEST(FileLock, DoesNotFollowASymbolicLink) {
-    ASSERT_EQ(symlink("/usr/ovra/target", "/run/lock/c.lock"), 0);
-    FileLock lock("c.lock");
-    EXPECT_FALSE(lock.lock(LOCK_EX | LOCK_NB, 0));
+TEST(FileLock, ReplacesWhateverSomebodyElsePutInItsPlace) {
+    const std::string path = "/run/lock/c.lock";
+    const std::pair<const char *, std::function<bool()>> planted[] = {
+        {"link", [&] { return symlink("/usr/ovra/target", path.c_str()) == 0; }},
+        {"FIFO", [&] { return mkfifo(path.c_str(), 0600) == 0; }},
+        {"folder", [&] { return File::CreateDir(path + "/x", 0755); }},
+        {"open to all",
+         [&] { return mknod(path.c_str(), 0600, 0) == 0 && !chmod(path.c_str(), 0644); }},
+        {"second name",
+         [&] { return mknod("/run/lock/d", 0600, 0) == 0 && !link("/run/lock/d", path.c_str()); }},
+        // Only the superuser can make it.
+        {"other owner",
+         [&] {
+             return mknod(path.c_str(), 0600, 0) == 0 &&
+                    (chown(path.c_str(), 65534, 0) == 0 || errno == EINVAL);
+         }},
+        {"folder is missing", [] { return std::filesystem::remove_all("/run/lock") > 0; }},
+    };
+    for (const auto &[what, plant] : planted) {
+        ASSERT_TRUE(plant()) << what;
+        const int theirs = open(path.c_str(), O_RDONLY | O_NONBLOCK);
+        flock(theirs, LOCK_EX | LOCK_NB);
+        FileLock lock("c.lock");
+        EXPECT_TRUE(lock.lock(LOCK_EX | LOCK_NB, 0)) << what;
+        EXPECT_FALSE(FileLock("c.lock").lock(LOCK_EX | LOCK_NB, 0)) << what;
+        close(theirs);
+        unlink(path.c_str());
+    }
     EXPECT_NE(access("/usr/ovra/target", F_OK), 0) << "nothing was made through the link";
 }

@@ -137,8 +137,13 @@ speedOfAShapedLink() {
     create 0
     # Slow enough for a busy machine to keep up.
     "$lab" shape 1 --rate 20mbit --delay 20ms >/dev/null 2>&1 || "$lab" shape 1 --rate 20mbit >/dev/null
-    on 1 0 ovradr --json speed "$remote" --timeout 4
-    holds '.data.bits_per_second > 18000000 and .data.bits_per_second < 22000000'
+    # A busy machine slows some measurements down, but speeds none up.
+    for _ in 1 2 3 4 5; do
+        on 1 0 ovradr --json speed "$remote" --timeout 4
+        holds '.data.bits_per_second < 22000000'
+        (($(value '.data.bits_per_second | floor') <= 18000000)) || break
+    done
+    holds '.data.bits_per_second > 18000000'
     # The first two of node 1's four endpoints are unreachable now, the third is not.
     "$lab" drop 1 0 >/dev/null
     on 1 0 ovradr speed "$remote" --timeout 4 --retries 0

@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "support/local_node.h"
 #include "support/log_capture.h"
+#include "support/other_process.h"
 #include "support/print_json.h"
 
 #include <ovradrcore/file_lock.h>
@@ -11,12 +12,14 @@
 #include <gtest/gtest.h>
 #include <sys/file.h>
 #include <sys/stat.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
+#include <chrono>
 #include <filesystem>
 #include <fstream>
 #include <iterator>
+#include <list>
+#include <thread>
 
 using namespace OvraDRNode;
 
@@ -149,7 +152,7 @@ TEST(Identity, AFileWithoutAUsableIdIsMended) {
     EXPECT_EQ(DRNode::getLocalNodeId(), DRNode::getLocalNodeId());
 }
 
-TEST(Identity, ALockThatStaysHeldMeansNoIdNotAWrongOne) {
+TEST(Identity, ALockThatStaysHeldMeansNoIdAndNeverAWrongOne) {
     const std::string id = DRNode::getLocalNodeId();
     OvraDRCore::FileLock held("drnode.info.lock");
     ASSERT_TRUE(held.lock(LOCK_EX | LOCK_NB, 0));
@@ -159,23 +162,23 @@ TEST(Identity, ALockThatStaysHeldMeansNoIdNotAWrongOne) {
         log.count("ERR", "dr_node", "ReadNodeIdFromConf", "Failed to lock [drnode.info.lock]"), 1);
     EXPECT_EQ(log.count("ERR", "dr_node", "CreateNodeId", "Failed to lock [drnode.info.lock]"), 1);
     EXPECT_EQ(log.count("ERR", "dr_node", "getLocalNodeId", "Failed to create nodeId"), 1);
-    held.unlock();
+    std::thread late([&held] {
+        std::this_thread::sleep_for(
+            std::chrono::milliseconds(6500)); // the reader gives up after 5 s
+        held.unlock();
+    });
     EXPECT_EQ(DRNode::getLocalNodeId(), id);
+    late.join();
+    EXPECT_EQ(identityFile(), "node_id=\"" + id + "\"\n");
 }
 
 TEST(Identity, ProcessesThatStartTogetherEndUpWithOneId) {
-    std::vector<pid_t> children;
+    std::list<OvraTest::OtherProcess> processes;
     for (int i = 0; i < 12; ++i) {
-        const pid_t child = fork();
-        if (child == 0) {
-            _exit(DRNode::getLocalNodeId().size() == 36 ? 0 : 1);
-        }
-        children.push_back(child);
+        processes.emplace_back([] { return DRNode::getLocalNodeId().size() == 36 ? 0 : 1; });
     }
-    for (const pid_t child : children) {
-        int status = 1;
-        waitpid(child, &status, 0);
-        EXPECT_EQ(status, 0);
+    for (OvraTest::OtherProcess &each : processes) {
+        EXPECT_EQ(each.wait(), 0);
     }
     const std::string id = DRNode::getLocalNodeId();
     EXPECT_EQ(identityFile(), "node_id=\"" + id + "\"\n") << "one line, whoever came last";

@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
+#include "support/other_process.h"
 #include "support/print_json.h"
 
 #include <ovraplatform/appliance.h>
@@ -8,14 +9,12 @@
 #include <gtest/gtest.h>
 #include <sys/resource.h>
 #include <sys/stat.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include <csignal>
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
-#include <functional>
 #include <sstream>
 #include <string>
 
@@ -64,39 +63,6 @@ protected:
 
 private:
     std::string folder_;
-};
-
-/// Runs `work` in its own process. It must not use gtest assertions.
-class OtherProcess {
-public:
-    explicit OtherProcess(const std::function<int()> &work)
-        : pid_(fork()) {
-        if (pid_ == 0) {
-            _exit(work());
-        }
-    }
-    OtherProcess(const OtherProcess &) = delete;
-    OtherProcess &operator=(const OtherProcess &) = delete;
-    ~OtherProcess() {
-        if (pid_ > 0) {
-            end(SIGKILL);
-        }
-    }
-
-    /// Its exit code, or -1 if ended by a signal.
-    int wait() {
-        int status = 0;
-        waitpid(pid_, &status, 0);
-        pid_ = -1;
-        return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
-    }
-    void end(int signal) {
-        kill(pid_, signal);
-        wait();
-    }
-
-private:
-    pid_t pid_;
 };
 
 /// From here on this process can write no file beyond `bytes`, as on a full disk.

@@ -5,6 +5,7 @@
 
 #include <ovradrnode/node_session.h>
 #include <ovraplatform/api_errors.h>
+#include <ovraplatform/session_walk.h>
 
 #include <mutex>
 
@@ -39,6 +40,8 @@ Json::Value create(const Json::Value &params, const APICaller &caller) {
     // process grants any.
     static std::mutex granting;
     const std::lock_guard<std::mutex> lock(granting);
+    const OvraPlatform::SessionWalk walk(
+        {caller.user, NodeSession::kApplication, NodeSession::ExtraOf(nodeId)});
     NodeSession sessions;
     const std::string session = sessions.CreateNodeSession(nodeId, caller.user);
     return granted(sessions, session);

@@ -2,6 +2,7 @@
 #pragma once
 
 #include "ovradrcore/export.h"
+#include "ovradrcore/no_fork.h"
 
 #include <string>
 
@@ -9,10 +10,13 @@ namespace OvraDRCore {
 
 /// An advisory lock between processes, flock(2) on a dedicated file.
 ///
-/// A bare name lives under /run/lock; a name with a slash is a path. The file is created if missing
-/// (mode 0600), never opened through a symbolic link, and never removed, so that every process uses
-/// the same file. The lock belongs to this object, not to the process, so two objects exclude each
-/// other within one process as well; it is released when the process dies.
+/// A bare name lives under /run/lock, which is created if missing; a name with a slash is a path.
+/// The file is created if missing (mode 0600) and never removed, so that every process uses the
+/// same one. Only a regular file of our own user with that mode and no other name is locked: what
+/// anybody else put in its place (a file, a link, a FIFO, a folder) is replaced, with one line in
+/// the log, or, where that is not permitted, refused. The lock belongs to this object, not to the
+/// process, so two objects exclude each other within one process as well; it is released when the
+/// process dies. A forked child does not hold the locks of its parent.
 class OVRADRCORE_EXPORT FileLock {
 public:
     /// Binds the object to its file; takes no lock.
@@ -31,7 +35,7 @@ public:
 
 private:
     std::string path_;
-    mutable int fd_ = -1;
+    mutable ForkClosedFd fd_;
 };
 
 } // namespace OvraDRCore

@@ -3,6 +3,7 @@
 
 #include "ovradrcore/err_recorder.h"
 #include "ovradrcore/export.h"
+#include "ovradrcore/no_fork.h"
 #include "ovradrcore/sqlite_command.h"
 #include "ovradrcore/sqlite_value.h"
 
@@ -19,7 +20,8 @@ namespace OvraDRCore {
 ///
 /// Every operation returns false on failure and records 407 with SQLite's error text as the
 /// message; it logs nothing, because the caller knows whether a failure matters. Nothing throws.
-/// Operations wait for a file locked by another process.
+/// Operations wait for a file locked by another process. An object is for one thread at a time, and
+/// a forked child does not use that of its parent.
 class OVRADRCORE_EXPORT SqliteDB : public ErrRecorder {
 public:
     /// \param path       the database file
@@ -54,6 +56,7 @@ private:
     bool fail(const std::string &what) const;
 
     std::string infoTable_;
+    std::unique_ptr<SqliteWait> wait_;
     std::unique_ptr<sqlite3, Close> db_;
 };
 

@@ -7,6 +7,7 @@
 #include <ovrabase/file.h>
 #include <ovrabase/number.h>
 #include <ovradrcore/log.h>
+#include <ovradrcore/no_fork.h>
 #include <ovradrcore/util.h>
 
 #include <sys/stat.h>
@@ -61,6 +62,10 @@ void readAddresses(const Lines &lines, ApplianceConfig &config) {
         if (!OvraBase::isNumericAddress(address)) {
             config.problems.push_back("address holds [" + address +
                                       "], not a numeric IPv4 or IPv6 address");
+        } else if (OvraBase::isIpv6LinkLocal(address)) {
+            config.problems.push_back("address holds [" + address +
+                                      "], a link-local address, which is the same on every link: "
+                                      "name another one");
         } else if (config.addresses.size() == kMaxAddresses) {
             config.problems.push_back("address holds more than " + std::to_string(kMaxAddresses) +
                                       " addresses");
@@ -111,7 +116,7 @@ void takeSettings(const Lines &lines, ApplianceConfig &config) {
 
 /// The settings are read often: the same problems are logged once per process.
 void logOnce(const std::string &path, const std::vector<std::string> &problems) {
-    static std::mutex mutex;
+    static OvraDRCore::ForkSafeMutex mutex;
     static std::string lastLogged;
     std::string text;
     for (const std::string &problem : problems) {

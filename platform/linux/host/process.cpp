@@ -4,6 +4,7 @@
 #include <ovrabase/file.h>
 #include <ovrabase/unique_fd.h>
 #include <ovradrcore/log.h>
+#include <ovradrcore/no_fork.h>
 
 #include <fcntl.h>
 #include <spawn.h>
@@ -29,11 +30,12 @@ constexpr std::size_t kMaxArguments = 255;
 /// The program behind each stream. Never destroyed: a thread may still close a stream while the
 /// process ends.
 struct RunningPrograms {
-    std::mutex mutex;
+    OvraDRCore::ForkSafeMutex mutex;
     std::map<FILE *, pid_t> pids;
 };
 
 RunningPrograms &runningPrograms() {
+    const OvraDRCore::NoFork noFork; // a child would wait for an initialisation under way
     static auto *const programs = new RunningPrograms;
     return *programs;
 }

@@ -1,32 +1,24 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "http/connection_pool.h"
 
-#include <ovrabase/unique_fd.h>
-
 #include <pthread.h>
-#include <sys/socket.h>
 #include <unistd.h>
 
 #include <algorithm>
-#include <exception>
 #include <iterator>
+#include <mutex>
 #include <utility>
 
 namespace OvraPlatform {
 
 ConnectionPool &ConnectionPool::instance() {
+    const OvraDRCore::NoFork noFork; // a child would wait for an initialisation under way
     static auto *pool = new ConnectionPool();
     return *pool;
 }
 
 ConnectionPool::ConnectionPool() {
-    // The lock is held across the fork, so that the child finds the lists whole. The first use of
-    // the pool cannot be within a fork: both take place in the caller's thread.
-    pthread_atfork([] { instance().mutex_.lock(); }, [] { instance().mutex_.unlock(); },
-                   [] {
-                       instance().dropAllInChild();
-                       instance().mutex_.unlock();
-                   });
+    pthread_atfork(nullptr, nullptr, [] { instance().dropAllInChild(); });
 }
 
 void ConnectionPool::dropAllInChild() {
@@ -42,7 +34,7 @@ std::unique_ptr<HttpConnection> ConnectionPool::take(const Endpoint &endpoint,
     const std::string key = endpoint.key();
     const auto oldest = std::chrono::steady_clock::now() - kIdleTime;
     std::list<Idle> stale; // closed after the lock is released: closing calls closeSocket()
-    const std::lock_guard<std::mutex> lock(mutex_);
+    const std::lock_guard<OvraDRCore::ForkSafeMutex> lock(mutex_);
     for (auto each = idle_.begin(); each != idle_.end();) {
         const auto next = std::next(each);
         if (each->since < oldest || each->trust != trust) {
@@ -67,7 +59,7 @@ void ConnectionPool::keep(const Endpoint &endpoint, const TrustStore::Stamp &tru
         {endpoint.key(), trust, std::chrono::steady_clock::now(), std::move(connection)});
     const std::string &key = added.front().endpoint;
     std::list<Idle> surplus;
-    const std::lock_guard<std::mutex> lock(mutex_);
+    const std::lock_guard<OvraDRCore::ForkSafeMutex> lock(mutex_);
     const auto same = [&key](const Idle &each) { return each.endpoint == key; };
     const auto count = std::count_if(idle_.begin(), idle_.end(), same);
     if (static_cast<std::size_t>(count) >= kMaxIdlePerEndpoint) {
@@ -78,21 +70,14 @@ void ConnectionPool::keep(const Endpoint &endpoint, const TrustStore::Stamp &tru
     idle_.splice(idle_.end(), added);
 }
 
-int ConnectionPool::openSocket(int family, int type, int protocol) {
-    const std::lock_guard<std::mutex> lock(mutex_);
-    OvraBase::UniqueFd fd(socket(family, type | SOCK_CLOEXEC, protocol));
-    try {
-        if (fd) {
-            sockets_.insert(fd.get());
-        }
-    } catch (const std::exception &) { // no memory; the caller is a callback of libcurl
-        return -1;
-    }
-    return fd.release();
+int ConnectionPool::adopt(OvraBase::UniqueFd socket) {
+    const std::lock_guard<OvraDRCore::ForkSafeMutex> lock(mutex_);
+    sockets_.insert(socket.get());
+    return socket.release();
 }
 
 void ConnectionPool::closeSocket(int fd) {
-    const std::lock_guard<std::mutex> lock(mutex_);
+    const std::lock_guard<OvraDRCore::ForkSafeMutex> lock(mutex_);
     // One that is not listed is the parent's, and was closed when this child began.
     if (sockets_.erase(fd) == 1) {
         close(fd);

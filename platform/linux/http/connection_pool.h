@@ -4,11 +4,13 @@
 #include "http/http_connection.h"
 #include "ovraplatform/trust_store.h"
 
+#include <ovrabase/unique_fd.h>
+#include <ovradrcore/no_fork.h>
+
 #include <chrono>
 #include <cstddef>
 #include <list>
 #include <memory>
-#include <mutex>
 #include <set>
 #include <string>
 #include <vector>
@@ -37,8 +39,8 @@ public:
     void keep(const Endpoint &endpoint, const TrustStore::Stamp &trust,
               std::unique_ptr<HttpConnection> connection);
 
-    /// A socket that a forked child closes; -1 if none is available.
-    int openSocket(int family, int type, int protocol);
+    /// Takes over a socket that a forked child shall close.
+    int adopt(OvraBase::UniqueFd socket);
     void closeSocket(int fd);
 
 private:
@@ -52,7 +54,7 @@ private:
     ConnectionPool();
     void dropAllInChild();
 
-    std::mutex mutex_;
+    OvraDRCore::ForkSafeMutex mutex_;
     std::list<Idle> idle_; ///< the longest idle first
     std::set<int> sockets_;
     std::list<Idle> parents_; ///< a child's copies of its parent's, out of use

@@ -1,26 +1,20 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "seal/seal_key_cache.h"
 
-#include <pthread.h>
-
 #include <algorithm>
+#include <mutex>
 
 namespace OvraPlatform {
 
 SealKeyCache &SealKeyCache::instance() {
+    const OvraDRCore::NoFork noFork; // a child would wait for an initialisation under way
     static auto *cache = new SealKeyCache();
     return *cache;
 }
 
-SealKeyCache::SealKeyCache() {
-    // A child must not find the lock held by a thread that it does not have.
-    const auto unlock = [] { instance().mutex_.unlock(); };
-    pthread_atfork([] { instance().mutex_.lock(); }, unlock, unlock);
-}
-
 std::optional<SealKeyCache::Known> SealKeyCache::find(const std::string &endpoint,
                                                       const TrustStore::Stamp &trust) {
-    const std::lock_guard<std::mutex> lock(mutex_);
+    const std::lock_guard<OvraDRCore::ForkSafeMutex> lock(mutex_);
     const auto entry = entries_.find(endpoint);
     if (entry == entries_.end()) {
         return std::nullopt;
@@ -35,7 +29,7 @@ std::optional<SealKeyCache::Known> SealKeyCache::find(const std::string &endpoin
 
 void SealKeyCache::put(const std::string &endpoint, const TrustStore::Stamp &trust,
                        const Known &known) {
-    const std::lock_guard<std::mutex> lock(mutex_);
+    const std::lock_guard<OvraDRCore::ForkSafeMutex> lock(mutex_);
     if (entries_.size() >= kMaxEndpoints && entries_.count(endpoint) == 0) {
         entries_.erase(
             std::min_element(entries_.begin(), entries_.end(), [](const auto &a, const auto &b) {
@@ -46,7 +40,7 @@ void SealKeyCache::put(const std::string &endpoint, const TrustStore::Stamp &tru
 }
 
 void SealKeyCache::drop(const std::string &endpoint) {
-    const std::lock_guard<std::mutex> lock(mutex_);
+    const std::lock_guard<OvraDRCore::ForkSafeMutex> lock(mutex_);
     entries_.erase(endpoint);
 }
 

@@ -4,10 +4,11 @@
 #include "ovraplatform/sealed_box.h"
 #include "ovraplatform/trust_store.h"
 
+#include <ovradrcore/no_fork.h>
+
 #include <chrono>
 #include <cstddef>
 #include <map>
-#include <mutex>
 #include <optional>
 #include <string>
 
@@ -38,9 +39,7 @@ private:
         std::chrono::steady_clock::time_point since;
     };
 
-    SealKeyCache();
-
-    std::mutex mutex_;
+    OvraDRCore::ForkSafeMutex mutex_;
     std::map<std::string, Entry> entries_;
 };
 

@@ -3,6 +3,7 @@
 
 #include <ovrabase/encoding.h>
 #include <ovradrcore/log.h>
+#include <ovradrcore/no_fork.h>
 
 #include <openssl/x509_vfy.h>
 
@@ -104,6 +105,7 @@ bool CertificateVerifier::pinNewKey() {
     if (verdict_ != Verdict::kNew) {
         return true;
     }
+    const OvraDRCore::NoFork::Pause forksPass; // it may wait for the file
     verdict_ = verdictOf(TrustStore().pin(endpoint_.key(), fingerprint_));
     return verdict_ == Verdict::kPinned;
 }

@@ -2,14 +2,13 @@
 #include "farlink_agent.h"
 #include "relay_api.h"
 #include "service/certificate.h"
+#include "sockets.h"
 
 #include <ovracredential/cred_request.h>
 #include <ovraplatform/appliance.h>
 #include <ovraplatform/farlink.h>
 
 #include <gtest/gtest.h>
-#include <netinet/in.h>
-#include <sys/socket.h>
 
 #include <atomic>
 #include <filesystem>
@@ -21,12 +20,12 @@ namespace {
 
 using Farlinkd::RelayApi;
 using Farlinkd::TunnelServer;
-using OvraBase::UniqueFd;
 using OvraPlatform::FarlinkSettings;
 using OvraService::HttpServer;
 using OvraService::Listener;
 
 constexpr std::chrono::seconds kSoon{20};
+constexpr int kPort = 20120;
 
 /// Whether it comes true within kSoon.
 template <typename Condition>
@@ -85,20 +84,7 @@ protected:
         http.stop();
     }
 
-    /// What a caller of the alias hears, as long as the appliance is there.
-    std::string call() const {
-        UniqueFd fd(socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0));
-        sockaddr_in address{};
-        address.sin_family = AF_INET;
-        address.sin_port = htons(20120);
-        address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
-        const timeval patience{20, 0};
-        setsockopt(fd.get(), SOL_SOCKET, SO_RCVTIMEO, &patience, sizeof patience);
-        EXPECT_EQ(connect(fd.get(), reinterpret_cast<sockaddr *>(&address), sizeof address), 0);
-        std::string text(100, '\0');
-        const ssize_t size = recv(fd.get(), text.data(), text.size(), 0);
-        return size < 0 ? "silence" : text.substr(0, static_cast<std::size_t>(size));
-    }
+    static std::string call() { return FarlinkdTest::hearAll(FarlinkdTest::dial(kPort)); }
     /// Where an appliance finds the alias: the text of its information.
     static Json::Value lookUp(const std::string &alias) {
         Json::Value info;
@@ -107,7 +93,7 @@ protected:
         return info;
     }
 
-    Farlinkd::AliasRegistry aliases{"/usr/ovra/aliases", {20120, 20120, std::chrono::hours(1)}};
+    Farlinkd::AliasRegistry aliases{"/usr/ovra/aliases", {kPort, kPort, std::chrono::hours(1)}};
     std::optional<RelayApi> api;
     TunnelServer tunnelServer{[this](const std::string &alias, const std::string &caller) {
                                   return api->announce(alias, caller);
@@ -132,10 +118,10 @@ TEST_F(TheFarlinkAgent, IsReachedUnderItsAliasUntilTheRelayIsSwitchedOff) {
     EXPECT_TRUE(lookUp("nas").isNull()) << "no relay is set up";
     ASSERT_TRUE(OvraPlatform::writeFarlinkSettings(settings));
     ASSERT_TRUE(soon([this] { return agent.status().connected; })) << agent.status().problem;
-    EXPECT_EQ(agent.status().port, 20120);
+    EXPECT_EQ(agent.status().port, kPort);
     Json::Value found;
     EXPECT_TRUE(soon([&] { return !(found = lookUp("NAS")).isNull(); }));
-    EXPECT_EQ(found["port"], 20120);
+    EXPECT_EQ(found["port"], kPort);
     EXPECT_EQ(found["host"], "127.0.0.1") << "that of the service, which names none";
     EXPECT_EQ(found["protocol"], "https");
     EXPECT_EQ(call(), "welcome");

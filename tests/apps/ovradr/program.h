@@ -13,6 +13,9 @@ namespace OvradrTest {
 
 using Arguments = std::vector<std::string>;
 
+/// Replaces this process by the program: that of this build, unless OVRADR_PROGRAM names another.
+[[noreturn]] void execute(const Arguments &arguments);
+
 /// The program's output and exit code; -1: ended by a signal, or killed after the time-out.
 struct Result {
     int exit = -1;

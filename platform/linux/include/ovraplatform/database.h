@@ -3,6 +3,8 @@
 
 #include "ovraplatform/export.h"
 
+#include <ovradrcore/no_fork.h>
+
 #include <cstdint>
 #include <memory>
 #include <optional>
@@ -19,10 +21,14 @@ struct DatabaseLayout {
     const char *name;   ///< as named in messages, e.g. "session store"
     int applicationId;  ///< SQLite's application_id: another program's file is refused
     int version;        ///< SQLite's user_version: a newer program's file is refused
-    const char *schema; ///< creates the tables in a new file
+    const char *schema; ///< creates the tables in a new file; with `upgrade`, as they were before
+    /// Turns the tables of the version before into these, when such a file is opened; null: it is
+    /// refused.
+    const char *upgrade = nullptr;
 };
 
-/// A prepared statement. Text and blobs are bound, never pasted.
+/// A prepared statement. Text and blobs are bound, never pasted. Short-lived: while it exists, it
+/// may hold a lock of the file, and forks wait.
 class OVRAPLATFORM_EXPORT Statement {
 public:
     Statement &bind(int index, std::string_view text);
@@ -50,6 +56,7 @@ private:
         : database_(database)
         , statement_(statement) {}
 
+    OvraDRCore::NoFork noFork_;
     class Database *database_;
     std::unique_ptr<sqlite3_stmt, Finalize> statement_;
 };
@@ -90,7 +97,7 @@ private:
 
     [[nodiscard]] bool makeFile();
     [[nodiscard]] bool setUp();
-    bool isOurs();
+    bool isPrevious(std::optional<std::int64_t> version) const;
     [[nodiscard]] bool makeTables();
     bool failSqlite(int code);
     void rollback();
@@ -98,11 +105,12 @@ private:
 
     std::string path_;
     DatabaseLayout layout_;
+    std::unique_ptr<OvraDRCore::SqliteWait> wait_;
     std::unique_ptr<sqlite3, Close> database_;
     std::string error_;
 };
 
-/// A write transaction: nothing is written without commit().
+/// A write transaction: nothing is written without commit(). Short-lived: forks wait for its end.
 class OVRAPLATFORM_EXPORT Transaction {
 public:
     /// Waits for another process's transaction up to the connection's busy time-out.
@@ -115,6 +123,7 @@ public:
     [[nodiscard]] bool commit();
 
 private:
+    OvraDRCore::NoFork noFork_;
     Database &database_;
     bool open_;
 };
