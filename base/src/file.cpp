@@ -90,6 +90,19 @@ Expected<void> writeAndSync(int fd, std::string_view content, mode_t mode) {
     return fchmod(fd, mode) == 0 && fsync(fd) == 0 ? Expected<void>() : lastSystemError();
 }
 
+/// Opens the file that stands for a folder's lock. The folder itself would not do: to open it for
+/// reading, as everybody may, is all that flock(2) takes.
+UniqueFd openLock(int folder) {
+    constexpr int kFlags = O_RDONLY | O_CREAT | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK;
+    UniqueFd fd(openat(folder, ".lock", kFlags, 0600));
+    // The owner of the folder must be able to open it even if the superuser was here first.
+    struct stat status {};
+    if (fd && geteuid() == 0 && fstat(folder, &status) == 0) {
+        (void)!fchown(fd.get(), status.st_uid, status.st_gid);
+    }
+    return fd;
+}
+
 } // namespace
 
 std::string folderOf(const std::string &path) {
@@ -173,11 +186,15 @@ Expected<FileUpdate> FileUpdate::begin(const std::string &path) {
     if (!folder) {
         return lastSystemError();
     }
-    Expected<LockedFd> locked = LockedFd::lock(std::move(folder), LOCK_EX, kLockWait);
+    UniqueFd file = openLock(folder.get());
+    if (!file) {
+        return lastSystemError();
+    }
+    Expected<LockedFd> locked = LockedFd::lock(std::move(file), LOCK_EX, kLockWait);
     if (!locked) {
         return Unexpected(locked.error());
     }
-    return FileUpdate(resolved, std::move(*locked));
+    return FileUpdate(resolved, std::move(folder), std::move(*locked));
 }
 
 Expected<void> FileUpdate::commit(std::string_view content, mode_t modeWhenNew) const {

@@ -47,9 +47,10 @@ enum class Links { kFollow, kRefuse };
 void fillStandardDescriptors();
 
 /// One read-modify-write of a small file, exclusive among all processes and threads that use this
-/// class for files in the same directory: the lock is flock(2) on the directory and is released
-/// when the process dies. Readers take no lock; they see the old file or the new one. A process
-/// that dies in between leaves at most PATH.new behind, which the next change overwrites.
+/// class for files in the same directory: the lock is flock(2) on the file ".lock" there, which
+/// only the directory's owner can open, and is released when the process dies. Readers take no
+/// lock; they see the old file or the new one. A process that dies in between leaves at most
+/// PATH.new behind, which the next change overwrites.
 class FileUpdate {
 public:
     /// Takes the lock; waits at most 5 seconds for it. A symbolic link at `path` is followed.
@@ -64,12 +65,14 @@ public:
     [[nodiscard]] Expected<void> commit(std::string_view content, mode_t modeWhenNew) const;
 
 private:
-    FileUpdate(std::string path, LockedFd directory)
+    FileUpdate(std::string path, UniqueFd directory, LockedFd lock)
         : path_(std::move(path))
-        , directory_(std::move(directory)) {}
+        , directory_(std::move(directory))
+        , lock_(std::move(lock)) {}
 
     std::string path_;
-    LockedFd directory_;
+    UniqueFd directory_;
+    LockedFd lock_;
 };
 
 } // namespace OvraBase

@@ -21,8 +21,9 @@ struct sqlite3;
 /// there.
 namespace OvraDRCore {
 
-/// A section during which no other thread forks. Cheap (about 30 ns). It may be nested, and its
-/// thread itself may fork. Not for waiting: a fork waits at most 5 seconds, then it goes ahead.
+/// A section during which no other thread forks. Cheap: two atomic additions to a number of the
+/// process. It may be nested, and its thread itself may fork. Not for waiting: a fork waits at most
+/// 5 seconds, then it goes ahead.
 class OVRADRCORE_EXPORT NoFork {
 public:
     NoFork() noexcept { enter(); }

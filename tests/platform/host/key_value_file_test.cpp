@@ -5,6 +5,9 @@
 #include <ovrabase/file.h>
 #include <ovracore/ovracore.h>
 
+#include <fcntl.h>
+#include <sys/file.h>
+
 #include <array>
 #include <chrono>
 #include <memory>
@@ -137,6 +140,9 @@ TEST_F(KeyValueFile, ALinkStaysALink) {
 
 TEST_F(KeyValueFile, AChangeWaitsForTheOneUnderWaySoThatNeitherIsLost) {
     ASSERT_GE(set("mine", "old"), 0);
+    EXPECT_EQ(modeOf(path(".lock")), 0600U);
+    const OvraBase::UniqueFd folder(open(path("").c_str(), O_RDONLY)); // as anybody may
+    ASSERT_EQ(flock(folder.get(), LOCK_EX), 0);
     std::optional<OvraBase::FileUpdate> underWay = OvraBase::FileUpdate::begin(file()).value();
     OtherProcess other([&] { return set("other", "new") < 0 ? 1 : 0; });
     std::this_thread::sleep_for(std::chrono::milliseconds(50));
