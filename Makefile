@@ -6,8 +6,7 @@ JOBS ?= $(shell nproc)
 stage := $(CURDIR)/build/stage
 
 .DEFAULT_GOAL := help
-.PHONY: help build build-dev test demo bench vendor format check clean stage deps-build deps-test deps-lab \
-	deps-bench deps-check
+.PHONY: help build build-dev test demo bench vendor format check clean stage deps-build deps-test deps-lab deps-check
 
 help: ## this list
 	@sed -n 's/^\([a-z-]*\):.*## /\1\t/p' $(MAKEFILE_LIST) | while IFS="$$(printf '\t')" read -r target text; do \
@@ -20,7 +19,7 @@ test: deps-test deps-lab build-dev ## every test, each on its own node (TESTS=re
 	@lab/lab way | sed 's/^/tests run by way of /'
 	ctest --preset dev -j $(JOBS) $(if $(TESTS),-R '$(TESTS)')
 
-bench: deps-bench build/bench/build.ninja ## the benchmarks, compared with their baselines
+bench: deps-build deps-lab build/bench/build.ninja ## the benchmarks, compared with their baselines
 	@cmake --build build/bench -j $(JOBS) --target bench
 
 vendor: deps-test deps-check ## the library on a vendor's own platform, with stand-ins for it
@@ -56,5 +55,5 @@ check: deps-build deps-check ## the CI checks that need no build
 clean: ## remove all output
 	rm -rf build
 
-deps-build deps-test deps-lab deps-bench deps-check: deps-%:
+deps-build deps-test deps-lab deps-check: deps-%:
 	@scripts/install-deps $*

@@ -2,8 +2,8 @@
 # SPDX-License-Identifier: Apache-2.0
 # TestSyncSpeed.sh setup: creates a file for a speed test and prints its absolute path without a
 # newline. ovradrd serves it at /webman/modules/ovradr/ followed by that path. The caller removes it
-# by that name; left-over files are removed here. Prints nothing if no file can be created; standard
-# error says why.
+# by that name; left-over files are removed here. If no file can be created, or its path cannot be
+# printed, none is left and standard error says why.
 set -eu
 umask 077
 
@@ -37,8 +37,10 @@ sweep
 free=$(df --output=avail -B1 "$folder" | tail -n 1)
 [ "$free" -gt $((size * 2)) ] || fail "too little space is free on the disk of $folder"
 file=$folder/speed-$(od -An -N16 -tx1 /dev/urandom | tr -d ' \n')
+# Nobody else removes a file whose name was not printed. A signal exits, so that it is removed too.
 trap 'rm -f "$file"' EXIT
+trap 'exit 1' HUP INT PIPE TERM
 # Random, so that nothing on the path can compress it.
 head -c "$size" /dev/urandom >"$file" || fail "cannot write $file"
+printf '%s' "$file" || fail "cannot print the path of $file: nobody reads it"
 trap - EXIT
-printf '%s' "$file"

@@ -84,14 +84,15 @@ AliasRegistry::enrol(const std::string &name, const std::string &key, std::int64
     if (!store(changed, nextPort)) {
         return tl::unexpected(Refusal::kNotStored);
     }
-    entries_ = std::move(changed);
+    replaceEntries(std::move(changed));
     nextPort_ = nextPort;
     return Enrolment{alias, isNew};
 }
 
-const Alias *AliasRegistry::find(const std::string &name) const {
+std::optional<Alias> AliasRegistry::find(const std::string &name) const {
+    const std::lock_guard lock(mutex_);
     const auto found = entries_.find(name);
-    return found == entries_.end() ? nullptr : &found->second;
+    return found == entries_.end() ? std::nullopt : std::optional(found->second);
 }
 
 bool AliasRegistry::release(const std::string &name) {
@@ -99,7 +100,7 @@ bool AliasRegistry::release(const std::string &name) {
     if (changed.erase(name) == 0 || !store(changed, nextPort_)) {
         return false;
     }
-    entries_ = std::move(changed);
+    replaceEntries(std::move(changed));
     return true;
 }
 
@@ -119,11 +120,17 @@ std::vector<Alias> AliasRegistry::dropExpired(std::int64_t now) {
     }
     // What could not be stored has expired all the same, and is dropped again after a restart.
     (void)store(changed, nextPort_);
-    entries_ = std::move(changed);
+    replaceEntries(std::move(changed));
     return dropped;
 }
 
+void AliasRegistry::replaceEntries(Entries entries) {
+    const std::lock_guard lock(mutex_);
+    entries_.swap(entries);
+}
+
 std::vector<Alias> AliasRegistry::list() const {
+    const std::lock_guard lock(mutex_);
     std::vector<Alias> all;
     for (const auto &[name, alias] : entries_) {
         all.push_back(alias);

@@ -7,6 +7,8 @@
 #include <cstddef>
 #include <cstdint>
 #include <map>
+#include <mutex>
+#include <optional>
 #include <string>
 #include <vector>
 
@@ -22,7 +24,8 @@ struct Alias {
 
 /// The owners of aliases: a text file of mode 0600, replaced whole with every change. An alias
 /// belongs to the first key that claims it, until it has not been enrolled for the length of the
-/// lease. For one thread at a time.
+/// lease. One thread at a time may change it, and waits for the disk; any may read meanwhile, and
+/// sees a change once it is stored.
 class AliasRegistry {
 public:
     struct Limits {
@@ -49,8 +52,8 @@ public:
     /// \param now  seconds since 1970, here and below
     [[nodiscard]] tl::expected<Enrolment, Refusal> enrol(const std::string &name,
                                                          const std::string &key, std::int64_t now);
-    /// Null for an unowned alias.
-    const Alias *find(const std::string &name) const;
+    /// std::nullopt for an unowned alias.
+    std::optional<Alias> find(const std::string &name) const;
     /// \return false if there is none, or the file cannot be written
     [[nodiscard]] bool release(const std::string &name);
     /// Removes expired entries. \return those removed
@@ -61,10 +64,12 @@ private:
     using Entries = std::map<std::string, Alias>;
 
     [[nodiscard]] bool store(const Entries &entries, int nextPort) const;
+    void replaceEntries(Entries entries);
     int freePort() const;
 
     std::string path_;
     Limits limits_;
+    mutable std::mutex mutex_; ///< of the entries, against their replacement
     Entries entries_;
     /// Ports rotate, so that a freed one stays free for as long as possible: callers of its last
     /// owner have pinned a key there.

@@ -12,6 +12,7 @@
 #include "service/tls_identity.h"
 #include "tunnel_server.h"
 
+#include <ovrabase/file.h>
 #include <ovrabase/number.h>
 #include <ovracore/ovracore.h>
 #include <ovradrcore/log.h>
@@ -123,7 +124,7 @@ int serve(const Options &options) {
     const int port = https->port;
     const int tunnelPort = tunnel->port;
 
-    RelayApi api(std::move(aliases), {options.address, options.host, tunnelPort});
+    RelayApi api(aliases, {options.address, options.host, tunnelPort}, {});
     TunnelServer tunnelServer(
         [&api](const std::string &alias, const std::string &caller) {
             return api.announce(alias, caller);
@@ -200,10 +201,11 @@ int run(int argc, char **argv) {
 } // namespace Farlinkd
 
 int main(int argc, char **argv) {
+    OvraBase::fillStandardDescriptors();
     openlog("farlinkd", LOG_NDELAY, LOG_DAEMON);
     try {
         return Farlinkd::run(argc, argv);
     } catch (const std::exception &error) {
-        return Farlinkd::fail({OvraService::ExitCode::kFailed, error.what()});
+        return OvraService::reportStartError("farlinkd", error);
     }
 }

@@ -8,8 +8,8 @@
 #include <ovraplatform/api_errors.h>
 #include <ovraplatform/farlink.h>
 
-#include <cstring>
 #include <ctime>
+#include <functional>
 #include <memory>
 #include <utility>
 #include <vector>
@@ -24,16 +24,9 @@ using OvraPlatform::apiError;
 using OvraPlatform::apiSuccess;
 
 constexpr std::size_t kMaxText = 256;
-constexpr std::chrono::seconds kChallengeTime{60};
 /// An appliance that has not polled for this long is gone; it polls again after each answer.
 constexpr std::chrono::seconds kGoneAfter{15};
-constexpr std::size_t kMaxQueued = 64;
 constexpr std::size_t kTokenBytes = 32;
-
-// For one client address. A busy appliance polls once for each caller.
-constexpr std::size_t kCallsPerMinute = 3000;
-constexpr std::size_t kProofsPerMinute = 30;
-constexpr std::size_t kAliasesPerHour = 10;
 
 Json::Value noSuchAlias() {
     return OvraPlatform::apiBadParameter("alias", "nobody has this alias: check how it is written");
@@ -60,6 +53,11 @@ Json::Value refusalOf(AliasRegistry::Refusal refusal) {
     return apiError(APIError::kInternal, "the relay service cannot store the alias: see its log");
 }
 
+std::string tooMuchToDo() {
+    return OvraDRCore::toString(
+        apiError(APIError::kTooBusy, "the relay service has too much to do: try again later"));
+}
+
 std::string randomText() {
     std::array<unsigned char, kTokenBytes> bytes{};
     randombytes_buf(bytes.data(), bytes.size());
@@ -79,12 +77,13 @@ std::string textOf(const Json::Value &params, const char *name) {
 
 } // namespace
 
-RelayApi::RelayApi(AliasRegistry aliases, Settings settings)
+RelayApi::RelayApi(AliasRegistry &aliases, Settings settings, const Limits &limits)
     : settings_(std::move(settings))
-    , aliases_(std::move(aliases))
-    , calls_(kCallsPerMinute, std::chrono::minutes(1))
-    , proofs_(kProofsPerMinute, std::chrono::minutes(1))
-    , newAliases_(kAliasesPerHour, std::chrono::hours(1)) {
+    , limits_(limits)
+    , aliases_(aliases)
+    , calls_(limits.callsPerMinute, std::chrono::minutes(1))
+    , proofs_(limits.proofsPerMinute, std::chrono::minutes(1))
+    , newAliases_(limits.aliasesPerHour, std::chrono::hours(1)) {
     crypto_auth_keygen(secret_.data());
 }
 
@@ -111,13 +110,14 @@ void RelayApi::serve(OvraService::HttpRequest request, const Answer &answer) {
     // std::function must be copyable.
     const auto held = std::make_shared<OvraService::HttpRequest>(std::move(request));
     if (!queue_.submit([this, held, answer] { handle(*held, answer); })) {
-        answer(OvraDRCore::toString(
-            apiError(APIError::kTooBusy, "the relay service has too much to do: try again later")));
+        answer(tooMuchToDo());
     }
 }
 
 void RelayApi::stop() {
-    queue_.stop(Clock::now() + std::chrono::seconds(2));
+    const auto deadline = Clock::now() + std::chrono::seconds(2);
+    queue_.stop(deadline);
+    changes_.stop(deadline);
 }
 
 void RelayApi::handle(OvraService::HttpRequest &request, const Answer &answer) {
@@ -133,7 +133,7 @@ void RelayApi::handle(OvraService::HttpRequest &request, const Answer &answer) {
     }
     const Json::Value params =
         call->params.isObject() ? call->params : Json::Value(Json::objectValue);
-    const std::lock_guard lock(mutex_);
+    std::unique_lock lock(mutex_);
     if (!calls_.allow(request.address, Clock::now())) {
         return reply(
             apiError(APIError::kTooBusy, "too many calls from this address: wait a minute"));
@@ -147,22 +147,33 @@ void RelayApi::handle(OvraService::HttpRequest &request, const Answer &answer) {
     if (call->method == "challenge") {
         return reply(challenge(params, request.address));
     }
-    if (call->method == "enrol") {
-        return reply(enrol(params, request.address));
-    }
-    if (call->method == "release") {
-        return reply(release(params));
-    }
     if (call->method == "wait") {
         return wait(params, answer);
     }
-    reply(apiError(APIError::kNoSuchMethod, "the relay service has no such method"));
+    lock.unlock();
+    std::function<Json::Value()> change;
+    if (call->method == "enrol") {
+        if (!isProved(params)) {
+            OVRA_NOTICE("An attempt from [%s] to enrol [%s] proves no key", request.address.c_str(),
+                        memberString(params, "alias").c_str());
+            return reply(
+                apiError(APIError::kNoPermission, "the proof of the key is not valid: try again"));
+        }
+        change = [this, params, address = request.address] { return enrol(params, address); };
+    } else if (call->method == "release") {
+        change = [this, params] { return release(params); };
+    } else {
+        return reply(apiError(APIError::kNoSuchMethod, "the relay service has no such method"));
+    }
+    if (!changes_.submit([change, answer] { answer(OvraDRCore::toString(change())); })) {
+        answer(tooMuchToDo());
+    }
 }
 
 Json::Value RelayApi::lookUp(const Json::Value &params) {
     const std::string name = memberString(params, "alias");
-    const Alias *alias = aliases_.find(name);
-    if (alias == nullptr) {
+    const auto alias = aliases_.find(name);
+    if (!alias) {
         return noSuchAlias();
     }
     const auto agent = agents_.find(name);
@@ -193,7 +204,7 @@ bool RelayApi::isFresh(const std::string &challenge, const std::string &alias,
     const std::int64_t now = std::time(nullptr);
     const std::int64_t time =
         OvraBase::parseNumber<std::int64_t>(challenge.substr(0, challenge.find('.'))).value_or(0);
-    return time <= now && now - time <= kChallengeTime.count() &&
+    return time <= now && now - time <= limits_.challenge.count() &&
            sameSecret(challenge, challengeFor(alias, key, time));
 }
 
@@ -207,17 +218,20 @@ Json::Value RelayApi::challenge(const Json::Value &params, const std::string &ad
     return apiSuccess(data);
 }
 
-Json::Value RelayApi::enrol(const Json::Value &params, const std::string &address) {
+/// Whether the caller has the key: only such a call waits for the disk.
+bool RelayApi::isProved(const Json::Value &params) const {
     const std::string name = memberString(params, "alias");
     const std::string key = textOf(params, "key");
     const std::string challenge = textOf(params, "challenge");
-    if (!isFresh(challenge, name, key) ||
-        !OvraPlatform::verifyFarlink(key, name, challenge, textOf(params, "signature"))) {
-        OVRA_NOTICE("An attempt from [%s] to enrol [%s] proves no key", address.c_str(),
-                    name.c_str());
-        return apiError(APIError::kNoPermission, "the proof of the key is not valid: try again");
-    }
-    if (aliases_.find(name) == nullptr && !newAliases_.allow(address, Clock::now())) {
+    return isFresh(challenge, name, key) &&
+           OvraPlatform::verifyFarlink(key, name, challenge, textOf(params, "signature"));
+}
+
+/// In the thread of the changes, as release() and dropExpired().
+Json::Value RelayApi::enrol(const Json::Value &params, const std::string &address) {
+    const std::string name = memberString(params, "alias");
+    const std::string key = textOf(params, "key");
+    if (!aliases_.find(name) && !newAliases_.allow(address, Clock::now())) {
         return apiError(APIError::kTooBusy, "too many new aliases from this address: wait an hour");
     }
     const auto enrolled = aliases_.enrol(name, key, std::time(nullptr));
@@ -229,11 +243,13 @@ Json::Value RelayApi::enrol(const Json::Value &params, const std::string &addres
         return refusalOf(enrolled.error());
     }
     const Alias &alias = enrolled->alias;
+    std::unique_lock lock(mutex_);
     if (enrolled->isNew) {
         OVRA_NOTICE("[%s] took the alias [%s] at port [%d]", address.c_str(), name.c_str(),
                     alias.port);
         leave(name); // an owner whose time was over
         if (!openPort(alias)) {
+            lock.unlock();
             (void)aliases_.release(name); // it says so itself in the log
             return apiError(APIError::kInternal,
                             "the port of the alias cannot be opened: the log of the service says "
@@ -302,14 +318,17 @@ void RelayApi::wait(const Json::Value &params, const Answer &answer) {
 
 Json::Value RelayApi::release(const Json::Value &params) {
     const std::string name = memberString(params, "alias");
+    std::unique_lock lock(mutex_);
     if (agentOf(params) == nullptr) {
         return apiError(APIError::kNoSession, "the token is not, or no longer, valid: enrol anew");
     }
+    lock.unlock();
     if (!aliases_.release(name)) {
         return apiError(APIError::kInternal,
                         "the relay service cannot store that the alias is free: see its log");
     }
     OVRA_NOTICE("The alias [%s] was given up", name.c_str());
+    lock.lock();
     leave(name);
     return apiSuccess();
 }
@@ -330,7 +349,7 @@ bool RelayApi::announce(const std::string &alias, const std::string &caller) {
     const std::lock_guard lock(mutex_);
     const auto found = agents_.find(alias);
     if (found == agents_.end() || !isThere(found->second) ||
-        found->second.callers.size() >= kMaxQueued) {
+        found->second.callers.size() >= limits_.callers) {
         return false;
     }
     Agent &agent = found->second;
@@ -341,16 +360,27 @@ bool RelayApi::announce(const std::string &alias, const std::string &caller) {
     return true;
 }
 
-void RelayApi::endOverdue() {
-    const std::lock_guard lock(mutex_);
-    for (auto &[name, agent] : agents_) {
-        if (agent.waiting && Clock::now() - agent.waitingSince >= OvraPlatform::kFarlinkHold) {
-            deliverCallers(agent, std::exchange(agent.waiting, nullptr));
-        }
-    }
+void RelayApi::dropExpired() {
     for (const Alias &alias : aliases_.dropExpired(std::time(nullptr))) {
         OVRA_NOTICE("The alias [%s] has expired", alias.name.c_str());
+        const std::lock_guard lock(mutex_);
         leave(alias.name);
+    }
+    dropping_ = false;
+}
+
+void RelayApi::endOverdue() {
+    {
+        const std::lock_guard lock(mutex_);
+        for (auto &[name, agent] : agents_) {
+            if (agent.waiting && Clock::now() - agent.waitingSince >= limits_.hold) {
+                deliverCallers(agent, std::exchange(agent.waiting, nullptr));
+            }
+        }
+    }
+    // One at a time: while the disk is slow they must not fill the queue.
+    if (!dropping_.exchange(true) && !changes_.submit([this] { dropExpired(); })) {
+        dropping_ = false;
     }
 }
 

@@ -8,13 +8,16 @@
 #include "tunnel_server.h"
 
 #include <ovrabase/secret.h>
+#include <ovraplatform/farlink.h>
 #include <ovraplatform/wire_form.h>
 
 #include <json/value.h>
 #include <sodium.h>
 
 #include <array>
+#include <atomic>
 #include <chrono>
+#include <cstddef>
 #include <deque>
 #include <map>
 #include <mutex>
@@ -31,7 +34,18 @@ public:
         int tunnelPort = 0;
     };
 
-    RelayApi(AliasRegistry aliases, Settings settings);
+    /// What one client, one appliance and one question may take.
+    struct Limits {
+        std::size_t callsPerMinute = 3000; ///< a busy appliance polls once for each caller
+        std::size_t proofsPerMinute = 30;
+        std::size_t aliasesPerHour = 10;
+        std::size_t callers = 64;           ///< of one appliance, not announced to it yet
+        std::chrono::seconds challenge{60}; ///< how long it can be answered
+        std::chrono::seconds hold = OvraPlatform::kFarlinkHold; ///< of a poll without a caller
+    };
+
+    /// \param aliases  changed by this object alone from now on; must outlive it
+    RelayApi(AliasRegistry &aliases, Settings settings, const Limits &limits);
     RelayApi(const RelayApi &) = delete;
     RelayApi &operator=(const RelayApi &) = delete;
 
@@ -62,8 +76,10 @@ private:
     void handle(OvraService::HttpRequest &request, const Answer &answer);
     Json::Value lookUp(const Json::Value &params);
     Json::Value challenge(const Json::Value &params, const std::string &address);
+    bool isProved(const Json::Value &params) const;
     Json::Value enrol(const Json::Value &params, const std::string &address);
     Json::Value release(const Json::Value &params);
+    void dropExpired();
     void wait(const Json::Value &params, const Answer &answer);
 
     std::string challengeFor(const std::string &alias, const std::string &key,
@@ -76,17 +92,21 @@ private:
     [[nodiscard]] bool openPort(const Alias &alias);
     void leave(const std::string &alias);
 
-    Settings settings_;
+    const Settings settings_;
+    const Limits limits_;
+    AliasRegistry &aliases_; ///< changed by the jobs of changes_ alone
     TunnelServer *tunnelServer_ = nullptr;
     /// Proves that a challenge is ours without storing it.
     OvraBase::SecretBytes<crypto_auth_KEYBYTES> secret_;
-    std::mutex mutex_; ///< of everything below
-    AliasRegistry aliases_;
+    std::mutex mutex_; ///< of the agents and limits; never held while the disk is waited for
     std::map<std::string, Agent> agents_;
     OvraService::RateLimit calls_;
     OvraService::RateLimit proofs_;
     OvraService::RateLimit newAliases_;
-    // Last, so that it is destroyed first: its jobs use everything above.
+    std::atomic<bool> dropping_ = false; ///< expired aliases; queued or in progress
+    // Last, so that they are destroyed first: their jobs use everything above. One thread makes the
+    // changes, which wait for the disk; nothing else does.
+    OvraService::WorkQueue changes_{1, 512};
     OvraService::WorkQueue queue_{2, 512};
 };
 

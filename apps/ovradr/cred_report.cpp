@@ -45,6 +45,12 @@ std::string releaseText(const Release &release, bool foreseen) {
                                : " Nobody tries again: revoke it on the other appliance.");
 }
 
+Refusal busyFailure() {
+    return failure(ExitCode::kFailed,
+                   "Another command changes credentials of the same node and does not end.",
+                   "Nothing was changed. Wait for it or end it, and try again.");
+}
+
 void addRelease(Json::Value &data, const Release &release) {
     data["session"] = OvraApps::releaseWord(release.state);
     if (release.state != Release::State::kLeft) {

@@ -27,4 +27,7 @@ std::string releaseText(const OvraApps::Release &release, bool foreseen);
 /// message) and "retried".
 void addRelease(Json::Value &data, const OvraApps::Release &release);
 
+/// The failure of a flow behind another one that does not end.
+Refusal busyFailure();
+
 } // namespace Ovradr

@@ -128,14 +128,15 @@ private:
             return withExit(direct.error(), ExitCode::kNameUnknown);
         }
         conn_ = *direct;
-        const Expected<std::vector<HostAddress>> found = resolveHost(conn_.addr, conn_.port);
+        const auto found = resolveHost(conn_.addr, conn_.port);
         if (!found) {
             return Refusal(found.error());
         }
         addresses_ = *found;
         std::string text = subject_.conn.isFarlink() ? targetText(conn_) + ": " : "";
-        for (const HostAddress &address : addresses_) {
-            text += (&address == addresses_.data() ? "" : ", ") + address.text;
+        for (const OvraBase::SocketAddress &address : addresses_) {
+            text +=
+                (&address == addresses_.data() ? "" : ", ") + OvraBase::addressText(address.get());
         }
         return text;
     }
@@ -145,9 +146,11 @@ private:
     Expected<std::string> key() {
         const auto met =
             OvraPlatform::peerFingerprint(conn_.protocol, conn_.addr, conn_.port, kKeySeconds);
-        if (met == tl::unexpected(CredError::kTrustUnavailable) ||
-            met == tl::unexpected(CredError::kOutOfMemory)) {
-            return endpointFailure(conn_, met.error());
+        for (const CredError told :
+             {CredError::kTrustUnavailable, CredError::kOutOfMemory, CredError::kTimedOut}) {
+            if (met == tl::unexpected(told)) {
+                return endpointFailure(conn_, told);
+            }
         }
         if (!met) {
             return failure(ExitCode::kNoAppliance,
@@ -281,7 +284,7 @@ private:
     const DiagnosisSubject &subject_;
     Diagnosis &diagnosis_;
     Conn conn_; ///< the direct endpoint
-    std::vector<HostAddress> addresses_;
+    std::vector<OvraBase::SocketAddress> addresses_;
     bool trusted_ = false;
     std::unique_ptr<BaseSender> sender_;
     Response info_;

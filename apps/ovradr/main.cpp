@@ -3,6 +3,8 @@
 #include "command_tree.h"
 #include "output.h"
 
+#include <ovrabase/file.h>
+
 #include <algorithm>
 #include <csignal>
 #include <cstdio>
@@ -94,6 +96,7 @@ int run(int argc, char **argv) {
 } // namespace Ovradr
 
 int main(int argc, char **argv) {
+    OvraBase::fillStandardDescriptors();
     // A vanished reader shows as a failed write.
     std::signal(SIGPIPE, SIG_IGN);
     try {

@@ -5,6 +5,7 @@
 
 #include <ovrabase/expected.h>
 #include <ovrabase/unique_fd.h>
+#include <ovrabase/utf8.h>
 
 #include <fcntl.h>
 #include <poll.h>
@@ -119,6 +120,9 @@ Expected<Secret> readLine(int fd, const std::string &where) {
     }
     if (secret.empty()) {
         return unreadable(where, "its first line is empty");
+    }
+    if (!OvraBase::isUtf8(secret.get()) || secret.get().find('\0') != std::string::npos) {
+        return unreadable(where, "its first line is not text in UTF-8");
     }
     return secret;
 }

@@ -3,29 +3,23 @@
 
 #include "failure.h"
 
+#include <ovrabase/address.h>
 #include <ovradrnode/conn.h>
-
-#include <sys/socket.h>
 
 #include <string>
 #include <vector>
 
 namespace Ovradr {
 
-struct HostAddress {
-    sockaddr_storage address{};
-    socklen_t size = 0;
-    std::string text; ///< as a number
-};
+/// The addresses of a host without duplicates; 10 seconds at most.
+[[nodiscard]] Expected<std::vector<OvraBase::SocketAddress>> resolveHost(const std::string &host,
+                                                                         int port);
 
-/// The addresses of a host without duplicates. Waits as long as the system's resolver does.
-[[nodiscard]] Expected<std::vector<HostAddress>> resolveHost(const std::string &host, int port);
-
-/// Opens a bare TCP connection to the first address that accepts one, and closes it; 10 seconds at
-/// most for all.
+/// Opens a bare TCP connection to the address that accepts one first, as requests do, and closes
+/// it; 10 seconds at most for all.
 /// \param conn  whose addresses they are, for the message
 /// \return the address that was reached.
-[[nodiscard]] Expected<std::string> connectAny(const std::vector<HostAddress> &addresses,
-                                               const OvraDRNode::Conn &conn);
+[[nodiscard]] Expected<std::string>
+connectAny(const std::vector<OvraBase::SocketAddress> &addresses, const OvraDRNode::Conn &conn);
 
 } // namespace Ovradr

@@ -51,6 +51,20 @@ int codeOf(const Json::Value &reply) {
 
 } // namespace
 
+OvraService::WorkQueue &WorkQueues::of(APIQueue queue) {
+    switch (queue) {
+    case APIQueue::kOutbound:
+        return outbound;
+    case APIQueue::kTwoWay:
+        return twoWay;
+    case APIQueue::kRelay:
+        return relay;
+    case APIQueue::kQuick:
+        break;
+    }
+    return quick;
+}
+
 /// A call on its way, and where its reply goes.
 struct CallDispatcher::Call {
     OvraPlatform::WireCall wire;
@@ -92,7 +106,9 @@ void CallDispatcher::serve(OvraService::HttpRequest request,
     });
     if (!taken) {
         OvraBase::wipe(held->body);
-        answer(OvraDRCore::toString(busy()));
+        Call call;
+        call.answer = answer;
+        refuse(call);
     }
 }
 
@@ -170,13 +186,14 @@ void CallDispatcher::route(Call call) {
         login(std::move(call));
         return;
     }
-    if (registry_.queue(call.wire) == APIQueue::kQuick) {
+    const APIQueue queue = registry_.queue(call.wire);
+    if (queue == APIQueue::kQuick) {
         run(call);
         return;
     }
     const auto held = std::make_shared<Call>(std::move(call));
-    if (!queues_.slow.submit([this, held] { run(*held); })) {
-        held->reply(busy());
+    if (!queues_.of(queue).submit([this, held] { run(*held); })) {
+        refuse(*held);
     }
 }
 
@@ -190,7 +207,14 @@ void CallDispatcher::login(Call call) {
     }
     if (!queues_.login.submit([this, held] { run(*held); }, *wait)) {
         loginApi_.withdraw(held->wire.params, held->caller.address);
-        held->reply(busy());
+        refuse(*held);
+    }
+}
+
+/// There is no place for the call.
+void CallDispatcher::refuse(const Call &call) const {
+    if (!stopping_) {
+        call.reply(busy());
     }
 }
 
@@ -212,14 +236,13 @@ Json::Value CallDispatcher::serveLocal(const OvraPlatform::LocalCall &call) {
     caller.user = call.user;
     caller.administrator = true;
     caller.local = true;
-    OvraService::WorkQueue &queue =
-        registry_.queue(call) == APIQueue::kQuick ? queues_.quick : queues_.slow;
-    const bool taken = queue.submit([this, call, caller, promise = promise] {
-        // Without a client the session library would note one in the environment, which threads
-        // must not change.
-        const OvraPlatform::ClientScope scope(kLoopback);
-        promise->set_value(registry_.dispatch(call, caller));
-    });
+    const bool taken =
+        queues_.of(registry_.queue(call)).submit([this, call, caller, promise = promise] {
+            // Without a client the session library would note one in the environment, which threads
+            // must not change.
+            const OvraPlatform::ClientScope scope(kLoopback);
+            promise->set_value(registry_.dispatch(call, caller));
+        });
     if (!taken) {
         return busy();
     }

@@ -21,9 +21,13 @@ namespace Ovradrd {
 struct WorkQueues {
     OvraService::WorkQueue quick{
         4, 512}; ///< reads calls, and runs those that answer from this machine alone
-    OvraService::WorkQueue slow{16, 64}; ///< calls that may wait on the network
+    OvraService::WorkQueue outbound{16, 64};
+    OvraService::WorkQueue twoWay{16, 64};
+    OvraService::WorkQueue relay{8, 64};
     OvraService::WorkQueue login{
         2, 64}; ///< log-ins: each hashes a password, with 64 MiB and a tenth of a second
+
+    OvraService::WorkQueue &of(OvraPlatform::APIQueue queue);
 };
 
 /// The path of a call from arrival to reply: read, unseal, find the session and its rights, choose
@@ -43,6 +47,9 @@ public:
     /// reply. Thread-safe.
     Json::Value serveLocal(const OvraPlatform::LocalCall &call);
 
+    /// From here on leaves remote calls for which there is no place without an answer: "too busy"
+    /// would end the caller's search for another way.
+    void beginStop() { stopping_ = true; }
     /// Stops waiting for local calls in progress; they are answered with a refusal.
     void leaveLocal() { leaving_ = true; }
 
@@ -54,6 +61,7 @@ private:
     [[nodiscard]] bool admit(Call &call);
     void route(Call call);
     void login(Call call);
+    void refuse(const Call &call) const;
     void run(const Call &call) const;
 
     const OvraPlatform::APIRegistry &registry_;
@@ -61,6 +69,7 @@ private:
     OvraPlatform::ReplayGuard &guard_;
     LoginApi &loginApi_;
     WorkQueues &queues_;
+    std::atomic<bool> stopping_ = false;
     std::atomic<bool> leaving_ = false;
 };
 

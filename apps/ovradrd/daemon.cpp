@@ -65,8 +65,10 @@ tl::expected<void, StartError> checkSetUp() {
             return notSetUp(std::string(path) + " is missing");
         }
     }
-    if (OvraDRNode::NodeDBHandler::GetHandler().GetSchemaVersion() < 0) {
-        return notSetUp("the node database cannot be read");
+    auto database = OvraDRNode::NodeDBHandler::GetHandler();
+    if (database.GetSchemaVersion() < 0) {
+        return notSetUp("the node database cannot be read (" + database.GetErrMsg().asString() +
+                        ")");
     }
     return {};
 }
@@ -174,7 +176,7 @@ tl::expected<void, StartError> Daemon::start() {
     self.farlink.emplace([&self](ConnectedClient client) { self.http->adopt(std::move(client)); });
     self.addHandlers();
     self.queues.emplace();
-    self.retries.emplace(self.queues->slow);
+    self.retries.emplace(self.queues->outbound);
     self.dispatcher.emplace(self.registry, *self.keys, self.guard, self.loginApi, *self.queues);
     self.local.emplace(OvraPlatform::kSocketFile, [&self](const LocalCall &call) {
         return self.dispatcher->serveLocal(call);
@@ -213,6 +215,9 @@ bool Daemon::stop() {
     if (self.http) {
         self.http->quiesce();
     }
+    if (self.dispatcher) {
+        self.dispatcher->beginStop();
+    }
     const auto deadline = std::chrono::steady_clock::now() + kGrace;
     bool ended = true;
     if (self.farlink) {
@@ -220,7 +225,9 @@ bool Daemon::stop() {
         ended = self.farlink->stop(std::chrono::steady_clock::now());
     }
     if (self.queues) {
-        for (WorkQueue *queue : {&self.queues->login, &self.queues->slow, &self.queues->quick}) {
+        WorkQueues &queues = *self.queues;
+        for (WorkQueue *queue :
+             {&queues.login, &queues.relay, &queues.twoWay, &queues.outbound, &queues.quick}) {
             ended = queue->stop(deadline) && ended;
         }
     }

@@ -43,8 +43,8 @@ public:
     /// tried. Returns at once.
     void doPeriodicWork();
 
-    /// Ends serving: calls in progress get kGrace, then their callers are told that the daemon
-    /// stops.
+    /// Ends serving: calls in progress get kGrace, then the connections of remote callers end
+    /// without an answer, and local callers are told that the daemon stops.
     /// \return false if calls still run (they wait for another appliance): the process may then
     ///         only leave with _exit(2), at once.
     bool stop();

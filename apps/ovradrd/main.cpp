@@ -5,6 +5,7 @@
 #include "daemon.h"
 #include "version.h"
 
+#include <ovrabase/file.h>
 #include <ovradrcore/log.h>
 #include <ovraplatform/appliance.h>
 
@@ -95,6 +96,7 @@ int serve() {
 } // namespace
 
 int main(int argc, char **argv) {
+    OvraBase::fillStandardDescriptors();
     openlog("ovradrd", LOG_NDELAY, LOG_DAEMON);
     try {
         CLI::App app("The web-API daemon of an appliance", "ovradrd");
@@ -107,6 +109,6 @@ int main(int argc, char **argv) {
         }
         return serve();
     } catch (const std::exception &error) {
-        return fail({ExitCode::kFailed, error.what()});
+        return OvraService::reportStartError("ovradrd", error);
     }
 }

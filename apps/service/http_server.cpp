@@ -114,6 +114,7 @@ struct Exchange {
     std::string document;
     std::string body;
     bool discard = false;           ///< the body is thrown away: the reply is there already
+    bool dropped = false;           ///< the connection ends without a reply
     std::optional<ServedFile> file; ///< what is replied instead of the document
     FilePart part;
 
@@ -124,13 +125,14 @@ struct Exchange {
         discard = true;
     }
 
-    /// Wakes the sleeping connection with the reply; the first one counts.
-    void answer(std::string text) {
+    /// Wakes the sleeping connection with the reply, or to its end; the first one counts.
+    void answer(std::optional<std::string> text) {
         const std::lock_guard lock(mutex);
         if (state != State::kWorking) {
             return;
         }
-        document = std::move(text);
+        dropped = !text;
+        document = std::move(text).value_or("");
         state = State::kAnswered;
         watch->enter(watched, Phase::kReplying);
         MHD_resume_connection(connection);
@@ -350,7 +352,7 @@ void HttpServer::Impl::handOver(Exchange &exchange) {
     // From here on the exchange may be answered, or even destroyed, at any moment.
     const Answer answer = [shared](std::string document) { shared->answer(std::move(document)); };
     if (closing) {
-        answer(errorText(APIError::kTooBusy, "the daemon stops: try again later"));
+        shared->answer(std::nullopt);
         return;
     }
     handler(std::move(request), answer);
@@ -408,6 +410,9 @@ MHD_Result HttpServer::Impl::sendFile(Exchange &exchange) {
 MHD_Result HttpServer::Impl::reply(Exchange &exchange) {
     if (exchange.file) {
         return sendFile(exchange);
+    }
+    if (exchange.dropped) {
+        return MHD_NO;
     }
     connections.enter(exchange.watched, Phase::kReplying);
     const std::unique_ptr<MHD_Response, DestroyResponse> response(MHD_create_response_from_buffer(
@@ -526,7 +531,7 @@ void HttpServer::stop() {
         }
     }
     for (const std::shared_ptr<Exchange> &exchange : underWay) {
-        exchange->answer(errorText(APIError::kTooBusy, "the daemon stops: try again later"));
+        exchange->answer(std::nullopt);
     }
     {
         std::unique_lock lock(impl_->mutex);

@@ -84,10 +84,11 @@ public:
     /// Serves an already connected client like one of the https sockets. In any thread while the
     /// server runs.
     void adopt(ConnectedClient client);
-    /// Accepts no further connections and refuses further requests; those in progress go on.
+    /// Accepts no further connections and ends those of further requests; those in progress go on.
     void quiesce();
-    /// Ends every request still in progress with a refusal, gives the replies half a second to
-    /// leave, and closes all connections.
+    /// Ends the connections of the requests still in progress without an answer, which would be
+    /// taken for the last word on them, gives the other replies half a second to leave, and closes
+    /// all connections.
     void stop();
 
 private:

@@ -1,14 +1,19 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
+#include <ovrabase/address.h>
+
 #include <chrono>
 #include <cstddef>
+#include <iterator>
+#include <list>
 #include <string>
 #include <unordered_map>
 
 namespace OvraService {
 
-/// Limits the events per address in a period. Not thread-safe.
+/// Limits the events of each client (see OvraBase::clientKey()) in a period. Remembers 8,192
+/// clients; for one more it forgets the one whose period began first. Not thread-safe.
 class RateLimit {
 public:
     using TimePoint = std::chrono::steady_clock::time_point;
@@ -19,34 +24,39 @@ public:
 
     /// Counts one event; false, without counting it, if there were too many.
     [[nodiscard]] bool allow(const std::string &address, TimePoint now) {
-        if (windows_.size() >= kMaxAddresses) {
-            forgetOld(now);
+        const std::string client = OvraBase::clientKey(address);
+        const auto found = byClient_.find(client);
+        if (found != byClient_.end() && now - found->second->begin < period_) {
+            return found->second->count < most_ && ++found->second->count > 0;
         }
-        Window &window = windows_[address];
-        if (now - window.begin >= period_) {
-            window = {now, 0};
+        if (found != byClient_.end()) {
+            forget(found->second);
+        } else if (windows_.size() >= kMaxClients) {
+            forget(windows_.begin());
         }
-        return window.count < most_ && ++window.count > 0;
+        windows_.push_back({client, now, 1});
+        byClient_[client] = std::prev(windows_.end());
+        return true;
     }
 
 private:
-    static constexpr std::size_t kMaxAddresses = 8192;
+    static constexpr std::size_t kMaxClients = 8192;
     struct Window {
+        std::string client;
         TimePoint begin;
         std::size_t count = 0;
     };
+    using Windows = std::list<Window>;
 
-    void forgetOld(TimePoint now) {
-        std::erase_if(windows_,
-                      [&](const auto &entry) { return now - entry.second.begin >= period_; });
-        if (windows_.size() >= kMaxAddresses) {
-            windows_.clear(); // rather than refuse every new one
-        }
+    void forget(Windows::iterator window) {
+        byClient_.erase(window->client);
+        windows_.erase(window);
     }
 
     std::size_t most_;
     std::chrono::seconds period_;
-    std::unordered_map<std::string, Window> windows_;
+    Windows windows_; ///< in the order in which they began
+    std::unordered_map<std::string, Windows::iterator> byClient_;
 };
 
 } // namespace OvraService

@@ -8,6 +8,7 @@
 
 #include <algorithm>
 #include <cstdio>
+#include <system_error>
 
 namespace OvraService {
 
@@ -15,6 +16,17 @@ int reportStartError(const char *program, const StartError &why) {
     OVRA_ERR("%s does not start: %s", program, why.text.c_str());
     std::fprintf(stderr, "%s: %s\n", program, why.text.c_str());
     return static_cast<int>(why.exit);
+}
+
+int reportStartError(const char *program, const std::exception &why) {
+    const auto *const system = dynamic_cast<const std::system_error *>(&why);
+    const bool noThread =
+        system != nullptr && system->code() == std::errc::resource_unavailable_try_again;
+    return reportStartError(
+        program, {ExitCode::kFailed,
+                  noThread ? "the system refuses to start a thread: raise the limits of processes "
+                             "and memory (ulimit -u, TasksMax= of the unit)"
+                           : std::string(why.what())});
 }
 
 void raiseDescriptorLimit(unsigned long count) {

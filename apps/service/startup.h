@@ -4,6 +4,7 @@
 #include <ovrabase/expected.h>
 
 #include <csignal>
+#include <exception>
 #include <string>
 
 namespace OvraService {
@@ -31,6 +32,9 @@ struct StartError {
 
 /// Reports on standard error and in the log why `program` does not start. \return its exit status
 int reportStartError(const char *program, const StartError &why);
+
+/// The same for an exception that ended the start, such as a thread that the system refuses.
+int reportStartError(const char *program, const std::exception &why);
 
 /// Raises the soft limit of open file descriptors to `count`, as far as the hard limit allows; a
 /// lower limit is a warning in the log.

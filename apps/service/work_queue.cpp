@@ -74,12 +74,21 @@ void WorkQueue::Impl::work() {
 
 WorkQueue::WorkQueue(unsigned int threads, std::size_t capacity)
     : impl_(std::make_unique<Impl>(capacity)) {
-    for (unsigned int i = 0; i < threads; ++i) {
-        impl_->threads.emplace_back([impl = impl_.get()] { impl->work(); });
+    try {
+        for (unsigned int i = 0; i < threads; ++i) {
+            impl_->threads.emplace_back([impl = impl_.get()] { impl->work(); });
+        }
+    } catch (...) {
+        end();
+        throw;
     }
 }
 
 WorkQueue::~WorkQueue() {
+    end();
+}
+
+void WorkQueue::end() {
     stop({});
     for (std::thread &thread : impl_->threads) {
         thread.join();

@@ -15,6 +15,7 @@ public:
     using Job = std::function<void()>;
     using TimePoint = std::chrono::steady_clock::time_point;
 
+    /// Throws std::system_error if the threads cannot all be started.
     /// \param capacity  how many jobs may wait
     WorkQueue(unsigned int threads, std::size_t capacity);
     WorkQueue(const WorkQueue &) = delete;
@@ -32,6 +33,8 @@ public:
     bool stop(TimePoint deadline);
 
 private:
+    void end();
+
     struct Impl;
     std::unique_ptr<Impl> impl_;
 };

@@ -14,10 +14,10 @@ using OvraPlatform::Statement;
 
 namespace {
 
-// "OvRl".
-constexpr DatabaseLayout kLayout = {"memory of pending releases", 0x4F76526C, 1, R"(
+// "OvRl". Credentials that share a session have a note each, so that none removes another's.
+constexpr DatabaseLayout kLayout = {"memory of pending releases", 0x4F76526C, 2, R"(
     CREATE TABLE release (
-        reference TEXT PRIMARY KEY,
+        reference TEXT NOT NULL,
         session   TEXT NOT NULL,
         addr      TEXT NOT NULL,
         protocol  TEXT NOT NULL,
@@ -27,7 +27,8 @@ constexpr DatabaseLayout kLayout = {"memory of pending releases", 0x4F76526C, 1,
         noted     INTEGER NOT NULL,
         attempts  INTEGER NOT NULL,
         next_try  INTEGER NOT NULL,
-        code      INTEGER NOT NULL
+        code      INTEGER NOT NULL,
+        PRIMARY KEY (reference, cred_id)
     ) STRICT, WITHOUT ROWID;
     CREATE INDEX release_next_try ON release (next_try);
 )"};
@@ -70,8 +71,9 @@ bool PendingReleases::note(const PendingRelease &release) {
     }
     database_.clearError();
     OvraPlatform::Transaction transaction(database_);
-    Statement count = database_.prepare("SELECT count(*) FROM release WHERE reference != ?1");
-    count.bind(1, release.reference());
+    Statement count =
+        database_.prepare("SELECT count(*) FROM release WHERE reference != ?1 OR cred_id != ?2");
+    count.bind(1, release.reference()).bind(2, release.credId);
     if (!transaction.isOpen() || !count.step()) {
         return false;
     }
@@ -81,7 +83,8 @@ bool PendingReleases::note(const PendingRelease &release) {
     }
     Statement insert = database_.prepare(
         "INSERT INTO release (reference, " OVRA_RELEASE_COLUMNS ") VALUES (?1, ?2, ?3, ?4, ?5, "
-        "?6, ?7, ?8, 0, ?9, 0) ON CONFLICT (reference) DO UPDATE SET addr = excluded.addr, "
+        "?6, ?7, ?8, 0, ?9, 0) ON CONFLICT (reference, cred_id) DO UPDATE SET addr = "
+        "excluded.addr, "
         "protocol = excluded.protocol, port = excluded.port, next_try = excluded.next_try");
     insert.bind(1, release.reference())
         .bind(2, release.session)
@@ -95,24 +98,36 @@ bool PendingReleases::note(const PendingRelease &release) {
     return insert.run() && transaction.commit();
 }
 
-bool PendingReleases::postpone(const std::string &reference, int code) {
+bool PendingReleases::postpone(const PendingRelease &release, int code) {
     if (!isOpen()) {
         return false;
     }
     database_.clearError();
     // The pause is computed in the statement: two processes may fail at the same time.
-    Statement update =
-        database_.prepare("UPDATE release SET attempts = attempts + 1, code = ?2, "
-                          "next_try = ?3 + min(?4, ?5 << min(attempts, 20)) WHERE reference = ?1");
-    update.bind(1, reference)
+    Statement update = database_.prepare("UPDATE release SET attempts = attempts + 1, code = ?2, "
+                                         "next_try = ?3 + min(?4, ?5 << min(attempts, 20)) "
+                                         "WHERE reference = ?1 AND cred_id = ?6");
+    update.bind(1, release.reference())
         .bind(2, std::int64_t{code})
         .bind(3, now())
         .bind(4, std::int64_t{kMaxPause})
-        .bind(5, std::int64_t{kFirstPause});
+        .bind(5, std::int64_t{kFirstPause})
+        .bind(6, release.credId);
     return update.run();
 }
 
-bool PendingReleases::remove(const std::string &reference) {
+bool PendingReleases::remove(const PendingRelease &release) {
+    if (!isOpen()) {
+        return false;
+    }
+    database_.clearError();
+    return database_.prepare("DELETE FROM release WHERE reference = ?1 AND cred_id = ?2")
+        .bind(1, release.reference())
+        .bind(2, release.credId)
+        .run();
+}
+
+bool PendingReleases::forget(const std::string &reference) {
     if (!isOpen()) {
         return false;
     }

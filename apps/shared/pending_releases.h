@@ -55,14 +55,18 @@ public:
     /// Why the last operation failed; "" if it succeeded.
     const std::string &error() const { return database_.error(); }
 
+    // A note is known by its session and its credential.
+
     /// Remembers a release before its flow begins, so that a flow that is killed leaves it noted. A
     /// known one gets the new endpoint. \return false on failure, and if there are kMaxReleases
     /// already.
     [[nodiscard]] bool note(const PendingRelease &release);
     /// The release failed once more: it is due again after a pause. \return false on failure.
-    [[nodiscard]] bool postpone(const std::string &reference, int code);
-    /// Forgets the release; a missing one counts as forgotten. \return false on failure.
-    [[nodiscard]] bool remove(const std::string &reference);
+    [[nodiscard]] bool postpone(const PendingRelease &release, int code);
+    /// Removes this note; a missing one counts as removed. \return false on failure.
+    [[nodiscard]] bool remove(const PendingRelease &release);
+    /// Removes every note of a session. \return false on failure.
+    [[nodiscard]] bool forget(const std::string &reference);
     /// All, oldest first. \return false on failure.
     [[nodiscard]] bool list(std::vector<PendingRelease> &releases);
     /// At most `most` of the due ones, the longest due first, including those due later than any

@@ -9,6 +9,7 @@
 #include <ovradrnode/cred_utils.h>
 #include <ovradrnode/node_db.h>
 #include <ovradrnode/node_delete.h>
+#include <ovraplatform/api_errors.h>
 
 #include <optional>
 
@@ -57,9 +58,81 @@ Release lookAfter(const Conn &conn, const std::string &session, Release::State w
 /// Updates the note to what happened to the session.
 void recordOutcome(PendingReleases &store, const PendingRelease &pending, Release &release) {
     release.remembered =
-        release.state == Release::State::kLeft && store.postpone(pending.reference(), release.code);
+        release.state == Release::State::kLeft && store.postpone(pending, release.code);
     if (release.state != Release::State::kLeft) {
-        (void)store.remove(pending.reference()); // what stays is found settled when it is due
+        (void)store.remove(pending); // what stays is found settled when it is due
+    }
+}
+
+PendingRelease noteFor(const DRNode &record, const std::string &session, const Conn &conn) {
+    PendingRelease pending;
+    pending.session = session;
+    pending.conn = conn;
+    pending.nodeId = record.nodeId;
+    pending.credId = record.credId;
+    return pending;
+}
+
+bool readRow(const std::string &credId, bool temporary, DRNode &row) {
+    return temporary ? DRNodeDB::GetTempCred(credId, row) : DRNodeDB::GetCred(credId, row);
+}
+
+/// Runs a flow that makes the session of a row superfluous and releases it if it can.
+/// \param record    the row as read before
+/// \param conn      the endpoint over which the flow releases; invalid: that of the row
+/// \param mustExist  whether the flow needs the row
+template <typename Flow>
+FlowResult runWithRelease(const DRNode &record, bool temporary, const Conn &conn, bool mustExist,
+                          Flow flow) {
+    const auto hadEnded = [&conn](DRNode row) {
+        row.conn = conn.isValid() ? conn : row.conn;
+        return predictRelease(row).state == Release::State::kEndedAlready;
+    };
+    bool ended = hadEnded(record); // takes long if the node is silent, so better without the lock
+    const SessionLock lock(record.nodeId, SessionLock::Purpose::kRelease);
+    FlowResult result;
+    if (lock.isBusy()) {
+        result.state = FlowState::kBusy;
+        return result;
+    }
+    DRNode &row = result.before;
+    if (!readRow(record.credId, temporary, row)) {
+        if (mustExist) {
+            result.state = FlowState::kGone;
+            return result;
+        }
+        row = DRNode();
+    }
+    if (row.session != record.session) {
+        ended = hadEnded(row);
+    }
+    const Conn &over = conn.isValid() ? conn : row.conn;
+    const PendingRelease pending = noteFor(row, row.session, over);
+    PendingReleases store;
+    const bool noted = !row.session.empty() && over.isValid() && store.note(pending);
+    if (!flow()) {
+        // The credential needs its session; a note that stays is found so.
+        (void)store.remove(pending);
+        return result;
+    }
+    result.state = FlowState::kDone;
+    result.release = lookAfter(over, row.session,
+                               ended ? Release::State::kEndedAlready : Release::State::kReleased);
+    if (noted) {
+        recordOutcome(store, pending, result.release);
+    }
+    if (!readRow(record.credId, temporary, result.after)) {
+        result.after = DRNode();
+    }
+    return result;
+}
+
+/// Has a session released later, unless a credential uses it by then.
+void releaseLater(const PendingRelease &pending) {
+    PendingReleases store;
+    if (!pending.session.empty() && !store.note(pending)) {
+        OVRA_ERR("The session [%s] at node [%s] is left behind: end it there",
+                 pending.reference().c_str(), pending.nodeId.c_str());
     }
 }
 
@@ -84,40 +157,51 @@ Release predictRelease(const DRNode &record) {
         .value_or(Release{Release::State::kReleased, 0, {}, false});
 }
 
-FlowResult runWithRelease(const DRNode &record, const Conn &conn,
-                          const std::function<bool()> &flow) {
-    DRNode superfluous = record;
-    superfluous.conn = conn;
-    const bool wasGone = predictRelease(superfluous).state == Release::State::kEndedAlready;
-    const PendingRelease pending{record.session, conn, record.nodeId, record.credId};
-    PendingReleases store;
-    const bool noted = !record.session.empty() && conn.isValid() && store.note(pending);
-    FlowResult result;
-    {
-        const SessionLock lock(SessionLock::Purpose::kRelease);
-        result.done = flow();
+FlowState createCredential(OvraDRNode::CredCreate &flow) {
+    const SessionLock lock(flow.getNode().nodeId, SessionLock::Purpose::kObtain);
+    if (lock.isBusy()) {
+        return FlowState::kBusy;
     }
-    if (!result.done) {
-        // The credential is as it was, and needs its session; a note that stays is found so.
-        (void)store.remove(pending.reference());
-        return {false, {Release::State::kKept, 0, {}, false}};
+    if (flow.processKnownNode()) {
+        return FlowState::kDone;
     }
-    result.release = lookAfter(conn, record.session,
-                               wasGone ? Release::State::kEndedAlready : Release::State::kReleased);
-    if (noted) {
-        recordOutcome(store, pending, result.release);
-    }
-    return result;
+    const DRNode &record = flow.getNode();
+    releaseLater(noteFor(record, record.session, record.conn));
+    return FlowState::kFailed;
+}
+
+FlowResult changeCredential(OvraDRNode::DRNodeCredSet &flow, const DRNode &record,
+                            const Conn &conn) {
+    return runWithRelease(record, false, conn, true, [&] {
+        if (!flow.setCredId(record.credId)) {
+            return false;
+        }
+        if (!flow.process()) {
+            if (flow.IsSessionChanged()) {
+                releaseLater(noteFor(record, flow.getNewSession(), conn));
+            }
+            return false;
+        }
+        if (conn.isFarlink()) {
+            // The flow stores what the alias stands for today. The log says why this fails.
+            (void)DRNodeDB::SetConn(record.credId, conn);
+        }
+        return true;
+    });
 }
 
 FlowResult deleteCredential(const DRNode &record, bool temporary) {
-    return runWithRelease(record, record.conn, [&record, temporary] {
+    return runWithRelease(record, temporary, Conn(), false, [&record, temporary] {
         return temporary ? OvraDRNode::TempCredDelete(record.credId).process()
                          : OvraDRNode::DRNodeCredDelete(record.credId).process();
     });
 }
 
 Release retryRelease(const PendingRelease &pending, PendingReleases &store) {
+    const SessionLock lock(pending.nodeId, SessionLock::Purpose::kRelease);
+    if (lock.isBusy()) {
+        return {Release::State::kLeft, OvraPlatform::APIError::kTooBusy, {}, true};
+    }
     DRNode record;
     const bool inUse = DRNodeDB::GetCred(pending.credId, record) &&
                        record.session == pending.session; // its flow was killed before it changed
@@ -125,7 +209,6 @@ Release retryRelease(const PendingRelease &pending, PendingReleases &store) {
     if (!inUse) {
         const auto now = look(pending.conn, pending.session, "", Release::State::kReleased);
         if (!now) {
-            const SessionLock lock(SessionLock::Purpose::kRelease);
             // Its result is checked below.
             (void)OvraDRNode::CredUtils::NotifyRemoteNodeDeleteSessionIfNotUsed(pending.conn,
                                                                                 pending.session);

@@ -4,9 +4,8 @@
 #include "shared/pending_releases.h"
 
 #include <ovradrnode/dr_node.h>
-
-#include <functional>
-#include <string>
+#include <ovradrnode/node_create.h>
+#include <ovradrnode/node_set.h>
 
 namespace OvraApps {
 
@@ -32,25 +31,45 @@ const char *releaseWord(Release::State state);
 /// the node would be told.
 Release predictRelease(const OvraDRNode::DRNode &record);
 
-struct FlowResult {
-    bool done = false; ///< what the flow answered
-    Release release;
+/// What became of a flow of the library that this appliance's other flows were kept out of.
+enum class FlowState {
+    kDone,
+    kFailed, ///< the flow says why; the credential is as it was
+    kGone,   ///< there is no such credential any more; the flow did not run
+    kBusy,   ///< another flow concerning the same node kept SessionLock; this one did not run
 };
 
-/// Runs a flow of the library that makes the session of `record` superfluous and releases it if it
-/// can, and finds out what happened to the session, which the flow itself does not report. The
-/// release is noted before the flow and stays noted if it failed, even if this process is killed;
-/// if it cannot be noted, the flow runs anyway.
-///
-/// \param conn  the endpoint over which the flow releases
-FlowResult runWithRelease(const OvraDRNode::DRNode &record, const OvraDRNode::Conn &conn,
-                          const std::function<bool()> &flow);
+struct FlowResult {
+    FlowState state = FlowState::kFailed;
+    // With kDone:
+    OvraDRNode::DRNode before; ///< the row that the flow found
+    OvraDRNode::DRNode after;  ///< the row as it is now; empty once deleted
+    Release release;           ///< of the session of `before`, unless `after` has it too
+};
+
+// A flow reads the row again once nobody else can change it. It notes the release of that row's
+// session before it begins and settles the note before anybody else can begin, so that a session
+// stays noted if the release failed, even if this process is killed; if it cannot be noted, the
+// flow runs anyway. Two rows never share a note.
+
+/// Creates a credential with a node that the flow has met (CredCreate::getRemoteNodeInfo()). If the
+/// row cannot be stored, the session that was granted for it is noted.
+[[nodiscard]] FlowState createCredential(OvraDRNode::CredCreate &flow);
+
+/// Changes a lasting credential, and finds out what happened to its previous session, which the
+/// flow itself does not report.
+/// \param flow  has logged in at `conn`
+/// \param conn  the new endpoint; a relay endpoint is stored as such
+FlowResult changeCredential(OvraDRNode::DRNodeCredSet &flow, const OvraDRNode::DRNode &record,
+                            const OvraDRNode::Conn &conn);
 
 /// Deletes a credential, lasting or temporary: its row, then its session on the other node unless
-/// a lasting credential still uses it. `done`: the row is gone, whatever the other node says.
+/// a lasting credential still uses it. kDone: the row is gone, whatever the other node says, or was
+/// gone before.
 FlowResult deleteCredential(const OvraDRNode::DRNode &record, bool temporary);
 
-/// Tries a release that is pending, and forgets or postpones it in the store.
+/// Tries a release that is pending, and removes or postpones its note. Behind a flow that keeps the
+/// lock the note stays as it is (kLeft with 107).
 Release retryRelease(const PendingRelease &pending, PendingReleases &store);
 
 } // namespace OvraApps

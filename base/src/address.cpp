@@ -58,6 +58,11 @@ bool isNumericAddress(const std::string &text) {
     return parseAddress(text, 0).has_value();
 }
 
+bool isIpv6LinkLocal(const std::string &text) {
+    in6_addr binary{};
+    return toBinary(AF_INET6, text, &binary) && IN6_IS_ADDR_LINKLOCAL(&binary);
+}
+
 std::string normalizeIpv6(std::string text) {
     if (text.size() > 2 && text.front() == '[' && text.back() == ']') {
         text = text.substr(1, text.size() - 2);

@@ -228,4 +228,13 @@ Expected<void> FileUpdate::commit(std::string_view content, mode_t modeWhenNew) 
     return {};
 }
 
+void fillStandardDescriptors() {
+    for (const int fd : {STDIN_FILENO, STDOUT_FILENO, STDERR_FILENO}) {
+        // open(2) takes the lowest closed descriptor.
+        if (fcntl(fd, F_GETFD) < 0) {
+            static_cast<void>(open("/dev/null", fd == STDIN_FILENO ? O_WRONLY : O_RDONLY));
+        }
+    }
+}
+
 } // namespace OvraBase

@@ -5,16 +5,29 @@
 #include "clock.h"
 #include "ovradrcore/json.h"
 #include "ovradrcore/log.h"
+#include "refresh_lock.h"
 
+#include <algorithm>
+#include <chrono>
 #include <optional>
+#include <thread>
+#include <vector>
 
 namespace OvraDRCore {
 
 namespace {
 
-/// A refresh probes at most a few endpoints, ten seconds each.
-constexpr long kRefreshWait = 30;
+using std::chrono::microseconds;
+using std::chrono::milliseconds;
+using std::chrono::steady_clock;
+
 constexpr std::int64_t kSecond = 1000;
+constexpr std::int64_t kLongest = Cache::kLongestRefresh * kSecond;
+
+/// Its stamp tells when a refresh of the entry failed last.
+std::string failureOf(const std::string &name) {
+    return name + std::string("\0failed", 7);
+}
 
 struct Stored {
     Json::Value value;
@@ -30,6 +43,59 @@ std::optional<Stored> load(const std::string &path, const std::string &name, int
     stored.age = systemMilliseconds() - entry->end;
     return stored;
 }
+
+/// The waiting of this thread for the refreshes of others.
+class Patience {
+public:
+    void enter() {
+        if (depth_++ == 0) {
+            left_ = milliseconds(kLongest);
+        }
+    }
+    void leave() { --depth_; }
+
+    /// Sleeps for a moment, longer each time. \return false, at once, if there is no time left.
+    bool pause(microseconds &moment) {
+        if (left_ <= left_.zero()) {
+            return false;
+        }
+        constexpr microseconds kLongestMoment{20'000};
+        const auto begin = steady_clock::now();
+        std::this_thread::sleep_for(std::min<steady_clock::duration>(moment, left_));
+        left_ -= steady_clock::now() - begin;
+        moment = std::min(2 * moment, kLongestMoment);
+        return true;
+    }
+
+private:
+    int depth_ = 0;
+    steady_clock::duration left_{};
+};
+
+thread_local Patience patience;
+
+/// An entry that this thread is refreshing, as long as this exists.
+class Refreshing {
+public:
+    Refreshing(const std::string &path, const std::string &name) {
+        keys.push_back(keyOf(path, name));
+    }
+    ~Refreshing() { keys.pop_back(); }
+    Refreshing(const Refreshing &) = delete;
+    Refreshing &operator=(const Refreshing &) = delete;
+
+    static bool is(const std::string &path, const std::string &name) {
+        return std::find(keys.begin(), keys.end(), keyOf(path, name)) != keys.end();
+    }
+
+private:
+    static std::string keyOf(const std::string &path, const std::string &name) {
+        return path + '\0' + name;
+    }
+    static thread_local std::vector<std::string> keys; ///< outermost first
+};
+
+thread_local std::vector<std::string> Refreshing::keys;
 
 } // namespace
 
@@ -67,28 +133,48 @@ Json::Value Cache::Read() const {
     if (isUsable()) {
         return stored->value;
     }
-    RefreshLock lock(path_, name_);
-    if (lock.isHeldHere()) {
+    if (Refreshing::is(path_, name_)) {
         return storedOrDefault();
     }
-    if (lock.isUsable()) {
-        if (!lock.tryAcquire()) {
-            const bool nothingStored = !stored || !IsValid(stored->value);
-            if (!nothingStored && !IsUpdatedDataRequired()) {
+    const std::int64_t arrival = systemMilliseconds();
+    const auto hasFailedMeanwhile = [&] {
+        const auto failure = CacheFile(path_).read(failureOf(name_), count_);
+        return failure && failure->end >= arrival && failure->end <= systemMilliseconds();
+    };
+    const CacheWaitScope scope;
+    RefreshLock lock(path_, name_);
+    RefreshLock::State state = lock.tryAcquire();
+    if (state == RefreshLock::State::kBusy) {
+        const bool presentable = stored && stored->age >= 0 &&
+                                 stored->age <= lifetime_ * kSecond + kLongest &&
+                                 IsValid(stored->value);
+        if (presentable && !IsUpdatedDataRequired()) {
+            return stored->value;
+        }
+        for (microseconds moment{50};
+             state == RefreshLock::State::kBusy && patience.pause(moment);) {
+            state = lock.tryAcquire();
+            if (isUsable()) {
                 return stored->value;
             }
-            if (!lock.acquire(kRefreshWait)) {
-                OVRA_WARN("Waited too long for the refresh of cache entry [%s]", name_.c_str());
+            if (hasFailedMeanwhile()) {
                 return storedOrDefault();
             }
         }
-        // The previous holder of the lock may have stored a fresh value.
-        if (isUsable()) {
-            return stored->value;
+        if (state == RefreshLock::State::kBusy) {
+            OVRA_WARN("Waited too long for the refresh of cache entry [%s], refreshing it here",
+                      name_.c_str());
+            lock.takeOver();
         }
+    } else if (isUsable()) { // the previous holder of the lock may have stored it
+        return stored->value;
     }
     Json::Value value;
-    return refresh(value) ? value : storedOrDefault();
+    const Refresh result = refresh(value);
+    if (isUsable()) { // this value or a younger one
+        return stored->value;
+    }
+    return result == Refresh::kFailed ? storedOrDefault() : value;
 }
 
 Json::Value Cache::GetCachedData() const {
@@ -104,21 +190,31 @@ double Cache::GetCachedAge() const {
 bool Cache::Update() const {
     // Concurrent readers share this refresh; one that another process began earlier may already be
     // out of date, so it is not waited for.
+    const CacheWaitScope scope;
     RefreshLock lock(path_, name_);
-    if (!lock.isHeldHere()) {
-        lock.tryAcquire();
-    }
+    lock.tryAcquire();
     Json::Value value;
-    return refresh(value);
+    return refresh(value) == Refresh::kStored;
 }
 
-bool Cache::refresh(Json::Value &value) const {
-    if (!GetUpdatedData(value)) {
-        return false;
+Cache::Refresh Cache::refresh(Json::Value &value) const {
+    const std::int64_t start = systemMilliseconds();
+    const bool fetched = [&] {
+        const Refreshing mark(path_, name_);
+        return GetUpdatedData(value);
+    }();
+    const std::int64_t now = systemMilliseconds();
+    // The clock may have been set back.
+    const std::int64_t end = now < start ? now : std::min(now, start + kLongest);
+    const CacheFile file(path_);
+    if (!fetched) {
+        file.write({failureOf(name_), "", now, now, 0}, now);
+        return Refresh::kFailed;
     }
-    // Without a usable directory this caller still gets the fresh value.
-    UpdateWithData(value);
-    return true;
+    return file.write({name_, toString(value), start, end, lifetime_ * kSecond},
+                      systemMilliseconds(), CacheFile::Younger::kKeep)
+               ? Refresh::kStored
+               : Refresh::kFetched; // whoever asked has it all the same
 }
 
 bool Cache::UpdateWithData(const Json::Value &value) const {
@@ -137,6 +233,14 @@ bool Cache::UpdateWithData(const Json::Value &value, long start, long end) const
 
 bool Cache::Remove() {
     return CacheFile(path_).remove(name_);
+}
+
+CacheWaitScope::CacheWaitScope() {
+    patience.enter();
+}
+
+CacheWaitScope::~CacheWaitScope() {
+    patience.leave();
 }
 
 } // namespace OvraDRCore

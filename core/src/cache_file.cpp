@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "cache_file.h"
 
+#include "cache_folder.h"
 #include "ovradrcore/log.h"
 
 #include <ovrabase/expected.h>
@@ -10,13 +11,14 @@
 #include <fcntl.h>
 #include <sys/file.h>
 #include <sys/stat.h>
+#include <unistd.h>
 
 #include <algorithm>
 #include <array>
-#include <atomic>
 #include <bit>
 #include <cerrno>
 #include <chrono>
+#include <filesystem>
 
 namespace OvraDRCore {
 
@@ -35,39 +37,6 @@ constexpr std::chrono::milliseconds kLockWait{2000};
 
 using Pair = std::array<std::byte, kPair>;
 
-bool isOursAlone(const struct stat &status) {
-    return status.st_uid == geteuid() && (status.st_mode & (S_IWGRP | S_IWOTH)) == 0;
-}
-
-/// Whether the directory may be trusted. Nobody else can replace it between this check and the
-/// opening of a file in it: its parent folder is sticky or ours.
-bool checkDirectory(const std::string &directory, bool create) {
-    struct stat status {};
-    if (lstat(directory.c_str(), &status) != 0) {
-        if (errno != ENOENT || !create) {
-            return false;
-        }
-        if (mkdir(directory.c_str(), 0700) != 0 && errno != EEXIST) {
-            OVRA_WARN("Failed to create cache directory [%s]: %s", directory.c_str(),
-                      OvraBase::errnoText(errno).c_str());
-            return false;
-        }
-        if (lstat(directory.c_str(), &status) != 0) {
-            return false;
-        }
-    }
-    if (S_ISDIR(status.st_mode) && isOursAlone(status)) {
-        return true;
-    }
-    static std::atomic<bool> reported{false};
-    if (!reported.exchange(true)) {
-        OVRA_ERR("Cache directory [%s] is not a directory of user %u that only he may write; going "
-                 "on without a cache. Remove it",
-                 directory.c_str(), static_cast<unsigned int>(geteuid()));
-    }
-    return false;
-}
-
 /// The number of buckets of a file of this size; 0 if it is not the size of a cache file.
 std::uint32_t bucketsOf(const struct stat &status) {
     const auto size = static_cast<std::uint64_t>(status.st_size);
@@ -76,10 +45,6 @@ std::uint32_t bucketsOf(const struct stat &status) {
                        buckets >= kMinBuckets && buckets <= kMaxBuckets &&
                        std::has_single_bit(buckets);
     return right ? static_cast<std::uint32_t>(buckets) : 0;
-}
-
-UniqueFd openFile(const std::string &path, int flags) {
-    return UniqueFd(open(path.c_str(), flags | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK, 0600));
 }
 
 bool readPair(int fd, std::uint32_t index, Pair &pair) {
@@ -132,13 +97,8 @@ public:
         // Between opening and locking, growing may have replaced the file.
         for (int attempt = 0; attempt < 100; ++attempt) {
             LockedFile file;
-            UniqueFd fd = openFile(path, create ? O_RDWR | O_CREAT : O_RDWR);
+            UniqueFd fd = openOrReplaceCacheFile(path, create ? O_RDWR | O_CREAT : O_RDWR);
             if (!fd) {
-                const bool hostile = errno == ELOOP || errno == EISDIR || errno == ENXIO ||
-                                     errno == EACCES || errno == EPERM;
-                if (create && hostile && discard(path)) {
-                    continue;
-                }
                 return std::nullopt;
             }
             auto locked = LockedFd::lock(std::move(fd), LOCK_EX, kLockWait);
@@ -157,12 +117,6 @@ public:
             file.buckets_ = bucketsOf(status);
             if (file.buckets_ != 0) {
                 return file;
-            }
-            if (!S_ISREG(status.st_mode) || !isOursAlone(status)) {
-                if (!discard(path)) {
-                    return std::nullopt;
-                }
-                continue;
             }
             if (ftruncate(file.fd_.get(), 0) != 0 ||
                 ftruncate(file.fd_.get(), static_cast<off_t>(kMinBuckets * kPair)) != 0) {
@@ -202,8 +156,10 @@ public:
         const std::uint32_t buckets = 2 * buckets_;
         // Only the lock holder gets here, so a left-over of the same name is stale.
         const std::string temporary = path + ".new";
-        unlink(temporary.c_str());
-        auto grown = LockedFd::lock(openFile(temporary, O_RDWR | O_CREAT | O_EXCL), LOCK_EX, {});
+        std::error_code ignored;
+        std::filesystem::remove_all(temporary, ignored);
+        auto grown =
+            LockedFd::lock(openCacheFile(temporary, O_RDWR | O_CREAT | O_EXCL), LOCK_EX, {});
         bool written = grown && ftruncate(grown->get(), static_cast<off_t>(buckets * kPair)) == 0;
         std::uint64_t total = 0;
         for (std::uint32_t index = 0; written && index < buckets_; ++index) {
@@ -243,11 +199,6 @@ private:
                storeCopy(grown, index + buckets_, 0, high.finish(1));
     }
 
-    static bool discard(const std::string &path) {
-        OVRA_WARN("Cache file [%s] is not a file of ours, replacing it", path.c_str());
-        return unlink(path.c_str()) == 0;
-    }
-
     LockedFd fd_;
     std::uint32_t buckets_ = 0;
     std::uint32_t index_ = 0;
@@ -282,10 +233,10 @@ std::size_t CacheFile::maxEntrySize() {
 }
 
 std::optional<CacheEntry> CacheFile::read(std::string_view name, int attempts) const {
-    if (!checkDirectory(OvraBase::folderOf(path_), false)) {
+    if (!checkCacheFolder(OvraBase::folderOf(path_), false)) {
         return std::nullopt;
     }
-    const UniqueFd fd = openFile(path_, O_RDONLY);
+    const UniqueFd fd = openCacheFile(path_, O_RDONLY);
     struct stat status {};
     if (!fd || fstat(fd.get(), &status) != 0) {
         return std::nullopt;
@@ -317,14 +268,14 @@ std::optional<CacheEntry> CacheFile::read(std::string_view name, int attempts) c
     return std::nullopt;
 }
 
-bool CacheFile::write(const CacheEntry &entry, std::int64_t now) const {
+bool CacheFile::write(const CacheEntry &entry, std::int64_t now, Younger younger) const {
     if (entry.name.size() + entry.value.size() > maxEntrySize()) {
         OVRA_WARN("Value of cache entry [%s] in [%s] is too large: %zu bytes, %zu fit",
                   entry.name.c_str(), path_.c_str(), entry.value.size(),
                   maxEntrySize() - std::min(maxEntrySize(), entry.name.size()));
         return false;
     }
-    if (!checkDirectory(OvraBase::folderOf(path_), true)) {
+    if (!checkCacheFolder(OvraBase::folderOf(path_), true)) {
         return false;
     }
     std::optional<LockedFile> file = LockedFile::open(path_, true);
@@ -335,6 +286,12 @@ bool CacheFile::write(const CacheEntry &entry, std::int64_t now) const {
     const std::int64_t oldest = now - kKeepStale;
     Pair pair;
     file->load(entry.name, pair);
+    if (younger == Younger::kKeep && file->copy() != nullptr) {
+        const std::optional<CacheEntry> stored = BucketImage::find(file->copy(), entry.name);
+        if (stored && stored->end > entry.end && stored->end <= now) {
+            return true;
+        }
+    }
     BucketImage image = file->image();
     bool fits = compose(*file, entry, oldest, image);
     while (!fits && file->grow(path_, oldest)) {
@@ -357,7 +314,7 @@ bool CacheFile::write(const CacheEntry &entry, std::int64_t now) const {
 }
 
 bool CacheFile::remove(std::string_view name) const {
-    if (!checkDirectory(OvraBase::folderOf(path_), false)) {
+    if (!checkCacheFolder(OvraBase::folderOf(path_), false)) {
         return true;
     }
     std::optional<LockedFile> file = LockedFile::open(path_, false);
@@ -372,46 +329,6 @@ bool CacheFile::remove(std::string_view name) const {
     BucketImage image = file->image();
     image.copyFrom(file->copy(), name, INT64_MIN / 2);
     return file->store(image);
-}
-
-namespace {
-
-/// The entries that this thread is refreshing, outermost first.
-thread_local std::vector<std::string> refreshing;
-
-} // namespace
-
-RefreshLock::RefreshLock(const std::string &path, const std::string &name)
-    : key_(path + '\0' + name)
-    , offset_(cacheNameHash(name) >> 2) { // an offset must be positive, with room after it
-    if (checkDirectory(OvraBase::folderOf(path), true)) {
-        file_ = openFile(path + ".lock", O_RDWR | O_CREAT);
-    }
-}
-
-RefreshLock::~RefreshLock() {
-    if (held_) {
-        refreshing.pop_back();
-        OvraBase::unlockByte(file_.get(), static_cast<off_t>(offset_));
-    }
-}
-
-bool RefreshLock::isHeldHere() const {
-    return std::find(refreshing.begin(), refreshing.end(), key_) != refreshing.end();
-}
-
-bool RefreshLock::tryAcquire() {
-    return acquire(0);
-}
-
-bool RefreshLock::acquire(long seconds) {
-    if (!file_ || !OvraBase::lockByte(file_.get(), static_cast<off_t>(offset_),
-                                      std::chrono::seconds(seconds))) {
-        return false;
-    }
-    held_ = true;
-    refreshing.push_back(key_);
-    return true;
 }
 
 } // namespace OvraDRCore

@@ -3,13 +3,10 @@
 
 #include "cache_bucket.h"
 
-#include <ovrabase/unique_fd.h>
-
 #include <cstdint>
 #include <optional>
 #include <string>
 #include <string_view>
-#include <vector>
 
 namespace OvraDRCore {
 
@@ -20,8 +17,13 @@ public:
 
     /// \param attempts  reads that may collide with a write before one waits for the lock
     std::optional<CacheEntry> read(std::string_view name, int attempts) const;
+    /// What happens to a stored value that was taken later than the one to write; one with a stamp
+    /// in the future never stays.
+    enum class Younger { kReplace, kKeep };
     /// Adds or replaces; drops long-expired entries of the same bucket.
-    bool write(const CacheEntry &entry, std::int64_t now) const;
+    /// \return whether the file holds the entry, or a younger one that was to be kept.
+    bool write(const CacheEntry &entry, std::int64_t now,
+               Younger younger = Younger::kReplace) const;
     /// True if the entry does not exist afterwards.
     bool remove(std::string_view name) const;
 
@@ -33,31 +35,6 @@ public:
 
 private:
     std::string path_;
-};
-
-/// The right to refresh one entry, held by one process on the appliance at a time: a byte of the
-/// lock file next to the cache file, selected by the entry's name (fcntl(2), open file description
-/// locks). It is released when the process dies.
-class RefreshLock {
-public:
-    RefreshLock(const std::string &path, const std::string &name);
-    ~RefreshLock();
-    RefreshLock(const RefreshLock &) = delete;
-    RefreshLock &operator=(const RefreshLock &) = delete;
-
-    /// This thread is already refreshing this entry, further up the call stack.
-    bool isHeldHere() const;
-    bool tryAcquire();
-    /// Waits at most `seconds`.
-    bool acquire(long seconds);
-    /// There is a directory that all processes can share.
-    bool isUsable() const { return static_cast<bool>(file_); }
-
-private:
-    std::string key_;
-    std::uint64_t offset_;
-    OvraBase::UniqueFd file_;
-    bool held_ = false;
 };
 
 } // namespace OvraDRCore

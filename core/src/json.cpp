@@ -1,18 +1,18 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "ovradrcore/json.h"
 
-#include <json/reader.h>
-#include <json/writer.h>
+#include "json_reader.h"
+#include "json_writer.h"
 
 #include <array>
-#include <memory>
+#include <exception>
 #include <string_view>
+#include <utility>
 
 namespace OvraDRCore {
 
 namespace {
 
-constexpr int kMaxDepth = 200;
 constexpr const char *kMask = "***";
 
 /// Members whose values are login material, at any depth.
@@ -46,38 +46,12 @@ void mask(Json::Value &value, bool secret) {
     }
 }
 
-const Json::StreamWriter::Factory &writerFactory() {
-    static const Json::StreamWriterBuilder builder = [] {
-        Json::StreamWriterBuilder made;
-        made["indentation"] = "";
-        made["commentStyle"] = "None";
-        return made;
-    }();
-    return builder;
-}
-
-const Json::CharReaderBuilder &readerFactory() {
-    static const Json::CharReaderBuilder builder = [] {
-        Json::CharReaderBuilder made;
-        made["allowComments"] = false;
-        made["allowTrailingCommas"] = false;
-        made["collectComments"] = false;
-        made["failIfExtra"] = true;
-        made["rejectDupKeys"] = true;
-        made["stackLimit"] = kMaxDepth;
-        return made;
-    }();
-    return builder;
-}
-
 } // namespace
 
 std::string toString(const Json::Value &value) {
-    // The boolean caches write and read these literals on every request.
-    if (value.isBool()) {
-        return value.asBool() ? "true" : "false";
-    }
-    return Json::writeString(writerFactory(), value);
+    std::string text;
+    writeJson(value, text);
+    return text;
 }
 
 Json::Value maskSecrets(const Json::Value &value) {
@@ -91,24 +65,14 @@ std::string toLogString(const Json::Value &value) {
 }
 
 bool fromString(Json::Value &value, const std::string &text) {
-    if (text == "true" || text == "false") {
-        value = text == "true";
-        return true;
-    }
-    // The reader treats a NUL as the end and would ignore what follows.
-    if (text.find('\0') != std::string::npos) {
-        return false;
-    }
     try {
-        const std::unique_ptr<Json::CharReader> reader(readerFactory().newCharReader());
         Json::Value parsed;
-        std::string errors;
-        if (!reader->parse(text.data(), text.data() + text.size(), &parsed, &errors)) {
+        if (!readJson(text, parsed)) {
             return false;
         }
         value = std::move(parsed);
         return true;
-    } catch (const std::exception &) { // too deep, or out of memory
+    } catch (const std::exception &) { // out of memory
         return false;
     }
 }

@@ -3,9 +3,12 @@
 
 #include "ovradrcore/no_fork.h"
 
+#include <ovrabase/utf8.h>
+
 #include <syslog.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <array>
 #include <cstdarg>
 #include <cstdio>
@@ -41,45 +44,55 @@ std::string_view stemOf(std::string_view path) {
     return name.substr(0, name.find('.'));
 }
 
-__attribute__((format(printf, 1, 0))) std::string vformat(const char *format, va_list args) {
-    va_list measured;
-    va_copy(measured, args);
-    // NOLINTNEXTLINE(clang-analyzer-valist.Uninitialized): the check does not know va_copy
-    const int length = std::vsnprintf(nullptr, 0, format, measured);
-    va_end(measured);
-    if (length <= 0) {
-        return {};
+/// One character as a line shows it: control characters and bytes that are not UTF-8 escaped.
+std::string shown(std::string_view text, const OvraBase::Utf8Character &character) {
+    constexpr std::string_view kMeanings = "\n\r\t";
+    constexpr std::string_view kLetters = "nrt";
+    constexpr char32_t kFirstPrintable = 0xA0; // after DEL and U+0080 to U+009F
+    const bool valid = character.size > 0;
+    const char first = text.front();
+    const std::size_t at = kMeanings.find(first);
+    if (at != std::string_view::npos) {
+        return {'\\', kLetters[at]};
     }
-    std::string text(static_cast<std::size_t>(length), '\0');
-    std::vsnprintf(text.data(), text.size() + 1, format, args);
-    return text;
+    if (valid && ((first >= ' ' && first <= '~') || character.code >= kFirstPrintable)) {
+        return std::string(text.substr(0, character.size));
+    }
+    std::array<char, 8> hex{};
+    const bool wide = valid && character.size > 1;
+    std::snprintf(hex.data(), hex.size(), wide ? "\\u%04x" : "\\x%02x",
+                  wide ? static_cast<unsigned int>(character.code)
+                       : static_cast<unsigned int>(static_cast<unsigned char>(first)));
+    return hex.data();
 }
 
-/// Escapes control characters; truncates long text at a character boundary.
-std::string oneLine(const std::string &text) {
+/// The message as one line of at most kMaxMessage bytes and the note that it was truncated,
+/// whatever bytes it consists of. \param size  of the whole message; `text` is at least the start
+/// that a line can show
+std::string oneLine(std::string_view text, std::size_t size) {
     std::string line;
-    line.reserve(text.size());
-    for (std::size_t i = 0; i < text.size(); ++i) {
-        const auto c = static_cast<unsigned char>(text[i]);
-        if (line.size() >= kMaxMessage && (c & 0xC0U) != 0x80U) {
-            line += "... (" + std::to_string(text.size() - i) + " more bytes)";
-            break;
+    for (std::size_t done = 0; done < size;) {
+        const OvraBase::Utf8Character character = OvraBase::firstUtf8(text.substr(done));
+        const std::string next = shown(text.substr(done), character);
+        if (line.size() + next.size() > kMaxMessage) {
+            return line + "... (" + std::to_string(size - done) + " more bytes)";
         }
-        if (c == '\n') {
-            line += "\\n";
-        } else if (c == '\r') {
-            line += "\\r";
-        } else if (c == '\t') {
-            line += "\\t";
-        } else if (c < 0x20 || c == 0x7F) {
-            std::array<char, 8> hex{};
-            std::snprintf(hex.data(), hex.size(), "\\x%02x", static_cast<unsigned int>(c));
-            line += hex.data();
-        } else {
-            line += text[i];
-        }
+        line += next;
+        done += std::max<std::size_t>(character.size, 1);
     }
     return line;
+}
+
+__attribute__((format(printf, 1, 0))) std::string formatLine(const char *format, va_list args) {
+    // A line shows at least one byte for each byte of the message; the last character may need
+    // more.
+    std::array<char, kMaxMessage + 8> start{};
+    const int length = std::vsnprintf(start.data(), start.size(), format, args);
+    if (length < 0) {
+        return "(a message that is too large)";
+    }
+    const auto size = static_cast<std::size_t>(length);
+    return oneLine({start.data(), std::min(size, start.size() - 1)}, size);
 }
 
 } // namespace
@@ -88,7 +101,7 @@ void logMessage(LogLevel level, const char *file, int line, const char *function
                 const char *format, ...) {
     va_list args;
     va_start(args, format);
-    const std::string message = oneLine(vformat(format, args));
+    const std::string message = formatLine(format, args);
     va_end(args);
     const std::string stem(stemOf(file));
     const NoFork noFork; // syslog(3) has a lock of its own

@@ -2,6 +2,7 @@
 #include "ovradrcore/request.h"
 
 #include "ovradrcore/json.h"
+#include "ovradrcore/log.h"
 
 namespace OvraDRCore {
 
@@ -15,6 +16,15 @@ constexpr const char *kEncrypt = "encrypt";
 
 Json::Value objectOrAsIs(const Json::Value &params) {
     return params.isNull() ? Json::Value(Json::objectValue) : params;
+}
+
+/// The platform's interfaces take names as C strings.
+bool isName(const std::string &text) {
+    return !text.empty() && text.find('\0') == std::string::npos;
+}
+
+bool isTimeout(long seconds) {
+    return seconds >= 1 && seconds <= Request::kMaxResponseTimeout;
 }
 
 } // namespace
@@ -58,13 +68,22 @@ void Request::addParam(const Json::Value &object) {
     }
 }
 
+void Request::setResponseTimeout(long seconds) {
+    responseTimeout_ = seconds;
+    if (!isTimeout(seconds)) {
+        OVRA_ERR("A response time-out of [%ld] seconds is not possible: set 1 to %ld", seconds,
+                 kMaxResponseTimeout);
+    }
+}
+
 void Request::setUpload(const std::string &path, const std::string &name) {
     uploadPath_ = path;
     uploadName_ = name;
 }
 
 bool Request::isValid() const {
-    return !api_.empty() && !method_.empty() && version_ > 0 && params_.isObject();
+    return isName(api_) && isName(method_) && version_ > 0 && params_.isObject() &&
+           isTimeout(responseTimeout_);
 }
 
 Json::Value Request::toJson() const {

@@ -36,6 +36,11 @@ bool areIdentifiers(const SqliteValueList &values) {
     return !values.empty();
 }
 
+/// Empty, which every statement rejects, if the condition says that it is invalid.
+std::string textOf(const SqliteCondition &condition) {
+    return condition.IsValid() ? condition.text : "";
+}
+
 std::string whereClause(bool filtered, const std::string &condition) {
     return filtered ? " WHERE " + condition : "";
 }
@@ -67,7 +72,7 @@ SqliteTableHandler::~SqliteTableHandler() = default;
 SqliteCommand::~SqliteCommand() = default;
 
 void SelectCommand::SetCondition(const SqliteCondition &condition) {
-    SetCondition(condition.text);
+    SetCondition(textOf(condition));
 }
 
 void SelectCommand::SetCondition(const std::string &text) {
@@ -101,12 +106,13 @@ std::string InsertCommand::render(bool masked) const {
     if (!isIdentifier(table()) || !areIdentifiers(values_)) {
         return {};
     }
+    // Appended, not added: g++ 12 at -O3 warns falsely (-Wrestrict) of a literal + a string.
     std::string names;
     std::string literals;
     for (const SqliteValueList::Column &column : values_) {
         const char *separator = names.empty() ? "" : ", ";
-        names += separator + identifier(column.first);
-        literals += separator + literalOf(column, masked);
+        names.append(separator).append(identifier(column.first));
+        literals.append(separator).append(literalOf(column, masked));
     }
     // Appended piece by piece: g++ 12 at -O2 warns falsely (-Wrestrict) of operator+ with a
     // literal.
@@ -124,7 +130,7 @@ void UpdateCommand::AddFieldValue(const std::string &field, int value) {
 }
 
 void UpdateCommand::SetCondition(const SqliteCondition &condition) {
-    SetCondition(condition.text);
+    SetCondition(textOf(condition));
 }
 
 void UpdateCommand::SetCondition(const std::string &text) {

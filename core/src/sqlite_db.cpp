@@ -1,8 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "ovradrcore/sqlite_db.h"
 
-#include "ovradrcore/log.h"
-
 #include <ovrabase/sqlite.h>
 
 #include <sqlite3.h>
@@ -54,8 +52,7 @@ void SqliteDB::Close::operator()(sqlite3 *db) const {
 }
 
 SqliteDB::SqliteDB(const std::string &path, unsigned int busyTime, const std::string &infoTable)
-    : path_(path)
-    , infoTable_(infoTable) {
+    : infoTable_(infoTable) {
     const NoFork noFork;
     OvraBase::SqliteHandle database;
     // The first statement reports a failure to open.
@@ -70,7 +67,6 @@ SqliteDB::~SqliteDB() = default;
 
 bool SqliteDB::fail(const std::string &what) const {
     SetErr(ERR::kFailed, what);
-    OVRA_WARN("Failed to use database [%s]: %s", path_.c_str(), what.c_str());
     return false;
 }
 
@@ -146,7 +142,10 @@ int SqliteDB::GetSchemaVersion() {
     select.SetTable(SqliteTableHandler(infoTable_, ""));
     SqliteValueList row;
     int version = -1;
-    return SelectRecord(select, row) && row.GetValue("version", version) ? version : -1;
+    if (SelectRecord(select, row) && !row.GetValue("version", version)) {
+        fail("it holds no schema version");
+    }
+    return version;
 }
 
 } // namespace OvraDRCore

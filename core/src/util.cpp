@@ -8,7 +8,6 @@
 #include <array>
 #include <cerrno>
 #include <cstdio>
-#include <sstream>
 
 namespace OvraDRCore {
 
@@ -33,9 +32,7 @@ std::string GenerateUUID() {
 
 template <>
 std::string ToString<int>(const int &value) {
-    std::ostringstream stream;
-    stream << value;
-    return stream.str();
+    return std::to_string(value); // a stream would group the digits as the caller's locale does
 }
 
 namespace File {

@@ -19,7 +19,10 @@ namespace OvraDRNode {
 /// Has a remote node create a credential for this one, over a credential that this node holds: the
 /// remote picks one of the offered endpoints, gets a short-lived local session, and creates its
 /// credential from both. setCredId(), setLocalAccount(), addLocalConns(), then check() or
-/// process(). Nothing is written here; the temporary session is always deleted again.
+/// process(). Nothing is written here. The temporary session is deleted again before process() or
+/// check() returns, and ends by itself after 300 seconds. If the remote node's answer is lost, it
+/// may have created its credential all the same: NodeSession has the session that it got for it.
+/// Takes no lock, see CredCreate.
 class OVRADRNODE_EXPORT CredReverseCreate : public OvraDRCore::ErrRecorder {
 public:
     ~CredReverseCreate() override;

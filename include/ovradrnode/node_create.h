@@ -19,6 +19,13 @@ namespace OvraDRNode {
 /// stores the record. Construct, call one setCred() overload, then process() (or check()); on false
 /// read GetErr(). Nothing is written locally before the last step; if that step fails, the session
 /// that the remote granted is not released.
+///
+/// The flows for credentials take no lock: none knows of another one, in this process or another,
+/// that concerns the same node. The remote node hands out the previous session of node and account
+/// as long as it has it, so a caller with several flows at once has to keep a creation apart from
+/// whatever may release a session, and every change and deletion apart from all others, each from
+/// its first look at the row. Otherwise a stored session may be released, or one that nothing uses
+/// stay on the remote node.
 class OVRADRNODE_EXPORT CredCreate : public OvraDRCore::ErrRecorder {
 public:
     ~CredCreate() override;

@@ -48,9 +48,10 @@ public:
     static NodeDBHandler GetHandler();
 };
 
-/// Access to the node database. Every operation opens it for one statement and closes it again; a
-/// failure returns false and logs an ERR line. The local node has no row: for its id
-/// DRNode::getLocalNode() is returned.
+/// Access to the node database. Every operation opens it for one statement and closes it again.
+/// False means a failure; an invalid argument, a list or a change that fails logs an ERR line, a
+/// single credential that cannot be read does not. The local node has no row: for its id
+/// DRNode::getLocalNode() is returned. What a record held before it is filled is lost.
 class OVRADRNODE_EXPORT DRNodeDB {
 public:
     /// Which credential tables to read, a bit set; both: node credentials first.

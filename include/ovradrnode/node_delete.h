@@ -8,7 +8,8 @@
 namespace OvraDRNode {
 
 /// Deletes a node credential: first the row, then, if no other credential uses it, the session on
-/// the remote node. A remote node that does not answer never blocks the deletion.
+/// the remote node. A remote node that does not answer never blocks the deletion; it keeps the
+/// session. Takes no lock, see CredCreate.
 class OVRADRNODE_EXPORT DRNodeCredDelete {
 public:
     explicit DRNodeCredDelete(const std::string &credId);

@@ -14,7 +14,8 @@ namespace OvraDRNode {
 
 /// Changes a node credential: a new login, possibly over another endpoint, to the same node. The
 /// row is rewritten first; then a session that nothing uses any more is released. Construct with
-/// the credential id, setCred(), process().
+/// the credential id, setCred(), process(). Takes no lock, see CredCreate: the session that is
+/// released is that of the row as setCredId() read it.
 class OVRADRNODE_EXPORT DRNodeCredSet : public OvraDRCore::ErrRecorder {
 public:
     DRNodeCredSet() = default;
@@ -30,6 +31,9 @@ public:
     [[nodiscard]] bool setCred(const Conn &conn, const std::string &account,
                                const std::string &password, const std::string &otp);
     bool IsSessionChanged() const;
+    /// The session that the remote node granted for this change, a secret; "" before
+    /// requestRemoteSession().
+    const std::string &getNewSession() const { return newSession; }
     /// Whether the new login reaches the node that the credential belongs to (518 if another).
     [[nodiscard]] bool check();
     [[nodiscard]] bool checkRemoteNodeInfo();

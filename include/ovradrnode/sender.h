@@ -33,7 +33,8 @@ public:
 
     /// Runs `request` on the local appliance with the administrator's rights.
     [[nodiscard]] static OvraDRCore::Response run(const OvraDRCore::Request &request);
-    /// Probes the endpoint now (at most 10 seconds) and records the verdict for all processes.
+    /// Probes the endpoint now (at most 10 seconds) and records the verdict for all processes,
+    /// except if this one has no memory, descriptor or thread left.
     [[nodiscard]] static bool IsConnectable(const Conn &conn);
     /// The recorded verdict; probes only if that is older than 5 seconds.
     static bool GetCachedConnectable(const Conn &conn);
@@ -148,7 +149,10 @@ private:
 };
 
 /// Sends to a node: locally if it is the local one, otherwise over the credential that worked last,
-/// then over every other credential of the node, until one succeeds.
+/// then over every other credential of the node, until one succeeds. Within one process() an
+/// endpoint that did not answer is not asked again. If none succeeds, the error is that of the last
+/// attempt; but 500, "nothing was sent", only if no attempt can have arrived: otherwise that one's
+/// 524.
 class OVRADRNODE_EXPORT NodeSender : public BaseSender {
 public:
     ~NodeSender() override;
@@ -161,7 +165,7 @@ public:
     [[nodiscard]] bool setNode(const std::string &id);
     [[nodiscard]] bool setNode(const DRNode &node);
     /// Builds the request, sends it to `nodeId` and copies the answer's data into `out`.
-    /// \return whether an answer came; an error answer gives the empty object.
+    /// \return whether an answer came; `out` is null if it was an error, or none came.
     [[nodiscard]] static bool process(const std::string &nodeId, const std::string &api,
                                       const std::string &method, int version,
                                       const Json::Value &params, Json::Value &out);

@@ -15,7 +15,7 @@ fail() {
 
 # needProgram PROGRAM PACKAGE: fails with the Debian package to install if PROGRAM is missing.
 needProgram() {
-    command -v "$1" >/dev/null || fail "$1 is missing; install the Debian package $2 (make deps does it)"
+    command -v "$1" >/dev/null || fail "$1 is missing; install the Debian package $2 (scripts/install-deps lab does it)"
 }
 
 # newId: 64 random bits as 16 hexadecimal digits. Every process of a lab has its id in the

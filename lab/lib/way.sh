@@ -58,7 +58,7 @@ pickWay() {
         return
     fi
     # shellcheck disable=SC2034 # read by the callers
-    labWhy="this machine refuses namespaces, and proot is missing or may not trace: install the Debian packages bubblewrap and proot (make deps), or allow one of the two"
+    labWhy="this machine refuses namespaces, and proot is missing or may not trace: install the Debian packages bubblewrap and proot (scripts/install-deps lab does it), or allow one of the two"
     return 1
 }
 

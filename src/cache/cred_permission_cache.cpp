@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "ovradrnode/cred_permission_cache.h"
 
+#include "library_errors.h"
 #include "ovradrnode/node_api.h"
 #include "ovradrnode/sender.h"
 #include "paths.h"
@@ -40,7 +41,8 @@ bool CredPermissionCache::GetUpdatedData(Json::Value &value) const {
     }
     CredNodeSender sender(credId);
     value = sender.process(WebAPI::getDRNodeTestPrivilegeAPI()).isSuccess();
-    return true;
+    return sender.GetErrCode() != OvraDRCore::ERR::kCredLibrary ||
+           sender.GetErrMsg() != LibraryError::kOutOfMemory; // that says nothing about the right
 }
 
 bool CredPermissionCache::IsValid(const Json::Value &value) const {

@@ -49,8 +49,9 @@ void listNodes(const std::string &nodeId, std::vector<DRNode> &nodes, DRNodeDB::
     }
 }
 
-/// Reads one row, whether or not the record is valid.
+/// Reads one row, whether or not the record is valid. A column that holds nothing stays empty.
 bool readCred(const SqliteTableHandler &table, const std::string &credId, DRNode &node) {
+    node = DRNode();
     SelectCommand command;
     command.SelectAll();
     command.SetTable(table);
@@ -100,7 +101,8 @@ bool DRNodeDB::ListCred(const std::string &nodeId, std::vector<DRNode> &nodes, C
 }
 
 bool DRNodeDB::Get(const std::string &nodeId, DRNode &node) {
-    if (!node.setNodeId(nodeId)) {
+    DRNode idOnly;
+    if (!idOnly.setNodeId(nodeId)) {
         OVRA_ERR("Bad node Id[%s]", nodeId.c_str());
         return false;
     }
@@ -112,9 +114,7 @@ bool DRNodeDB::Get(const std::string &nodeId, DRNode &node) {
     if (!ListCred(nodeId, nodes, CRED_TYPE_NODE)) {
         return false;
     }
-    if (!nodes.empty()) {
-        node = nodes.front();
-    }
+    node = nodes.empty() ? idOnly : nodes.front();
     return true;
 }
 

@@ -184,6 +184,13 @@ bool setLoginOptions(OvraCgi *handle, int timeout) {
            OvraCgiSetOption(handle, OVRA_CGI_OPT_TIMEOUT, &timeout) != 0;
 }
 
+/// Whether a session tied to the node is found again. One that is not (the id is no UTF-8, or too
+/// long) would be made anew with every call.
+bool isTraceable(const std::string &nodeId) {
+    const std::string extra = NodeSession::ExtraOf(nodeId);
+    return extra.size() < kFieldSize && NodeSession::NodeIdOf(extra) == nodeId;
+}
+
 /// \param timeout  seconds; negative: none
 /// \param nodeId   may be empty
 std::string CgiLogin(const std::string &userName, int timeout, const std::string &nodeId) {
@@ -205,9 +212,7 @@ std::string CgiLogin(const std::string &userName, int timeout, const std::string
         }
     }
     if (!nodeId.empty()) {
-        Json::Value extra(Json::objectValue);
-        extra[Word::kNodeId] = nodeId;
-        const std::string text = OvraDRCore::toString(extra);
+        const std::string text = NodeSession::ExtraOf(nodeId);
         if (OvraCgiSetOption(handle.get(), OVRA_CGI_OPT_EXTRA, text.c_str()) == 0) {
             OVRA_WARN("Failed to set extra opt[%s] of user[%s] login", text.c_str(),
                       userName.c_str());
@@ -241,9 +246,15 @@ std::string NodeSession::NodeIdOf(const std::string &extra) {
                                                  : "";
 }
 
+std::string NodeSession::ExtraOf(const std::string &nodeId) {
+    Json::Value extra(Json::objectValue);
+    extra[Word::kNodeId] = nodeId;
+    return OvraDRCore::toString(extra);
+}
+
 std::string NodeSession::CreateNodeSession(const std::string &nodeId, const std::string &userName) {
     SetErr(ERR::kFailed);
-    if (nodeId.empty() || userName.empty()) {
+    if (nodeId.empty() || userName.empty() || !isTraceable(nodeId)) {
         OVRA_ERR("Bad nodeId[%s] / userName[%s]", nodeId.c_str(), userName.c_str());
         SetErr(ERR::kBadParameter);
         return {};

@@ -2,7 +2,9 @@
 #define OVRA_LOG_FILE "sender"
 #include "transport/conn_cache.h"
 
+#include "library_errors.h"
 #include "paths.h"
+#include "transport/request_scope.h"
 #include "words.h"
 
 #include <ovracredential/cred_request.h>
@@ -52,6 +54,10 @@ ProbeResult IsConnectableWithErrCheck(const Conn &conn) {
                std::difftime(std::time(nullptr), start));
     OVRA_NOTICE("Conn [%s] is not connectable since cred error[%d]", text(conn).c_str(),
                 request.GetError());
+    if (request.GetError() == LibraryError::kOutOfMemory) {
+        return {false, true, true};
+    }
+    RequestScope::noteUnreachable(conn);
     return {false, true};
 }
 
@@ -73,6 +79,11 @@ bool ConnCache::getStoredVerdict() const {
     return !IsValid(stored) || stored.asBool();
 }
 
+bool ConnCache::isHeldUnreachable() const {
+    const double age = GetCachedAge();
+    return age >= 0 && age <= static_cast<double>(kLifetime) && !getStoredVerdict();
+}
+
 void ConnCache::logChange(const char *function, bool oldVerdict, bool newVerdict) const {
     if (oldVerdict != newVerdict) {
         OVRA_LOG_IN(OvraDRCore::LogLevel::kNotice, function,
@@ -85,7 +96,7 @@ bool ConnCache::GetUpdatedData(Json::Value &value) const {
     const ProbeResult probe = IsConnectableWithErrCheck(conn);
     value = probe.connectable;
     const bool old = getStoredVerdict();
-    if (!probe.ran) {
+    if (!probe.ran || probe.lacked) {
         return false;
     }
     logChange(__func__, old, probe.connectable);

@@ -24,6 +24,8 @@ public:
 
     /// The stored verdict, however old; true if there is none.
     bool getStoredVerdict() const;
+    /// Whether the stored verdict is fresh and says that the endpoint does not answer.
+    bool isHeldUnreachable() const;
     /// Logs a changed verdict under the name `function`.
     void logChange(const char *function, bool oldVerdict, bool newVerdict) const;
 
@@ -36,6 +38,8 @@ struct ProbeResult {
     bool connectable = false;
     /// False: the probe could not be set up, which says nothing about the endpoint.
     bool ran = true;
+    /// True: this process had no memory, descriptor or thread left, which says nothing either.
+    bool lacked = false;
 };
 
 /// Probes the web-API entry point of the endpoint for any answer; sends no secret; waits 10 seconds

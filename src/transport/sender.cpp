@@ -2,12 +2,14 @@
 #include "ovradrnode/sender.h"
 
 #include "transport/conn_cache.h"
+#include "transport/request_scope.h"
 #include "words.h"
 
 #include <ovradrcore/json.h>
 #include <ovradrcore/log.h>
 #include <ovrawebapi/api_runner.h>
 
+#include <algorithm>
 #include <ctime>
 #include <utility>
 
@@ -40,18 +42,29 @@ OvraDRCore::ErrRecorder errorOf(const OvraDRCore::ErrRecorder &sender, const Res
 bool BaseSender::IsConnectable(const Conn &conn) {
     const std::time_t start = std::time(nullptr);
     const ProbeResult probe = IsConnectableWithErrCheck(conn);
-    const std::time_t end = std::time(nullptr);
+    const std::time_t now = std::time(nullptr);
+    // A process that was stopped in its probe has old news, and other processes may know better.
+    const std::time_t end = std::min(now, start + OvraDRCore::Cache::kLongestRefresh);
     if (!probe.ran) {
         OVRA_NOTICE("Failed to check connectable of conn[%s]",
                     OvraDRCore::toString(conn.toJson()).c_str());
     }
+    if (probe.lacked) {
+        return false;
+    }
     const ConnCache cache(conn);
     cache.logChange(__func__, cache.getStoredVerdict(), probe.connectable);
-    cache.UpdateWithData(probe.connectable, start, end);
+    const double age = cache.GetCachedAge();
+    if (end == now || age < 0 || age > std::difftime(now, end)) {
+        cache.UpdateWithData(probe.connectable, start, end);
+    }
     return probe.connectable;
 }
 
 bool BaseSender::GetCachedConnectable(const Conn &conn) {
+    if (RequestScope::isUnreachable(conn)) {
+        return false;
+    }
     const ConnCache cache(conn);
     const Json::Value verdict = cache.Read();
     return !cache.IsValid(verdict) || verdict.asBool();

@@ -3,8 +3,10 @@
 
 // Senders over one endpoint and one credential.
 
+#include "library_errors.h"
 #include "ovradrnode/sender.h"
 #include "transport/conn_cache.h"
+#include "transport/request_scope.h"
 
 #include <ovracredential/cred_request.h>
 #include <ovradrcore/json.h>
@@ -20,12 +22,6 @@ using OvraDRCore::Request;
 using OvraDRCore::Response;
 
 namespace {
-
-/// Error numbers of the credential library that have their own code.
-constexpr int kLibraryNoPermission = 4;
-constexpr int kLibraryCannotConnect = 5;
-constexpr int kLibraryCertificate = 6;
-constexpr int kLibraryTimedOut = 10;
 
 constexpr int kSealParameters = 2;
 constexpr int kSend = 0;
@@ -43,6 +39,13 @@ std::string text(const Conn &conn) {
 int loginError(int remoteCode) {
     const bool listed = remoteCode >= kFirstLoginCode && remoteCode <= kLastLoginCode;
     return listed ? ERR::kLoginFailed + (remoteCode - kFirstLoginCode) : ERR::kLoginFailed;
+}
+
+/// Hands a text to the credential library, unless it would be cut at a NUL. \return whether it took
+/// it
+template <typename Object>
+bool setItem(int (*set)(Object *, const char *), Object *object, const std::string &item) {
+    return item.find('\0') == std::string::npos && set(object, item.c_str()) == 0;
 }
 
 } // namespace
@@ -75,8 +78,8 @@ bool BaseCredSender::initConn() const {
         SetErr(ERR::kBadParameter, "conn");
         return false;
     }
-    if (OVRACredItemSetProtocol(cred, conn.protocol.c_str()) != 0 ||
-        OVRACredItemSetHost(cred, conn.addr.c_str()) != 0 ||
+    if (!setItem(OVRACredItemSetProtocol, cred, conn.protocol) ||
+        !setItem(OVRACredItemSetHost, cred, conn.addr) ||
         OVRACredItemSetPort(cred, conn.port) != 0) {
         SetErr(ERR::kCredItemRefused);
         return false;
@@ -135,20 +138,24 @@ void BaseCredSender::SetCredRequestError(OVRA::CredRequest &request) const {
     }
     OVRA_NOTICE("cred error [%d]", error);
     switch (error) {
-    case kLibraryNoPermission:
+    case LibraryError::kNoPermission:
         SetErr(ERR::kNoPrivilege);
         return;
-    case kLibraryCertificate:
+    case LibraryError::kCertificate:
         SetErr(ERR::kCertificateChanged);
         return;
-    case kLibraryCannotConnect:
-    case kLibraryTimedOut: {
+    case LibraryError::kCannotConnect:
+    case LibraryError::kTimedOut: {
         SetErr(ERR::kNotConnectable);
+        RequestScope::noteUnreachable(conn);
         const ConnCache cache(conn);
         cache.logChange(__func__, cache.getStoredVerdict(), false);
         cache.UpdateWithData(false);
         return;
     }
+    case LibraryError::kUnanswered:
+        RequestScope::noteUnreachable(conn);
+        [[fallthrough]];
     default:
         SetErr(ERR::kCredLibrary, error);
     }
@@ -223,7 +230,7 @@ Response BaseCredSender::process(const Request &request) {
     Response response;
     CallTexts texts(request, conn);
     if (!request.isValid()) {
-        SetErr(ERR::kBadParameter, OvraDRCore::maskSecrets(request.toJson()));
+        SetErr(ERR::kBadParameter, request.toJson());
         OVRA_ERR("Invalid api");
     } else if (!isValid()) {
         SetErr(ERR::kBadParameter);
@@ -289,8 +296,8 @@ bool CredAccountSender::initCred() {
         OVRA_ERR("Bad parameter of credHost [%s]", conn.addr.c_str());
         return false;
     }
-    if (OVRACredItemSetRemoteAccount(cred, account.c_str()) != 0 ||
-        OVRACredItemSetRemotePasswd(cred, passwd.c_str()) != 0) {
+    if (!setItem(OVRACredItemSetRemoteAccount, cred, account) ||
+        !setItem(OVRACredItemSetRemotePasswd, cred, passwd)) {
         SetErr(ERR::kCredItemRefused);
         OVRA_ERR("Failed to set the credential infomation of host [%s]", account.c_str());
         return false;
@@ -356,7 +363,7 @@ bool CredSessionSender::initCred() {
         OVRA_ERR("Bad parameter [%s]", session.c_str());
         return false;
     }
-    if (OVRACredSessItemSetAccessToken(credSess, session.c_str()) != 0) {
+    if (!setItem(OVRACredSessItemSetAccessToken, credSess, session)) {
         SetErr(ERR::kCredItemRefused);
         OVRA_ERR("Failed to set the credential session of host [%s]", conn.addr.c_str());
         return false;

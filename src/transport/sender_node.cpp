@@ -3,10 +3,13 @@
 
 // Senders to a node: which credential is used, and what is recorded from the answer.
 
+#include "library_errors.h"
 #include "ovradrnode/cred_permission_cache.h"
 #include "ovradrnode/node_db.h"
 #include "ovradrnode/sender.h"
+#include "transport/conn_cache.h"
 #include "transport/node_valid_cred_cache.h"
+#include "transport/request_scope.h"
 
 #include <ovradrcore/json.h>
 #include <ovradrcore/log.h>
@@ -33,6 +36,24 @@ bool isNoPermission(const Response &response) {
 /// the same answer.
 bool hasGotThrough(const Response &response) {
     return response.isValid() && !isNoPermission(response);
+}
+
+/// Whether an attempt failed with this number of those that are only passed on.
+bool failedWith(const OvraDRCore::ErrRecorder &attempt, int libraryError) {
+    return attempt.GetErrCode() == ERR::kCredLibrary && attempt.GetErrMsg() == libraryError;
+}
+
+/// Whether the request may have been carried out although no answer came.
+bool mayHaveArrived(const OvraDRCore::ErrRecorder &attempt) {
+    return failedWith(attempt, LibraryError::kConnectionLost) ||
+           failedWith(attempt, LibraryError::kUnanswered);
+}
+
+/// Whether a relay endpoint is known not to answer, so that the relay service need not be asked
+/// where it is; the sender itself looks at all others.
+bool isHeldUnreachable(const Conn &conn) {
+    return conn.isFarlink() &&
+           (RequestScope::isUnreachable(conn) || ConnCache(conn).isHeldUnreachable());
 }
 
 bool isLocal(const DRNode &node) {
@@ -64,6 +85,7 @@ bool NodeSender::setNode(const DRNode &node) {
 }
 
 Response NodeSender::process(const Request &request) {
+    const RequestScope scope;
     SetErr(ERR::kNone);
     Response response;
     if (!request.isValid()) {
@@ -78,18 +100,30 @@ Response NodeSender::process(const Request &request) {
     if (processByCredId(remembered, request, response)) {
         return response;
     }
+    const bool tried = GetErrCode() != ERR::kCredNotFound; // else its row could not be read
+    OvraDRCore::ErrRecorder arrived;                       // of an attempt whose request may have
+    const auto noteArrival = [this, &arrived] {
+        if (mayHaveArrived(*this)) {
+            arrived.SetErr(this);
+        }
+    };
+    noteArrival();
     std::vector<DRNode> nodes;
     if (!DRNodeDB::ListCred(nodeId, nodes, kAllCreds)) {
         return {};
     }
     for (const DRNode &node : nodes) {
-        if (node.credId == remembered) {
-            continue; // already tried; its error stays unless another attempt follows
+        if (tried && node.credId == remembered) {
+            continue; // its error stays unless another attempt follows
         }
         SetErr(ERR::kNone);
         if (processByCred(node, request, response)) {
             break;
         }
+        noteArrival();
+    }
+    if (GetErrCode() == ERR::kNotConnectable && arrived.GetErrCode() != ERR::kNone) {
+        SetErr(&arrived); // "not connectable" would say that nothing was sent
     }
     return response;
 }
@@ -138,6 +172,7 @@ bool NodeSender::processByCred(const DRNode &node, const Request &request, Respo
 }
 
 std::string NodeSender::getValidCredId() const {
+    const RequestScope scope;
     std::vector<DRNode> nodes;
     if (nodeId.empty() || DRNode::isLocalNodeId(nodeId) ||
         !DRNodeDB::ListCred(nodeId, nodes, DRNodeDB::CRED_TYPE_NODE)) {
@@ -157,6 +192,7 @@ std::string NodeSender::getCachedCredId() const {
 }
 
 bool NodeSender::isConnectable() const {
+    const OvraDRCore::CacheWaitScope waits;
     const std::string id = getValidCredId();
     if (!id.empty()) {
         return BaseSender::IsConnectable(CredNodeSender(id).getNode().conn);
@@ -165,8 +201,9 @@ bool NodeSender::isConnectable() const {
     if (!DRNodeDB::ListCred(nodeId, nodes, DRNodeDB::CRED_TYPE_NODE)) {
         return false;
     }
+    const RequestScope scope;
     for (const DRNode &node : nodes) {
-        if (node.credId != id && BaseSender::IsConnectable(node.conn)) {
+        if (!RequestScope::isUnreachable(node.conn) && BaseSender::IsConnectable(node.conn)) {
             return true;
         }
     }
@@ -221,10 +258,22 @@ Response CredNodeSender::process(const Request &request) {
         SetErr(ERR::kCredInvalid);
         return {};
     }
+    if (isHeldUnreachable(node.conn)) {
+        SetErr(ERR::kNotConnectable, node.conn.toJson());
+        OVRA_NOTICE("Failed to send req [%s] since cache [%s] not connectable",
+                    OvraDRCore::toLogString(request.toJson()).c_str(),
+                    OvraDRCore::toString(node.conn.toJson()).c_str());
+        return {};
+    }
     SetErr(ERR::kFailed);
     CredSessionSender sender(node.conn, node.session);
+    if (!sender.getConn().isValid()) {
+        RequestScope::noteUnreachable(node.conn); // the relay service does not say where it is
+    }
     Response response = sender.process(request);
-    CredPermissionCache(node.credId).SetPrivilege(request, hasGotThrough(response));
+    if (!failedWith(sender, LibraryError::kOutOfMemory)) {
+        CredPermissionCache(node.credId).SetPrivilege(request, hasGotThrough(response));
+    }
     if (sender.GetErrCode() != ERR::kNone) {
         SetErr(&sender);
     } else {
@@ -234,6 +283,7 @@ Response CredNodeSender::process(const Request &request) {
 }
 
 bool CredNodeSender::testPrivilege() {
+    const OvraDRCore::CacheWaitScope scope;
     SetErr(ERR::kFailed);
     if (!node.isValid()) {
         SetErr(ERR::kCredInvalid);

@@ -6,151 +6,177 @@
 
 #include <gtest/gtest.h>
 
+#include <functional>
+#include <map>
+
 using namespace OvraDRNode;
 using namespace OvraDRNode::WebAPI;
 
 namespace {
 
-const Conn kConn = Conn::https("h", 5001);
-const std::string kConnText = R"({"addr":"h","port":5001,"protocol":"https"})";
-const std::string kNoConn = R"([{"addr":"","port":-1,"protocol":""}])";
+/// The arguments of all builders, each acceptable.
+struct Arguments {
+    Conn conn = Conn::https("h", 5001);
+    std::string credId = "c", account = "a", password = "p", otp = "1", session = "s",
+                direction = "d", nodeId = "n", url = "u", user = "joe";
+    int retries = 0, timeout = 3;
+    Request request = getDRNodeCredSetAPI("c", conn, "a", "pw", "");
+};
+using A = const Arguments &;
+
+/// Takes one argument away.
+const std::map<char, std::function<void(Arguments &)>> kMissing = {
+    {'c', [](Arguments &a) { a.conn.port = -1; }},
+    {'i', [](Arguments &a) { a.credId = ""; }},
+    {'a', [](Arguments &a) { a.account = ""; }},
+    {'p', [](Arguments &a) { a.password = ""; }},
+    {'s', [](Arguments &a) { a.session = ""; }},
+    {'d', [](Arguments &a) { a.direction = ""; }},
+    {'n', [](Arguments &a) { a.nodeId = ""; }},
+    {'u', [](Arguments &a) { a.url = a.user = ""; }},
+    {'r', [](Arguments &a) { a.retries = -1; }},
+    {'t', [](Arguments &a) { a.timeout = -1; }},
+    {'q', [](Arguments &a) { a.request.setMethod(""); }},
+};
+
+/// The text with the values of the arguments in the places of their names.
+std::string filled(std::string text, A a) {
+    const std::pair<const char *, std::string> values[] = {
+        {"{conn}", OvraDRCore::toString(a.conn.toJson())},
+        {"{credId}", a.credId},
+        {"{account}", a.account},
+        {"{direction}", a.direction},
+        {"{nodeId}", a.nodeId},
+        {"{url}", a.url},
+        {"{retries}", std::to_string(a.retries)},
+        {"{timeout}", std::to_string(a.timeout)},
+        {"{masked}", OvraDRCore::toLogString(a.request.toJson())},
+        {"{request}", OvraDRCore::toString(a.request.toJson())}};
+    for (const auto &[name, value] : values) {
+        for (std::size_t at = 0; (at = text.find(name)) != std::string::npos;) {
+            text.replace(at, std::string(name).size(), value);
+        }
+    }
+    return text;
+}
 
 } // namespace
 
+/// The name of a builder, and its call.
+#define BUILT_BY(builder, ...)                                                                     \
+#builder, [](A a) { (void)a; return builder(__VA_ARGS__); }
+
 TEST(NodeApi, EveryRequestOfTheCatalogue) {
     const struct {
-        Request request;
-        const char *api;
-        const char *method;
-        int version;
-        std::string params;
-        bool sealed;
-    } cases[] = {
-        {OvraCoreUserGetAPI("joe"), "OVRA.Core.User", "get", 1, R"({"name":"joe"})", false},
-        {getDRNodeSessionCreateAPI("n"), "OVRA.DR.Node.Session", "create", 2, R"({"node_id":"n"})",
-         false},
-        {getDRNodeSessionTempCreateAPI(), "OVRA.DR.Node.Session", "temp_create", 1, "{}", false},
-        {getDRNodeSessionDeleteAPI("s"), "OVRA.DR.Node.Session", "delete", 1, R"({"session":"s"})",
-         false},
-        {getDRNodeSessionGetAPI("s"), "OVRA.DR.Node.Session", "get", 1, R"({"session":"s"})",
-         false},
-        {getDRNodeInfoAPI({}), "OVRA.DR.Node", "info", 1, "{}", false},
-        {getDRNodeInfoAPI({"b", "a"}), "OVRA.DR.Node", "info", 1, R"({"additional":["b","a"]})",
-         false},
-        {getDRNodeCredCreateAPI(kConn, "s", "d"), "OVRA.DR.Node.Credential", "create", 1,
-         R"({"auth":"session","conn":)" + kConnText + R"(,"cred_direction":"d","session":"s"})",
-         true},
-        {getDRNodeCredCreateAPI(kConn, "a", "p", "1", "d"), "OVRA.DR.Node.Credential", "create", 1,
-         R"({"account":"a","auth":"account","conn":)" + kConnText +
-             R"(,"cred_direction":"d","otpcode":"1","password":"p"})",
-         true},
-        {getDRNodeCredCreateAPI("c"), "OVRA.DR.Node.Credential", "create", 1,
-         R"({"auth":"cred_id","cred_direction":"unidirection","cred_id":"c"})", false},
-        {getDRNodeCredGetAPI("c"), "OVRA.DR.Node.Credential", "get", 1, R"({"cred_id":"c"})",
-         false},
-        {getDRNodeCredSetAPI("c", kConn, "a", "p", ""), "OVRA.DR.Node.Credential", "set", 1,
-         R"({"account":"a","addr":"h","cred_id":"c","password":"p","port":5001,"protocol":"https"})",
-         true},
-        {getDRNodeTestSyncSpeedAPI("n", 0, 0), "OVRA.DR.Node", "test_sync_speed", 1,
-         R"({"node_id":"n","retries":0,"timeout":0})", false},
-        {getDRNodeTestDownloadSpeedAPI("u", 2, 3), "OVRA.DR.Node", "test_download_speed", 1,
-         R"({"retries":2,"timeout":3,"url":"u"})", false},
-        {getDRNodeTestPrivilegeAPI(), "OVRA.DR.Node", "test_privilege", 1, "{}", false},
-        {getDRNodeCredRelayAPI("c", getDRNodeTestPrivilegeAPI()), "OVRA.DR.Node.Credential",
-         "relay", 1,
-         R"({"cred_id":"c","webapi":{"api":"OVRA.DR.Node","method":"test_privilege","params":{},)"
-         R"("version":1}})",
-         false},
-        {getDRNodeTestConnectionAPI({Conn(), kConn}), "OVRA.DR.Node", "test_connection", 1,
-         R"({"conns":[)" + kConnText + "]}", false},
-        {getDRNodeCredReverseCreateAPI("c", Conn()), "OVRA.DR.Node.Credential", "reverse_create", 1,
-         R"({"cred_id":"c"})", false},
-        {getDRNodeTestCredReverseCreateAPI("c", kConn), "OVRA.DR.Node.Credential",
-         "test_reverse_create", 1, R"({"conn":)" + kConnText + R"(,"cred_id":"c"})", false},
-        {getDRNodeTempCredReverseCreateAPI("c", kConn), "OVRA.DR.Node.Credential",
-         "temp_reverse_create", 1, R"({"conn":)" + kConnText + R"(,"cred_id":"c"})", false},
-        {getDRNodeTestCredCreateAPI(kConn, "a", "s"), "OVRA.DR.Node.Credential", "test_create", 1,
-         R"({"account":"a","auth":"session","conn":)" + kConnText + R"(,"session":"s"})", true},
-        {getDRNodeTestCredCreateAPI(kConn, "a", "p", "1"), "OVRA.DR.Node.Credential", "test_create",
-         1,
-         R"({"account":"a","auth":"account","conn":)" + kConnText +
-             R"(,"otpcode":"1","password":"p"})",
-         true},
-        {getDRNodeTestCredSetAPI("c", kConn, "a", "p", "1"), "OVRA.DR.Node.Credential", "test_set",
-         1,
-         R"({"account":"a","addr":"h","cred_id":"c","otpcode":"1","password":"p","port":5001,)"
-         R"("protocol":"https"})",
-         true},
-        {getDRNodeTempCredCreateAPI(kConn, "a", "p", ""), "OVRA.DR.Node.Credential", "temp_create",
-         1, R"({"account":"a","auth":"account","conn":)" + kConnText + R"(,"password":"p"})", true},
-        {getDRNodeTempCredCreateAPI(kConn, "s"), "OVRA.DR.Node.Credential", "temp_create", 1,
-         R"({"auth":"session","conn":)" + kConnText + R"(,"session":"s"})", true},
-    };
-    for (const auto &each : cases) {
-        EXPECT_TRUE(each.request.isValid()) << each.method;
-        EXPECT_EQ(each.request.getAPI(), each.api);
-        EXPECT_EQ(each.request.getMethod(), each.method);
-        EXPECT_EQ(each.request.getVersion(), each.version) << each.method;
-        EXPECT_EQ(OvraDRCore::toString(each.request.getParams()), each.params) << each.method;
-        EXPECT_EQ(each.request.isEncryptRequired(), each.sealed) << each.method;
-    }
-}
-
-TEST(NodeApi, ARefusedArgumentIsAnInvalidRequestAndOneLine) {
-    const std::string no = kNoConn.substr(1, kNoConn.size() - 2);
-    const struct {
-        std::function<Request()> build;
         const char *function;
-        std::string message; ///< empty: refused silently
+        std::function<Request(A)> build;
+        std::string call, params;
+        std::string needs, refusal; ///< keys of kMissing, and what is logged without one of them
     } cases[] = {
-        {[] { return OvraCoreUserGetAPI(""); }, "", ""},
-        {[] { return getDRNodeSessionGetAPI(""); }, "", ""},
-        {[] { return getDRNodeSessionCreateAPI(""); }, "getDRNodeSessionCreateAPI", "Bad nodeId[]"},
-        {[] { return getDRNodeSessionDeleteAPI(""); }, "getDRNodeSessionDeleteAPI",
-         "Bad sessionId"},
-        {[] { return getDRNodeCredCreateAPI(Conn(), "s", "d"); }, "getDRNodeCredCreateAPI",
-         "invalid conn[" + no + "]/empty session or bad credType[d]"},
-        {[] { return getDRNodeCredCreateAPI(kConn, "a", "", "1", "d"); }, "getDRNodeCredCreateAPI",
-         "Invalid conn[" + kConnText + "] or empty account[a]/password or bad credType[d]"},
-        {[] { return getDRNodeCredCreateAPI(""); }, "getDRNodeCredCreateAPI", "Invalid credId[]"},
-        {[] { return getDRNodeCredGetAPI(""); }, "getDRNodeCredGetAPI", "credId[]"},
-        {[] { return getDRNodeCredSetAPI("", kConn, "a", "p", ""); }, "getDRNodeCredSetAPI",
-         "empty conn[" + kConnText + "] or empty account[a]/password/credId[]"},
-        {[] { return getDRNodeTestSyncSpeedAPI("n", -1, 0); }, "getDRNodeTestSyncSpeedAPI",
-         "invalid nodeId[n], retries[-1], or timeout[0]"},
-        {[] { return getDRNodeTestDownloadSpeedAPI("u", 0, -1); }, "getDRNodeTestDownloadSpeedAPI",
-         "invalid url[u], retries[0], or timeout[-1]"},
-        {[] { return getDRNodeCredRelayAPI("", getDRNodeCredSetAPI("c", kConn, "a", "pw", "")); },
-         "getDRNodeCredRelayAPI",
-         "Invalid credId [] or relayAPI [{\"api\":\"OVRA.DR.Node.Credential\",\"encrypt\":true,"
-         "\"method\":\"set\",\"params\":{\"account\":\"a\",\"addr\":\"h\",\"cred_id\":\"c\","
-         "\"password\":\"***\",\"port\":5001,\"protocol\":\"https\"},\"version\":1}]"},
-        {[] { return getDRNodeTestConnectionAPI({Conn()}); }, "getDRNodeTestConnectionAPI",
-         "Empty connections"},
-        {[] { return getDRNodeCredReverseCreateAPI("", kConn); }, "getDRNodeCredReverseCreateAPI",
+        {BUILT_BY(OvraCoreUserGetAPI, a.user), "OVRA.Core.User get 1", R"({"name":"joe"})", "u",
+         ""},
+        {BUILT_BY(getDRNodeSessionCreateAPI, a.nodeId), "OVRA.DR.Node.Session create 2",
+         R"({"node_id":"n"})", "n", "Bad nodeId[]"},
+        {BUILT_BY(getDRNodeSessionTempCreateAPI), "OVRA.DR.Node.Session temp_create 1", R"({})", "",
+         ""},
+        {BUILT_BY(getDRNodeSessionDeleteAPI, a.session), "OVRA.DR.Node.Session delete 1",
+         R"({"session":"s"})", "s", "Bad sessionId"},
+        {BUILT_BY(getDRNodeSessionGetAPI, a.session), "OVRA.DR.Node.Session get 1",
+         R"({"session":"s"})", "s", ""},
+        {BUILT_BY(getDRNodeInfoAPI, {}), "OVRA.DR.Node info 1", R"({})", "", ""},
+        {BUILT_BY(getDRNodeInfoAPI, {"b", "a"}), "OVRA.DR.Node info 1",
+         R"({"additional":["b","a"]})", "", ""},
+        {BUILT_BY(getDRNodeTestPrivilegeAPI), "OVRA.DR.Node test_privilege 1", R"({})", "", ""},
+        {BUILT_BY(getDRNodeTestConnectionAPI, {Conn(), a.conn}), "OVRA.DR.Node test_connection 1",
+         R"({"conns":[{conn}]})", "c", "Empty connections"},
+        {BUILT_BY(getDRNodeTestSyncSpeedAPI, a.nodeId, a.retries, a.timeout),
+         "OVRA.DR.Node test_sync_speed 1", R"({"node_id":"n","retries":0,"timeout":3})", "nrt",
+         "invalid nodeId[{nodeId}], retries[{retries}], or timeout[{timeout}]"},
+        {BUILT_BY(getDRNodeTestDownloadSpeedAPI, a.url, a.retries, a.timeout),
+         "OVRA.DR.Node test_download_speed 1", R"({"retries":0,"timeout":3,"url":"u"})", "urt",
+         "invalid url[{url}], retries[{retries}], or timeout[{timeout}]"},
+        {BUILT_BY(getDRNodeCredCreateAPI, a.conn, a.session, a.direction),
+         "OVRA.DR.Node.Credential create 1 sealed",
+         R"({"auth":"session","conn":{conn},"cred_direction":"d","session":"s"})", "csd",
+         "invalid conn[{conn}]/empty session or bad credType[{direction}]"},
+        {BUILT_BY(getDRNodeCredCreateAPI, a.conn, a.account, a.password, a.otp, a.direction),
+         "OVRA.DR.Node.Credential create 1 sealed",
+         R"({"account":"a","auth":"account","conn":{conn},"cred_direction":"d",)"
+         R"("otpcode":"1","password":"p"})",
+         "capd",
+         "Invalid conn[{conn}] or empty account[{account}]/password or bad credType[{direction}]"},
+        {BUILT_BY(getDRNodeCredCreateAPI, a.credId), "OVRA.DR.Node.Credential create 1",
+         R"({"auth":"cred_id","cred_direction":"unidirection","cred_id":"c"})", "i",
+         "Invalid credId[]"},
+        {BUILT_BY(getDRNodeCredGetAPI, a.credId), "OVRA.DR.Node.Credential get 1",
+         R"({"cred_id":"c"})", "i", "credId[]"},
+        {BUILT_BY(getDRNodeCredSetAPI, a.credId, a.conn, a.account, a.password, a.otp),
+         "OVRA.DR.Node.Credential set 1 sealed",
+         R"({"account":"a","addr":"h","cred_id":"c","otpcode":"1","password":"p",)"
+         R"("port":5001,"protocol":"https"})",
+         "icap", "empty conn[{conn}] or empty account[{account}]/password/credId[{credId}]"},
+        {BUILT_BY(getDRNodeCredRelayAPI, a.credId, a.request), "OVRA.DR.Node.Credential relay 1",
+         R"({"cred_id":"c","webapi":{request}})", "iq",
+         "Invalid credId [{credId}] or relayAPI [{masked}]"},
+        {BUILT_BY(getDRNodeCredReverseCreateAPI, a.credId, a.conn),
+         "OVRA.DR.Node.Credential reverse_create 1", R"({"conn":{conn},"cred_id":"c"})", "i",
          "Bad credId[]"},
-        {[] { return getDRNodeTestCredReverseCreateAPI("", kConn); },
-         "getDRNodeTestCredReverseCreateAPI", "Bad credId []"},
-        {[] { return getDRNodeTestCredCreateAPI(kConn, "", "s"); }, "getDRNodeTestCredCreateAPI",
-         "invalid conn[" + kConnText + "] or empty account [] /empty session"},
-        {[] { return getDRNodeTestCredSetAPI("c", kConn, "a", "", ""); }, "getDRNodeTestCredSetAPI",
-         "invalid credId[c] or conn[" + kConnText + "] or empty account [a] /empty password"},
-        {[] { return getDRNodeTempCredCreateAPI(kConn, "a", "", ""); },
-         "getDRNodeTempCredCreateAPI",
-         "invalid conn[" + kConnText + "] or empty account [a] /empty password"},
-        {[] { return getDRNodeTempCredCreateAPI(kConn, ""); }, "getDRNodeTempCredCreateAPI",
-         "invalid conn[" + kConnText + "]/empty session"},
-        {[] { return getDRNodeTempCredReverseCreateAPI("", kConn); },
-         "getDRNodeTempCredReverseCreateAPI", "Bad credId[]"},
+        {BUILT_BY(getDRNodeTestCredReverseCreateAPI, a.credId, a.conn),
+         "OVRA.DR.Node.Credential test_reverse_create 1", R"({"conn":{conn},"cred_id":"c"})", "i",
+         "Bad credId []"},
+        {BUILT_BY(getDRNodeTempCredReverseCreateAPI, a.credId, a.conn),
+         "OVRA.DR.Node.Credential temp_reverse_create 1", R"({"conn":{conn},"cred_id":"c"})", "i",
+         "Bad credId[]"},
+        {BUILT_BY(getDRNodeTestCredCreateAPI, a.conn, a.account, a.session),
+         "OVRA.DR.Node.Credential test_create 1 sealed",
+         R"({"account":"a","auth":"session","conn":{conn},"session":"s"})", "cas",
+         "invalid conn[{conn}] or empty account [{account}] /empty session"},
+        {BUILT_BY(getDRNodeTestCredCreateAPI, a.conn, a.account, a.password, a.otp),
+         "OVRA.DR.Node.Credential test_create 1 sealed",
+         R"({"account":"a","auth":"account","conn":{conn},"otpcode":"1","password":"p"})", "cap",
+         "invalid conn[{conn}] or empty account [{account}] /empty password"},
+        {BUILT_BY(getDRNodeTestCredSetAPI, a.credId, a.conn, a.account, a.password, a.otp),
+         "OVRA.DR.Node.Credential test_set 1 sealed",
+         R"({"account":"a","addr":"h","cred_id":"c","otpcode":"1","password":"p",)"
+         R"("port":5001,"protocol":"https"})",
+         "icap",
+         "invalid credId[{credId}] or conn[{conn}] or empty account [{account}] /empty password"},
+        {BUILT_BY(getDRNodeTempCredCreateAPI, a.conn, a.account, a.password, a.otp),
+         "OVRA.DR.Node.Credential temp_create 1 sealed",
+         R"({"account":"a","auth":"account","conn":{conn},"otpcode":"1","password":"p"})", "cap",
+         "invalid conn[{conn}] or empty account [{account}] /empty password"},
+        {BUILT_BY(getDRNodeTempCredCreateAPI, a.conn, a.session),
+         "OVRA.DR.Node.Credential temp_create 1 sealed",
+         R"({"auth":"session","conn":{conn},"session":"s"})", "cs",
+         "invalid conn[{conn}]/empty session"},
     };
     for (const auto &each : cases) {
-        LogCapture log;
-        EXPECT_FALSE(each.build().isValid()) << each.message;
-        ASSERT_EQ(log.lines().size(), each.message.empty() ? 0U : 1U) << each.message;
-        if (!each.message.empty()) {
-            EXPECT_EQ(log.count("ERR", "node_api", each.function, each.message), 1)
-                << log.lines()[0];
+        const std::string where = each.function + each.params;
+        const Request request = each.build({});
+        EXPECT_TRUE(request.isValid()) << where;
+        EXPECT_EQ(request.getAPI() + " " + request.getMethod() + " " +
+                      std::to_string(request.getVersion()) +
+                      (request.isEncryptRequired() ? " sealed" : ""),
+                  each.call);
+        EXPECT_EQ(OvraDRCore::toString(request.getParams()), filled(each.params, {}));
+        for (const char missing : each.needs) {
+            Arguments arguments;
+            kMissing.at(missing)(arguments);
+            LogCapture log;
+            EXPECT_FALSE(each.build(arguments).isValid()) << where << " without " << missing;
+            const std::string message = filled(each.refusal, arguments);
+            EXPECT_EQ(log.count("ERR", "node_api", each.function, message), message.empty() ? 0 : 1)
+                << where << " without " << missing;
+            EXPECT_EQ(log.lines().size(), message.empty() ? 0U : 1U) << where;
         }
+        Arguments fewer;
+        fewer.otp = "";
+        EXPECT_FALSE(each.build(fewer).getParams().isMember("otpcode")) << where;
+    }
+    for (const Request &request : {getDRNodeCredReverseCreateAPI("c", Conn()),
+                                   getDRNodeTestCredReverseCreateAPI("c", Conn()),
+                                   getDRNodeTempCredReverseCreateAPI("c", Conn())}) {
+        EXPECT_EQ(OvraDRCore::toString(request.getParams()), R"({"cred_id":"c"})");
     }
 }
 

@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #include <ovrabase/number.h>
 #include <ovrabase/secret.h>
+#include <ovrabase/utf8.h>
 
 #include <gtest/gtest.h>
 
@@ -25,6 +26,22 @@ TEST(Number, APortCanBeConnectedTo) {
     for (const char *text : {"0", "65536", "-1", "5443x", ""}) {
         EXPECT_FALSE(parsePort(text)) << text;
     }
+}
+
+TEST(Utf8, IsTheShortestFormOfACharacterThatThereIs) {
+    for (const char *text :
+         {"", "az~", "\u0080\u07ff", "\u0800\ud7ff\ue000\uffff", "\U00010000\U0010ffff"}) {
+        EXPECT_TRUE(isUtf8(text)) << text;
+    }
+    for (const char *text :
+         {"a\x80", "\xbf", "\xc1\xbf", "\xc3",
+          "\xc3"
+          "a",
+          "\xe0\x9f\xbf", "\xe2\x82", "\xed\xa0\x80", "\xed\xbf\xbf", "\xf0\x8f\xbf\xbf",
+          "\xf0\x9f\x98", "\xf4\x90\x80\x80", "\xf8\x88\x80\x80\x80", "\xff"}) {
+        EXPECT_FALSE(isUtf8(text)) << text;
+    }
+    EXPECT_EQ(firstUtf8("\U0001f600x").code, U'\U0001f600');
 }
 
 TEST(Secret, LeavesNothingWhereItLay) {

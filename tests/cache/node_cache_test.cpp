@@ -1,16 +1,28 @@
 // SPDX-License-Identifier: Apache-2.0
+#include "cache_file.h"
 #include "clock.h"
 #include "support/local_node.h"
 #include "support/log_capture.h"
 #include "support/remote_node.h"
+#include "transport/conn_cache.h"
 
 #include <ovradrcore/json.h>
-#include <ovradrnode/dr_node.h>
+#include <ovradrnode/node_api.h>
 #include <ovradrnode/node_cache.h>
+#include <ovradrnode/sender.h>
 #include <ovraplatform/api_errors.h>
 #include <ovraplatform/api_registry.h>
 
 #include <gtest/gtest.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <array>
+#include <atomic>
+#include <csignal>
+#include <ctime>
+#include <future>
+#include <thread>
 
 using namespace OvraDRNode;
 using namespace OvraTest;
@@ -19,19 +31,23 @@ namespace {
 
 std::int64_t now = 3'000'000'000'000;
 
-/// The remote node "n1" with one credential.
+/// The nodes "n1" with the credential c1 and "n2" with d1, which has no right, and d2.
 class NodeInfo : public testing::Test {
 protected:
     void SetUp() override {
         provisionNode();
         OvraDRCore::setSystemClock([] { return now; });
         addCred("node_cred", "n1", "c1", "https", remote.port(), "s1");
+        addCred("node_cred", "n2", "d1", "https", other.port(), "z1");
+        addCred("node_cred", "n2", "d2", "https", other.port(), "z2");
         remote.answer("info", R"({"success":true,"data":{"hostname":"b","serial":"S",)"
                               R"("additional":{"timezone":"Asia/Tokyo"}}})");
     }
     void TearDown() override { OvraDRCore::setSystemClock(nullptr); }
 
     RemoteNode remote;
+    RemoteNode other;
+    Conn conn = Conn::https("127.0.0.1", remote.port());
     NodeCache cache{"n1", false};
     LogCapture log;
 };
@@ -92,4 +108,91 @@ TEST_F(NodeInfo, TheLocalNodeNeedsAWholeAnswer) {
     EXPECT_EQ(local.GetHostName(), "renamed");
     EXPECT_TRUE(local.IsUpdatedDataRequired());
     EXPECT_FALSE(cache.IsUpdatedDataRequired());
+}
+
+TEST_F(NodeInfo, OfTwoNodesAndAllElseLearntIsKeptApartUnderItsNames) {
+    other.answer("z1 test_privilege", R"({"success":false,"error":{"code":105}})");
+    other.answer("info", R"({"success":true,"data":{"hostname":"two"}})");
+    EXPECT_EQ(cache.GetHostName(), "b");
+    EXPECT_EQ(NodeCache("n2", true).GetHostName(), "two");
+    EXPECT_EQ(remote.calls(), "probe, s1 test_privilege, s1 info");
+    EXPECT_EQ(other.calls(), "probe, z1 test_privilege, z2 test_privilege, z2 info");
+    other.die();
+    EXPECT_FALSE(BaseSender::IsConnectable(Conn::https("127.0.0.1", other.port())));
+    const std::string host = "_127.0.0.1";
+    const std::array<std::string, 3> cases[] = {
+        {"node", "n2", R"({"hostname":"two"})"},
+        {"dr_node_cred_cache", "node_valid_cred_n1", "\"c1\""},
+        {"dr_node_cred_cache", "node_valid_cred_n2", "\"d2\""},
+        {"dr_cred_premission_cache", "cred_permission_c1", "true"},
+        {"dr_cred_premission_cache", "cred_permission_d1", "false"},
+        {"dr_cred_premission_cache", "cred_permission_d2", "true"},
+        {"dr_node_conn_cache", "conn_https_" + std::to_string(conn.port) + host, "true"},
+        {"dr_node_conn_cache", "conn_https_" + std::to_string(other.port()) + host, "false"},
+    };
+    for (const auto &[file, entry, value] : cases) {
+        const auto stored = OvraDRCore::CacheFile("/tmp/.ovradrcache//" + file).read(entry, 3);
+        EXPECT_EQ(stored ? stored->value : "", value) << entry;
+    }
+}
+
+TEST_F(NodeInfo, NobodyWaitsForTheProbeOfAnEndpointThatWasDead) {
+    ConnCache(conn).UpdateWithData(false, now / 1000 - 8, now / 1000 - 8);
+    std::promise<void> begun;
+    std::promise<void> released;
+    remote.before("probe", [&] {
+        begun.set_value();
+        released.get_future().wait();
+    });
+    auto prober =
+        std::async(std::launch::async, [&] { return BaseSender::GetCachedConnectable(conn); });
+    begun.get_future().wait();
+    EXPECT_FALSE(BaseSender::GetCachedConnectable(conn));
+    EXPECT_NE(prober.wait_for(std::chrono::seconds(0)), std::future_status::ready);
+    released.set_value();
+    EXPECT_TRUE(prober.get());
+    EXPECT_TRUE(BaseSender::GetCachedConnectable(conn));
+}
+
+TEST_F(NodeInfo, ProcessesStoppedInTheirProbesHoldOthersUpOnceAndHaveOldNewsLater) {
+    OvraDRCore::setSystemClock(nullptr);
+    std::array<pid_t, 2> stopped{};
+    std::atomic<std::size_t> probes{0};
+    remote.before("probe", [&] {
+        remote.answer("probe", probes < stopped.size() ? Answer::silence() : Answer::html());
+        ++probes;
+    });
+    const auto send = [] {
+        return NodeSender("n1").process(WebAPI::getDRNodeInfoAPI({})).isSuccess();
+    };
+    for (pid_t &child : stopped) {
+        child = fork();
+        if (child == 0) {
+            _exit((&child == stopped.data() ? send() : BaseSender::IsConnectable(conn)) ? 0 : 1);
+        }
+    }
+    while (probes < stopped.size()) {
+        std::this_thread::sleep_for(std::chrono::milliseconds(5));
+    }
+    for (const pid_t child : stopped) {
+        kill(child, SIGSTOP);
+    }
+    for (const double limit : {20.0, 9.0}) {
+        const std::time_t start = std::time(nullptr);
+        EXPECT_TRUE(send());
+        EXPECT_LT(std::difftime(std::time(nullptr), start), limit);
+        std::this_thread::sleep_for(std::chrono::seconds(1));
+        ConnCache(conn).UpdateWithData(true, 1, 1);
+    }
+    EXPECT_TRUE(send());
+    EXPECT_EQ(probes, stopped.size() + 3);
+    for (const bool isSender : {true, false}) {
+        const pid_t child = stopped[isSender ? 0 : 1];
+        kill(child, SIGCONT);
+        int status = 0;
+        waitpid(child, &status, 0);
+        EXPECT_EQ(WIFEXITED(status) && WEXITSTATUS(status) == 0, isSender)
+            << "who asks for a probe has its own finding";
+        EXPECT_TRUE(ConnCache(conn).getStoredVerdict());
+    }
 }

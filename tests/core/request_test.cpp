@@ -1,6 +1,4 @@
 // SPDX-License-Identifier: Apache-2.0
-#include "support/print_json.h"
-
 #include <ovradrcore/json.h>
 #include <ovradrcore/request.h>
 #include <ovradrcore/response.h>
@@ -45,8 +43,16 @@ TEST(Request, IncompleteOrForeignJsonIsInvalidAndNeverThrows) {
           R"({"api":"a","method":"m","version":"1"})", R"({"api":"a","method":"m","version":0})",
           R"({"api":"a","method":"m","version":9999999999})",
           R"({"api":"a","method":"m","version":1,"params":[]})",
+          R"({"api":"a\u0000","method":"m","version":1})",
+          R"({"api":"a","method":"m\u0000","version":1})",
           R"({"api":"a","method":"m","version":1,"encrypt":"yes"})"}) {
         EXPECT_FALSE(Request(json(text)).isValid()) << text;
+    }
+    Request request("a", 1, "m", Json::Value());
+    for (const auto &[seconds, valid] :
+         {std::pair(0L, false), {1, true}, {86400, true}, {86401, false}, {-1, false}}) {
+        request.setResponseTimeout(seconds);
+        EXPECT_EQ(request.isValid(), valid) << seconds;
     }
 }
 
@@ -54,11 +60,10 @@ TEST(Response, UnderstandsTheTwoWireForms) {
     Response response(json(R"({"success":true,"data":{"s":"x","n":5,"b":true,"o":{}}})"));
     EXPECT_TRUE(response.isValid() && response.isSuccess());
     EXPECT_EQ(response.getErrCode(), 0);
-    EXPECT_EQ(response.getDataFieldtoStr("s"), "x");
-    EXPECT_EQ(response.getDataFieldtoStr("n"), "5");
-    EXPECT_EQ(response.getDataFieldtoStr("b"), "true");
-    EXPECT_EQ(response.getDataFieldtoStr("o"), "");
-    EXPECT_EQ(response.getDataFieldtoStr("absent"), "");
+    for (const auto &[field, text] :
+         {std::pair("s", "x"), {"n", "5"}, {"b", "true"}, {"o", ""}, {"absent", ""}}) {
+        EXPECT_EQ(response.getDataFieldtoStr(field), text) << field;
+    }
     EXPECT_TRUE(response.getDataField("absent").isNull());
     response.setResp(std::string(R"({"success":false,"error":{"code":105,"msg":["a"]}})"));
     EXPECT_TRUE(response.isValid());
@@ -69,33 +74,17 @@ TEST(Response, UnderstandsTheTwoWireForms) {
 }
 
 TEST(Response, AnythingElseIsInvalidWithANonZeroCode) {
-    std::string deep;
-    for (int i = 0; i < 100000; ++i) {
-        deep += "[";
-    }
-    const std::vector<std::string> replies = {"",
-                                              "<html>busy</html>",
-                                              R"({"success":true,"data":{"a":1)",
-                                              "null",
-                                              "[]",
-                                              "true",
-                                              "{}",
-                                              deep,
-                                              R"({"success":"true"})",
-                                              R"({"success":true,"data":[1]})",
-                                              R"({"success":false})",
-                                              R"({"success":false,"error":{"code":0}})",
-                                              R"({"success":false,"error":{"code":"105"}})",
-                                              R"({"success":false,"error":105})",
-                                              R"({"success":true} trailing)",
-                                              R"({"success":false,"error":{"code":99999999999}})",
-                                              std::string("{\"success\":true}\0x", 18)};
-    for (const std::string &reply : replies) {
+    for (const std::string reply :
+         {"", "<html>busy</html>", R"({"success":true} trailing)", "null", "[]", "true", "{}",
+          R"({"success":"true"})", R"({"success":true,"data":[1]})", R"({"success":false})",
+          R"({"success":false,"error":{"code":0}})", R"({"success":false,"error":{"code":"105"}})",
+          R"({"success":false,"error":105})",
+          R"({"success":false,"error":{"code":99999999999}})"}) {
         Response response(json(R"({"success":true,"data":{"old":1}})"));
         response.setResp(reply);
-        EXPECT_FALSE(response.isValid() || response.isSuccess()) << reply.substr(0, 60);
-        EXPECT_EQ(response.getErrCode(), 407) << reply.substr(0, 60);
-        EXPECT_FALSE(response.hasDataField("old")) << reply.substr(0, 60);
+        EXPECT_FALSE(response.isValid() || response.isSuccess()) << reply;
+        EXPECT_EQ(response.getErrCode(), 407) << reply;
+        EXPECT_FALSE(response.hasDataField("old")) << reply;
     }
 }
 

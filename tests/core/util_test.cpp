@@ -12,7 +12,6 @@
 
 #include <cerrno>
 #include <chrono>
-#include <climits>
 #include <filesystem>
 #include <functional>
 #include <regex>
@@ -29,10 +28,6 @@ TEST(Util, UuidsAreVersionFourAndDiffer) {
         EXPECT_TRUE(std::regex_match(id, form)) << id;
         EXPECT_TRUE(seen.insert(id).second);
     }
-}
-
-TEST(Util, SmallestIntHasElevenCharacters) {
-    EXPECT_EQ(ToString<int>(INT_MIN), "-2147483648");
 }
 
 TEST(Util, CreateDirMakesWhatIsMissingWithTheModeWhateverTheUmask) {

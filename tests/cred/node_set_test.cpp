@@ -16,6 +16,7 @@ protected:
     void SetUp() override {
         CredFlow::SetUp();
         addCred("node_cred", "n1", "c1", "http", 80, "old");
+        addCred("node_cred", "n2", "c2", "https", 1, "other");
     }
     bool update(const std::string &credId = "c1") {
         DRNodeCredSet set(credId);
@@ -23,7 +24,10 @@ protected:
         code = set.GetErrCode();
         return done;
     }
-    std::string row() { return rows("node_cred"); }
+    std::string row() {
+        EXPECT_EQ(rows("node_cred WHERE cred_id = 'c2'"), "n2|https|1|other\n");
+        return rows("node_cred WHERE cred_id = 'c1'");
+    }
 
     const std::string untouched = "n1|http|80|old\n";
     int code = -1;
@@ -45,7 +49,7 @@ TEST_F(CredUpdate, TheRowIsRewrittenAndThenTheOldSessionReleasedOverTheNewEndpoi
 }
 
 TEST_F(CredUpdate, ASessionThatAnotherCredentialUsesStays) {
-    addCred("node_cred", "n1", "c2", "https", remote.port(), "old");
+    addCred("node_cred", "n1", "c3", "https", remote.port(), "old");
     EXPECT_TRUE(update());
     EXPECT_EQ(sent("old delete"), 0);
 }
@@ -86,6 +90,12 @@ TEST_F(CredUpdate, FailsAtEachStepWithItsCodeAndTheOldRow) {
         EXPECT_EQ(code, each.code) << each.call << each.answer;
         EXPECT_EQ(row(), untouched);
     }
+    DRNodeCredSet again("c1");
+    ASSERT_TRUE(again.setCred(conn, "joe", "pw", "1"));
+    EXPECT_FALSE(again.process());
+    SetUpAnswers();
+    EXPECT_TRUE(again.check()) << "the same object, once the node is well";
+    EXPECT_EQ(again.GetErrCode(), 0);
     EXPECT_EQ(log.count("ERR", "node_set", "checkRemoteNodeInfo",
                         "Different nodeId [n2] to setCred, [n1] is expected"),
               1);

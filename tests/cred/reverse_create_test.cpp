@@ -3,56 +3,9 @@
 
 #include <ovradrcore/json.h>
 #include <ovradrnode/cred_reverse_create.h>
-#include <ovradrnode/node_session.h>
-#include <ovraplatform/api_errors.h>
-#include <ovraplatform/api_registry.h>
 
 using namespace OvraDRNode;
 using namespace OvraTest;
-
-namespace {
-
-/// The remote reaches this node at 192.0.2.1:5001 and reports a credential "r1".
-class ReverseCreation : public CredFlow {
-protected:
-    void SetUp() override {
-        CredFlow::SetUp();
-        addCred("node_cred", "n1", "c1", "https", remote.port(), "s1");
-        remote.answer(
-            "test_connection",
-            R"({"success":true,"data":{"addr":"192.0.2.1","protocol":"https","port":5001}})");
-        remote.answer("create", R"({"success":true,"data":{"src_cred":{"cred_id":"r1"}}})");
-        remote.answer("temp_create", R"({"success":true,"data":{"cred_id":"t1"}})");
-        for (const char *call : {"create", "temp_create", "test_create"}) {
-            remote.before(call, [this, call] { noteSession(call); });
-        }
-        users.add("OVRA.Core.User", 1, "get", OvraPlatform::APIRight::kAdministrator,
-                  OvraPlatform::APIQueue::kQuick,
-                  [](const Json::Value &params, const OvraPlatform::APICaller &) {
-                      return params["name"] == "joe" ? OvraPlatform::apiSuccess()
-                                                     : OvraPlatform::apiError(1);
-                  });
-        users.host();
-    }
-    /// What the temporary session permitted while the remote had it.
-    void noteSession(const std::string &call) {
-        Json::Value params;
-        EXPECT_TRUE(OvraDRCore::fromString(params, remote.params(call)));
-        lent = params["session"].asString();
-        lentUser = NodeSession().GetUserBySession(lent);
-    }
-    bool isGone() { return !lent.empty() && NodeSession().GetUserBySession(lent).empty(); }
-    bool arm(CredReverseCreate &flow, const std::string &account = "joe") {
-        return flow.setCredId("c1") && flow.setLocalAccount(account) &&
-               flow.addLocalConns({Conn::https("192.0.2.1", 5001), Conn::http("192.0.2.1", 5000)});
-    }
-
-    OvraPlatform::APIRegistry users;
-    std::string lent;
-    std::string lentUser;
-};
-
-} // namespace
 
 TEST_F(ReverseCreation, TheRemoteGetsAnEndpointItReachesAndASessionForTheTimeOfTheCall) {
     CredReverseCreate flow;
@@ -60,6 +13,7 @@ TEST_F(ReverseCreation, TheRemoteGetsAnEndpointItReachesAndASessionForTheTimeOfT
     EXPECT_TRUE(flow.process());
     EXPECT_EQ(OvraDRCore::toString(flow.getCredInfo()), R"({"cred_id":"r1"})");
     EXPECT_EQ(lentUser, "joe");
+    EXPECT_EQ(lentSeconds, 300) << "should this process die";
     EXPECT_TRUE(isGone());
     Json::Value params;
     EXPECT_TRUE(OvraDRCore::fromString(params, remote.params("create")));

@@ -98,16 +98,17 @@ TEST_F(NodeDb, ARecordThatIsNotValidCountsAsNotFoundAndTheOtherTableIsSearched) 
     addCred("temp_cred", "n1", "c1", "https", 7, "s7");
     EXPECT_TRUE(DRNodeDB::GetCred("c1", node));
     EXPECT_EQ(node.session, "s7");
+    querySql("ALTER TABLE node_cred RENAME TO old; CREATE TABLE node_cred AS"
+             " SELECT addr, protocol, port, cred_id, node_id, NULL AS session FROM old");
+    EXPECT_FALSE(DRNodeDB::GetCred("c2", node)) << "not with the session of the record before";
 }
 
 TEST_F(NodeDb, TheFirstCredentialOfANodeOrTheIdAlone) {
     DRNode node;
     EXPECT_TRUE(DRNodeDB::Get("n1", node));
     EXPECT_EQ(node.credId, "c1");
-    DRNode none;
-    EXPECT_TRUE(DRNodeDB::Get("n3", none)) << "temporary credentials do not count";
-    EXPECT_EQ(none.nodeId, "n3");
-    EXPECT_FALSE(none.isValid());
+    EXPECT_TRUE(DRNodeDB::Get("n3", node)) << "temporary credentials do not count";
+    EXPECT_EQ(node.nodeId + node.credId + node.conn.addr + node.session, "n3");
     EXPECT_FALSE(DRNodeDB::Get("", node));
     EXPECT_EQ(log.count("ERR", "node_db", "Get", "Bad node Id[]"), 1);
 }

@@ -38,10 +38,12 @@ protected:
         DRNode::getLocalNodeId();
         addCred("node_cred", "n1", "c1", "https", remote.port(), "s1");
         addCred("node_cred", "n1", "c2", "https", remote.port(), "s2");
-        addCred("node_cred", "n2", "c3", "https", remote.port(), "s3");
+        addCred("node_cred", "n2", "c3", "https", other.port(), "s3");
         remote.answer("info", R"({"success":true,"data":{"hostname":"b"}})");
+        other.answer("info", R"({"success":true,"data":{"hostname":"c"}})");
     }
-    RemoteNode remote;
+    RemoteNode remote; ///< "n1"
+    RemoteNode other;  ///< "n2"
     LogCapture log;
 };
 
@@ -82,7 +84,12 @@ TEST_F(Dispatch, ARemoteNodeIsAskedOverAnyCredentialAndTheOutcomeKept) {
     Operation operation("n1");
     EXPECT_TRUE(operation.Run());
     EXPECT_EQ(operation.GetResult()["hostname"].asString(), "b");
-    EXPECT_EQ(operation.localRuns, 0);
+    EXPECT_EQ(operation.GetErrCode() + operation.localRuns, 0);
+    Operation second("n2");
+    EXPECT_TRUE(second.Run());
+    EXPECT_EQ(second.GetResult()["hostname"].asString(), "c");
+    EXPECT_EQ(remote.calls() + "; " + other.calls(),
+              "probe, s1 test_privilege, s1 info; probe, s3 test_privilege, s3 info");
     remote.answer("info", R"({"success":false,"error":{"code":999,"msg":"why"}})");
     Operation refused("n1");
     EXPECT_FALSE(refused.Run());

@@ -137,8 +137,13 @@ speedOfAShapedLink() {
     create 0
     # Slow enough for a busy machine to keep up.
     "$lab" shape 1 --rate 20mbit --delay 20ms >/dev/null 2>&1 || "$lab" shape 1 --rate 20mbit >/dev/null
-    on 1 0 ovradr --json speed "$remote" --timeout 4
-    holds '.data.bits_per_second > 18000000 and .data.bits_per_second < 22000000'
+    # A busy machine slows some measurements down, but speeds none up.
+    for _ in 1 2 3 4 5; do
+        on 1 0 ovradr --json speed "$remote" --timeout 4
+        holds '.data.bits_per_second < 22000000'
+        (($(value '.data.bits_per_second | floor') <= 18000000)) || break
+    done
+    holds '.data.bits_per_second > 18000000'
     # The first two of node 1's four endpoints are unreachable now, the third is not.
     "$lab" drop 1 0 >/dev/null
     on 1 0 ovradr speed "$remote" --timeout 4 --retries 0
@@ -192,6 +197,30 @@ made() { value .data.cred_id; }
 addAdministrators() {
     on 2 0 ovradr user add other --admin --password-file /usr/ovra/pw
     on 1 0 ovradr user add back --admin --password-file /usr/ovra/pw
+}
+
+# Both nodes are asked for forty credentials in both directions at the same moment.
+flowsAtOnce() {
+    local node there
+    local -A cred sid entry
+    on 1 0 ovradr user add replica --admin --password-file /usr/ovra/pw
+    for node in 1 2; do
+        there=$((3 - node)) entry[$node]="https://$("$lab" addr "$node"):5001/webapi/query.cgi"
+        on "$node" 0 ovradr --json cred create "https://$("$lab" addr $there):5001" --account replica \
+            --password-file /usr/ovra/pw --fingerprint "$(fingerprint $there)"
+        cred[$node]=$(made)
+        on "$node" 0 curl -qsk "${entry[$node]}" \
+            -d "api=OVRA.Core.Auth&version=1&method=login&account=\"replica\"&passwd=\"$password\""
+        sid[$node]=$(value .data.sid)
+    done
+    for node in 1 2; do
+        on "$node" 0 curl -qskZ --parallel-immediate --parallel-max 40 "${entry[$node]}?[1-40]" \
+            -d "api=OVRA.DR.Node.Credential&version=1&method=create&_sid=${sid[$node]}" \
+            -d "auth=\"cred_id\"&cred_id=\"${cred[$node]}\"&cred_direction=\"bidirection\"" &
+    done
+    wait
+    remain 1 81 1
+    remain 2 81 1
 }
 
 sharedSessions() {
@@ -323,7 +352,9 @@ callsThroughTheRelay() {
     soon ovradr conn test flk:nas-3
     says "$thirdKey" # TLS ends at the appliance, not at the relay
     url=flk:nas-3 key=$thirdKey
-    create 0
+    create 0 --json
+    on 1 0 ovradr --json cred set "$(made)" --account replica --password-file /usr/ovra/pw
+    holds '.data | .protocol == "flk" and .endpoint_changed == false'
     on 3 0 ovradr --json node id
     remote=$(value .data.node_id)
     info 0

@@ -25,6 +25,19 @@ absent() { [[ ! -e $1 ]] || broken "$1 is there"; }
 # exitCodeOf COMMAND...: sets code and output (both streams).
 exitCodeOf() { output=$("$@" 2>&1 </dev/null) && code=0 || code=$?; }
 
+# missed TEXT FILE SED COMMAND...: with this change of a file below $scratch COMMAND fails and prints TEXT.
+missed() {
+    local text=$1 file=$scratch/$2 change=$3
+    shift 3
+    cp "$file" "$scratch/before"
+    sed -i "$change" "$file"
+    ! cmp -s "$file" "$scratch/before" || broken "$change changes nothing in $file"
+    exitCodeOf "$@"
+    same "$change in $file: $output" "$code" 1
+    holds "$change in $file" "$output" "$text"
+    cp "$scratch/before" "$file"
+}
+
 # eventually WHAT COMMAND...: COMMAND succeeds within 10 seconds.
 eventually() {
     local what=$1 i

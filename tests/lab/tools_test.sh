@@ -113,17 +113,7 @@ exportsMissNothingThatIsDeclared() {
     [[ $output != *'g()'* ]] || broken "a function that needs no library: $output"
 }
 
-# checkFacts TEXT FILE SED: with the change, check-facts fails and prints TEXT.
-checkFacts() {
-    local text=$1 file=$scratch/$2 change=$3
-    cp "$file" "$scratch/before"
-    sed -i "$change" "$file"
-    ! cmp -s "$file" "$scratch/before" || broken "$change changes nothing in $2"
-    exitCodeOf "$root/tools/check-facts" "$scratch"
-    same "$change in $2" "$code" 1
-    holds "$change in $2" "$output" "$text"
-    cp "$scratch/before" "$file"
-}
+checkFacts() { missed "$1" "$2" "$3" "$root/tools/check-facts" "$scratch"; }
 
 # Removes one fact after another from a copy of the checkout.
 factsAreMissedWhereTheyAreForgotten() {

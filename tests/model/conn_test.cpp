@@ -117,8 +117,10 @@ TEST(LocalConn, EveryAddressIsListedWithBothPortsThenTheRelay) {
     EXPECT_FALSE(Conn::localFarlink().isValid()) << "enabled, but without an alias";
     farlink["server_alias"] = "relay-a";
     EXPECT_EQ(texts({Conn::listLocal().back()}), "flk:relay-a:443 ");
-    farlink["enabled"] = "true";
-    EXPECT_FALSE(Conn::localFarlink().isValid()) << "not a bool";
+    for (const Json::Value &notOn : {Json::Value(false), Json::Value("true")}) {
+        farlink["enabled"] = notOn;
+        EXPECT_FALSE(Conn::localFarlink().isValid()) << notOn.asString();
+    }
 }
 
 TEST(LocalConn, AMachineWithoutAnAddressListsNothing) {

@@ -2,7 +2,6 @@
 #include "support/local_node.h"
 #include "support/log_capture.h"
 #include "support/other_process.h"
-#include "support/print_json.h"
 
 #include <ovradrcore/file_lock.h>
 #include <ovradrcore/json.h>
@@ -17,6 +16,7 @@
 #include <chrono>
 #include <filesystem>
 #include <fstream>
+#include <functional>
 #include <iterator>
 #include <list>
 #include <thread>
@@ -45,15 +45,14 @@ void writeIdentity(const std::string &text) {
 
 TEST(DRNode, IsValidWithBothIdsAnEndpointAndASession) {
     EXPECT_TRUE(example().isValid());
-    DRNode node = example();
-    node.session.clear();
-    EXPECT_FALSE(node.isValid());
-    node = example();
-    node.conn.port = -1;
-    EXPECT_FALSE(node.isValid());
-    node = example();
-    node.credId.clear();
-    EXPECT_FALSE(node.isValid());
+    const std::function<void(DRNode &)> lacking[] = {
+        [](DRNode &node) { node.session.clear(); }, [](DRNode &node) { node.conn.port = -1; },
+        [](DRNode &node) { node.credId.clear(); }, [](DRNode &node) { node.nodeId.clear(); }};
+    for (const auto &lack : lacking) {
+        DRNode node = example();
+        lack(node);
+        EXPECT_FALSE(node.isValid()) << node.toJson();
+    }
     EXPECT_FALSE(DRNode("x", "x").isValid()) << "equal ids that are not the local one";
     EXPECT_TRUE(DRNode::getLocalNode().isValid()) << "needs no endpoint and no session";
 }
@@ -106,8 +105,9 @@ TEST(DRNodeAttr, NeedsNodeAppAndNameButNoValue) {
               R"({"app":"","attr":"","node_id":"","value":""})");
 }
 
-TEST(Identity, IsMadeOnceAndKept) {
+TEST(Identity, IsMadeOnceAndKeptUntilAResetOfWhichThisProcessHearsNothing) {
     LogCapture log;
+    EXPECT_TRUE(DRNode::resetLocalNodeId()) << "nothing to reset";
     const std::string id = DRNode::getLocalNodeId();
     EXPECT_EQ(id.size(), 36U);
     EXPECT_EQ(identityFile(), "node_id=\"" + id + "\"\n");
@@ -118,13 +118,6 @@ TEST(Identity, IsMadeOnceAndKept) {
     struct stat status {};
     stat("/usr/ovra/etc/ovradr", &status);
     EXPECT_EQ(status.st_mode & 07777U, 0755U);
-}
-
-TEST(Identity, AResetMakesANewOneButThisProcessKeepsWhatItKnew) {
-    EXPECT_TRUE(DRNode::resetLocalNodeId()) << "nothing to reset";
-    const std::string id = DRNode::getLocalNodeId();
-    EXPECT_TRUE(DRNode::isLocalNodeId(id));
-    LogCapture log;
     EXPECT_TRUE(DRNode::resetLocalNodeId());
     EXPECT_EQ(log.count("WARN", "dr_node", "resetLocalNodeId", "Reset local nodeId: [success]"), 1);
     EXPECT_NE(DRNode::getLocalNodeId(), id);

@@ -2,7 +2,6 @@
 #pragma once
 
 #include "support/other_process.h"
-#include "support/print_json.h"
 
 #include <ovraplatform/appliance.h>
 

@@ -21,7 +21,7 @@ using OvraPlatform::apiSuccess;
 
 namespace {
 
-/// A session of another application, created without the library.
+/// A session of another application for the node "n1", created without the library.
 std::string foreignSession(const char *user) {
     OvraCgi handle{};
     OvraCgiInit("", &handle);
@@ -31,6 +31,7 @@ std::string foreignSession(const char *user) {
     OvraCgiSetOption(&handle, OVRA_CGI_OPT_SKIP_PASSWORD, &on);
     OvraCgiSetOption(&handle, OVRA_CGI_OPT_APP, "desktop");
     OvraCgiSetOption(&handle, OVRA_CGI_OPT_TIMEOUT, &timeout);
+    OvraCgiSetOption(&handle, OVRA_CGI_OPT_EXTRA, R"({"node_id":"n1"})");
     char sid[101] = {};
     EXPECT_EQ(OvraCgiLoginNoAuth(&handle, sid, sizeof(sid), "192.0.2.1"), 1);
     OvraCgiFree(&handle);
@@ -63,8 +64,14 @@ protected:
 } // namespace
 
 TEST_F(Session, OneNodeAndUserHaveOneSession) {
+    const std::string foreign = foreignSession("joe");
     const std::string first = create("n1", "joe");
     EXPECT_EQ(session.GetErrCode(), 0);
+    EXPECT_NE(first, foreign) << "another application's is never handed out";
+    OvraTest::RawSqlite sessions(OvraPlatform::kSessionsFile);
+    EXPECT_EQ(sessions.cell("SELECT ui || ifnull(expires, ' never') FROM session WHERE id = '" +
+                            first + "'"),
+              R"({"hide":true} never)");
     EXPECT_EQ(log.count("INFO", "node_session", "CreateNodeSession",
                         "Create node session for node[n1] with privielge of userName[joe]"),
               1);
@@ -80,8 +87,10 @@ TEST_F(Session, OneNodeAndUserHaveOneSession) {
 }
 
 TEST_F(Session, BadArgumentsAndUnknownUsersGetNone) {
-    EXPECT_EQ(create("", "joe") + create("n1", ""), "");
-    EXPECT_EQ(session.GetErrCode(), 401);
+    for (const std::string &node : {std::string(), std::string("n\xFF"), std::string(1020, 'n')}) {
+        EXPECT_EQ(create(node, "joe") + create("n1", ""), "") << "never found again";
+        EXPECT_EQ(session.GetErrCode(), 401);
+    }
     EXPECT_EQ(create("n1", "nobody"), "");
     EXPECT_EQ(session.GetErrCode(), 527);
     EXPECT_EQ(session.GetErrMsg().asString(), "nobody");
@@ -102,7 +111,9 @@ TEST_F(Session, BadArgumentsAndUnknownUsersGetNone) {
 
 TEST_F(Session, ATemporaryOneIsTiedToNoNodeAndEnds) {
     const std::string temp = session.CreateTempSession("joe", 7);
+    EXPECT_EQ(session.GetErrCode(), 0);
     EXPECT_EQ(userOf(temp), "joe");
+    EXPECT_EQ(session.GetErrCode(), 0);
     EXPECT_NE(create("n1", "joe"), temp);
     EXPECT_NE(session.CreateTempSession("joe", 60), temp) << "never reused";
     const std::string row = " WHERE id = '" + temp + "'";

@@ -1,6 +1,9 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
+// Included before every source of a test program.
+
+#if __has_include(<json/json.h>)
 #include <json/json.h>
 
 #include <ostream>
@@ -15,3 +18,4 @@ inline void PrintTo(const Value &value, std::ostream *out) {
 }
 
 } // namespace Json
+#endif

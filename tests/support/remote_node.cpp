@@ -64,6 +64,11 @@ void RemoteNode::answer(const std::string &call, const Answer &answer) {
     answers_[call] = answer;
 }
 
+void RemoteNode::forgetAnswers() {
+    const std::lock_guard<std::mutex> lock(guard_);
+    answers_.clear();
+}
+
 void RemoteNode::before(const std::string &method, std::function<void()> action) {
     const std::lock_guard<std::mutex> lock(guard_);
     actions_[method] = std::move(action);

@@ -2,7 +2,6 @@
 #pragma once
 
 #include "support/misbehaving_server.h"
-#include "support/print_json.h"
 #include "support/sealing_daemon.h"
 
 #include <functional>
@@ -27,6 +26,7 @@ public:
     void answer(const std::string &call, const std::string &document);
     /// Something other than a reply.
     void answer(const std::string &call, const Answer &answer);
+    void forgetAnswers();
     /// Runs before the calls of `method` are answered.
     void before(const std::string &method, std::function<void()> action);
     /// From now on connections are refused, and idle ones are cut.

@@ -3,8 +3,11 @@
 // The handling of every error number of the credential library, with a test double that fails on
 // demand: the real library cannot be made to return them all.
 
+#include "clock.h"
+#include "support/local_node.h"
 #include "support/log_capture.h"
 #include "transport/conn_cache.h"
+#include "transport/node_valid_cred_cache.h"
 
 #include <ovracredential/cred_request.h>
 #include <ovradrcore/json.h>
@@ -26,6 +29,9 @@ struct Script {
     int error = 0;
     int allocated = 0;
     int sent = 0;
+    int probed = 0;
+    int lookedUp = 0;
+    std::int64_t now = 1'000'000'000'000; ///< every failed request takes 10 seconds
     long timeout = 0;
     int encryptMode = 0;
     std::string upload;
@@ -86,7 +92,8 @@ CredRequest::~CredRequest() = default;
 int CredRequest::SetURL(const std::string &, const std::string &, int, const std::string &) {
     return ok("url");
 }
-int CredRequest::SetDefaultTimeout(long) {
+int CredRequest::SetDefaultTimeout(long seconds) {
+    EXPECT_EQ(seconds, 10) << "only probes set it";
     return ok("timeout");
 }
 int CredRequest::SetResponseTimeout(long seconds) {
@@ -107,8 +114,10 @@ int CredRequest::CreateWebAPIRequest(CredRequest &, OVRACred *, OVRACredSess *, 
 }
 int CredRequest::Process(bool reuse, int mode) {
     EXPECT_TRUE(reuse);
-    script.sent += mode == 0 ? 1 : 0;
-    return mode == 2 ? ok("probe") : ok("process");
+    ++(mode == 2 ? script.probed : script.sent);
+    const int done = mode == 2 ? ok("probe") : ok("process");
+    script.now += done == 0 ? 10'000 : 0;
+    return done;
 }
 std::string CredRequest::GetResponse() const {
     return R"({"success":true})";
@@ -125,6 +134,7 @@ int CredRequestUtil::Logout(OVRACred *, OVRACredSess *) {
     return 1;
 }
 int CredRequestFarlink::GetConnInfo(const std::string &alias, Json::Value &info, const void *) {
+    ++script.lookedUp;
     info["host"] = alias + ".relay";
     info["protocol"] = "https";
     info["port"] = 6001;
@@ -133,6 +143,7 @@ int CredRequestFarlink::GetConnInfo(const std::string &alias, Json::Value &info,
 } // namespace OVRA
 
 using namespace OvraDRNode;
+using namespace OvraTest;
 
 namespace {
 
@@ -175,6 +186,7 @@ TEST_F(CredError, LibraryNumbersBecomeCodesAndOnlyLostConnectionsMarkTheEndpoint
         {"process", 4, 525, "null", false}, {"process", 6, 526, "null", false},
         {"process", 5, 500, "null", true},  {"process", 10, 500, "null", true},
         {"process", 1, 524, "1", false},    {"process", 99, 524, "99", false},
+        {"process", 2, 524, "2", false},    {"process", 15, 524, "15", false},
         {"process", 0, 0, "null", false},   {"create", 7, 524, "7", false},
         {"create", 5, 500, "null", true},
     };
@@ -232,10 +244,58 @@ TEST_F(CredError, ARelayEndpointIsResolvedBeforeUse) {
     EXPECT_TRUE(sender.getConn() == Conn::https("alias.relay", 6001)) << "the old one stays";
 }
 
-TEST_F(CredError, AProbeThatCannotBeSetUpLeavesTheVerdictOfARefresh) {
-    script.fail = {"timeout"};
-    ConnCache(conn).UpdateWithData(true, 1, 1);
-    EXPECT_TRUE(BaseSender::GetCachedConnectable(conn));
-    EXPECT_FALSE(BaseSender::IsConnectable(conn));
+TEST_F(CredError, AProbeThatSaysNothingOfTheEndpointLeavesTheVerdictOfARefresh) {
+    const struct {
+        const char *step;
+        int number;
+        bool kept; ///< also by a probe that was asked for
+    } cases[] = {{"timeout", 1, false}, {"probe", 2, true}};
+    for (const auto &each : cases) {
+        script.fail = {each.step};
+        script.error = each.number;
+        ConnCache(conn).UpdateWithData(true, 1, 1);
+        EXPECT_TRUE(BaseSender::GetCachedConnectable(conn)) << each.step;
+        EXPECT_GT(ConnCache(conn).GetCachedAge(), 1000) << each.step << ": it is still the old one";
+        EXPECT_FALSE(BaseSender::IsConnectable(conn)) << each.step;
+        EXPECT_EQ(ConnCache(conn).getStoredVerdict(), each.kept) << each.step;
+    }
     EXPECT_EQ(log.count("Failed to set timeout of conn"), 2);
+}
+
+TEST_F(CredError, OneRequestAsksASilentEndpointOnceHoweverManyCredentialsItHas) {
+    const struct {
+        const char *step;
+        int number;
+        int probed;
+        int sent;
+        int code;
+    } cases[] = {
+        {"probe", 10, 2, 0, 500},
+        {"process", 10, 2, 2, 500},
+        {"process", 15, 2, 2, 524}, // the request may have arrived: 500 would deny it
+    };
+    OvraDRCore::setSystemClock([] { return script.now; });
+    provisionNode();
+    for (int i = 0; i < 6; ++i) {
+        addCred("temp_cred", "n1", "t" + std::to_string(i), "https", 5001 + i % 2, "s");
+    }
+    for (const auto &each : cases) {
+        script = Script{{each.step}, each.number};
+        NodeValidCredCache("n1").UpdateWithData("t0");
+        NodeSender sender("n1");
+        EXPECT_FALSE(sender.process(WebAPI::getDRNodeInfoAPI({})).isValid());
+        EXPECT_EQ(script.probed, each.probed) << each.step << each.number;
+        EXPECT_EQ(script.sent, each.sent) << each.step << each.number;
+        EXPECT_EQ(sender.GetErrCode(), each.code) << each.step << each.number;
+        executeSql("UPDATE temp_cred SET port = port + 2");
+    }
+    const Conn relayed("127.0.0.1", "flk", 443);
+    addCred("node_cred", "n2", "c9", "flk", 443, "s");
+    ConnCache(relayed).UpdateWithData(false);
+    script = Script{{}, 0, 0, 0, 0, 0, script.now};
+    CredNodeSender sender("c9");
+    EXPECT_FALSE(sender.process(WebAPI::getDRNodeInfoAPI({})).isValid());
+    EXPECT_EQ(sender.GetErrMsg(), relayed.toJson());
+    EXPECT_EQ(script.lookedUp, 0) << "the relay service is not asked where a dead alias is";
+    OvraDRCore::setSystemClock(nullptr);
 }

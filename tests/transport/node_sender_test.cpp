@@ -25,8 +25,8 @@ namespace {
 constexpr const char *kNoPermission = R"({"success":false,"error":{"code":105}})";
 constexpr const char *kOtherError = R"({"success":false,"error":{"code":999,"msg":"m"}})";
 
-/// A node with the credentials c1, c2 (node) and t1 (temporary), all to one endpoint; their
-/// sessions are s1, s2 and s3.
+/// A node with the credentials c1, c2 (node) and t1 (temporary), all to one endpoint, with the
+/// sessions s1, s2 and s3; and another node with the credential o1 and the session o1.
 class NodeSend : public testing::Test {
 protected:
     void SetUp() override {
@@ -35,6 +35,7 @@ protected:
         addCred("node_cred", "n1", "c1", "https", remote.port(), "s1");
         addCred("node_cred", "n1", "c2", "https", remote.port(), "s2");
         addCred("temp_cred", "n1", "t1", "https", remote.port(), "s3");
+        addCred("node_cred", "n2", "o1", "https", other.port(), "o1");
         ConnCache(conn).UpdateWithData(true);
     }
     void remember(const std::string &credId) { NodeValidCredCache("n1").UpdateWithData(credId); }
@@ -45,6 +46,7 @@ protected:
     }
 
     RemoteNode remote;
+    RemoteNode other;
     Conn conn = Conn::https("127.0.0.1", remote.port());
     NodeSender sender{"n1"};
     LogCapture log;
@@ -126,6 +128,30 @@ TEST_F(NodeSend, ADeadEndpointIsPassedOver) {
     }
 }
 
+TEST_F(NodeSend, WhatIsKnownOfOneNodeIsNotOfAnother) {
+    EXPECT_TRUE(send().isSuccess());
+    other.answer("o1 test_privilege", kNoPermission);
+    NodeSender toOther("n2");
+    EXPECT_TRUE(toOther.process(WebAPI::getDRNodeInfoAPI({})).isSuccess());
+    EXPECT_EQ(other.calls(), "probe, o1 test_privilege, o1 info");
+    EXPECT_TRUE(toOther.isConnectable());
+    other.die();
+    EXPECT_FALSE(toOther.process(WebAPI::getDRNodeInfoAPI({})).isSuccess());
+    EXPECT_FALSE(toOther.isConnectable());
+    EXPECT_TRUE(send().isSuccess());
+    EXPECT_EQ(remote.calls(), "s1 info");
+    EXPECT_TRUE(sender.isConnectable());
+}
+
+TEST_F(NodeSend, ARememberedCredentialWhoseRowCannotBeReadIsNotTakenForTried) {
+    // The list has a blob that a look-up by text does not find, as if the row had been locked then.
+    executeSql("DELETE FROM temp_cred; DELETE FROM node_cred WHERE cred_id <> 'c1';"
+               "UPDATE node_cred SET cred_id = CAST(cred_id AS BLOB)");
+    remember("c1");
+    EXPECT_TRUE(send().isSuccess()) << sender.GetErrCode();
+    EXPECT_EQ(remote.calls(), "s1 info");
+}
+
 TEST_F(NodeSend, WithNothingRememberedTheFirstWithTheRightIsFoundAndThenUsed) {
     remote.answer("s1 test_privilege", kNoPermission);
     EXPECT_TRUE(send().isSuccess());
@@ -189,6 +215,13 @@ TEST_F(NodeSend, OneNamedCredential) {
     EXPECT_EQ(CredNodeSender("").GetErrCode(), 401);
     EXPECT_EQ(CredNodeSender("c1").GetErrCode(), 0);
     EXPECT_EQ(CredNodeSender(node).GetErrCode(), 516);
+    CredNodeSender kept("c1");
+    EXPECT_FALSE(kept.setCred(""));
+    EXPECT_FALSE(kept.setCred("c9"));
+    EXPECT_FALSE(kept.setCred(node));
+    EXPECT_EQ(kept.getNode().credId, "c1") << "what was refused changed nothing";
+    EXPECT_FALSE(sender.setNode("") || sender.setNode(node));
+    EXPECT_TRUE(send().isSuccess());
 }
 
 TEST_F(NodeSend, TheRightIsAskedForAgainWhenTheVerdictHasExpired) {
@@ -224,7 +257,7 @@ TEST_F(NodeSend, ARelayedTestOfPrivilegeSaysNothingAboutTheCredentialThatCarried
                         "Not update no permission of credId[c1] in cache for relay test privilege "
                         "request"),
               1);
-    EXPECT_FALSE(permission.SetPrivilege(WebAPI::getDRNodeInfoAPI({}), false) == false);
+    EXPECT_TRUE(permission.SetPrivilege(WebAPI::getDRNodeInfoAPI({}), false));
     EXPECT_FALSE(permission.GetCachedHasPrivilege());
     EXPECT_FALSE(CredPermissionCache("").SetHasPrivilege());
     EXPECT_TRUE(CredPermissionCache("new").GetCachedHasPrivilege());

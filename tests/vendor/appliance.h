@@ -29,11 +29,10 @@ public:
         : conn(OvraDRNode::Conn::https(host, 5001))
         , remote(OvraVendor::credentialLibrary().remotes["https://" + host + ":5001"])
         , nodeId_(nodeId) {
-        remote.accounts = {{"joe", {"pw"}}};
         remote.answer = [this](const OvraVendor::Call &call) { return answer(call); };
     }
 
-    /// The answer to "method" or "session method" from now on, as JSON text.
+    /// The answer to a method from now on, as JSON text.
     std::map<std::string, std::string> answers;
     OvraDRNode::Conn conn;
     OvraVendor::Remote &remote;
@@ -49,12 +48,10 @@ public:
     }
     /// The first call of `method` so far; an empty one if there was none.
     OvraVendor::Call callOf(const std::string &method) const {
-        for (const OvraVendor::Call &call : remote.calls) {
-            if (call.method == method) {
-                return call;
-            }
-        }
-        return {};
+        const auto found =
+            std::find_if(remote.calls.begin(), remote.calls.end(),
+                         [&method](const auto &call) { return call.method == method; });
+        return found != remote.calls.end() ? *found : OvraVendor::Call();
     }
     /// Stores a credential for this node with a session known to it.
     void grant(const std::string &credId, const std::string &session) {
@@ -65,11 +62,8 @@ public:
 
 private:
     Json::Value answer(const OvraVendor::Call &call) {
-        for (const std::string &name : {call.session + " " + call.method, call.method}) {
-            const auto found = answers.find(name);
-            if (found != answers.end()) {
-                return json(found->second);
-            }
+        if (answers.count(call.method) != 0) {
+            return json(answers[call.method]);
         }
         Json::Value data(Json::objectValue);
         if (call.api == "OVRA.DR.Node" && call.method == "info") {

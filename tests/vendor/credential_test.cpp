@@ -30,7 +30,7 @@ protected:
 } // namespace
 
 TEST_F(Credential, IsMadeOverAnAccountThatIsLoggedOutAgain) {
-    peer.remote.accounts["joe"].code = "123456";
+    peer.remote.login = "joe/pw/123456";
     {
         DRNodeCredCreate flow;
         ASSERT_TRUE(flow.setCred(peer.conn, "joe", "pw", "123456"));
@@ -46,34 +46,20 @@ TEST_F(Credential, IsMadeOverAnAccountThatIsLoggedOutAgain) {
     EXPECT_EQ(NodeCache("n1", false).GetHostName(), "peer");
 }
 
-TEST_F(Credential, IsNotMadeWhenTheLogInIsRefused) {
-    peer.remote.accounts = {
-        {"joe", {"pw", "123456"}}, {"off", {"pw", "", true}}, {"guest", {"pw", "", false, false}}};
-    const struct {
-        const char *account, *password, *code;
-        int error;
-    } cases[] = {
-        {"nobody", "pw", "", 501}, {"joe", "wrong", "123456", 501}, {"off", "pw", "", 502},
-        {"guest", "pw", "", 503},  {"joe", "pw", "", 504},          {"joe", "pw", "000000", 505},
-    };
-    for (const auto &each : cases) {
+TEST_F(Credential, IsNotMadeWhenTheLogInIsRefusedOrTheRemoteLost) {
+    for (const auto &[refusal, error] : {std::pair(400, 501), {402, 503}, {404, 505}}) {
+        peer.remote.refusal = refusal;
         DRNodeCredCreate flow;
-        EXPECT_FALSE(flow.setCred(peer.conn, each.account, each.password, each.code)) << each.error;
-        EXPECT_EQ(flow.GetErrCode(), each.error) << each.account;
+        EXPECT_FALSE(flow.setCred(peer.conn, "joe", "pw", "000000"));
+        EXPECT_EQ(flow.GetErrCode(), error);
     }
-    peer.remote.reachable = false;
-    DRNodeCredCreate flow;
-    EXPECT_FALSE(flow.setCred(peer.conn, "joe", "pw", "123456"));
-    EXPECT_EQ(flow.GetErrCode(), 500);
-    EXPECT_EQ(rows(), "");
     EXPECT_EQ(peer.remote.logins + peer.remote.logouts, 0);
-}
-
-TEST_F(Credential, IsLostWithTheRemoteDuringItsCreationAndLeavesNothing) {
     DRNodeCredCreate flow;
     ASSERT_TRUE(flow.setCred(peer.conn, "joe", "pw", ""));
     peer.remote.reachable = false;
     EXPECT_FALSE(flow.process());
+    EXPECT_EQ(flow.GetErrCode(), 500);
+    EXPECT_FALSE(flow.setCred(peer.conn, "joe", "pw", ""));
     EXPECT_EQ(flow.GetErrCode(), 500);
     EXPECT_EQ(rows(), "");
 }

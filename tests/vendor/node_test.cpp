@@ -12,18 +12,6 @@ using namespace OvraVendor;
 
 namespace {
 
-/// Requests for this node stay local; its own operation reports where it ran.
-class WhereAmI : public NodeOperationDispatcher {
-public:
-    using NodeOperationDispatcher::NodeOperationDispatcher;
-    bool IsValidParam() override { return true; }
-    bool RunLocal() override {
-        result = "here";
-        return true;
-    }
-    OvraDRCore::Request GetRequest() override { return WebAPI::getDRNodeInfoAPI({}); }
-};
-
 std::string text(const std::vector<Conn> &conns) {
     std::string all;
     for (const Conn &conn : conns) {
@@ -104,10 +92,6 @@ TEST_F(Appliance, RunsWhatIsForThisNodeHere) {
     EXPECT_EQ(asked, "admin: OVRA.DR.Node info 1");
     EXPECT_TRUE(
         CredNodeSender(DRNode::getLocalNode()).process(WebAPI::getDRNodeInfoAPI({})).isSuccess());
-
-    WhereAmI operation(DRNode::getLocalNodeId());
-    EXPECT_TRUE(operation.Run());
-    EXPECT_EQ(operation.GetResult().asString(), "here");
 
     webApiLibrary().answer = nullptr;
     EXPECT_EQ(sender.process(WebAPI::getDRNodeInfoAPI({})).getErrCode(), 100) << "nobody to ask";

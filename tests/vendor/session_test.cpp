@@ -48,9 +48,6 @@ TEST_F(GrantedSession, IsOneForANodeAndAUser) {
     EXPECT_EQ(session.GetUserBySession(id), "joe");
     EXPECT_EQ(session.GetUserBySession("unknown"), "");
     EXPECT_EQ(session.GetErrCode(), 528);
-}
-
-TEST_F(GrantedSession, KeepsTheAddressOfAWebClient) {
     setenv("REMOTE_ADDR", "192.0.2.50", 1);
     EXPECT_EQ(stored(session.CreateTempSession("joe", 300)).client, "192.0.2.50");
 }

@@ -2,6 +2,12 @@
 #pragma once
 
 #include "commands/commands.h"
+#include "failure.h"
+#include "node_ref.h"
+
+namespace OvraDRNode {
+class BaseSender;
+} // namespace OvraDRNode
 
 namespace Ovradr {
 
@@ -11,5 +17,9 @@ void addCredSetCommand(CLI::App &family, Command &chosen);
 void addCredDeleteCommand(CLI::App &family, Command &chosen);
 void addCredReverseCommand(CLI::App &family, Command &chosen);
 void addCredTestCommand(CLI::App &family, Command &chosen);
+
+/// Whether the session of a credential is accepted at its endpoint, the node there is the right
+/// one, and the right is there. \return the credential with its account
+Outcome testCred(OvraDRNode::BaseSender &sender, const FoundCred &cred);
 
 } // namespace Ovradr

@@ -8,14 +8,13 @@
 
 #include <ovradrnode/node_create.h>
 
-#include <shared/session_lock.h>
-
 #include <memory>
 
 namespace Ovradr {
 
 namespace {
 
+using OvraApps::FlowState;
 using OvraDRNode::Conn;
 using OvraDRNode::CredCreate;
 using OvraDRNode::DRNode;
@@ -74,9 +73,9 @@ Outcome runFlow(CredCreate &flow, const Conn &conn, const CreateOptions &options
     if (options.dryRun) {
         return checkOnly(flow, conn);
     }
-    const OvraApps::SessionLock lock(OvraApps::SessionLock::Purpose::kObtain);
-    if (!flow.processKnownNode()) {
-        return flowFailure(flow, conn);
+    const FlowState state = OvraApps::createCredential(flow);
+    if (state != FlowState::kDone) {
+        return state == FlowState::kBusy ? busyFailure() : flowFailure(flow, conn);
     }
     const DRNode &record = flow.getNode();
     Report report;

@@ -14,45 +14,48 @@ namespace Ovradr {
 namespace {
 
 using OvraDRCore::Response;
-using OvraDRNode::CredNodeSender;
 using OvraDRNode::DRNode;
 namespace WebAPI = OvraDRNode::WebAPI;
 
-/// Why a request failed.
-Refusal refusal(const CredNodeSender &sender, const Response &response) {
-    Refusal found = failureOf(errorOf(sender, response));
-    found.value().message.insert(0, targetText(sender.getNode().conn) + ": ");
-    return found;
+Outcome test(const FoundCred &cred) {
+    OvraDRNode::CredNodeSender sender(cred.record);
+    return testCred(sender, cred).map([](Report report) {
+        report.text += "It works.\n";
+        return report;
+    });
 }
 
-/// Whether the session is accepted, the node is the right one, and the right is there.
-Outcome test(const FoundCred &cred) {
+} // namespace
+
+Outcome testCred(OvraDRNode::BaseSender &sender, const FoundCred &cred) {
     const DRNode &record = cred.record;
-    CredNodeSender sender(record);
+    const auto refusal = [&](const Response &response) {
+        Refusal found = failureOf(errorOf(sender, response));
+        found.value().message.insert(0, targetText(record.conn) + ": ");
+        return found;
+    };
     const Response info = sender.process(WebAPI::getDRNodeInfoAPI({}));
     if (!info.isSuccess()) {
-        return refusal(sender, info);
+        return refusal(info);
     }
     if (info.getDataFieldtoStr("node_id") != record.nodeId) {
         return failure(ExitCode::kFailed,
                        targetText(record.conn) +
                            " is now another node than the one that the credential is for.",
-                       "Delete the credential, and make a new one with `ovradr cred create`.");
+                       "Check the endpoint, or make a new credential with `ovradr cred create`.");
     }
     const Response right = sender.process(WebAPI::getDRNodeTestPrivilegeAPI());
     if (!right.isSuccess()) {
-        return refusal(sender, right);
+        return refusal(right);
     }
     const Response owner = sender.process(WebAPI::getDRNodeSessionGetAPI(record.session));
     const std::string account = owner.getDataFieldtoStr("account");
     Report report;
     report.data = credJson(record, cred.temporary);
     report.data["account"] = account;
-    report.text = credText(record, cred.temporary, account) + "It works.\n";
+    report.text = credText(record, cred.temporary, account);
     return report;
 }
-
-} // namespace
 
 void addCredTestCommand(CLI::App &family, Command &chosen) {
     CLI::App *command = family.add_subcommand(

@@ -72,7 +72,7 @@ Outcome forget(PendingReleases &store, const std::vector<PendingRelease> &releas
     if (!reference) {
         return Refusal(reference.error());
     }
-    if (!store.remove(*reference)) {
+    if (!store.forget(*reference)) {
         return storeFailure(ExitCode::kNotSetUp, store.error());
     }
     Report report;

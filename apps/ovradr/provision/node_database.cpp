@@ -163,9 +163,7 @@ Expected<void> checkNodeDatabase() {
     if (version > kSchemaVersion) {
         return newerSchema(path, version);
     }
-    return unusable(path,
-                    handler.GetErrMsg().isString() ? handler.GetErrMsg().asString()
-                                                   : "it holds no schema version",
+    return unusable(path, handler.GetErrMsg().asString(),
                     "Run `ovradr setup`, which says what is wrong with it.");
 }
 

@@ -5,15 +5,16 @@
 #include "handlers/params.h"
 #include "handlers/relay.h"
 #include "handlers/words.h"
-#include "shared/session_lock.h"
 #include "shared/session_release.h"
 
+#include <ovradrcore/json.h>
 #include <ovradrcore/log.h>
 #include <ovradrnode/cred_reverse_create.h>
 #include <ovradrnode/dr_node.h>
 #include <ovradrnode/node_create.h>
 #include <ovradrnode/node_db.h>
 #include <ovradrnode/node_set.h>
+#include <ovraplatform/account_store.h>
 #include <ovraplatform/api_errors.h>
 
 #include <string>
@@ -24,6 +25,7 @@ namespace Ovradrd {
 namespace {
 
 namespace ERR = OvraDRCore::ERR;
+using OvraApps::FlowState;
 using OvraDRNode::Conn;
 using OvraDRNode::CredReverseCreate;
 using OvraDRNode::DRNode;
@@ -32,11 +34,19 @@ using OvraPlatform::APICaller;
 using OvraPlatform::apiError;
 using OvraPlatform::apiSuccess;
 
+constexpr char kDirection[] = "cred_direction";
 constexpr char kUnidirection[] = "unidirection";
 constexpr char kBidirection[] = "bidirection";
 
 Json::Value noSuchCredential() {
     return apiError(ERR::kCredNotFound, "this node has no such credential: list those that it has");
+}
+
+/// The reply of a flow behind another one that does not end.
+Json::Value busy() {
+    return apiError(OvraPlatform::APIError::kTooBusy,
+                    "another flow changes credentials of the same node, nothing was done: try "
+                    "again later");
 }
 
 /// Where other nodes reach this one; an error reply in `refusal` if there is no such place.
@@ -51,6 +61,23 @@ std::vector<Conn> localConns(Json::Value &refusal) {
     return conns;
 }
 
+/// The account of this appliance with whose rights another node comes back.
+std::string readLocalAccount(Params &in, const APICaller &caller) {
+    constexpr char kName[] = "local_account";
+    const std::string named = in.optionalText(kName, Params::kMaxAccount);
+    if (named.empty() && !caller.local) {
+        return caller.user;
+    }
+    OvraPlatform::AccountStore accounts;
+    const auto account = accounts.find(named);
+    if (!account || !account->administrator || account->disabled) {
+        in.refuse(kName, "local_account has to name an administrator of this appliance, with whose "
+                         "rights the other node comes back; only a caller with a session of its "
+                         "own may leave it out");
+    }
+    return named;
+}
+
 /// Has the node behind a credential create one back to this node.
 bool reverse(CredReverseCreate &flow, const std::string &credId, const std::string &account,
              const std::vector<Conn> &conns) {
@@ -60,14 +87,18 @@ bool reverse(CredReverseCreate &flow, const std::string &credId, const std::stri
 
 /// A credential in both directions is one unit: if the way back fails, the way there is removed
 /// too.
-Json::Value addReverse(Json::Value data, const std::string &credId, const APICaller &caller,
+Json::Value addReverse(Json::Value data, const std::string &credId, const std::string &account,
                        const std::vector<Conn> &conns) {
     CredReverseCreate flow;
-    if (!reverse(flow, credId, caller.user, conns)) {
-        OVRA_NOTICE("The credential [%s] is deleted again: none could be made back to this node",
-                    credId.c_str());
+    if (!reverse(flow, credId, account, conns)) {
+        OVRA_NOTICE(
+            "The credential [%s] is deleted again: none could be made back to this node. If "
+            "the answer of the other node was lost, it holds one all the same: see `ovradr "
+            "session list`",
+            credId.c_str());
         DRNode record;
-        if (!DRNodeDB::GetCred(credId, record) || !OvraApps::deleteCredential(record, false).done) {
+        if (!DRNodeDB::GetCred(credId, record) ||
+            OvraApps::deleteCredential(record, false).state != FlowState::kDone) {
             OVRA_ERR("The credential [%s] could not be deleted: delete it by hand", credId.c_str());
         }
         return flowError(flow, ERR::kCredIncomplete);
@@ -85,18 +116,25 @@ Json::Value carryOut(OvraDRNode::CredCreate &flow, const Proof &proof) {
     if (flow.isLocalNode()) {
         return OvraPlatform::apiBadParameter("conn", "conn is this node itself: name another one");
     }
-    const OvraApps::SessionLock lock(OvraApps::SessionLock::Purpose::kObtain);
-    return flow.processKnownNode() ? Json::Value() : flowError(flow, ERR::kCredIncomplete);
+    switch (OvraApps::createCredential(flow)) {
+    case FlowState::kDone:
+        return {};
+    case FlowState::kBusy:
+        return busy();
+    default:
+        return flowError(flow, ERR::kCredIncomplete);
+    }
 }
 
 Json::Value create(const Json::Value &params, const APICaller &caller) {
     Params in(params);
     const Proof proof(in, true);
-    const std::string direction = in.word("cred_direction", {kUnidirection, kBidirection});
+    const std::string direction = in.word(kDirection, {kUnidirection, kBidirection});
+    const bool bothWays = direction == kBidirection;
+    const std::string account = bothWays ? readLocalAccount(in, caller) : "";
     if (!in.ok()) {
         return in.error();
     }
-    const bool bothWays = direction == kBidirection;
     Json::Value refusal;
     const std::vector<Conn> conns = bothWays ? localConns(refusal) : std::vector<Conn>();
     if (!refusal.isNull()) {
@@ -109,7 +147,13 @@ Json::Value create(const Json::Value &params, const APICaller &caller) {
     }
     Json::Value data(Json::objectValue);
     data["src_cred"] = flow.getNode().toJson();
-    return bothWays ? addReverse(data, flow.getNode().credId, caller, conns) : apiSuccess(data);
+    return bothWays ? addReverse(data, flow.getNode().credId, account, conns) : apiSuccess(data);
+}
+
+OvraPlatform::APIQueue queueOfCreate(const Json::Value &params) {
+    return OvraDRCore::memberString(params, kDirection) == kBidirection
+               ? OvraPlatform::APIQueue::kTwoWay
+               : OvraPlatform::APIQueue::kOutbound;
 }
 
 Json::Value createTemporary(const Json::Value &params, const APICaller & /*caller*/) {
@@ -173,9 +217,11 @@ Json::Value list(const Json::Value &params, const APICaller & /*caller*/) {
         return in.error();
     }
     // Unreadable tables read as empty ones, and a session audit would end those in use.
-    if (OvraDRNode::NodeDBHandler::GetHandler().GetSchemaVersion() < 0) {
+    auto database = OvraDRNode::NodeDBHandler::GetHandler();
+    if (database.GetSchemaVersion() < 0) {
         return apiError(OvraPlatform::APIError::kInternal,
-                        "the node database cannot be read now: see the log of the appliance");
+                        "the node database of the appliance cannot be read (" +
+                            database.GetErrMsg().asString() + "): try again");
     }
     Json::Value data(Json::objectValue);
     data["creds"] = Json::Value(Json::arrayValue);
@@ -205,14 +251,24 @@ Json::Value set(const Json::Value &params, bool dryRun) {
     OvraDRNode::DRNodeCredSet flow;
     const bool armed = flow.setCredId(credId) &&
                        flow.setCred(conn, login.account, login.password.get(), login.otpCode);
-    const auto change = [&flow] { return flow.process(); };
-    if (!armed || !(dryRun ? flow.check() : OvraApps::runWithRelease(record, conn, change).done)) {
+    if (!armed || (dryRun && !flow.check())) {
         return flowError(flow, ERR::kCredIncomplete);
     }
-    if (!DRNodeDB::GetCred(credId, record)) {
-        return noSuchCredential();
+    if (dryRun) {
+        return apiSuccess(record.toJson());
     }
-    return apiSuccess(record.toJson());
+    const OvraApps::FlowResult result = OvraApps::changeCredential(flow, record, conn);
+    switch (result.state) {
+    case FlowState::kDone:
+        return apiSuccess(result.after.toJson());
+    case FlowState::kGone:
+        return noSuchCredential();
+    case FlowState::kBusy:
+        return busy();
+    case FlowState::kFailed:
+        break;
+    }
+    return flowError(flow, ERR::kCredIncomplete);
 }
 
 /// A missing credential counts as deleted.
@@ -228,12 +284,15 @@ Json::Value remove(const Json::Value &params, const APICaller & /*caller*/) {
         record.credId = credId;
     }
     const OvraApps::FlowResult result = OvraApps::deleteCredential(record, temporary);
-    if (!result.done) {
+    if (result.state == FlowState::kBusy) {
+        return busy();
+    }
+    if (result.state != FlowState::kDone) {
         return apiError(ERR::kFailed, "the credential cannot be deleted: see the log of the "
                                       "appliance, and check that its disk is not full");
     }
     Json::Value data;
-    if (!record.session.empty()) {
+    if (!result.before.session.empty()) {
         data["release"] = OvraApps::releaseWord(result.release.state);
     }
     return apiSuccess(data);
@@ -249,6 +308,7 @@ Json::Value runReverse(const Json::Value &params, const APICaller &caller, Run r
     if (in.has("conn")) {
         conns.push_back(in.conn("conn"));
     }
+    const std::string account = readLocalAccount(in, caller);
     if (!in.ok()) {
         return in.error();
     }
@@ -263,7 +323,7 @@ Json::Value runReverse(const Json::Value &params, const APICaller &caller, Run r
             return refusal;
         }
     }
-    if (!flow.setLocalAccount(caller.user) || !flow.addLocalConns(conns) || !run(flow)) {
+    if (!flow.setLocalAccount(account) || !flow.addLocalConns(conns) || !run(flow)) {
         return flowError(flow, ERR::kCredIncomplete);
     }
     Json::Value data(Json::objectValue);
@@ -321,18 +381,19 @@ void addCredentialAPI(OvraPlatform::APIRegistry &registry) {
     };
     add("get", APIQueue::kQuick, get);
     add("list", APIQueue::kQuick, list);
-    add("create", APIQueue::kSlow, create);
-    add("temp_create", APIQueue::kSlow, createTemporary);
-    add("test_create", APIQueue::kSlow, testCreate);
-    add("set", APIQueue::kSlow,
+    registry.add(kCredentialApi, 1, "create", OvraPlatform::APIRight::kAdministrator,
+                 APIQueue::kTwoWay, create, queueOfCreate);
+    add("temp_create", APIQueue::kOutbound, createTemporary);
+    add("test_create", APIQueue::kOutbound, testCreate);
+    add("set", APIQueue::kOutbound,
         [](const Json::Value &params, const APICaller & /*caller*/) { return set(params, false); });
-    add("test_set", APIQueue::kSlow,
+    add("test_set", APIQueue::kOutbound,
         [](const Json::Value &params, const APICaller & /*caller*/) { return set(params, true); });
-    add("delete", APIQueue::kSlow, remove);
-    add("reverse_create", APIQueue::kSlow, createReverse<CredReverseCreate>);
-    add("temp_reverse_create", APIQueue::kSlow, createReverse<OvraDRNode::TempCredReverseCreate>);
-    add("test_reverse_create", APIQueue::kSlow, testReverse);
-    add(kRelay, APIQueue::kSlow, relay);
+    add("delete", APIQueue::kOutbound, remove);
+    add("reverse_create", APIQueue::kTwoWay, createReverse<CredReverseCreate>);
+    add("temp_reverse_create", APIQueue::kTwoWay, createReverse<OvraDRNode::TempCredReverseCreate>);
+    add("test_reverse_create", APIQueue::kTwoWay, testReverse);
+    add(kRelay, APIQueue::kRelay, relay);
 }
 
 } // namespace Ovradrd

@@ -105,7 +105,7 @@ void addNodeAPI(OvraPlatform::APIRegistry &registry) {
     registry.add(kNodeApi, 1, "info", APIRight::kSession, APIQueue::kQuick, info);
     registry.add(kNodeApi, 1, "test_privilege", APIRight::kAdministrator, APIQueue::kQuick,
                  testPrivilege);
-    registry.add(kNodeApi, 1, "test_connection", APIRight::kAdministrator, APIQueue::kSlow,
+    registry.add(kNodeApi, 1, "test_connection", APIRight::kAdministrator, APIQueue::kOutbound,
                  testConnection);
 }
 

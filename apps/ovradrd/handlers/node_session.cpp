@@ -5,6 +5,9 @@
 
 #include <ovradrnode/node_session.h>
 #include <ovraplatform/api_errors.h>
+#include <ovraplatform/session_walk.h>
+
+#include <mutex>
 
 namespace Ovradrd {
 
@@ -33,6 +36,12 @@ Json::Value create(const Json::Value &params, const APICaller &caller) {
     if (!in.ok()) {
         return in.error();
     }
+    // The search for the previous session and the grant of a new one are two steps. Only this
+    // process grants any.
+    static std::mutex granting;
+    const std::lock_guard<std::mutex> lock(granting);
+    const OvraPlatform::SessionWalk walk(
+        {caller.user, NodeSession::kApplication, NodeSession::ExtraOf(nodeId)});
     NodeSession sessions;
     const std::string session = sessions.CreateNodeSession(nodeId, caller.user);
     return granted(sessions, session);

@@ -114,9 +114,9 @@ Json::Value testSyncSpeed(const Json::Value &params, const APICaller & /*caller*
 void addSpeedAPI(OvraPlatform::APIRegistry &registry) {
     using OvraPlatform::APIQueue;
     using OvraPlatform::APIRight;
-    registry.add(kNodeApi, 1, "test_download_speed", APIRight::kAdministrator, APIQueue::kSlow,
+    registry.add(kNodeApi, 1, "test_download_speed", APIRight::kAdministrator, APIQueue::kOutbound,
                  testDownloadSpeed);
-    registry.add(kNodeApi, 1, "test_sync_speed", APIRight::kAdministrator, APIQueue::kSlow,
+    registry.add(kNodeApi, 1, "test_sync_speed", APIRight::kAdministrator, APIQueue::kTwoWay,
                  testSyncSpeed);
 }
 

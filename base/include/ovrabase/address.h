@@ -24,6 +24,9 @@ struct SocketAddress {
 std::optional<SocketAddress> parseAddress(const std::string &text, int port);
 bool isNumericAddress(const std::string &text);
 
+/// Whether it is in fe80::/10 (RFC 4291, 2.5.6): it is nobody's without the name of a link.
+bool isIpv6LinkLocal(const std::string &text);
+
 /// The canonical form of an IPv6 address (RFC 5952), with or without brackets; "" for any other
 /// text.
 std::string normalizeIpv6(std::string text);

@@ -40,6 +40,12 @@ enum class Links { kFollow, kRefuse };
 [[nodiscard]] Expected<bool> createFile(const std::string &path, std::string_view content,
                                         mode_t mode);
 
+/// Opens /dev/null for each of the descriptors 0, 1 and 2 that is closed, so that no file or socket
+/// that is opened later gets one of them, and with it what is meant for a person. For the first
+/// line of main(). What was closed stays unusable: the standard input cannot be read, nor the
+/// others written.
+void fillStandardDescriptors();
+
 /// One read-modify-write of a small file, exclusive among all processes and threads that use this
 /// class for files in the same directory: the lock is flock(2) on the file ".lock" there, which
 /// only the directory's owner can open, and is released when the process dies. Readers take no

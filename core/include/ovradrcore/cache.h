@@ -16,8 +16,14 @@ namespace OvraDRCore {
 /// processes, even if the process dies at any instruction; a read takes no lock. A directory or
 /// file that is damaged, or not exclusively ours, reads as empty; the library then works without a
 /// cache. Format, limits and recovery: docs/files.md.
+///
 /// Refreshing: an entry that is absent, older than its lifetime, stamped in the future or rejected
-/// by IsValid() is refreshed by one process at a time. No lock on the file is held meanwhile.
+/// by IsValid() is refreshed by one process at a time. No lock on the file is held meanwhile. A
+/// reader that waits for another one's refresh takes what that one stores, or its failure. If that
+/// one dies, or has not ended after kLongestRefresh, the reader refreshes the entry itself; within
+/// a CacheWaitScope the waits for all entries together are that long at most. A refreshed value is
+/// as old as the end of GetUpdatedData(), at most kLongestRefresh after its begin: a process that
+/// was stopped meanwhile has old news. It never replaces a younger value.
 class OVRADRCORE_EXPORT Cache {
 public:
     virtual ~Cache();
@@ -32,9 +38,13 @@ public:
     /// A further reason to refresh a value that is still fresh; false by default.
     virtual bool IsNeedUpdate(const Json::Value &value) const;
     /// Whether a reader needs fresh data while another process fetches it: if true, it waits for
-    /// that process and uses its result; if false, it uses the stored value at once (and waits only
-    /// if nothing is stored). By default: the `flag` of the constructor.
+    /// that process and uses its result; if false, it uses a stored value at once that has expired
+    /// kLongestRefresh ago at most. By default: the `flag` of the constructor.
     virtual bool IsUpdatedDataRequired() const;
+
+    /// Seconds that a refresh may take before others no longer wait for it: the probe of an
+    /// endpoint that says nothing (10 seconds), and a bit.
+    static constexpr long kLongestRefresh = 11;
 
     /// \param path      the cache file; its directory is created with mode 0700 if missing
     /// \param name      the entry's key in the file
@@ -55,22 +65,36 @@ public:
     /// Seconds for which a stored value is fresh.
     long GetLifetime() const { return lifetime_; }
     /// Fetches now, whatever is stored, and stores the result.
+    /// \return false if nothing could be fetched, or the result could not be stored.
     bool Update() const;
-    /// Stores `value` as taken now.
+    /// Stores `value` as taken now; false if it could not be stored.
     bool UpdateWithData(const Json::Value &value) const;
-    /// Stores `value` as measured from `start` to `end` (seconds of the system clock).
+    /// Stores `value` as measured from `start` to `end` (seconds of the system clock), even if a
+    /// younger value is stored.
     bool UpdateWithData(const Json::Value &value, long start, long end) const;
     /// Deletes the entry; succeeds if there is none.
     bool Remove();
 
 private:
-    bool refresh(Json::Value &value) const;
+    enum class Refresh { kFailed, kFetched, kStored };
+    Refresh refresh(Json::Value &value) const;
 
     std::string path_;
     std::string name_;
     long lifetime_;
     bool flag_;
     int count_;
+};
+
+/// One request of this thread, which may read several cache entries: while a scope exists, the
+/// thread waits Cache::kLongestRefresh in sum at most for refreshes by others, then refreshes
+/// itself whatever is being refreshed. A scope within a scope changes nothing.
+class OVRADRCORE_EXPORT CacheWaitScope {
+public:
+    CacheWaitScope();
+    ~CacheWaitScope();
+    CacheWaitScope(const CacheWaitScope &) = delete;
+    CacheWaitScope &operator=(const CacheWaitScope &) = delete;
 };
 
 } // namespace OvraDRCore

@@ -15,6 +15,8 @@ public:
     /// Default time-out for a reply, in seconds. A peer may have to probe several endpoints (10
     /// seconds each) before it answers.
     static constexpr long kDefaultResponseTimeout = 60;
+    /// A day, the longest that a reply can be waited for.
+    static constexpr long kMaxResponseTimeout = 86400;
 
     /// Empty and invalid.
     Request() = default;
@@ -37,8 +39,10 @@ public:
     void addParam(const Json::Value &object);
     /// The parameters hold login material and must be sealed.
     void setEncryptRequired(bool required) { encryptRequired_ = required; }
-    /// \param seconds  how long the transport waits for the reply
-    void setResponseTimeout(long seconds) { responseTimeout_ = seconds; }
+    /// \param seconds  how long the transport waits for the reply, 1 to kMaxResponseTimeout; any
+    /// other
+    ///                 value is logged and makes the request invalid
+    void setResponseTimeout(long seconds);
     /// A file to upload, and the name under which it is sent. Both or neither.
     void setUpload(const std::string &path, const std::string &name);
 
@@ -51,7 +55,8 @@ public:
     const std::string &getUploadPath() const { return uploadPath_; }
     const std::string &getUploadName() const { return uploadName_; }
 
-    /// API and method not empty, version positive, parameters an object.
+    /// API and method not empty and without a NUL, version positive, parameters an object, the
+    /// time-out one that is possible.
     bool isValid() const;
     /// Members "api", "method", "version", "params" and, only when set, "encrypt".
     Json::Value toJson() const;

@@ -18,9 +18,10 @@ namespace OvraDRCore {
 /// An open SQLite file. Construction reports no error: if the file cannot be opened, every
 /// operation fails. Neither the file nor a table is ever created here.
 ///
-/// Every operation returns false on failure, records 407 with SQLite's error text as the message,
-/// and logs it once at WARN; nothing throws. Operations wait for a file locked by another process.
-/// An object is for one thread at a time, and a forked child does not use that of its parent.
+/// Every operation returns false on failure and records 407 with SQLite's error text as the
+/// message; it logs nothing, because the caller knows whether a failure matters. Nothing throws.
+/// Operations wait for a file locked by another process. An object is for one thread at a time, and
+/// a forked child does not use that of its parent.
 class OVRADRCORE_EXPORT SqliteDB : public ErrRecorder {
 public:
     /// \param path       the database file
@@ -42,7 +43,8 @@ public:
     /// An empty condition is rejected: a delete never affects every row.
     [[nodiscard]] bool DeleteRecord(const std::string &condition, const SqliteTableHandler &table);
 
-    /// The schema version that provisioning wrote into the info table; -1 if it cannot be read.
+    /// The schema version that provisioning wrote into the info table; -1 if it cannot be read,
+    /// and GetErrMsg() says why.
     [[nodiscard]] int GetSchemaVersion();
 
 private:
@@ -53,7 +55,6 @@ private:
     bool run(const std::string &sql, std::vector<SqliteValueList> *rows, bool firstOnly);
     bool fail(const std::string &what) const;
 
-    std::string path_;
     std::string infoTable_;
     std::unique_ptr<SqliteWait> wait_;
     std::unique_ptr<sqlite3, Close> db_;

@@ -13,7 +13,7 @@ namespace OvraDRCore {
 /// provides no random bytes.
 [[nodiscard]] OVRADRCORE_EXPORT std::string GenerateUUID();
 
-/// The text of a value as a default string stream writes it. Only `int` is provided.
+/// The decimal text of a value, without grouping in any locale. Only `int` is provided.
 template <typename T>
 std::string ToString(const T &value);
 template <>

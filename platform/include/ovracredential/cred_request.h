@@ -77,8 +77,11 @@ public:
     int Process(bool reuse, int mode);
     /// The response document of the last request, unsealed if it was sealed; "" if there was none.
     std::string GetResponse() const;
-    /// The library's error number; 0 if there was none. 4: not permitted (HTTP 401, 403), 5: cannot
-    /// connect, 6: the endpoint's key is not the one trusted for it, 10: timed out.
+    /// The library's error number; 0 if there was none. 2: this process has no memory, descriptor
+    /// or thread left; 4: not permitted (HTTP 401, 403); 5: cannot connect; 6: the endpoint's key
+    /// is not the one trusted for it; 9: the connection ended before the reply; 10: timed out
+    /// before the request was sent; 15: sent, and no answer in time. After 9 and 15 it may have
+    /// been carried out.
     int GetError() const;
 
 private:

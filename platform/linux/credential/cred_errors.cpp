@@ -10,7 +10,9 @@ const char *credErrorText(int error) {
     case CredError::kBadArgument:
         return "the endpoint or the call is not valid: check protocol, host and port";
     case CredError::kOutOfMemory:
-        return "out of memory or descriptors";
+        return "this process has no memory, descriptor or thread left: end what takes them, or "
+               "raise its "
+               "limits";
     case CredError::kInternal:
         return "the request failed: the system log says why";
     case CredError::kNoPermission:
@@ -35,6 +37,8 @@ const char *credErrorText(int error) {
         return "the file cannot be sent: it must be a readable file, and go over https";
     case CredError::kSealFailed:
         return "the request could not be sealed: check that the endpoint is an appliance's";
+    case CredError::kUnanswered:
+        return "no answer in time: check whether the request was carried out";
     case CredError::kTrustUnavailable:
         return "the file of trusted keys cannot be read or written: the system log says why";
     }

@@ -3,6 +3,7 @@
 
 #include "credential/cred_objects.h"
 #include "http/web_call.h"
+#include "relay/alias_place.h"
 
 #include <ovrabase/secret.h>
 #include <ovradrcore/log.h>
@@ -68,16 +69,12 @@ struct CredRequest::Impl {
         return 1;
     }
 
-    OvraPlatform::Deadline deadline() const {
-        return std::chrono::steady_clock::now() + std::chrono::seconds(seconds);
-    }
-
-    CredExpected<void> send(bool reuse) {
+    CredExpected<void> send(bool reuse, OvraPlatform::Deadline deadline) {
         if (!endpoint || !call) {
             return tl::unexpected(CredError::kBadArgument);
         }
         return OvraPlatform::callWebAPI(*endpoint, *call,
-                                        {deadline(), reuse, encryptMode == kSealed, upload})
+                                        {deadline, reuse, encryptMode == kSealed, upload})
             .map([this](WebReply reply) {
                 response = std::move(reply.document);
                 OvraDRCore::ReplyHandOver::give(response, std::move(reply.response));
@@ -95,23 +92,30 @@ struct CredRequest::Impl {
         return true;
     }
 
-    bool findAlias() {
-        Json::Value info;
-        return CredRequestFarlink::GetConnInfo(alias, info, nullptr) != 0 &&
-               setEndpoint(info["protocol"].asString(), info["host"].asString(),
-                           info["port"].asInt());
+    CredExpected<void> findAlias() {
+        return OvraPlatform::findAlias(alias, std::chrono::seconds(seconds))
+            .and_then([this](const OvraPlatform::AliasPlace &place) -> CredExpected<void> {
+                if (setEndpoint("https", place.host, place.port)) {
+                    return {};
+                }
+                return tl::unexpected(CredError::kCannotConnect);
+            });
     }
 
     CredExpected<void> process(bool reuse, int mode) {
-        if (!alias.empty() && !findAlias()) {
-            return tl::unexpected(CredError::kCannotConnect);
+        const OvraPlatform::Deadline deadline =
+            std::chrono::steady_clock::now() + std::chrono::seconds(seconds);
+        if (!alias.empty()) {
+            if (const auto found = findAlias(); !found) {
+                return found;
+            }
         }
         switch (mode) {
         case kModeRequest:
-            return send(reuse);
+            return send(reuse, deadline);
         case kModeProbe:
             if (endpoint) {
-                return OvraPlatform::probe(*endpoint, url, deadline());
+                return OvraPlatform::probe(*endpoint, url, deadline);
             }
             break;
         default:

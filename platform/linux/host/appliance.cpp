@@ -62,6 +62,10 @@ void readAddresses(const Lines &lines, ApplianceConfig &config) {
         if (!OvraBase::isNumericAddress(address)) {
             config.problems.push_back("address holds [" + address +
                                       "], not a numeric IPv4 or IPv6 address");
+        } else if (OvraBase::isIpv6LinkLocal(address)) {
+            config.problems.push_back("address holds [" + address +
+                                      "], a link-local address, which is the same on every link: "
+                                      "name another one");
         } else if (config.addresses.size() == kMaxAddresses) {
             config.problems.push_back("address holds more than " + std::to_string(kMaxAddresses) +
                                       " addresses");

@@ -1,14 +1,10 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "http/connection_pool.h"
 
-#include <ovrabase/unique_fd.h>
-
 #include <pthread.h>
-#include <sys/socket.h>
 #include <unistd.h>
 
 #include <algorithm>
-#include <exception>
 #include <iterator>
 #include <mutex>
 #include <utility>
@@ -74,17 +70,10 @@ void ConnectionPool::keep(const Endpoint &endpoint, const TrustStore::Stamp &tru
     idle_.splice(idle_.end(), added);
 }
 
-int ConnectionPool::openSocket(int family, int type, int protocol) {
+int ConnectionPool::adopt(OvraBase::UniqueFd socket) {
     const std::lock_guard<OvraDRCore::ForkSafeMutex> lock(mutex_);
-    OvraBase::UniqueFd fd(socket(family, type | SOCK_CLOEXEC, protocol));
-    try {
-        if (fd) {
-            sockets_.insert(fd.get());
-        }
-    } catch (const std::exception &) { // no memory; the caller is a callback of libcurl
-        return -1;
-    }
-    return fd.release();
+    sockets_.insert(socket.get());
+    return socket.release();
 }
 
 void ConnectionPool::closeSocket(int fd) {

@@ -4,6 +4,7 @@
 #include "http/http_connection.h"
 #include "ovraplatform/trust_store.h"
 
+#include <ovrabase/unique_fd.h>
 #include <ovradrcore/no_fork.h>
 
 #include <chrono>
@@ -38,8 +39,8 @@ public:
     void keep(const Endpoint &endpoint, const TrustStore::Stamp &trust,
               std::unique_ptr<HttpConnection> connection);
 
-    /// A socket that a forked child closes; -1 if none is available.
-    int openSocket(int family, int type, int protocol);
+    /// Takes over a socket that a forked child shall close.
+    int adopt(OvraBase::UniqueFd socket);
     void closeSocket(int fd);
 
 private:

@@ -24,6 +24,7 @@ public:
     bool isTls() const { return protocol_ == "https"; }
     /// The host, in lower case, without brackets.
     const std::string &host() const { return host_; }
+    int port() const { return port_; }
     bool isIpv6() const { return host_.find(':') != std::string::npos; }
     /// "https://host:5001": the same text for the same endpoint.
     std::string key() const;

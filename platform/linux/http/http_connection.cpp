@@ -2,8 +2,10 @@
 #include "http/http_connection.h"
 
 #include "http/connection_pool.h"
+#include "http/dialer.h"
 #include "http/sigpipe_guard.h"
 
+#include <ovrabase/address.h>
 #include <ovradrcore/log.h>
 #include <ovradrcore/no_fork.h>
 
@@ -23,12 +25,11 @@ namespace {
 /// The hashed folder and not the bundle of all certificates, which takes 26 ms to load for every
 /// connection.
 constexpr char kCertificateDir[] = "/etc/ssl/certs";
-constexpr long kConnectMillis = 10'000;
+constexpr std::chrono::seconds kConnectTime{10};
 /// A peer whose kernel is silent for this long is gone, however long the answer may take.
 constexpr unsigned kSilenceMillis = 10'000;
 constexpr int kKeepAliveSeconds = 3;
 constexpr std::size_t kMaxHeader = std::size_t{64} * 1024;
-constexpr std::size_t kMaxProbeReply = std::size_t{64} * 1024;
 constexpr int kMaxAttempts = 2;
 
 bool curlReady() {
@@ -59,16 +60,26 @@ struct FreeMime {
 };
 using Mime = std::unique_ptr<curl_mime, FreeMime>;
 
-/// How many bytes the peer's kernel has acknowledged on this connection (tcp(7), RFC 4898);
-/// std::nullopt if this kernel does not tell.
-std::optional<std::uint64_t> deliveredBytes(int socket) {
+/// States of a connection (tcp(7)), of a header that excludes linux/tcp.h.
+constexpr unsigned kClosed = 7;
+constexpr unsigned kCloseWait = 8;
+
+/// What the kernel says of a connection, bytes acknowledged by the peer included (RFC 4898);
+/// std::nullopt if it does not tell.
+std::optional<tcp_info> tcpInfo(int socket) {
     tcp_info info{};
-    socklen_t size = sizeof(info);
-    constexpr std::size_t kNeeded = offsetof(tcp_info, tcpi_bytes_acked) + sizeof(__u64);
+    socklen_t size = sizeof info;
+    constexpr std::size_t kNeeded =
+        offsetof(tcp_info, tcpi_bytes_acked) + sizeof info.tcpi_bytes_acked;
     if (getsockopt(socket, IPPROTO_TCP, TCP_INFO, &info, &size) != 0 || size < kNeeded) {
         return std::nullopt;
     }
-    return info.tcpi_bytes_acked;
+    return info;
+}
+
+std::optional<std::uint64_t> deliveredBytes(int socket) {
+    const std::optional<tcp_info> info = tcpInfo(socket);
+    return info ? std::optional<std::uint64_t>(info->tcpi_bytes_acked) : std::nullopt;
 }
 
 /// Makes the kernel end the connection if the peer's kernel neither acknowledges what is sent nor
@@ -85,19 +96,32 @@ void endWhenSilent(int socket) {
 
 /// Whether the connection ended because the peer fell silent; the kernel's clocks are a little
 /// apart.
-bool endedInSilence(int socket) {
+bool hasEndedInSilence(const tcp_info &info) {
     constexpr unsigned kTolerance = 500; // milliseconds
-    constexpr unsigned kClosed = 7;      // TCP_CLOSE of a header that excludes linux/tcp.h
-    tcp_info info{};
-    socklen_t size = sizeof info;
-    return getsockopt(socket, IPPROTO_TCP, TCP_INFO, &info, &size) == 0 &&
-           size >= offsetof(tcp_info, tcpi_last_ack_recv) + sizeof info.tcpi_last_ack_recv &&
-           info.tcpi_state == kClosed && info.tcpi_last_ack_recv + kTolerance >= kSilenceMillis;
+    return info.tcpi_state == kClosed && info.tcpi_last_ack_recv + kTolerance >= kSilenceMillis;
+}
+
+/// Whether the peer ended its stream before anything beyond `before` reached it: its last segment
+/// acknowledges all that its kernel had then. A reset acknowledges nothing.
+bool hasEndedUnread(const tcp_info &info, std::optional<std::uint64_t> before) {
+    return info.tcpi_state == kCloseWait && before == info.tcpi_bytes_acked;
 }
 
 long millisecondsUntil(Deadline deadline) {
     using std::chrono::milliseconds;
     return std::chrono::ceil<milliseconds>(deadline - std::chrono::steady_clock::now()).count();
+}
+
+/// Adds a line to a list. \return whether there was memory
+template <typename List>
+bool append(List &list, const std::string &line) {
+    curl_slist *longer = curl_slist_append(list.get(), line.c_str());
+    if (longer == nullptr) {
+        return false;
+    }
+    static_cast<void>(list.release()); // it is part of the longer list
+    list.reset(longer);
+    return true;
 }
 
 bool isRegularFile(const std::string &path) {
@@ -156,15 +180,14 @@ bool HttpConnection::setUp() {
     if (!handle_) {
         return false;
     }
-    constexpr std::size_t kMaxSockets = 16; // two at most are open at a time
-    sockets_.reserve(kMaxSockets);
-    for (const char *header : {"Accept: application/json", "Expect:"}) {
-        curl_slist *longer = curl_slist_append(headers_.get(), header);
-        if (longer == nullptr) {
-            return false;
-        }
-        static_cast<void>(headers_.release()); // it is part of the longer list
-        headers_.reset(longer);
+    const std::string &host = endpoint_.host();
+    // dial() finds the address; this one only keeps libcurl from asking for it as well (RFC 5737).
+    const bool listed =
+        append(headers_, "Accept: application/json") && append(headers_, "Expect:") &&
+        (OvraBase::isNumericAddress(host) ||
+         append(addresses_, OvraBase::joinHostPort(host, endpoint_.port()) + ":192.0.2.1"));
+    if (!listed) {
+        return false;
     }
     Options options(handle_.get());
     options.set(CURLOPT_NOSIGNAL, 1L)
@@ -177,14 +200,14 @@ bool HttpConnection::setUp() {
         .set(CURLOPT_HTTPHEADER, headers_.get())
         .set(CURLOPT_MAXCONNECTS, 1L)
         .set(CURLOPT_MAXAGE_CONN, static_cast<long>(ConnectionPool::kIdleTime.count()))
-        // A name server that is silent must not hold us longer than the time that was given.
-        .set(CURLOPT_QUICK_EXIT, 1L)
+        .set(CURLOPT_RESOLVE, addresses_.get())
         .set(CURLOPT_WRITEFUNCTION, &HttpConnection::onBody)
         .set(CURLOPT_WRITEDATA, this)
         .set(CURLOPT_HEADERFUNCTION, &HttpConnection::onHeader)
         .set(CURLOPT_HEADERDATA, this)
         .set(CURLOPT_OPENSOCKETFUNCTION, &HttpConnection::onOpenSocket)
         .set(CURLOPT_OPENSOCKETDATA, this)
+        .set(CURLOPT_SOCKOPTFUNCTION, &HttpConnection::onSocketOptions)
         .set(CURLOPT_CLOSESOCKETFUNCTION, &HttpConnection::onCloseSocket)
         .set(CURLOPT_CLOSESOCKETDATA, this)
         .set(CURLOPT_PREREQFUNCTION, &HttpConnection::onRequest)
@@ -209,11 +232,20 @@ bool HttpConnection::setUp() {
     return options.ok();
 }
 
-CredExpected<HttpAnswer> HttpConnection::get(const std::string &url, Deadline deadline) {
-    if (!Options(handle_.get()).set(CURLOPT_HTTPGET, 1L).ok()) {
+CredExpected<long> HttpConnection::status(const std::string &url, Deadline deadline) {
+    const bool set = Options(handle_.get())
+                         .set(CURLOPT_NOBODY, 1L) // a GET whose body is not waited for
+                         .set(CURLOPT_CUSTOMREQUEST, "GET")
+                         .ok();
+    if (!set) {
         return tl::unexpected(CredError::kOutOfMemory);
     }
-    return perform(url, deadline);
+    const CredExpected<HttpAnswer> answer = perform(url, deadline);
+    long status = 0;
+    curl_easy_getinfo(handle_.get(), CURLINFO_RESPONSE_CODE, &status);
+    constexpr long kFirstFinal = 200; // those before only announce an answer
+    return status >= kFirstFinal ? status
+                                 : answer.map([](const HttpAnswer &got) { return got.status; });
 }
 
 CredExpected<HttpAnswer> HttpConnection::post(const std::string &url, const std::string &body,
@@ -262,19 +294,21 @@ CredExpected<HttpAnswer> HttpConnection::perform(const std::string &url, Deadlin
     if (left <= 0) {
         return tl::unexpected(CredError::kTimedOut);
     }
-    const std::size_t limit = purpose_ == Purpose::kProbe ? kMaxProbeReply : kMaxReply;
-    const bool set = Options(handle_.get())
-                         .set(CURLOPT_URL, url.c_str())
-                         .set(CURLOPT_TIMEOUT_MS, left)
-                         .set(CURLOPT_CONNECTTIMEOUT_MS, std::min(left, kConnectMillis))
-                         .set(CURLOPT_MAXFILESIZE_LARGE, static_cast<curl_off_t>(limit))
-                         .ok();
+    connectDeadline_ = std::min(deadline, std::chrono::steady_clock::now() + kConnectTime);
+    const bool set =
+        Options(handle_.get())
+            .set(CURLOPT_URL, url.c_str())
+            .set(CURLOPT_TIMEOUT_MS, left)
+            .set(CURLOPT_CONNECTTIMEOUT_MS, std::max(millisecondsUntil(connectDeadline_), 1L))
+            .set(CURLOPT_MAXFILESIZE_LARGE, static_cast<curl_off_t>(kMaxReply))
+            .ok();
     if (!set) {
         return tl::unexpected(CredError::kOutOfMemory);
     }
     answer_ = HttpAnswer();
     headerBytes_ = 0;
     attempt_ = Attempt();
+    notConnected_.reset();
     replyTooLarge_ = false;
     const SigpipeGuard noSigpipe;
     const CURLcode code = transfer_.perform(handle_.get());
@@ -295,12 +329,17 @@ CredError HttpConnection::errorOf(CURLcode code) const {
     if (verdict == CertificateVerifier::Verdict::kUnavailable) {
         return CredError::kTrustUnavailable;
     }
-    if (attempt_.endedInSilence) {
-        return CredError::kTimedOut;
+    if (attempt_.endedInSilence || code == CURLE_OPERATION_TIMEDOUT) {
+        return attempt_.mayHaveArrived ? CredError::kUnanswered : CredError::kTimedOut;
     }
+    if (attempt_.mayHaveArrived && code == CURLE_COULDNT_CONNECT) {
+        return CredError::kConnectionLost; // connect() would not send it twice
+    }
+    return notConnected_ ? *notConnected_ : errorOfTransfer(code);
+}
+
+CredError HttpConnection::errorOfTransfer(CURLcode code) const {
     switch (code) {
-    case CURLE_OPERATION_TIMEDOUT:
-        return CredError::kTimedOut;
     case CURLE_COULDNT_RESOLVE_HOST:
     case CURLE_COULDNT_CONNECT:
     case CURLE_SSL_CONNECT_ERROR:
@@ -332,8 +371,7 @@ CredError HttpConnection::errorOf(CURLcode code) const {
 
 std::size_t HttpConnection::onBody(char *data, std::size_t size, std::size_t count, void *self) {
     auto *connection = static_cast<HttpConnection *>(self);
-    const std::size_t limit = connection->purpose_ == Purpose::kProbe ? kMaxProbeReply : kMaxReply;
-    if (connection->answer_.body.size() + size * count > limit) {
+    if (connection->answer_.body.size() + size * count > kMaxReply) {
         connection->replyTooLarge_ = true;
         return 0;
     }
@@ -360,54 +398,72 @@ CURLcode HttpConnection::onTlsContext(CURL *, void *context, void *self) {
 /// Called when a connection is ready (TLS included) and before anything of the request is sent.
 ///
 /// libcurl repeats a request by itself if a kept connection ends without an answer, even if the
-/// peer may have carried it out. Here it is repeated only if the peer's kernel had acknowledged
-/// none of its bytes, and not if the peer fell silent.
+/// peer may have carried it out. Here it is repeated only if the peer had ended its stream before
+/// any of the request reached it; after a reset nobody knows.
 int HttpConnection::onRequest(void *self, char *, char *, int, int) {
     auto *connection = static_cast<HttpConnection *>(self);
     Attempt &attempt = connection->attempt_;
     ++attempt.count;
-    if (attempt.count > kMaxAttempts || (attempt.count > 1 && attempt.mayHaveArrived)) {
+    if (attempt.count > kMaxAttempts || attempt.mayHaveArrived) {
         return CURL_PREREQFUNC_ABORT;
     }
     if (connection->purpose_ == Purpose::kRequests && !connection->verifier_.pinNewKey()) {
         return CURL_PREREQFUNC_ABORT;
     }
-    attempt.mayHaveArrived = true;
-    attempt.socket = connection->sockets_.size() == 1 ? connection->sockets_.front() : -1;
+    attempt.mayHaveArrived = connection->purpose_ == Purpose::kRequests;
+    attempt.socket = connection->socket_;
     attempt.delivered = deliveredBytes(attempt.socket);
-    if (attempt.socket >= 0 && !connection->endsWhenSilent_) {
+    if (!connection->endsWhenSilent_) {
         endWhenSilent(attempt.socket);
         connection->endsWhenSilent_ = true;
     }
     return CURL_PREREQFUNC_OK;
 }
 
-curl_socket_t HttpConnection::onOpenSocket(void *self, curlsocktype, curl_sockaddr *address) {
-    auto *connection = static_cast<HttpConnection *>(self);
-    if (connection->attempt_.endedInSilence) {
-        return CURL_SOCKET_BAD; // it would be waited for once more
-    }
-    const int fd = ConnectionPool::instance().openSocket(address->family, address->socktype,
-                                                         address->protocol);
-    if (fd < 0) {
+curl_socket_t HttpConnection::connect() {
+    if (attempt_.mayHaveArrived || attempt_.endedInSilence) {
         return CURL_SOCKET_BAD;
     }
-    connection->sockets_.push_back(fd);
-    connection->endsWhenSilent_ = false;
-    return fd;
+    CredExpected<OvraBase::UniqueFd> dialed = [this] {
+        const OvraDRCore::NoFork::Pause forksPass; // it waits for name servers and the peer
+        return dial(endpoint_, connectDeadline_);
+    }();
+    if (!dialed) {
+        notConnected_ = dialed.error();
+        return CURL_SOCKET_BAD;
+    }
+    socket_ = ConnectionPool::instance().adopt(std::move(*dialed));
+    endsWhenSilent_ = false;
+    return socket_;
+}
+
+/// The address that libcurl gives is not one; see setUp().
+curl_socket_t HttpConnection::onOpenSocket(void *self, curlsocktype, curl_sockaddr *) {
+    auto *connection = static_cast<HttpConnection *>(self);
+    try {
+        return connection->connect();
+    } catch (const std::exception &) {
+        connection->notConnected_ = CredError::kOutOfMemory;
+        return CURL_SOCKET_BAD;
+    }
+}
+
+int HttpConnection::onSocketOptions(void *, curl_socket_t, curlsocktype) {
+    return CURL_SOCKOPT_ALREADY_CONNECTED;
 }
 
 int HttpConnection::onCloseSocket(void *self, curl_socket_t socket) {
     auto *connection = static_cast<HttpConnection *>(self);
     Attempt &attempt = connection->attempt_;
     if (socket == attempt.socket) {
-        const std::optional<std::uint64_t> delivered = deliveredBytes(socket);
-        attempt.mayHaveArrived = !delivered || delivered != attempt.delivered;
-        attempt.endedInSilence = endedInSilence(socket);
+        const std::optional<tcp_info> info = tcpInfo(socket);
+        if (info && hasEndedUnread(*info, attempt.delivered)) {
+            attempt.mayHaveArrived = false;
+        }
+        attempt.endedInSilence = info && hasEndedInSilence(*info);
         attempt.socket = -1;
     }
-    std::vector<int> &sockets = connection->sockets_;
-    sockets.erase(std::remove(sockets.begin(), sockets.end(), socket), sockets.end());
+    connection->socket_ = -1;
     ConnectionPool::instance().closeSocket(socket);
     return 0;
 }

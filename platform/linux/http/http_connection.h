@@ -6,9 +6,10 @@
 #include "ovraplatform/cred_errors.h"
 #include "trust/certificate_verifier.h"
 
+#include <ovrabase/connect.h>
+
 #include <curl/curl.h>
 
-#include <chrono>
 #include <cstddef>
 #include <cstdint>
 #include <memory>
@@ -19,7 +20,7 @@
 
 namespace OvraPlatform {
 
-using Deadline = std::chrono::steady_clock::time_point;
+using OvraBase::Deadline;
 
 /// Bound on the body of a reply.
 inline constexpr std::size_t kMaxReply = std::size_t{8} * 1024 * 1024;
@@ -54,7 +55,8 @@ public:
     HttpConnection &operator=(const HttpConnection &) = delete;
     ~HttpConnection();
 
-    [[nodiscard]] CredExpected<HttpAnswer> get(const std::string &url, Deadline deadline);
+    /// The status of the answer to a GET, however much of the answer comes.
+    [[nodiscard]] CredExpected<long> status(const std::string &url, Deadline deadline);
     /// \param body  application/x-www-form-urlencoded
     [[nodiscard]] CredExpected<HttpAnswer> post(const std::string &url, const std::string &body,
                                                 Deadline deadline);
@@ -73,7 +75,7 @@ private:
         int count = 0;
         int socket = -1;
         std::optional<std::uint64_t> delivered; ///< bytes that had arrived when it began
-        bool mayHaveArrived = true;             ///< something of a request that failed
+        bool mayHaveArrived = false;            ///< something of the request
         bool endedInSilence = false;            ///< the peer fell silent
     };
     struct FreeHandle {
@@ -86,23 +88,29 @@ private:
     HttpConnection(const Endpoint &endpoint, Purpose purpose);
     [[nodiscard]] bool setUp();
     [[nodiscard]] CredExpected<HttpAnswer> perform(const std::string &url, Deadline deadline);
+    curl_socket_t connect();
     CredError errorOf(CURLcode code) const;
+    CredError errorOfTransfer(CURLcode code) const;
 
     static std::size_t onBody(char *data, std::size_t size, std::size_t count, void *self);
     static std::size_t onHeader(char *data, std::size_t size, std::size_t count, void *self);
     static CURLcode onTlsContext(CURL *handle, void *context, void *self);
     static int onRequest(void *self, char *peer, char *local, int peerPort, int localPort);
     static curl_socket_t onOpenSocket(void *self, curlsocktype type, curl_sockaddr *address);
+    static int onSocketOptions(void *self, curl_socket_t socket, curlsocktype type);
     static int onCloseSocket(void *self, curl_socket_t socket);
 
     Endpoint endpoint_;
     Purpose purpose_;
     CertificateVerifier verifier_;
     std::unique_ptr<curl_slist, FreeList> headers_;
+    std::unique_ptr<curl_slist, FreeList> addresses_;
     HttpAnswer answer_;
     std::size_t headerBytes_ = 0;
     Attempt attempt_;
-    std::vector<int> sockets_; ///< more than one only while several addresses are tried
+    int socket_ = -1;
+    Deadline connectDeadline_;
+    std::optional<CredError> notConnected_;
     bool replyTooLarge_ = false;
     bool endsWhenSilent_ = false; ///< the present socket has been told to
     // Last, so that they go first: closing a connection calls back.

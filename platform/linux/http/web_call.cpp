@@ -236,7 +236,8 @@ CredExpected<PublicKey> fetchSealKey(const Endpoint &endpoint, const WebCallOpti
     plain.upload.reset();
     const CredExpected<WebReply> reply = callPlain(endpoint, call, plain);
     if (!reply) {
-        return tl::unexpected(reply.error());
+        // Of the request that it is for nothing has been sent.
+        return tl::unexpected(withoutRequest(reply.error()));
     }
     const auto key = parsePublicKey(reply->response.getDataFieldtoStr("public_key"));
     if (!key) {
@@ -261,13 +262,12 @@ CredExpected<void> probe(const Endpoint &endpoint, const std::string &url, Deadl
     if (!connection) {
         return tl::unexpected(CredError::kOutOfMemory);
     }
-    return connection->get(url, deadline)
-        .and_then([](const HttpAnswer &answer) -> CredExpected<void> {
-            if (answer.status >= kHttpServerError || answer.status == kHttpNotFound) {
-                return tl::unexpected(CredError::kHttpStatus);
-            }
-            return {};
-        });
+    return connection->status(url, deadline).and_then([](long status) -> CredExpected<void> {
+        if (status >= kHttpServerError || status == kHttpNotFound) {
+            return tl::unexpected(CredError::kHttpStatus);
+        }
+        return {};
+    });
 }
 
 } // namespace OvraPlatform

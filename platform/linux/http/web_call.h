@@ -32,6 +32,11 @@ struct WebReply {
 [[nodiscard]] CredExpected<WebReply> callWebAPI(const Endpoint &endpoint, const WireCall &call,
                                                 const WebCallOptions &options);
 
+/// The error of a question that had to be answered before a request could be sent.
+inline CredError withoutRequest(CredError error) {
+    return error == CredError::kUnanswered ? CredError::kTimedOut : error;
+}
+
 /// Checks without any secret or trust whether the entry point answers.
 [[nodiscard]] CredExpected<void> probe(const Endpoint &endpoint, const std::string &url,
                                        Deadline deadline);

@@ -4,6 +4,7 @@
 #include "http/web_call.h"
 #include "ovracore/ovracore.h"
 #include "ovracredential/cred_request.h"
+#include "relay/alias_place.h"
 
 #include <ovrabase/address.h>
 #include <ovrabase/number.h>
@@ -86,7 +87,7 @@ bool writeFarlinkSettings(const FarlinkSettings &settings) {
 }
 
 FarlinkReply FarlinkClient::call(const char *method, const Json::Value &params,
-                                 std::chrono::seconds time) const {
+                                 std::chrono::milliseconds time) const {
     const auto endpoint = Endpoint::make("https", settings_.host, settings_.port);
     if (!endpoint) {
         return noAnswer(CredError::kBadArgument);
@@ -100,10 +101,10 @@ FarlinkReply FarlinkClient::call(const char *method, const Json::Value &params,
     return reply ? verdictOn(std::move(*reply)) : noAnswer(reply.error());
 }
 
-FarlinkReply FarlinkClient::lookUp(const std::string &alias) const {
+FarlinkReply FarlinkClient::lookUp(const std::string &alias, std::chrono::milliseconds time) const {
     Json::Value params(Json::objectValue);
     params["alias"] = alias;
-    return call("lookup", params, kAnswerTime);
+    return call("lookup", params, std::min<std::chrono::milliseconds>(time, kAnswerTime));
 }
 
 FarlinkReply FarlinkClient::enrol(const FarlinkKey &key) const {
@@ -132,6 +133,29 @@ FarlinkReply FarlinkClient::release(const std::string &token) const {
     return call("release", params, kAnswerTime);
 }
 
+CredExpected<AliasPlace> findAlias(const std::string &alias, std::chrono::milliseconds time) {
+    const auto settings = readFarlinkSettings();
+    if (!settings || settings->host.empty()) {
+        OVRA_NOTICE("[%s] cannot be looked up: %s", alias.c_str(),
+                    settings ? "no relay service is set up on this appliance; run "
+                               "ovradr farlink enable, or use a direct endpoint"
+                             : settings.error().c_str());
+        return tl::unexpected(CredError::kCannotConnect);
+    }
+    const FarlinkReply reply = FarlinkClient(*settings).lookUp(OvraBase::toLower(alias), time);
+    const Json::Value port = reply ? reply->getDataField("port") : Json::Value();
+    if (!port.isInt()) {
+        OVRA_NOTICE("The relay service [%s] does not tell where [%s] is reached: [%s]",
+                    settings->host.c_str(), alias.c_str(),
+                    reply ? "its answer has no port" : reply.error().text.c_str());
+        const CredError error = reply ? CredError::kNone : withoutRequest(reply.error().error);
+        const bool told = error == CredError::kTimedOut || error == CredError::kOutOfMemory;
+        return tl::unexpected(told ? error : CredError::kCannotConnect);
+    }
+    const std::string host = reply->getDataFieldtoStr("host");
+    return AliasPlace{host.empty() ? settings->host : host, port.asInt()};
+}
+
 } // namespace OvraPlatform
 
 namespace OVRA {
@@ -139,27 +163,13 @@ namespace OVRA {
 int CredRequestFarlink::GetConnInfo(const std::string &alias, Json::Value &info, const void *) {
     info = Json::Value();
     try {
-        const auto settings = OvraPlatform::readFarlinkSettings();
-        if (!settings || settings->host.empty()) {
-            OVRA_NOTICE("[%s] cannot be looked up: %s", alias.c_str(),
-                        settings ? "no relay service is set up on this appliance; run "
-                                   "ovradr farlink enable, or use a direct endpoint"
-                                 : settings.error().c_str());
+        const auto place = OvraPlatform::findAlias(alias, OvraPlatform::kAnswerTime);
+        if (!place) {
             return 0;
         }
-        const OvraPlatform::FarlinkReply reply =
-            OvraPlatform::FarlinkClient(*settings).lookUp(OvraBase::toLower(alias));
-        const Json::Value port = reply ? reply->getDataField("port") : Json::Value();
-        if (!port.isInt()) {
-            OVRA_NOTICE("The relay service [%s] does not tell where [%s] is reached: [%s]",
-                        settings->host.c_str(), alias.c_str(),
-                        reply ? "its answer has no port" : reply.error().text.c_str());
-            return 0;
-        }
-        const std::string host = reply->getDataFieldtoStr("host");
-        info["host"] = host.empty() ? settings->host : host;
+        info["host"] = place->host;
         info["protocol"] = "https";
-        info["port"] = port.asInt();
+        info["port"] = place->port;
         return 1;
     } catch (const std::exception &error) {
         OVRA_ERR("[%s] cannot be looked up: [%s]", alias.c_str(), error.what());

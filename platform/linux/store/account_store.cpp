@@ -5,6 +5,7 @@
 
 #include <ovrabase/encoding.h>
 #include <ovrabase/secret.h>
+#include <ovrabase/utf8.h>
 #include <ovradrcore/log.h>
 
 #include <sodium.h>
@@ -92,9 +93,15 @@ bool AccountStore::isName(std::string_view name) {
 }
 
 bool AccountStore::checkPassword(std::string_view password) {
-    return (password.size() >= kMinPassword && password.size() <= kMaxPassword) ||
-           database_.refuse("A password has " + std::to_string(kMinPassword) + " to " +
-                            std::to_string(kMaxPassword) + " bytes. Choose another one.");
+    if (password.size() < kMinPassword || password.size() > kMaxPassword) {
+        return database_.refuse("A password has " + std::to_string(kMinPassword) + " to " +
+                                std::to_string(kMaxPassword) + " bytes. Choose another one.");
+    }
+    // No other appliance could log in with it: a request carries text.
+    return (OvraBase::isUtf8(password) && password.find('\0') == std::string_view::npos) ||
+           database_.refuse(
+               "A password is text in UTF-8. Set the terminal or the file to UTF-8, or "
+               "choose another one.");
 }
 
 bool AccountStore::changedOne(const std::string &name) {

@@ -188,38 +188,53 @@ bool Database::setUp() {
     if (!execute("PRAGMA secure_delete = ON; BEGIN")) {
         return false;
     }
-    const bool fresh = pragma("PRAGMA user_version") == 0;
-    const bool ours = !fresh && isOurs();
+    const auto version = pragma("PRAGMA user_version");
+    const bool named = pragma("PRAGMA application_id") == layout_.applicationId;
     if (failed() || !execute("COMMIT")) {
         return false;
     }
-    if (ours || (fresh && makeTables())) {
+    if (version == layout_.version && named) {
+        return true;
+    }
+    const bool older = version == 0 || (named && isPrevious(version));
+    if (older && makeTables()) {
         return true;
     }
     if (!failed()) {
-        fail("The file [" + path_ + "] is not a " + layout_.name +
-             " that this version knows. Install the version that made it, or move it away.");
+        fail("The file [" + path_ + "] is not a " + layout_.name + " that this version knows" +
+             (named ? ": it has layout " + std::to_string(version.value_or(0)) + ", not " +
+                          std::to_string(layout_.version)
+                    : std::string()) +
+             ". Install the version that made it, or move it away.");
     }
     return false;
 }
 
-bool Database::isOurs() {
-    return pragma("PRAGMA user_version") == layout_.version &&
-           pragma("PRAGMA application_id") == layout_.applicationId;
+bool Database::isPrevious(std::optional<std::int64_t> version) const {
+    return layout_.upgrade != nullptr && version == layout_.version - 1;
 }
 
+/// Makes the tables in a new file, or upgrades those of the version before.
 /// \return false also if the file has another program's tables.
 bool Database::makeTables() {
     Transaction transaction(*this);
     if (!transaction.isOpen()) {
         return false;
     }
-    if (pragma("SELECT count(*) FROM sqlite_schema") != 0) {
-        return isOurs(); // another process was faster, or it is not our file
+    const auto version = pragma("PRAGMA user_version");
+    const bool named = pragma("PRAGMA application_id") == layout_.applicationId;
+    if (version == layout_.version && named) {
+        return true; // another process was faster
+    }
+    const bool upgrades = named && isPrevious(version);
+    if (!upgrades && pragma("SELECT count(*) FROM sqlite_schema") != 0) {
+        return false;
     }
     const std::string stamp = "PRAGMA application_id = " + std::to_string(layout_.applicationId) +
                               "; PRAGMA user_version = " + std::to_string(layout_.version);
-    return execute(layout_.schema) && execute(stamp.c_str()) && transaction.commit();
+    return (upgrades || execute(layout_.schema)) &&
+           (layout_.upgrade == nullptr || execute(layout_.upgrade)) && execute(stamp.c_str()) &&
+           transaction.commit();
 }
 
 Statement Database::prepare(const char *sql) {

@@ -2,6 +2,7 @@
 #include "ovracgi/ovracgi.h"
 
 #include "ovraplatform/session_store.h"
+#include "ovraplatform/session_walk.h"
 #include "store/client_context.h"
 
 #include <ovradrcore/log.h>
@@ -13,6 +14,7 @@
 #include <cstring>
 #include <memory>
 #include <string>
+#include <utility>
 
 using OvraPlatform::SessionRecord;
 using OvraPlatform::SessionRequest;
@@ -26,6 +28,8 @@ struct OvraCgiStore {
 };
 
 namespace {
+
+thread_local const OvraPlatform::SessionFilter *walked = nullptr; ///< of the SessionWalk
 
 struct PutJson {
     void operator()(json_object *object) const { json_object_put(object); }
@@ -69,6 +73,15 @@ OvraCgiStore *storeOf(OvraCgi *handle) {
 }
 
 } // namespace
+
+OvraPlatform::SessionWalk::SessionWalk(SessionFilter filter)
+    : filter_(std::move(filter)) {
+    walked = &filter_;
+}
+
+OvraPlatform::SessionWalk::~SessionWalk() {
+    walked = nullptr;
+}
 
 int OvraCgiInit(const char * /*name*/, OvraCgi *handle) {
     if (handle == nullptr) {
@@ -163,11 +176,11 @@ int OvraCgiRemoveSessionByFunc(OvraCgi *handle, OvraCgiTest test, void *argument
     if (store == nullptr || test == nullptr) {
         return -1;
     }
-    const bool done = store->sessions.removeIf([test, argument](const SessionRecord &session) {
+    const auto remove = [test, argument](const SessionRecord &session) {
         const JsonObject record = makeRecord(session);
         return record != nullptr && test(record.get(), argument) == 0;
-    });
-    return done ? 0 : -1;
+    };
+    return store->sessions.removeIf(remove, walked) ? 0 : -1;
 }
 
 int OvraCgiRemoveSessionByIndex(OvraCgi *handle, int field, const char *value) {

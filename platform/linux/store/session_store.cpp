@@ -22,7 +22,10 @@ constexpr std::size_t kReferenceBytes = 8;
 
 // "OvSe". The key of a session is the SHA-256 of its id: looking it up in the index takes a time
 // that depends on the hash, from which no id can be built up digit by digit.
-constexpr DatabaseLayout kLayout = {"session store", 0x4F765365, 1, R"(
+//
+// With its indexes and its count, layout 2 lets nothing look at every session. The partial indexes
+// cost a session that never ends nothing.
+constexpr DatabaseLayout kLayout = {"session store", 0x4F765365, 2, R"(
     CREATE TABLE session (
         key     BLOB PRIMARY KEY,
         id      TEXT NOT NULL,
@@ -36,7 +39,22 @@ constexpr DatabaseLayout kLayout = {"session store", 0x4F765365, 1, R"(
     ) STRICT, WITHOUT ROWID;
     CREATE INDEX session_user ON session (user);
     CREATE INDEX session_expires ON session (expires) WHERE expires IS NOT NULL;
+)",
+                                    R"(
+    DROP INDEX session_user;
+    CREATE INDEX session_owner ON session (user, app, extra);
+    CREATE INDEX session_timed ON session (user) WHERE expires IS NOT NULL;
+    CREATE INDEX session_created ON session (created) WHERE expires IS NOT NULL;
+    CREATE TABLE tally (sessions INTEGER NOT NULL) STRICT;
+    INSERT INTO tally SELECT count(*) FROM session;
+    CREATE TRIGGER session_made AFTER INSERT ON session
+        BEGIN UPDATE tally SET sessions = sessions + 1; END;
+    CREATE TRIGGER session_removed AFTER DELETE ON session
+        BEGIN UPDATE tally SET sessions = sessions - 1; END;
 )"};
+
+/// How many sessions a walk holds in memory.
+constexpr int kPage = 256;
 
 // ?1 is the time. A timed session made more than a minute in the future was made before the clock
 // was set back; nobody knows how long it would live.
@@ -151,9 +169,12 @@ std::optional<std::int64_t> SessionStore::count(const char *sql, const std::stri
 }
 
 bool SessionStore::removeExpired() {
-    return database_.prepare("DELETE FROM session WHERE NOT " OVRA_SESSION_LIVE)
-        .bind(1, now())
-        .run();
+    // The opposite of OVRA_SESSION_LIVE, each half found by its index.
+    const std::int64_t time = now();
+    return database_.prepare("DELETE FROM session WHERE expires <= ?1").bind(1, time).run() &&
+           database_.prepare("DELETE FROM session WHERE expires IS NOT NULL AND created > ?1 + 60")
+               .bind(1, time)
+               .run();
 }
 
 /// Sweeps, ends what must end, and checks the limits; inside the transaction of the insert.
@@ -168,14 +189,19 @@ bool SessionStore::makeRoom(const SessionRequest &request) {
              .run()) {
         return false;
     }
-    const auto ofUser = count("SELECT count(*) FROM session WHERE user = ?1", request.user);
-    const auto all = count("SELECT count(*) FROM session", {});
-    if (!ofUser || !all) {
+    const auto timed = request.timeout < 0
+                           ? 0
+                           : count("SELECT count(*) FROM session WHERE user = ?1 AND expires IS "
+                                   "NOT NULL",
+                                   request.user);
+    const auto all = count("SELECT sessions FROM tally", {});
+    if (!timed || !all) {
         return false;
     }
-    if (*ofUser >= kMaxSessionsOfUser) {
-        return database_.fail("User [" + request.user + "] has " + std::to_string(*ofUser) +
-                              " sessions, as many as a user may have. Remove some of them.");
+    if (*timed >= kMaxTimedOfUser) {
+        return database_.fail("User [" + request.user + "] has " + std::to_string(*timed) +
+                              " sessions that end by themselves, as many as a user may have. "
+                              "Remove some of them.");
     }
     if (*all >= kMaxSessions) {
         return database_.fail("The appliance has " + std::to_string(*all) +
@@ -270,23 +296,56 @@ bool SessionStore::sweep() {
     return removeExpired();
 }
 
-bool SessionStore::removeIf(const std::function<bool(const SessionRecord &)> &test) {
-    std::vector<SessionRecord> sessions;
-    if (!list(sessions)) {
+/// The next live sessions in the order of their keys, after this one.
+bool SessionStore::readPage(const SessionFilter *filter, const std::string &after, Page &page) {
+    constexpr char kAll[] =
+        "SELECT " OVRA_SESSION_COLUMNS ", key FROM session WHERE key > ?2 AND " OVRA_SESSION_LIVE
+        " ORDER BY key LIMIT ?3";
+    constexpr char kFiltered[] =
+        "SELECT " OVRA_SESSION_COLUMNS
+        ", key FROM session WHERE user = ?4 AND app IS ?5 AND extra IS ?6 AND "
+        "key > ?2 AND " OVRA_SESSION_LIVE " ORDER BY key LIMIT ?3";
+    Statement statement = database_.prepare(filter == nullptr ? kAll : kFiltered);
+    statement.bind(1, now()).bindBlob(2, after).bind(3, std::int64_t{kPage});
+    if (filter != nullptr) {
+        statement.bind(4, filter->user).bindOptional(5, filter->app).bindOptional(6, filter->extra);
+    }
+    page.clear();
+    while (statement.step()) {
+        page.emplace_back(statement.text(8), readRecord(statement));
+    }
+    return !database_.failed();
+}
+
+bool SessionStore::removeIf(const std::function<bool(const SessionRecord &)> &test,
+                            const SessionFilter *filter) {
+    if (!isOpen()) {
         return false;
     }
-    std::erase_if(sessions, [&test](const SessionRecord &record) { return !test(record); });
-    if (sessions.empty()) {
+    database_.clearError();
+    std::vector<std::string> doomed;
+    Page page;
+    std::string last;
+    do {
+        if (!readPage(filter, last, page)) {
+            return false;
+        }
+        for (const auto &[key, record] : page) {
+            last = key;
+            if (test(record)) {
+                doomed.push_back(key);
+            }
+        }
+    } while (page.size() == kPage);
+    if (doomed.empty()) {
         return true;
     }
     Transaction transaction(database_);
     if (!transaction.isOpen()) {
         return false;
     }
-    for (const SessionRecord &record : sessions) {
-        if (!database_.prepare("DELETE FROM session WHERE key = ?1")
-                 .bindBlob(1, keyOf(record.id))
-                 .run()) {
+    for (const std::string &key : doomed) {
+        if (!database_.prepare("DELETE FROM session WHERE key = ?1").bindBlob(1, key).run()) {
             return false;
         }
     }

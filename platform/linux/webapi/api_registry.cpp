@@ -56,8 +56,9 @@ APIRegistry::~APIRegistry() {
 }
 
 void APIRegistry::add(const std::string &api, int version, const std::string &method,
-                      APIRight right, APIQueue queue, APIHandler handler) {
-    apis_[api][method].insert_or_assign(version, Entry{right, queue, std::move(handler)});
+                      APIRight right, APIQueue queue, APIHandler handler, APIQueueChoice choice) {
+    apis_[api][method].insert_or_assign(version,
+                                        Entry{right, queue, std::move(handler), std::move(choice)});
 }
 
 tl::expected<const APIRegistry::Entry *, int> APIRegistry::find(const APICall &call) const {
@@ -90,7 +91,10 @@ std::vector<APIRegistry::Method> APIRegistry::methods() const {
 
 APIQueue APIRegistry::queue(const APICall &call) const {
     const auto entry = find(call);
-    return entry ? (*entry)->queue : APIQueue::kQuick;
+    if (!entry) {
+        return APIQueue::kQuick;
+    }
+    return (*entry)->choice ? (*entry)->choice(call.params) : (*entry)->queue;
 }
 
 Json::Value APIRegistry::dispatch(const APICall &call, const APICaller &caller) const {

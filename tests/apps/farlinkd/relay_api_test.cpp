@@ -1,13 +1,15 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "relay_api.h"
-#include "support/print_json.h"
 
 #include <ovradrcore/json.h>
 #include <ovraplatform/farlink_key.h>
 
+#include <fcntl.h>
 #include <gtest/gtest.h>
+#include <sys/file.h>
 
 #include <future>
+#include <thread>
 
 namespace {
 
@@ -18,7 +20,8 @@ using OvraPlatform::FarlinkKey;
 
 class TheRelayApi : public testing::Test {
 protected:
-    TheRelayApi() {
+    explicit TheRelayApi(const RelayApi::Limits &limits = {})
+        : api(aliases, {"127.0.0.1", "relay.example", 5444}, limits) {
         EXPECT_TRUE(tunnelServer.start(OvraService::Listener::listen("127.0.0.1", 0).value()));
         api.connect(tunnelServer);
     }
@@ -66,8 +69,17 @@ protected:
 
     std::string address = "192.0.2.1";
     TunnelServer tunnelServer{[](const std::string &, const std::string &) { return false; }, {}};
-    RelayApi api{AliasRegistry("/usr/ovra/aliases", {20100, 20110, std::chrono::seconds(60), 2}),
-                 {"127.0.0.1", "relay.example", 5444}};
+    AliasRegistry aliases{"/usr/ovra/aliases", {20100, 20110, std::chrono::seconds(60), 2}};
+    RelayApi api;
+};
+
+class TheBoundedRelayApi : public TheRelayApi {
+protected:
+    TheBoundedRelayApi()
+        : TheRelayApi({.aliasesPerHour = 2,
+                       .callers = 2,
+                       .challenge = std::chrono::seconds(2),
+                       .hold = std::chrono::seconds(1)}) {}
 };
 
 } // namespace
@@ -130,16 +142,78 @@ TEST_F(TheRelayApi, TellsTheApplianceOfItsCallersAndOfAnotherEnrolment) {
     EXPECT_EQ(waiting.wait_for(std::chrono::milliseconds(100)), std::future_status::timeout);
 }
 
-TEST_F(TheRelayApi, BoundsWhatOneAddressMayDo) {
-    const FarlinkKey owner = key("owner");
+TEST_F(TheRelayApi, ServesEverybodyElseWhileAChangeIsBeingStored) {
+    const Json::Value token = call("enrol", proof(key("owner"), "nas"))["data"]["token"];
+    Reply waiting = begin("wait", named("nas", token));
+    // The registry waits for this lock as for a slow disk, for up to 5 seconds.
+    const OvraBase::UniqueFd folder(open("/usr/ovra", O_RDONLY | O_CLOEXEC));
+    ASSERT_EQ(flock(folder.get(), LOCK_EX), 0);
+    std::vector<Reply> changes;
+    for (const char *alias : {"two", "three", "four"}) {
+        changes.push_back(begin("enrol", proof(key(alias), alias)));
+    }
+    EXPECT_EQ(changes[0].wait_for(std::chrono::milliseconds(200)), std::future_status::timeout);
+    api.endOverdue();
+    EXPECT_EQ(code(call("lookup", named("two"))), 106) << "not stored, so nobody has it";
+    EXPECT_EQ(code(call("lookup", named("nas"))), 0);
+    EXPECT_TRUE(api.announce("nas", "caller"));
+    EXPECT_EQ(waiting.get()["data"]["callers"][0], "caller");
+    EXPECT_EQ(changes[0].wait_for(std::chrono::seconds(0)), std::future_status::timeout);
+    flock(folder.get(), LOCK_UN);
+    for (Reply &change : changes) {
+        EXPECT_EQ(code(change.get()), 0);
+    }
+}
+
+TEST_F(TheRelayApi, BoundsWhatOneClientMayDo) {
     int attempts = 0;
+    address = "2001:db8::ffff";
     while (attempts < 100 && code(call("challenge", named("nas"))) == 0) {
-        ++attempts;
+        address = "2001:db8::" + std::to_string(++attempts); // one subscriber has many
     }
     EXPECT_EQ(attempts, 30);
     address = "192.0.2.2";
     EXPECT_EQ(code(call("challenge", named("nas"))), 0) << "others are not held up";
+    const auto taken = OvraService::Listener::listen("127.0.0.1", 20100);
+    EXPECT_EQ(code(call("enrol", proof(key("owner"), "nas"))), 100) << "its port is in use";
+    EXPECT_EQ(code(call("lookup", named("nas"))), 106) << "so it is nobody's";
     for (const char *alias : {"", "ab", "-ab", "ab-", "a b", "a/b", "NAS", "../aliases"}) {
         EXPECT_EQ(code(call("enrol", named(alias))), 106) << alias;
     }
+}
+
+TEST_F(TheBoundedRelayApi, NewAliasesCallersChallengesAndPolls) {
+    const FarlinkKey owner = key("owner");
+    const Json::Value old = proof(owner, "nas-1");
+    address = "2001:db8::1";
+    const Json::Value token = call("enrol", proof(owner, "nas-1"))["data"]["token"];
+    EXPECT_EQ(code(call("enrol", proof(owner, "nas-2"))), 0);
+    address = "2001:db8::2";
+    EXPECT_EQ(code(call("enrol", proof(key("next"), "nas-3"))), 107) << "a third one in an hour";
+    EXPECT_EQ(code(call("enrol", proof(owner, "nas-2"))), 0) << "this one is not new";
+    address = "2001:db8:0:1::1";
+    EXPECT_EQ(code(call("enrol", proof(key("next"), "nas-3"))), 0) << "another client";
+
+    Reply waiting = begin("wait", named("nas-1", token));
+    api.endOverdue();
+    EXPECT_EQ(waiting.wait_for(std::chrono::milliseconds(100)), std::future_status::timeout);
+    std::this_thread::sleep_for(std::chrono::milliseconds(3100));
+    api.endOverdue();
+    EXPECT_EQ(waiting.get()["data"]["callers"], Json::Value(Json::arrayValue));
+    EXPECT_TRUE(api.announce("nas-1", "caller-1"));
+    EXPECT_TRUE(api.announce("nas-1", "caller-2"));
+    EXPECT_FALSE(api.announce("nas-1", "caller-3")) << "it fetches none";
+    EXPECT_EQ(code(call("enrol", old)), 105) << "a challenge that is too old";
+}
+
+TEST(TheLimitOfARate, ForgetsTheClientThatBeganFirstForOneTooMany) {
+    OvraService::RateLimit limit(1, std::chrono::hours(1));
+    const auto now = std::chrono::steady_clock::now();
+    for (int i = 0; i <= 8192; ++i) {
+        EXPECT_TRUE(limit.allow(std::to_string(i), now));
+    }
+    EXPECT_FALSE(limit.allow("1", now));
+    EXPECT_TRUE(limit.allow("0", now)) << "forgotten";
+    EXPECT_FALSE(limit.allow("8192", now + std::chrono::minutes(59)));
+    EXPECT_TRUE(limit.allow("8192", now + std::chrono::hours(1)));
 }

@@ -1,10 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
+#include "sockets.h"
 #include "tunnel_server.h"
-
-#include <arpa/inet.h>
-#include <gtest/gtest.h>
-#include <sys/socket.h>
-#include <unistd.h>
 
 #include <condition_variable>
 #include <mutex>
@@ -13,43 +9,14 @@
 namespace {
 
 using Farlinkd::TunnelServer;
+using FarlinkdTest::dial;
+using FarlinkdTest::hear;
+using FarlinkdTest::hearAll;
+using FarlinkdTest::say;
 using OvraBase::UniqueFd;
 using OvraService::Listener;
 
-UniqueFd dial(int port) {
-    UniqueFd fd(socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0));
-    sockaddr_in address{};
-    address.sin_family = AF_INET;
-    address.sin_port = htons(static_cast<std::uint16_t>(port));
-    address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
-    const timeval patience{10, 0};
-    setsockopt(fd.get(), SOL_SOCKET, SO_RCVTIMEO, &patience, sizeof patience);
-    EXPECT_EQ(connect(fd.get(), reinterpret_cast<sockaddr *>(&address), sizeof address), 0);
-    return fd;
-}
-
-void say(const UniqueFd &fd, const std::string &text) {
-    for (std::size_t done = 0; done < text.size();) {
-        const ssize_t size = send(fd.get(), &text[done], text.size() - done, MSG_NOSIGNAL);
-        if (size <= 0) {
-            return;
-        }
-        done += static_cast<std::size_t>(size);
-    }
-}
-
-/// Reads until the other end closes, or 10 seconds pass without a byte ("timeout").
-std::string hearAll(const UniqueFd &fd) {
-    std::string all;
-    std::string buffer(1 << 16, '\0');
-    for (;;) {
-        const ssize_t size = recv(fd.get(), buffer.data(), buffer.size(), 0);
-        if (size <= 0) {
-            return size < 0 && errno == EAGAIN ? "timeout" : all;
-        }
-        all.append(buffer, 0, static_cast<std::size_t>(size));
-    }
-}
+constexpr std::chrono::seconds kLong{120};
 
 class ThroughTheTunnelServer : public testing::Test {
 protected:
@@ -132,14 +99,45 @@ TEST_F(ThroughTheTunnelServer, NobodyIsConnectedToSomebodyElse) {
 }
 
 TEST_F(ThroughTheTunnelServer, AreBoundedAndEndWithTheAlias) {
-    begin({.perAlias = 1, .idle = std::chrono::milliseconds(500)});
-    UniqueFd client = dial(callerPort);
-    UniqueFd appliance = answer(caller());
-    EXPECT_EQ(hearAll(dial(callerPort)), "") << "one too many";
+    // Longer than anybody listens here: only the bounds end a connection.
+    TunnelServer::Limits perAlias{.perAlias = 1, .arriving = 1, .line = kLong, .answer = kLong};
+    TunnelServer::Limits all = perAlias;
+    all.perAlias = 64;
+    all.calls = 1;
+    for (TunnelServer::Limits limits : {perAlias, all}) {
+        begin(limits);
+        UniqueFd client = dial(callerPort);
+        const std::string first = caller();
+        EXPECT_EQ(hearAll(dial(callerPort)), "") << "one too many, while the first one waits";
+        UniqueFd appliance = answer(first);
+        say(appliance, "through");
+        EXPECT_EQ(hear(client), "through");
+        EXPECT_EQ(hearAll(dial(callerPort)), "") << "and once it is put through";
+        const UniqueFd silent = dial(tunnelPort);
+        EXPECT_EQ(hearAll(dial(tunnelPort)), "") << "an appliance too many that says nothing";
+        server->close("nas");
+        EXPECT_EQ(hearAll(client), "");
+        EXPECT_EQ(hearAll(appliance), "");
+    }
+    begin({.idle = std::chrono::milliseconds(500)});
+    const UniqueFd client = dial(callerPort);
+    const UniqueFd appliance = answer(caller());
     EXPECT_EQ(hearAll(client), "") << "in silence for too long";
-    client = dial(callerPort);
-    appliance = answer(caller());
-    server->close("nas");
-    EXPECT_EQ(hearAll(client), "");
-    EXPECT_EQ(hearAll(appliance), "");
+}
+
+TEST_F(ThroughTheTunnelServer, WhatTheOtherEndDoesNotTakeStaysWithTheSender) {
+    begin({});
+    const UniqueFd client = dial(callerPort);
+    UniqueFd appliance = answer(caller());
+    const timeval patience{1, 0};
+    setsockopt(client.get(), SOL_SOCKET, SO_SNDTIMEO, &patience, sizeof patience);
+    const std::string chunk(1 << 20, 'x');
+    std::size_t taken = 0;
+    for (ssize_t size = 1; size > 0 && taken < (128U << 20U);) {
+        size = send(client.get(), chunk.data(), chunk.size(), MSG_NOSIGNAL);
+        taken += size > 0 ? static_cast<std::size_t>(size) : 0;
+    }
+    EXPECT_LT(taken, 64U << 20U) << "the kernel's buffers, of four sockets";
+    shutdown(client.get(), SHUT_WR);
+    EXPECT_EQ(hearAll(appliance).size(), taken);
 }

@@ -96,8 +96,7 @@ TEST(CommandLine, OutputThatCannotBeWrittenIsAFailure) {
     const pid_t child = fork();
     if (child == 0) {
         dup2(open("/dev/full", O_WRONLY | O_CLOEXEC), STDOUT_FILENO);
-        execl(OVRADR_PROGRAM, OVRADR_PROGRAM, "node", "id", nullptr);
-        _exit(127);
+        execute({"node", "id"});
     }
     int status = 0;
     waitpid(child, &status, 0);

@@ -57,6 +57,11 @@ TEST_F(PairedNode, TheDoctorNamesTheStepThatFailsAndHasAnExitCodeForEach) {
     } cases[] = {
         {"", 0, [](RemoteNode &) {}},
         {"connect", 3, [](RemoteNode &node) { node.die(); }},
+        {"key", 3,
+         [](RemoteNode &node) {
+             node.server.fallSilent();
+             node.server.closeConnections();
+         }},
         {"key", 6,
          [](RemoteNode &node) {
              node.server.changeCertificate();

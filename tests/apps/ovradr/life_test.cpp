@@ -1,9 +1,13 @@
 // SPDX-License-Identifier: Apache-2.0
 // The fate of rows and sessions when a credential is changed or deleted, completely or partly.
+#include "platform/store/raw_sqlite.h"
 #include "program.h"
 #include "shared/pending_releases.h"
+#include "shared/session_lock.h"
 #include "support/local_node.h"
 #include "support/remote_node.h"
+
+#include <ovradrcore/json.h>
 
 #include <gtest/gtest.h>
 #include <sys/stat.h>
@@ -11,6 +15,7 @@
 #include <atomic>
 #include <csignal>
 #include <filesystem>
+#include <set>
 #include <thread>
 
 namespace OvradrTest {
@@ -37,19 +42,23 @@ protected:
 
     void begin() {
         std::filesystem::remove(OvraApps::kPendingReleasesFile);
+        ended.clear();
         executeSql("DELETE FROM node_cred");
         addCred("node_cred", "n1", "c1", "https", remote.port(), "old");
         remote.answer("login", R"({"success":true,"data":{"sid":"login-session"}})");
         remote.answer("info", R"({"success":true,"data":{"node_id":"n1","serial":"S1"}})");
         remote.answer("create", R"({"success":true,"data":{"session":"granted"}})");
-        remote.answer("old test_privilege", R"({"success":true})");
+        for (const char *session : {"old", "granted", "granted-1", "granted-2"}) {
+            remote.answer(session + std::string(" test_privilege"), R"({"success":true})");
+        }
         remote.before("delete", [this] { forgetDeleted(); });
     }
 
     void forgetDeleted() {
-        if (remote.params("delete") == R"({"session":"old"})") {
-            remote.answer("old test_privilege", kDead);
-        }
+        Json::Value params;
+        EXPECT_TRUE(OvraDRCore::fromString(params, remote.params("delete")));
+        ended.insert(params["session"].asString());
+        remote.answer(params["session"].asString() + " test_privilege", kDead);
     }
 
     /// Kills the program at its intended last call.
@@ -106,6 +115,7 @@ protected:
     std::atomic<int> calls = 0;
     std::atomic<int> fatal = 0;
     std::atomic<pid_t> victim = 0;
+    std::set<std::string> ended; ///< the sessions that the remote was asked to delete
     RemoteNode remote;
 };
 
@@ -169,6 +179,75 @@ TEST_F(Life, ACommandThatIsKilledAnywhereLeavesTheOldOrTheNewStateAndNoSessionUn
     }
 }
 
+TEST_F(Life, CommandsAtTheSameTimeLeaveNoSessionThatNobodyKnows) {
+    const Arguments set = change({"set", "c1"});
+    const Arguments drop{"cred", "delete", "c1", "--json"};
+    const Arguments other{"cred", "delete", "c2", "--json"};
+    const struct {
+        const char *what;
+        Arguments first;
+        Arguments second;
+        bool killed; ///< both, when the session that they share is to be released
+    } cases[] = {{"two changes", set, set, false},
+                 {"change and deletion", set, drop, false},
+                 {"two that share", drop, other, false},
+                 {"two that share, killed", drop, other, true}};
+    for (const auto &each : cases) {
+        SCOPED_TRACE(each.what);
+        begin();
+        const bool sharing = each.second == other;
+        if (sharing) {
+            addCred("node_cred", "n1", "c2", "https", remote.port(), "old");
+        }
+        std::atomic<int> grants = 0;
+        std::atomic<int> arrived = 0;
+        std::atomic<pid_t> pids[2] = {0, 0};
+        const auto meet = [&arrived] { // both know the row before either changes it
+            ++arrived;
+            for (int i = 0; i < 1000 && arrived < 2; ++i) {
+                std::this_thread::sleep_for(std::chrono::milliseconds(5));
+            }
+        };
+        remote.before("login", meet);
+        remote.before("test_privilege", [&] { sharing || arrived >= 2 ? void() : meet(); });
+        remote.before("create", [&] {
+            remote.answer("create", R"({"success":true,"data":{"session":"granted-)" +
+                                        std::to_string(++grants) + R"("}})");
+        });
+        remote.before("delete", [&] {
+            if (each.killed) {
+                std::this_thread::sleep_for(std::chrono::milliseconds(300)); // the other one ends
+                kill(pids[0], SIGKILL);
+                kill(pids[1], SIGKILL);
+            } else {
+                forgetDeleted();
+            }
+        });
+        Program first(each.first, "secret word\n");
+        Program second(each.second, "secret word\n");
+        pids[0] = first.pid();
+        pids[1] = second.pid();
+        const std::string said = first.finish().out + second.finish().out;
+
+        std::string known = sessions();
+        for (const PendingRelease &release : pending()) {
+            known += release.session + "\n";
+        }
+        std::set<std::string> live{"old"};
+        for (int i = 1; i <= grants; ++i) {
+            live.insert("granted-" + std::to_string(i));
+        }
+        for (const std::string &session : live) {
+            EXPECT_TRUE(ended.count(session) != 0 || known.find(session) != std::string::npos)
+                << session << " lives, and nobody knows";
+        }
+        if (sharing && !each.killed) {
+            EXPECT_NE(said.find("\"kept\""), std::string::npos) << said;
+            EXPECT_NE(said.find("\"released\""), std::string::npos) << said;
+        }
+    }
+}
+
 TEST_F(Life, ARemoteThatDiesBetweenTheGrantAndTheRowChangesNothing) {
     for (const bool update : {true, false}) {
         // An update first looks up the previous session, then the granted one.
@@ -188,6 +267,66 @@ TEST_F(Life, ARemoteThatDiesBetweenTheGrantAndTheRowChangesNothing) {
         EXPECT_EQ(sessions(), "old\n");
         EXPECT_TRUE(pending().empty());
     }
+}
+
+TEST_F(Life, ASessionWhoseRowCannotBeStoredIsNotedForRelease) {
+    executeSql(
+        "CREATE TRIGGER ins BEFORE INSERT ON node_cred BEGIN SELECT RAISE(FAIL, 'full'); END;"
+        "CREATE TRIGGER up BEFORE UPDATE ON node_cred BEGIN SELECT RAISE(FAIL, 'full'); END");
+    for (const Arguments &command : {create(), change({"set", "c1"})}) {
+        const Result result = run(command, "secret word\n");
+        EXPECT_EQ(result.exit, 9) << result.err;
+        ASSERT_FALSE(pending().empty()) << command[1];
+        EXPECT_EQ(pending().back().session, "granted");
+        EXPECT_TRUE(PendingReleases().remove(pending().back()));
+        EXPECT_TRUE(pending().empty());
+    }
+}
+
+TEST_F(Life, ACredentialMovesWithItsSessionToAnEndpointOfItsNode) {
+    addCred("node_cred", "n1", "c2", "https", remote.port(), "old");
+    EXPECT_EQ(run(create(), "secret word\n").exit, 0) << "the key is known from here on";
+    const auto at = [this](const char *host) {
+        return std::string("https://") + host + ":" + std::to_string(remote.port());
+    };
+    const auto move = [](const std::string &url) {
+        return run({"cred", "set", "c1", "--url", url, "--json"});
+    };
+    const auto row = [] {
+        return querySql("SELECT addr, session FROM node_cred WHERE cred_id = 'c1'");
+    };
+    remote.answer("get", R"({"success":true,"data":{"account":"joe"}})");
+    const struct {
+        const char *call;
+        const char *answer;
+        int exit;
+    } refusals[] = {
+        {"info", R"({"success":true,"data":{"node_id":"n2","serial":"S"}})", 1},
+        {"info", kDead, 4},
+        {"old test_privilege", R"({"success":false,"error":{"code":105}})", 8},
+    };
+    for (const auto &each : refusals) {
+        remote.answer("info", R"({"success":true,"data":{"node_id":"n1","serial":"S1"}})");
+        remote.answer(each.call, std::string(each.answer));
+        EXPECT_EQ(move(at("localhost")).exit, each.exit) << each.answer;
+    }
+    EXPECT_EQ(run({"cred", "set", "c1"}).exit, 2);
+    EXPECT_EQ(run({"cred", "set", "c1", "--url", at("localhost"), "--password-stdin"}).exit, 2);
+    EXPECT_EQ(row(), "127.0.0.1|old\n");
+    remote.answer("old test_privilege", R"({"success":true})");
+    const Json::Value moved = move(at("localhost")).json()["data"];
+    EXPECT_EQ(moved["session"].asString() + moved["account"].asString(), "unchangedjoe");
+    EXPECT_TRUE(moved["endpoint_changed"].asBool());
+    EXPECT_EQ(row(), "localhost|old\n");
+    EXPECT_EQ(querySql("SELECT addr FROM node_cred WHERE cred_id = 'c2'"), "127.0.0.1\n");
+
+    remote.server.changeCertificate();
+    remote.server.closeConnections();
+    remote.forgetCalls();
+    EXPECT_EQ(move(at("[::ffff:127.0.0.1]")).exit, 6)
+        << "another key, and nobody who vouches for it";
+    EXPECT_EQ(remote.calls(), "");
+    EXPECT_EQ(row(), "localhost|old\n");
 }
 
 TEST_F(Life, WhatIsStillNeededIsNotReleased) {
@@ -230,7 +369,7 @@ TEST(PendingRelease, IsDueAgainAfterPausesThatGrow) {
     EXPECT_TRUE(due(1000 + PendingReleases::kHold));
     for (const int pause : {30, 60, 120, 240, 480, 960, 1920, 3840, 7680, 15360, 21600, 21600}) {
         const std::time_t failed = now;
-        ASSERT_TRUE(store.postpone(note.reference(), 500));
+        ASSERT_TRUE(store.postpone(note, 500));
         EXPECT_FALSE(due(failed + pause - 1)) << pause;
         EXPECT_TRUE(due(failed + pause)) << pause;
     }
@@ -238,8 +377,41 @@ TEST(PendingRelease, IsDueAgainAfterPausesThatGrow) {
     struct stat status {};
     ASSERT_EQ(stat(OvraApps::kPendingReleasesFile, &status), 0);
     EXPECT_EQ(status.st_mode & 0777U, 0600U);
-    EXPECT_TRUE(store.remove(note.reference()));
+    EXPECT_TRUE(store.remove(note));
     EXPECT_FALSE(due(1 << 30));
+}
+
+TEST(PendingRelease, NotesAreOneForEachSessionAndCredentialAndBounded) {
+    PendingReleases store;
+    const PendingRelease note{"session", OvraDRNode::Conn::https("h", 1), "n", "c"};
+    PendingRelease other = note;
+    other.credId = "c2";
+    ASSERT_TRUE(store.note(note) && store.note(other));
+    EXPECT_TRUE(store.postpone(other, 500) && store.remove(note));
+    std::vector<PendingRelease> left;
+    EXPECT_TRUE(store.list(left));
+    ASSERT_EQ(left.size(), 1U);
+    EXPECT_EQ(left[0].credId + std::to_string(left[0].attempts), "c21");
+    OvraTest::RawSqlite file(OvraApps::kPendingReleasesFile);
+    ASSERT_TRUE(
+        file.run("WITH RECURSIVE n(i) AS (SELECT 1 UNION ALL SELECT i + 1 FROM n WHERE i < " +
+                 std::to_string(PendingReleases::kMaxReleases - 1) +
+                 ") INSERT INTO release SELECT i, i, 'h', 'https', 1, 'n', i, 0, 0, 0, 0 "
+                 "FROM n"));
+    EXPECT_FALSE(store.note(note)) << store.error();
+    EXPECT_TRUE(store.note(other)) << "a known one";
+    EXPECT_TRUE(store.forget(other.reference()) && store.note(note)) << "there is room again";
+}
+
+TEST(SessionLock, KeepsFlowsWithOneNodeApartAndNoOthers) {
+    using OvraApps::SessionLock;
+    using Purpose = SessionLock::Purpose;
+    const SessionLock obtaining("n1", Purpose::kObtain, 0);
+    const SessionLock releasing("../n2", Purpose::kRelease, 0);
+    EXPECT_FALSE(obtaining.isBusy() || releasing.isBusy());
+    EXPECT_FALSE(SessionLock("n1", Purpose::kObtain, 0).isBusy());
+    EXPECT_TRUE(SessionLock("n1", Purpose::kRelease, 0).isBusy());
+    EXPECT_TRUE(SessionLock("../n2", Purpose::kObtain, 0).isBusy());
 }
 
 } // namespace OvradrTest

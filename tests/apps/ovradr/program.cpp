@@ -17,6 +17,7 @@
 #include <cerrno>
 #include <chrono>
 #include <csignal>
+#include <cstdlib>
 #include <fstream>
 #include <iterator>
 #include <thread>
@@ -30,16 +31,6 @@ using std::chrono::seconds;
 using std::chrono::steady_clock;
 
 constexpr int kCannotStart = 127;
-
-[[noreturn]] void execute(const Arguments &arguments) {
-    std::vector<char *> argv{const_cast<char *>(OVRADR_PROGRAM)}; // NOLINT: as execv(3) wants it
-    for (const std::string &argument : arguments) {
-        argv.push_back(const_cast<char *>(argument.c_str())); // NOLINT
-    }
-    argv.push_back(nullptr);
-    execv(OVRADR_PROGRAM, argv.data());
-    _exit(kCannotStart);
-}
 
 int anonymousFile(const std::string &content = "") {
     const int fd = memfd_create("ovradr_test", MFD_CLOEXEC);
@@ -55,6 +46,19 @@ std::string contentOf(int fd) {
 }
 
 } // namespace
+
+void execute(const Arguments &arguments) {
+    const char *const other = std::getenv("OVRADR_PROGRAM");
+    const char *const program = other != nullptr ? other : OVRADR_PROGRAM;
+    std::vector<char *> argv{const_cast<char *>(program)}; // NOLINT: as execv(3) wants it
+    for (const std::string &argument : arguments) {
+        argv.push_back(const_cast<char *>(argument.c_str())); // NOLINT
+    }
+    argv.push_back(nullptr);
+    std::signal(SIGINT, SIG_DFL); // nohup ignores it, for whatever it starts
+    execv(program, argv.data());
+    _exit(kCannotStart);
+}
 
 Json::Value Result::json() const {
     Json::Value document;

@@ -1,8 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
-#include "support/print_json.h"
-
 #include <json/value.h>
 #include <sys/types.h>
 
@@ -12,6 +10,9 @@
 namespace OvradrTest {
 
 using Arguments = std::vector<std::string>;
+
+/// Replaces this process by the program: that of this build, unless OVRADR_PROGRAM names another.
+[[noreturn]] void execute(const Arguments &arguments);
 
 /// The program's output and exit code; -1: ended by a signal, or killed after the time-out.
 struct Result {

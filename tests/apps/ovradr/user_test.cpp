@@ -93,26 +93,18 @@ TEST(User, TheSecretOfOneTimeCodesIsShownOnlyWhereItIsAskedFor) {
 }
 
 TEST(Password, IsTypedTwiceAndNotEchoed) {
-    Terminal terminal({"user", "add", "bob"});
-    ASSERT_TRUE(terminal.shows("Password of bob: "));
-    EXPECT_FALSE(terminal.echoes());
-    terminal.type("correct horse\n");
-    ASSERT_TRUE(terminal.shows("Again: "));
-    terminal.type("correct horse\n");
-    EXPECT_EQ(terminal.finish(), 0) << terminal.screen();
-    EXPECT_TRUE(terminal.echoes());
-    EXPECT_EQ(terminal.screen().find("horse"), std::string::npos) << terminal.screen();
-    EXPECT_EQ(logIn(kPassword), LoginResult::kOk);
-}
-
-TEST(Password, ThatIsTypedDifferentlyTheSecondTimeIsRefused) {
-    Terminal terminal({"user", "add", "bob"});
-    ASSERT_TRUE(terminal.shows("Password of bob: "));
-    terminal.type("correct horse\n");
-    ASSERT_TRUE(terminal.shows("Again: "));
-    terminal.type("correct hors\n");
-    EXPECT_EQ(terminal.finish(), 1);
-    EXPECT_EQ(logIn(kPassword), LoginResult::kWrong);
+    for (const bool same : {false, true}) {
+        Terminal terminal({"user", "add", "bob"});
+        ASSERT_TRUE(terminal.shows("Password of bob: "));
+        EXPECT_FALSE(terminal.echoes());
+        terminal.type("correct horse\n");
+        ASSERT_TRUE(terminal.shows("Again: "));
+        terminal.type(same ? "correct horse\n" : "correct hors\n");
+        EXPECT_EQ(terminal.finish(), same ? 0 : 1) << terminal.screen();
+        EXPECT_TRUE(terminal.echoes());
+        EXPECT_EQ(terminal.screen().find("hors"), std::string::npos) << terminal.screen();
+        EXPECT_EQ(logIn(kPassword), same ? LoginResult::kOk : LoginResult::kWrong);
+    }
 }
 
 TEST(Password, TheEchoComesBackWhenThePromptIsInterrupted) {
@@ -147,6 +139,8 @@ TEST(Password, IsRefusedWhenItCannotBeRead) {
         {"an empty line", {"--password-stdin"}, "\ncorrect horse\n", 1},
         {"too short", {"--password-stdin"}, "short\n", 1},
         {"too long", {"--password-stdin"}, std::string(1025, 'x') + "\n", 1},
+        {"not UTF-8", {"--password-stdin"}, "correct h\xf6rse\n", 1},
+        {"a NUL", {"--password-stdin"}, std::string("correct \0horse\n", 15), 1},
         {"no such file", {"--password-file", "/nowhere/at/all"}, "", 1},
         {"a folder", {"--password-file", "/"}, "", 1},
         {"nobody to ask", {}, "correct horse\n", 2},

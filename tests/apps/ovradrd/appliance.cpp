@@ -4,6 +4,7 @@
 #include "support/local_node.h"
 #include "support/test_certificate.h"
 
+#include <ovrabase/address.h>
 #include <ovradrcore/json.h>
 #include <ovraplatform/account_store.h>
 #include <ovraplatform/appliance.h>
@@ -11,7 +12,6 @@
 #include <ovraplatform/session_store.h>
 #include <ovraplatform/wire_form.h>
 
-#include <arpa/inet.h>
 #include <curl/curl.h>
 #include <openssl/pem.h>
 #include <poll.h>
@@ -165,32 +165,19 @@ Reply Appliance::login(const std::string &account, const std::string &password,
 
 RawConnection::RawConnection(int port)
     : fd_(socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0)) {
-    sockaddr_in address{};
-    address.sin_family = AF_INET;
-    address.sin_port = htons(static_cast<std::uint16_t>(port));
-    address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
-    if (connect(fd_, reinterpret_cast<const sockaddr *>(&address), sizeof(address)) != 0) {
-        close(fd_);
-        fd_ = -1;
-    }
-}
-
-RawConnection::RawConnection(RawConnection &&other) noexcept
-    : fd_(std::exchange(other.fd_, -1)) {}
-
-RawConnection::~RawConnection() {
-    if (fd_ >= 0) {
-        close(fd_);
+    const auto server = OvraBase::parseAddress("127.0.0.1", port);
+    if (connect(fd(), server->get(), server->size) != 0) {
+        fd_.reset();
     }
 }
 
 bool RawConnection::isOpen() const {
     char byte = 0;
-    return recv(fd_, &byte, 1, MSG_PEEK | MSG_DONTWAIT) < 0 && errno == EAGAIN;
+    return recv(fd(), &byte, 1, MSG_PEEK | MSG_DONTWAIT) < 0 && errno == EAGAIN;
 }
 
 bool RawConnection::send(const std::string &bytes) const {
-    return ::send(fd_, bytes.data(), bytes.size(), MSG_NOSIGNAL) ==
+    return ::send(fd(), bytes.data(), bytes.size(), MSG_NOSIGNAL) ==
            static_cast<ssize_t>(bytes.size());
 }
 
@@ -199,12 +186,12 @@ bool RawConnection::drain(std::chrono::milliseconds time, std::string &all) cons
     for (;;) {
         const auto left =
             std::chrono::ceil<std::chrono::milliseconds>(end - std::chrono::steady_clock::now());
-        pollfd waiting{fd_, POLLIN, 0};
+        pollfd waiting{fd(), POLLIN, 0};
         char part[4096];
         if (left.count() <= 0 || poll(&waiting, 1, static_cast<int>(left.count())) <= 0) {
             return false;
         }
-        const ssize_t got = recv(fd_, part, sizeof(part), 0);
+        const ssize_t got = recv(fd(), part, sizeof(part), 0);
         if (got <= 0) {
             return true;
         }

@@ -2,7 +2,8 @@
 #pragma once
 
 #include "daemon.h"
-#include "support/print_json.h"
+
+#include <ovrabase/unique_fd.h>
 
 #include <gtest/gtest.h>
 #include <json/json.h>
@@ -73,10 +74,7 @@ Json::Value json(const std::string &text);
 class RawConnection {
 public:
     explicit RawConnection(int port);
-    RawConnection(RawConnection &&other) noexcept;
-    RawConnection(const RawConnection &) = delete;
-    ~RawConnection();
-
+    int fd() const { return fd_.get(); } ///< -1 if nobody listens
     /// Whether the other end has neither closed nor sent anything.
     bool isOpen() const;
     /// False if the other end is gone.
@@ -90,7 +88,7 @@ private:
     /// Whether the other end closed.
     bool drain(std::chrono::milliseconds time, std::string &all) const;
 
-    int fd_;
+    OvraBase::UniqueFd fd_;
 };
 
 } // namespace OvraTest

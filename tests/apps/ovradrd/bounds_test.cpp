@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "appliance.h"
 #include "call_dispatcher.h"
+#include "support/misbehaving_server.h"
 
 #include <ovraplatform/api_errors.h>
 #include <ovraplatform/appliance.h>
@@ -8,18 +9,21 @@
 #include <sys/resource.h>
 
 #include <condition_variable>
+#include <future>
 #include <list>
 #include <map>
 #include <mutex>
-#include <ostream>
 #include <thread>
 
 namespace {
 
 using OvraTest::Appliance;
+using OvraTest::json;
 using OvraTest::RawConnection;
 using namespace std::chrono_literals;
 
+const std::string kLongPost = "POST /webapi/query.cgi HTTP/1.1\r\nHost: a\r\nContent-Type: "
+                              "application/x-www-form-urlencoded\r\nContent-Length: 90000\r\n\r\n";
 constexpr char kGetInfo[] = "api=OVRA.Core.Encryption&version=1&method=getinfo";
 
 class Bounds : public Appliance {
@@ -40,47 +44,53 @@ protected:
     }
 };
 
-struct SlowScene {
-    const char *name;
-    bool tls;
-    const char *begin; ///< sent at once
-    char drip;         ///< then every 100 ms; NUL: nothing
-
-    friend std::ostream &operator<<(std::ostream &out, const SlowScene &scene) {
-        return out << scene.name;
-    }
-};
-
-class SlowClient : public Bounds, public testing::WithParamInterface<SlowScene> {};
-
-TEST_P(SlowClient, IsCutOffWhenItsRequestTakesTooLong) {
+TEST_F(Bounds, CutOffAClientWhoseRequestTakesTooLong) {
+    const struct {
+        const char *name;
+        bool tls;
+        std::string begin; ///< sent at once
+        std::string drip;  ///< then every 100 ms
+    } clients[] = {{"says nothing", false, "", ""},
+                   {"shakes no hands", true, "", ""},
+                   {"drips its header", false, "POST /webapi/query.cgi HTTP/1.1\r\nX: ", "a"},
+                   {"drips its body", false, kLongPost, "a"}};
     OvraService::HttpLimits limits;
     limits.connections.arriving = 1s;
     restart(limits);
-    const RawConnection connection(port(GetParam().tls));
-    const auto begun = std::chrono::steady_clock::now();
-    const auto time = [begun] { return std::chrono::steady_clock::now() - begun; };
-    connection.send(GetParam().begin);
-    while (!connection.closesWithin(100ms) && time() < 10s) {
-        if (GetParam().drip != '\0') {
-            connection.send(std::string(1, GetParam().drip));
+    for (const auto &client : clients) {
+        const RawConnection connection(port(client.tls));
+        const auto begun = std::chrono::steady_clock::now();
+        const auto time = [begun] { return std::chrono::steady_clock::now() - begun; };
+        connection.send(client.begin);
+        while (!connection.closesWithin(100ms) && time() < 10s) {
+            connection.send(client.drip);
         }
+        EXPECT_GE(time(), 900ms) << client.name;
+        EXPECT_LT(time(), 10s) << client.name;
     }
-    EXPECT_GE(time(), 900ms);
-    EXPECT_LT(time(), 10s);
 }
 
-INSTANTIATE_TEST_SUITE_P(
-    , SlowClient,
-    testing::Values(SlowScene{"saysNothing", false, "", '\0'},
-                    SlowScene{"shakesNoHands", true, "", '\0'},
-                    SlowScene{"dripsItsHeader", false,
-                              "POST /webapi/query.cgi HTTP/1.1\r\nX: ", 'a'},
-                    SlowScene{"dripsItsBody", false,
-                              "POST /webapi/query.cgi HTTP/1.1\r\nHost: a\r\nContent-Type: "
-                              "application/x-www-form-urlencoded\r\nContent-Length: 1000\r\n\r\n",
-                              'a'}),
-    [](const auto &scene) { return std::string(scene.param.name); });
+TEST_F(Bounds, OfAllBodiesTogetherRefuseWhatIsTooMuch) {
+    OvraService::HttpLimits limits;
+    limits.bodies = 100'000;
+    restart(limits);
+    const auto becomes = [this](bool refused) {
+        for (int i = 0; i < 500; ++i) {
+            if ((http({.body = std::string(50'000, 'x')}).code() == 107) == refused) {
+                return true;
+            }
+            std::this_thread::sleep_for(10ms);
+        }
+        return false;
+    };
+    {
+        const RawConnection half(port(false));
+        half.send(kLongPost + std::string(80'000, 'x'));
+        EXPECT_TRUE(becomes(true));
+        expectQuickAnswer();
+    }
+    EXPECT_TRUE(becomes(false)) << "what the client that left had sent still counts";
+}
 
 TEST_F(Bounds, Leave500SlowConnectionsNoInfluence) {
     std::list<RawConnection> slow;
@@ -107,20 +117,41 @@ TEST_F(Bounds, HoldWhenMoreConnectionsComeThanThereMayBe) {
     expectQuickAnswer();
 }
 
+TEST_F(Bounds, OfAStoppingDaemonEndTheConnectionWithoutAnAnswer) {
+    addAccount("root", true);
+    OvraTest::MisbehavingServer silent;
+    silent.fallSilent();
+    Json::Value params;
+    params["conns"][0] = json(R"({"addr":"127.0.0.1","protocol":"http"})");
+    params["conns"][0]["port"] = silent.port();
+    auto waiting = std::async(std::launch::async, [&] {
+        return call("OVRA.DR.Node", 1, "test_connection", params, session("root"));
+    });
+    while (silent.connections() == 0) {
+        std::this_thread::sleep_for(5ms);
+    }
+    EXPECT_FALSE(daemon().stop());
+    EXPECT_EQ(waiting.get().status, 0);
+}
+
 /// A registry with one call that waits and one that does not.
-class FullLanes : public testing::Test {
+class FullQueues : public testing::Test {
 protected:
-    FullLanes() {
+    FullQueues() {
         using OvraPlatform::APIQueue;
         using OvraPlatform::APIRight;
-        registry.add("Test", 1, "wait", APIRight::kNone, APIQueue::kSlow,
-                     [this](const Json::Value &, const OvraPlatform::APICaller &) {
-                         std::unique_lock lock(mutex);
-                         ++inside;
-                         changed.notify_all();
-                         changed.wait(lock, [this] { return open; });
-                         return OvraPlatform::apiSuccess();
-                     });
+        for (const auto &[method, queue] :
+             {std::pair("relay", APIQueue::kRelay), std::pair("twoWay", APIQueue::kTwoWay),
+              std::pair("outbound", APIQueue::kOutbound)}) {
+            registry.add("Test", 1, method, APIRight::kNone, queue,
+                         [this](const Json::Value &, const OvraPlatform::APICaller &) {
+                             std::unique_lock lock(mutex);
+                             ++inside;
+                             changed.notify_all();
+                             changed.wait(lock, [this] { return open; });
+                             return OvraPlatform::apiSuccess();
+                         });
+        }
         registry.add("Test", 1, "quick", APIRight::kNone, APIQueue::kQuick,
                      [](const Json::Value &, const OvraPlatform::APICaller &) {
                          return OvraPlatform::apiSuccess();
@@ -156,18 +187,25 @@ protected:
     std::optional<Ovradrd::WorkQueues> queues{std::in_place};
 };
 
-TEST_F(FullLanes, RefuseAtOnceAndDoNotHoldUpQuickCalls) {
-    for (int i = 0; i < 16; ++i) {
-        serve("wait");
+TEST_F(FullQueues, RefuseAtOnceAndDoNotHoldUpTheLowerOnes) {
+    int places = 0;
+    int refused = 0;
+    for (const auto &[method, threads] :
+         {std::pair("relay", 8), std::pair("twoWay", 16), std::pair("outbound", 16)}) {
+        places += threads;
+        for (int i = 0; i < threads; ++i) {
+            serve(method);
+        }
+        {
+            std::unique_lock lock(mutex);
+            ASSERT_TRUE(changed.wait_for(lock, 5s, [&] { return inside == places; })) << method;
+        }
+        for (int i = 0; i < 64 + 5; ++i) {
+            serve(method);
+        }
+        refused += 5;
+        EXPECT_TRUE(gets(107, refused)) << method;
     }
-    {
-        std::unique_lock lock(mutex);
-        ASSERT_TRUE(changed.wait_for(lock, 5s, [this] { return inside == 16; }));
-    }
-    for (int i = 0; i < 64 + 5; ++i) {
-        serve("wait");
-    }
-    EXPECT_TRUE(gets(107, 5));
     serve("quick");
     EXPECT_TRUE(gets(0, 1));
     {
@@ -175,28 +213,8 @@ TEST_F(FullLanes, RefuseAtOnceAndDoNotHoldUpQuickCalls) {
         open = true;
     }
     changed.notify_all();
-    EXPECT_TRUE(gets(0, 16 + 64 + 1));
-    EXPECT_EQ(replies[107], 5);
-    queues.reset();
-}
-
-TEST_F(FullLanes, LetLocalCallersGoWhenTheDaemonStops) {
-    OvraPlatform::LocalCall call;
-    call.api = "Test";
-    call.version = 1;
-    call.method = "wait";
-    call.user = "admin";
-    std::thread stopper([this] {
-        std::this_thread::sleep_for(200ms);
-        dispatcher->leaveLocal();
-    });
-    EXPECT_EQ(dispatcher->serveLocal(call)["error"]["code"], 107);
-    stopper.join();
-    {
-        const std::lock_guard lock(mutex);
-        open = true;
-    }
-    changed.notify_all();
+    EXPECT_TRUE(gets(0, places + 3 * 64 + 1));
+    EXPECT_EQ(replies[107], refused);
     queues.reset();
 }
 

@@ -5,6 +5,14 @@
 #include "support/remote_node.h"
 
 #include <ovraplatform/appliance.h>
+#include <ovraplatform/client_scope.h>
+#include <ovrawebapi/api_runner.h>
+
+#include <atomic>
+#include <future>
+#include <mutex>
+#include <set>
+#include <thread>
 
 namespace {
 
@@ -121,10 +129,26 @@ TEST_F(Credential, InBothDirectionsIsMadeThereAndBack) {
     EXPECT_EQ(asked["conn"]["addr"], "10.0.0.1");
 }
 
-TEST_F(Credential, InBothDirectionsIsNotBegunWithoutAnAddressOfOnesOwn) {
-    OvraTest::writeFile(OvraPlatform::kConfigFile, "address=\"192.0.2.1\"\n");
+TEST_F(Credential, InBothDirectionsIsNotBegunWithoutAnAddressOrAnAccountOfOnesOwn) {
+    addAccount("plain", false);
     Json::Value params = byAccount();
     params["cred_direction"] = "bidirection";
+    for (const char *account : {"nobody", "plain"}) {
+        params["local_account"] = account;
+        EXPECT_EQ(ask("create", params).code(), 106) << account;
+    }
+    params.removeMember("local_account");
+    const auto askHere = [&params] { // as `ovradr call local` does
+        Json::Value reply;
+        OVRA::APIRunner().Exec(reply, "OVRA.DR.Node.Credential", 1, "create", params, "admin");
+        return reply;
+    };
+    EXPECT_EQ(askHere()["error"]["msg"]["param"], "local_account");
+    EXPECT_EQ(remote.calls(), "");
+    params["local_account"] = "root";
+    EXPECT_EQ(askHere()["data"]["dst_cred"], json(R"({"cred_id":"back"})"));
+    remote.forgetCalls();
+    OvraTest::writeFile(OvraPlatform::kConfigFile, "address=\"192.0.2.1\"\n");
     EXPECT_EQ(ask("create", params).code(), 401);
     EXPECT_EQ(remote.calls(), "");
 }
@@ -224,6 +248,34 @@ TEST_F(Credential, DoesNotReachTheNodeItself) {
     remote.answer("info", R"({"success":true,"data":{"serial":"S1","node_id":")" + self + R"("}})");
     EXPECT_EQ(ask("create", byAccount()).code(), 106);
     EXPECT_EQ(rows("node_cred"), "");
+}
+
+TEST_F(Credential, OfAnotherNodeGetsOneSessionHoweverManyAskAtOnce) {
+    addAccount("admin", true);
+    for (int round = 0; round < 20; ++round) {
+        std::set<std::string> granted;
+        std::mutex guard;
+        std::atomic<int> ready = 0;
+        std::vector<std::future<void>> asked;
+        for (int i = 0; i < 6; ++i) {
+            asked.push_back(std::async(std::launch::async, [&] {
+                const OvraPlatform::ClientScope scope("127.0.0.1");
+                Json::Value params;
+                params["node_id"] = "n" + std::to_string(round);
+                Json::Value reply;
+                ++ready;
+                while (ready < 6) {
+                    std::this_thread::yield();
+                }
+                OVRA::APIRunner().Exec(reply, "OVRA.DR.Node.Session", 2, "create", params, "admin");
+                const std::lock_guard<std::mutex> lock(guard);
+                granted.insert(reply["data"]["session"].asString());
+            }));
+        }
+        asked.clear();
+        EXPECT_EQ(granted.size(), 1U) << round;
+        EXPECT_EQ(granted.count(""), 0U);
+    }
 }
 
 class Relay : public Credential {

@@ -1,10 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "appliance.h"
 
-#include <arpa/inet.h>
 #include <openssl/ssl.h>
-#include <sys/socket.h>
-#include <unistd.h>
 
 #include <memory>
 
@@ -112,17 +109,12 @@ struct TlsVisit {
         SSL_CTX_set_min_proto_version(context.get(), version);
         SSL_CTX_set_max_proto_version(context.get(), version);
         const std::unique_ptr<SSL, FreeSsl> ssl(SSL_new(context.get()));
-        sockaddr_in address{};
-        address.sin_family = AF_INET;
-        address.sin_port = htons(static_cast<std::uint16_t>(port));
-        address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
-        const int fd = socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0);
-        SSL_set_fd(ssl.get(), fd);
+        const RawConnection connection(port);
+        SSL_set_fd(ssl.get(), connection.fd());
         if (offered != nullptr) {
             SSL_set_session(ssl.get(), offered);
         }
-        connected = connect(fd, reinterpret_cast<sockaddr *>(&address), sizeof(address)) == 0 &&
-                    SSL_connect(ssl.get()) == 1;
+        connected = SSL_connect(ssl.get()) == 1;
         if (connected) {
             constexpr char kRequest[] = "GET /webapi/query.cgi HTTP/1.1\r\nHost: a\r\n\r\n";
             char reply[512];
@@ -132,7 +124,6 @@ struct TlsVisit {
             session.reset(SSL_get1_session(ssl.get()));
             SSL_shutdown(ssl.get());
         }
-        close(fd);
     }
 
     bool connected = false;

@@ -1,7 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "handlers/flow_error.h"
 #include "handlers/params.h"
-#include "support/print_json.h"
 
 #include <ovradrcore/json.h>
 

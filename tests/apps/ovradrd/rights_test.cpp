@@ -114,6 +114,7 @@ TEST_F(Session, IsWorthWhatItsAccountIsWorthNow) {
     addAccount("alice", true);
     addAccount("root", true);
     const std::string sid = session("alice");
+    const std::string expired = session("root");
     OvraPlatform::AccountStore accounts;
     const auto code = [&] { return call(kNode, 1, "test_privilege", {}, sid).code(); };
     EXPECT_EQ(code(), 0);
@@ -124,51 +125,40 @@ TEST_F(Session, IsWorthWhatItsAccountIsWorthNow) {
     EXPECT_EQ(code(), 105);
     ASSERT_TRUE(accounts.remove("alice"));
     EXPECT_EQ(code(), 119);
-}
 
-TEST_F(Session, ThatExpiredIsUnknown) {
-    addAccount("alice", true);
-    const std::string sid = session("alice");
-    EXPECT_EQ(call(kNode, 1, "info", {}, sid).code(), 0);
+    EXPECT_EQ(call(kNode, 1, "info", {}, expired).code(), 0);
     const std::string now = std::to_string(std::time(nullptr));
     ASSERT_TRUE(OvraTest::RawSqlite(OvraPlatform::kSessionsFile)
                     .run("UPDATE session SET expires = " + now));
-    EXPECT_EQ(call(kNode, 1, "info", {}, sid).code(), 119);
+    EXPECT_EQ(call(kNode, 1, "info", {}, expired).code(), 119);
 }
 
-TEST_F(Session, IsNotTakenForExpiredWhenTheStoreCannotBeRead) {
+TEST_F(Session, IsLookedUpInTheFileThatIsThereNowAndNotTakenForExpiredWhenThatCannotBeRead) {
     addAccount("alice", true);
-    const std::string sid = session("alice");
-    for (int i = 0; i < 20; ++i) {
-        ASSERT_EQ(call(kNode, 1, "info", {}, sid).code(), 0);
-    }
-    std::filesystem::resize_file(OvraPlatform::kSessionsFile, 10);
-    for (int i = 0; i < 20; ++i) {
-        EXPECT_EQ(call(kNode, 1, "info", {}, sid).code(), 100);
-    }
-}
-
-TEST_F(Session, IsLookedUpInTheFileThatIsThereNow) {
-    addAccount("alice", true);
+    // In each of the daemon's threads.
+    const auto expectCode = [this](int code, const std::string &sid) {
+        for (int i = 0; i < 20; ++i) {
+            EXPECT_EQ(call(kNode, 1, "info", {}, sid).code(), code);
+        }
+    };
     const std::string before = session("alice");
-    for (int i = 0; i < 20; ++i) {
-        ASSERT_EQ(call(kNode, 1, "info", {}, before).code(), 0);
-    }
+    expectCode(0, before);
     std::filesystem::remove(OvraPlatform::kSessionsFile);
     const std::string after = session("alice");
-    for (int i = 0; i < 20; ++i) {
-        EXPECT_EQ(call(kNode, 1, "info", {}, before).code(), 119);
-        EXPECT_EQ(call(kNode, 1, "info", {}, after).code(), 0);
-    }
+    expectCode(119, before);
+    expectCode(0, after);
+    std::filesystem::resize_file(OvraPlatform::kSessionsFile, 10);
+    expectCode(100, after);
 }
 
-TEST_F(Session, ForANodeIsReusedAndTiedToTheCallersAccount) {
+TEST_F(Session, ForANodeIsReusedAndTiedToTheCallersAccountAndATemporaryOneEndsAfterAnHour) {
     addAccount("alice", true);
     const std::string sid = session("alice");
     const Json::Value node = json(R"({"node_id":"n1"})");
     const Reply first = call(kSession, 2, "create", node, sid);
     ASSERT_EQ(first.code(), 0) << first.text;
     EXPECT_EQ(call(kSession, 2, "create", node, sid).data(), first.data());
+    EXPECT_NE(call(kSession, 2, "create", json(R"({"node_id":"n2"})"), sid).data(), first.data());
     const Reply owner = call(kSession, 1, "get", first.data(), sid);
     EXPECT_EQ(owner.data()["account"], "alice");
 
@@ -177,14 +167,10 @@ TEST_F(Session, ForANodeIsReusedAndTiedToTheCallersAccount) {
     EXPECT_EQ(call(kNode, 1, "test_privilege", {}, granted).code(), 0);
     EXPECT_EQ(call(kSession, 1, "delete", first.data(), granted).code(), 0);
     EXPECT_EQ(call(kNode, 1, "test_privilege", {}, granted).code(), 119);
-}
 
-TEST_F(Session, ThatIsTemporaryEndsAfterAnHour) {
-    addAccount("alice", true);
-    const Reply reply = call(kSession, 1, "temp_create", {}, session("alice"));
-    ASSERT_EQ(reply.code(), 0) << reply.text;
-    const auto record = OvraPlatform::SessionStore().find(reply.data()["session"].asString());
-    ASSERT_TRUE(record);
+    const Reply temporary = call(kSession, 1, "temp_create", {}, sid);
+    const auto record = OvraPlatform::SessionStore().find(temporary.data()["session"].asString());
+    ASSERT_TRUE(record) << temporary.text;
     EXPECT_EQ(record->expires.value_or(0) - record->created, 3600);
 }
 

@@ -75,39 +75,27 @@ TEST_F(Sealed, LogInAndCallsWorkOverPlainHttp) {
     OVRACredFree(cred);
 }
 
-TEST_F(Sealed, IsAnsweredSealed) {
-    const Reply reply = post(seal(wallClock()));
+TEST_F(Sealed, IsAnsweredSealedAndRefusedTheSecondTime) {
+    const WireCall outer = seal(wallClock());
+    const Reply reply = post(outer);
     EXPECT_EQ(reply.document.getMemberNames(), std::vector<std::string>{"sealed_reply"});
     EXPECT_EQ(open(reply)["success"], true);
+    EXPECT_EQ(open(post(outer))["error"]["msg"]["reason"], "replayed");
 }
 
-TEST_F(Sealed, IsRefusedTheSecondTime) {
-    const WireCall outer = seal(wallClock());
-    EXPECT_EQ(open(post(outer))["success"], true);
-    const Json::Value again = open(post(outer));
-    EXPECT_EQ(again["error"]["code"], 109);
-    EXPECT_EQ(again["error"]["msg"]["reason"], "replayed");
-}
-
-TEST_F(Sealed, IsToldTheTimeWhenItIsStale) {
-    const Json::Value refusal = open(post(seal(wallClock() - 120'000)));
-    EXPECT_EQ(refusal["error"]["code"], 109);
-    EXPECT_EQ(refusal["error"]["msg"]["reason"], "stale");
-    EXPECT_NEAR(refusal["error"]["msg"]["time"].asDouble(), static_cast<double>(wallClock()), 5000);
-}
-
-TEST_F(Sealed, CannotBeMovedToAnotherCall) {
-    WireCall outer = seal(wallClock());
-    outer.method = "info";
-    EXPECT_EQ(open(post(outer))["error"]["msg"]["reason"], "call");
-}
-
-TEST_F(Sealed, ThatCannotBeOpenedIsRefusedUnsealed) {
-    WireCall outer = seal(wallClock());
-    outer.sealed[10] = outer.sealed[10] == 'A' ? 'B' : 'A';
-    const Reply reply = post(outer);
-    EXPECT_EQ(reply.code(), 109);
-    EXPECT_EQ(reply.document["error"]["msg"]["reason"], "key");
+TEST_F(Sealed, IsRefusedWithTheReason) {
+    const Json::Value stale = open(post(seal(wallClock() - 120'000)))["error"];
+    EXPECT_EQ(stale["code"], 109);
+    EXPECT_EQ(stale["msg"]["reason"], "stale");
+    EXPECT_NEAR(stale["msg"]["time"].asDouble(), static_cast<double>(wallClock()), 5000);
+    WireCall moved = seal(wallClock());
+    moved.method = "info";
+    EXPECT_EQ(open(post(moved))["error"]["msg"]["reason"], "call");
+    WireCall damaged = seal(wallClock());
+    damaged.sealed[10] = damaged.sealed[10] == 'A' ? 'B' : 'A';
+    const Reply unsealed = post(damaged);
+    EXPECT_EQ(unsealed.code(), 109);
+    EXPECT_EQ(unsealed.document["error"]["msg"]["reason"], "key");
 }
 
 TEST_F(Sealed, IsWhatPlainHttpDemands) {

@@ -4,9 +4,11 @@
 
 #include <ovracredential/cred_request.h>
 #include <ovraplatform/cred_errors.h>
+#include <ovraplatform/farlink.h>
 #include <ovraplatform/peer_trust.h>
 
 #include <gtest/gtest.h>
+#include <sys/mount.h>
 
 #include <chrono>
 #include <cstdlib>
@@ -136,14 +138,16 @@ INSTANTIATE_TEST_SUITE_P(
         AnswerScene{"failure with code 0", Answer::json(R"({"success":false,"error":{"code":0}})"),
                     CredError::kReplyBroken},
         AnswerScene{"a cut document", Answer::truncated(kRefusal), CredError::kConnectionLost},
-        AnswerScene{"50 MB", Answer::huge(50'000'000, true), CredError::kReplyTooLarge},
-        AnswerScene{"50 MB unannounced", Answer::huge(50'000'000, false),
-                    CredError::kReplyTooLarge},
+        AnswerScene{"7 MiB", Answer::success(R"({"x":")" + std::string(7 << 20, 'x') + "\"}"),
+                    CredError::kNone},
+        AnswerScene{"9 MiB", Answer::huge(9 << 20, true), CredError::kReplyTooLarge},
+        AnswerScene{"9 MiB unannounced", Answer::huge(9 << 20, false), CredError::kReplyTooLarge},
         AnswerScene{"headers without end", Answer::raw(manyHeaders()), CredError::kReplyTooLarge},
         AnswerScene{"no HTTP", Answer::raw("220 hello\r\n"), CredError::kReplyBroken},
         AnswerScene{"nothing, closing", Answer::closed(), CredError::kConnectionLost},
-        AnswerScene{"nothing, waiting", Answer::silence(), CredError::kTimedOut},
-        AnswerScene{"too slowly", Answer::drip(50ms), CredError::kTimedOut},
+        AnswerScene{"nothing, resetting", Answer::reset(), CredError::kConnectionLost},
+        AnswerScene{"nothing, waiting", Answer::silence(), CredError::kUnanswered},
+        AnswerScene{"too slowly", Answer::drip(50ms), CredError::kUnanswered},
         AnswerScene{"401", Answer::status(401), CredError::kNoPermission},
         AnswerScene{"403", Answer::status(403), CredError::kNoPermission},
         AnswerScene{"404", Answer::status(404), CredError::kHttpStatus},
@@ -163,6 +167,9 @@ TEST_F(CredRequestScene, TellsWhyItCannotConnect) {
     silent.fallSilent();
     const auto begin = std::chrono::steady_clock::now();
     EXPECT_EQ(call(silent, true, 1).error, CredError::kTimedOut);
+    std::filesystem::create_directories(kConfigDir);
+    ASSERT_TRUE(writeFarlinkSettings({"127.0.0.1", silent.port(), ""}));
+    EXPECT_EQ(probe("flk", 1, "alias").error, CredError::kTimedOut) << "while it is looked up";
     EXPECT_LT(std::chrono::steady_clock::now() - begin, 5s);
 }
 
@@ -230,26 +237,45 @@ TEST_F(CredRequestScene, ReplacesAKeptConnectionThatThePeerHasClosed) {
     EXPECT_EQ(server.requests().size(), 3U);
 }
 
-TEST_F(CredRequestScene, RepeatsARequestOfWhichNothingArrived) {
-    MisbehavingServer server({.tls = true});
-    call(server);
-    call(server);
-    if (!server.vanish()) {
-        GTEST_SKIP() << "a connection cannot be made to vanish without CAP_NET_ADMIN";
-    }
-    EXPECT_TRUE(call(server).ok);
-    EXPECT_EQ(server.requests().size(), 3U);
-}
-
 TEST_F(CredRequestScene, DoesNotRepeatARequestThatMayHaveBeenCarriedOut) {
     MisbehavingServer server({.tls = true});
     call(server);
-    call(server);
-    server.answerOnce(Answer::closed());
-    EXPECT_EQ(call(server).error, CredError::kConnectionLost);
-    EXPECT_EQ(server.requests().size(), 3U);
-    EXPECT_EQ(server.requests()[2].connection, server.requests()[1].connection)
-        << "it was the kept connection";
+    for (const Answer &answer : {Answer::closed(), Answer::reset()}) {
+        call(server); // on the connection that is then used again
+        const std::size_t before = server.requests().size();
+        server.answerOnce(answer);
+        EXPECT_EQ(call(server).error, CredError::kConnectionLost);
+        const std::vector<Received> requests = server.requests();
+        ASSERT_EQ(requests.size(), before + 1);
+        EXPECT_EQ(requests[before].connection, requests[before - 1].connection);
+    }
+}
+
+TEST_F(CredRequestScene, TriesEveryAddressOfAHostAndFirstTheOneThatWorked) {
+    writeFile(path("hosts"), "127.0.0.1 several\n127.0.0.2 several\n127.0.0.3 several\n");
+    if (mount(path("hosts").c_str(), "/etc/hosts", nullptr, MS_BIND, nullptr) != 0) {
+        GTEST_SKIP() << "a host with several addresses needs the right to mount";
+    }
+    MisbehavingServer server({.tls = true, .address = "127.0.0.2"});
+    const int port = server.port();
+    EXPECT_EQ(probe("https", port, "several").error, CredError::kNone);
+    MisbehavingServer before({.address = "127.0.0.1", .port = port});
+    MisbehavingServer after({.address = "127.0.0.3", .port = port});
+    EXPECT_EQ(probe("https", port, "several").error, CredError::kNone);
+    EXPECT_EQ(before.connections() + after.connections(), 0);
+    umount("/etc/hosts");
+}
+
+TEST_F(CredRequestScene, SaysThatTheShortageIsItsOwn) {
+    MisbehavingServer server({.tls = true});
+    for (const char *host : {"127.0.0.1", "localhost"}) {
+        OtherProcess starved([&] {
+            const rlimit none{0, 0};
+            setrlimit(RLIMIT_NOFILE, &none);
+            return static_cast<int>(probe("https", server.port(), host).error);
+        });
+        EXPECT_EQ(starved.wait(), static_cast<int>(CredError::kOutOfMemory)) << host;
+    }
 }
 
 TEST_F(CredRequestScene, RefusesAnEndpointWhoseKeyHasChanged) {
@@ -362,6 +388,10 @@ TEST_F(CredRequestScene, SendsAFileAlong) {
     }
 }
 
+Answer drippingBody() {
+    return {"HTTP/1.1 200 OK\r\n\r\n{", {}, Answer::Ending::kHang};
+}
+
 struct ProbeScene {
     const char *name;
     Answer answer;
@@ -398,8 +428,12 @@ INSTANTIATE_TEST_SUITE_P(
                     ProbeScene{"500", Answer::status(500), CredError::kHttpStatus},
                     ProbeScene{"silence", Answer::silence(), CredError::kTimedOut},
                     ProbeScene{"nothing", Answer::closed(), CredError::kConnectionLost},
-                    ProbeScene{"50 MB", Answer::huge(50'000'000, false),
-                               CredError::kReplyTooLarge}));
+                    ProbeScene{"50 MB", Answer::huge(50'000'000, false), CredError::kNone},
+                    ProbeScene{"50 MB announced", Answer::huge(50'000'000, true), CredError::kNone},
+                    ProbeScene{"a cut document", Answer::truncated(kRefusal), CredError::kNone},
+                    ProbeScene{"a body without end", drippingBody(), CredError::kNone},
+                    ProbeScene{"a cut status", Answer::raw("HTTP/1.1"),
+                               CredError::kConnectionLost}));
 
 TEST_F(CredRequestScene, ProbesOverConnectionsOfTheirOwn) {
     MisbehavingServer server({.tls = true});

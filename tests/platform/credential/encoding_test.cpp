@@ -1,6 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "http/endpoint.h"
-#include "support/print_json.h"
 
 #include <ovradrcore/json.h>
 #include <ovraplatform/wire_form.h>

@@ -62,10 +62,10 @@ TEST_F(Appliance, NamesWhatItCannotUseAndGoesOnWithout) {
 }
 
 TEST_F(Appliance, AnUnusableAddressNeverMeansEveryAddress) {
-    const ApplianceConfig mixed = read("address=\"192.0.2.300,192.0.2.3,,host\"\n");
+    const ApplianceConfig mixed = read("address=\"192.0.2.300,192.0.2.3,,host,fe80::1\"\n");
     EXPECT_FALSE(mixed.servesAllAddresses);
     EXPECT_EQ(mixed.addresses, (Strings{"192.0.2.3"}));
-    EXPECT_EQ(mixed.problems.size(), 3U);
+    EXPECT_EQ(mixed.problems.size(), 4U);
     const ApplianceConfig unreadable = readApplianceConfig(path(""));
     EXPECT_FALSE(unreadable.servesAllAddresses);
     EXPECT_TRUE(unreadable.addresses.empty());

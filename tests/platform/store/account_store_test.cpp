@@ -162,6 +162,10 @@ TEST_F(Accounts, WhatCannotBeDoneIsRefusedWithAReason) {
     EXPECT_EQ(reason(accounts.setPassword("bob", kPassword)), "There is no account [bob].");
     EXPECT_EQ(reason(accounts.remove("bob")), "There is no account [bob].");
     EXPECT_NE(reason(accounts.setPassword("ann", "short")).find("8 to 1024"), std::string::npos);
+    for (const std::string &password :
+         {std::string("correct h\xf6rse"), std::string("correct \0horse", 14)}) {
+        EXPECT_NE(reason(accounts.setPassword("ann", password)).find("UTF-8"), std::string::npos);
+    }
     EXPECT_NE(reason(accounts.setTotp("ann", "GEZDGNBV")).find("base32"), std::string::npos);
     EXPECT_EQ(verify("ann", kPassword), LoginResult::kOk);
     EXPECT_FALSE(accounts.find("ann")->administrator);

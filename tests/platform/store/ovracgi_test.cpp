@@ -4,6 +4,7 @@
 #include <ovracgi/ovracgi.h>
 #include <ovraplatform/client_scope.h>
 #include <ovraplatform/session_store.h>
+#include <ovraplatform/session_walk.h>
 
 #include <json-c/json.h>
 
@@ -12,6 +13,7 @@
 #include <cstring>
 #include <string>
 #include <thread>
+#include <utility>
 
 using OvraPlatform::ClientScope;
 using OvraPlatform::SessionStore;
@@ -53,13 +55,7 @@ struct Cgi : OvraTest::OwnFiles {
                           OvraCgiLoginNoAuth(&handle, sid.data(), sid.size(), client) == 1;
         return done ? sid.data() : "";
     }
-    static bool isLive(const std::string &sid) {
-        Handle handle;
-        json_object *record = nullptr;
-        const int found = OvraCgiGetSessionBySID(&handle, sid.c_str(), &record);
-        json_object_put(record);
-        return found == 1;
-    }
+    static bool isLive(const std::string &sid) { return SessionStore().find(sid).has_value(); }
     static std::string remoteOf(const std::string &sid) {
         const auto session = SessionStore().find(sid);
         return session ? session->remote : "(no session)";
@@ -96,7 +92,7 @@ TEST_F(Cgi, ALoginGivesASessionWhoseFieldsAreReadByNumber) {
     json_object_put(record);
 }
 
-TEST_F(Cgi, ALoginThatIsNotCompleteGivesNoSession) {
+TEST_F(Cgi, ALoginThatIsNotCompleteGivesNoSessionAndUnusableOptionsAreRefused) {
     std::array<char, 100> sid{};
     Handle handle;
     std::strcpy(handle.user, "ann");
@@ -109,46 +105,37 @@ TEST_F(Cgi, ALoginThatIsNotCompleteGivesNoSession) {
     handle.user[0] = '\0';
     EXPECT_EQ(OvraCgiLoginNoAuth(&handle, sid.data(), sid.size(), nullptr), 0) << "nobody";
     EXPECT_STREQ(sid.data(), "");
-}
-
-TEST_F(Cgi, UnusableOptionsAreRefused) {
-    Handle handle;
-    EXPECT_EQ(handle.option(OVRA_CGI_OPT_TIMEOUT, 0), 0);
+    EXPECT_EQ(handle.option(OVRA_CGI_OPT_TIMEOUT, 0) + handle.option(99, 1), 0);
     EXPECT_EQ(handle.option(OVRA_CGI_OPT_EXTRA, "no JSON"), 0);
     EXPECT_EQ(handle.option(OVRA_CGI_OPT_UI, "[]"), 0);
     EXPECT_EQ(handle.option(OVRA_CGI_OPT_APP, std::string(256, 'a').c_str()), 0);
     EXPECT_EQ(OvraCgiSetOption(&handle, OVRA_CGI_OPT_APP, nullptr), 0);
-    EXPECT_EQ(handle.option(99, 1), 0);
 }
 
-TEST_F(Cgi, AWalkRemovesWhatItsTestAnswersZeroFor) {
+TEST_F(Cgi, AWalkVisitsAndRemovesWhatItIsAboutAndItsTestMayUseTheStore) {
     const std::string ann = login("ann");
     const std::string other = login("ann", "web");
     const std::string bob = login("bob");
-    struct Walk {
-        int seen = 0;
-        bool storeAnswered = true;
-    } walk;
-    Handle handle;
-    EXPECT_EQ(OvraCgiRemoveSessionByFunc(
-                  &handle,
-                  [](json_object *record, void *argument) {
-                      auto *const state = static_cast<Walk *>(argument);
-                      ++state->seen;
-                      state->storeAnswered =
-                          state->storeAnswered && isLive(field(record, OVRA_CGI_FIELD_SID));
-                      return field(record, OVRA_CGI_FIELD_USER) == "ann" &&
-                                     field(record, OVRA_CGI_FIELD_APP) == "Tidewater"
-                                 ? 0
-                                 : 1;
-                  },
-                  &walk),
-              0);
-    EXPECT_EQ(walk.seen, 3);
-    EXPECT_TRUE(walk.storeAnswered);
+    const auto walk = [](bool removes) {
+        std::pair<std::string, bool> state("", removes);
+        const auto test = [](json_object *record, void *argument) {
+            auto &[seen, removing] = *static_cast<std::pair<std::string, bool> *>(argument);
+            seen += isLive(field(record, OVRA_CGI_FIELD_SID)) ? field(record, OVRA_CGI_FIELD_USER)
+                                                              : "gone";
+            return removing && field(record, OVRA_CGI_FIELD_APP) == "Tidewater" ? 0 : 1;
+        };
+        Handle handle;
+        EXPECT_EQ(OvraCgiRemoveSessionByFunc(&handle, test, &state), 0);
+        return state.first;
+    };
+    EXPECT_EQ(walk(false).size(), 9U);
+    {
+        const OvraPlatform::SessionWalk about({"ann", "Tidewater", R"({"node_id":"n1"})"});
+        EXPECT_EQ(walk(true), "ann");
+    }
     EXPECT_FALSE(isLive(ann));
-    EXPECT_TRUE(isLive(other));
-    EXPECT_TRUE(isLive(bob));
+    EXPECT_EQ(walk(false).size(), 6U);
+    Handle handle;
     EXPECT_NE(OvraCgiRemoveSessionByFunc(&handle, nullptr, nullptr), 0);
     EXPECT_NE(OvraCgiRemoveSessionByIndex(&handle, OVRA_CGI_FIELD_USER, "bob"), 0);
     EXPECT_TRUE(isLive(bob));

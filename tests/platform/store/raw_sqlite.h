@@ -14,6 +14,7 @@ public:
     explicit RawSqlite(const std::string &path) {
         sqlite3 *raw = nullptr;
         sqlite3_open(path.c_str(), &raw);
+        sqlite3_busy_timeout(raw, 10'000);
         database_.reset(raw);
     }
 

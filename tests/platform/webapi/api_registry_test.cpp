@@ -1,13 +1,10 @@
 // SPDX-License-Identifier: Apache-2.0
-#include "support/print_json.h"
-
 #include <ovraplatform/api_errors.h>
 #include <ovraplatform/api_registry.h>
 #include <ovrawebapi/api_runner.h>
 
 #include <gtest/gtest.h>
 
-#include <ostream>
 #include <stdexcept>
 
 namespace {
@@ -27,28 +24,16 @@ Json::Value echo(const Json::Value &params, const APICaller &caller) {
     return apiSuccess(data);
 }
 
-struct Scene {
-    const char *name;
-    APICall call;
-    APICaller caller;
-    int code;
-};
-std::ostream &operator<<(std::ostream &out, const Scene &scene) {
-    return out << scene.name;
-}
-
 const APICaller kNobody{};
 const APICaller kUser{"ann", false, "s1", "192.0.2.1", false};
 const APICaller kAdministrator{"root", true, "s2", "192.0.2.1", false};
 const APICaller kLocal{"admin", true, "", "", true};
 
-class Dispatch : public testing::TestWithParam<Scene> {};
-
-TEST_P(Dispatch, AnswersWithTheCodeOfTheWireForm) {
+TEST(APIRegistry, AnswersWithTheCodeOfTheWireForm) {
     APIRegistry registry;
     registry.add("Open", 1, "get", APIRight::kNone, APIQueue::kQuick, echo);
     registry.add("Mine", 2, "get", APIRight::kSession, APIQueue::kQuick, echo);
-    registry.add("All", 1, "set", APIRight::kAdministrator, APIQueue::kSlow, echo);
+    registry.add("All", 1, "set", APIRight::kAdministrator, APIQueue::kOutbound, echo);
     registry.add("Here", 1, "get", APIRight::kLocal, APIQueue::kQuick, echo);
     registry.add("Bad", 1, "throw", APIRight::kNone, APIQueue::kQuick,
                  [](const Json::Value &params, const APICaller &) -> Json::Value {
@@ -58,50 +43,48 @@ TEST_P(Dispatch, AnswersWithTheCodeOfTheWireForm) {
                  [](const Json::Value &, const APICaller &) -> Json::Value { throw 7; });
     registry.add("Bad", 1, "no_document", APIRight::kNone, APIQueue::kQuick,
                  [](const Json::Value &, const APICaller &) { return Json::Value("done"); });
-    EXPECT_EQ(codeOf(registry.dispatch(GetParam().call, GetParam().caller)), GetParam().code);
+    Json::Value list(Json::objectValue);
+    list["list"].append(1);
+    const struct {
+        const char *name;
+        APICall call;
+        APICaller caller;
+        int code;
+    } scenes[] = {{"anybody", {"Open", 1, "get"}, kNobody, 0},
+                  {"a user", {"Mine", 2, "get"}, kUser, 0},
+                  {"an administrator", {"All", 1, "set"}, kAdministrator, 0},
+                  {"no such API", {"Closed", 1, "get"}, kAdministrator, APIError::kNoSuchAPI},
+                  {"no such method", {"Open", 1, "set"}, kUser, APIError::kNoSuchMethod},
+                  {"no such version", {"Mine", 1, "get"}, kUser, APIError::kNoSuchVersion},
+                  {"no session", {"Mine", 2, "get"}, kNobody, APIError::kNoSession},
+                  {"no session, more needed", {"All", 1, "set"}, kNobody, APIError::kNoSession},
+                  {"no right", {"All", 1, "set"}, kUser, APIError::kNoPermission},
+                  {"no process of the appliance",
+                   {"Here", 1, "get"},
+                   kAdministrator,
+                   APIError::kNoPermission},
+                  {"a process of the appliance", {"Here", 1, "get"}, kLocal, 0},
+                  {"no object", {"Open", 1, "get", "text"}, kUser, APIError::kBadRequest},
+                  {"wrong type used", {"Bad", 1, "throw", list}, kUser, APIError::kInternal},
+                  {"not an exception", {"Bad", 1, "throw_number"}, kUser, APIError::kInternal},
+                  {"no document", {"Bad", 1, "no_document"}, kUser, APIError::kInternal}};
+    for (const auto &scene : scenes) {
+        EXPECT_EQ(codeOf(registry.dispatch(scene.call, scene.caller)), scene.code) << scene.name;
+    }
+    EXPECT_EQ(registry.dispatch({"Open", 1, "get", Json::Value()}, kNobody)["data"]["params"],
+              Json::Value(Json::objectValue));
 }
 
-Json::Value objectWithList() {
-    Json::Value params(Json::objectValue);
-    params["list"].append(1);
-    return params;
-}
-
-INSTANTIATE_TEST_SUITE_P(
-    Calls, Dispatch,
-    testing::Values(
-        Scene{"anybody", {"Open", 1, "get"}, kNobody, 0},
-        Scene{"a user", {"Mine", 2, "get"}, kUser, 0},
-        Scene{"an administrator", {"All", 1, "set"}, kAdministrator, 0},
-        Scene{"no such API", {"Closed", 1, "get"}, kAdministrator, APIError::kNoSuchAPI},
-        Scene{"no such method", {"Open", 1, "set"}, kUser, APIError::kNoSuchMethod},
-        Scene{"no such version", {"Mine", 1, "get"}, kUser, APIError::kNoSuchVersion},
-        Scene{"no session", {"Mine", 2, "get"}, kNobody, APIError::kNoSession},
-        Scene{"no session, more needed", {"All", 1, "set"}, kNobody, APIError::kNoSession},
-        Scene{"no right", {"All", 1, "set"}, kUser, APIError::kNoPermission},
-        Scene{"no process of the appliance",
-              {"Here", 1, "get"},
-              kAdministrator,
-              APIError::kNoPermission},
-        Scene{"a process of the appliance", {"Here", 1, "get"}, kLocal, 0},
-        Scene{"no object", {"Open", 1, "get", "text"}, kUser, APIError::kBadRequest},
-        Scene{"wrong type used", {"Bad", 1, "throw", objectWithList()}, kUser, APIError::kInternal},
-        Scene{"not an exception", {"Bad", 1, "throw_number"}, kUser, APIError::kInternal},
-        Scene{"no document", {"Bad", 1, "no_document"}, kUser, APIError::kInternal}));
-
-TEST(APIRegistry, GivesAHandlerAnObjectForNullParameters) {
-    APIRegistry registry;
-    registry.add("Open", 1, "get", APIRight::kNone, APIQueue::kQuick, echo);
-    const Json::Value reply = registry.dispatch({"Open", 1, "get", Json::Value()}, kNobody);
-    EXPECT_EQ(reply["data"]["params"], Json::Value(Json::objectValue));
-}
-
-TEST(APIRegistry, KnowsTheLaneOfEachVersion) {
+TEST(APIRegistry, KnowsTheQueueOfEachVersionAndOfWhatItIsAskedFor) {
     APIRegistry registry;
     registry.add("A", 1, "get", APIRight::kNone, APIQueue::kQuick, echo);
-    registry.add("A", 2, "get", APIRight::kNone, APIQueue::kSlow, echo);
+    registry.add("A", 2, "get", APIRight::kNone, APIQueue::kRelay, echo,
+                 [](const Json::Value &params) {
+                     return params.isString() ? APIQueue::kRelay : APIQueue::kOutbound;
+                 });
     EXPECT_EQ(registry.queue({"A", 1, "get"}), APIQueue::kQuick);
-    EXPECT_EQ(registry.queue({"A", 2, "get"}), APIQueue::kSlow);
+    EXPECT_EQ(registry.queue({"A", 2, "get"}), APIQueue::kOutbound);
+    EXPECT_EQ(registry.queue({"A", 2, "get", "text"}), APIQueue::kRelay);
     EXPECT_EQ(registry.queue({"B", 1, "get"}), APIQueue::kQuick);
 }
 

@@ -85,14 +85,10 @@ TEST_F(LocalCallScene, CarriesTheWholeCallAndTheWholeReply) {
     EXPECT_EQ(OvraTest::modeOf(kStateDir), 0700U);
 }
 
-TEST_F(LocalCallScene, SaysSoWhenNoDaemonRuns) {
-    Json::Value out;
-    EXPECT_FALSE(OVRA::APIRunner().Exec(out, "Test", 1, "get", Json::Value(), "admin"));
+TEST_F(LocalCallScene, SaysSoWhenNoDaemonRunsOrItDiesDuringTheCall) {
+    const Json::Value out = ask();
     EXPECT_EQ(codeOf(out), APIError::kInternal);
     EXPECT_NE(out["error"]["msg"].asString().find("ovradrd does not answer"), std::string::npos);
-}
-
-TEST_F(LocalCallScene, SaysSoWhenTheDaemonDiesDuringTheCall) {
     OvraTest::OtherProcess daemon([] {
         LocalServer server(kSocketFile, [](const LocalCall &) -> Json::Value { _exit(9); });
         static_cast<void>(server.start());

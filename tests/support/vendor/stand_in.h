@@ -43,18 +43,12 @@ struct Call {
     std::string uploadName;
 };
 
-struct Account {
-    std::string password;
-    std::string code{}; ///< the one-time code that is asked for; "": none
-    bool disabled = false;
-    bool permitted = true;
-};
-
 /// A remote appliance, behind one endpoint.
 struct Remote {
     bool reachable = true;
     int error = 0; ///< the credential library's error number for every request; 0: none
-    std::map<std::string, Account> accounts{};
+    std::string login = "joe/pw/";    ///< account, password and one-time code that it lets in
+    int refusal = 400;                ///< the error for any others
     std::set<std::string> sessions{}; ///< those that live; others are answered with error 119
     std::function<Json::Value(const Call &)> answer{};
     std::vector<Call> calls{};

@@ -22,10 +22,14 @@ enum class APIRight {
     kLocal,         ///< a process of this appliance
 };
 
-/// Which queue a call runs in.
+/// Which queue a call runs in. What a call has another appliance call here in return runs in a
+/// queue above its own, so that two appliances that call each other never wait for each other's
+/// places.
 enum class APIQueue {
-    kQuick, ///< answers from this machine alone
-    kSlow,  ///< may wait on the network; must not hold up the quick ones
+    kQuick,    ///< answers from this machine alone
+    kOutbound, ///< waits for the network, where it asks for quick calls at most
+    kTwoWay,   ///< has another appliance make outbound calls, to this one too
+    kRelay,    ///< has another appliance make any other call
 };
 
 /// On whose behalf a handler runs.
@@ -40,6 +44,9 @@ struct APICaller {
 /// Receives the parameters (always an object) and returns a reply document (webapi/api_errors.h).
 using APIHandler = std::function<Json::Value(const Json::Value &params, const APICaller &caller)>;
 
+/// Tells the queue of a call from its parameters, which may be anything.
+using APIQueueChoice = std::function<APIQueue(const Json::Value &params)>;
+
 /// The web-API handlers of a process, found by API, version and method.
 ///
 /// Filled by one thread first, then used by any number of threads.
@@ -49,6 +56,7 @@ public:
         APIRight right;
         APIQueue queue;
         APIHandler handler;
+        APIQueueChoice choice; ///< may be empty
     };
 
     APIRegistry() = default;
@@ -58,8 +66,10 @@ public:
     ~APIRegistry();
 
     /// Registers a handler; replaces an earlier one under the same names.
+    /// \param queue   the highest one that the call may need
+    /// \param choice  which one a call needs, if that depends on its parameters
     void add(const std::string &api, int version, const std::string &method, APIRight right,
-             APIQueue queue, APIHandler handler);
+             APIQueue queue, APIHandler handler, APIQueueChoice choice = {});
 
     /// One registered method, as a caller sees it.
     struct Method {

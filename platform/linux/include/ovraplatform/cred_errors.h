@@ -8,12 +8,12 @@
 namespace OvraPlatform {
 
 /// The error numbers of the credential request library, as returned by
-/// OVRA::CredRequest::GetError(). 4, 5, 6 and 10 are a contract with the node library; the others
-/// tell failures apart.
+/// OVRA::CredRequest::GetError(). 2, 4, 5, 6, 9, 10 and 15 are a contract with the node library;
+/// the others tell failures apart.
 enum class CredError : int {
     kNone = 0,
     kBadArgument = 1,        ///< an unusable endpoint, path or call
-    kOutOfMemory = 2,        ///< out of memory or descriptors
+    kOutOfMemory = 2,        ///< this process has no memory, descriptor or thread left
     kInternal = 3,           ///< a failure without a number of its own
     kNoPermission = 4,       ///< HTTP status 401 or 403
     kCannotConnect = 5,      ///< no such name, refused, unreachable, or no TLS on that port
@@ -21,11 +21,12 @@ enum class CredError : int {
     kReplyTooLarge = 7,      ///< over 8 MiB
     kReplyBroken = 8,        ///< empty, not HTTP, or not a reply document
     kConnectionLost = 9,     ///< the connection ended before the reply was complete
-    kTimedOut = 10,          ///< not done within the given time
+    kTimedOut = 10,          ///< not done within the given time; nothing of the request was sent
     kHttpStatus = 11,        ///< an HTTP status that is not an answer
     kUploadUnreadable = 12,  ///< the file to send cannot be read, or cannot be sent as required
     kSealFailed = 13,        ///< the request could not be sealed, or the reply not opened
     kTrustUnavailable = 14,  ///< the file of trusted keys can be neither read nor written
+    kUnanswered = 15,        ///< sent, and no answer in time: it may have been carried out
 };
 
 /// A value, or the error; never kNone.

@@ -21,7 +21,10 @@ struct DatabaseLayout {
     const char *name;   ///< as named in messages, e.g. "session store"
     int applicationId;  ///< SQLite's application_id: another program's file is refused
     int version;        ///< SQLite's user_version: a newer program's file is refused
-    const char *schema; ///< creates the tables in a new file
+    const char *schema; ///< creates the tables in a new file; with `upgrade`, as they were before
+    /// Turns the tables of the version before into these, when such a file is opened; null: it is
+    /// refused.
+    const char *upgrade = nullptr;
 };
 
 /// A prepared statement. Text and blobs are bound, never pasted. Short-lived: while it exists, it
@@ -94,7 +97,7 @@ private:
 
     [[nodiscard]] bool makeFile();
     [[nodiscard]] bool setUp();
-    bool isOurs();
+    bool isPrevious(std::optional<std::int64_t> version) const;
     [[nodiscard]] bool makeTables();
     bool failSqlite(int code);
     void rollback();

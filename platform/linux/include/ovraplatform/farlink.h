@@ -57,7 +57,10 @@ public:
         : settings_(std::move(settings)) {}
 
     /// Where the alias is reached now: "port", and "host" if it differs from that of the service.
-    [[nodiscard]] FarlinkReply lookUp(const std::string &alias) const;
+    /// \param time  how long it may take, but 10 seconds at most
+    [[nodiscard]] FarlinkReply
+    lookUp(const std::string &alias,
+           std::chrono::milliseconds time = std::chrono::seconds(10)) const;
     /// Proves that this appliance holds the key of its alias, or claims a free alias: "port",
     /// "tunnel_port", "token" and "expires".
     [[nodiscard]] FarlinkReply enrol(const FarlinkKey &key) const;
@@ -68,7 +71,7 @@ public:
 
 private:
     FarlinkReply call(const char *method, const Json::Value &params,
-                      std::chrono::seconds time) const;
+                      std::chrono::milliseconds time) const;
 
     FarlinkSettings settings_;
 };

@@ -10,6 +10,7 @@
 #include <functional>
 #include <optional>
 #include <string>
+#include <utility>
 #include <vector>
 
 namespace OvraPlatform {
@@ -43,16 +44,26 @@ struct SessionRequest {
     bool keepOthers = false; ///< otherwise the user's other sessions of the same app end
 };
 
+/// Whose sessions a walk visits.
+struct SessionFilter {
+    std::string user;
+    std::string app;
+    std::string extra; ///< byte for byte
+};
+
 /// The appliance's login sessions, in a SQLite file that all processes share. Expired sessions are
 /// never handed out; they are swept by sweep() and whenever a session is created. If the clock is
 /// set back by more than a minute, timed sessions from its future end.
+///
+/// The cost of one operation, list() and an unfiltered walk apart, does not grow with the number of
+/// sessions, nor does the memory that it takes.
 ///
 /// An object holds one connection: short-lived, for one thread, not kept across a fork. Every
 /// change is one transaction.
 class OVRAPLATFORM_EXPORT SessionStore {
 public:
-    static constexpr int kMaxSessionsOfUser = 512;
-    static constexpr int kMaxSessions = 4096;
+    static constexpr int kMaxTimedOfUser = 512;  ///< that end by themselves
+    static constexpr int kMaxSessions = 65536;   ///< of all users
     static constexpr std::size_t kIdLength = 43; ///< base64url (RFC 4648) of 256 bits, no padding
     static constexpr std::size_t kMaxUser = 491;
     static constexpr std::size_t kMaxApp = 255;
@@ -83,13 +94,18 @@ public:
     [[nodiscard]] bool sweep();
     /// Removes together the live sessions for which `test` returns true. The store is not locked
     /// during `test`, which may use it.
+    /// \param filter  only these are visited; null: all
     /// \return false on failure; then nothing is removed.
-    [[nodiscard]] bool removeIf(const std::function<bool(const SessionRecord &)> &test);
+    [[nodiscard]] bool removeIf(const std::function<bool(const SessionRecord &)> &test,
+                                const SessionFilter *filter = nullptr);
 
 private:
+    using Page = std::vector<std::pair<std::string, SessionRecord>>; ///< by their keys
+
     std::int64_t now() const;
     [[nodiscard]] bool checkRequest(const SessionRequest &request);
     std::optional<std::int64_t> count(const char *sql, const std::string &user);
+    [[nodiscard]] bool readPage(const SessionFilter *filter, const std::string &after, Page &page);
     [[nodiscard]] bool removeExpired();
     [[nodiscard]] bool makeRoom(const SessionRequest &request);
     [[nodiscard]] bool insert(const SessionRequest &request, const std::string &id);

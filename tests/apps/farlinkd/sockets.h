@@ -1,0 +1,57 @@
+// SPDX-License-Identifier: Apache-2.0
+#pragma once
+
+#include <ovrabase/unique_fd.h>
+
+#include <arpa/inet.h>
+#include <gtest/gtest.h>
+#include <sys/socket.h>
+
+#include <cerrno>
+#include <string>
+
+// Both ends of the relay's connections.
+namespace FarlinkdTest {
+
+inline OvraBase::UniqueFd dial(int port) {
+    OvraBase::UniqueFd fd(socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0));
+    sockaddr_in address{};
+    address.sin_family = AF_INET;
+    address.sin_port = htons(static_cast<std::uint16_t>(port));
+    address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+    const timeval patience{10, 0};
+    setsockopt(fd.get(), SOL_SOCKET, SO_RCVTIMEO, &patience, sizeof patience);
+    EXPECT_EQ(connect(fd.get(), reinterpret_cast<sockaddr *>(&address), sizeof address), 0);
+    return fd;
+}
+
+inline void say(const OvraBase::UniqueFd &fd, const std::string &text) {
+    for (std::size_t done = 0; done < text.size();) {
+        const ssize_t size = send(fd.get(), &text[done], text.size() - done, MSG_NOSIGNAL);
+        if (size <= 0) {
+            return;
+        }
+        done += static_cast<std::size_t>(size);
+    }
+}
+
+inline std::string hear(const OvraBase::UniqueFd &fd) {
+    std::string text(100, '\0');
+    const ssize_t size = recv(fd.get(), text.data(), text.size(), 0);
+    return size < 0 ? "timeout" : text.substr(0, static_cast<std::size_t>(size));
+}
+
+/// Reads until the other end closes, or 10 seconds pass without a byte ("timeout").
+inline std::string hearAll(const OvraBase::UniqueFd &fd) {
+    std::string all;
+    std::string buffer(1 << 16, '\0');
+    for (;;) {
+        const ssize_t size = recv(fd.get(), buffer.data(), buffer.size(), 0);
+        if (size <= 0) {
+            return size < 0 && errno == EAGAIN ? "timeout" : all;
+        }
+        all.append(buffer, 0, static_cast<std::size_t>(size));
+    }
+}
+
+} // namespace FarlinkdTest
