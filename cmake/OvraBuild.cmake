@@ -56,6 +56,9 @@ function(ovra_shared name version_script)
     SOVERSION ${PROJECT_VERSION_MAJOR}
     LINKER_LANGUAGE CXX
     LINK_DEPENDS ${version_script})
-  target_link_options(${name} PRIVATE
-    "-Wl,--version-script=${version_script}" -Wl,--no-undefined)
+  target_link_options(${name} PRIVATE "-Wl,--version-script=${version_script}")
+  if(NOT OVRADRNODE_SANITIZE)
+    # With clang the program brings the sanitizers' functions, not the library.
+    target_link_options(${name} PRIVATE -Wl,--no-undefined)
+  endif()
 endfunction()

@@ -10,6 +10,7 @@
 #include <gtest/gtest.h>
 #include <linux/filter.h>
 #include <linux/seccomp.h>
+#include <spawn.h>
 #include <sys/prctl.h>
 #include <sys/stat.h>
 #include <sys/syscall.h>
@@ -111,12 +112,8 @@ TEST_F(CacheTest, NothingStoredReadsAsNullAndIsFetched) {
 }
 
 TEST_F(CacheTest, AStoredValueIsReadWhileItIsFreshAndUsable) {
-    const struct {
-        Json::Value value;
-        long later; // seconds after it was stored
-        double age;
-        bool read;
-    } cases[] = {
+    const std::tuple<Json::Value, long, double, bool> cases[] = {
+        // value, later, age, read
         {"stored", kLifetime, kLifetime, true},
         {"stored", kLifetime + 1, kLifetime + 1, false},
         {"clock set back", -3600, -1, false},
@@ -151,49 +148,44 @@ TEST_F(CacheTest, ARefreshThatYieldsNothingLeavesTheStoredValue) {
     EXPECT_EQ(text(cache.Read()), "\"stored\"");
     EXPECT_FALSE(cache.Update());
     EXPECT_EQ(text(cache.GetCachedData()), "\"stored\"");
-    cache.refresh = [&](Json::Value &) { return cache.UpdateWithData("on the way") && false; };
-    EXPECT_EQ(text(cache.Read()), "\"on the way\"");
+}
+
+TEST_F(CacheTest, ARefreshMayReadAndWriteItsOwnEntry) {
+    for (const bool success : {true, false}) {
+        TestCache cache("a");
+        cache.UpdateWithData("old");
+        fakeNow += kLifetime + 1;
+        cache.refresh = [=](Json::Value &value) {
+            TestCache inner("a");
+            EXPECT_EQ(text(inner.Read()), "\"old\"") << "no refresh within the refresh";
+            EXPECT_TRUE(inner.UpdateWithData("noted on the way"));
+            value = "new";
+            return success;
+        };
+        EXPECT_EQ(text(cache.Read()), success ? "\"new\"" : "\"noted on the way\"");
+    }
 }
 
 TEST_F(CacheTest, ARefreshedValueIsAsOldAsTheFindingBehindIt) {
-    const struct {
-        long took;
-        bool otherMeanwhile; // another process stores a second before the end
-        const char *read;
-        long age;
-    } cases[] = {
+    const std::tuple<long, bool, const char *, long> cases[] = {
         {10, false, "\"found\"", 0},
         {10, true, "\"found\"", 0},
         {120, false, "\"found\"", 120 - Cache::kLongestRefresh}, // the process was stopped
         {120, true, "\"other\"", 1},
     };
-    for (const auto &each : cases) {
+    for (const auto &[took, otherMeanwhile, read, age] : cases) {
         TestCache cache("a");
         cache.Remove();
-        cache.refresh = [&](Json::Value &value) {
-            fakeNow += each.took - 1;
-            EXPECT_TRUE(!each.otherMeanwhile || TestCache("a").UpdateWithData("other"));
+        cache.refresh = [lasts = took, other = otherMeanwhile](Json::Value &value) {
+            fakeNow += lasts - 1;
+            EXPECT_TRUE(!other || TestCache("a").UpdateWithData("other"));
             fakeNow += 1;
             value = "found";
             return true;
         };
-        EXPECT_EQ(text(cache.Read()), each.read) << each.took;
-        EXPECT_EQ(cache.GetCachedAge(), each.age) << each.took << each.otherMeanwhile;
+        EXPECT_EQ(text(cache.Read()), read) << took;
+        EXPECT_EQ(cache.GetCachedAge(), age) << took << otherMeanwhile;
     }
-}
-
-TEST_F(CacheTest, ARefreshMayReadAndWriteItsOwnEntry) {
-    TestCache cache("a");
-    cache.UpdateWithData("old");
-    fakeNow += kLifetime + 1;
-    cache.refresh = [](Json::Value &value) {
-        TestCache inner("a");
-        EXPECT_EQ(text(inner.Read()), "\"old\"") << "no refresh within the refresh";
-        EXPECT_TRUE(inner.UpdateWithData("noted on the way"));
-        value = "new";
-        return true;
-    };
-    EXPECT_EQ(text(cache.Read()), "\"new\"");
 }
 
 TEST_F(CacheTest, RemoveTakesOneEntryAndMayFindNone) {
@@ -225,7 +217,7 @@ TEST_F(CacheTest, TheFileGrowsKeepsEverythingAndForgetsWhatIsLongPast) {
     }
 }
 
-TEST_F(CacheTest, AValueTooLargeIsRefusedAndTheOldOneStays) {
+TEST_F(CacheTest, LargeValuesAreStoredUpToABucketAndEvictTheOldest) {
     TestCache cache("a");
     ASSERT_TRUE(cache.UpdateWithData(std::string(3900, 'x')));
     EXPECT_FALSE(cache.UpdateWithData(std::string(5000, 'y')));
@@ -237,10 +229,7 @@ TEST_F(CacheTest, AValueTooLargeIsRefusedAndTheOldOneStays) {
     };
     fakeNow += kLifetime + 1;
     EXPECT_EQ(cache.Read().asString().size(), 5000U) << "who fetched it has it all the same";
-}
-
-TEST_F(CacheTest, LargeValuesThatShareABucketMakeRoomForOneAnother) {
-    for (int i = 0; i < 64; ++i) {
+    for (int i = 0; i < 64; ++i) { // those that share a bucket make room for one another
         ASSERT_TRUE(TestCache("n" + std::to_string(i)).UpdateWithData(std::string(3000, 'x')));
         EXPECT_EQ(TestCache("n" + std::to_string(i)).GetCachedData().asString().size(), 3000U);
     }
@@ -336,9 +325,7 @@ TEST_F(CacheTest, ADirectoryThatIsNotOursAloneIsRefusedOnceAndTheValueFetched) {
 TEST_F(CacheTest, WritersThatAreKilledBesideOthersLoseAndTearNothing) {
     constexpr int kProcesses = 4;
     constexpr int kEach = 400;
-    const auto name = [](int process, int i) {
-        return "p" + std::to_string(process) + "_" + std::to_string(i);
-    };
+    const auto name = [](int process, int i) { return std::to_string(process * kEach + i); };
     std::mt19937 random(11);
     const int good = inProcesses(
         kProcesses,
@@ -346,13 +333,11 @@ TEST_F(CacheTest, WritersThatAreKilledBesideOthersLoseAndTearNothing) {
             const TestCache shared("shared");
             for (int i = 0; i < kEach; ++i) {
                 const TestCache cache(name(process, i));
-                bool whole =
-                    cache.UpdateWithData(i) && cache.GetCachedData() == Json::Value(i) &&
-                    shared.UpdateWithData(std::string(3000, static_cast<char>('0' + i % 10)));
-                const Json::Value value = shared.GetCachedData();
-                whole = whole && value.isString() && value.asString().size() == 3000 &&
-                        value.asString() == std::string(3000, value.asString()[0]);
-                if (!whole) {
+                const std::string content(3000, static_cast<char>('0' + i % 10));
+                const bool stored = cache.UpdateWithData(i) && shared.UpdateWithData(content);
+                const std::string seen = shared.GetCachedData().asString();
+                if (!stored || cache.GetCachedData() != Json::Value(i) ||
+                    seen != std::string(3000, seen[0])) {
                     _exit(1);
                 }
             }
@@ -373,12 +358,12 @@ TEST_F(CacheTest, WritersThatAreKilledBesideOthersLoseAndTearNothing) {
         });
     ASSERT_EQ(good, kProcesses);
     for (int i = 0; i < kProcesses * kEach; ++i) {
-        ASSERT_EQ(TestCache(name(i / kEach, i % kEach)).GetCachedData(), Json::Value(i % kEach));
+        ASSERT_EQ(TestCache(std::to_string(i)).GetCachedData(), Json::Value(i % kEach));
     }
 }
 
 TEST_F(CacheTest, OfManyReadersOneRefreshesAndTheOthersShareItsResultOrItsFailure) {
-    for (const bool success : {true, false}) {
+    for (const bool success : {false, true}) { // an earlier failure counts for nothing
         const std::string refreshes = success ? "/tmp/successes" : "/tmp/failures";
         TestCache("a").UpdateWithData("old");
         fakeNow += kLifetime + 1;
@@ -437,12 +422,13 @@ TEST_F(CacheTest, ARefreshThatDiesIsTakenOverAtOnceThoughItsChildrenLive) {
     const int good = inProcesses(1, [](int) {
         TestCache cache("a");
         cache.refresh = [](Json::Value &) -> bool {
-            for (const bool exec : {true, false}) {
-                if (fork() == 0) {
-                    alarm(60);
-                    exec ? execlp("sleep", "sleep", "60", nullptr) : pause();
-                    _exit(0);
-                }
+            std::string sleep = "sleep";
+            std::string seconds = "60";
+            char *const words[] = {sleep.data(), seconds.data(), nullptr};
+            if (posix_spawnp(nullptr, "sleep", nullptr, nullptr, words, nullptr) == 0 &&
+                fork() == 0) {
+                alarm(60);
+                pause();
             }
             std::raise(SIGKILL);
             _exit(0);

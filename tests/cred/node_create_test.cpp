@@ -27,14 +27,10 @@ TEST_F(CredFlow, CreatesFromAnAccountAndLogsOutAgain) {
     EXPECT_EQ(sent("login-sid logout"), 2);
     EXPECT_GE(sent("granted test_privilege"), 1) << "the session was tried before it was stored";
     EXPECT_EQ(NodeCache("n1", false).GetCachedData()["hostname"].asString(), "b");
-}
-
-TEST_F(CredFlow, CreatesATemporaryOne) {
-    TempCredCreate create;
-    ASSERT_TRUE(create.setCred(conn, "joe", "pw", ""));
-    ASSERT_TRUE(create.process());
+    TempCredCreate temporary;
+    ASSERT_TRUE(temporary.setCred(conn, "joe", "pw", "") && temporary.process());
     EXPECT_EQ(rows("temp_cred"), granted("temp-granted"));
-    EXPECT_EQ(rows("node_cred"), "");
+    EXPECT_EQ(rows("node_cred"), granted("granted"));
 }
 
 TEST_F(CredFlow, CreatesFromASessionAndFromAnotherCredential) {

@@ -122,7 +122,7 @@ factsAreMissedWhereTheyAreForgotten() {
     same "the checkout as it is: $output" "$code" 0
 
     local errors=core/include/ovradrcore/err_recorder.h
-    checkFacts 'failure.cpp: no Meaning for code 599' "$errors" 's/kFailed = 407/kNew = 599, &/'
+    checkFacts 'failure.cpp: no ErrorEntry for code 599' "$errors" 's/kFailed = 407/kNew = 599, &/'
     checkFacts 'docs/ovradr.md: no row for code 599' "$errors" 's/kFailed = 407/kNew = 599, &/'
     checkFacts 'no text for kFailed' core/src/err_recorder.cpp '/case kFailed:/d'
     checkFacts 'docs/ovradr.md: no row for code 505' docs/ovradr.md '/^| 505 /d'

@@ -4,6 +4,7 @@
 #include "support/test_certificate.h"
 
 #include <arpa/inet.h>
+#include <linux/filter.h>
 #include <netinet/in.h>
 #include <netinet/tcp.h>
 #include <openssl/ssl.h>
@@ -294,6 +295,15 @@ void MisbehavingServer::closeConnections() {
     const std::lock_guard lock(mutex_);
     for (const int fd : open_) {
         shutdown(fd, SHUT_RDWR);
+    }
+}
+
+void MisbehavingServer::deafen() {
+    const std::lock_guard<std::mutex> lock(impl_->mutex);
+    sock_filter nothing{BPF_RET | BPF_K, 0, 0, 0};
+    const sock_fprog filter{1, &nothing};
+    for (const int fd : impl_->open) {
+        setsockopt(fd, SOL_SOCKET, SO_ATTACH_FILTER, &filter, sizeof filter);
     }
 }
 

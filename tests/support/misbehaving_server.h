@@ -115,6 +115,8 @@ public:
     void fallSilent() { silent_ = true; }
     /// Closes every open connection.
     void closeConnections();
+    /// From now on nothing that is sent on the open connections arrives or is acknowledged.
+    void deafen();
     /// Closes the port: connections are refused.
     void refuse();
 

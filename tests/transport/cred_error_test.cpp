@@ -16,6 +16,7 @@
 
 #include <gtest/gtest.h>
 
+#include <ctime>
 #include <set>
 
 struct _tag_ovra_cred_ {};
@@ -245,21 +246,28 @@ TEST_F(CredError, ARelayEndpointIsResolvedBeforeUse) {
 }
 
 TEST_F(CredError, AProbeThatSaysNothingOfTheEndpointLeavesTheVerdictOfARefresh) {
+    const std::string text = OvraDRCore::toString(conn.toJson());
     const struct {
         const char *step;
         int number;
         bool kept; ///< also by a probe that was asked for
-    } cases[] = {{"timeout", 1, false}, {"probe", 2, true}};
+    } cases[] = {{"url", 1, false}, {"timeout", 1, false}, {"probe", 2, true}};
     for (const auto &each : cases) {
         script.fail = {each.step};
         script.error = each.number;
-        ConnCache(conn).UpdateWithData(true, 1, 1);
+        const std::time_t old = std::time(nullptr) - 100;
+        ConnCache(conn).UpdateWithData(true, old, old);
         EXPECT_TRUE(BaseSender::GetCachedConnectable(conn)) << each.step;
-        EXPECT_GT(ConnCache(conn).GetCachedAge(), 1000) << each.step << ": it is still the old one";
+        EXPECT_GT(ConnCache(conn).GetCachedAge(), 99) << each.step << ": it is still the old one";
         EXPECT_FALSE(BaseSender::IsConnectable(conn)) << each.step;
         EXPECT_EQ(ConnCache(conn).getStoredVerdict(), each.kept) << each.step;
     }
-    EXPECT_EQ(log.count("Failed to set timeout of conn"), 2);
+    for (const std::string step : {"url", "timeout"}) {
+        EXPECT_EQ(log.count("ERR", "sender", "IsConnectableWithErrCheck",
+                            "Failed to set " + step + " of conn [" + text + "]"),
+                  2);
+    }
+    EXPECT_EQ(log.count("Failed to check connectable of conn[" + text + "]"), 2);
 }
 
 TEST_F(CredError, OneRequestAsksASilentEndpointOnceHoweverManyCredentialsItHas) {

@@ -72,13 +72,6 @@ TEST_F(Probe, AnEndpointThatRefusesIsHeldUnreachableUntilItComesBack) {
     EXPECT_EQ(log.lines().size(), 0U) << "answered from the cache, no probe";
 }
 
-TEST_F(Probe, AnyAnswerOfTheEntryPointCountsAndTheCertificateIsNotJudged) {
-    remote.answer("probe", Answer::html());
-    EXPECT_TRUE(BaseSender::IsConnectable(conn));
-    remote.server.changeCertificate();
-    EXPECT_TRUE(BaseSender::IsConnectable(conn));
-}
-
 TEST_F(Probe, AHostThatSaysNothingAfterTheHandshakeCostsTheProbesTimeOutOnce) {
     remote.answer("probe", Answer::silence());
     const auto start = std::chrono::steady_clock::now();
@@ -105,20 +98,6 @@ TEST_F(Probe, ManyProcessesThatAskAtOnceSendOneProbe) {
     }
     EXPECT_EQ(good, 20);
     EXPECT_EQ(remote.calls(), "probe");
-}
-
-TEST_F(Probe, AnEndpointThatCannotBeProbedIsNotConnectableAndARefreshKeepsTheOldVerdict) {
-    const Conn odd("a b/c", "https", 1);
-    EXPECT_FALSE(BaseSender::IsConnectable(odd));
-    EXPECT_EQ(log.count("ERR", "sender", "IsConnectableWithErrCheck",
-                        "Failed to set url of conn [" + text(odd) + "]"),
-              1);
-    EXPECT_EQ(log.count("NOTICE", "sender", "IsConnectable",
-                        "Failed to check connectable of conn[" + text(odd) + "]"),
-              1);
-    EXPECT_FALSE(ConnCache(odd).getStoredVerdict());
-    ConnCache(odd).UpdateWithData(true, 1, 1);
-    EXPECT_TRUE(BaseSender::GetCachedConnectable(odd));
 }
 
 TEST_F(Probe, AStoredValueThatIsNoVerdictReadsAsConnectableAndIsAskedAgain) {

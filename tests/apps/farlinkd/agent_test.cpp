@@ -134,7 +134,7 @@ TEST_F(TheFarlinkAgent, IsReachedUnderItsAliasUntilTheRelayIsSwitchedOff) {
     EXPECT_TRUE(lookUp("nas").isNull());
 
     ASSERT_TRUE(OvraPlatform::writeFarlinkSettings(settings));
-    EXPECT_TRUE(soon([this] { return call() == "welcome"; })) << agent.status().problem;
+    EXPECT_TRUE(soon([] { return call() == "welcome"; })) << agent.status().problem;
 }
 
 TEST_F(TheFarlinkAgent, SaysWhyItIsNotConnected) {

@@ -125,7 +125,7 @@ TEST_F(TestFiles, OnlySoManyAreSentAtOnce) {
     const RawConnection slow(port(false));
     slow.send(request);
     std::string reply;
-    for (int i = 0; i < 100 && reply.substr(0, 12) != "HTTP/1.1 503"; ++i) {
+    for (int i = 0; i < 5000 && reply.substr(0, 12) != "HTTP/1.1 503"; ++i) {
         reply = get(kUrl + named('0'), "Range: bytes=0-1\r\n");
     }
     EXPECT_EQ(reply.substr(0, 12), "HTTP/1.1 503") << reply;

@@ -13,7 +13,6 @@
 #include <chrono>
 #include <cstdlib>
 #include <memory>
-#include <ostream>
 #include <string>
 #include <thread>
 #include <vector>
@@ -68,7 +67,7 @@ Result call(const MisbehavingServer &server, bool reuse = true, long seconds = 5
 Result probe(const std::string &protocol, int port, const std::string &host = "127.0.0.1") {
     OVRA::CredRequest request;
     EXPECT_NE(request.SetURL(protocol, host, port, "webapi/query.cgi"), 0);
-    EXPECT_NE(request.SetDefaultTimeout(1), 0);
+    EXPECT_NE(request.SetDefaultTimeout(3), 0);
     return process(request, true, 2);
 }
 
@@ -99,23 +98,6 @@ struct AnswerScene {
     Answer answer;
     CredError error;
 };
-std::ostream &operator<<(std::ostream &out, const AnswerScene &scene) {
-    return out << scene.name;
-}
-
-class WhenItAnswers : public CredRequestScene, public testing::WithParamInterface<AnswerScene> {};
-
-TEST_P(WhenItAnswers, TheErrorTellsWhatWasWrong) {
-    MisbehavingServer server({.tls = true});
-    server.answer(GetParam().answer);
-    const auto begin = std::chrono::steady_clock::now();
-    const Result result = call(server, true, 1);
-    EXPECT_EQ(result.error, GetParam().error);
-    EXPECT_EQ(result.ok, GetParam().error == CredError::kNone);
-    EXPECT_EQ(result.response.empty(), !result.ok);
-    EXPECT_LT(std::chrono::steady_clock::now() - begin, 5s);
-    EXPECT_EQ(server.requests().size(), 1U);
-}
 
 std::string manyHeaders() {
     std::string bytes = "HTTP/1.1 200 OK\r\n";
@@ -127,32 +109,44 @@ std::string manyHeaders() {
 
 const std::string kRefusal = R"({"success":false,"error":{"code":105}})";
 
-INSTANTIATE_TEST_SUITE_P(
-    All, WhenItAnswers,
-    testing::Values(
-        AnswerScene{"an error document", Answer::json(kRefusal), CredError::kNone},
-        AnswerScene{"HTML", Answer::html(), CredError::kReplyBroken},
-        AnswerScene{"an empty body", Answer::empty(), CredError::kReplyBroken},
-        AnswerScene{"JSON of another shape", Answer::json("[1]"), CredError::kReplyBroken},
-        AnswerScene{"no success flag", Answer::json(R"({"data":{}})"), CredError::kReplyBroken},
-        AnswerScene{"failure with code 0", Answer::json(R"({"success":false,"error":{"code":0}})"),
-                    CredError::kReplyBroken},
-        AnswerScene{"a cut document", Answer::truncated(kRefusal), CredError::kConnectionLost},
-        AnswerScene{"7 MiB", Answer::success(R"({"x":")" + std::string(7 << 20, 'x') + "\"}"),
-                    CredError::kNone},
-        AnswerScene{"9 MiB", Answer::huge(9 << 20, true), CredError::kReplyTooLarge},
-        AnswerScene{"9 MiB unannounced", Answer::huge(9 << 20, false), CredError::kReplyTooLarge},
-        AnswerScene{"headers without end", Answer::raw(manyHeaders()), CredError::kReplyTooLarge},
-        AnswerScene{"no HTTP", Answer::raw("220 hello\r\n"), CredError::kReplyBroken},
-        AnswerScene{"nothing, closing", Answer::closed(), CredError::kConnectionLost},
-        AnswerScene{"nothing, resetting", Answer::reset(), CredError::kConnectionLost},
-        AnswerScene{"nothing, waiting", Answer::silence(), CredError::kUnanswered},
-        AnswerScene{"too slowly", Answer::drip(50ms), CredError::kUnanswered},
-        AnswerScene{"401", Answer::status(401), CredError::kNoPermission},
-        AnswerScene{"403", Answer::status(403), CredError::kNoPermission},
-        AnswerScene{"404", Answer::status(404), CredError::kHttpStatus},
-        AnswerScene{"500", Answer::status(500), CredError::kHttpStatus},
-        AnswerScene{"a redirect", Answer::redirect("https://127.0.0.1/"), CredError::kHttpStatus}));
+TEST_F(CredRequestScene, TellsWhatWasWrongWithAnAnswer) {
+    const AnswerScene scenes[] = {
+        {"an error document", Answer::json(kRefusal), CredError::kNone},
+        {"HTML", Answer::html(), CredError::kReplyBroken},
+        {"an empty body", Answer::empty(), CredError::kReplyBroken},
+        {"JSON of another shape", Answer::json("[1]"), CredError::kReplyBroken},
+        {"no success flag", Answer::json(R"({"data":{}})"), CredError::kReplyBroken},
+        {"failure with code 0", Answer::json(R"({"success":false,"error":{"code":0}})"),
+         CredError::kReplyBroken},
+        {"a cut document", Answer::truncated(kRefusal), CredError::kConnectionLost},
+        {"7 MiB", Answer::success(R"({"x":")" + std::string(7 << 20, 'x') + "\"}"),
+         CredError::kNone},
+        {"9 MiB", Answer::huge(9 << 20, true), CredError::kReplyTooLarge},
+        {"9 MiB unannounced", Answer::huge(9 << 20, false), CredError::kReplyTooLarge},
+        {"headers without end", Answer::raw(manyHeaders()), CredError::kReplyTooLarge},
+        {"no HTTP", Answer::raw("220 hello\r\n"), CredError::kReplyBroken},
+        {"nothing, closing", Answer::closed(), CredError::kConnectionLost},
+        {"nothing, resetting", Answer::reset(), CredError::kConnectionLost},
+        {"nothing, waiting", Answer::silence(), CredError::kUnanswered},
+        {"too slowly", Answer::drip(50ms), CredError::kUnanswered},
+        {"401", Answer::status(401), CredError::kNoPermission},
+        {"403", Answer::status(403), CredError::kNoPermission},
+        {"404", Answer::status(404), CredError::kHttpStatus},
+        {"500", Answer::status(500), CredError::kHttpStatus},
+        {"a redirect", Answer::redirect("https://127.0.0.1/"), CredError::kHttpStatus}};
+    for (const AnswerScene &scene : scenes) {
+        MisbehavingServer server({.tls = true});
+        server.answer(scene.answer);
+        const auto begin = std::chrono::steady_clock::now();
+        const bool slow = scene.error == CredError::kUnanswered;
+        const Result result = call(server, true, slow ? 3 : 30);
+        EXPECT_EQ(result.error, scene.error) << scene.name;
+        EXPECT_EQ(result.ok, scene.error == CredError::kNone) << scene.name;
+        EXPECT_EQ(result.response.empty(), !result.ok) << scene.name;
+        EXPECT_LT(std::chrono::steady_clock::now() - begin, slow ? 20s : 40s) << scene.name;
+        EXPECT_EQ(server.requests().size(), 1U) << scene.name;
+    }
+}
 
 TEST_F(CredRequestScene, TellsWhyItCannotConnect) {
     MisbehavingServer server({.tls = true});
@@ -170,7 +164,7 @@ TEST_F(CredRequestScene, TellsWhyItCannotConnect) {
     std::filesystem::create_directories(kConfigDir);
     ASSERT_TRUE(writeFarlinkSettings({"127.0.0.1", silent.port(), ""}));
     EXPECT_EQ(probe("flk", 1, "alias").error, CredError::kTimedOut) << "while it is looked up";
-    EXPECT_LT(std::chrono::steady_clock::now() - begin, 5s);
+    EXPECT_LT(std::chrono::steady_clock::now() - begin, 9s);
 }
 
 TEST_F(CredRequestScene, FollowsNeitherARedirectNorAProxyOfTheEnvironment) {
@@ -196,15 +190,16 @@ TEST_F(CredRequestScene, RefusesWhatCannotBeSent) {
     EXPECT_EQ(request.SetDefaultTimeout(0), 0);
     EXPECT_EQ(request.SetResponseTimeout(-1), 0);
     EXPECT_EQ(request.SetEncryptMode(1), 0);
-    const auto create = [&](OVRACred *cred, const char *api, int version,
-                            const Json::Value &params) {
+    const auto create = [&](OVRACred *cred, const char *api, int version, const Json::Value &params,
+                            const char *method = "get") {
         return OVRA::CredRequest::CreateWebAPIRequest(request, cred, objects.sess.get(), api,
-                                                      version, "get", params);
+                                                      version, method, params);
     };
     EXPECT_EQ(create(nullptr, "A", 1, {}), 0);
     EXPECT_EQ(create(objects.cred.get(), "", 1, {}), 0);
     EXPECT_EQ(create(objects.cred.get(), "A", 0, {}), 0);
     EXPECT_EQ(create(objects.cred.get(), "A", 1, "text"), 0);
+    EXPECT_EQ(create(objects.cred.get(), "A", 1, {}, ""), 0);
     EXPECT_EQ(request.GetError(), static_cast<int>(CredError::kBadArgument));
 
     EXPECT_NE(OVRACredItemSetProtocol(objects.cred.get(), "flk"), 0);
@@ -215,7 +210,7 @@ TEST_F(CredRequestScene, RefusesWhatCannotBeSent) {
     EXPECT_NE(create(objects.cred.get(), "A", 1, {}), 0) << "what was refused changed nothing";
 }
 
-TEST_F(CredRequestScene, KeepsAConnectionForTheNextRequest) {
+TEST_F(CredRequestScene, KeepsAConnectionForTheNextRequestUntilThePeerClosesIt) {
     MisbehavingServer server({.tls = true});
     call(server); // pins the key, which ends the first connection
     const int before = server.connections();
@@ -225,16 +220,24 @@ TEST_F(CredRequestScene, KeepsAConnectionForTheNextRequest) {
     EXPECT_EQ(server.connections(), before + 1);
     EXPECT_TRUE(call(server, false).ok);
     EXPECT_EQ(server.connections(), before + 2);
+    server.closeConnections();
+    std::this_thread::sleep_for(50ms);
+    EXPECT_TRUE(call(server).ok) << "one that the peer has closed is replaced";
+    EXPECT_EQ(server.requests().size(), 8U);
 }
 
-TEST_F(CredRequestScene, ReplacesAKeptConnectionThatThePeerHasClosed) {
+TEST_F(CredRequestScene, RepeatsARequestIfThePeerHadEndedItsStreamBefore) {
     MisbehavingServer server({.tls = true});
     call(server);
     call(server);
-    server.closeConnections();
-    std::this_thread::sleep_for(50ms);
-    EXPECT_TRUE(call(server).ok);
+    server.deafen();
+    std::thread ending([&server] {
+        std::this_thread::sleep_for(200ms);
+        server.closeConnections();
+    });
+    EXPECT_TRUE(call(server, true, 30).ok);
     EXPECT_EQ(server.requests().size(), 3U);
+    ending.join();
 }
 
 TEST_F(CredRequestScene, DoesNotRepeatARequestThatMayHaveBeenCarriedOut) {
@@ -388,52 +391,38 @@ TEST_F(CredRequestScene, SendsAFileAlong) {
     }
 }
 
-Answer drippingBody() {
-    return {"HTTP/1.1 200 OK\r\n\r\n{", {}, Answer::Ending::kHang};
-}
-
-struct ProbeScene {
-    const char *name;
-    Answer answer;
-    CredError error;
-};
-std::ostream &operator<<(std::ostream &out, const ProbeScene &scene) {
-    return out << scene.name;
-}
-
-class ProbeThatGets : public CredRequestScene, public testing::WithParamInterface<ProbeScene> {};
-
-TEST_P(ProbeThatGets, CountsAnAnswerOfTheEntryPoint) {
-    for (const bool tls : {false, true}) {
-        MisbehavingServer server({.tls = tls});
-        server.answer(GetParam().answer);
-        const Result result = probe(tls ? "https" : "http", server.port());
-        EXPECT_EQ(result.error, GetParam().error) << tls;
-        EXPECT_EQ(result.ok, GetParam().error == CredError::kNone) << tls;
-        ASSERT_EQ(server.requests().size(), 1U);
-        EXPECT_EQ(server.requests()[0].method, "GET");
-        EXPECT_EQ(server.requests()[0].path, "/webapi/query.cgi");
-        EXPECT_EQ(server.requests()[0].body, "");
-        EXPECT_TRUE(TrustStore().list()->empty());
+TEST_F(CredRequestScene, ProbesForAnyAnswerOfTheEntryPoint) {
+    const AnswerScene scenes[] = {
+        {"a document", Answer::json(kRefusal), CredError::kNone},
+        {"HTML", Answer::html(), CredError::kNone},
+        {"403", Answer::status(403), CredError::kNone},
+        {"a redirect", Answer::redirect("http://x/"), CredError::kNone},
+        {"404", Answer::status(404), CredError::kHttpStatus},
+        {"500", Answer::status(500), CredError::kHttpStatus},
+        {"silence", Answer::silence(), CredError::kTimedOut},
+        {"nothing", Answer::closed(), CredError::kConnectionLost},
+        {"50 MB", Answer::huge(50'000'000, false), CredError::kNone},
+        {"50 MB announced", Answer::huge(50'000'000, true), CredError::kNone},
+        {"a cut document", Answer::truncated(kRefusal), CredError::kNone},
+        {"a body without end",
+         {"HTTP/1.1 200 OK\r\n\r\n{", {}, Answer::Ending::kHang},
+         CredError::kNone},
+        {"a cut status", Answer::raw("HTTP/1.1"), CredError::kConnectionLost}};
+    for (const AnswerScene &scene : scenes) {
+        for (const bool tls : {false, true}) {
+            MisbehavingServer server({.tls = tls});
+            server.answer(scene.answer);
+            const Result result = probe(tls ? "https" : "http", server.port());
+            EXPECT_EQ(result.error, scene.error) << scene.name << tls;
+            EXPECT_EQ(result.ok, scene.error == CredError::kNone) << scene.name << tls;
+            ASSERT_EQ(server.requests().size(), 1U) << scene.name << tls;
+            EXPECT_EQ(server.requests()[0].method, "GET");
+            EXPECT_EQ(server.requests()[0].path, "/webapi/query.cgi");
+            EXPECT_EQ(server.requests()[0].body, "");
+        }
     }
+    EXPECT_TRUE(TrustStore().list()->empty());
 }
-
-INSTANTIATE_TEST_SUITE_P(
-    All, ProbeThatGets,
-    testing::Values(ProbeScene{"a document", Answer::json(kRefusal), CredError::kNone},
-                    ProbeScene{"HTML", Answer::html(), CredError::kNone},
-                    ProbeScene{"403", Answer::status(403), CredError::kNone},
-                    ProbeScene{"a redirect", Answer::redirect("http://x/"), CredError::kNone},
-                    ProbeScene{"404", Answer::status(404), CredError::kHttpStatus},
-                    ProbeScene{"500", Answer::status(500), CredError::kHttpStatus},
-                    ProbeScene{"silence", Answer::silence(), CredError::kTimedOut},
-                    ProbeScene{"nothing", Answer::closed(), CredError::kConnectionLost},
-                    ProbeScene{"50 MB", Answer::huge(50'000'000, false), CredError::kNone},
-                    ProbeScene{"50 MB announced", Answer::huge(50'000'000, true), CredError::kNone},
-                    ProbeScene{"a cut document", Answer::truncated(kRefusal), CredError::kNone},
-                    ProbeScene{"a body without end", drippingBody(), CredError::kNone},
-                    ProbeScene{"a cut status", Answer::raw("HTTP/1.1"),
-                               CredError::kConnectionLost}));
 
 TEST_F(CredRequestScene, ProbesOverConnectionsOfTheirOwn) {
     MisbehavingServer server({.tls = true});
