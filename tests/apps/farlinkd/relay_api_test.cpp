@@ -146,7 +146,7 @@ TEST_F(TheRelayApi, ServesEverybodyElseWhileAChangeIsBeingStored) {
     const Json::Value token = call("enrol", proof(key("owner"), "nas"))["data"]["token"];
     Reply waiting = begin("wait", named("nas", token));
     // The registry waits for this lock as for a slow disk, for up to 5 seconds.
-    const OvraBase::UniqueFd folder(open("/usr/ovra", O_RDONLY | O_CLOEXEC));
+    const OvraBase::UniqueFd folder(open("/usr/ovra/.lock", O_RDWR | O_CREAT | O_CLOEXEC, 0600));
     ASSERT_EQ(flock(folder.get(), LOCK_EX), 0);
     std::vector<Reply> changes;
     for (const char *alias : {"two", "three", "four"}) {
