@@ -141,7 +141,7 @@ factsAreMissedWhereTheyAreForgotten() {
     checkFacts 'docs/ovradrd.md: no fact about a node: timezone' docs/ovradrd.md 's/known: `timezone`/known: zone/'
     checkFacts 'no request for the fact hostname' src/cache/node_cache.cpp 's/API({Word::kTimeZone/API({Word::kHostName, Word::kTimeZone/'
     checkFacts 'no row for getDRNodeInfoAPI' tests/api/node_api_test.cpp '/BUILT_BY(getDRNodeInfoAPI,/d'
-    checkFacts 'no row for `OVRA.DR.Node` 1 `stat`' tests/api/node_api_test.cpp 's/"test_privilege", 1/"stat", 1/'
+    checkFacts 'no row for `OVRA.DR.Node` 1 `stat`' tests/api/node_api_test.cpp 's/test_privilege 1"/stat 1"/'
     checkFacts 'docs/wire.md: no row for the method release' docs/wire.md '/^| `release`/d'
     checkFacts 'names `ovradr set up`' apps/ovradrd/main.cpp 's/`ovradr setup`/`ovradr set up`/'
     checkFacts 'does not name conn_test.cpp' tests/model/CMakeLists.txt 's/ conn_test.cpp//'
