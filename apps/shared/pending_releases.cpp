@@ -14,8 +14,28 @@ using OvraPlatform::Statement;
 
 namespace {
 
-// "OvRl". Credentials that share a session have a note each, so that none removes another's.
-constexpr DatabaseLayout kLayout = {"memory of pending releases", 0x4F76526C, 2, R"(
+// "OvRl". Since version 2 credentials that share a session have a note each, so that none removes
+// another's.
+constexpr DatabaseLayout kLayout = {"memory of pending releases", 0x4F76526C, 2,
+                                    R"(
+    CREATE TABLE release (
+        reference TEXT PRIMARY KEY,
+        session   TEXT NOT NULL,
+        addr      TEXT NOT NULL,
+        protocol  TEXT NOT NULL,
+        port      INTEGER NOT NULL,
+        node_id   TEXT NOT NULL,
+        cred_id   TEXT NOT NULL,
+        noted     INTEGER NOT NULL,
+        attempts  INTEGER NOT NULL,
+        next_try  INTEGER NOT NULL,
+        code      INTEGER NOT NULL
+    ) STRICT, WITHOUT ROWID;
+    CREATE INDEX release_next_try ON release (next_try);
+)",
+                                    R"(
+    ALTER TABLE release RENAME TO release_1;
+    DROP INDEX release_next_try;
     CREATE TABLE release (
         reference TEXT NOT NULL,
         session   TEXT NOT NULL,
@@ -30,6 +50,8 @@ constexpr DatabaseLayout kLayout = {"memory of pending releases", 0x4F76526C, 2,
         code      INTEGER NOT NULL,
         PRIMARY KEY (reference, cred_id)
     ) STRICT, WITHOUT ROWID;
+    INSERT INTO release SELECT * FROM release_1;
+    DROP TABLE release_1;
     CREATE INDEX release_next_try ON release (next_try);
 )"};
 
