@@ -146,8 +146,8 @@ TEST_F(TheRelayApi, ServesEverybodyElseWhileAChangeIsBeingStored) {
     const Json::Value token = call("enrol", proof(key("owner"), "nas"))["data"]["token"];
     Reply waiting = begin("wait", named("nas", token));
     // The registry waits for this lock as for a slow disk, for up to 5 seconds.
-    const OvraBase::UniqueFd folder(open("/usr/ovra", O_RDONLY | O_CLOEXEC));
-    ASSERT_EQ(flock(folder.get(), LOCK_EX), 0);
+    const OvraBase::UniqueFd held(open("/usr/ovra/.lock", O_RDONLY | O_CLOEXEC));
+    ASSERT_EQ(flock(held.get(), LOCK_EX), 0);
     std::vector<Reply> changes;
     for (const char *alias : {"two", "three", "four"}) {
         changes.push_back(begin("enrol", proof(key(alias), alias)));
@@ -159,7 +159,7 @@ TEST_F(TheRelayApi, ServesEverybodyElseWhileAChangeIsBeingStored) {
     EXPECT_TRUE(api.announce("nas", "caller"));
     EXPECT_EQ(waiting.get()["data"]["callers"][0], "caller");
     EXPECT_EQ(changes[0].wait_for(std::chrono::seconds(0)), std::future_status::timeout);
-    flock(folder.get(), LOCK_UN);
+    flock(held.get(), LOCK_UN);
     for (Reply &change : changes) {
         EXPECT_EQ(code(change.get()), 0);
     }
