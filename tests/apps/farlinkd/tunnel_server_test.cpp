@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-#include "sockets.h"
+#include "support/sockets.h"
 #include "tunnel_server.h"
 
 #include <condition_variable>
@@ -9,12 +9,9 @@
 namespace {
 
 using Farlinkd::TunnelServer;
-using FarlinkdTest::dial;
-using FarlinkdTest::hear;
-using FarlinkdTest::hearAll;
-using FarlinkdTest::say;
 using OvraBase::UniqueFd;
 using OvraService::Listener;
+using namespace OvraTest;
 
 constexpr std::chrono::seconds kLong{120};
 

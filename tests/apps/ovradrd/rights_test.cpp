@@ -6,7 +6,6 @@
 #include <ovraplatform/account_store.h>
 #include <ovraplatform/api_registry.h>
 #include <ovraplatform/session_store.h>
-#include <ovrawebapi/api_runner.h>
 
 #include <algorithm>
 #include <ctime>
@@ -204,19 +203,12 @@ TEST_F(Node, FindsTheFirstEndpointThatItReaches) {
     EXPECT_EQ(reply.data(), params["conns"][1]);
 }
 
-/// A call by a process of the appliance through the library.
-Json::Value askLocally(const char *api, const char *method, const char *params = "{}") {
-    Json::Value reply;
-    OVRA::APIRunner().Exec(reply, api, 1, method, json(params), "admin");
-    return reply;
-}
-
 TEST_F(Node, ServesItsOwnProcessesAsAdministrators) {
-    EXPECT_EQ(askLocally("OVRA.Core.Farlink", "get")["data"], json(R"({"enabled":false})"));
-    EXPECT_EQ(askLocally(kNode, "test_privilege")["success"], true);
-    EXPECT_EQ(askLocally(kCredential, "create")["error"]["code"], 106);
-    EXPECT_EQ(askLocally("OVRA.Core.Auth", "login")["error"]["code"], 101);
-    EXPECT_EQ(askLocally("OVRA.Core.Auth", "logout")["error"]["code"], 119);
+    EXPECT_EQ(callHere("OVRA.Core.Farlink", 1, "get")["data"], json(R"({"enabled":false})"));
+    EXPECT_EQ(callHere(kNode, 1, "test_privilege")["success"], true);
+    EXPECT_EQ(callHere(kCredential, 1, "create")["error"]["code"], 106);
+    EXPECT_EQ(callHere("OVRA.Core.Auth", 1, "login")["error"]["code"], 101);
+    EXPECT_EQ(callHere("OVRA.Core.Auth", 1, "logout")["error"]["code"], 119);
 }
 
 } // namespace
