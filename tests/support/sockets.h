@@ -1,9 +1,9 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
+#include <ovrabase/address.h>
 #include <ovrabase/unique_fd.h>
 
-#include <arpa/inet.h>
 #include <gtest/gtest.h>
 #include <sys/socket.h>
 
@@ -15,24 +15,15 @@ namespace OvraTest {
 
 inline OvraBase::UniqueFd dial(int port) {
     OvraBase::UniqueFd fd(socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0));
-    sockaddr_in address{};
-    address.sin_family = AF_INET;
-    address.sin_port = htons(static_cast<std::uint16_t>(port));
-    address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+    const auto address = OvraBase::parseAddress("127.0.0.1", port);
     const timeval patience{20, 0};
     setsockopt(fd.get(), SOL_SOCKET, SO_RCVTIMEO, &patience, sizeof patience);
-    EXPECT_EQ(connect(fd.get(), reinterpret_cast<sockaddr *>(&address), sizeof address), 0);
+    EXPECT_EQ(connect(fd.get(), address->get(), address->size), 0);
     return fd;
 }
 
 inline void say(const OvraBase::UniqueFd &fd, const std::string &text) {
-    for (std::size_t done = 0; done < text.size();) {
-        const ssize_t size = send(fd.get(), &text[done], text.size() - done, MSG_NOSIGNAL);
-        if (size <= 0) {
-            return;
-        }
-        done += static_cast<std::size_t>(size);
-    }
+    (void)!send(fd.get(), text.data(), text.size(), MSG_NOSIGNAL); // waits until all is taken
 }
 
 inline std::string hear(const OvraBase::UniqueFd &fd) {

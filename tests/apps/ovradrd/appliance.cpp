@@ -63,11 +63,9 @@ void Appliance::addAccount(const std::string &name, bool administrator) {
 }
 
 std::string Appliance::session(const std::string &user, int timeout) {
-    OvraPlatform::SessionRequest request;
-    request.user = user;
-    request.timeout = timeout;
-    request.keepOthers = true;
-    return OvraPlatform::SessionStore().create(request).value_or("");
+    return OvraPlatform::SessionStore()
+        .create({.user = user, .timeout = timeout, .keepOthers = true})
+        .value_or("");
 }
 
 void Appliance::SetUp() {
@@ -77,11 +75,8 @@ void Appliance::SetUp() {
 
 void Appliance::restart(const OvraService::HttpLimits &limits, std::size_t testFiles) {
     daemon_.reset();
-    Ovradrd::Settings settings;
-    settings.addresses = {"127.0.0.1"};
-    settings.limits = limits;
-    settings.testFiles = testFiles;
-    daemon_ = std::make_unique<Ovradrd::Daemon>(settings);
+    daemon_ = std::make_unique<Ovradrd::Daemon>(
+        Ovradrd::Settings{.addresses = {"127.0.0.1"}, .limits = limits, .testFiles = testFiles});
     const auto started = daemon_->start();
     ASSERT_TRUE(started) << started.error().text;
 }
@@ -121,12 +116,7 @@ Reply Appliance::http(const HttpCall &call) const {
 
 Reply Appliance::call(const std::string &api, int version, const std::string &method,
                       const Json::Value &params, const std::string &sid, bool tls) const {
-    OvraPlatform::WireCall wire;
-    wire.api = api;
-    wire.version = version;
-    wire.method = method;
-    wire.params = params;
-    wire.sid = sid;
+    const OvraPlatform::WireCall wire{{api, version, method, params}, sid, ""};
     return http({.body = OvraPlatform::encodeForm(wire).value(), .tls = tls});
 }
 

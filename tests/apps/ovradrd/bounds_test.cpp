@@ -53,9 +53,7 @@ TEST_F(Bounds, CutOffAClientWhoseRequestTakesTooLong) {
                    {"shakes no hands", true, "", ""},
                    {"drips its header", false, "POST /webapi/query.cgi HTTP/1.1\r\nX: ", "a"},
                    {"drips its body", false, kLongPost, "a"}};
-    OvraService::HttpLimits limits;
-    limits.connections.arriving = 1s;
-    restart(limits);
+    restart({.connections = {.arriving = 1s}});
     for (const auto &client : clients) {
         const UniqueFd connection = dial(port(client.tls));
         const auto begun = std::chrono::steady_clock::now();
@@ -72,9 +70,7 @@ TEST_F(Bounds, CutOffAClientWhoseRequestTakesTooLong) {
 }
 
 TEST_F(Bounds, OfAllBodiesTogetherRefuseWhatIsTooMuch) {
-    OvraService::HttpLimits limits;
-    limits.bodies = 100'000;
-    restart(limits);
+    restart({.bodies = 100'000});
     const auto tooMuch = [this] { return http({.body = std::string(50'000, 'x')}).code() == 107; };
     {
         const UniqueFd half = dial(port(false));
@@ -168,6 +164,8 @@ TEST(FullQueues, RefuseAtOnceAndDoNotHoldUpTheLowerOnes) {
     EXPECT_TRUE(soon([&] { return replies[0] == 1; }));
     open.set_value();
     EXPECT_TRUE(soon([&] { return replies[0] == places + 3 * 64 + 1; }));
+    serve("relay");
+    EXPECT_TRUE(soon([&] { return replies[0] == places + 3 * 64 + 2; })) << "there is room again";
     EXPECT_EQ(replies[107], refused);
 }
 
