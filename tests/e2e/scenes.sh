@@ -17,6 +17,7 @@ remain() {
     holds ".data.sessions | length == $3"
 }
 
+nodeDb=/usr/ovra/etc/ovradr/node.db
 # at NODE: its endpoint.
 at() { echo "https://$("$lab" addr "$1"):5001"; }
 # admin NODE NAME: creates an administrator.
@@ -91,20 +92,19 @@ deadEndpoint() {
 
 damagedDatabase() {
     create 0
-    local db=/usr/ovra/etc/ovradr/node.db
     on 1 0 ovradr user add someone --password-file /usr/ovra/pw # makes a database of another schema
-    on 1 0 cp "$db" /usr/ovra/keep.db
-    for damage in "rm $db" ": >$db" "printf rubbish-%5000d 0 >$db" \
-        "rm $db; cp /usr/ovra/var/ovradr/accounts.db $db"; do
+    on 1 0 cp "$nodeDb" /usr/ovra/keep.db
+    for damage in "rm $nodeDb" ": >$nodeDb" "printf rubbish-%5000d 0 >$nodeDb" \
+        "rm $nodeDb; cp /usr/ovra/var/ovradr/accounts.db $nodeDb"; do
         on 1 0 sh -c "$damage"
         on 1 9 ovradr cred list
         output=$("$lab" run 1 -- ovradr call "$remote" OVRA.DR.Node info 2>&1) && fail "call without a database"
-        on 1 0 cp /usr/ovra/keep.db "$db"
+        on 1 0 cp /usr/ovra/keep.db "$nodeDb"
         info 0
     done
 }
 
-damagedIdentityAndCaches() {
+damagedCaches() {
     create 0
     info 0
     on 1 0 sh -c 'for f in /tmp/.ovradrcache/*; do head -c 200000 /dev/urandom >$f; done'
@@ -112,15 +112,6 @@ damagedIdentityAndCaches() {
     on 1 0 sh -c 'rm -r /tmp/.ovradrcache; ln -s /tmp /tmp/.ovradrcache'
     info 0
     logSays 1 "going on without a cache"
-    on 1 0 rm /tmp/.ovradrcache
-    on 1 0 sh -c "echo 'other=\"x\"' >/usr/ovra/etc/ovradr/node.info"
-    local id
-    on 1 0 ovradr --json node id
-    id=$(value .data.node_id)
-    on 1 0 ovradr --json node id
-    holds ".data.node_id == \"$id\""
-    on 1 0 cat /usr/ovra/etc/ovradr/node.info
-    says 'other="x"'
 }
 
 killedDaemon() {
@@ -194,7 +185,6 @@ operationHereAndThere() {
         --param 'webapi={"api":"OVRA.DR.Node","method":"info","version":1}'
 }
 
-nodeDb=/usr/ovra/etc/ovradr/node.db
 # The credential that the last command created.
 made() { value .data.cred_id; }
 # Both nodes are asked for forty credentials in both directions at the same moment.

@@ -158,8 +158,7 @@ TEST_F(Session, ForANodeIsReusedAndTiedToTheCallersAccountAndATemporaryOneEndsAf
     ASSERT_EQ(first.code(), 0) << first.text;
     EXPECT_EQ(call(kSession, 2, "create", node, sid).data(), first.data());
     EXPECT_NE(call(kSession, 2, "create", json(R"({"node_id":"n2"})"), sid).data(), first.data());
-    const Reply owner = call(kSession, 1, "get", first.data(), sid);
-    EXPECT_EQ(owner.data()["account"], "alice");
+    EXPECT_EQ(call(kSession, 1, "get", first.data(), sid).data()["account"], "alice");
 
     const std::string granted = first.data()["session"].asString();
     EXPECT_FALSE(OvraPlatform::SessionStore().find(granted)->expires);
@@ -189,18 +188,15 @@ TEST_F(Node, TellsWhatItIsAskedFor) {
 
 TEST_F(Node, FindsTheFirstEndpointThatItReaches) {
     addAccount("root", true);
-    Json::Value params;
-    params["conns"][0] = json(R"({"addr":"127.0.0.1","protocol":"http","port":1})");
+    Json::Value params = json(kOneEndpoint);
     for (const bool tls : {true, false}) {
-        Json::Value conn;
-        conn["addr"] = "127.0.0.1";
+        Json::Value conn = json(R"({"addr":"127.0.0.1"})");
         conn["protocol"] = tls ? "https" : "http";
         conn["port"] = port(tls);
         params["conns"].append(conn);
     }
-    const Reply reply = call(kNode, 1, "test_connection", params, session("root"));
-    EXPECT_EQ(reply.code(), 0);
-    EXPECT_EQ(reply.data(), params["conns"][1]);
+    EXPECT_EQ(call(kNode, 1, "test_connection", params, session("root")).data(),
+              params["conns"][1]);
 }
 
 TEST_F(Node, ServesItsOwnProcessesAsAdministrators) {

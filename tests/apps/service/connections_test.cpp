@@ -82,9 +82,8 @@ TEST(Connections, MakeRoomByEndingTheOneThatWaitedLongestOfAllOrOfAClientWithToo
 
 TEST(Connections, CountsOneThatIsClosedNoMore) {
     Connections table({.total = 1});
-    { const Client gone(table, "a"); }
-    const Client present(table, "a");
-    EXPECT_FALSE(present.isShut());
+    Client(table, "a").enter(Phase::kWorking);
+    EXPECT_TRUE(table.admit("a"));
 }
 
 TEST(Connections, EndWhenTheTimeOfTheirPhaseIsOver) {
