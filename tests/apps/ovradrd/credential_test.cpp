@@ -85,9 +85,8 @@ TEST_F(Credential, IsMadeByASessionOrByAnotherCredential) {
     ASSERT_EQ(first.code(), 0) << first.text;
 
     remote.answer("granted create", R"({"success":true,"data":{"session":"granted"}})");
-    params = credId(first.data()["src_cred"]["cred_id"].asString());
-    params["auth"] = "cred_id";
-    params["cred_direction"] = "unidirection";
+    params = json(R"({"auth":"cred_id","cred_direction":"unidirection"})");
+    params["cred_id"] = first.data()["src_cred"]["cred_id"];
     EXPECT_EQ(ask("create", params).code(), 0);
     EXPECT_EQ(rows("node_cred"), "n1|granted\nn1|granted\n");
 }
