@@ -25,6 +25,7 @@ public:
     OtherProcess &operator=(const OtherProcess &) = delete;
     ~OtherProcess() { end(SIGKILL); }
 
+    pid_t pid() const { return pid_; }
     /// Its exit code; -1 if ended by a signal, or still running after 30 seconds.
     int wait() {
         int status = 0;

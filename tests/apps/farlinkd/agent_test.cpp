@@ -1,44 +1,22 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "farlink_agent.h"
-#include "relay_api.h"
-#include "service/certificate.h"
-#include "sockets.h"
+#include "support/daemon_program.h"
+#include "support/sockets.h"
+#include "support/soon.h"
 
 #include <ovracredential/cred_request.h>
 #include <ovraplatform/appliance.h>
 #include <ovraplatform/farlink.h>
 
-#include <gtest/gtest.h>
-
-#include <atomic>
 #include <filesystem>
 #include <fstream>
-#include <optional>
-#include <thread>
 
 namespace {
 
-using Farlinkd::RelayApi;
-using Farlinkd::TunnelServer;
 using OvraPlatform::FarlinkSettings;
-using OvraService::HttpServer;
-using OvraService::Listener;
+using OvraTest::soon;
 
-constexpr std::chrono::seconds kSoon{20};
 constexpr int kPort = 20120;
-
-/// Whether it comes true within kSoon.
-template <typename Condition>
-bool soon(const Condition &condition) {
-    for (const auto end = std::chrono::steady_clock::now() + kSoon;
-         std::chrono::steady_clock::now() < end;) {
-        if (condition()) {
-            return true;
-        }
-        std::this_thread::sleep_for(std::chrono::milliseconds(20));
-    }
-    return false;
-}
 
 void makeFolders() {
     for (const std::filesystem::path file :
@@ -47,44 +25,22 @@ void makeFolders() {
     }
 }
 
-/// An appliance, its relay service and a caller, in one process.
+/// An appliance, its relay service and a caller.
 class TheFarlinkAgent : public testing::Test {
 protected:
     TheFarlinkAgent() {
         makeFolders();
-        Listener tunnel = Listener::listen("127.0.0.1", 0).value();
-        const int tunnelPort = tunnel.port;
-        EXPECT_TRUE(tunnelServer.start(std::move(tunnel)));
-        api.emplace(aliases, RelayApi::Settings{"127.0.0.1", "", tunnelPort},
-                    RelayApi::Limits{.hold = std::chrono::seconds(0)});
-        api->connect(tunnelServer);
-        const std::string key = "/usr/ovra/relay.key", certificate = "/usr/ovra/relay.crt";
-        EXPECT_TRUE(OvraService::createTlsKey(key));
-        EXPECT_TRUE(OvraService::createCertificate(certificate, key, {"localhost", {}}));
-        identity = OvraService::TlsIdentity::load(key, certificate).value();
-        std::vector<Listener> listeners;
-        listeners.push_back(Listener::listen("127.0.0.1", 0).value());
-        settings = {"127.0.0.1", listeners[0].port, "nas"};
-        EXPECT_TRUE(http.start(std::move(listeners), {}, identity));
-        ticker = std::thread([this] {
-            while (!over) {
-                api->endOverdue();
-                std::this_thread::sleep_for(std::chrono::milliseconds(50));
-            }
-        });
+        int port = 0;
+        EXPECT_EQ(std::sscanf(relay.line().c_str(), "farlinkd: ready, https %d", &port), 1);
+        settings = {"127.0.0.1", port, "nas"};
         agent.start();
     }
     ~TheFarlinkAgent() override {
-        EXPECT_TRUE(OvraPlatform::writeFarlinkSettings({}));
-        EXPECT_TRUE(agent.stop(std::chrono::steady_clock::now() + kSoon));
-        over = true;
-        ticker.join();
-        http.quiesce();
-        api->stop();
-        http.stop();
+        relay.end(SIGKILL); // or a poll would go on
+        EXPECT_TRUE(agent.stop(std::chrono::steady_clock::now() + std::chrono::seconds(20)));
     }
 
-    static std::string call() { return FarlinkdTest::hearAll(FarlinkdTest::dial(kPort)); }
+    static std::string call() { return OvraTest::hearAll(OvraTest::dial(kPort)); }
     /// Where an appliance finds the alias: the text of its information.
     static Json::Value lookUp(const std::string &alias) {
         Json::Value info;
@@ -93,23 +49,13 @@ protected:
         return info;
     }
 
-    Farlinkd::AliasRegistry aliases{"/usr/ovra/aliases", {kPort, kPort, std::chrono::hours(1)}};
-    std::optional<RelayApi> api;
-    TunnelServer tunnelServer{[this](const std::string &alias, const std::string &caller) {
-                                  return api->announce(alias, caller);
-                              },
-                              {.answer = std::chrono::milliseconds(1000)}};
-    OvraService::TlsIdentity identity;
-    HttpServer http{[this](OvraService::HttpRequest request, const HttpServer::Answer &answer) {
-                        api->serve(std::move(request), answer);
-                    },
-                    {}};
+    OvraTest::DaemonProgram relay{{FARLINKD_PROGRAM, "--address", "127.0.0.1", "--port", "0",
+                                   "--tunnel-port", "0", "--first-port", std::to_string(kPort),
+                                   "--last-port", std::to_string(kPort)}};
     FarlinkSettings settings;
     Ovradrd::FarlinkAgent agent{[](const OvraService::ConnectedClient &client) {
         send(client.fd.get(), "welcome", 7, MSG_NOSIGNAL);
     }};
-    std::atomic<bool> over = false;
-    std::thread ticker;
 };
 
 } // namespace

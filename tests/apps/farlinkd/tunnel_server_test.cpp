@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-#include "sockets.h"
+#include "support/sockets.h"
 #include "tunnel_server.h"
 
 #include <condition_variable>
@@ -9,12 +9,9 @@
 namespace {
 
 using Farlinkd::TunnelServer;
-using FarlinkdTest::dial;
-using FarlinkdTest::hear;
-using FarlinkdTest::hearAll;
-using FarlinkdTest::say;
 using OvraBase::UniqueFd;
 using OvraService::Listener;
+using namespace OvraTest;
 
 constexpr std::chrono::seconds kLong{120};
 
@@ -101,10 +98,8 @@ TEST_F(ThroughTheTunnelServer, NobodyIsConnectedToSomebodyElse) {
 TEST_F(ThroughTheTunnelServer, AreBoundedAndEndWithTheAlias) {
     // Longer than anybody listens here: only the bounds end a connection.
     TunnelServer::Limits perAlias{.perAlias = 1, .arriving = 1, .line = kLong, .answer = kLong};
-    TunnelServer::Limits all = perAlias;
-    all.perAlias = 64;
-    all.calls = 1;
-    for (TunnelServer::Limits limits : {perAlias, all}) {
+    TunnelServer::Limits all{.calls = 1, .arriving = 1, .line = kLong, .answer = kLong};
+    for (const auto &limits : {perAlias, all}) {
         begin(limits);
         UniqueFd client = dial(callerPort);
         const std::string first = caller();

@@ -1,28 +1,19 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "appliance.h"
 
+#include "service/certificate.h"
 #include "support/local_node.h"
-#include "support/test_certificate.h"
 
-#include <ovrabase/address.h>
 #include <ovradrcore/json.h>
 #include <ovraplatform/account_store.h>
 #include <ovraplatform/appliance.h>
 #include <ovraplatform/sealed_box.h>
 #include <ovraplatform/session_store.h>
 #include <ovraplatform/wire_form.h>
+#include <ovrawebapi/api_runner.h>
 
 #include <curl/curl.h>
-#include <openssl/pem.h>
-#include <poll.h>
-#include <sys/socket.h>
-#include <sys/stat.h>
-#include <unistd.h>
 
-#include <cerrno>
-#include <chrono>
-#include <cstdio>
-#include <cstdlib>
 #include <stdexcept>
 
 namespace OvraTest {
@@ -33,22 +24,6 @@ void require(bool ok, const char *what) {
     if (!ok) {
         throw std::runtime_error(what);
     }
-}
-
-struct CloseFile {
-    void operator()(FILE *file) const { std::fclose(file); }
-};
-
-void writeTlsFiles() {
-    const TestCertificate made("IP:127.0.0.1");
-    const std::unique_ptr<FILE, CloseFile> key(std::fopen(OvraPlatform::kTlsKeyFile, "w"));
-    const std::unique_ptr<FILE, CloseFile> certificate(
-        std::fopen(OvraPlatform::kTlsCertificateFile, "w"));
-    require(key && certificate && fchmod(fileno(key.get()), 0600) == 0 &&
-                PEM_write_PrivateKey(key.get(), made.key(), nullptr, nullptr, 0, nullptr,
-                                     nullptr) == 1 &&
-                PEM_write_X509(certificate.get(), made.certificate()) == 1,
-            "the TLS files cannot be written");
 }
 
 std::size_t takeBody(const char *data, std::size_t size, std::size_t count, void *text) {
@@ -74,7 +49,10 @@ Json::Value json(const std::string &text) {
 void Appliance::provision() {
     provisionNode();
     require(OvraPlatform::ensureStateDir(), "no state folder");
-    writeTlsFiles();
+    require(OvraService::createTlsKey(OvraPlatform::kTlsKeyFile) &&
+                OvraService::createCertificate(OvraPlatform::kTlsCertificateFile,
+                                               OvraPlatform::kTlsKeyFile, {"localhost", {}}),
+            "no TLS files");
     require(OvraPlatform::SealKeyPair::loadOrCreate(OvraPlatform::kSealKeyFile).has_value(),
             "no sealing key");
 }
@@ -85,11 +63,9 @@ void Appliance::addAccount(const std::string &name, bool administrator) {
 }
 
 std::string Appliance::session(const std::string &user, int timeout) {
-    OvraPlatform::SessionRequest request;
-    request.user = user;
-    request.timeout = timeout;
-    request.keepOthers = true;
-    return OvraPlatform::SessionStore().create(request).value_or("");
+    return OvraPlatform::SessionStore()
+        .create({.user = user, .timeout = timeout, .keepOthers = true})
+        .value_or("");
 }
 
 void Appliance::SetUp() {
@@ -99,11 +75,8 @@ void Appliance::SetUp() {
 
 void Appliance::restart(const OvraService::HttpLimits &limits, std::size_t testFiles) {
     daemon_.reset();
-    Ovradrd::Settings settings;
-    settings.addresses = {"127.0.0.1"};
-    settings.limits = limits;
-    settings.testFiles = testFiles;
-    daemon_ = std::make_unique<Ovradrd::Daemon>(settings);
+    daemon_ = std::make_unique<Ovradrd::Daemon>(
+        Ovradrd::Settings{.addresses = {"127.0.0.1"}, .limits = limits, .testFiles = testFiles});
     const auto started = daemon_->start();
     ASSERT_TRUE(started) << started.error().text;
 }
@@ -143,13 +116,15 @@ Reply Appliance::http(const HttpCall &call) const {
 
 Reply Appliance::call(const std::string &api, int version, const std::string &method,
                       const Json::Value &params, const std::string &sid, bool tls) const {
-    OvraPlatform::WireCall wire;
-    wire.api = api;
-    wire.version = version;
-    wire.method = method;
-    wire.params = params;
-    wire.sid = sid;
+    const OvraPlatform::WireCall wire{{api, version, method, params}, sid, ""};
     return http({.body = OvraPlatform::encodeForm(wire).value(), .tls = tls});
+}
+
+Json::Value Appliance::callHere(const char *api, int version, const char *method,
+                                const Json::Value &params) {
+    Json::Value reply;
+    OVRA::APIRunner().Exec(reply, api, version, method, params, "admin");
+    return reply;
 }
 
 Reply Appliance::login(const std::string &account, const std::string &password,
@@ -161,53 +136,6 @@ Reply Appliance::login(const std::string &account, const std::string &password,
         params["otp_code"] = code;
     }
     return call("OVRA.Core.Auth", 1, "login", params);
-}
-
-RawConnection::RawConnection(int port)
-    : fd_(socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0)) {
-    const auto server = OvraBase::parseAddress("127.0.0.1", port);
-    if (connect(fd(), server->get(), server->size) != 0) {
-        fd_.reset();
-    }
-}
-
-bool RawConnection::isOpen() const {
-    char byte = 0;
-    return recv(fd(), &byte, 1, MSG_PEEK | MSG_DONTWAIT) < 0 && errno == EAGAIN;
-}
-
-bool RawConnection::send(const std::string &bytes) const {
-    return ::send(fd(), bytes.data(), bytes.size(), MSG_NOSIGNAL) ==
-           static_cast<ssize_t>(bytes.size());
-}
-
-bool RawConnection::drain(std::chrono::milliseconds time, std::string &all) const {
-    const auto end = std::chrono::steady_clock::now() + time;
-    for (;;) {
-        const auto left =
-            std::chrono::ceil<std::chrono::milliseconds>(end - std::chrono::steady_clock::now());
-        pollfd waiting{fd(), POLLIN, 0};
-        char part[4096];
-        if (left.count() <= 0 || poll(&waiting, 1, static_cast<int>(left.count())) <= 0) {
-            return false;
-        }
-        const ssize_t got = recv(fd(), part, sizeof(part), 0);
-        if (got <= 0) {
-            return true;
-        }
-        all.append(part, static_cast<std::size_t>(got));
-    }
-}
-
-std::string RawConnection::readAll(std::chrono::milliseconds time) const {
-    std::string all;
-    drain(time, all);
-    return all;
-}
-
-bool RawConnection::closesWithin(std::chrono::milliseconds time) const {
-    std::string all;
-    return drain(time, all);
 }
 
 } // namespace OvraTest

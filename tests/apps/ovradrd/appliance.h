@@ -3,12 +3,9 @@
 
 #include "daemon.h"
 
-#include <ovrabase/unique_fd.h>
-
 #include <gtest/gtest.h>
 #include <json/json.h>
 
-#include <chrono>
 #include <memory>
 #include <string>
 
@@ -53,6 +50,9 @@ public:
     Reply call(const std::string &api, int version, const std::string &method,
                const Json::Value &params = Json::Value(), const std::string &sid = "",
                bool tls = true) const;
+    /// The answer to a process of the appliance, which calls through the Unix socket.
+    static Json::Value callHere(const char *api, int version, const char *method,
+                                const Json::Value &params = Json::objectValue);
     Reply login(const std::string &account, const std::string &password,
                 const std::string &code = "") const;
 
@@ -69,26 +69,5 @@ private:
 
 /// A JSON object from its text.
 Json::Value json(const std::string &text);
-
-/// A plain TCP connection to 127.0.0.1.
-class RawConnection {
-public:
-    explicit RawConnection(int port);
-    int fd() const { return fd_.get(); } ///< -1 if nobody listens
-    /// Whether the other end has neither closed nor sent anything.
-    bool isOpen() const;
-    /// False if the other end is gone.
-    bool send(const std::string &bytes) const;
-    /// Reads until the other end closes or the time-out expires.
-    std::string readAll(std::chrono::milliseconds time) const;
-    /// Whether the other end closes within the time.
-    bool closesWithin(std::chrono::milliseconds time) const;
-
-private:
-    /// Whether the other end closed.
-    bool drain(std::chrono::milliseconds time, std::string &all) const;
-
-    OvraBase::UniqueFd fd_;
-};
 
 } // namespace OvraTest

@@ -1,25 +1,27 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "appliance.h"
 #include "call_dispatcher.h"
+#include "service/startup.h"
 #include "support/misbehaving_server.h"
+#include "support/sockets.h"
+#include "support/soon.h"
 
 #include <ovraplatform/api_errors.h>
 #include <ovraplatform/appliance.h>
 
-#include <sys/resource.h>
-
-#include <condition_variable>
+#include <algorithm>
+#include <atomic>
 #include <future>
-#include <list>
 #include <map>
-#include <mutex>
+#include <optional>
 #include <thread>
+#include <tuple>
+#include <vector>
 
 namespace {
 
-using OvraTest::Appliance;
-using OvraTest::json;
-using OvraTest::RawConnection;
+using OvraBase::UniqueFd;
+using namespace OvraTest;
 using namespace std::chrono_literals;
 
 const std::string kLongPost = "POST /webapi/query.cgi HTTP/1.1\r\nHost: a\r\nContent-Type: "
@@ -29,10 +31,7 @@ constexpr char kGetInfo[] = "api=OVRA.Core.Encryption&version=1&method=getinfo";
 class Bounds : public Appliance {
 protected:
     void SetUp() override {
-        rlimit limit{};
-        getrlimit(RLIMIT_NOFILE, &limit);
-        limit.rlim_cur = limit.rlim_max;
-        setrlimit(RLIMIT_NOFILE, &limit);
+        OvraService::raiseDescriptorLimit(16384);
         Appliance::SetUp();
     }
     /// Whether a call is answered in time.
@@ -54,168 +53,120 @@ TEST_F(Bounds, CutOffAClientWhoseRequestTakesTooLong) {
                    {"shakes no hands", true, "", ""},
                    {"drips its header", false, "POST /webapi/query.cgi HTTP/1.1\r\nX: ", "a"},
                    {"drips its body", false, kLongPost, "a"}};
-    OvraService::HttpLimits limits;
-    limits.connections.arriving = 1s;
-    restart(limits);
+    restart({.connections = {.arriving = 1s}});
     for (const auto &client : clients) {
-        const RawConnection connection(port(client.tls));
+        const UniqueFd connection = dial(port(client.tls));
         const auto begun = std::chrono::steady_clock::now();
         const auto time = [begun] { return std::chrono::steady_clock::now() - begun; };
-        connection.send(client.begin);
-        while (!connection.closesWithin(100ms) && time() < 10s) {
-            connection.send(client.drip);
+        say(connection, client.begin);
+        while (isOpen(connection) && time() < 10s) {
+            std::this_thread::sleep_for(100ms);
+            say(connection, client.drip);
         }
+        EXPECT_NE(hearAll(connection), "timeout") << client.name;
         EXPECT_GE(time(), 900ms) << client.name;
         EXPECT_LT(time(), 10s) << client.name;
     }
 }
 
 TEST_F(Bounds, OfAllBodiesTogetherRefuseWhatIsTooMuch) {
-    OvraService::HttpLimits limits;
-    limits.bodies = 100'000;
-    restart(limits);
-    const auto becomes = [this](bool refused) {
-        for (int i = 0; i < 500; ++i) {
-            if ((http({.body = std::string(50'000, 'x')}).code() == 107) == refused) {
-                return true;
-            }
-            std::this_thread::sleep_for(10ms);
-        }
-        return false;
-    };
+    restart({.bodies = 100'000});
+    const auto tooMuch = [this] { return http({.body = std::string(50'000, 'x')}).code() == 107; };
     {
-        const RawConnection half(port(false));
-        half.send(kLongPost + std::string(80'000, 'x'));
-        EXPECT_TRUE(becomes(true));
+        const UniqueFd half = dial(port(false));
+        say(half, kLongPost + std::string(80'000, 'x'));
+        EXPECT_TRUE(soon(tooMuch));
         expectQuickAnswer();
     }
-    EXPECT_TRUE(becomes(false)) << "what the client that left had sent still counts";
+    EXPECT_TRUE(soon([&] { return !tooMuch(); }))
+        << "what the client that left had sent still counts";
 }
 
-TEST_F(Bounds, Leave500SlowConnectionsNoInfluence) {
-    std::list<RawConnection> slow;
+TEST_F(Bounds, Leave500SlowConnectionsNoInfluenceAndHoldWhenMoreComeThanThereMayBe) {
+    std::vector<UniqueFd> slow;
     for (int i = 0; i < 500; ++i) {
-        slow.emplace_back(port(i % 2 == 0));
-        ASSERT_TRUE(slow.back().isOpen());
-        if (i % 2 != 0) {
-            slow.back().send("POST /webapi/query.cgi HTTP/1.1\r\nX: a");
-        }
+        slow.push_back(dial(port(i % 2 == 0)));
+        say(slow.back(), i % 2 == 0 ? "" : "POST /webapi/query.cgi HTTP/1.1\r\nX: a");
     }
     for (int i = 0; i < 5; ++i) {
         expectQuickAnswer();
     }
-    for (const RawConnection &connection : slow) {
-        EXPECT_TRUE(connection.isOpen());
-    }
-}
-
-TEST_F(Bounds, HoldWhenMoreConnectionsComeThanThereMayBe) {
-    std::list<RawConnection> flood;
-    for (int i = 0; i < 1500; ++i) {
-        flood.emplace_back(port(i % 2 == 0));
+    EXPECT_TRUE(std::all_of(slow.begin(), slow.end(), isOpen));
+    for (int i = 0; i < 1000; ++i) {
+        slow.push_back(dial(port(i % 2 == 0)));
     }
     expectQuickAnswer();
 }
 
 TEST_F(Bounds, OfAStoppingDaemonEndTheConnectionWithoutAnAnswer) {
     addAccount("root", true);
-    OvraTest::MisbehavingServer silent;
+    MisbehavingServer silent;
     silent.fallSilent();
-    Json::Value params;
-    params["conns"][0] = json(R"({"addr":"127.0.0.1","protocol":"http"})");
+    Json::Value params = json(R"({"conns":[{"addr":"127.0.0.1","protocol":"http"}]})");
     params["conns"][0]["port"] = silent.port();
     auto waiting = std::async(std::launch::async, [&] {
         return call("OVRA.DR.Node", 1, "test_connection", params, session("root"));
     });
-    while (silent.connections() == 0) {
-        std::this_thread::sleep_for(5ms);
-    }
+    EXPECT_TRUE(soon([&] { return silent.connections() > 0; }));
     EXPECT_FALSE(daemon().stop());
     EXPECT_EQ(waiting.get().status, 0);
 }
 
-/// A registry with one call that waits and one that does not.
-class FullQueues : public testing::Test {
-protected:
-    FullQueues() {
-        using OvraPlatform::APIQueue;
-        using OvraPlatform::APIRight;
-        for (const auto &[method, queue] :
-             {std::pair("relay", APIQueue::kRelay), std::pair("twoWay", APIQueue::kTwoWay),
-              std::pair("outbound", APIQueue::kOutbound)}) {
-            registry.add("Test", 1, method, APIRight::kNone, queue,
-                         [this](const Json::Value &, const OvraPlatform::APICaller &) {
-                             std::unique_lock lock(mutex);
-                             ++inside;
-                             changed.notify_all();
-                             changed.wait(lock, [this] { return open; });
-                             return OvraPlatform::apiSuccess();
-                         });
-        }
-        registry.add("Test", 1, "quick", APIRight::kNone, APIQueue::kQuick,
-                     [](const Json::Value &, const OvraPlatform::APICaller &) {
+TEST(FullQueues, RefuseAtOnceAndDoNotHoldUpTheLowerOnes) {
+    using OvraPlatform::APIQueue;
+    const std::tuple<const char *, APIQueue, int> rows[] = {{"relay", APIQueue::kRelay, 8},
+                                                            {"twoWay", APIQueue::kTwoWay, 16},
+                                                            {"outbound", APIQueue::kOutbound, 16}};
+    std::atomic<int> inside = 0;
+    std::map<int, std::atomic<int>> replies; // by code
+    replies[0] = replies[107] = 0;
+    std::promise<void> open;
+    const auto opened = open.get_future().share();
+    OvraPlatform::APIRegistry registry;
+    for (const auto &[method, queue, threads] : rows) {
+        registry.add("Test", 1, method, OvraPlatform::APIRight::kNone, queue,
+                     [&](const Json::Value &, const auto &) {
+                         ++inside;
+                         opened.wait();
                          return OvraPlatform::apiSuccess();
                      });
-        Appliance::provision();
-        keys = OvraPlatform::SealKeyPair::load(OvraPlatform::kSealKeyFile).value();
-        dispatcher.emplace(registry, *keys, guard, api, *queues);
     }
-    void serve(const std::string &method) {
-        dispatcher->serve({"api=Test&version=1&method=" + method, "127.0.0.1", true},
-                          [this](const std::string &document) {
-                              const std::lock_guard lock(mutex);
-                              ++replies[OvraTest::json(document)["error"]["code"].asInt()];
-                              changed.notify_all();
-                          });
-    }
-    /// Whether that many replies had this code within a few seconds.
-    bool gets(int code, int count) {
-        std::unique_lock lock(mutex);
-        return changed.wait_for(lock, 5s, [&] { return replies[code] >= count; });
-    }
-
-    std::mutex mutex;
-    std::condition_variable changed;
-    int inside = 0;
-    bool open = false;
-    std::map<int, int> replies;
-    OvraPlatform::APIRegistry registry;
-    std::optional<OvraPlatform::SealKeyPair> keys;
+    registry.add("Test", 1, "quick", OvraPlatform::APIRight::kNone, APIQueue::kQuick,
+                 [](const Json::Value &, const auto &) { return OvraPlatform::apiSuccess(); });
+    Appliance::provision();
+    const auto keys = OvraPlatform::SealKeyPair::load(OvraPlatform::kSealKeyFile).value();
     OvraPlatform::ReplayGuard guard;
     Ovradrd::LoginApi api;
     std::optional<Ovradrd::CallDispatcher> dispatcher;
-    std::optional<Ovradrd::WorkQueues> queues{std::in_place};
-};
-
-TEST_F(FullQueues, RefuseAtOnceAndDoNotHoldUpTheLowerOnes) {
+    Ovradrd::WorkQueues queues;
+    dispatcher.emplace(registry, keys, guard, api, queues);
+    const auto serve = [&](const std::string &method) {
+        dispatcher->serve({"api=Test&version=1&method=" + method, "127.0.0.1", true},
+                          [&](const std::string &document) {
+                              ++replies.at(json(document)["error"]["code"].asInt());
+                          });
+    };
     int places = 0;
     int refused = 0;
-    for (const auto &[method, threads] :
-         {std::pair("relay", 8), std::pair("twoWay", 16), std::pair("outbound", 16)}) {
+    for (const auto &[method, queue, threads] : rows) {
         places += threads;
         for (int i = 0; i < threads; ++i) {
             serve(method);
         }
-        {
-            std::unique_lock lock(mutex);
-            ASSERT_TRUE(changed.wait_for(lock, 5s, [&] { return inside == places; })) << method;
-        }
+        EXPECT_TRUE(soon([&] { return inside == places; })) << method;
         for (int i = 0; i < 64 + 5; ++i) {
             serve(method);
         }
         refused += 5;
-        EXPECT_TRUE(gets(107, refused)) << method;
+        EXPECT_TRUE(soon([&] { return replies[107] == refused; })) << method;
     }
     serve("quick");
-    EXPECT_TRUE(gets(0, 1));
-    {
-        const std::lock_guard lock(mutex);
-        open = true;
-    }
-    changed.notify_all();
-    EXPECT_TRUE(gets(0, places + 3 * 64 + 1));
+    EXPECT_TRUE(soon([&] { return replies[0] == 1; }));
+    open.set_value();
+    EXPECT_TRUE(soon([&] { return replies[0] == places + 3 * 64 + 1; }));
+    serve("relay");
+    EXPECT_TRUE(soon([&] { return replies[0] == places + 3 * 64 + 2; })) << "there is room again";
     EXPECT_EQ(replies[107], refused);
-    queues.reset();
 }
 
 } // namespace

@@ -1,5 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "appliance.h"
+#include "support/sockets.h"
 
 #include <openssl/ssl.h>
 
@@ -7,10 +8,7 @@
 
 namespace {
 
-using OvraTest::Appliance;
-using OvraTest::HttpCall;
-using OvraTest::RawConnection;
-using OvraTest::Reply;
+using namespace OvraTest;
 
 constexpr char kGetInfo[] = "api=OVRA.Core.Encryption&version=1&method=getinfo";
 
@@ -60,89 +58,61 @@ TEST_F(Wire, SurvivesRubbish) {
     for (int i = 0; i < 100'000; ++i) {
         rubbish += static_cast<char>(i * 7919 % 256);
     }
+    const std::string get = "GET / HTTP/";
+    const std::string post = "POST /webapi/query.cgi HTTP/1.1\r\nHost: a\r\n";
     for (const bool tls : {true, false}) {
         for (const std::string &bytes :
-             {rubbish, std::string(100'000, '\0'), std::string("GET / HTTP/9.9\r\n\r\n"),
-              "GET / HTTP/1.1\r\nX: " + std::string(100'000, 'a'),
-              std::string(
-                  "POST /webapi/query.cgi HTTP/1.1\r\nHost: a\r\nContent-Length: -5\r\n\r\n"),
-              std::string("POST /webapi/query.cgi HTTP/1.1\r\nHost: a\r\n"
-                          "Content-Type: application/x-www-form-urlencoded\r\n"
-                          "Transfer-Encoding: chunked\r\n\r\nzz\r\n")}) {
-            const RawConnection connection(port(tls));
-            connection.send(bytes);
-            EXPECT_TRUE(connection.closesWithin(std::chrono::seconds(5))) << bytes.substr(0, 60);
+             {rubbish, std::string(100'000, '\0'), get + "9.9\r\n\r\n",
+              get + "1.1\r\nX: " + std::string(100'000, 'a'), post + "Content-Length: -5\r\n\r\n",
+              post + "Content-Type: application/x-www-form-urlencoded\r\n"
+                     "Transfer-Encoding: chunked\r\n\r\nzz\r\n"}) {
+            const auto connection = dial(port(tls));
+            say(connection, bytes);
+            EXPECT_NE(hearAll(connection), "timeout") << bytes.substr(0, 60);
         }
     }
     EXPECT_EQ(http({.body = kGetInfo}).code(), 0);
 }
 
 TEST_F(Wire, KeepsAConnectionForFurtherRequests) {
-    const RawConnection connection(port(false));
-    const std::string request = "POST /webapi/query.cgi HTTP/1.1\r\nHost: a\r\n"
-                                "Content-Type: application/x-www-form-urlencoded\r\n"
-                                "Content-Length: " +
-                                std::to_string(sizeof(kGetInfo) - 1) + "\r\n\r\n" + kGetInfo;
-    connection.send(request + request);
-    const std::string replies = connection.readAll(std::chrono::seconds(1));
-    const std::size_t first = replies.find("public_key");
-    ASSERT_NE(first, std::string::npos);
-    EXPECT_NE(replies.find("public_key", first + 1), std::string::npos);
+    const auto connection = dial(port(false));
+    const std::string request = "GET /webapi/query.cgi HTTP/1.1\r\nHost: a\r\n";
+    say(connection, request + "\r\n" + request + "Connection: close\r\n\r\n");
+    const std::string replies = hearAll(connection);
+    EXPECT_NE(replies.find("HTTP/1.1 200"), replies.rfind("HTTP/1.1 200")) << replies;
 }
 
-struct FreeContext {
-    void operator()(SSL_CTX *context) const { SSL_CTX_free(context); }
-};
-struct FreeSsl {
-    void operator()(SSL *ssl) const { SSL_free(ssl); }
-};
-struct FreeSession {
-    void operator()(SSL_SESSION *session) const { SSL_SESSION_free(session); }
-};
-using Session = std::unique_ptr<SSL_SESSION, FreeSession>;
-
-/// One request over TLS of exactly this version.
-struct TlsVisit {
-    TlsVisit(int port, int version, SSL_SESSION *offered) {
-        const std::unique_ptr<SSL_CTX, FreeContext> context(SSL_CTX_new(TLS_client_method()));
-        SSL_CTX_set_security_level(context.get(), 0);
-        SSL_CTX_set_min_proto_version(context.get(), version);
-        SSL_CTX_set_max_proto_version(context.get(), version);
-        const std::unique_ptr<SSL, FreeSsl> ssl(SSL_new(context.get()));
-        const RawConnection connection(port);
-        SSL_set_fd(ssl.get(), connection.fd());
-        if (offered != nullptr) {
-            SSL_set_session(ssl.get(), offered);
-        }
-        connected = SSL_connect(ssl.get()) == 1;
-        if (connected) {
-            constexpr char kRequest[] = "GET /webapi/query.cgi HTTP/1.1\r\nHost: a\r\n\r\n";
-            char reply[512];
-            SSL_write(ssl.get(), kRequest, sizeof(kRequest) - 1);
-            SSL_read(ssl.get(), reply, sizeof(reply));
-            resumed = SSL_session_reused(ssl.get()) == 1;
-            session.reset(SSL_get1_session(ssl.get()));
-            SSL_shutdown(ssl.get());
-        }
+/// The session of a visit over TLS of exactly this version; null without a connection.
+std::shared_ptr<SSL_SESSION> visit(int port, int version, SSL_SESSION *offered = nullptr) {
+    const std::shared_ptr<SSL_CTX> context(SSL_CTX_new(TLS_client_method()), SSL_CTX_free);
+    SSL_CTX_set_security_level(context.get(), 0);
+    SSL_CTX_set_min_proto_version(context.get(), version);
+    SSL_CTX_set_max_proto_version(context.get(), version);
+    const std::shared_ptr<SSL> ssl(SSL_new(context.get()), SSL_free);
+    const auto connection = dial(port);
+    SSL_set_fd(ssl.get(), connection.get());
+    if (offered != nullptr) {
+        SSL_set_session(ssl.get(), offered);
     }
+    if (SSL_connect(ssl.get()) != 1) {
+        return nullptr;
+    }
+    EXPECT_EQ(SSL_session_reused(ssl.get()) == 1, offered != nullptr) << version;
+    constexpr char kRequest[] = "GET /webapi/query.cgi HTTP/1.1\r\nHost: a\r\n\r\n";
+    char reply[512];
+    SSL_write(ssl.get(), kRequest, sizeof(kRequest) - 1);
+    SSL_read(ssl.get(), reply, sizeof(reply)); // TLS 1.3 has sent its ticket before
+    SSL_shutdown(ssl.get());
+    return {SSL_get1_session(ssl.get()), SSL_SESSION_free};
+}
 
-    bool connected = false;
-    bool resumed = false;
-    Session session;
-};
-
-TEST_F(Wire, ResumesTlsSessions) {
+TEST_F(Wire, ResumesTlsSessionsAndSpeaksNoOldTls) {
     for (const int version : {TLS1_2_VERSION, TLS1_3_VERSION}) {
-        const TlsVisit first(port(true), version, nullptr);
-        ASSERT_TRUE(first.connected);
-        EXPECT_FALSE(first.resumed);
-        EXPECT_TRUE(TlsVisit(port(true), version, first.session.get()).resumed) << version;
+        const auto session = visit(port(true), version);
+        ASSERT_TRUE(session);
+        EXPECT_TRUE(visit(port(true), version, session.get()));
     }
-}
-
-TEST_F(Wire, SpeaksNoOldTls) {
-    EXPECT_FALSE(TlsVisit(port(true), TLS1_1_VERSION, nullptr).connected);
-    EXPECT_TRUE(TlsVisit(port(true), TLS1_2_VERSION, nullptr).connected);
+    EXPECT_FALSE(visit(port(true), TLS1_1_VERSION));
 }
 
 } // namespace

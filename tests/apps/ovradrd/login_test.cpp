@@ -6,13 +6,10 @@
 #include <ovraplatform/session_store.h>
 #include <ovraplatform/totp.h>
 
-#include <liboath/oath.h>
-
 #include <array>
 #include <chrono>
 #include <future>
 #include <thread>
-#include <vector>
 
 namespace {
 
@@ -21,18 +18,6 @@ using OvraTest::Appliance;
 using OvraTest::Reply;
 
 class Login : public Appliance {};
-
-/// The authenticator's current code.
-std::string codeOf(const std::string &secret) {
-    char *key = nullptr;
-    std::size_t size = 0;
-    std::array<char, 7> code{};
-    if (oath_base32_decode(secret.data(), secret.size(), &key, &size) == OATH_OK) {
-        oath_totp_generate(key, size, std::time(nullptr), 30, 0, 6, code.data());
-        free(key);
-    }
-    return code.data();
-}
 
 TEST_F(Login, GivesASessionOfHalfAnHourThatWorksUntilLogout) {
     addAccount("alice", true);
@@ -59,8 +44,7 @@ TEST_F(Login, TellsWhyItRefusesOnlyToWhoKnowsThePassword) {
     AccountStore accounts;
     ASSERT_TRUE(accounts.setDisabled("disabled", true));
     ASSERT_TRUE(accounts.setRemoteLogin("local", false));
-    const std::string secret = OvraPlatform::newTotpSecret();
-    ASSERT_TRUE(accounts.setTotp("coded", secret));
+    ASSERT_TRUE(accounts.setTotp("coded", OvraPlatform::newTotpSecret()));
 
     EXPECT_EQ(login("nobody", kPassword).code(), 400);
     EXPECT_EQ(login("plain", "wrong password").code(), 400);
@@ -70,9 +54,6 @@ TEST_F(Login, TellsWhyItRefusesOnlyToWhoKnowsThePassword) {
     EXPECT_EQ(login("local", kPassword).code(), 402);
     EXPECT_EQ(login("coded", kPassword).code(), 403);
     EXPECT_EQ(login("coded", kPassword, "000000").code(), 404);
-    const std::string code = codeOf(secret);
-    EXPECT_EQ(login("coded", kPassword, code).code(), 0);
-    EXPECT_EQ(login("coded", kPassword, code).code(), 404) << "a code counts once";
 }
 
 TEST_F(Login, RefusesParametersThatAreNoLogIn) {
@@ -81,9 +62,8 @@ TEST_F(Login, RefusesParametersThatAreNoLogIn) {
           R"({"account":"a","passwd":"x","otp_code":7})", R"({"account":"a\n","passwd":"x"})"}) {
         EXPECT_EQ(call("OVRA.Core.Auth", 1, "login", OvraTest::json(params)).code(), 106) << params;
     }
-    Json::Value huge;
+    Json::Value huge = OvraTest::json(R"({"passwd":"x"})");
     huge["account"] = std::string(500'000, 'a');
-    huge["passwd"] = "x";
     EXPECT_EQ(call("OVRA.Core.Auth", 1, "login", huge).code(), 106);
 }
 

@@ -1,23 +1,14 @@
 // SPDX-License-Identifier: Apache-2.0
+#include "appliance.h"
 #include "handlers/flow_error.h"
 #include "handlers/params.h"
-
-#include <ovradrcore/json.h>
-
-#include <gtest/gtest.h>
-#include <json/json.h>
 
 #include <functional>
 
 namespace {
 
 using Ovradrd::Params;
-
-Json::Value parse(const std::string &text) {
-    Json::Value value;
-    EXPECT_TRUE(OvraDRCore::fromString(value, text)) << text;
-    return value;
-}
+using OvraTest::json;
 
 struct Scene {
     const char *name;
@@ -51,7 +42,7 @@ const Scene kScenes[] = {
 TEST(Params, AreTakenOrNamedAsUnusable) {
     for (const Scene &scene : kScenes) {
         for (const bool usable : {true, false}) {
-            for (const Json::Value &value : parse(usable ? scene.usable : scene.refused)) {
+            for (const Json::Value &value : json(usable ? scene.usable : scene.refused)) {
                 Json::Value params(Json::objectValue);
                 params["x"] = value;
                 Params in(params);
@@ -64,7 +55,7 @@ TEST(Params, AreTakenOrNamedAsUnusable) {
 }
 
 TEST(Params, NameTheFirstThatIsUnusable) {
-    const Json::Value params = parse(R"({"y": 7})");
+    const Json::Value params = json(R"({"y": 7})");
     Params in(params);
     in.text("y", 4);
     in.text("x", 4);
@@ -72,19 +63,13 @@ TEST(Params, NameTheFirstThatIsUnusable) {
     EXPECT_EQ(in.error()["error"]["msg"]["param"], "y");
 }
 
-TEST(FlowError, PassesTheCodeAndMessageOn) {
+TEST(FlowError, PassesTheCodeAndMessageOnButNoOtherNodesRefusalAsItsOwn) {
     const OvraDRCore::ErrRecorder flow;
     flow.SetErr(518, "n2");
-    EXPECT_EQ(Ovradrd::flowError(flow, 509)["error"], parse(R"({"code":518,"msg":"n2"})"));
-    flow.SetErr(0);
-    EXPECT_EQ(Ovradrd::flowError(flow, 509)["error"]["code"], 509);
-}
-
-TEST(FlowError, DoesNotPassOffAnotherNodesRefusalAsItsOwn) {
-    const OvraDRCore::ErrRecorder flow;
-    for (const int refusal : {105, 119}) {
-        flow.SetErr(refusal);
-        EXPECT_EQ(Ovradrd::flowError(flow, 509)["error"]["code"], 525);
+    EXPECT_EQ(Ovradrd::flowError(flow, 509)["error"], json(R"({"code":518,"msg":"n2"})"));
+    for (const auto &[recorded, code] : {std::pair(0, 509), {105, 525}, {119, 525}}) {
+        flow.SetErr(recorded);
+        EXPECT_EQ(Ovradrd::flowError(flow, 509)["error"]["code"], code);
     }
 }
 

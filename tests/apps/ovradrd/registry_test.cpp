@@ -13,41 +13,14 @@ using OvraPlatform::APIQueue;
 using OvraPlatform::APIRegistry;
 using OvraPlatform::APIRight;
 
-/// A method as named in the table.
-std::string nameOf(const std::string &api, int version, const std::string &method) {
-    return "`" + api + "` " + std::to_string(version) + " `" + method + "`";
-}
-
-const char *wordOf(APIRight right) {
-    switch (right) {
-    case APIRight::kNone:
-        return "anybody";
-    case APIRight::kSession:
-        return "session";
-    case APIRight::kAdministrator:
-        return "administrator";
-    case APIRight::kLocal:
-        return "local";
-    }
-    return "";
-}
-
-std::string queueOf(const APIRegistry::Method &method) {
-    if (Ovradrd::LoginApi::isLogin({method.api, method.version, method.method})) {
-        return "log-in";
-    }
-    switch (method.queue) {
-    case APIQueue::kQuick:
-        return "quick";
-    case APIQueue::kOutbound:
-        return "outbound";
-    case APIQueue::kTwoWay:
-        return "two-way";
-    case APIQueue::kRelay:
-        return "relay";
-    }
-    return "";
-}
+const std::map<APIRight, std::string> kRights{{APIRight::kNone, "anybody"},
+                                              {APIRight::kSession, "session"},
+                                              {APIRight::kAdministrator, "administrator"},
+                                              {APIRight::kLocal, "local"}};
+const std::map<APIQueue, std::string> kQueues{{APIQueue::kQuick, "quick"},
+                                              {APIQueue::kOutbound, "outbound"},
+                                              {APIQueue::kTwoWay, "two-way"},
+                                              {APIQueue::kRelay, "relay"}};
 
 class Registry : public OvraTest::Appliance {};
 
@@ -59,19 +32,23 @@ TEST_F(Registry, IsDocumentedWithItsRightsAndQueues) {
             << "docs/ovradrd.md has two rows for " << row[0] << ": remove one";
     }
     for (const APIRegistry::Method &method : APIRegistry::hosted()->methods()) {
-        const std::string name = nameOf(method.api, method.version, method.method);
+        const std::string name =
+            "`" + method.api + "` " + std::to_string(method.version) + " `" + method.method + "`";
+        const std::string right = kRights.at(method.right);
+        const bool isLogin =
+            Ovradrd::LoginApi::isLogin({method.api, method.version, method.method});
+        const std::string queue = isLogin ? "log-in" : kQueues.at(method.queue);
         const auto row = rows.find(name);
         if (row == rows.end()) {
             ADD_FAILURE() << "docs/ovradrd.md has no row for " << name
-                          << ": add one under \"What can be called\":\n| " << name << " | "
-                          << wordOf(method.right) << " | " << queueOf(method)
-                          << " | PARAMETERS | DATA |";
+                          << ": add one under \"What can be called\":\n| " << name << " | " << right
+                          << " | " << queue << " | PARAMETERS | DATA |";
             continue;
         }
         // After a semicolon follow the handler's own requirements.
-        EXPECT_EQ(row->second[1].substr(0, row->second[1].find(';')), wordOf(method.right))
+        EXPECT_EQ(row->second[1].substr(0, row->second[1].find(';')), right)
             << "docs/ovradrd.md: correct the right of " << name;
-        EXPECT_EQ(row->second[2].substr(0, row->second[2].find(';')), queueOf(method))
+        EXPECT_EQ(row->second[2].substr(0, row->second[2].find(';')), queue)
             << "docs/ovradrd.md: correct the queue of " << name;
         rows.erase(row);
     }
@@ -81,16 +58,18 @@ TEST_F(Registry, IsDocumentedWithItsRightsAndQueues) {
     }
 }
 
-TEST_F(Registry, KeepsTheWayBackOutOfTheQueueThatWaitsForIt) {
-    const auto queueOf = [](const Json::Value &params) {
-        return APIRegistry::hosted()->queue({"OVRA.DR.Node.Credential", 1, "create", params});
-    };
-    Json::Value params;
-    EXPECT_EQ(queueOf("no object"), APIQueue::kOutbound);
-    params["cred_direction"] = "unidirection";
-    EXPECT_EQ(queueOf(params), APIQueue::kOutbound);
-    params["cred_direction"] = "bidirection";
-    EXPECT_EQ(queueOf(params), APIQueue::kTwoWay);
+class Queues : public OvraTest::Appliance {};
+
+TEST_F(Queues, KeepTheWayBackOutOfTheOneThatWaitsForIt) {
+    for (const auto &[params, queue] :
+         {std::pair(R"("no object")", APIQueue::kOutbound),
+          std::pair(R"({"cred_direction":"unidirection"})", APIQueue::kOutbound),
+          std::pair(R"({"cred_direction":"bidirection"})", APIQueue::kTwoWay)}) {
+        EXPECT_EQ(APIRegistry::hosted()->queue(
+                      {"OVRA.DR.Node.Credential", 1, "create", OvraTest::json(params)}),
+                  queue)
+            << params;
+    }
 }
 
 } // namespace

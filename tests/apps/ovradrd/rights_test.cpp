@@ -6,7 +6,6 @@
 #include <ovraplatform/account_store.h>
 #include <ovraplatform/api_registry.h>
 #include <ovraplatform/session_store.h>
-#include <ovrawebapi/api_runner.h>
 
 #include <algorithm>
 #include <ctime>
@@ -159,8 +158,7 @@ TEST_F(Session, ForANodeIsReusedAndTiedToTheCallersAccountAndATemporaryOneEndsAf
     ASSERT_EQ(first.code(), 0) << first.text;
     EXPECT_EQ(call(kSession, 2, "create", node, sid).data(), first.data());
     EXPECT_NE(call(kSession, 2, "create", json(R"({"node_id":"n2"})"), sid).data(), first.data());
-    const Reply owner = call(kSession, 1, "get", first.data(), sid);
-    EXPECT_EQ(owner.data()["account"], "alice");
+    EXPECT_EQ(call(kSession, 1, "get", first.data(), sid).data()["account"], "alice");
 
     const std::string granted = first.data()["session"].asString();
     EXPECT_FALSE(OvraPlatform::SessionStore().find(granted)->expires);
@@ -190,33 +188,23 @@ TEST_F(Node, TellsWhatItIsAskedFor) {
 
 TEST_F(Node, FindsTheFirstEndpointThatItReaches) {
     addAccount("root", true);
-    Json::Value params;
-    params["conns"][0] = json(R"({"addr":"127.0.0.1","protocol":"http","port":1})");
+    Json::Value params = json(kOneEndpoint);
     for (const bool tls : {true, false}) {
-        Json::Value conn;
-        conn["addr"] = "127.0.0.1";
+        Json::Value conn = json(R"({"addr":"127.0.0.1"})");
         conn["protocol"] = tls ? "https" : "http";
         conn["port"] = port(tls);
         params["conns"].append(conn);
     }
-    const Reply reply = call(kNode, 1, "test_connection", params, session("root"));
-    EXPECT_EQ(reply.code(), 0);
-    EXPECT_EQ(reply.data(), params["conns"][1]);
-}
-
-/// A call by a process of the appliance through the library.
-Json::Value askLocally(const char *api, const char *method, const char *params = "{}") {
-    Json::Value reply;
-    OVRA::APIRunner().Exec(reply, api, 1, method, json(params), "admin");
-    return reply;
+    EXPECT_EQ(call(kNode, 1, "test_connection", params, session("root")).data(),
+              params["conns"][1]);
 }
 
 TEST_F(Node, ServesItsOwnProcessesAsAdministrators) {
-    EXPECT_EQ(askLocally("OVRA.Core.Farlink", "get")["data"], json(R"({"enabled":false})"));
-    EXPECT_EQ(askLocally(kNode, "test_privilege")["success"], true);
-    EXPECT_EQ(askLocally(kCredential, "create")["error"]["code"], 106);
-    EXPECT_EQ(askLocally("OVRA.Core.Auth", "login")["error"]["code"], 101);
-    EXPECT_EQ(askLocally("OVRA.Core.Auth", "logout")["error"]["code"], 119);
+    EXPECT_EQ(callHere("OVRA.Core.Farlink", 1, "get")["data"], json(R"({"enabled":false})"));
+    EXPECT_EQ(callHere(kNode, 1, "test_privilege")["success"], true);
+    EXPECT_EQ(callHere(kCredential, 1, "create")["error"]["code"], 106);
+    EXPECT_EQ(callHere("OVRA.Core.Auth", 1, "login")["error"]["code"], 101);
+    EXPECT_EQ(callHere("OVRA.Core.Auth", 1, "logout")["error"]["code"], 119);
 }
 
 } // namespace

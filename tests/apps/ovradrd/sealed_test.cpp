@@ -2,8 +2,6 @@
 #include "appliance.h"
 #include "seal/sealing.h"
 
-#include <ovracredential/cred_request.h>
-#include <ovradrcore/json.h>
 #include <ovraplatform/appliance.h>
 #include <ovraplatform/sealed_box.h>
 #include <ovraplatform/wire_form.h>
@@ -23,22 +21,14 @@ protected:
         Appliance::SetUp();
         addAccount("alice", true);
         keys = SealKeyPair::load(kSealKeyFile).value();
-        inner.api = "OVRA.DR.Node";
-        inner.version = 1;
-        inner.method = "test_privilege";
-        inner.sid = session("alice");
+        inner = {{"OVRA.DR.Node", 1, "test_privilege", {}}, session("alice"), ""};
     }
 
     /// The call in its envelope.
     WireCall seal(UnixMillis time) {
-        WireCall outer;
-        outer.api = inner.api;
-        outer.version = inner.version;
-        outer.method = inner.method;
         const auto sealed = sealRequest(keys->publicKey(), inner, time).value();
-        outer.sealed = sealed.envelope;
         replyKey = sealed.replyKey;
-        return outer;
+        return {{inner.api, inner.version, inner.method, {}}, "", sealed.envelope};
     }
     Reply post(const WireCall &outer) const {
         return http({.body = encodeForm(outer).value(), .tls = false});
@@ -53,27 +43,6 @@ protected:
     WireCall inner;
     ReplyKey replyKey;
 };
-
-TEST_F(Sealed, LogInAndCallsWorkOverPlainHttp) {
-    OVRACred *cred = OVRACredAlloc();
-    OVRACredSess *sess = OVRACredSessAlloc();
-    OVRACredItemSetProtocol(cred, "http");
-    OVRACredItemSetHost(cred, "127.0.0.1");
-    OVRACredItemSetPort(cred, port(false));
-    OVRACredItemSetRemoteAccount(cred, "alice");
-    OVRACredItemSetRemotePasswd(cred, kPassword);
-    Json::Value granted;
-    EXPECT_NE(OVRA::CredRequestUtil::LoginWithOTP(cred, "", sess, &granted), 0);
-    EXPECT_EQ(granted["success"], true) << granted;
-    OVRA::CredRequest request;
-    OVRA::CredRequest::CreateWebAPIRequest(request, cred, sess, "OVRA.DR.Node", 1, "test_privilege",
-                                           Json::Value());
-    EXPECT_NE(request.Process(true, 0), 0) << request.GetError();
-    EXPECT_EQ(json(request.GetResponse())["success"], true);
-    EXPECT_NE(OVRA::CredRequestUtil::Logout(cred, sess), 0);
-    OVRACredSessFree(sess);
-    OVRACredFree(cred);
-}
 
 TEST_F(Sealed, IsAnsweredSealedAndRefusedTheSecondTime) {
     const WireCall outer = seal(wallClock());

@@ -1,16 +1,17 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "appliance.h"
+#include "support/sockets.h"
 
 #include <sys/stat.h>
-#include <unistd.h>
 
+#include <array>
 #include <filesystem>
 #include <fstream>
+#include <vector>
 
 namespace {
 
-using OvraTest::Appliance;
-using OvraTest::RawConnection;
+using namespace OvraTest;
 
 const std::string kUrl = "/webman/modules/ovradr/";
 const std::string kFolder = "/usr/ovra/var/ovradr/speedtest";
@@ -31,10 +32,10 @@ protected:
     /// The whole answer to a request whose path is sent unchanged.
     std::string get(const std::string &path, const std::string &headers = "",
                     const std::string &method = "GET") const {
-        const RawConnection client(port(false));
-        client.send(method + " " + path + " HTTP/1.1\r\nHost: a\r\nConnection: close\r\n" +
-                    headers + "\r\n");
-        return client.readAll(std::chrono::seconds(5));
+        const auto client = dial(port(false));
+        say(client, method + " " + path + " HTTP/1.1\r\nHost: a\r\nConnection: close\r\n" +
+                        headers + "\r\n");
+        return hearAll(client);
     }
 };
 
@@ -52,11 +53,8 @@ TEST_F(TestFiles, AreServedOverBothProtocols) {
 }
 
 TEST_F(TestFiles, AreSentInParts) {
-    const struct {
-        const char *range;
-        const char *status;
-        const char *rest; ///< header and body, as far as the range decides them
-    } cases[] = {
+    // The range, the status, and header and body as far as the range decides them.
+    const std::array<const char *, 3> cases[] = {
         {"bytes=2-4", "206", "Content-Range: bytes 2-4/10\r\n"},
         {"bytes=2-4", "206", "\r\n\r\n234"},
         {"bytes=8-", "206", "\r\n\r\n89"},
@@ -70,42 +68,32 @@ TEST_F(TestFiles, AreSentInParts) {
         {"bytes=18446744073709551616-", "200", "\r\n\r\n0123456789"},
         {"lines=1-2", "200", "\r\n\r\n0123456789"},
     };
-    for (const auto &each : cases) {
-        const std::string reply =
-            get(kUrl + named('0'), std::string("Range: ") + each.range + "\r\n");
-        EXPECT_EQ(reply.substr(0, 12), std::string("HTTP/1.1 ") + each.status) << each.range;
-        EXPECT_NE(reply.find(each.rest), std::string::npos) << each.range << reply;
+    for (const auto &[range, status, rest] : cases) {
+        const std::string reply = get(kUrl + named('0'), std::string("Range: ") + range + "\r\n");
+        EXPECT_EQ(reply.substr(9, 3), status) << range;
+        EXPECT_NE(reply.find(rest), std::string::npos) << range << reply;
     }
 }
 
 TEST_F(TestFiles, NothingElseIsReached) {
     const std::string secret = "/usr/ovra/var/ovradr/secret";
+    std::vector<std::string> names{secret, "/etc/passwd", "../../../etc/passwd", "..%2f", ""};
+    for (const char *end : {"/", "0", "/../../secret"}) {
+        names.push_back(named('0') + end);
+    }
+    for (const char *rest : {"/notes", "/../secret", "/%2e%2e/secret", "%2f..%2fsecret", "", "/"}) {
+        names.push_back(kFolder + rest);
+    }
+    names.push_back("/" + named('0'));
     std::ofstream(secret) << "not for peers";
     std::filesystem::create_symlink(secret, named('1'));
     std::filesystem::create_hard_link(secret, named('2'));
     std::ofstream(kFolder + "/notes") << "not for peers";
     ASSERT_EQ(mkfifo(named('3').c_str(), 0600), 0);
     std::filesystem::create_directory(named('4'));
-    const std::string names[] = {named('1'),
-                                 named('2'),
-                                 named('3'),
-                                 named('4'),
-                                 named('5'),
-                                 named('0') + "/",
-                                 named('0') + "0",
-                                 named('0') + "/../../secret",
-                                 kFolder + "/notes",
-                                 kFolder + "/../secret",
-                                 kFolder + "/%2e%2e/secret",
-                                 kFolder + "%2f..%2fsecret",
-                                 kFolder,
-                                 kFolder + "/",
-                                 "/" + named('0'),
-                                 secret,
-                                 "/etc/passwd",
-                                 "../../../etc/passwd",
-                                 "..%2f",
-                                 ""};
+    for (const char digit : {'1', '2', '3', '4', '5'}) {
+        names.push_back(named(digit));
+    }
     for (const std::string &name : names) {
         const std::string reply = get(kUrl + name);
         EXPECT_EQ(reply.substr(0, 12), "HTTP/1.1 404") << name << reply;
@@ -121,9 +109,8 @@ TEST_F(TestFiles, NothingElseIsReached) {
 TEST_F(TestFiles, OnlySoManyAreSentAtOnce) {
     std::filesystem::resize_file(named('0'), 64 << 20);
     restart({}, 1);
-    const std::string request = "GET " + kUrl + named('0') + " HTTP/1.1\r\nHost: a\r\n\r\n";
-    const RawConnection slow(port(false));
-    slow.send(request);
+    const auto slow = dial(port(false));
+    say(slow, "GET " + kUrl + named('0') + " HTTP/1.1\r\nHost: a\r\n\r\n");
     std::string reply;
     for (int i = 0; i < 5000 && reply.substr(0, 12) != "HTTP/1.1 503"; ++i) {
         reply = get(kUrl + named('0'), "Range: bytes=0-1\r\n");

@@ -7,8 +7,11 @@
 #include <unistd.h>
 
 #include <chrono>
+#include <list>
 #include <string>
 #include <thread>
+#include <utility>
+#include <vector>
 
 namespace {
 
@@ -47,56 +50,44 @@ private:
     Connections::Connection *connection_ = nullptr;
 };
 
-TEST(Connections, MakesRoomByEndingTheOneThatWaitedLongestForItsClient) {
-    Connections table({.total = 3});
-    Client working(table, "a");
-    working.enter(Phase::kWorking);
-    Client slow(table, "b");
-    std::this_thread::sleep_for(2ms);
-    Client idle(table, "c");
-    idle.enter(Phase::kIdle);
-
-    EXPECT_TRUE(table.admit("d"));
-    EXPECT_TRUE(slow.isShut());
-    EXPECT_FALSE(idle.isShut());
-    EXPECT_FALSE(working.isShut());
-}
-
-TEST(Connections, KeepsOneClientFromTakingTheRoomOfOthers) {
-    Connections table({.total = 10, .perClient = 2});
-    Client other(table, "b");
-    std::this_thread::sleep_for(2ms);
-    Client first(table, "a");
-    std::this_thread::sleep_for(2ms);
-    Client second(table, "a");
-    EXPECT_TRUE(table.admit("a"));
-    EXPECT_TRUE(first.isShut());
-    EXPECT_FALSE(second.isShut());
-    EXPECT_FALSE(other.isShut());
-}
-
-TEST(Connections, RefusesWhenEveryConnectionIsBeingServed) {
-    Connections table({.total = 2});
-    Client working(table, "a");
-    working.enter(Phase::kWorking);
-    Client replying(table, "a");
-    replying.enter(Phase::kReplying);
-    EXPECT_FALSE(table.admit("b"));
-    EXPECT_FALSE(working.isShut());
-    EXPECT_FALSE(replying.isShut());
+TEST(Connections, MakeRoomByEndingTheOneThatWaitedLongestOfAllOrOfAClientWithTooMany) {
+    const struct {
+        ConnectionLimits limits;
+        std::vector<std::pair<const char *, Phase>> open;
+        const char *next;
+        int ended; ///< of those; -1: none, the next one is refused
+    } scenes[] = {{{.total = 3},
+                   {{"a", Phase::kWorking}, {"b", Phase::kArriving}, {"c", Phase::kIdle}},
+                   "d",
+                   1},
+                  {{.total = 10, .perClient = 2},
+                   {{"b", Phase::kArriving}, {"a", Phase::kArriving}, {"a", Phase::kArriving}},
+                   "a",
+                   1},
+                  {{.total = 2}, {{"a", Phase::kWorking}, {"a", Phase::kReplying}}, "b", -1}};
+    for (const auto &scene : scenes) {
+        Connections table(scene.limits);
+        std::list<Client> clients;
+        for (const auto &[name, phase] : scene.open) {
+            clients.emplace_back(table, name).enter(phase);
+            std::this_thread::sleep_for(2ms);
+        }
+        EXPECT_EQ(table.admit(scene.next), scene.ended >= 0);
+        int number = 0;
+        for (const Client &client : clients) {
+            EXPECT_EQ(client.isShut(), number++ == scene.ended) << scene.next << number;
+        }
+    }
 }
 
 TEST(Connections, CountsOneThatIsClosedNoMore) {
     Connections table({.total = 1});
-    { const Client gone(table, "a"); }
-    const Client present(table, "a");
-    EXPECT_FALSE(present.isShut());
+    Client(table, "a").enter(Phase::kWorking);
+    EXPECT_TRUE(table.admit("a"));
 }
 
 TEST(Connections, EndWhenTheTimeOfTheirPhaseIsOver) {
-    ConnectionLimits limits;
-    limits.arriving = limits.idle = limits.replying = 100ms;
-    Connections table(limits);
+    Connections table({.arriving = 100ms, .idle = 100ms, .replying = 100ms});
     for (const Phase phase : {Phase::kArriving, Phase::kIdle, Phase::kReplying, Phase::kWorking}) {
         Client client(table, "a");
         client.enter(phase);
@@ -105,9 +96,7 @@ TEST(Connections, EndWhenTheTimeOfTheirPhaseIsOver) {
 }
 
 TEST(Connections, DoNotGiveANewConnectionMoreTimeBecauseItsHeaderCame) {
-    ConnectionLimits limits;
-    limits.arriving = 600ms;
-    Connections table(limits);
+    Connections table({.arriving = 600ms});
     Client client(table, "a");
     std::this_thread::sleep_for(400ms);
     client.beginRequest();

@@ -1,38 +1,29 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
+#include <ovrabase/address.h>
 #include <ovrabase/unique_fd.h>
 
-#include <arpa/inet.h>
 #include <gtest/gtest.h>
 #include <sys/socket.h>
 
 #include <cerrno>
 #include <string>
 
-// Both ends of the relay's connections.
-namespace FarlinkdTest {
+// Plain connections to a server on 127.0.0.1.
+namespace OvraTest {
 
 inline OvraBase::UniqueFd dial(int port) {
     OvraBase::UniqueFd fd(socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0));
-    sockaddr_in address{};
-    address.sin_family = AF_INET;
-    address.sin_port = htons(static_cast<std::uint16_t>(port));
-    address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
-    const timeval patience{10, 0};
+    const auto address = OvraBase::parseAddress("127.0.0.1", port);
+    const timeval patience{20, 0};
     setsockopt(fd.get(), SOL_SOCKET, SO_RCVTIMEO, &patience, sizeof patience);
-    EXPECT_EQ(connect(fd.get(), reinterpret_cast<sockaddr *>(&address), sizeof address), 0);
+    EXPECT_EQ(connect(fd.get(), address->get(), address->size), 0);
     return fd;
 }
 
 inline void say(const OvraBase::UniqueFd &fd, const std::string &text) {
-    for (std::size_t done = 0; done < text.size();) {
-        const ssize_t size = send(fd.get(), &text[done], text.size() - done, MSG_NOSIGNAL);
-        if (size <= 0) {
-            return;
-        }
-        done += static_cast<std::size_t>(size);
-    }
+    (void)!send(fd.get(), text.data(), text.size(), MSG_NOSIGNAL); // waits until all is taken
 }
 
 inline std::string hear(const OvraBase::UniqueFd &fd) {
@@ -41,7 +32,13 @@ inline std::string hear(const OvraBase::UniqueFd &fd) {
     return size < 0 ? "timeout" : text.substr(0, static_cast<std::size_t>(size));
 }
 
-/// Reads until the other end closes, or 10 seconds pass without a byte ("timeout").
+/// Whether the other end has neither closed nor sent anything.
+inline bool isOpen(const OvraBase::UniqueFd &fd) {
+    char byte = 0;
+    return recv(fd.get(), &byte, 1, MSG_PEEK | MSG_DONTWAIT) < 0 && errno == EAGAIN;
+}
+
+/// Reads until the other end closes, or 20 seconds pass without a byte ("timeout").
 inline std::string hearAll(const OvraBase::UniqueFd &fd) {
     std::string all;
     std::string buffer(1 << 16, '\0');
@@ -54,4 +51,4 @@ inline std::string hearAll(const OvraBase::UniqueFd &fd) {
     }
 }
 
-} // namespace FarlinkdTest
+} // namespace OvraTest
