@@ -62,21 +62,13 @@ void OvraCgiFree(OvraCgi *handle) {
 
 int OvraCgiSetOption(OvraCgi *handle, int option, const void *value) {
     Session &session = *handle->store;
-    switch (option) {
-    case OVRA_CGI_OPT_TIMEOUT:
+    const std::map<int, std::string *> texts = {{OVRA_CGI_OPT_APP, &session.app},
+                                                {OVRA_CGI_OPT_EXTRA, &session.extra},
+                                                {OVRA_CGI_OPT_UI, &session.ui}};
+    if (const auto text = texts.find(option); text != texts.end()) {
+        *text->second = static_cast<const char *>(value);
+    } else if (option == OVRA_CGI_OPT_TIMEOUT) {
         session.timeout = *static_cast<const int *>(value);
-        break;
-    case OVRA_CGI_OPT_APP:
-        session.app = static_cast<const char *>(value);
-        break;
-    case OVRA_CGI_OPT_EXTRA:
-        session.extra = static_cast<const char *>(value);
-        break;
-    case OVRA_CGI_OPT_UI:
-        session.ui = static_cast<const char *>(value);
-        break;
-    default:
-        break;
     }
     return cgiLibrary().refusedOptions.count(option) == 0 ? 1 : 0;
 }

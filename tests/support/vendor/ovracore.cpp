@@ -25,10 +25,7 @@ std::vector<std::string> linesOf(const char *path) {
     return lines;
 }
 
-std::map<FILE *, pid_t> &programs() {
-    static std::map<FILE *, pid_t> running;
-    return running;
-}
+std::map<FILE *, pid_t> programs;
 
 } // namespace
 
@@ -90,14 +87,14 @@ FILE *OLIBCPopen(const char *path, const char *mode, ...) {
     }
     close(ends[1]);
     FILE *stream = fdopen(ends[0], mode);
-    programs()[stream] = child;
+    programs[stream] = child;
     ++coreLibrary().streams;
     return stream;
 }
 
 int OLIBCPclose(FILE *stream) {
-    const pid_t child = programs().at(stream);
-    programs().erase(stream);
+    const pid_t child = programs.at(stream);
+    programs.erase(stream);
     --coreLibrary().streams;
     fclose(stream);
     int status = -1;

@@ -24,12 +24,6 @@ namespace {
 
 constexpr int kCannotConnect = 5;
 
-/// An item as the C functions take it: rejected if empty.
-int setItem(std::string &item, const char *value) {
-    item = value;
-    return item.empty() ? -1 : 0;
-}
-
 /// Null if it cannot be reached.
 Remote *findRemote(const OVRACred &cred) {
     auto &remotes = credentialLibrary().remotes;
@@ -70,23 +64,23 @@ void OVRACredSessFree(OVRACredSess *sess) {
     delete sess;
 }
 int OVRACredItemSetProtocol(OVRACred *cred, const char *protocol) {
-    return setItem(cred->protocol, protocol);
+    return (cred->protocol = protocol).empty() ? -1 : 0;
 }
 int OVRACredItemSetHost(OVRACred *cred, const char *host) {
-    return setItem(cred->host, host);
+    return (cred->host = host).empty() ? -1 : 0;
 }
 int OVRACredItemSetPort(OVRACred *cred, int port) {
     cred->port = port;
     return 0;
 }
 int OVRACredItemSetRemoteAccount(OVRACred *cred, const char *account) {
-    return setItem(cred->account, account);
+    return (cred->account = account).empty() ? -1 : 0;
 }
 int OVRACredItemSetRemotePasswd(OVRACred *cred, const char *passwd) {
-    return setItem(cred->password, passwd);
+    return (cred->password = passwd).empty() ? -1 : 0;
 }
 int OVRACredSessItemSetAccessToken(OVRACredSess *sess, const char *token) {
-    return setItem(sess->token, token);
+    return (sess->token = token).empty() ? -1 : 0;
 }
 }
 
