@@ -10,56 +10,23 @@
 #include <ovrabase/lock.h>
 
 #include <fcntl.h>
-#include <pthread.h>
 #include <unistd.h>
 
-#include <algorithm>
 #include <atomic>
 #include <cerrno>
-#include <mutex>
-#include <utility>
-#include <vector>
 
 namespace OvraDRCore {
-
-/// The lock files that this process has open. A child of fork(2) shares them, and a lock stays
-/// until the last process has closed its file, so the child closes its copies. The guard is held
-/// while one is opened, locked or closed, and over fork(2).
-class RefreshLock::OpenLocks {
-public:
-    static OpenLocks &instance() {
-        static auto *const locks = new OpenLocks; // outlives the threads that use it
-        return *locks;
-    }
-
-    std::mutex guard;
-    std::vector<RefreshLock *> all;
-
-private:
-    OpenLocks() {
-        pthread_atfork([] { instance().guard.lock(); }, [] { instance().guard.unlock(); },
-                       [] {
-                           for (RefreshLock *const lock : std::exchange(instance().all, {})) {
-                               lock->file_.reset();
-                           }
-                           instance().guard.unlock();
-                       });
-    }
-};
 
 RefreshLock::RefreshLock(const std::string &path, const std::string &name)
     : path_(path + ".lock")
     , offset_(static_cast<off_t>(cacheNameHash(name) >> 2U)) {} // positive, with room after it
 
 RefreshLock::~RefreshLock() {
-    const std::lock_guard lock(OpenLocks::instance().guard);
     close();
 }
 
 void RefreshLock::close() {
     if (file_) {
-        std::vector<RefreshLock *> &all = OpenLocks::instance().all;
-        all.erase(std::find(all.begin(), all.end(), this));
         OvraBase::unlockByte(file_.get(), offset_);
         file_.reset();
     }
@@ -67,19 +34,15 @@ void RefreshLock::close() {
 
 /// \return 0 or an errno; EAGAIN if another one holds the lock.
 int RefreshLock::tryLock() {
+    const NoFork noFork;
     constexpr int kAttempts = 100; // another process may replace the file at every one
     for (int attempt = 0; attempt < kAttempts; ++attempt) {
-        OvraBase::UniqueFd opened;
         if (!file_) {
-            opened = openOrReplaceCacheFile(path_, O_RDWR | O_CREAT);
+            OvraBase::UniqueFd opened = openOrReplaceCacheFile(path_, O_RDWR | O_CREAT);
             if (!opened) {
                 return errno;
             }
-        }
-        const std::lock_guard lock(OpenLocks::instance().guard);
-        if (!file_) {
-            file_ = std::move(opened);
-            OpenLocks::instance().all.push_back(this);
+            file_.reset(opened.release());
         }
         const auto locked = OvraBase::lockByte(file_.get(), offset_, {});
         if (!locked) {
@@ -119,10 +82,7 @@ void RefreshLock::takeOver() {
     if (current) {
         unlink(path_.c_str());
     }
-    {
-        const std::lock_guard lock(OpenLocks::instance().guard);
-        close();
-    }
+    close();
     tryAcquire();
 }
 

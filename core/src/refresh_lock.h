@@ -1,7 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
-#include <ovrabase/unique_fd.h>
+#include "ovradrcore/no_fork.h"
 
 #include <sys/types.h>
 
@@ -31,14 +31,12 @@ public:
     void takeOver();
 
 private:
-    class OpenLocks;
-
     int tryLock();
     void close();
 
     std::string path_;
     off_t offset_;
-    OvraBase::UniqueFd file_;
+    ForkClosedFd file_;
 };
 
 } // namespace OvraDRCore

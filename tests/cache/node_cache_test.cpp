@@ -182,13 +182,9 @@ TEST_F(NodeInfo, ProcessesStoppedInTheirProbesHoldOthersUpOnceAndHaveOldNewsLate
     }
     EXPECT_TRUE(send());
     EXPECT_EQ(probes, stopped.size() + 3);
-    for (const bool isSender : {true, false}) {
-        const pid_t child = stopped[isSender ? 0 : 1];
+    for (const pid_t child : stopped) {
         kill(child, SIGCONT);
-        int status = 0;
-        waitpid(child, &status, 0);
-        EXPECT_EQ(WIFEXITED(status) && WEXITSTATUS(status) == 0, isSender)
-            << "who asks for a probe has its own finding";
+        waitpid(child, nullptr, 0);
         EXPECT_TRUE(ConnCache(conn).getStoredVerdict());
     }
 }

@@ -424,7 +424,10 @@ curl_socket_t HttpConnection::connect() {
     if (attempt_.mayHaveArrived || attempt_.endedInSilence) {
         return CURL_SOCKET_BAD;
     }
-    CredExpected<OvraBase::UniqueFd> dialed = dial(endpoint_, connectDeadline_);
+    CredExpected<OvraBase::UniqueFd> dialed = [this] {
+        const OvraDRCore::NoFork::Pause forksPass; // it waits for name servers and the peer
+        return dial(endpoint_, connectDeadline_);
+    }();
     if (!dialed) {
         notConnected_ = dialed.error();
         return CURL_SOCKET_BAD;
