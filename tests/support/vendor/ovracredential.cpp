@@ -26,7 +26,7 @@ constexpr int kCannotConnect = 5;
 
 /// Null if it cannot be reached.
 Remote *findRemote(const OVRACred &cred) {
-    auto &remotes = credentialLibrary().remotes;
+    auto &remotes = credentialLibrary.remotes;
     const auto found =
         remotes.find(cred.protocol + "://" + cred.host + ":" + std::to_string(cred.port));
     return found != remotes.end() && found->second.reachable ? &found->second : nullptr;
@@ -41,26 +41,21 @@ Json::Value refusal(int code) {
 
 } // namespace
 
-OvraVendor::CredentialLibrary &OvraVendor::credentialLibrary() {
-    static CredentialLibrary library;
-    return library;
-}
-
 extern "C" {
 OVRACred *OVRACredAlloc() {
-    ++credentialLibrary().credentials;
+    ++credentialLibrary.credentials;
     return new OVRACred;
 }
 void OVRACredFree(OVRACred *cred) {
-    --credentialLibrary().credentials;
+    --credentialLibrary.credentials;
     delete cred;
 }
 OVRACredSess *OVRACredSessAlloc() {
-    ++credentialLibrary().sessions;
+    ++credentialLibrary.sessions;
     return new OVRACredSess;
 }
 void OVRACredSessFree(OVRACredSess *sess) {
-    --credentialLibrary().sessions;
+    --credentialLibrary.sessions;
     delete sess;
 }
 int OVRACredItemSetProtocol(OVRACred *cred, const char *protocol) {
@@ -94,11 +89,11 @@ struct CredRequest::Impl {
 
 CredRequest::CredRequest()
     : impl_(std::make_unique<Impl>()) {
-    ++credentialLibrary().requests;
+    ++credentialLibrary.requests;
 }
 
 CredRequest::~CredRequest() {
-    --credentialLibrary().requests;
+    --credentialLibrary.requests;
 }
 
 int CredRequest::SetURL(const std::string &protocol, const std::string &address, int port,
@@ -176,8 +171,8 @@ int CredRequestUtil::Logout(OVRACred *cred, OVRACredSess *sess) {
 
 int CredRequestFarlink::GetConnInfo(const std::string &alias, Json::Value &info,
                                     const void * /*options*/) {
-    const auto found = credentialLibrary().relay.find(alias);
-    if (found == credentialLibrary().relay.end()) {
+    const auto found = credentialLibrary.relay.find(alias);
+    if (found == credentialLibrary.relay.end()) {
         return 0;
     }
     info = found->second;
