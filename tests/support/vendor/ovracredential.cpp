@@ -23,59 +23,12 @@ struct _tag_ovra_cred_sess_ {
 namespace {
 
 constexpr int kCannotConnect = 5;
-constexpr int kInvalid = 1;
-constexpr int kMaxTimeout = 86400;
 
-std::set<const void *> &liveObjects() {
-    static std::set<const void *> objects;
-    return objects;
-}
-
-template <typename Object>
-Object *obtain(OvraVendor::Live &live) {
-    auto *object = new Object;
-    liveObjects().insert(object);
-    live.obtained();
-    return object;
-}
-
-template <typename Object>
-void giveBack(Object *object, OvraVendor::Live &live) {
-    if (object == nullptr) {
-        return;
-    }
-    if (liveObjects().erase(object) == 0) {
-        ++live.misused;
-        return;
-    }
-    live.givenBack();
-    delete object;
-}
-
-bool isLive(const OVRACred *cred) {
-    const bool live = liveObjects().count(cred) == 1;
-    credentialLibrary().credentials.misused += live ? 0 : 1;
-    return live;
-}
-bool isLive(const OVRACredSess *sess) {
-    const bool live = liveObjects().count(sess) == 1;
-    credentialLibrary().sessions.misused += live ? 0 : 1;
-    return live;
-}
-
-/// An item as the C functions take it: rejected if empty.
-template <typename Object>
-int setItem(Object *object, std::string Object::*item, const char *value) {
-    if (!isLive(object) || value == nullptr || *value == '\0') {
-        return -1;
-    }
-    object->*item = value;
-    return 0;
-}
-
-Remote *findRemote(const std::string &protocol, const std::string &host, int port) {
-    auto &remotes = credentialLibrary().remotes;
-    const auto found = remotes.find(protocol + "://" + host + ":" + std::to_string(port));
+/// Null if it cannot be reached.
+Remote *findRemote(const OVRACred &cred) {
+    auto &remotes = credentialLibrary.remotes;
+    const auto found =
+        remotes.find(cred.protocol + "://" + cred.host + ":" + std::to_string(cred.port));
     return found != remotes.end() && found->second.reachable ? &found->second : nullptr;
 }
 
@@ -88,88 +41,73 @@ Json::Value refusal(int code) {
 
 } // namespace
 
-OvraVendor::CredentialLibrary &OvraVendor::credentialLibrary() {
-    static CredentialLibrary library;
-    return library;
-}
-
 extern "C" {
 OVRACred *OVRACredAlloc() {
-    return obtain<OVRACred>(credentialLibrary().credentials);
+    ++credentialLibrary.credentials;
+    return new OVRACred;
 }
 void OVRACredFree(OVRACred *cred) {
-    giveBack(cred, credentialLibrary().credentials);
+    --credentialLibrary.credentials;
+    delete cred;
 }
 OVRACredSess *OVRACredSessAlloc() {
-    return obtain<OVRACredSess>(credentialLibrary().sessions);
+    ++credentialLibrary.sessions;
+    return new OVRACredSess;
 }
 void OVRACredSessFree(OVRACredSess *sess) {
-    giveBack(sess, credentialLibrary().sessions);
+    --credentialLibrary.sessions;
+    delete sess;
 }
 int OVRACredItemSetProtocol(OVRACred *cred, const char *protocol) {
-    return setItem(cred, &OVRACred::protocol, protocol);
+    return (cred->protocol = protocol).empty() ? -1 : 0;
 }
 int OVRACredItemSetHost(OVRACred *cred, const char *host) {
-    return setItem(cred, &OVRACred::host, host);
+    return (cred->host = host).empty() ? -1 : 0;
 }
 int OVRACredItemSetPort(OVRACred *cred, int port) {
-    if (!isLive(cred) || port < 1 || port > 65535) {
-        return -1;
-    }
     cred->port = port;
     return 0;
 }
 int OVRACredItemSetRemoteAccount(OVRACred *cred, const char *account) {
-    return setItem(cred, &OVRACred::account, account);
+    return (cred->account = account).empty() ? -1 : 0;
 }
 int OVRACredItemSetRemotePasswd(OVRACred *cred, const char *passwd) {
-    return setItem(cred, &OVRACred::password, passwd);
+    return (cred->password = passwd).empty() ? -1 : 0;
 }
 int OVRACredSessItemSetAccessToken(OVRACredSess *sess, const char *token) {
-    return setItem(sess, &OVRACredSess::token, token);
+    return (sess->token = token).empty() ? -1 : 0;
 }
 }
 
 namespace OVRA {
 
 struct CredRequest::Impl {
-    std::string protocol, host;
-    int port = -1;
+    Remote *remote = nullptr; ///< null: cannot be reached
     Call call;
     std::string response;
-    int error = 0;
 };
 
 CredRequest::CredRequest()
     : impl_(std::make_unique<Impl>()) {
-    credentialLibrary().requests.obtained();
+    ++credentialLibrary.requests;
 }
 
 CredRequest::~CredRequest() {
-    credentialLibrary().requests.givenBack();
+    --credentialLibrary.requests;
 }
 
 int CredRequest::SetURL(const std::string &protocol, const std::string &address, int port,
                         const std::string &path) {
-    if (address.empty() || path != "webapi/query.cgi") {
-        return 0;
-    }
-    impl_->protocol = protocol;
-    impl_->host = address;
-    impl_->port = port;
-    return 1;
+    impl_->remote = findRemote({protocol, address, "", "", port});
+    return path == "webapi/query.cgi" ? 1 : 0;
 }
 
 int CredRequest::SetDefaultTimeout(long seconds) {
-    return SetResponseTimeout(seconds);
+    return seconds > 0 ? 1 : 0;
 }
 
 int CredRequest::SetResponseTimeout(long seconds) {
-    if (seconds < 1 || seconds > kMaxTimeout) {
-        return 0;
-    }
-    impl_->call.timeout = seconds;
-    return 1;
+    return seconds > 0 ? 1 : 0;
 }
 
 int CredRequest::SetEncryptMode(int mode) {
@@ -177,57 +115,27 @@ int CredRequest::SetEncryptMode(int mode) {
     return 1;
 }
 
-int CredRequest::SetUploadFile(const std::string &path, const std::string &name) {
-    impl_->call.uploadName = name;
-    return path.empty() ? 0 : 1;
+int CredRequest::SetUploadFile(const std::string & /*path*/, const std::string & /*name*/) {
+    return 0;
 }
 
 int CredRequest::CreateWebAPIRequest(CredRequest &req, OVRACred *cred, OVRACredSess *sess,
                                      const std::string &api, int version, const std::string &method,
                                      const Json::Value &params) {
-    if (!isLive(cred) || (sess != nullptr && !isLive(sess)) || api.empty() || method.empty()) {
-        req.impl_->error = kInvalid;
-        return 0;
-    }
-    req.impl_->protocol = cred->protocol;
-    req.impl_->host = cred->host;
-    req.impl_->port = cred->port;
-    req.impl_->call.session = sess != nullptr ? sess->token : "";
-    req.impl_->call.api = api;
-    req.impl_->call.method = method;
-    req.impl_->call.version = version;
-    req.impl_->call.params = params;
+    req.impl_->remote = findRemote(*cred);
+    req.impl_->call = {sess != nullptr ? sess->token : "", api, method, version, params};
     return 1;
 }
 
 int CredRequest::Process(bool /*reuse*/, int mode) {
-    impl_->response.clear();
-    Remote *remote = findRemote(impl_->protocol, impl_->host, impl_->port);
-    if (remote == nullptr) {
-        impl_->error = kCannotConnect;
-        return 0;
+    Remote *const remote = impl_->remote;
+    if (remote != nullptr && mode != 2) {
+        remote->calls.push_back(impl_->call);
+        const bool known = remote->sessions.count(impl_->call.session) == 1;
+        impl_->response = Json::writeString(Json::StreamWriterBuilder(),
+                                            known ? remote->answer(impl_->call) : refusal(119));
     }
-    if (mode == 2) {
-        ++remote->probes;
-        impl_->error = 0;
-        return 1;
-    }
-    impl_->error = remote->error;
-    if (remote->error != 0) {
-        return 0;
-    }
-    remote->calls.push_back(impl_->call);
-    const bool known = remote->sessions.count(impl_->call.session) == 1;
-    Json::Value document = refusal(119);
-    if (known) {
-        document = Json::Value();
-        document["success"] = true;
-        if (remote->answer) {
-            document = remote->answer(impl_->call);
-        }
-    }
-    impl_->response = Json::writeString(Json::StreamWriterBuilder(), document);
-    return 1;
+    return remote != nullptr ? 1 : 0;
 }
 
 std::string CredRequest::GetResponse() const {
@@ -235,22 +143,15 @@ std::string CredRequest::GetResponse() const {
 }
 
 int CredRequest::GetError() const {
-    return impl_->error;
+    return impl_->remote != nullptr ? 0 : kCannotConnect;
 }
 
 int CredRequestUtil::LoginWithOTP(OVRACred *cred, const std::string &otp, OVRACredSess *sess,
                                   Json::Value *out) {
-    if (!isLive(cred) || !isLive(sess) || out == nullptr) {
-        return 0;
-    }
-    Remote *remote = findRemote(cred->protocol, cred->host, cred->port);
-    if (remote == nullptr) {
-        *out = refusal(100);
-        return 0;
-    }
-    if (cred->account + "/" + cred->password + "/" + otp != remote->login) {
-        *out = refusal(remote->refusal);
-        return 1;
+    Remote *const remote = findRemote(*cred);
+    if (remote == nullptr || cred->account + "/" + cred->password + "/" + otp != remote->login) {
+        *out = refusal(remote != nullptr ? remote->refusal : 100);
+        return remote != nullptr ? 1 : 0;
     }
     sess->token = "login-" + std::to_string(++remote->logins);
     remote->sessions.insert(sess->token);
@@ -261,22 +162,17 @@ int CredRequestUtil::LoginWithOTP(OVRACred *cred, const std::string &otp, OVRACr
 }
 
 int CredRequestUtil::Logout(OVRACred *cred, OVRACredSess *sess) {
-    if (!isLive(cred) || !isLive(sess)) {
-        return 0;
-    }
-    Remote *remote = findRemote(cred->protocol, cred->host, cred->port);
-    const bool ended = remote != nullptr && remote->sessions.erase(sess->token) == 1;
+    Remote *const remote = findRemote(*cred);
     if (remote != nullptr) {
         ++remote->logouts;
     }
-    sess->token.clear();
-    return ended ? 1 : 0;
+    return remote != nullptr && remote->sessions.erase(sess->token) == 1 ? 1 : 0;
 }
 
 int CredRequestFarlink::GetConnInfo(const std::string &alias, Json::Value &info,
                                     const void * /*options*/) {
-    const auto found = credentialLibrary().relay.find(alias);
-    if (found == credentialLibrary().relay.end()) {
+    const auto found = credentialLibrary.relay.find(alias);
+    if (found == credentialLibrary.relay.end()) {
         return 0;
     }
     info = found->second;

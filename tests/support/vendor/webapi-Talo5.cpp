@@ -6,36 +6,26 @@
 
 #include <ovrawebapi/api_runner.h>
 
-OvraVendor::WebApiLibrary &OvraVendor::webApiLibrary() {
-    static WebApiLibrary library;
-    return library;
-}
-
 namespace OVRA {
 
 APIRunner::APIRunner() {
-    OvraVendor::webApiLibrary().runners.obtained();
+    ++OvraVendor::webApiLibrary.runners;
 }
 
 APIRunner::~APIRunner() {
-    OvraVendor::webApiLibrary().runners.givenBack();
+    --OvraVendor::webApiLibrary.runners;
 }
 
 bool APIRunner::Exec(Json::Value &out, const char *api, int version, const char *method,
                      const Json::Value &params, const char *user) {
-    const auto &answer = OvraVendor::webApiLibrary().answer;
+    const auto &answer = OvraVendor::webApiLibrary.answer;
     if (!answer) {
         out = Json::Value();
         out["success"] = false;
         out["error"]["code"] = 100;
         return false;
     }
-    OvraVendor::Call call;
-    call.api = api;
-    call.method = method;
-    call.version = version;
-    call.params = params;
-    out = answer(call, user);
+    out = answer({"", api, method, version, params}, user);
     return true;
 }
 
