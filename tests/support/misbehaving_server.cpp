@@ -299,10 +299,10 @@ void MisbehavingServer::closeConnections() {
 }
 
 void MisbehavingServer::deafen() {
-    const std::lock_guard<std::mutex> lock(impl_->mutex);
+    const std::lock_guard lock(mutex_);
     sock_filter nothing{BPF_RET | BPF_K, 0, 0, 0};
     const sock_fprog filter{1, &nothing};
-    for (const int fd : impl_->open) {
+    for (const int fd : open_) {
         setsockopt(fd, SOL_SOCKET, SO_ATTACH_FILTER, &filter, sizeof filter);
     }
 }
