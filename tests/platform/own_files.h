@@ -35,12 +35,6 @@ inline unsigned int modeOf(const std::string &path) {
     return lstat(path.c_str(), &status) == 0 ? status.st_mode & 07777U : 0U;
 }
 
-/// How the sandbox around this program works: root, user or proot.
-inline std::string labWay() {
-    const char *const way = std::getenv("OVRADR_LAB_WAY");
-    return way != nullptr ? way : "";
-}
-
 /// A fixture with its own folder. The fixed paths of the appliance may be used too.
 class OwnFiles : public testing::Test {
 protected:
@@ -50,12 +44,10 @@ protected:
         folder_ = pattern;
     }
     void TearDown() override {
-        if (!folder_.empty()) {
-            std::filesystem::remove_all(folder_);
-            std::filesystem::remove_all(OvraPlatform::kConfigDir);
-            std::filesystem::remove_all(OvraPlatform::kStateDir);
-            umask(022);
-        }
+        std::filesystem::remove_all(folder_);
+        std::filesystem::remove_all(OvraPlatform::kConfigDir);
+        std::filesystem::remove_all(OvraPlatform::kStateDir);
+        umask(022);
     }
 
     std::string path(const std::string &name) const { return folder_ + "/" + name; }

@@ -104,12 +104,4 @@ TEST(APIRunner, RunsTheHandlersThatItsProcessHostsAsALocalAdministrator) {
     EXPECT_EQ(APIRegistry::hosted(), nullptr);
 }
 
-TEST(APIValidator, AcceptsPortsOnly) {
-    EXPECT_TRUE(OVRA::APIValidator::IsPort(1));
-    EXPECT_TRUE(OVRA::APIValidator::IsPort(65535));
-    EXPECT_FALSE(OVRA::APIValidator::IsPort(0));
-    EXPECT_FALSE(OVRA::APIValidator::IsPort(65536));
-    EXPECT_FALSE(OVRA::APIValidator::IsPort(-1));
-}
-
 } // namespace
