@@ -77,18 +77,6 @@ TEST_F(JudgeScene, AcceptsWhatTheSystemAcceptsForThatNameOrAddressWhateverWasPin
     }
 }
 
-TEST_F(JudgeScene, PinsAKeyItMeetsFirstOnlyWhenItIsTold) {
-    CertificateVerifier first = judge();
-    ASSERT_TRUE(shakeHands(first, server_, nullptr));
-    EXPECT_EQ(first.verdict(), Verdict::kNew);
-    EXPECT_TRUE(TrustStore().list()->empty());
-    EXPECT_TRUE(first.pinNewKey());
-
-    CertificateVerifier second = judge();
-    EXPECT_TRUE(shakeHands(second, server_, nullptr));
-    EXPECT_EQ(second.verdict(), Verdict::kPinned);
-}
-
 TEST_F(JudgeScene, EndsTheHandshakeWithAnotherKeyAndWhenThePinnedKeysCannotBeRead) {
     TrustStore().pin("https://nas.example:5001", fingerprintOf(other_.certificate()));
     CertificateVerifier strict = judge();

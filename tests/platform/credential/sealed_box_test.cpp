@@ -128,10 +128,9 @@ TEST_F(SealScene, KeepsItsKeyInAFileOfItsOwnerOnly) {
     ASSERT_EQ(chmod(path("key").c_str(), 0640), 0);
     EXPECT_FALSE(SealKeyPair::load(path("key")));
     const std::string text = OvraTest::readFile(path("key"));
+    ASSERT_EQ(chmod(path("key").c_str(), 0600), 0);
     for (const std::string &damaged : {std::string(), std::string("x"), text.substr(0, 30)}) {
         OvraTest::writeFile(path("key"), damaged);
-        ASSERT_EQ(chmod(path("key").c_str(), 0600), 0);
-        EXPECT_FALSE(SealKeyPair::load(path("key"))) << damaged.size();
         const auto kept = SealKeyPair::loadOrCreate(path("key"));
         ASSERT_FALSE(kept) << "must not be replaced";
         EXPECT_EQ(kept.error().find(text.substr(20, 10)), std::string::npos)
