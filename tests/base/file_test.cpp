@@ -8,8 +8,6 @@
 #include <cerrno>
 #include <filesystem>
 #include <fstream>
-#include <thread>
-#include <vector>
 
 using namespace OvraBase;
 
@@ -67,16 +65,6 @@ TEST_F(Files, ThatExistAreNeverReplacedByCreation) {
     EXPECT_EQ(createFile(path("missing/new"), "", 0600).error().number, ENOENT);
     const auto entries = std::filesystem::directory_iterator(folder);
     EXPECT_EQ(std::distance(begin(entries), end(entries)), 1) << "something was left behind";
-}
-
-TEST_F(Files, AreCreatedByOneOfManyThatTryAtOnce) {
-    std::atomic<int> made = 0;
-    std::vector<std::jthread> threads;
-    for (int i = 0; i < 8; ++i) {
-        threads.emplace_back([&] { made += createFile(path("new"), "x", 0600).value() ? 1 : 0; });
-    }
-    threads.clear();
-    EXPECT_EQ(made, 1);
 }
 
 TEST_F(Files, KeepTheirModeWhenTheyAreReplacedAsNoFolderEverIs) {

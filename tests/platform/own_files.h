@@ -11,10 +11,8 @@
 #include <unistd.h>
 
 #include <csignal>
-#include <cstdlib>
 #include <filesystem>
 #include <fstream>
-#include <sstream>
 #include <string>
 
 namespace OvraTest {
@@ -25,9 +23,8 @@ inline void writeFile(const std::string &path, const std::string &content) {
 }
 
 inline std::string readFile(const std::string &path) {
-    std::ostringstream content;
-    content << std::ifstream(path, std::ios::binary).rdbuf();
-    return content.str();
+    std::ifstream file(path, std::ios::binary);
+    return {std::istreambuf_iterator<char>(file), {}};
 }
 
 inline unsigned int modeOf(const std::string &path) {

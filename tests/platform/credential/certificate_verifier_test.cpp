@@ -41,17 +41,10 @@ bool shakeHands(CertificateVerifier &judge, const OvraTest::TestCertificate &ser
     SSL_set_bio(clientEnd.get(), two, two);
     SSL_set_accept_state(serverEnd.get());
     SSL_set_connect_state(clientEnd.get());
-    for (int i = 0; i < 10; ++i) {
-        const int client = SSL_do_handshake(clientEnd.get());
-        if (client == 1) {
-            return true;
-        }
-        if (SSL_get_error(clientEnd.get(), client) == SSL_ERROR_SSL) {
-            return false;
-        }
+    for (int i = 0; i < 10 && SSL_do_handshake(clientEnd.get()) != 1; ++i) {
         SSL_do_handshake(serverEnd.get());
     }
-    return false;
+    return SSL_is_init_finished(clientEnd.get()) != 0;
 }
 
 class JudgeScene : public OvraTest::OwnFiles {
