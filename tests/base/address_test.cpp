@@ -45,9 +45,7 @@ TEST(Address, AHostHasOneSpelling) {
     EXPECT_EQ(joinHostPort("2001:db8::1", 5001), "[2001:db8::1]:5001");
     EXPECT_EQ(joinHostPort("nas.example", 80), "nas.example:80");
     EXPECT_EQ(toLower("NAS-1.Example"), "nas-1.example");
-}
-
-TEST(Address, AHostNameHoldsNothingThatWouldMeanMoreInAUrl) {
+    // A name holds nothing that would mean more in a URL.
     for (const char *name : {"nas", "nas-1.example", "10.0.0.1", "a_b"}) {
         EXPECT_TRUE(isHostName(name)) << name;
     }

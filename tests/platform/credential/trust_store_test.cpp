@@ -42,7 +42,7 @@ TEST_F(TrustScene, TrustsTheKeyThatAnEndpointHadFirstUntilItForgets) {
     EXPECT_EQ(entries[1].fingerprint, fingerprint("c"));
 }
 
-TEST_F(TrustScene, KeepsLinesThatItDoesNotUnderstandOrThatCountForNothing) {
+TEST_F(TrustScene, KeepsLinesThatCountForNothingAndRefusesToJudgeWithoutItsFile) {
     const std::string strange = "# a comment\n\nhttps://a:1 SHA256:short\nrubbish\n"
                                 "https://b:1  " +
                                 fingerprint("b") + "\n";
@@ -60,9 +60,7 @@ TEST_F(TrustScene, KeepsLinesThatItDoesNotUnderstandOrThatCountForNothing) {
     EXPECT_EQ(store().list()->size(), 1U);
     EXPECT_TRUE(store().forget("https://a:1"));
     EXPECT_EQ(store().lookup("https://a:1", fingerprint("2")), TrustVerdict::kUnknown);
-}
-
-TEST_F(TrustScene, RefusesToJudgeWithoutItsFile) {
+    std::filesystem::remove(file());
     std::filesystem::create_directory(file());
     EXPECT_EQ(store().lookup("https://a:1", fingerprint("a")), TrustVerdict::kUnavailable);
     EXPECT_EQ(store().pin("https://a:1", fingerprint("a")), TrustVerdict::kUnavailable);

@@ -7,7 +7,6 @@
 
 #include <array>
 #include <string>
-#include <utility>
 
 using namespace OvraPlatform;
 using namespace OvraTest;

@@ -60,9 +60,7 @@ TEST(LinkAddresses, AreThoseThatOtherMachinesReachIpv4FirstOrTheConfiguredOnes) 
               "lo=127.0.1.2 eth1=192.0.2.130(down) eth0=192.0.2.2 =192.0.2.99(down) "
               "eth0=2001:DB8:0::2 ");
     EXPECT_EQ(toText(selectAddresses(kLinks, servingAt({}), kBoth)), "");
-}
-
-TEST(LinkAddresses, ThePppLinkIsKeptApart) {
+    // The PPP link is kept apart.
     EXPECT_EQ(pppAddress(kLinks, {}, 0), "203.0.113.9");
     EXPECT_EQ(pppAddress(kLinks, {}, 1), "");
     EXPECT_EQ(pppAddress({{"ppp0", IFF_UP, AF_INET, "203.0.113.9"}}, {}, 0), "");

@@ -3,7 +3,6 @@
 #include "platform/store/raw_sqlite.h"
 
 #include <ovraplatform/account_store.h>
-#include <ovraplatform/totp.h>
 
 #include <sodium.h>
 

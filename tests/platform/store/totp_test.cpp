@@ -5,9 +5,7 @@
 
 #include <string>
 
-using OvraPlatform::matchTotp;
-using OvraPlatform::newTotpSecret;
-using OvraPlatform::normalizeTotpSecret;
+using namespace OvraPlatform;
 
 namespace {
 
@@ -41,7 +39,7 @@ TEST(Totp, TakesOneStepOfDriftEachWayNoStepTwiceAndOnlyCodes) {
     EXPECT_FALSE(matchTotp("", "287082", 59));
 }
 
-TEST(Totp, SecretsAreRandomAndReadAsPeopleTypeThem) {
+TEST(Totp, SecretsAreRandomReadAsPeopleTypeThemAndShownInAUri) {
     const std::string secret = newTotpSecret();
     EXPECT_EQ(secret.size(), 32U);
     EXPECT_NE(secret, newTotpSecret());
@@ -50,9 +48,6 @@ TEST(Totp, SecretsAreRandomAndReadAsPeopleTypeThem) {
     for (const char *text : {"", "GEZDGNBV", "GEZDGNBVGY3TQOJQGEZDGNBVGY3TQOJ!", "otpauth://x"}) {
         EXPECT_EQ(normalizeTotpSecret(text), "") << text;
     }
-}
-
-TEST(Totp, TheEnrolmentUriEscapesNames) {
     EXPECT_EQ(OvraPlatform::totpUri("store 1&x=/y", "ann@example", kSecret),
               "otpauth://totp/store%201%26x%3D%2Fy:ann%40example?secret=" + std::string(kSecret) +
                   "&issuer=store%201%26x%3D%2Fy&algorithm=SHA1&digits=6&period=30");

@@ -28,7 +28,7 @@ const APICaller kUser{"ann", false, "s1", "192.0.2.1", false};
 const APICaller kAdministrator{"root", true, "s2", "192.0.2.1", false};
 const APICaller kLocal{"admin", true, "", "", true};
 
-TEST(APIRegistry, AnswersWithTheCodeOfTheWireForm) {
+TEST(APIRegistry, AnswersWithTheCodeOfTheWireFormAndKnowsTheQueueOfACall) {
     APIRegistry registry;
     registry.add("Open", 1, "get", APIRight::kNone, APIQueue::kQuick, echo);
     registry.add("Mine", 2, "get", APIRight::kSession, APIQueue::kQuick, echo);
@@ -69,10 +69,6 @@ TEST(APIRegistry, AnswersWithTheCodeOfTheWireForm) {
     }
     EXPECT_EQ(registry.dispatch({"Open", 1, "get", Json::Value()}, kNobody)["data"]["params"],
               Json::Value(Json::objectValue));
-}
-
-TEST(APIRegistry, KnowsTheQueueOfEachVersionAndOfWhatItIsAskedFor) {
-    APIRegistry registry;
     registry.add("A", 1, "get", APIRight::kNone, APIQueue::kQuick, echo);
     registry.add("A", 2, "get", APIRight::kNone, APIQueue::kRelay, echo,
                  [](const Json::Value &params) {
