@@ -11,10 +11,8 @@
 #include <unistd.h>
 
 #include <csignal>
-#include <cstdlib>
 #include <filesystem>
 #include <fstream>
-#include <sstream>
 #include <string>
 
 namespace OvraTest {
@@ -25,20 +23,13 @@ inline void writeFile(const std::string &path, const std::string &content) {
 }
 
 inline std::string readFile(const std::string &path) {
-    std::ostringstream content;
-    content << std::ifstream(path, std::ios::binary).rdbuf();
-    return content.str();
+    std::ifstream file(path, std::ios::binary);
+    return {std::istreambuf_iterator<char>(file), {}};
 }
 
 inline unsigned int modeOf(const std::string &path) {
     struct stat status {};
     return lstat(path.c_str(), &status) == 0 ? status.st_mode & 07777U : 0U;
-}
-
-/// How the sandbox around this program works: root, user or proot.
-inline std::string labWay() {
-    const char *const way = std::getenv("OVRADR_LAB_WAY");
-    return way != nullptr ? way : "";
 }
 
 /// A fixture with its own folder. The fixed paths of the appliance may be used too.
@@ -50,12 +41,10 @@ protected:
         folder_ = pattern;
     }
     void TearDown() override {
-        if (!folder_.empty()) {
-            std::filesystem::remove_all(folder_);
-            std::filesystem::remove_all(OvraPlatform::kConfigDir);
-            std::filesystem::remove_all(OvraPlatform::kStateDir);
-            umask(022);
-        }
+        std::filesystem::remove_all(folder_);
+        std::filesystem::remove_all(OvraPlatform::kConfigDir);
+        std::filesystem::remove_all(OvraPlatform::kStateDir);
+        umask(022);
     }
 
     std::string path(const std::string &name) const { return folder_ + "/" + name; }

@@ -133,7 +133,10 @@ TEST(Conformance, TheApplianceSaysWhoAndWhereItIs) {
     for (const int port : {ovraw3::Talo().GetHttpPort(), ovraw3::Talo().GetHttpsPort()}) {
         EXPECT_TRUE(port == -1 || OVRA::APIValidator::IsPort(port)) << port;
     }
-    EXPECT_FALSE(OVRA::APIValidator::IsPort(-1));
+    EXPECT_TRUE(OVRA::APIValidator::IsPort(1) && OVRA::APIValidator::IsPort(65535));
+    for (const int port : {-1, 0, 65536}) {
+        EXPECT_FALSE(OVRA::APIValidator::IsPort(port)) << port;
+    }
 
     std::array<OLIBNetInterface, 33> table{};
     const int count = OLIBNetGetInterfaceInfo(table.data(), 32, 18);

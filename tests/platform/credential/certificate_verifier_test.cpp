@@ -41,80 +41,48 @@ bool shakeHands(CertificateVerifier &judge, const OvraTest::TestCertificate &ser
     SSL_set_bio(clientEnd.get(), two, two);
     SSL_set_accept_state(serverEnd.get());
     SSL_set_connect_state(clientEnd.get());
-    for (int i = 0; i < 10; ++i) {
-        const int client = SSL_do_handshake(clientEnd.get());
-        if (client == 1) {
-            return true;
-        }
-        if (SSL_get_error(clientEnd.get(), client) == SSL_ERROR_SSL) {
-            return false;
-        }
+    for (int i = 0; i < 10 && SSL_do_handshake(clientEnd.get()) != 1; ++i) {
         SSL_do_handshake(serverEnd.get());
     }
-    return false;
+    return SSL_is_init_finished(clientEnd.get()) != 0;
 }
 
 class JudgeScene : public OvraTest::OwnFiles {
 protected:
-    void SetUp() override {
-        ASSERT_NO_FATAL_FAILURE(OwnFiles::SetUp());
-        std::filesystem::remove_all(kStateDir);
-    }
-    static Endpoint endpoint(const std::string &host) {
-        return Endpoint::make("https", host, 5001).value();
+    static CertificateVerifier judge(const std::string &host = "nas.example",
+                                     bool observe = false) {
+        return {Endpoint::make("https", host, 5001).value(), observe};
     }
 
     OvraTest::TestCertificate server_{"DNS:nas.example,IP:192.0.2.7"};
+    OvraTest::TestCertificate other_;
 };
 
-TEST_F(JudgeScene, AcceptsWhatTheSystemAcceptsForThatNameOrAddress) {
+TEST_F(JudgeScene, AcceptsWhatTheSystemAcceptsForThatNameOrAddressWhateverWasPinned) {
+    TrustStore().pin("https://nas.example:5001", fingerprintOf(other_.certificate()));
     for (const auto &[host, verdict] : {std::pair{"nas.example", Verdict::kSystem},
                                         {"192.0.2.7", Verdict::kSystem},
                                         {"other.example", Verdict::kNew},
                                         {"192.0.2.8", Verdict::kNew}}) {
-        CertificateVerifier judge(endpoint(host), false);
-        EXPECT_TRUE(shakeHands(judge, server_, &server_)) << host;
-        EXPECT_EQ(judge.verdict(), verdict) << host;
+        CertificateVerifier each = judge(host);
+        EXPECT_TRUE(shakeHands(each, server_, &server_)) << host;
+        EXPECT_EQ(each.verdict(), verdict) << host;
     }
 }
 
-TEST_F(JudgeScene, AcceptsWhatTheSystemAcceptsAlsoWhenAnotherKeyWasPinned) {
-    const OvraTest::TestCertificate old;
-    TrustStore().pin("https://nas.example:5001", fingerprintOf(old.certificate()));
-    CertificateVerifier judge(endpoint("nas.example"), false);
-    EXPECT_TRUE(shakeHands(judge, server_, &server_));
-    EXPECT_EQ(judge.verdict(), Verdict::kSystem);
-}
-
-TEST_F(JudgeScene, PinsAKeyItMeetsFirstOnlyWhenItIsTold) {
-    CertificateVerifier first(endpoint("nas.example"), false);
-    ASSERT_TRUE(shakeHands(first, server_, nullptr));
-    EXPECT_EQ(first.verdict(), Verdict::kNew);
-    EXPECT_TRUE(TrustStore().list()->empty());
-    EXPECT_TRUE(first.pinNewKey());
-
-    CertificateVerifier second(endpoint("nas.example"), false);
-    EXPECT_TRUE(shakeHands(second, server_, nullptr));
-    EXPECT_EQ(second.verdict(), Verdict::kPinned);
-}
-
-TEST_F(JudgeScene, EndsTheHandshakeWithAnotherKey) {
-    const OvraTest::TestCertificate other;
-    TrustStore().pin("https://nas.example:5001", fingerprintOf(other.certificate()));
-    CertificateVerifier judge(endpoint("nas.example"), false);
-    EXPECT_FALSE(shakeHands(judge, server_, nullptr));
-    EXPECT_EQ(judge.verdict(), Verdict::kChanged);
-
-    CertificateVerifier observer(endpoint("nas.example"), true);
+TEST_F(JudgeScene, EndsTheHandshakeWithAnotherKeyAndWhenThePinnedKeysCannotBeRead) {
+    TrustStore().pin("https://nas.example:5001", fingerprintOf(other_.certificate()));
+    CertificateVerifier strict = judge();
+    EXPECT_FALSE(shakeHands(strict, server_, nullptr));
+    EXPECT_EQ(strict.verdict(), Verdict::kChanged);
+    CertificateVerifier observer = judge("nas.example", true);
     EXPECT_TRUE(shakeHands(observer, server_, nullptr));
     EXPECT_EQ(observer.verdict(), Verdict::kChanged);
-}
-
-TEST_F(JudgeScene, EndsTheHandshakeWhenThePinnedKeysCannotBeRead) {
-    std::filesystem::create_directories(kKnownEndpointsFile);
-    CertificateVerifier judge(endpoint("nas.example"), false);
-    EXPECT_FALSE(shakeHands(judge, server_, nullptr));
-    EXPECT_EQ(judge.verdict(), Verdict::kUnavailable);
+    std::filesystem::remove(kKnownEndpointsFile);
+    std::filesystem::create_directory(kKnownEndpointsFile);
+    CertificateVerifier blind = judge();
+    EXPECT_FALSE(shakeHands(blind, server_, nullptr));
+    EXPECT_EQ(blind.verdict(), Verdict::kUnavailable);
 }
 
 } // namespace

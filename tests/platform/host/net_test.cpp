@@ -9,14 +9,11 @@
 #include <netinet/in.h>
 
 #include <array>
+#include <cstdlib>
 #include <string>
 #include <vector>
 
-using OvraPlatform::ApplianceConfig;
-using OvraPlatform::LinkAddress;
-using OvraPlatform::pppAddress;
-using OvraPlatform::selectAddresses;
-using OvraTest::writeFile;
+using namespace OvraPlatform;
 
 namespace {
 
@@ -45,23 +42,17 @@ std::string toText(const std::vector<OLIBNetInterface> &entries) {
     return text;
 }
 
-ApplianceConfig servingAt(std::vector<std::string> addresses) {
-    ApplianceConfig config;
-    config.servesAllAddresses = false;
-    config.addresses = std::move(addresses);
-    return config;
+ApplianceConfig servingAt(const std::vector<std::string> &addresses) {
+    return {.servesAllAddresses = false, .addresses = addresses};
 }
 
-TEST(LinkAddresses, AreThoseThatOtherMachinesReachIpv4First) {
+TEST(LinkAddresses, AreThoseThatOtherMachinesReachIpv4FirstOrTheConfiguredOnes) {
     EXPECT_EQ(toText(selectAddresses(kLinks, {}, kBoth)),
               "eth0=192.0.2.2 eth1=192.0.2.130(down) wg0=198.51.100.4 eth0=2001:db8::2 "
               "pppoe-lan=fd00::2 ");
     EXPECT_EQ(toText(selectAddresses(kLinks, {}, OLIB_NET_SELECT_IPV6)),
               "eth0=2001:db8::2 pppoe-lan=fd00::2 ");
     EXPECT_EQ(toText(selectAddresses(kLinks, {}, 0)), "");
-}
-
-TEST(LinkAddresses, AreTheConfiguredOnesAndNoOther) {
     EXPECT_EQ(toText(selectAddresses(kLinks,
                                      servingAt({"2001:DB8:0::2", "127.0.1.2", "192.0.2.130",
                                                 "192.0.2.2", "192.0.2.99"}),
@@ -69,9 +60,7 @@ TEST(LinkAddresses, AreTheConfiguredOnesAndNoOther) {
               "lo=127.0.1.2 eth1=192.0.2.130(down) eth0=192.0.2.2 =192.0.2.99(down) "
               "eth0=2001:DB8:0::2 ");
     EXPECT_EQ(toText(selectAddresses(kLinks, servingAt({}), kBoth)), "");
-}
-
-TEST(LinkAddresses, ThePppLinkIsKeptApart) {
+    // The PPP link is kept apart.
     EXPECT_EQ(pppAddress(kLinks, {}, 0), "203.0.113.9");
     EXPECT_EQ(pppAddress(kLinks, {}, 1), "");
     EXPECT_EQ(pppAddress({{"ppp0", IFF_UP, AF_INET, "203.0.113.9"}}, {}, 0), "");
@@ -79,11 +68,8 @@ TEST(LinkAddresses, ThePppLinkIsKeptApart) {
 }
 
 struct Net : OvraTest::OwnFiles {
-    static bool ip(std::vector<const char *> words) {
-        words.resize(8, nullptr);
-        FILE *const stream = OLIBCPopen("/usr/sbin/ip", "r", words[0], words[1], words[2], words[3],
-                                        words[4], words[5], words[6], words[7], nullptr);
-        return stream != nullptr && OLIBCPclose(stream) == 0;
+    static bool ip(const std::string &words) {
+        return std::system(("/usr/sbin/ip " + words).c_str()) == 0;
     }
     static std::string interfaces() {
         std::array<OLIBNetInterface, 32> table{};
@@ -93,15 +79,14 @@ struct Net : OvraTest::OwnFiles {
 };
 
 TEST_F(Net, ListsWhatTheKernelHas) {
-    if (OvraTest::labWay() == "proot" ||
-        !ip({"link", "add", "ppp0", "type", "veth", "peer", "lan0"})) {
+    if (std::getenv("OVRADR_LAB_WAY") == std::string("proot") ||
+        !ip("link add ppp0 type veth peer lan0")) {
         GTEST_SKIP() << "this machine does not allow a network of one's own";
     }
-    ASSERT_TRUE(ip({"addr", "add", "192.0.2.5/24", "dev", "lan0"}));
-    ASSERT_TRUE(ip({"addr", "add", "203.0.113.5/32", "dev", "ppp0"}));
+    ASSERT_TRUE(ip("addr add 192.0.2.5/24 dev lan0") && ip("addr add 203.0.113.5/32 dev ppp0"));
     EXPECT_EQ(interfaces(), "lan0=192.0.2.5(down) ");
     EXPECT_EQ(OVRAPPPoECheckStatus(1), 0);
-    ASSERT_TRUE(ip({"link", "set", "ppp0", "up"}) && ip({"link", "set", "lan0", "up"}));
+    ASSERT_TRUE(ip("link set ppp0 up") && ip("link set lan0 up"));
     EXPECT_EQ(interfaces(), "lan0=192.0.2.5 ");
     EXPECT_EQ(OVRAPPPoECheckStatus(1), 1);
     EXPECT_EQ(OVRAPPPoECheckStatus(2), 0);
@@ -112,7 +97,7 @@ TEST_F(Net, ListsWhatTheKernelHas) {
 }
 
 TEST_F(Net, ListsTheConfiguredAddressesAndFillsNoMoreThanTheTableHolds) {
-    writeFile(OvraPlatform::kConfigFile, "address=\"127.0.1.2,127.0.1.3\"\n");
+    OvraTest::writeFile(kConfigFile, "address=\"127.0.1.2,127.0.1.3\"\n");
     EXPECT_EQ(interfaces(), "lo=127.0.1.2 lo=127.0.1.3 ");
     std::array<OLIBNetInterface, 2> table{};
     EXPECT_EQ(OLIBNetGetInterfaceInfo(table.data(), 1, kBoth), 1);

@@ -1,9 +1,10 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
+#include <ovrabase/sqlite.h>
+
 #include <sqlite3.h>
 
-#include <memory>
 #include <string>
 
 namespace OvraTest {
@@ -35,10 +36,7 @@ public:
     }
 
 private:
-    struct Close {
-        void operator()(sqlite3 *database) const { sqlite3_close(database); }
-    };
-    std::unique_ptr<sqlite3, Close> database_;
+    OvraBase::SqliteHandle database_;
 };
 
 } // namespace OvraTest

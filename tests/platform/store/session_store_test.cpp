@@ -8,24 +8,17 @@
 
 #include <chrono>
 #include <functional>
-#include <memory>
 #include <optional>
 #include <string>
 #include <thread>
 #include <vector>
 
-using OvraPlatform::SessionRecord;
-using OvraPlatform::SessionRequest;
-using OvraPlatform::SessionStore;
-using OvraTest::modeOf;
-using OvraTest::OtherProcess;
-using OvraTest::RawSqlite;
-using OvraTest::readFile;
-using OvraTest::writeFile;
+using namespace OvraPlatform;
+using namespace OvraTest;
 
 namespace {
 
-struct Sessions : OvraTest::OwnFiles {
+struct Sessions : OwnFiles {
     std::string file() const { return path("state/sessions.db"); }
     SessionStore store() {
         return SessionStore(file(), [this] { return time; });
@@ -54,7 +47,7 @@ struct Sessions : OvraTest::OwnFiles {
 constexpr char kLayoutText[] =
     "SELECT group_concat(name) FROM (SELECT name FROM sqlite_schema ORDER BY name)";
 
-TEST_F(Sessions, KeepWhatTheyWereMadeOf) {
+TEST_F(Sessions, KeepWhatTheyWereMadeOfAndAreFoundByTheWholeIdOnly) {
     const SessionRequest request = {
         "ann", "Tidewater", R"({"node_id":"n1"})", R"({"hide":true})", "::ffff:192.0.2.1",
         60,    true};
@@ -66,25 +59,19 @@ TEST_F(Sessions, KeepWhatTheyWereMadeOf) {
         std::string::npos);
     const std::optional<SessionRecord> found = store().find(*id);
     ASSERT_TRUE(found);
-    EXPECT_EQ(found->id, *id);
-    EXPECT_EQ(found->user + found->app + found->extra + found->ui + found->remote,
-              request.user + request.app + request.extra + request.ui + request.remote);
+    EXPECT_EQ(found->id + found->user + found->app + found->extra + found->ui + found->remote,
+              *id + request.user + request.app + request.extra + request.ui + request.remote);
     EXPECT_EQ(found->created, time);
     EXPECT_EQ(found->expires, time + 60);
     EXPECT_EQ(found->toString().find(*id), std::string::npos);
     EXPECT_NE(found->toString().find(found->reference()), std::string::npos);
-}
-
-TEST_F(Sessions, AreFoundByTheWholeIdOnly) {
-    const std::string id = create("ann", -1);
-    std::string altered = id;
+    std::string altered = *id;
     altered[20] = altered[20] == 'A' ? 'B' : 'A';
-    for (const std::string &other : {std::string(), altered, id + "=", id.substr(0, 42), id + id,
+    for (const std::string &other : {std::string(), altered, *id + "=", id->substr(0, 42),
                                      std::string("%"), std::string(43, '\0')}) {
         EXPECT_FALSE(store().find(other)) << other;
     }
-    EXPECT_TRUE(store().find(id));
-    EXPECT_NE(id, create("ann", -1));
+    EXPECT_NE(*id, create("ann", -1));
 }
 
 TEST_F(Sessions, EndAtTheirTimeAndAreThenSwept) {
@@ -121,13 +108,13 @@ TEST_F(Sessions, ANewOneEndsTheUsersOthersOfItsApplicationUnlessTheyAreToStay) {
     const std::string otherApp = create("ann", -1, "Tidewater");
     const std::string noApp = create("ann", -1);
     const std::string otherUser = create("bob", -1, "web");
-    const std::string alone = store().create({"ann", "web", "", "", "", -1, false}).value_or("");
+    const std::string alone = store().create({.user = "ann", .app = "web"}).value_or("");
     EXPECT_FALSE(store().find(first));
     EXPECT_FALSE(store().find(second));
     for (const std::string &id : {alone, otherApp, noApp, otherUser}) {
         EXPECT_TRUE(store().find(id));
     }
-    ASSERT_TRUE(store().create({"ann", "", "", "", "", -1, false}));
+    ASSERT_TRUE(store().create({.user = "ann"}));
     EXPECT_FALSE(store().find(noApp));
     EXPECT_TRUE(store().find(alone));
 }
@@ -173,7 +160,7 @@ std::uint64_t stepsOf(const std::function<void()> &operation) {
 
 TEST_F(Sessions, CostNoMoreAmongTenThousandOfTheirUser) {
     const SessionRequest request = {"ann", "Tidewater", R"({"node_id":"n1"})", "", "", -1, true};
-    const OvraPlatform::SessionFilter filter = {request.user, request.app, request.extra};
+    const SessionFilter filter = {request.user, request.app, request.extra};
     const auto oneMore = [&] {
         int visited = 0;
         const auto visit = [&](const SessionRecord &session) {
@@ -247,7 +234,8 @@ TEST_F(Sessions, OfUnusableThingsAreRefused) {
     EXPECT_EQ(count(), 2U);
 }
 
-TEST_F(Sessions, ThatAreRemovedAreGoneFromTheFileToo) {
+TEST_F(Sessions, AreForTheirOwnerOnlyAndGoneFromTheFileWhenRemoved) {
+    umask(0);
     const std::string gone = create("ann", -1);
     const std::string kept = create("ann", -1);
     EXPECT_NE(readFile(file()).find(gone), std::string::npos);
@@ -256,11 +244,6 @@ TEST_F(Sessions, ThatAreRemovedAreGoneFromTheFileToo) {
     EXPECT_FALSE(store().find(gone));
     EXPECT_TRUE(store().find(kept));
     EXPECT_EQ(readFile(file()).find(gone), std::string::npos);
-}
-
-TEST_F(Sessions, AreForTheirOwnerOnly) {
-    umask(0);
-    create("ann", -1);
     EXPECT_EQ(modeOf(path("state")), 0700U);
     EXPECT_EQ(modeOf(file()), 0600U);
     chmod(file().c_str(), 0644);
@@ -298,20 +281,17 @@ TEST_F(Sessions, ADamagedOrForeignFileIsAClearErrorAndStaysAsItIs) {
 }
 
 TEST_F(Sessions, ManyProcessesMakeTheStoreAndUseItAtOnce) {
-    std::vector<std::unique_ptr<OtherProcess>> processes;
-    processes.reserve(4);
-    for (int i = 0; i < 4; ++i) {
-        processes.push_back(std::make_unique<OtherProcess>([&] {
-            for (int session = 0; session < 10; ++session) {
-                if (create("ann", -1).empty()) {
-                    return 1;
-                }
-            }
-            return 0;
-        }));
-    }
-    for (const auto &process : processes) {
-        EXPECT_EQ(process->wait(), 0);
+    const auto makeTen = [&] {
+        int made = 0;
+        for (int i = 0; i < 10; ++i) {
+            made += create("ann", -1).empty() ? 0 : 1;
+        }
+        return made;
+    };
+    OtherProcess processes[] = {OtherProcess(makeTen), OtherProcess(makeTen), OtherProcess(makeTen),
+                                OtherProcess(makeTen)};
+    for (OtherProcess &process : processes) {
+        EXPECT_EQ(process.wait(), 10);
     }
     EXPECT_EQ(count(), 40U);
 }
@@ -341,14 +321,13 @@ TEST_F(Sessions, ThatWereHandedOutOutliveAKilledProcess) {
 TEST_F(Sessions, AFullDiskIsAClearErrorAndLosesNothing) {
     const std::string id = create("ann", -1);
     OtherProcess full([&] {
-        OvraTest::limitFileSize(std::filesystem::file_size(file()));
+        limitFileSize(std::filesystem::file_size(file()));
         SessionStore sessions = store();
-        for (int i = 0; i < 500; ++i) {
-            if (!sessions.create({"ann", "", "", "", "", -1, true})) {
-                return sessions.error().find("disk") != std::string::npos ? 0 : 2;
-            }
+        int made = 0;
+        while (made < 500 && sessions.create({"ann", "", "", "", "", -1, true})) {
+            ++made;
         }
-        return 1;
+        return sessions.error().find("disk") != std::string::npos ? 0 : 1;
     });
     EXPECT_EQ(full.wait(), 0);
     EXPECT_TRUE(store().find(id));

@@ -5,9 +5,7 @@
 
 #include <string>
 
-using OvraPlatform::matchTotp;
-using OvraPlatform::newTotpSecret;
-using OvraPlatform::normalizeTotpSecret;
+using namespace OvraPlatform;
 
 namespace {
 
@@ -25,7 +23,7 @@ TEST(Totp, AgreesWithTheTestVectorsOfRfc6238) {
     }
 }
 
-TEST(Totp, TakesOneStepOfDriftEachWayAndNoStepTwice) {
+TEST(Totp, TakesOneStepOfDriftEachWayNoStepTwiceAndOnlyCodes) {
     constexpr std::int64_t kStep = 1111111111 / 30; // 1111111109 is in the previous step
     EXPECT_EQ(matchTotp(kSecret, "050471", (kStep - 1) * 30), kStep);
     EXPECT_EQ(matchTotp(kSecret, "050471", (kStep + 2) * 30 - 1), kStep);
@@ -34,9 +32,6 @@ TEST(Totp, TakesOneStepOfDriftEachWayAndNoStepTwice) {
     EXPECT_FALSE(matchTotp(kSecret, "050471", kStep * 30, kStep));
     EXPECT_FALSE(matchTotp(kSecret, "081804", kStep * 30, kStep));
     EXPECT_EQ(matchTotp(kSecret, "081804", kStep * 30, kStep - 2), kStep - 1);
-}
-
-TEST(Totp, RefusesWhatIsNoCode) {
     for (const char *code : {"", "28708", "2870820", "94287082", "28708 ", "28708a", "-87082"}) {
         EXPECT_FALSE(matchTotp(kSecret, code, 59)) << code;
     }
@@ -44,7 +39,7 @@ TEST(Totp, RefusesWhatIsNoCode) {
     EXPECT_FALSE(matchTotp("", "287082", 59));
 }
 
-TEST(Totp, SecretsAreRandomAndReadAsPeopleTypeThem) {
+TEST(Totp, SecretsAreRandomReadAsPeopleTypeThemAndShownInAUri) {
     const std::string secret = newTotpSecret();
     EXPECT_EQ(secret.size(), 32U);
     EXPECT_NE(secret, newTotpSecret());
@@ -53,9 +48,6 @@ TEST(Totp, SecretsAreRandomAndReadAsPeopleTypeThem) {
     for (const char *text : {"", "GEZDGNBV", "GEZDGNBVGY3TQOJQGEZDGNBVGY3TQOJ!", "otpauth://x"}) {
         EXPECT_EQ(normalizeTotpSecret(text), "") << text;
     }
-}
-
-TEST(Totp, TheEnrolmentUriEscapesNames) {
     EXPECT_EQ(OvraPlatform::totpUri("store 1&x=/y", "ann@example", kSecret),
               "otpauth://totp/store%201%26x%3D%2Fy:ann%40example?secret=" + std::string(kSecret) +
                   "&issuer=store%201%26x%3D%2Fy&algorithm=SHA1&digits=6&period=30");

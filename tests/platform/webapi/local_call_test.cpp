@@ -15,6 +15,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <array>
 #include <atomic>
 #include <chrono>
 #include <filesystem>
@@ -30,11 +31,8 @@ using namespace std::chrono_literals;
 
 Json::Value echo(const LocalCall &call) {
     Json::Value data;
-    data["api"] = call.api;
-    data["version"] = call.version;
-    data["method"] = call.method;
+    data["call"] = call.api + std::to_string(call.version) + call.method + call.user;
     data["params"] = call.params;
-    data["user"] = call.user;
     return apiSuccess(data);
 }
 
@@ -62,61 +60,59 @@ std::string answerTo(const std::string &bytes) {
     return receiveFrame(fd.get(), std::chrono::steady_clock::now() + 5s).value_or("");
 }
 
-class LocalCallScene : public OvraTest::OwnFiles {
-protected:
-    void SetUp() override {
-        ASSERT_NO_FATAL_FAILURE(OwnFiles::SetUp());
-        std::filesystem::remove_all(kStateDir);
+/// A process with a server, as soon as that listens.
+struct Daemon : OvraTest::OtherProcess {
+    explicit Daemon(const LocalHandler &handler)
+        : OtherProcess([&] {
+            LocalServer server(kSocketFile, handler);
+            static_cast<void>(server.start());
+            return pause();
+        }) {
+        while (!connectRaw()) {
+            std::this_thread::sleep_for(10ms);
+        }
     }
 };
 
-TEST_F(LocalCallScene, CarriesTheWholeCallAndTheWholeReply) {
+struct LocalCallScene : OvraTest::OwnFiles {};
+
+TEST_F(LocalCallScene, CarriesTheWholeCallAndReplyAndSurvivesRubbish) {
     LocalServer server(kSocketFile, echo);
     ASSERT_TRUE(server.start());
     Json::Value params;
     params["text"] = std::string(100'000, 'x') + "\n\xC3\xA9";
     const Json::Value out = ask("get", params);
-    EXPECT_EQ(out["data"]["api"], "Test");
-    EXPECT_EQ(out["data"]["version"], 1);
-    EXPECT_EQ(out["data"]["method"], "get");
+    EXPECT_EQ(out["data"]["call"], "Test1getadmin");
     EXPECT_EQ(out["data"]["params"], params);
-    EXPECT_EQ(out["data"]["user"], "admin");
     EXPECT_EQ(OvraTest::modeOf(kSocketFile), 0600U);
     EXPECT_EQ(OvraTest::modeOf(kStateDir), 0700U);
+    const std::string four("\0\0\0\4", 4);
+    for (const std::string &rubbish : {std::string(), std::string("\0\0", 2), four + "xy",
+                                       std::string("\xFF\xFF\xFF\xFF rubbish")}) {
+        EXPECT_EQ(answerTo(rubbish), "");
+    }
+    for (const char *text : {"GET ", "[{}]", "null"}) {
+        Json::Value reply;
+        ASSERT_TRUE(OvraDRCore::fromString(reply, answerTo(four + text))) << text;
+        EXPECT_EQ(codeOf(reply), APIError::kBadRequest) << text;
+    }
+    EXPECT_EQ(codeOf(ask()), 0);
 }
 
 TEST_F(LocalCallScene, SaysSoWhenNoDaemonRunsOrItDiesDuringTheCall) {
     const Json::Value out = ask();
     EXPECT_EQ(codeOf(out), APIError::kInternal);
     EXPECT_NE(out["error"]["msg"].asString().find("ovradrd does not answer"), std::string::npos);
-    OvraTest::OtherProcess daemon([] {
-        LocalServer server(kSocketFile, [](const LocalCall &) -> Json::Value { _exit(9); });
-        static_cast<void>(server.start());
-        pause();
-        return 0;
-    });
-    while (!connectRaw()) {
-        std::this_thread::sleep_for(10ms);
-    }
+    const Daemon daemon([](const LocalCall &) -> Json::Value { _exit(9); });
     EXPECT_EQ(codeOf(ask()), APIError::kInternal);
 }
 
 TEST_F(LocalCallScene, ReplacesTheSocketOfADeadDaemonOnly) {
-    {
-        OvraTest::OtherProcess daemon([] {
-            LocalServer server(kSocketFile, echo);
-            static_cast<void>(server.start());
-            pause();
-            return 0;
-        });
-        while (!connectRaw()) {
-            std::this_thread::sleep_for(10ms);
-        }
-        LocalServer second(kSocketFile, echo);
-        EXPECT_FALSE(second.start());
-        EXPECT_EQ(codeOf(ask()), 0) << "the first must go on answering";
-        daemon.end(SIGKILL);
-    }
+    Daemon daemon(echo);
+    LocalServer second(kSocketFile, echo);
+    EXPECT_FALSE(second.start());
+    EXPECT_EQ(codeOf(ask()), 0) << "the first must go on answering";
+    daemon.end(SIGKILL);
     LocalServer server(kSocketFile, echo);
     ASSERT_TRUE(server.start());
     EXPECT_EQ(codeOf(ask()), 0);
@@ -130,9 +126,7 @@ TEST_F(LocalCallScene, TakesNoPlaceThatIsNotItsOwn) {
     EXPECT_EQ(OvraTest::readFile(kSocketFile), "precious");
 
     LocalServer tooLong(path(std::string(120, 'x')), echo);
-    const auto started = tooLong.start();
-    ASSERT_FALSE(started);
-    EXPECT_NE(started.error().find("too long"), std::string::npos);
+    EXPECT_NE(tooLong.start().error().find("too long"), std::string::npos);
 }
 
 TEST_F(LocalCallScene, RefusesTheProcessesOfOtherUsers) {
@@ -156,22 +150,6 @@ TEST_F(LocalCallScene, RefusesTheProcessesOfOtherUsers) {
     EXPECT_EQ(code, APIError::kNoPermission);
 }
 
-TEST_F(LocalCallScene, SurvivesRubbish) {
-    LocalServer server(kSocketFile, echo);
-    ASSERT_TRUE(server.start());
-    const std::string four("\0\0\0\4", 4);
-    EXPECT_EQ(answerTo(""), "");
-    EXPECT_EQ(answerTo(std::string("\0\0", 2)), "");
-    EXPECT_EQ(answerTo(std::string("\xFF\xFF\xFF\xFF rubbish", 12)), "");
-    EXPECT_EQ(answerTo(four + "xy"), "");
-    for (const char *text : {"GET ", "[{}]", "null"}) {
-        Json::Value reply;
-        ASSERT_TRUE(OvraDRCore::fromString(reply, answerTo(four + text))) << text;
-        EXPECT_EQ(codeOf(reply), APIError::kBadRequest) << text;
-    }
-    EXPECT_EQ(codeOf(ask()), 0);
-}
-
 TEST_F(LocalCallScene, AnswersForAHandlerThatFails) {
     LocalServer server(kSocketFile, [](const LocalCall &call) {
         if (call.method == "throw") {
@@ -185,15 +163,12 @@ TEST_F(LocalCallScene, AnswersForAHandlerThatFails) {
 }
 
 TEST_F(LocalCallScene, ServesMoreCallersThanItHasThreads) {
-    std::atomic<int> running{0};
-    std::atomic<int> most{0};
+    std::atomic<std::size_t> running{0};
+    std::array<std::atomic<int>, 21> times{}; // by the number of those that run then
     LocalServer server(
         kSocketFile,
         [&](const LocalCall &call) {
-            const int now = ++running;
-            int seen = most;
-            while (seen < now && !most.compare_exchange_weak(seen, now)) {
-            }
+            ++times.at(++running);
             std::this_thread::sleep_for(5ms);
             --running;
             return echo(call);
@@ -207,7 +182,8 @@ TEST_F(LocalCallScene, ServesMoreCallersThanItHasThreads) {
     for (auto &caller : callers) {
         EXPECT_EQ(codeOf(caller.get()), 0);
     }
-    EXPECT_EQ(most, 2);
+    EXPECT_GT(times[2], 0);
+    EXPECT_EQ(times[1] + times[2], 20);
 }
 
 TEST_F(LocalCallScene, StopsAtOnceButAnswersTheCallUnderWay) {
