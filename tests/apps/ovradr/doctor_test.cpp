@@ -29,11 +29,7 @@ std::string failedStep(const Json::Value &document) {
 } // namespace
 
 TEST_F(Diagnosis, NamesTheStepThatFailsAndHasAnExitCodeForEach) {
-    const struct {
-        const char *step;
-        int exit;
-        std::function<void(RemoteNode &)> harm;
-    } cases[] = {
+    const std::tuple<const char *, int, std::function<void(RemoteNode &)>> cases[] = {
         {"", 0, [](RemoteNode &) {}},
         {"connect", 3, [](RemoteNode &node) { node.die(); }},
         {"key", 3, [](RemoteNode &node) { node.server.fallSilent(); }},
@@ -47,29 +43,21 @@ TEST_F(Diagnosis, NamesTheStepThatFailsAndHasAnExitCodeForEach) {
         {"clock", 13,
          [](RemoteNode &node) { node.answer("getinfo", success(R"({"time":1600000000000})")); }},
     };
-    for (const auto &each : cases) {
+    for (const auto &[step, exit, harm] : cases) {
         OvraTest::executeSql("DELETE FROM node_cred");
         RemoteNode node;
         pair(node);
-        each.harm(node);
+        harm(node);
         node.server.closeConnections();
         const Result result = run({"doctor", "n1", "--json"});
-        EXPECT_EQ(result.exit, each.exit) << each.step << result.out;
-        EXPECT_EQ(failedStep(result.json()), each.step) << result.out;
+        EXPECT_EQ(result.exit, exit) << step << result.out;
+        EXPECT_EQ(failedStep(result.json()), step) << result.out;
         const Result shown = run({"doctor", "n1"});
-        EXPECT_EQ(shown.exit, each.exit);
+        EXPECT_EQ(shown.exit, exit);
         EXPECT_NE(shown.out.find("resolve"), std::string::npos) << "also where it failed";
         EXPECT_EQ((result.out + shown.out).find("s3cret"), std::string::npos);
     }
     EXPECT_EQ(run({"doctor", "https://no-such-host.invalid"}).exit, 10);
-}
-
-TEST_F(Diagnosis, SendsNoPasswordToANewKey) {
-    const Arguments doctor{"doctor", url};
-    EXPECT_EQ(run(doctor + Arguments{"--account", "bob", "--password-stdin"}, "secret\n").exit, 6);
-    EXPECT_EQ(run(doctor).exit, 0) << "what sends no secret needs no trust";
-    EXPECT_EQ(remote.calls().find("login"), std::string::npos) << remote.calls();
-    EXPECT_EQ(run({"conn", "forget", url}).exit, 7) << "and nothing was pinned";
 }
 
 TEST_F(Diagnosis, KnowsWhatANodeThatIsGoneSaidLast) {

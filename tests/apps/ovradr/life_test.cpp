@@ -135,15 +135,13 @@ TEST_F(Life, ACommandThatIsKilledAnywhereLeavesTheOldOrTheNewStateAndNoSessionUn
 
 TEST_F(Life, CommandsAtTheSameTimeLeaveNoSessionThatNobodyKnows) {
     const Arguments other{"cred", "delete", "c2", "--json"};
-    const struct {
-        Arguments first;
-        Arguments second;
-        bool killed; ///< both, when the session that they share is to be released
-    } cases[] = {{set, set, false}, {set, drop, false}, {drop, other, false}, {drop, other, true}};
-    for (const auto &each : cases) {
-        SCOPED_TRACE(each.first[1] + " and " + each.second[1] + " " + each.second[2]);
+    // The last ones are killed when the session that they share is to be released.
+    const std::tuple<Arguments, Arguments, bool> cases[] = {
+        {set, set, false}, {set, drop, false}, {drop, other, false}, {drop, other, true}};
+    for (const auto &[one, another, killed] : cases) {
+        SCOPED_TRACE(one[1] + " and " + another[1] + " " + another[2]);
         begin();
-        const bool sharing = each.second == other;
+        const bool sharing = another == other;
         if (sharing) {
             addCred("node_cred", "n1", "c2", "https", remote.port(), "old");
         }
@@ -162,7 +160,7 @@ TEST_F(Life, CommandsAtTheSameTimeLeaveNoSessionThatNobodyKnows) {
             remote.answer("create",
                           success(R"({"session":"granted-)" + std::to_string(++grants) + "\"}"));
         });
-        if (each.killed) {
+        if (killed) {
             remote.before("delete", [&pids] {
                 do { // so that the other one ends
                     std::this_thread::sleep_for(std::chrono::milliseconds(300));
@@ -171,8 +169,8 @@ TEST_F(Life, CommandsAtTheSameTimeLeaveNoSessionThatNobodyKnows) {
                 kill(pids[1], SIGKILL);
             });
         }
-        Program first(each.first, "secret word\n");
-        Program second(each.second, "secret word\n");
+        Program first(one, "secret word\n");
+        Program second(another, "secret word\n");
         pids[0] = first.pid();
         pids[1] = second.pid();
         const std::string said = first.finish().out + second.finish().out;
@@ -186,7 +184,7 @@ TEST_F(Life, CommandsAtTheSameTimeLeaveNoSessionThatNobodyKnows) {
             EXPECT_TRUE(ended.count(session) != 0 || known.find(session) != std::string::npos)
                 << session << " lives, and nobody knows";
         }
-        if (sharing && !each.killed) {
+        if (sharing && !killed) {
             EXPECT_NE(said.find("\"kept\""), std::string::npos) << said;
             EXPECT_NE(said.find("\"released\""), std::string::npos) << said;
         }

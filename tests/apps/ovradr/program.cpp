@@ -130,6 +130,12 @@ void Terminal::type(const std::string &text) const {
     EXPECT_EQ(write(master_, text.data(), text.size()), static_cast<ssize_t>(text.size()));
 }
 
+bool Terminal::answers(const std::string &question, const std::string &line) {
+    const bool asked = shows(question);
+    type(line + "\n");
+    return asked;
+}
+
 bool Terminal::echoes() const {
     termios settings{};
     return tcgetattr(slave_, &settings) == 0 && (settings.c_lflag & ECHO) != 0;

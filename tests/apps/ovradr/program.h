@@ -74,6 +74,8 @@ public:
     /// appears for 10 seconds.
     bool shows(const std::string &text);
     void type(const std::string &text) const;
+    /// Types the line when the screen shows the question; false if it does not.
+    bool answers(const std::string &question, const std::string &line);
     bool echoes() const;
     /// Reads the rest. \return the exit code, or minus the signal
     int finish();

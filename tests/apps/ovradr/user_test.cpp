@@ -90,26 +90,20 @@ TEST(User, TheSecretOfOneTimeCodesIsShownOnlyWhereItIsAskedFor) {
 }
 
 TEST(Password, IsTypedTwiceAndNotEchoed) {
-    for (const bool same : {false, true}) {
+    const std::pair<const char *, int> cases[] = {
+        {"correct hors\n", 1}, {"corr\x03", -SIGINT}, {"correct horse\n", 0}};
+    for (const auto &[again, exit] : cases) { // \x03: Ctrl-C
         Terminal terminal({"user", "add", "bob"});
         ASSERT_TRUE(terminal.shows("Password of bob: "));
         EXPECT_FALSE(terminal.echoes());
         terminal.type("correct horse\n");
         ASSERT_TRUE(terminal.shows("Again: "));
-        terminal.type(same ? "correct horse\n" : "correct hors\n");
-        EXPECT_EQ(terminal.finish(), same ? 0 : 1) << terminal.screen();
+        terminal.type(again);
+        EXPECT_EQ(terminal.finish(), exit) << terminal.screen();
         EXPECT_TRUE(terminal.echoes());
         EXPECT_EQ(terminal.screen().find("hors"), std::string::npos) << terminal.screen();
-        EXPECT_EQ(logIn(kPassword), same ? LoginResult::kOk : LoginResult::kWrong);
+        EXPECT_EQ(logIn(kPassword), exit == 0 ? LoginResult::kOk : LoginResult::kWrong);
     }
-}
-
-TEST(Password, TheEchoComesBackWhenThePromptIsInterrupted) {
-    Terminal terminal({"user", "add", "bob"});
-    ASSERT_TRUE(terminal.shows("Password of bob: "));
-    terminal.type("corr\x03"); // Ctrl-C
-    EXPECT_EQ(terminal.finish(), -SIGINT);
-    EXPECT_TRUE(terminal.echoes());
 }
 
 TEST(Password, FromAFileIsItsFirstLine) {
@@ -124,12 +118,7 @@ TEST(Password, FromAFileIsItsFirstLine) {
 }
 
 TEST(Password, IsRefusedWhenItCannotBeRead) {
-    const struct {
-        const char *what;
-        Arguments arguments;
-        std::string input;
-        int exit;
-    } cases[] = {
+    const std::tuple<const char *, Arguments, std::string, int> cases[] = {
         {"empty", {"--password-stdin"}, "", 1},
         {"an empty line", {"--password-stdin"}, "\ncorrect horse\n", 1},
         {"too short", {"--password-stdin"}, "short\n", 1},
@@ -138,17 +127,17 @@ TEST(Password, IsRefusedWhenItCannotBeRead) {
         {"a NUL", {"--password-stdin"}, std::string("correct \0horse\n", 15), 1},
         {"no such file", {"--password-file", "/nowhere/at/all"}, "", 1},
         {"a folder", {"--password-file", "/"}, "", 1},
-        {"nobody to ask", {}, "correct horse\n", 2},
+        {"nobody to ask", Arguments{}, "correct horse\n", 2},
         {"two sources", {"--password-stdin", "--password-file", "/dev/null"}, "correct horse\n", 2},
         {"as an argument", {"--password", "correct horse"}, "", 2},
         {"as an argument", {"--password=correct horse"}, "", 2},
         {"as a further argument", {"correct horse"}, "", 2},
     };
-    for (const auto &each : cases) {
-        const Result result = run(Arguments{"user", "add", "bob"} + each.arguments, each.input);
-        EXPECT_EQ(result.exit, each.exit) << each.what << ": " << result.err;
+    for (const auto &[what, arguments, input, exit] : cases) {
+        const Result result = run(Arguments{"user", "add", "bob"} + arguments, input);
+        EXPECT_EQ(result.exit, exit) << what << ": " << result.err;
         EXPECT_EQ((result.out + result.err).find("horse"), std::string::npos) << result.err;
-        EXPECT_EQ(logIn(kPassword), LoginResult::kWrong) << each.what;
+        EXPECT_EQ(logIn(kPassword), LoginResult::kWrong) << what;
     }
 }
 
