@@ -20,10 +20,16 @@ trap '((BASH_SUBSHELL)) || broken "exit code $? of: $BASH_COMMAND"' ERR
 
 same() { [[ $2 == "$3" ]] || broken "$1: expected \"$3\", got \"$2\""; }
 holds() { [[ $2 == *"$3"* ]] || broken "$1: expected \"$3\" somewhere in: $2"; }
-absent() { [[ ! -e $1 ]] || broken "$1 is there"; }
 
 # exitCodeOf COMMAND...: sets code and output (both streams).
 exitCodeOf() { output=$("$@" 2>&1 </dev/null) && code=0 || code=$?; }
+
+# ends WHAT CODE TEXT COMMAND...: COMMAND ends with that exit code and prints TEXT.
+ends() {
+    exitCodeOf "${@:4}"
+    same "exit code of $1: $output" "$code" "$2"
+    holds "$1" "$output" "$3"
+}
 
 # missed TEXT FILE SED COMMAND...: with this change of a file below $scratch COMMAND fails and prints TEXT.
 missed() {
@@ -32,9 +38,7 @@ missed() {
     cp "$file" "$scratch/before"
     sed -i "$change" "$file"
     ! cmp -s "$file" "$scratch/before" || broken "$change changes nothing in $file"
-    exitCodeOf "$@"
-    same "$change in $file: $output" "$code" 1
-    holds "$change in $file" "$output" "$text"
+    ends "$change in $file" 1 "$text" "$@"
     cp "$scratch/before" "$file"
 }
 

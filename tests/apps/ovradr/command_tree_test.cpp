@@ -4,13 +4,11 @@
 
 #include <gtest/gtest.h>
 
-#include <algorithm>
 #include <cctype>
 #include <map>
 #include <optional>
 #include <regex>
 #include <set>
-#include <sstream>
 
 namespace {
 
@@ -24,30 +22,32 @@ constexpr char kPage[] = "docs/ovradr.md";
 struct Usage {
     std::string command; ///< "cred create"; "" for the program itself
     std::string rest;    ///< what follows the command
-    bool known = true;   ///< false: a word stands in the place of a command that is none
+};
+
+/// What stands between the backticks of a section.
+struct Content {
+    std::vector<Usage> usages;
+    Names looseOptions; ///< those in no usage
+};
+
+/// What the page says about a command.
+struct Description {
+    Names options;
+    std::string usage;
 };
 
 Names optionsIn(const std::string &text) {
     static const std::regex kOption("--[a-z][a-z-]*");
-    Names names;
-    for (std::sregex_iterator found(text.begin(), text.end(), kOption), end; found != end;
-         ++found) {
-        names.insert(found->str());
-    }
-    return names;
+    return {std::sregex_token_iterator(text.begin(), text.end(), kOption), {}};
 }
 
-/// The anchor of a heading.
-std::string anchorOf(const std::string &heading) {
-    std::string anchor = "#";
-    for (const char c : heading) {
-        if (std::isalnum(static_cast<unsigned char>(c)) != 0 || c == '-' || c == '_') {
-            anchor += static_cast<char>(std::tolower(static_cast<unsigned char>(c)));
-        } else if (c == ' ') {
-            anchor += '-';
-        }
+/// The target of a link to a heading.
+std::string linkTo(const std::string &heading) {
+    std::string anchor = std::regex_replace(heading, std::regex("[^A-Za-z0-9_ -]"), "");
+    for (char &c : anchor) {
+        c = c == ' ' ? '-' : static_cast<char>(std::tolower(static_cast<unsigned char>(c)));
     }
-    return anchor;
+    return "(#" + anchor + ")";
 }
 
 class CommandTree : public testing::Test {
@@ -58,79 +58,58 @@ protected:
     }
 
     /// std::nullopt if the code does not begin with the program's name.
-    std::optional<Usage> usageIn(const std::string &code) {
-        static const std::regex kUsage("^(?:[a-z0-9-]*[#$] )?ovradr( .*)?$");
-        static const std::regex kWord("[a-z]+");
+    std::optional<Usage> usageIn(const std::string &code) const {
+        static const std::regex kUsage("(?:[a-z0-9-]*[#$] )?ovradr( .*)?");
+        static const std::regex kNext(" *([^ ]+)(.*)");
         std::smatch match;
         if (!std::regex_match(code, match, kUsage)) {
             return std::nullopt;
         }
-        Usage usage;
-        CLI::App *place = &app_;
-        std::istringstream words(match[1]);
-        for (std::string word; words >> word;) {
-            const auto next = place->get_subcommands(
-                [&word](const CLI::App *child) { return child->get_name() == word; });
-            if (next.empty()) {
-                usage.known = place->get_subcommands({}).empty() || !std::regex_match(word, kWord);
-                std::getline(words, usage.rest);
-                usage.rest = word + usage.rest;
+        Usage usage{"", match[1]};
+        for (std::smatch next; std::regex_match(usage.rest, next, kNext); usage.rest = next[2]) {
+            const std::string longer =
+                usage.command + (usage.command.empty() ? "" : " ") + next[1].str();
+            if (options_.count(longer) == 0) {
                 break;
             }
-            place = next.front();
-            usage.command += (usage.command.empty() ? "" : " ") + word;
+            usage.command = longer;
         }
         return usage;
     }
 
-    std::vector<Usage> usagesIn(const DocPage::Section &section) {
-        std::vector<Usage> usages;
+    Content contentOf(const DocPage::Section &section) const {
+        Content content;
         for (const std::string &code : codeIn(section.heading + "\n" + section.text)) {
             if (const auto usage = usageIn(code)) {
-                usages.push_back(*usage);
+                content.usages.push_back(*usage);
+            } else {
+                content.looseOptions.merge(optionsIn(code));
             }
         }
-        return usages;
+        return content;
     }
 
-    /// The options of a section that are in no usage line.
-    Names looseOptionsIn(const DocPage::Section &section) {
-        Names options;
-        for (const std::string &code : codeIn(section.text)) {
-            if (!usageIn(code)) {
-                options.merge(optionsIn(code));
-            }
-        }
-        return options;
-    }
-
-    /// The options and usage words that the page documents for the command.
-    /// \return false if no section names the command
-    bool readAbout(const std::string &command, const DocPage &page, Names &options,
-                   std::string &usageText) {
-        bool named = false;
-        std::string links;
+    /// By command: what stands in the sections that name it, and in those that they link to.
+    std::map<std::string, Description> descriptionsIn(const DocPage &page) const {
+        std::map<std::string, Description> descriptions;
         for (const DocPage::Section &section : page.sections()) {
-            for (const Usage &usage : usagesIn(section)) {
-                if (usage.command == command) {
-                    named = true;
-                    usageText += usage.rest + " ";
-                    options.merge(looseOptionsIn(section));
-                    links += section.text;
+            for (const auto &[command, rest] : contentOf(section).usages) {
+                Description &description = descriptions[command];
+                description.usage += rest + " ";
+                description.options.merge(optionsIn(rest));
+                for (const DocPage::Section &other : page.sections()) {
+                    if (other.heading == section.heading ||
+                        section.text.find(linkTo(other.heading)) != std::string::npos) {
+                        description.options.merge(contentOf(other).looseOptions);
+                    }
                 }
             }
         }
-        for (const DocPage::Section &section : page.sections()) {
-            if (links.find("(" + anchorOf(section.heading) + ")") != std::string::npos) {
-                options.merge(looseOptionsIn(section));
-            }
-        }
-        options.merge(optionsIn(usageText));
-        return named;
+        return descriptions;
     }
 
-    bool has(const std::string &command, const std::string &option) const {
-        return options_.at(command).count(option) > 0 || options_.at("").count(option) > 0;
+    bool isCommand(const std::string &words) const {
+        return !words.empty() && commands_.count(words) > 0;
     }
 
     std::map<std::string, CLI::App *> commands_; ///< those that do something, and the program
@@ -157,14 +136,11 @@ private:
 };
 
 TEST_F(CommandTree, IsDocumentedAsAWhole) {
-    const DocPage page(kPage);
+    auto descriptions = descriptionsIn(DocPage(kPage));
     for (const auto &[command, node] : commands_) {
-        Names documented;
-        std::string usage;
-        if (!readAbout(command, page, documented, usage)) {
-            ADD_FAILURE() << kPage << " does not describe `ovradr " << command << "`: add it";
-            continue;
-        }
+        EXPECT_TRUE(descriptions.count(command) > 0)
+            << kPage << " does not describe `ovradr " << command << "`: add it";
+        const auto &[documented, usage] = descriptions[command];
         for (const std::string &option : options_[command]) {
             EXPECT_TRUE(documented.count(option) > 0 || (option == "--help" && !command.empty()))
                 << kPage << ": `ovradr " << command << "` has an option " << option
@@ -187,15 +163,16 @@ TEST_F(CommandTree, ShowsAnExampleOfEveryCommand) {
 }
 
 TEST_F(CommandTree, IsAllThatPagesMention) {
+    static const std::regex kWordFirst(" *[a-z]+( .*)?");
     for (const std::string &name : OvraTest::docPages()) {
         const DocPage page(name);
         for (const DocPage::Section &section : page.sections()) {
-            for (const Usage &usage : usagesIn(section)) {
-                EXPECT_TRUE(usage.known) << name << ": there is no `ovradr " << usage.command << " "
-                                         << usage.rest << "`";
-                for (const std::string &option : optionsIn(usage.rest)) {
-                    EXPECT_TRUE(has(usage.command, option))
-                        << name << ": `ovradr " << usage.command << "` has no option " << option;
+            for (const auto &[command, rest] : contentOf(section).usages) {
+                EXPECT_TRUE(isCommand(command) || !std::regex_match(rest, kWordFirst))
+                    << name << ": there is no `ovradr " << command << rest << "`";
+                for (const std::string &option : optionsIn(rest)) {
+                    EXPECT_TRUE(options_[command].count(option) + options_[""].count(option) > 0)
+                        << name << ": `ovradr " << command << "` has no option " << option;
                 }
             }
         }
@@ -204,18 +181,17 @@ TEST_F(CommandTree, IsAllThatPagesMention) {
 
 TEST_F(CommandTree, HasEveryOptionThatItsPageDescribes) {
     const DocPage page(kPage);
+    Names all;
+    for (const auto &[command, options] : options_) {
+        all.insert(options.begin(), options.end());
+    }
     for (const DocPage::Section &section : page.sections()) {
-        Names commands;
-        for (const Usage &usage : usagesIn(section)) {
-            commands.insert(usage.command);
+        const auto [usages, looseOptions] = contentOf(section);
+        Names known = usages.empty() ? all : options_[""];
+        for (const Usage &usage : usages) {
+            known.merge(Names(options_[usage.command]));
         }
-        Names known = options_[""];
-        for (const auto &[command, options] : options_) {
-            if (commands.empty() || commands.count(command) > 0) {
-                known.insert(options.begin(), options.end());
-            }
-        }
-        for (const std::string &option : looseOptionsIn(section)) {
+        for (const std::string &option : looseOptions) {
             EXPECT_TRUE(known.count(option) > 0)
                 << kPage << ", \"" << section.heading
                 << "\": no command of this section has an option " << option;
@@ -228,7 +204,7 @@ TEST_F(CommandTree, HasItsDocumentsForScriptsDescribed) {
     for (const DocPage::Row &row : DocPage(kPage).rows("For scripts")) {
         for (const std::string &code : codeIn(row[0])) {
             const std::optional<Usage> usage = usageIn("ovradr " + code);
-            EXPECT_TRUE(usage->known && commands_.count(usage->command) > 0)
+            EXPECT_TRUE(isCommand(usage->command))
                 << kPage << ", \"For scripts\": there is no command " << code;
             described.insert(usage->command);
         }

@@ -1,20 +1,14 @@
 // SPDX-License-Identifier: Apache-2.0
 // The fate of rows and sessions when a credential is changed or deleted, completely or partly.
 #include "platform/store/raw_sqlite.h"
-#include "program.h"
+#include "scripted_node.h"
 #include "shared/pending_releases.h"
 #include "shared/session_lock.h"
-#include "support/local_node.h"
-#include "support/remote_node.h"
 
 #include <ovradrcore/json.h>
 
-#include <gtest/gtest.h>
-#include <sys/stat.h>
-
 #include <atomic>
 #include <csignal>
-#include <filesystem>
 #include <set>
 #include <thread>
 
@@ -27,42 +21,33 @@ using OvraApps::PendingReleases;
 using OvraTest::addCred;
 using OvraTest::executeSql;
 using OvraTest::querySql;
-using OvraTest::RemoteNode;
 
-constexpr const char *kDead = R"({"success":false,"error":{"code":119}})";
-
-/// A credential "c1" with the session "old"; the remote grants "granted" and deletes sessions on
-/// request.
-class Life : public testing::Test {
+/// A credential "c1" with the session "old"; the remote deletes sessions on request.
+class Life : public ScriptedNode {
 protected:
-    Life() {
-        EXPECT_EQ(run({"setup"}).exit, 0);
-        begin();
-    }
+    Life() { begin(); }
 
     void begin() {
         std::filesystem::remove(OvraApps::kPendingReleasesFile);
         ended.clear();
         executeSql("DELETE FROM node_cred");
         addCred("node_cred", "n1", "c1", "https", remote.port(), "old");
-        remote.answer("login", R"({"success":true,"data":{"sid":"login-session"}})");
-        remote.answer("info", R"({"success":true,"data":{"node_id":"n1","serial":"S1"}})");
-        remote.answer("create", R"({"success":true,"data":{"session":"granted"}})");
-        for (const char *session : {"old", "granted", "granted-1", "granted-2"}) {
-            remote.answer(session + std::string(" test_privilege"), R"({"success":true})");
+        remote.forgetAnswers();
+        admitBob(remote);
+        for (const char *method :
+             {"probe", "login", "info", "create", "test_privilege", "logout", "delete"}) {
+            remote.before(method, [this, method] { called(method); });
         }
-        remote.before("delete", [this] { forgetDeleted(); });
     }
 
-    void forgetDeleted() {
-        Json::Value params;
-        EXPECT_TRUE(OvraDRCore::fromString(params, remote.params("delete")));
-        ended.insert(params["session"].asString());
-        remote.answer(params["session"].asString() + " test_privilege", kDead);
-    }
-
-    /// Kills the program at its intended last call.
-    void count() {
+    /// Kills the program at its intended last call, before the answer.
+    void called(const std::string &method) {
+        if (method == "delete") {
+            Json::Value params;
+            EXPECT_TRUE(OvraDRCore::fromString(params, remote.params("delete")));
+            ended.insert(params["session"].asString());
+            remote.answer(params["session"].asString() + " test_privilege", refusal(119));
+        }
         if (++calls == fatal) {
             while (victim == 0) {
             }
@@ -70,30 +55,8 @@ protected:
         }
     }
 
-    Arguments change(const Arguments &command) const {
-        Arguments all{"cred"};
-        all.insert(all.end(), command.begin(), command.end());
-        for (const char *word : {"--account", "bob", "--password-stdin", "--fingerprint"}) {
-            all.emplace_back(word);
-        }
-        all.push_back(remote.server.fingerprint());
-        return all;
-    }
-    Arguments create() const {
-        return change({"create", "https://127.0.0.1:" + std::to_string(remote.port())});
-    }
-
-    /// Runs the program and kills it when the remote gets the call with that number, before the
-    /// answer; 0: never.
+    /// Runs the program until the remote gets the call with that number; 0: to its end.
     void runUntil(const Arguments &arguments, int call) {
-        for (const char *method :
-             {"probe", "login", "info", "create", "test_privilege", "logout"}) {
-            remote.before(method, [this] { count(); });
-        }
-        remote.before("delete", [this] {
-            forgetDeleted();
-            count();
-        });
         victim = 0;
         calls = 0;
         fatal = call;
@@ -112,65 +75,56 @@ protected:
         return releases;
     }
 
+    const Arguments create = asBob(remote, {"cred", "create", url});
+    const Arguments set = asBob(remote, {"cred", "set", "c1"});
+    const Arguments drop{"cred", "delete", "c1", "--json"};
     std::atomic<int> calls = 0;
     std::atomic<int> fatal = 0;
     std::atomic<pid_t> victim = 0;
     std::set<std::string> ended; ///< the sessions that the remote was asked to delete
-    RemoteNode remote;
 };
 
 } // namespace
 
 TEST_F(Life, ADeletionSaysWhatBecameOfTheSession) {
-    const struct {
-        const char *word;
-        std::function<void()> arrange;
-        int pending;
-    } cases[] = {
-        {"released", [] {}, 0},
-        {"ended_already", [this] { remote.answer("old test_privilege", kDead); }, 0},
-        {"kept", [this] { addCred("node_cred", "n1", "c2", "https", remote.port(), "old"); }, 0},
-        {"left_behind",
-         [this] {
-             remote.answer("old test_privilege", R"({"success":false,"error":{"code":105}})");
-         },
-         1},
-        {"left_behind", [this] { remote.before("delete", [] {}); }, 1},
-        {"left_behind", [this] { remote.die(); }, 1},
+    const std::pair<std::string, std::function<void()>> cases[] = {
+        {"released", [] {}},
+        {"ended_already", [this] { remote.answer("old test_privilege", refusal(119)); }},
+        {"kept", [this] { addCred("node_cred", "n1", "c2", "https", remote.port(), "old"); }},
+        {"left_behind", [this] { remote.answer("old test_privilege", refusal(105)); }},
+        {"left_behind", [this] { remote.before("delete", [] {}); }},
+        {"left_behind", [this] { remote.die(); }},
     };
-    for (const auto &each : cases) {
+    for (const auto &[word, arrange] : cases) {
         begin();
-        each.arrange();
-        const Json::Value foreseen = run({"cred", "delete", "c1", "--dry-run", "--json"}).json();
-        EXPECT_EQ(foreseen["data"]["row"], "present");
-        const Result result = run({"cred", "delete", "c1", "--json"});
+        arrange();
+        EXPECT_EQ(run(drop + Arguments{"--dry-run"}).json()["data"]["row"], "present");
+        const Result result = run(drop);
         EXPECT_EQ(result.exit, 0);
-        EXPECT_EQ(result.json()["data"]["session"], each.word) << result.out;
+        EXPECT_EQ(result.json()["data"]["session"], word) << result.out;
         EXPECT_EQ(querySql("SELECT 1 FROM node_cred WHERE cred_id = 'c1'"), "");
-        EXPECT_EQ(pending().size(), static_cast<std::size_t>(each.pending)) << result.out;
+        EXPECT_EQ(pending().size(), word == "left_behind" ? 1U : 0U) << result.out;
     }
 }
 
 TEST_F(Life, ACommandThatIsKilledAnywhereLeavesTheOldOrTheNewStateAndNoSessionUnseen) {
-    const struct {
-        Arguments command;
-        std::string after; ///< the sessions in the rows
-    } cases[] = {{create(), "old\ngranted\n"},
-                 {change({"set", "c1"}), "granted\n"},
-                 {{"cred", "delete", "c1"}, ""}};
-    for (const auto &each : cases) {
+    const std::pair<Arguments, std::string> cases[] = {// with the sessions in the rows afterwards
+                                                       {create, "old\ngranted-s3cret\n"},
+                                                       {set, "granted-s3cret\n"},
+                                                       {drop, ""}};
+    for (const auto &[command, after] : cases) {
         begin();
-        runUntil(each.command, 0);
+        runUntil(command, 0);
         const int last = calls;
-        EXPECT_EQ(sessions(), each.after);
+        EXPECT_EQ(sessions(), after);
         EXPECT_GE(last, 3);
         for (int call = 1; call <= last; ++call) {
-            SCOPED_TRACE(each.command[1] + " killed at call " + std::to_string(call));
+            SCOPED_TRACE(command[1] + " killed at call " + std::to_string(call));
             begin();
             remote.forgetCalls();
-            runUntil(each.command, call);
+            runUntil(command, call);
             const std::string rows = sessions();
-            EXPECT_TRUE(rows == "old\n" || rows == each.after) << rows;
+            EXPECT_TRUE(rows == "old\n" || rows == after) << rows;
             EXPECT_EQ(run({"session", "pending", "--retry"}).exit, 0);
             EXPECT_TRUE(pending().empty());
             const bool needed = rows.find("old") != std::string::npos;
@@ -180,22 +134,14 @@ TEST_F(Life, ACommandThatIsKilledAnywhereLeavesTheOldOrTheNewStateAndNoSessionUn
 }
 
 TEST_F(Life, CommandsAtTheSameTimeLeaveNoSessionThatNobodyKnows) {
-    const Arguments set = change({"set", "c1"});
-    const Arguments drop{"cred", "delete", "c1", "--json"};
     const Arguments other{"cred", "delete", "c2", "--json"};
-    const struct {
-        const char *what;
-        Arguments first;
-        Arguments second;
-        bool killed; ///< both, when the session that they share is to be released
-    } cases[] = {{"two changes", set, set, false},
-                 {"change and deletion", set, drop, false},
-                 {"two that share", drop, other, false},
-                 {"two that share, killed", drop, other, true}};
-    for (const auto &each : cases) {
-        SCOPED_TRACE(each.what);
+    // The last ones are killed when the session that they share is to be released.
+    const std::tuple<Arguments, Arguments, bool> cases[] = {
+        {set, set, false}, {set, drop, false}, {drop, other, false}, {drop, other, true}};
+    for (const auto &[one, another, killed] : cases) {
+        SCOPED_TRACE(one[1] + " and " + another[1] + " " + another[2]);
         begin();
-        const bool sharing = each.second == other;
+        const bool sharing = another == other;
         if (sharing) {
             addCred("node_cred", "n1", "c2", "https", remote.port(), "old");
         }
@@ -211,22 +157,20 @@ TEST_F(Life, CommandsAtTheSameTimeLeaveNoSessionThatNobodyKnows) {
         remote.before("login", meet);
         remote.before("test_privilege", [&] { sharing || arrived >= 2 ? void() : meet(); });
         remote.before("create", [&] {
-            remote.answer("create", R"({"success":true,"data":{"session":"granted-)" +
-                                        std::to_string(++grants) + R"("}})");
+            remote.answer("create",
+                          success(R"({"session":"granted-)" + std::to_string(++grants) + "\"}"));
         });
-        remote.before("delete", [&] {
-            if (each.killed) {
+        if (killed) {
+            remote.before("delete", [&pids] {
                 do { // so that the other one ends
                     std::this_thread::sleep_for(std::chrono::milliseconds(300));
                 } while (pids[0] == 0 || pids[1] == 0);
                 kill(pids[0], SIGKILL);
                 kill(pids[1], SIGKILL);
-            } else {
-                forgetDeleted();
-            }
-        });
-        Program first(each.first, "secret word\n");
-        Program second(each.second, "secret word\n");
+            });
+        }
+        Program first(one, "secret word\n");
+        Program second(another, "secret word\n");
         pids[0] = first.pid();
         pids[1] = second.pid();
         const std::string said = first.finish().out + second.finish().out;
@@ -240,7 +184,7 @@ TEST_F(Life, CommandsAtTheSameTimeLeaveNoSessionThatNobodyKnows) {
             EXPECT_TRUE(ended.count(session) != 0 || known.find(session) != std::string::npos)
                 << session << " lives, and nobody knows";
         }
-        if (sharing && !each.killed) {
+        if (sharing && !killed) {
             EXPECT_NE(said.find("\"kept\""), std::string::npos) << said;
             EXPECT_NE(said.find("\"released\""), std::string::npos) << said;
         }
@@ -251,85 +195,63 @@ TEST_F(Life, ASessionWhoseRowCannotBeStoredIsNotedForRelease) {
     executeSql(
         "CREATE TRIGGER ins BEFORE INSERT ON node_cred BEGIN SELECT RAISE(FAIL, 'full'); END;"
         "CREATE TRIGGER up BEFORE UPDATE ON node_cred BEGIN SELECT RAISE(FAIL, 'full'); END");
-    for (const Arguments &command : {create(), change({"set", "c1"})}) {
-        const Result result = run(command, "secret word\n");
-        EXPECT_EQ(result.exit, 9) << result.err;
-        ASSERT_FALSE(pending().empty()) << command[1];
-        EXPECT_EQ(pending().back().session, "granted");
-        EXPECT_TRUE(PendingReleases().remove(pending().back()));
-        EXPECT_TRUE(pending().empty());
+    for (const Arguments &command : {create, set}) {
+        std::filesystem::remove(OvraApps::kPendingReleasesFile);
+        EXPECT_EQ(run(command, "secret word\n").exit, 9);
+        ASSERT_EQ(pending().size(), 1U) << command[1];
+        EXPECT_EQ(pending()[0].session, "granted-s3cret");
     }
 }
 
 TEST_F(Life, ACredentialMovesWithItsSessionToAnEndpointOfItsNode) {
     addCred("node_cred", "n1", "c2", "https", remote.port(), "old");
-    EXPECT_EQ(run(create(), "secret word\n").exit, 0) << "the key is known from here on";
-    const auto at = [this](const char *host) {
-        return std::string("https://") + host + ":" + std::to_string(remote.port());
+    EXPECT_EQ(run(create, "secret word\n").exit, 0) << "the key is known from here on";
+    const std::string port = ":" + std::to_string(remote.port());
+    const auto expectMove = [&](const std::string &host, int exit, const char *row) {
+        const Result result =
+            run({"cred", "set", "c1", "--url", "https://" + host + port, "--json"});
+        EXPECT_EQ(result.exit, exit) << result.out;
+        EXPECT_EQ(querySql("SELECT addr, session FROM node_cred WHERE cred_id = 'c1'"), row);
+        return result.json()["data"];
     };
-    const auto move = [](const std::string &url) {
-        return run({"cred", "set", "c1", "--url", url, "--json"});
+    remote.answer("get", success(R"({"account":"joe"})"));
+    const std::tuple<const char *, std::string, int> refusals[] = {
+        {"info", success(R"({"node_id":"n2","serial":"S"})"), 1},
+        {"info", refusal(119), 4},
+        {"old test_privilege", refusal(105), 8},
     };
-    const auto row = [] {
-        return querySql("SELECT addr, session FROM node_cred WHERE cred_id = 'c1'");
-    };
-    remote.answer("get", R"({"success":true,"data":{"account":"joe"}})");
-    const struct {
-        const char *call;
-        const char *answer;
-        int exit;
-    } refusals[] = {
-        {"info", R"({"success":true,"data":{"node_id":"n2","serial":"S"}})", 1},
-        {"info", kDead, 4},
-        {"old test_privilege", R"({"success":false,"error":{"code":105}})", 8},
-    };
-    for (const auto &each : refusals) {
-        remote.answer("info", R"({"success":true,"data":{"node_id":"n1","serial":"S1"}})");
-        remote.answer(each.call, std::string(each.answer));
-        EXPECT_EQ(move(at("localhost")).exit, each.exit) << each.answer;
+    for (const auto &[call, answer, exit] : refusals) {
+        admitBob(remote);
+        remote.answer(call, answer);
+        expectMove("localhost", exit, "127.0.0.1|old\n");
     }
     EXPECT_EQ(run({"cred", "set", "c1"}).exit, 2);
-    EXPECT_EQ(run({"cred", "set", "c1", "--url", at("localhost"), "--password-stdin"}).exit, 2);
-    EXPECT_EQ(row(), "127.0.0.1|old\n");
-    remote.answer("old test_privilege", R"({"success":true})");
-    const Json::Value moved = move(at("localhost")).json()["data"];
+    EXPECT_EQ(run({"cred", "set", "c1", "--url", url, "--password-stdin"}).exit, 2);
+    remote.answer("old test_privilege", success("{}"));
+    const Json::Value moved = expectMove("localhost", 0, "localhost|old\n");
     EXPECT_EQ(moved["session"].asString() + moved["account"].asString(), "unchangedjoe");
     EXPECT_TRUE(moved["endpoint_changed"].asBool());
-    EXPECT_EQ(row(), "localhost|old\n");
     EXPECT_EQ(querySql("SELECT addr FROM node_cred WHERE cred_id = 'c2'"), "127.0.0.1\n");
 
-    remote.server.changeCertificate();
+    remote.server.changeCertificate(); // another key, and nobody who vouches for it
     remote.server.closeConnections();
     remote.forgetCalls();
-    EXPECT_EQ(move(at("[::ffff:127.0.0.1]")).exit, 6)
-        << "another key, and nobody who vouches for it";
+    expectMove("[::ffff:127.0.0.1]", 6, "localhost|old\n");
     EXPECT_EQ(remote.calls(), "");
-    EXPECT_EQ(row(), "localhost|old\n");
-}
-
-TEST_F(Life, WhatIsStillNeededIsNotReleased) {
-    // The state left by a deletion killed before removing the row.
-    PendingRelease note{"old", OvraDRNode::Conn::https("127.0.0.1", remote.port()), "n1", "c1"};
-    ASSERT_TRUE(PendingReleases().note(note));
-    EXPECT_EQ(
-        run({"session", "pending", "--retry", "--json"}).json()["data"]["tried"][0]["session"],
-        "kept");
-    EXPECT_TRUE(pending().empty());
-    EXPECT_EQ(remote.calls().find("delete"), std::string::npos);
 }
 
 TEST_F(Life, ASessionIsNotReleasedWhileACredentialIsMadeWithIt) {
     // The remote grants the session whose release is still pending.
     ASSERT_TRUE(PendingReleases().note(
-        {"granted", OvraDRNode::Conn::https("127.0.0.1", remote.port()), "n1", "c0"}));
+        {"granted-s3cret", OvraDRNode::Conn::https("127.0.0.1", remote.port()), "n1", "c0"}));
     std::optional<Program> releasing;
     remote.before("create", [&] {
         releasing.emplace(Arguments{"session", "pending", "--retry", "--json"});
         std::this_thread::sleep_for(std::chrono::milliseconds(500));
     });
-    EXPECT_EQ(run(create(), "secret word\n").exit, 0);
+    EXPECT_EQ(run(create, "secret word\n").exit, 0);
     EXPECT_EQ(releasing->finish().json()["data"]["tried"][0]["session"], "kept");
-    EXPECT_EQ(remote.calls().find("granted delete"), std::string::npos);
+    EXPECT_TRUE(ended.empty());
 }
 
 TEST(PendingRelease, IsDueAgainAfterPausesThatGrow) {
@@ -352,9 +274,7 @@ TEST(PendingRelease, IsDueAgainAfterPausesThatGrow) {
         EXPECT_TRUE(due(failed + pause)) << pause;
     }
     EXPECT_TRUE(due(0)) << "the clock was set back";
-    struct stat status {};
-    ASSERT_EQ(stat(OvraApps::kPendingReleasesFile, &status), 0);
-    EXPECT_EQ(status.st_mode & 0777U, 0600U);
+    EXPECT_EQ(modeOf(OvraApps::kPendingReleasesFile), 0600U);
     EXPECT_TRUE(store.remove(note));
     EXPECT_FALSE(due(1 << 30));
 }

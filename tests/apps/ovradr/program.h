@@ -1,22 +1,45 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
+#include "platform/own_files.h"
+
 #include <json/value.h>
 #include <sys/types.h>
 
+#include <functional>
+#include <optional>
 #include <string>
 #include <vector>
 
 namespace OvradrTest {
 
+using OvraTest::modeOf;
+using OvraTest::readFile;
+using OvraTest::writeFile;
 using Arguments = std::vector<std::string>;
 
-/// Replaces this process by the program: that of this build, unless OVRADR_PROGRAM names another.
-[[noreturn]] void execute(const Arguments &arguments);
+/// All of them, one after the other.
+Arguments operator+(Arguments first, const Arguments &second);
 
-/// The program's output and exit code; -1: ended by a signal, or killed after the time-out.
+/// The program as a child process. Killed after a minute, or if still running on destruction.
+class Process {
+public:
+    /// \param connect  gives the child its standard input and output
+    Process(const Arguments &arguments, const std::function<void()> &connect);
+    Process(const Process &) = delete;
+    Process &operator=(const Process &) = delete;
+    ~Process();
+
+    pid_t pid() const { return pid_; }
+    /// Repeats `meanwhile` until the end. \return the exit code, or minus the signal
+    int wait(const std::function<void()> &meanwhile);
+
+private:
+    pid_t pid_;
+};
+
 struct Result {
-    int exit = -1;
+    int exit; ///< the exit code, or minus the signal
     std::string out;
     std::string err;
 
@@ -24,22 +47,18 @@ struct Result {
     Json::Value json() const;
 };
 
-/// The program, running with `input` as its standard input. Killed if still running on destruction.
+/// The program, running with `input` as its standard input.
 class Program {
 public:
     explicit Program(const Arguments &arguments, const std::string &input = "");
-    Program(const Program &) = delete;
-    Program &operator=(const Program &) = delete;
     ~Program();
 
-    pid_t pid() const { return pid_; }
-    /// Waits 30 seconds at most.
+    pid_t pid() const { return process_.pid(); }
     Result finish();
 
 private:
-    pid_t pid_ = -1;
-    int out_;
-    int err_;
+    std::vector<int> streams_;
+    Process process_;
 };
 
 /// Runs the program to its end.
@@ -49,30 +68,27 @@ Result run(const Arguments &arguments, const std::string &input = "");
 class Terminal {
 public:
     explicit Terminal(const Arguments &arguments);
-    Terminal(const Terminal &) = delete;
-    Terminal &operator=(const Terminal &) = delete;
     ~Terminal();
 
-    /// Reads until the screen shows `text` after the previously awaited text; false after 10
-    /// seconds.
+    /// Reads until the screen shows `text` after the previously awaited text; false if nothing new
+    /// appears for 10 seconds.
     bool shows(const std::string &text);
     void type(const std::string &text) const;
+    /// Types the line when the screen shows the question; false if it does not.
+    bool answers(const std::string &question, const std::string &line);
     bool echoes() const;
     /// Reads the rest. \return the exit code, or minus the signal
     int finish();
     const std::string &screen() const { return screen_; }
 
 private:
-    bool readOn();
+    bool readOn(int milliseconds);
 
-    pid_t pid_ = -1;
     int master_ = -1;
     int slave_ = -1; ///< keeps the terminal, so that it can be looked at after the program's end
+    std::optional<Process> process_;
     std::string screen_;
     std::size_t seen_ = 0;
 };
-
-std::string readFile(const std::string &path);
-void writeFile(const std::string &path, const std::string &content);
 
 } // namespace OvradrTest

@@ -40,10 +40,7 @@ TEST(SpeedCommand, EveryEndpointThatWasTriedIsNamedWithItsOutcome) {
 }
 
 TEST(SpeedCommand, IsShownWithThreeFigures) {
-    const struct {
-        const char *speed;
-        const char *text;
-    } cases[] = {
+    const std::pair<const char *, const char *> cases[] = {
         {"94.1 Mbit/s", "94.1 Mbit/s (11.8 MB/s)"},
         {"5189.6 Mbit/s", "5.19 Gbit/s (649 MB/s)"},
         {"0.0 Mbit/s", "0.00 bit/s (0.00 B/s)"},
@@ -51,8 +48,8 @@ TEST(SpeedCommand, IsShownWithThreeFigures) {
         {"fast enough", "fast enough"},
         {"12 furlongs", "12 furlongs"},
     };
-    for (const auto &each : cases) {
-        EXPECT_EQ(Ovradr::rateText(each.speed), each.text);
+    for (const auto &[speed, text] : cases) {
+        EXPECT_EQ(Ovradr::rateText(speed), text);
     }
 }
 

@@ -6,7 +6,6 @@
 #include <ovraplatform/totp.h>
 
 #include <gtest/gtest.h>
-#include <sys/stat.h>
 
 #include <csignal>
 
@@ -24,18 +23,16 @@ LoginResult logIn(const std::string &password) {
     return AccountStore().verify("bob", password, "");
 }
 
-void addBob() {
-    ASSERT_EQ(run({"user", "add", "bob", "--password-stdin"}, std::string(kPassword) + "\n").exit,
-              0);
+int addBob() {
+    return run({"user", "add", "bob", "--admin", "--password-stdin"}, "correct horse\nmore").exit;
 }
 
 } // namespace
 
 TEST(User, LivesFromAddToRemove) {
     EXPECT_EQ(run({"user", "list", "--json"}).json()["data"]["users"].size(), 0U);
-    ASSERT_EQ(
-        run({"user", "add", "bob", "--admin", "--password-stdin"}, "correct horse\nmore").exit, 0);
-    EXPECT_EQ(logIn("correct horse"), LoginResult::kOk);
+    ASSERT_EQ(addBob(), 0);
+    EXPECT_EQ(logIn(kPassword), LoginResult::kOk);
     const Json::Value users = run({"user", "list", "--json"}).json()["data"]["users"];
     ASSERT_EQ(users.size(), 1U);
     EXPECT_EQ(users[0]["name"], "bob");
@@ -59,7 +56,7 @@ TEST(User, LivesFromAddToRemove) {
 }
 
 TEST(User, WhoIsRemovedLosesHisSessionsAndNobodyElseDoes) {
-    addBob();
+    ASSERT_EQ(addBob(), 0);
     SessionStore sessions;
     const auto his = sessions.create({.user = "bob", .app = "Tidewater", .timeout = -1});
     const auto hers = sessions.create({.user = "bobby", .app = "Tidewater", .timeout = -1});
@@ -74,7 +71,7 @@ TEST(User, WhoIsRemovedLosesHisSessionsAndNobodyElseDoes) {
 }
 
 TEST(User, TheSecretOfOneTimeCodesIsShownOnlyWhereItIsAskedFor) {
-    addBob();
+    ASSERT_EQ(addBob(), 0);
     EXPECT_EQ(run({"user", "totp", "bob"}).exit, 2) << "the output is not a terminal";
     EXPECT_EQ(logIn(kPassword), LoginResult::kOk) << "and nothing was switched on";
 
@@ -93,48 +90,35 @@ TEST(User, TheSecretOfOneTimeCodesIsShownOnlyWhereItIsAskedFor) {
 }
 
 TEST(Password, IsTypedTwiceAndNotEchoed) {
-    for (const bool same : {false, true}) {
+    const std::pair<const char *, int> cases[] = {
+        {"correct hors\n", 1}, {"corr\x03", -SIGINT}, {"correct horse\n", 0}};
+    for (const auto &[again, exit] : cases) { // \x03: Ctrl-C
         Terminal terminal({"user", "add", "bob"});
         ASSERT_TRUE(terminal.shows("Password of bob: "));
         EXPECT_FALSE(terminal.echoes());
         terminal.type("correct horse\n");
         ASSERT_TRUE(terminal.shows("Again: "));
-        terminal.type(same ? "correct horse\n" : "correct hors\n");
-        EXPECT_EQ(terminal.finish(), same ? 0 : 1) << terminal.screen();
+        terminal.type(again);
+        EXPECT_EQ(terminal.finish(), exit) << terminal.screen();
         EXPECT_TRUE(terminal.echoes());
         EXPECT_EQ(terminal.screen().find("hors"), std::string::npos) << terminal.screen();
-        EXPECT_EQ(logIn(kPassword), same ? LoginResult::kOk : LoginResult::kWrong);
+        EXPECT_EQ(logIn(kPassword), exit == 0 ? LoginResult::kOk : LoginResult::kWrong);
     }
 }
 
-TEST(Password, TheEchoComesBackWhenThePromptIsInterrupted) {
-    Terminal terminal({"user", "add", "bob"});
-    ASSERT_TRUE(terminal.shows("Password of bob: "));
-    EXPECT_FALSE(terminal.echoes());
-    terminal.type("corr\x03"); // Ctrl-C
-    EXPECT_EQ(terminal.finish(), -SIGINT);
-    EXPECT_TRUE(terminal.echoes());
-}
-
 TEST(Password, FromAFileIsItsFirstLine) {
-    writeFile("/tmp/ovradr_test_password", "correct horse\nnot this\n");
-    const Result warned =
-        run({"user", "add", "bob", "--password-file", "/tmp/ovradr_test_password"});
+    const std::string file = "/tmp/ovradr_test_password";
+    writeFile(file, "correct horse\nnot this\n");
+    const Result warned = run({"user", "add", "bob", "--password-file", file});
     EXPECT_EQ(warned.exit, 0) << warned.err;
     EXPECT_EQ(logIn(kPassword), LoginResult::kOk);
     EXPECT_NE(warned.err.find("everybody can read"), std::string::npos);
-    chmod("/tmp/ovradr_test_password", 0600);
-    EXPECT_EQ(run({"user", "passwd", "bob", "--password-file", "/tmp/ovradr_test_password"}).err,
-              "");
+    chmod(file.c_str(), 0600);
+    EXPECT_EQ(run({"user", "passwd", "bob", "--password-file", file}).err, "");
 }
 
 TEST(Password, IsRefusedWhenItCannotBeRead) {
-    const struct {
-        const char *what;
-        Arguments arguments;
-        std::string input;
-        int exit;
-    } cases[] = {
+    const std::tuple<const char *, Arguments, std::string, int> cases[] = {
         {"empty", {"--password-stdin"}, "", 1},
         {"an empty line", {"--password-stdin"}, "\ncorrect horse\n", 1},
         {"too short", {"--password-stdin"}, "short\n", 1},
@@ -143,19 +127,17 @@ TEST(Password, IsRefusedWhenItCannotBeRead) {
         {"a NUL", {"--password-stdin"}, std::string("correct \0horse\n", 15), 1},
         {"no such file", {"--password-file", "/nowhere/at/all"}, "", 1},
         {"a folder", {"--password-file", "/"}, "", 1},
-        {"nobody to ask", {}, "correct horse\n", 2},
+        {"nobody to ask", Arguments{}, "correct horse\n", 2},
         {"two sources", {"--password-stdin", "--password-file", "/dev/null"}, "correct horse\n", 2},
         {"as an argument", {"--password", "correct horse"}, "", 2},
         {"as an argument", {"--password=correct horse"}, "", 2},
         {"as a further argument", {"correct horse"}, "", 2},
     };
-    for (const auto &each : cases) {
-        Arguments arguments{"user", "add", "bob"};
-        arguments.insert(arguments.end(), each.arguments.begin(), each.arguments.end());
-        const Result result = run(arguments, each.input);
-        EXPECT_EQ(result.exit, each.exit) << each.what << ": " << result.err;
+    for (const auto &[what, arguments, input, exit] : cases) {
+        const Result result = run(Arguments{"user", "add", "bob"} + arguments, input);
+        EXPECT_EQ(result.exit, exit) << what << ": " << result.err;
         EXPECT_EQ((result.out + result.err).find("horse"), std::string::npos) << result.err;
-        EXPECT_EQ(logIn(kPassword), LoginResult::kWrong) << each.what;
+        EXPECT_EQ(logIn(kPassword), LoginResult::kWrong) << what;
     }
 }
 
