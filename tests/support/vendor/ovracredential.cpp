@@ -31,8 +31,21 @@ std::set<const void *> &liveObjects() {
     return objects;
 }
 
+/// \param error  receives the number, if the operation has to fail
+bool fails(const char *operation, int *error = nullptr) {
+    const auto &fault = credentialLibrary().fault;
+    const std::optional<int> number = fault ? fault(operation) : std::nullopt;
+    if (number && error != nullptr) {
+        *error = *number;
+    }
+    return number.has_value();
+}
+
 template <typename Object>
-Object *obtain(OvraVendor::Live &live) {
+Object *obtain(const char *operation, OvraVendor::Live &live) {
+    if (fails(operation)) {
+        return nullptr;
+    }
     auto *object = new Object;
     liveObjects().insert(object);
     live.obtained();
@@ -65,8 +78,8 @@ bool isLive(const OVRACredSess *sess) {
 
 /// An item as the C functions take it: rejected if empty.
 template <typename Object>
-int setItem(Object *object, std::string Object::*item, const char *value) {
-    if (!isLive(object) || value == nullptr || *value == '\0') {
+int setItem(const char *operation, Object *object, std::string Object::*item, const char *value) {
+    if (fails(operation) || !isLive(object) || value == nullptr || *value == '\0') {
         return -1;
     }
     object->*item = value;
@@ -95,38 +108,38 @@ OvraVendor::CredentialLibrary &OvraVendor::credentialLibrary() {
 
 extern "C" {
 OVRACred *OVRACredAlloc() {
-    return obtain<OVRACred>(credentialLibrary().credentials);
+    return obtain<OVRACred>(__func__, credentialLibrary().credentials);
 }
 void OVRACredFree(OVRACred *cred) {
     giveBack(cred, credentialLibrary().credentials);
 }
 OVRACredSess *OVRACredSessAlloc() {
-    return obtain<OVRACredSess>(credentialLibrary().sessions);
+    return obtain<OVRACredSess>(__func__, credentialLibrary().sessions);
 }
 void OVRACredSessFree(OVRACredSess *sess) {
     giveBack(sess, credentialLibrary().sessions);
 }
 int OVRACredItemSetProtocol(OVRACred *cred, const char *protocol) {
-    return setItem(cred, &OVRACred::protocol, protocol);
+    return setItem(__func__, cred, &OVRACred::protocol, protocol);
 }
 int OVRACredItemSetHost(OVRACred *cred, const char *host) {
-    return setItem(cred, &OVRACred::host, host);
+    return setItem(__func__, cred, &OVRACred::host, host);
 }
 int OVRACredItemSetPort(OVRACred *cred, int port) {
-    if (!isLive(cred) || port < 1 || port > 65535) {
+    if (fails(__func__) || !isLive(cred) || port < 1 || port > 65535) {
         return -1;
     }
     cred->port = port;
     return 0;
 }
 int OVRACredItemSetRemoteAccount(OVRACred *cred, const char *account) {
-    return setItem(cred, &OVRACred::account, account);
+    return setItem(__func__, cred, &OVRACred::account, account);
 }
 int OVRACredItemSetRemotePasswd(OVRACred *cred, const char *passwd) {
-    return setItem(cred, &OVRACred::password, passwd);
+    return setItem(__func__, cred, &OVRACred::password, passwd);
 }
 int OVRACredSessItemSetAccessToken(OVRACredSess *sess, const char *token) {
-    return setItem(sess, &OVRACredSess::token, token);
+    return setItem(__func__, sess, &OVRACredSess::token, token);
 }
 }
 
@@ -151,7 +164,7 @@ CredRequest::~CredRequest() {
 
 int CredRequest::SetURL(const std::string &protocol, const std::string &address, int port,
                         const std::string &path) {
-    if (address.empty() || path != "webapi/query.cgi") {
+    if (fails(__func__) || address.empty() || path != "webapi/query.cgi") {
         return 0;
     }
     impl_->protocol = protocol;
@@ -161,7 +174,7 @@ int CredRequest::SetURL(const std::string &protocol, const std::string &address,
 }
 
 int CredRequest::SetDefaultTimeout(long seconds) {
-    return SetResponseTimeout(seconds);
+    return fails(__func__) ? 0 : SetResponseTimeout(seconds);
 }
 
 int CredRequest::SetResponseTimeout(long seconds) {
@@ -179,12 +192,15 @@ int CredRequest::SetEncryptMode(int mode) {
 
 int CredRequest::SetUploadFile(const std::string &path, const std::string &name) {
     impl_->call.uploadName = name;
-    return path.empty() ? 0 : 1;
+    return fails(__func__) || path.empty() ? 0 : 1;
 }
 
 int CredRequest::CreateWebAPIRequest(CredRequest &req, OVRACred *cred, OVRACredSess *sess,
                                      const std::string &api, int version, const std::string &method,
                                      const Json::Value &params) {
+    if (fails(__func__, &req.impl_->error)) {
+        return 0;
+    }
     if (!isLive(cred) || (sess != nullptr && !isLive(sess)) || api.empty() || method.empty()) {
         req.impl_->error = kInvalid;
         return 0;
@@ -200,8 +216,12 @@ int CredRequest::CreateWebAPIRequest(CredRequest &req, OVRACred *cred, OVRACredS
     return 1;
 }
 
-int CredRequest::Process(bool /*reuse*/, int mode) {
+int CredRequest::Process(bool reuse, int mode) {
+    impl_->call.reused = reuse;
     impl_->response.clear();
+    if (fails(mode == 2 ? "probe" : __func__, &impl_->error)) {
+        return 0;
+    }
     Remote *remote = findRemote(impl_->protocol, impl_->host, impl_->port);
     if (remote == nullptr) {
         impl_->error = kCannotConnect;
@@ -243,6 +263,7 @@ int CredRequestUtil::LoginWithOTP(OVRACred *cred, const std::string &otp, OVRACr
     if (!isLive(cred) || !isLive(sess) || out == nullptr) {
         return 0;
     }
+    const int done = fails(__func__) ? 0 : 1; // whatever the remote says
     Remote *remote = findRemote(cred->protocol, cred->host, cred->port);
     if (remote == nullptr) {
         *out = refusal(100);
@@ -250,14 +271,14 @@ int CredRequestUtil::LoginWithOTP(OVRACred *cred, const std::string &otp, OVRACr
     }
     if (cred->account + "/" + cred->password + "/" + otp != remote->login) {
         *out = refusal(remote->refusal);
-        return 1;
+        return done;
     }
     sess->token = "login-" + std::to_string(++remote->logins);
     remote->sessions.insert(sess->token);
     *out = Json::Value();
     (*out)["success"] = true;
     (*out)["data"]["sid"] = sess->token;
-    return 1;
+    return done;
 }
 
 int CredRequestUtil::Logout(OVRACred *cred, OVRACredSess *sess) {
@@ -275,12 +296,13 @@ int CredRequestUtil::Logout(OVRACred *cred, OVRACredSess *sess) {
 
 int CredRequestFarlink::GetConnInfo(const std::string &alias, Json::Value &info,
                                     const void * /*options*/) {
+    const int done = fails(__func__) ? 0 : 1;
     const auto found = credentialLibrary().relay.find(alias);
     if (found == credentialLibrary().relay.end()) {
         return 0;
     }
     info = found->second;
-    return 1;
+    return done;
 }
 
 } // namespace OVRA

@@ -41,6 +41,7 @@ struct Call {
     bool sealed = false;
     long timeout = 0; ///< seconds
     std::string uploadName;
+    bool reused = false; ///< may go over a connection that was left open
 };
 
 /// A remote appliance, behind one endpoint.
@@ -61,6 +62,9 @@ struct Remote {
 struct CredentialLibrary {
     std::map<std::string, Remote> remotes;    ///< by "protocol://host:port"
     std::map<std::string, Json::Value> relay; ///< what the relay service says of an alias
+    /// Asked at each operation, by its name ("probe" for the Process() of one): the error number
+    /// with which it fails, if it does.
+    std::function<std::optional<int>(const std::string &operation)> fault;
     Live credentials, sessions, requests;
 };
 OVRA_VENDOR_EXPORT CredentialLibrary &credentialLibrary();
