@@ -1,11 +1,8 @@
 // SPDX-License-Identifier: Apache-2.0
-#include "support/local_node.h"
-#include "support/log_capture.h"
-#include "support/remote_node.h"
+#include "support/node_fixture.h"
 
 #include <ovradrnode/node.h>
 
-#include <gtest/gtest.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -28,22 +25,21 @@ void script(const std::string &name, const std::string &body) {
 
 /// Three local endpoints (two addresses, one with HTTPS only is not possible: each has both), a
 /// remote node "n1", and a set-up script that makes a test file.
-class Speed : public testing::Test {
+class Speed : public TwoNodes {
 protected:
-    void SetUp() override {
-        provisionNode();
+    Speed() {
         std::ofstream("/usr/ovra/etc/ovradr/ovradrd.conf")
             << "address=\"127.0.0.1,127.0.0.2\"\nhttps_port=\"444\"\nhttp_port=\"81\"\n";
-        addCred("node_cred", "n1", "c1", "https", remote.port(), "s1");
+        addNodeCred("c1", "s1");
         script("TestSyncSpeed.sh", "touch /tmp/speed-file; printf /tmp/speed-file");
         remote.answer("test_download_speed", R"({"success":true,"data":{"speed":"11.5 MB/s"}})");
     }
     bool fileLeft() { return access(kTestFile, F_OK) == 0; }
     std::string run(const std::string &nodeId = "n1") { return node.TestSyncSpeed(nodeId, 2, 3); }
+    /// The code of a download test that fails.
+    int download() { return codeOf(!node.TestDownloadSpeed("u", 0, 0).empty(), node); }
 
-    RemoteNode remote;
     Node node;
-    LogCapture log;
 };
 
 } // namespace
@@ -56,11 +52,9 @@ TEST_F(Speed, TheFirstLineOfTheScriptIsTakenWhole) {
     script("TestDownloadSpeed.sh", "echo one; echo two");
     EXPECT_EQ(node.TestDownloadSpeed("u", 0, 0), "one\n");
     script("TestDownloadSpeed.sh", "exit 3");
-    EXPECT_EQ(node.TestDownloadSpeed("u", 0, 0), "");
-    EXPECT_EQ(node.GetErrCode(), 407);
+    EXPECT_EQ(download(), 407);
     std::filesystem::remove_all(kFolder);
-    EXPECT_EQ(node.TestDownloadSpeed("u", 0, 0), "");
-    EXPECT_EQ(node.GetErrCode(), 401);
+    EXPECT_EQ(download(), 401);
     EXPECT_EQ(
         log.count("ERR", "node", "TestDownloadSpeed",
                   std::string("Failed to exec the command [") + kFolder + "TestDownloadSpeed.sh]."),
