@@ -7,7 +7,8 @@
 #include <ovradrcore/log.h>
 
 #include <gtest/gtest.h>
-#include <unistd.h>
+
+#include <set>
 
 using namespace OvraDRCore;
 
@@ -17,7 +18,6 @@ TEST(Log, LineNamesPlaceLevelAndProcess) {
     ASSERT_EQ(log.lines().size(), 1U);
     EXPECT_EQ(log.count("NOTICE", "log_test", "TestBody", "Set [a] to [7]"), 1);
     EXPECT_EQ(log.lines()[0].substr(0, 2), "5 ");
-    EXPECT_NE(log.lines()[0].find("[" + std::to_string(getpid()) + "]"), std::string::npos);
 }
 
 TEST(Log, ForeignTextCannotForgeALine) {
@@ -49,44 +49,30 @@ TEST(Log, HugeMessageIsCutAtACharacterAndSaysSo) {
     }
 }
 
-TEST(ErrRecorder, NamesEveryCode) {
-    std::string names;
+TEST(ErrRecorder, EveryCodeHasANameOfItsOwn) {
+    std::set<std::string> names{"unknown error"};
+    std::string codes;
     for (int code = -1; code < 1000; ++code) {
-        const std::string name = ERR::ToString(code);
-        names += name == "unknown error" ? "" : std::to_string(code) + " " + name + "; ";
+        const bool named = names.insert(ERR::ToString(code)).second;
+        codes += named ? std::to_string(code) + " " : "";
     }
-    EXPECT_EQ(
-        names,
-        "0 no error; 401 bad parameter; 402 out of memory; 403 no sender; 404 credential not "
-        "found; "
-        "407 failed; 500 endpoint not connectable; 501 login failed; 502 account disabled; "
-        "503 login not permitted; 504 one-time code required; 505 one-time code wrong; "
-        "506 credential item refused; 507 unknown node; 509 credential not completed; "
-        "511 session not created; 512 session not removed; 516 credential record invalid; "
-        "518 belongs to another node; 519 node information not obtained; "
-        "520 credential check failed; 522 endpoint chosen by the remote node invalid; "
-        "523 login call failed; 524 credential library error; 525 no privilege; "
-        "526 certificate not the trusted one; 527 no such user; 528 user of the session unknown; ");
+    EXPECT_EQ(codes,
+              "0 401 402 403 404 407 500 501 502 503 504 505 506 507 509 511 512 516 518 519 "
+              "520 522 523 524 525 526 527 528 ");
 }
 
-TEST(ErrRecorder, RendersCodeAndMessage) {
+TEST(ErrRecorder, RendersCodeAndMessageCopiesAnotherAndRefusesNull) {
+    LogCapture log;
     ErrRecorder recorder;
     EXPECT_EQ(toString(recorder.GetErr()), R"({"err_code":0})");
     recorder.SetErr(401, "");
     EXPECT_EQ(toString(recorder.GetErr()), R"({"err_code":401,"err_msg":""})");
     recorder.SetErr(500);
     EXPECT_EQ(toString(recorder.GetErr()), R"({"err_code":500})") << "a later error clears";
-}
-
-TEST(ErrRecorder, CopiesAnotherAndRefusesNull) {
-    LogCapture log;
     ErrRecorder from;
     from.SetErr(516, "id");
-    ErrRecorder to;
-    to.SetErr(&from);
-    EXPECT_EQ(to.GetErrCode(), 516);
-    EXPECT_EQ(to.GetErrMsg().asString(), "id");
-    to.SetErr(static_cast<const ErrRecorder *>(nullptr));
-    EXPECT_EQ(to.GetErrCode(), 516);
+    recorder.SetErr(&from);
+    recorder.SetErr(static_cast<const ErrRecorder *>(nullptr));
+    EXPECT_EQ(toString(recorder.GetErr()), R"({"err_code":516,"err_msg":"id"})");
     EXPECT_EQ(log.count("ERR", "err_recorder", "SetErr", "Null pointer"), 1);
 }

@@ -29,24 +29,17 @@ protected:
     LogCapture log;
 };
 
-std::string ids(const std::vector<DRNode> &nodes) {
+/// The ids of the credentials of one node or of all.
+std::string list(int tables, const char *nodeId = nullptr) {
+    const auto type = static_cast<DRNodeDB::CredType>(tables);
+    std::vector<DRNode> nodes;
+    EXPECT_TRUE(nodeId != nullptr ? DRNodeDB::ListCred(nodeId, nodes, type)
+                                  : DRNodeDB::List(nodes, type));
     std::string all;
     for (const DRNode &node : nodes) {
         all += node.credId + " ";
     }
     return all;
-}
-
-std::string list(int type) {
-    std::vector<DRNode> nodes;
-    EXPECT_TRUE(DRNodeDB::List(nodes, static_cast<DRNodeDB::CredType>(type)));
-    return ids(nodes);
-}
-
-std::string listCred(const std::string &nodeId, int type) {
-    std::vector<DRNode> nodes;
-    EXPECT_TRUE(DRNodeDB::ListCred(nodeId, nodes, static_cast<DRNodeDB::CredType>(type)));
-    return ids(nodes);
 }
 
 } // namespace
@@ -55,9 +48,9 @@ TEST_F(NodeDb, ListsTheTablesAskedForNodeCredentialsFirst) {
     EXPECT_EQ(list(1), "c1 c2 c3 ");
     EXPECT_EQ(list(2), "t1 t2 t3 ");
     EXPECT_EQ(list(3), "c1 c2 c3 t1 t2 t3 ");
-    EXPECT_EQ(listCred("n1", 3), "c1 c2 t1 ");
-    EXPECT_EQ(listCred("n3", 1), "");
-    EXPECT_EQ(listCred("n1' OR '1'='1", 3), "") << "an id is never SQL";
+    EXPECT_EQ(list(3, "n1"), "c1 c2 t1 ");
+    EXPECT_EQ(list(1, "n3"), "");
+    EXPECT_EQ(list(3, "n1' OR '1'='1"), "") << "an id is never SQL";
     std::vector<DRNode> nodes(1);
     EXPECT_FALSE(DRNodeDB::ListCred("", nodes, DRNodeDB::CRED_TYPE_NODE));
     EXPECT_EQ(log.count("ERR", "node_db", "ListCred", "Invalid nodeId []"), 1);

@@ -13,6 +13,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <array>
 #include <chrono>
 #include <filesystem>
 #include <fstream>
@@ -87,17 +88,6 @@ TEST(DRNode, JsonNeverHoldsTheSessionAndGivesBackTheIdsOnly) {
     EXPECT_TRUE(node.fromJson(Json::Value(5)));
 }
 
-TEST(DRNode, RowsHoldAllSixColumns) {
-    const auto row = example().ToSqliteRecord();
-    EXPECT_EQ(row.size(), 6U);
-    DRNode node;
-    EXPECT_TRUE(node.FromSqliteValues(row));
-    EXPECT_EQ(node.toJson(), example().toJson());
-    EXPECT_EQ(node.session, "s1");
-    EXPECT_EQ(example().ToSqliteValues({"session", "port", "x"}).size(), 2U);
-    EXPECT_FALSE(node.FromSqliteValues({}));
-}
-
 TEST(DRNodeAttr, NeedsNodeAppAndNameButNoValue) {
     EXPECT_TRUE(DRNodeAttr("n", "a", "k", "").isValid());
     EXPECT_FALSE(DRNodeAttr("n", "", "k", "v").isValid());
@@ -125,21 +115,17 @@ TEST(Identity, IsMadeOnceAndKeptUntilAResetOfWhichThisProcessHearsNothing) {
 }
 
 TEST(Identity, AFileWithoutAUsableIdIsMended) {
-    const struct {
-        const char *text;
-        const char *level;
-        const char *message;
-    } cases[] = {
+    const std::array<const char *, 3> cases[] = {
         {"node_id=\"\"\n", "WARN", "Invalid nodeId []"},
         {"other=\"x\"\n", "ERR", "Failed to get nodeId"},
         {"", "ERR", "Failed to get nodeId"},
     };
-    for (const auto &each : cases) {
-        writeIdentity(each.text);
+    for (const auto &[text, level, message] : cases) {
+        writeIdentity(text);
         LogCapture log;
         const std::string id = DRNode::getLocalNodeId();
         EXPECT_EQ(id.size(), 36U);
-        EXPECT_EQ(log.count(each.level, "dr_node", "ReadNodeIdFromConf", each.message), 1);
+        EXPECT_EQ(log.count(level, "dr_node", "ReadNodeIdFromConf", message), 1);
         EXPECT_NE(identityFile().find("node_id=\"" + id + "\"\n"), std::string::npos);
     }
     EXPECT_EQ(DRNode::getLocalNodeId(), DRNode::getLocalNodeId());

@@ -30,10 +30,6 @@ void provisionNode() {
     executeSql(std::string(std::istreambuf_iterator<char>(file), {}));
 }
 
-void executeSql(const std::string &sql) {
-    querySql(sql);
-}
-
 std::string querySql(const std::string &sql) {
     sqlite3 *db = nullptr;
     std::string rows;

@@ -12,9 +12,11 @@ inline constexpr const char *kIdentityFile = "/usr/ovra/etc/ovradr/node.info";
 void provisionNode();
 
 /// Runs statements on the node database without the library.
-void executeSql(const std::string &sql);
-/// The rows of a query, columns joined by '|', rows by '\n'.
+/// \return the rows, columns joined by '|', rows by '\n'
 std::string querySql(const std::string &sql);
+inline void executeSql(const std::string &sql) {
+    querySql(sql);
+}
 
 /// Adds a row to a credential table.
 void addCred(const std::string &table, const std::string &nodeId, const std::string &credId,

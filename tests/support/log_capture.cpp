@@ -3,6 +3,7 @@
 
 #include <unistd.h>
 
+#include <algorithm>
 #include <cstdarg>
 #include <cstdio>
 #include <mutex>
@@ -70,16 +71,12 @@ int LogCapture::count(const std::string &text) const {
 int LogCapture::count(const std::string &level, const std::string &file,
                       const std::string &function, const std::string &message) const {
     // "PRIORITY file:line(function)[LEVEL][pid]: message"
-    const std::string middle =
-        "(" + function + ")[" + level + "][" + std::to_string(getpid()) + "]: ";
+    const std::string rest =
+        "(" + function + ")[" + level + "][" + std::to_string(getpid()) + "]: " + message;
     int found = 0;
     for (const std::string &line : lines()) {
-        const std::size_t colon = line.find(':');
-        const std::size_t bracket = line.find('(');
-        found += line.substr(2, colon - 2) == file && bracket != std::string::npos &&
-                         line.substr(bracket) == middle + message
-                     ? 1
-                     : 0;
+        const std::size_t end = std::min(line.find('('), line.size());
+        found += line.substr(2, line.find(':') - 2) == file && line.substr(end) == rest ? 1 : 0;
     }
     return found;
 }

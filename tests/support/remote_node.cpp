@@ -56,14 +56,9 @@ SealingDaemon::Reply RemoteNode::record(const std::string &call, const std::stri
     return ofSession ? *ofSession : ofAll.value_or(R"({"success":true})");
 }
 
-void RemoteNode::answer(const std::string &call, const std::string &document) {
+void RemoteNode::answer(const std::string &call, const SealingDaemon::Reply &reply) {
     const std::lock_guard<std::mutex> lock(guard_);
-    answers_[call] = document;
-}
-
-void RemoteNode::answer(const std::string &call, const Answer &answer) {
-    const std::lock_guard<std::mutex> lock(guard_);
-    answers_[call] = answer;
+    answers_[call] = reply;
 }
 
 void RemoteNode::forgetAnswers() {

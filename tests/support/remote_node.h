@@ -21,11 +21,8 @@ public:
     RemoteNode();
 
     int port() const { return server.port(); }
-    /// \param call      "method" or "session method"; "probe" for a bare request
-    /// \param document  the reply
-    void answer(const std::string &call, const std::string &document);
-    /// Something other than a reply.
-    void answer(const std::string &call, const Answer &answer);
+    /// \param call  "method" or "session method"; "probe" for a bare request
+    void answer(const std::string &call, const SealingDaemon::Reply &reply);
     void forgetAnswers();
     /// Runs before the calls of `method` are answered.
     void before(const std::string &method, std::function<void()> action);

@@ -23,14 +23,11 @@ public:
     using Reply = std::variant<std::string, Answer>;
     using Handler = std::function<Reply(const OvraPlatform::WireCall &)>;
 
-    SealingDaemon(const std::string &keyFile, Handler handler)
-        : handler_(std::move(handler)) {
-        newKey(keyFile);
-    }
-    SealingDaemon(const std::string &keyFile, Handler handler,
-                  OvraPlatform::ReplayGuard::Clocks clocks)
+    /// \param clocks  none, or those of its ReplayGuard
+    template <typename... Clocks>
+    SealingDaemon(const std::string &keyFile, Handler handler, Clocks... clocks)
         : handler_(std::move(handler))
-        , guard_(std::move(clocks)) {
+        , guard_(std::move(clocks)...) {
         newKey(keyFile);
     }
 

@@ -20,8 +20,8 @@ void require(bool ok) {
 } // namespace
 
 TestCertificate::TestCertificate(const std::string &names)
-    : key_(EVP_PKEY_Q_keygen(nullptr, nullptr, "EC", "P-256"))
-    , certificate_(X509_new()) {
+    : key_(EVP_PKEY_Q_keygen(nullptr, nullptr, "EC", "P-256"), EVP_PKEY_free)
+    , certificate_(X509_new(), X509_free) {
     require(key_ && certificate_);
     X509 *made = certificate_.get();
     X509_NAME *name = X509_get_subject_name(made);

@@ -19,15 +19,8 @@ public:
     X509 *certificate() const { return certificate_.get(); }
 
 private:
-    struct FreeKey {
-        void operator()(EVP_PKEY *key) const { EVP_PKEY_free(key); }
-    };
-    struct FreeCertificate {
-        void operator()(X509 *certificate) const { X509_free(certificate); }
-    };
-
-    std::unique_ptr<EVP_PKEY, FreeKey> key_;
-    std::unique_ptr<X509, FreeCertificate> certificate_;
+    std::shared_ptr<EVP_PKEY> key_;
+    std::shared_ptr<X509> certificate_;
 };
 
 } // namespace OvraTest

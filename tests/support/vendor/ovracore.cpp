@@ -25,14 +25,7 @@ std::vector<std::string> linesOf(const char *path) {
     return lines;
 }
 
-bool isOfKey(const std::string &line, const std::string &key) {
-    return line.compare(0, key.size() + 1, key + "=") == 0;
-}
-
-std::map<FILE *, pid_t> &programs() {
-    static std::map<FILE *, pid_t> running;
-    return running;
-}
+std::map<FILE *, pid_t> programs;
 
 } // namespace
 
@@ -48,39 +41,24 @@ int OLIBCFileExist(const char *path) {
 }
 
 int OLIBCFileGetKeyValue(const char *path, const char *key, char *buffer, int size, int /*flag*/) {
+    const std::string start = std::string(key) + "=\"";
     for (const std::string &line : linesOf(path)) {
-        if (!isOfKey(line, key)) {
-            continue;
+        if (line.starts_with(start) &&
+            line.size() - start.size() <= static_cast<std::size_t>(size)) {
+            const std::string value = line.substr(start.size(), line.size() - start.size() - 1);
+            return std::snprintf(buffer, value.size() + 1, "%s", value.c_str());
         }
-        std::string value = line.substr(std::string(key).size() + 1);
-        if (value.size() >= 2 && value.front() == '"' && value.back() == '"') {
-            value = value.substr(1, value.size() - 2);
-        }
-        const bool fits = static_cast<int>(value.size()) < size;
-        return fits ? std::snprintf(buffer, static_cast<std::size_t>(size), "%s", value.c_str())
-                    : -1;
     }
     return -1;
 }
 
 int OLIBCFileSetKeyValue(const char *path, const char *key, const char *value,
                          const char * /*format*/) {
-    if (coreLibrary().readOnly) {
-        return -1;
-    }
-    const std::string line = std::string(key) + "=\"" + value + "\"";
+    const std::string start = std::string(key) + "=\"";
     std::vector<std::string> lines = linesOf(path);
-    bool replaced = false;
-    for (std::string &each : lines) {
-        if (isOfKey(each, key)) {
-            each = line;
-            replaced = true;
-        }
-    }
-    if (!replaced) {
-        lines.push_back(line);
-    }
-    std::ofstream file(path);
+    std::erase_if(lines, [&start](const std::string &line) { return line.starts_with(start); });
+    lines.push_back(start + value + "\"");
+    std::ofstream file(coreLibrary().readOnly ? "/" : path);
     for (const std::string &each : lines) {
         file << each << '\n';
     }
@@ -109,20 +87,15 @@ FILE *OLIBCPopen(const char *path, const char *mode, ...) {
     }
     close(ends[1]);
     FILE *stream = fdopen(ends[0], mode);
-    programs()[stream] = child;
-    coreLibrary().streams.obtained();
+    programs[stream] = child;
+    ++coreLibrary().streams;
     return stream;
 }
 
 int OLIBCPclose(FILE *stream) {
-    const auto found = programs().find(stream);
-    if (found == programs().end()) {
-        ++coreLibrary().streams.misused;
-        return -1;
-    }
-    const pid_t child = found->second;
-    programs().erase(found);
-    coreLibrary().streams.givenBack();
+    const pid_t child = programs.at(stream);
+    programs.erase(stream);
+    --coreLibrary().streams;
     fclose(stream);
     int status = -1;
     return waitpid(child, &status, 0) == child ? status : -1;

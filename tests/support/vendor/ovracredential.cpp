@@ -23,12 +23,20 @@ struct _tag_ovra_cred_sess_ {
 namespace {
 
 constexpr int kCannotConnect = 5;
-constexpr int kInvalid = 1;
-constexpr int kMaxTimeout = 86400;
 
-std::set<const void *> &liveObjects() {
-    static std::set<const void *> objects;
-    return objects;
+/// Null if it cannot be reached.
+Remote *findRemote(const OVRACred &cred) {
+    auto &remotes = credentialLibrary().remotes;
+    const auto found =
+        remotes.find(cred.protocol + "://" + cred.host + ":" + std::to_string(cred.port));
+    return found != remotes.end() && found->second.reachable ? &found->second : nullptr;
+}
+
+Json::Value refusal(int code) {
+    Json::Value document;
+    document["success"] = false;
+    document["error"]["code"] = code;
+    return document;
 }
 
 /// \param error  receives the number, if the operation has to fail
@@ -41,64 +49,6 @@ bool fails(const char *operation, int *error = nullptr) {
     return number.has_value();
 }
 
-template <typename Object>
-Object *obtain(const char *operation, OvraVendor::Live &live) {
-    if (fails(operation)) {
-        return nullptr;
-    }
-    auto *object = new Object;
-    liveObjects().insert(object);
-    live.obtained();
-    return object;
-}
-
-template <typename Object>
-void giveBack(Object *object, OvraVendor::Live &live) {
-    if (object == nullptr) {
-        return;
-    }
-    if (liveObjects().erase(object) == 0) {
-        ++live.misused;
-        return;
-    }
-    live.givenBack();
-    delete object;
-}
-
-bool isLive(const OVRACred *cred) {
-    const bool live = liveObjects().count(cred) == 1;
-    credentialLibrary().credentials.misused += live ? 0 : 1;
-    return live;
-}
-bool isLive(const OVRACredSess *sess) {
-    const bool live = liveObjects().count(sess) == 1;
-    credentialLibrary().sessions.misused += live ? 0 : 1;
-    return live;
-}
-
-/// An item as the C functions take it: rejected if empty.
-template <typename Object>
-int setItem(const char *operation, Object *object, std::string Object::*item, const char *value) {
-    if (fails(operation) || !isLive(object) || value == nullptr || *value == '\0') {
-        return -1;
-    }
-    object->*item = value;
-    return 0;
-}
-
-Remote *findRemote(const std::string &protocol, const std::string &host, int port) {
-    auto &remotes = credentialLibrary().remotes;
-    const auto found = remotes.find(protocol + "://" + host + ":" + std::to_string(port));
-    return found != remotes.end() && found->second.reachable ? &found->second : nullptr;
-}
-
-Json::Value refusal(int code) {
-    Json::Value document;
-    document["success"] = false;
-    document["error"]["code"] = code;
-    return document;
-}
-
 } // namespace
 
 OvraVendor::CredentialLibrary &OvraVendor::credentialLibrary() {
@@ -108,46 +58,52 @@ OvraVendor::CredentialLibrary &OvraVendor::credentialLibrary() {
 
 extern "C" {
 OVRACred *OVRACredAlloc() {
-    return obtain<OVRACred>(__func__, credentialLibrary().credentials);
+    if (fails(__func__)) {
+        return nullptr;
+    }
+    ++credentialLibrary().credentials;
+    return new OVRACred;
 }
 void OVRACredFree(OVRACred *cred) {
-    giveBack(cred, credentialLibrary().credentials);
+    --credentialLibrary().credentials;
+    delete cred;
 }
 OVRACredSess *OVRACredSessAlloc() {
-    return obtain<OVRACredSess>(__func__, credentialLibrary().sessions);
+    if (fails(__func__)) {
+        return nullptr;
+    }
+    ++credentialLibrary().sessions;
+    return new OVRACredSess;
 }
 void OVRACredSessFree(OVRACredSess *sess) {
-    giveBack(sess, credentialLibrary().sessions);
+    --credentialLibrary().sessions;
+    delete sess;
 }
 int OVRACredItemSetProtocol(OVRACred *cred, const char *protocol) {
-    return setItem(__func__, cred, &OVRACred::protocol, protocol);
+    return fails(__func__) || (cred->protocol = protocol).empty() ? -1 : 0;
 }
 int OVRACredItemSetHost(OVRACred *cred, const char *host) {
-    return setItem(__func__, cred, &OVRACred::host, host);
+    return fails(__func__) || (cred->host = host).empty() ? -1 : 0;
 }
 int OVRACredItemSetPort(OVRACred *cred, int port) {
-    if (fails(__func__) || !isLive(cred) || port < 1 || port > 65535) {
-        return -1;
-    }
     cred->port = port;
-    return 0;
+    return fails(__func__) ? -1 : 0;
 }
 int OVRACredItemSetRemoteAccount(OVRACred *cred, const char *account) {
-    return setItem(__func__, cred, &OVRACred::account, account);
+    return fails(__func__) || (cred->account = account).empty() ? -1 : 0;
 }
 int OVRACredItemSetRemotePasswd(OVRACred *cred, const char *passwd) {
-    return setItem(__func__, cred, &OVRACred::password, passwd);
+    return fails(__func__) || (cred->password = passwd).empty() ? -1 : 0;
 }
 int OVRACredSessItemSetAccessToken(OVRACredSess *sess, const char *token) {
-    return setItem(__func__, sess, &OVRACredSess::token, token);
+    return fails(__func__) || (sess->token = token).empty() ? -1 : 0;
 }
 }
 
 namespace OVRA {
 
 struct CredRequest::Impl {
-    std::string protocol, host;
-    int port = -1;
+    Remote *remote = nullptr; ///< null: cannot be reached
     Call call;
     std::string response;
     int error = 0;
@@ -155,34 +111,26 @@ struct CredRequest::Impl {
 
 CredRequest::CredRequest()
     : impl_(std::make_unique<Impl>()) {
-    credentialLibrary().requests.obtained();
+    ++credentialLibrary().requests;
 }
 
 CredRequest::~CredRequest() {
-    credentialLibrary().requests.givenBack();
+    --credentialLibrary().requests;
 }
 
 int CredRequest::SetURL(const std::string &protocol, const std::string &address, int port,
                         const std::string &path) {
-    if (fails(__func__) || address.empty() || path != "webapi/query.cgi") {
-        return 0;
-    }
-    impl_->protocol = protocol;
-    impl_->host = address;
-    impl_->port = port;
-    return 1;
+    impl_->remote = findRemote({protocol, address, "", "", port});
+    return fails(__func__) || path != "webapi/query.cgi" ? 0 : 1;
 }
 
 int CredRequest::SetDefaultTimeout(long seconds) {
-    return fails(__func__) ? 0 : SetResponseTimeout(seconds);
+    return !fails(__func__) && seconds > 0 ? 1 : 0;
 }
 
 int CredRequest::SetResponseTimeout(long seconds) {
-    if (seconds < 1 || seconds > kMaxTimeout) {
-        return 0;
-    }
     impl_->call.timeout = seconds;
-    return 1;
+    return seconds > 0 ? 1 : 0;
 }
 
 int CredRequest::SetEncryptMode(int mode) {
@@ -191,63 +139,32 @@ int CredRequest::SetEncryptMode(int mode) {
 }
 
 int CredRequest::SetUploadFile(const std::string &path, const std::string &name) {
-    impl_->call.uploadName = name;
-    return fails(__func__) || path.empty() ? 0 : 1;
+    impl_->call.uploads.push_back(path + " as " + name);
+    return 1;
 }
 
 int CredRequest::CreateWebAPIRequest(CredRequest &req, OVRACred *cred, OVRACredSess *sess,
                                      const std::string &api, int version, const std::string &method,
                                      const Json::Value &params) {
-    if (fails(__func__, &req.impl_->error)) {
-        return 0;
-    }
-    if (!isLive(cred) || (sess != nullptr && !isLive(sess)) || api.empty() || method.empty()) {
-        req.impl_->error = kInvalid;
-        return 0;
-    }
-    req.impl_->protocol = cred->protocol;
-    req.impl_->host = cred->host;
-    req.impl_->port = cred->port;
-    req.impl_->call.session = sess != nullptr ? sess->token : "";
-    req.impl_->call.api = api;
-    req.impl_->call.method = method;
-    req.impl_->call.version = version;
-    req.impl_->call.params = params;
-    return 1;
+    req.impl_->remote = findRemote(*cred);
+    req.impl_->call = {sess != nullptr ? sess->token : "", api, method, version, params};
+    return fails(__func__, &req.impl_->error) ? 0 : 1;
 }
 
 int CredRequest::Process(bool reuse, int mode) {
-    impl_->call.reused = reuse;
-    impl_->response.clear();
+    Remote *const remote = impl_->remote;
+    impl_->error = remote != nullptr ? 0 : kCannotConnect;
     if (fails(mode == 2 ? "probe" : __func__, &impl_->error)) {
         return 0;
     }
-    Remote *remote = findRemote(impl_->protocol, impl_->host, impl_->port);
-    if (remote == nullptr) {
-        impl_->error = kCannotConnect;
-        return 0;
+    impl_->call.reused = reuse;
+    if (remote != nullptr && mode != 2) {
+        remote->calls.push_back(impl_->call);
+        const bool known = remote->sessions.count(impl_->call.session) == 1;
+        impl_->response = Json::writeString(Json::StreamWriterBuilder(),
+                                            known ? remote->answer(impl_->call) : refusal(119));
     }
-    if (mode == 2) {
-        ++remote->probes;
-        impl_->error = 0;
-        return 1;
-    }
-    impl_->error = remote->error;
-    if (remote->error != 0) {
-        return 0;
-    }
-    remote->calls.push_back(impl_->call);
-    const bool known = remote->sessions.count(impl_->call.session) == 1;
-    Json::Value document = refusal(119);
-    if (known) {
-        document = Json::Value();
-        document["success"] = true;
-        if (remote->answer) {
-            document = remote->answer(impl_->call);
-        }
-    }
-    impl_->response = Json::writeString(Json::StreamWriterBuilder(), document);
-    return 1;
+    return remote != nullptr ? 1 : 0;
 }
 
 std::string CredRequest::GetResponse() const {
@@ -260,17 +177,10 @@ int CredRequest::GetError() const {
 
 int CredRequestUtil::LoginWithOTP(OVRACred *cred, const std::string &otp, OVRACredSess *sess,
                                   Json::Value *out) {
-    if (!isLive(cred) || !isLive(sess) || out == nullptr) {
-        return 0;
-    }
-    const int done = fails(__func__) ? 0 : 1; // whatever the remote says
-    Remote *remote = findRemote(cred->protocol, cred->host, cred->port);
-    if (remote == nullptr) {
-        *out = refusal(100);
-        return 0;
-    }
-    if (cred->account + "/" + cred->password + "/" + otp != remote->login) {
-        *out = refusal(remote->refusal);
+    Remote *const remote = findRemote(*cred);
+    const int done = fails(__func__) || remote == nullptr ? 0 : 1;
+    if (remote == nullptr || cred->account + "/" + cred->password + "/" + otp != remote->login) {
+        *out = refusal(remote != nullptr ? remote->refusal : 100);
         return done;
     }
     sess->token = "login-" + std::to_string(++remote->logins);
@@ -282,16 +192,11 @@ int CredRequestUtil::LoginWithOTP(OVRACred *cred, const std::string &otp, OVRACr
 }
 
 int CredRequestUtil::Logout(OVRACred *cred, OVRACredSess *sess) {
-    if (!isLive(cred) || !isLive(sess)) {
-        return 0;
-    }
-    Remote *remote = findRemote(cred->protocol, cred->host, cred->port);
-    const bool ended = remote != nullptr && remote->sessions.erase(sess->token) == 1;
+    Remote *const remote = findRemote(*cred);
     if (remote != nullptr) {
         ++remote->logouts;
     }
-    sess->token.clear();
-    return ended ? 1 : 0;
+    return remote != nullptr && remote->sessions.erase(sess->token) == 1 ? 1 : 0;
 }
 
 int CredRequestFarlink::GetConnInfo(const std::string &alias, Json::Value &info,

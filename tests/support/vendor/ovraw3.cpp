@@ -14,11 +14,11 @@ OvraVendor::W3Library &OvraVendor::w3Library() {
 namespace ovraw3 {
 
 Talo::Talo() {
-    OvraVendor::w3Library().clients.obtained();
+    ++OvraVendor::w3Library().clients;
 }
 
 Talo::~Talo() {
-    OvraVendor::w3Library().clients.givenBack();
+    --OvraVendor::w3Library().clients;
 }
 
 int Talo::GetHttpPort() {

@@ -6,30 +6,17 @@
 
 #include <json/value.h>
 
-#include <ctime>
 #include <functional>
 #include <map>
 #include <optional>
 #include <set>
 #include <string>
+#include <utility>
 #include <vector>
 
 namespace OvraVendor {
 
 #define OVRA_VENDOR_EXPORT __attribute__((visibility("default")))
-
-/// Objects of one kind that the library under test has acquired and has to release.
-struct Live {
-    int now = 0;
-    int ever = 0;
-    int misused = 0; ///< given back twice, or used after that
-
-    void obtained() {
-        ++now;
-        ++ever;
-    }
-    void givenBack() { --now; }
-};
 
 /// A request as it arrived at a remote appliance.
 struct Call {
@@ -39,33 +26,31 @@ struct Call {
     int version = 0;
     Json::Value params;
     bool sealed = false;
-    long timeout = 0; ///< seconds
-    std::string uploadName;
-    bool reused = false; ///< may go over a connection that was left open
+    bool reused = false;                ///< may go over a connection that was left open
+    long timeout = 0;                   ///< seconds
+    std::vector<std::string> uploads{}; ///< "path as name"
 };
 
 /// A remote appliance, behind one endpoint.
 struct Remote {
     bool reachable = true;
-    int error = 0; ///< the credential library's error number for every request; 0: none
     std::string login = "joe/pw/";    ///< account, password and one-time code that it lets in
     int refusal = 400;                ///< the error for any others
     std::set<std::string> sessions{}; ///< those that live; others are answered with error 119
     std::function<Json::Value(const Call &)> answer{};
     std::vector<Call> calls{};
-    int probes = 0;
     int logins = 0;
     int logouts = 0;
 };
 
 /// libovracredential.so
 struct CredentialLibrary {
-    std::map<std::string, Remote> remotes;    ///< by "protocol://host:port"
-    std::map<std::string, Json::Value> relay; ///< what the relay service says of an alias
+    std::map<std::string, Remote> remotes;           ///< by "protocol://host:port"
+    std::map<std::string, Json::Value> relay;        ///< what the relay service says of an alias
+    int credentials = 0, sessions = 0, requests = 0; ///< that are alive
     /// Asked at each operation, by its name ("probe" for the Process() of one): the error number
     /// with which it fails, if it does.
     std::function<std::optional<int>(const std::string &operation)> fault;
-    Live credentials, sessions, requests;
 };
 OVRA_VENDOR_EXPORT CredentialLibrary &credentialLibrary();
 
@@ -73,22 +58,20 @@ OVRA_VENDOR_EXPORT CredentialLibrary &credentialLibrary();
 struct WebApiLibrary {
     /// The local appliance's answer; without it the call fails.
     std::function<Json::Value(const Call &, const std::string &user)> answer;
-    Live runners;
+    int runners = 0; ///< that are alive
 };
 OVRA_VENDOR_EXPORT WebApiLibrary &webApiLibrary();
 
 struct Session {
     std::string id, user, app, extra, ui, client;
     int timeout = 0;
-    std::time_t ends = 0; ///< 0: never
 };
 
 /// libovracgi.so
 struct CgiLibrary {
     std::vector<Session> sessions;
     std::set<int> refusedOptions;
-    bool broken = false; ///< the store does not open
-    Live handles, records;
+    int handles = 0, records = 0; ///< that are alive
 };
 OVRA_VENDOR_EXPORT CgiLibrary &cgiLibrary();
 
@@ -96,14 +79,14 @@ OVRA_VENDOR_EXPORT CgiLibrary &cgiLibrary();
 struct W3Library {
     int http = 5000;
     int https = 5001;
-    Live clients;
+    int clients = 0; ///< that are alive
 };
 OVRA_VENDOR_EXPORT W3Library &w3Library();
 
 /// libovracore.so: its files and programs are real ones.
 struct CoreLibrary {
     bool readOnly = false; ///< no key can be written
-    Live streams;
+    int streams = 0;       ///< that are open
 };
 OVRA_VENDOR_EXPORT CoreLibrary &coreLibrary();
 
@@ -127,24 +110,22 @@ struct NetLibrary {
 };
 OVRA_VENDOR_EXPORT NetLibrary &netLibrary();
 
-/// Everything that was not released, or released wrongly, as text; "" if nothing.
+/// How much was not released, or released twice, as text; "" if nothing.
 inline std::string leftOver() {
-    std::string text;
-    const auto look = [&text](const char *name, const Live &live) {
-        if (live.now != 0 || live.misused != 0) {
-            text += std::string(name) + ": " + std::to_string(live.now) + " of " +
-                    std::to_string(live.ever) + " live, " + std::to_string(live.misused) +
-                    " misused\n";
-        }
+    const std::pair<const char *, int> live[] = {
+        {"credential objects", credentialLibrary().credentials},
+        {"credential sessions", credentialLibrary().sessions},
+        {"credential requests", credentialLibrary().requests},
+        {"local runners", webApiLibrary().runners},
+        {"session store handles", cgiLibrary().handles},
+        {"session records", cgiLibrary().records},
+        {"web-engine clients", w3Library().clients},
+        {"streams of programs", coreLibrary().streams},
     };
-    look("credential objects", credentialLibrary().credentials);
-    look("credential sessions", credentialLibrary().sessions);
-    look("credential requests", credentialLibrary().requests);
-    look("local runners", webApiLibrary().runners);
-    look("session store handles", cgiLibrary().handles);
-    look("session records", cgiLibrary().records);
-    look("web-engine clients", w3Library().clients);
-    look("streams of programs", coreLibrary().streams);
+    std::string text;
+    for (const auto &[name, count] : live) {
+        text += count != 0 ? std::to_string(count) + " " + name + "\n" : "";
+    }
     return text;
 }
 

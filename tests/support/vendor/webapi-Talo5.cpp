@@ -14,11 +14,11 @@ OvraVendor::WebApiLibrary &OvraVendor::webApiLibrary() {
 namespace OVRA {
 
 APIRunner::APIRunner() {
-    OvraVendor::webApiLibrary().runners.obtained();
+    ++OvraVendor::webApiLibrary().runners;
 }
 
 APIRunner::~APIRunner() {
-    OvraVendor::webApiLibrary().runners.givenBack();
+    --OvraVendor::webApiLibrary().runners;
 }
 
 bool APIRunner::Exec(Json::Value &out, const char *api, int version, const char *method,
@@ -30,12 +30,7 @@ bool APIRunner::Exec(Json::Value &out, const char *api, int version, const char 
         out["error"]["code"] = 100;
         return false;
     }
-    OvraVendor::Call call;
-    call.api = api;
-    call.method = method;
-    call.version = version;
-    call.params = params;
-    out = answer(call, user);
+    out = answer({"", api, method, version, params}, user);
     return true;
 }
 
