@@ -1,7 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "support/node_fixture.h"
 
-#include <ovradrnode/node_api.h>
 #include <ovradrnode/operation_dispatcher.h>
 
 using namespace OvraDRNode;

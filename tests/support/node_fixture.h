@@ -10,6 +10,8 @@
 #include <ovradrcore/json.h>
 #include <ovradrnode/conn.h>
 #include <ovradrnode/dr_node.h>
+#include <ovradrnode/node_api.h>
+#include <ovradrnode/sender.h>
 #include <ovraplatform/api_errors.h>
 #include <ovraplatform/api_registry.h>
 
@@ -49,6 +51,8 @@ protected:
     }
 
     static inline std::int64_t now = 1'000'000'000'000;
+    /// A request that any session may make.
+    const OvraDRCore::Request info = OvraDRNode::WebAPI::getDRNodeInfoAPI({});
     LogCapture log;
 
 private:

@@ -8,9 +8,6 @@
 #include "transport/conn_cache.h"
 #include "transport/node_valid_cred_cache.h"
 
-#include <ovradrnode/node_api.h>
-#include <ovradrnode/sender.h>
-
 #include <ctime>
 
 using namespace OvraDRNode;
@@ -43,7 +40,7 @@ protected:
     int send(const std::set<std::string> &operations, int number = 0) {
         fail(operations, number);
         CredSessionSender sender(conn, "s");
-        (void)sender.process(WebAPI::getDRNodeInfoAPI({})); // the code is what is looked at
+        (void)sender.process(info); // the code is what is looked at
         message = sender.GetErrMsg();
         return sender.GetErrCode();
     }
@@ -182,7 +179,7 @@ TEST_F(CredError, OneRequestAsksASilentEndpointOnceHoweverManyCredentialsItHas) 
         fail({each.step}, each.number);
         NodeValidCredCache("n1").UpdateWithData("t0");
         NodeSender sender("n1");
-        EXPECT_FALSE(sender.process(WebAPI::getDRNodeInfoAPI({})).isValid());
+        EXPECT_FALSE(sender.process(info).isValid());
         EXPECT_EQ(asked["probe"], each.probed) << each.step << each.number;
         EXPECT_EQ(asked["Process"], each.sent) << each.step << each.number;
         EXPECT_EQ(sender.GetErrCode(), each.code) << each.step << each.number;
@@ -193,7 +190,7 @@ TEST_F(CredError, OneRequestAsksASilentEndpointOnceHoweverManyCredentialsItHas) 
     ConnCache(relayed).UpdateWithData(false);
     fail({});
     CredNodeSender sender("c9");
-    EXPECT_FALSE(sender.process(WebAPI::getDRNodeInfoAPI({})).isValid());
+    EXPECT_FALSE(sender.process(info).isValid());
     EXPECT_EQ(sender.GetErrMsg(), relayed.toJson());
     EXPECT_EQ(asked["GetConnInfo"], 0) << "the relay service is not asked where a dead alias is";
 }

@@ -2,9 +2,6 @@
 #include "support/node_fixture.h"
 #include "transport/conn_cache.h"
 
-#include <ovradrnode/node_api.h>
-#include <ovradrnode/sender.h>
-
 #include <chrono>
 
 using namespace OvraDRNode;
@@ -16,7 +13,7 @@ namespace {
 
 class CredSender : public TwoNodes {
 protected:
-    Response send(BaseSender &sender) { return sender.process(WebAPI::getDRNodeInfoAPI({})); }
+    Response send(BaseSender &sender) { return sender.process(info); }
     /// 0 if the request was carried out, else the sender's code.
     int codeOfSend(BaseSender &&sender) { return codeOf(send(sender).isSuccess(), sender); }
 };

@@ -4,9 +4,7 @@
 #include "transport/node_valid_cred_cache.h"
 
 #include <ovradrnode/cred_permission_cache.h>
-#include <ovradrnode/node_api.h>
 #include <ovradrnode/node_candidates.h>
-#include <ovradrnode/sender.h>
 
 using namespace OvraDRNode;
 using namespace OvraTest;
@@ -75,7 +73,7 @@ TEST_F(NodeCandidates, AreListedAsTheSenderThenTriesThem) {
         other.forgetCalls();
         EXPECT_EQ(textOf(listNodeCandidates("n1")), each.listed) << each.what;
         EXPECT_EQ(remote.calls() + other.calls(), "") << each.what << ": nothing is sent";
-        EXPECT_TRUE(NodeSender("n1").process(WebAPI::getDRNodeInfoAPI({})).isSuccess());
+        EXPECT_TRUE(NodeSender("n1").process(info).isSuccess());
         EXPECT_EQ(remote.count(each.used) + other.count(each.used), 1) << each.what;
     }
     EXPECT_TRUE(listNodeCandidates("n9").empty());

@@ -3,8 +3,6 @@
 #include "support/other_process.h"
 #include "transport/conn_cache.h"
 
-#include <ovradrnode/sender.h>
-
 #include <chrono>
 #include <deque>
 
