@@ -32,24 +32,16 @@ SqliteDB openDb(unsigned int busyTime = 1) {
     return {kPath, busyTime, "info"};
 }
 
-InsertCommand insertion(const std::string &id, const SqliteValue &value) {
+/// \return why it failed; "" if it did not
+std::string insert(const std::string &id, const SqliteValue &value) {
     SqliteValueList row;
     row.AddValue("id", id);
     row.AddValue("v", value);
     InsertCommand command;
     command.SetTable(kTable);
     command.SetFieldValues(row);
-    return command;
-}
-
-bool insert(const std::string &id, const SqliteValue &value) {
-    return openDb().InsertRecord(insertion(id, value));
-}
-
-std::string failureOfInsert() {
     SqliteDB db = openDb();
-    EXPECT_FALSE(db.InsertRecord(insertion("a", 1)));
-    return db.GetErrMsg().asString();
+    return db.InsertRecord(command) ? "" : db.GetErrMsg().asString();
 }
 
 std::vector<SqliteValueList> select(const SqliteCondition &condition) {
@@ -83,7 +75,7 @@ TEST_F(Sqlite, AnyBytesAreStoredAndMatchedExactly) {
                                             "\xff\xfe not utf-8",
                                             std::string(3000000, 'x')};
     for (std::size_t i = 0; i < texts.size(); ++i) {
-        ASSERT_TRUE(insert(std::to_string(i), texts[i])) << i;
+        ASSERT_EQ(insert(std::to_string(i), texts[i]), "") << i;
     }
     for (std::size_t i = 0; i < texts.size(); ++i) {
         const auto rows = select(SqliteEqual("v", texts[i]));
@@ -180,12 +172,12 @@ TEST_F(Sqlite, WaitsForALockOfAnotherAndFailsWhenItStays) {
     sqlite3 *other = nullptr;
     ASSERT_EQ(sqlite3_open(kPath, &other), SQLITE_OK);
     ASSERT_EQ(sqlite3_exec(other, "BEGIN EXCLUSIVE", nullptr, nullptr, nullptr), SQLITE_OK);
-    EXPECT_EQ(failureOfInsert(), "database is locked");
+    EXPECT_EQ(insert("a", 1), "database is locked");
     std::thread release([&] {
         std::this_thread::sleep_for(std::chrono::milliseconds(300));
         sqlite3_exec(other, "COMMIT", nullptr, nullptr, nullptr);
     });
-    EXPECT_TRUE(insert("a", 1));
+    EXPECT_EQ(insert("a", 1), "");
     release.join();
     sqlite3_close(other);
 }
@@ -193,12 +185,12 @@ TEST_F(Sqlite, WaitsForALockOfAnotherAndFailsWhenItStays) {
 TEST_F(Sqlite, AFileThatIsNotWhatItShouldBeFailsClearlyAndIsLeftAlone) {
     insert("a", 1);
     unlink(kPath);
-    EXPECT_FALSE(insert("b", 1));
+    EXPECT_NE(insert("b", 1), "");
     EXPECT_NE(access(kPath, F_OK), 0) << "an absent file is not made";
     std::ofstream(kPath).close();
-    EXPECT_FALSE(insert("b", 1)) << "an empty file has no table";
+    EXPECT_NE(insert("b", 1), "") << "an empty file has no table";
     std::ofstream(kPath) << std::string(10000, '?');
-    EXPECT_EQ(failureOfInsert(), "file is not a database");
+    EXPECT_EQ(insert("a", 1), "file is not a database");
     struct stat status {};
     stat(kPath, &status);
     EXPECT_EQ(status.st_size, 10000);

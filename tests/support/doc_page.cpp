@@ -4,6 +4,7 @@
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
+#include <regex>
 #include <sstream>
 #include <stdexcept>
 
@@ -82,6 +83,7 @@ std::vector<std::string> docPages() {
 }
 
 std::vector<std::string> codeIn(const std::string &text) {
+    static const std::regex kQuoted("`([^`]*)`");
     std::vector<std::string> code;
     std::istringstream lines(text);
     bool inBlock = false;
@@ -91,13 +93,9 @@ std::vector<std::string> codeIn(const std::string &text) {
         } else if (inBlock || line.starts_with("    ")) {
             code.push_back(trimmed(line));
         } else {
-            for (std::size_t begin = 0; (begin = line.find('`', begin)) != std::string::npos;) {
-                const std::size_t end = line.find('`', begin + 1);
-                if (end == std::string::npos) {
-                    break;
-                }
-                code.push_back(line.substr(begin + 1, end - begin - 1));
-                begin = end + 1;
+            for (std::sregex_iterator each(line.begin(), line.end(), kQuoted), end; each != end;
+                 ++each) {
+                code.push_back((*each)[1]);
             }
         }
     }

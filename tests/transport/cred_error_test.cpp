@@ -21,7 +21,7 @@ protected:
     CredError() {
         remote.sessions = {"s"};
         remote.answer = [](const auto &) { return OvraPlatform::apiSuccess(); };
-        credentialLibrary().fault = [this](const std::string &operation) {
+        credentialLibrary.fault = [this](const std::string &operation) {
             ++asked[operation];
             const bool fails = failing.count(operation) != 0;
             now += fails && (operation == "Process" || operation == "probe") ? 10'000 : 0;
@@ -30,7 +30,7 @@ protected:
         ConnCache(conn).UpdateWithData(true);
     }
     ~CredError() override {
-        EXPECT_EQ(credentialLibrary().credentials + credentialLibrary().sessions, 0);
+        EXPECT_EQ(credentialLibrary.credentials + credentialLibrary.sessions, 0);
     }
     void fail(const std::set<std::string> &operations, int number = 0) {
         failing = operations;
@@ -52,7 +52,7 @@ protected:
     }
 
     Conn conn = Conn::https("h", 5001);
-    OvraVendor::Remote &remote = credentialLibrary().remotes["https://h:5001"];
+    OvraVendor::Remote &remote = credentialLibrary.remotes["https://h:5001"];
     std::set<std::string> failing;
     int error = 0;
     std::map<std::string, int> asked;
@@ -128,8 +128,8 @@ TEST_F(CredError, TheRequestSaysHowItTravels) {
 
 TEST_F(CredError, ARelayEndpointIsResolvedBeforeUse) {
     fail({"GetConnInfo"}); // the answer counts, not this
-    credentialLibrary().relay["alias"] = Conn::https("alias.relay", 6001).toJson();
-    credentialLibrary().relay["alias"]["host"] = "alias.relay";
+    credentialLibrary.relay["alias"] = Conn::https("alias.relay", 6001).toJson();
+    credentialLibrary.relay["alias"]["host"] = "alias.relay";
     CredSessionSender sender(Conn::farlink("alias"), "s");
     EXPECT_TRUE(sender.getConn() == Conn::https("alias.relay", 6001));
     EXPECT_FALSE(sender.setConn(Conn()));
@@ -172,7 +172,7 @@ TEST_F(CredError, OneRequestAsksASilentEndpointOnceHoweverManyCredentialsItHas) 
     stopClock();
     for (int i = 0; i < 6; ++i) {
         const int port = 5001 + i;
-        credentialLibrary().remotes["https://127.0.0.1:" + std::to_string(port)] = remote;
+        credentialLibrary.remotes["https://127.0.0.1:" + std::to_string(port)] = remote;
         addCred("temp_cred", "n1", "t" + std::to_string(i), "https", 5001 + i % 2, "s");
     }
     for (const auto &each : cases) {

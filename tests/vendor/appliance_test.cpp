@@ -32,7 +32,7 @@ Json::Value json(const std::string &text) {
 struct PeerNode {
     explicit PeerNode(const std::string &host)
         : conn(Conn::https(host, 5001))
-        , remote(credentialLibrary().remotes["https://" + host + ":5001"]) {
+        , remote(credentialLibrary.remotes["https://" + host + ":5001"]) {
         remote.answer = [this](const Call &call) { return answer(call); };
     }
 
@@ -88,7 +88,7 @@ protected:
     void SetUp() override {
         provisionNode();
         DRNode::getLocalNodeId();
-        webApiLibrary().answer = [](const Call &call, const std::string &user) {
+        webApiLibrary.answer = [](const Call &call, const std::string &user) {
             const bool known = user == "admin" && call.params["name"] == "joe";
             return json(known ? kSuccess : R"({"success":false,"error":{"code":3106}})");
         };
@@ -113,7 +113,7 @@ std::string text(const std::vector<Conn> &conns) {
 
 std::string sessionIds() {
     std::string all;
-    for (const OvraVendor::Session &each : cgiLibrary().sessions) {
+    for (const OvraVendor::Session &each : cgiLibrary.sessions) {
         all += each.id + " ";
     }
     return all;
@@ -129,23 +129,22 @@ void script(const std::string &name, const std::string &body) {
 } // namespace
 
 TEST_F(Appliance, GivesTheNodeItsIdentity) {
-    const std::string id = DRNode::getLocalNodeId();
-    EXPECT_EQ(id.size(), 36U);
-    EXPECT_EQ(DRNode::getLocalNodeId(), id);
+    EXPECT_EQ(DRNode::getLocalNodeId().size(), 36U);
+    EXPECT_EQ(DRNode::getLocalNodeId(), DRNode::getLocalNodeId());
     ASSERT_TRUE(DRNode::resetLocalNodeId());
-    coreLibrary().readOnly = true;
+    coreLibrary.readOnly = true;
     EXPECT_EQ(DRNode::getLocalNodeId(), "") << "a value that was not stored is none";
     EXPECT_EQ(DRNode::getLocalHostName() + " " + DRNode::getLocalSerial(), "appliance SERIAL1");
-    sdkLibrary() = {std::nullopt, std::nullopt};
+    sdkLibrary = {std::nullopt, std::nullopt};
     EXPECT_EQ(DRNode::getLocalHostName() + DRNode::getLocalSerial(), "");
 }
 
 TEST_F(Appliance, TellsTheNodeItsEndpoints) {
     EXPECT_EQ(text(DRNode::getLocalConn()), "");
-    netLibrary().interfaces = {
+    netLibrary.interfaces = {
         {"eth0", "192.0.2.1"}, {"eth1", "192.0.2.2", false}, {"eth2", "2001:db8::1"}};
-    netLibrary().pppoe = "198.51.100.9";
-    webApiLibrary().answer = [](const Call &call, const std::string &) {
+    netLibrary.pppoe = "198.51.100.9";
+    webApiLibrary.answer = [](const Call &call, const std::string &) {
         EXPECT_EQ(call.api + " " + call.method, "OVRA.Core.Farlink get");
         return json(R"({"success":true,"data":{"enabled":true,"server_alias":"home"}})");
     };
@@ -153,15 +152,15 @@ TEST_F(Appliance, TellsTheNodeItsEndpoints) {
               "https://192.0.2.1:5001 http://192.0.2.1:5000 https://2001:db8::1:5001 "
               "http://2001:db8::1:5000 https://198.51.100.9:5001 http://198.51.100.9:5000 "
               "flk://home:443 ");
-    w3Library().https = -1;
-    webApiLibrary().answer = nullptr;
+    w3Library.https = -1;
+    webApiLibrary.answer = nullptr;
     EXPECT_EQ(text(Conn::listLocal()),
               "http://192.0.2.1:5000 http://2001:db8::1:5000 http://198.51.100.9:5000 ")
         << "an endpoint without a port is none";
 }
 
 TEST_F(Appliance, AsksTheRelayWhereAnAliasIs) {
-    auto &relay = credentialLibrary().relay;
+    auto &relay = credentialLibrary.relay;
     relay["home"] = json(R"({"host":"relay.example","protocol":"https","port":4001})");
     relay["odd"] = json(R"({"host":"relay.example","port":"4001"})");
     EXPECT_EQ(text({Conn::translateFarlink(Conn::farlink("home"))}), "https://relay.example:4001 ");
@@ -171,7 +170,7 @@ TEST_F(Appliance, AsksTheRelayWhereAnAliasIs) {
 
 TEST_F(Appliance, RunsWhatIsForThisNodeHere) {
     std::string asked;
-    webApiLibrary().answer = [&asked](const Call &call, const std::string &user) {
+    webApiLibrary.answer = [&asked](const Call &call, const std::string &user) {
         asked = user + ": " + call.api + " " + call.method + " " + std::to_string(call.version);
         return json(R"({"success":true,"data":{"hostname":"appliance"}})");
     };
@@ -179,13 +178,13 @@ TEST_F(Appliance, RunsWhatIsForThisNodeHere) {
     EXPECT_EQ(sender.process(WebAPI::getDRNodeInfoAPI({})).getDataFieldtoStr("hostname"),
               "appliance");
     EXPECT_EQ(asked, "admin: OVRA.DR.Node info 1");
-    webApiLibrary().answer = nullptr;
+    webApiLibrary.answer = nullptr;
     EXPECT_EQ(sender.process(WebAPI::getDRNodeInfoAPI({})).getErrCode(), 100) << "nobody to ask";
 }
 
 TEST_F(Appliance, RunsTheScriptsOfTheLinkTests) {
     peer.grant("c1", "s1");
-    netLibrary().interfaces = {{"eth0", "192.0.2.1"}};
+    netLibrary.interfaces = {{"eth0", "192.0.2.1"}};
     script("TestDownloadSpeed.sh", R"(printf '%s %s %s' "$1" "$2" "$3")");
     script("TestSyncSpeed.sh",
            R"([ "$1" = setup ] && touch /tmp/speed-file && printf /tmp/speed-file)");
@@ -283,7 +282,7 @@ TEST_F(Appliance, MakesASessionForANodeAndAUser) {
     unsetenv("REMOTE_ADDR");
     const std::string id = session.CreateNodeSession("n1", "joe");
     ASSERT_EQ(sessionIds(), id + " ");
-    const OvraVendor::Session made = cgiLibrary().sessions[0];
+    const OvraVendor::Session made = cgiLibrary.sessions[0];
     EXPECT_EQ(made.user + " " + made.app + " " + made.extra, R"(joe Tidewater {"node_id":"n1"})");
     EXPECT_EQ(made.ui, R"({"hide":true,"title":"session"})") << "the rest of the template stays";
     EXPECT_EQ(made.timeout, -1);
@@ -293,20 +292,20 @@ TEST_F(Appliance, MakesASessionForANodeAndAUser) {
     EXPECT_EQ(session.CreateNodeSession("n1", "nobody"), "");
     EXPECT_EQ(session.GetErrCode(), 527);
     for (const int option : {1, 3, 7, 10}) {
-        cgiLibrary().refusedOptions = {option};
+        cgiLibrary.refusedOptions = {option};
         EXPECT_EQ(session.CreateNodeSession("n2", "joe"), "") << option;
         EXPECT_EQ(session.GetErrCode(), 511) << option;
     }
-    cgiLibrary().refusedOptions = {9, 11};
+    cgiLibrary.refusedOptions = {9, 11};
     EXPECT_NE(session.CreateNodeSession("n2", "joe"), "") << "can be without these";
-    webApiLibrary().answer = [](const Call &, const std::string &) { return json(kSuccess); };
+    webApiLibrary.answer = [](const Call &, const std::string &) { return json(kSuccess); };
     EXPECT_NE(session.CreateTempSession(std::string(600, 'j'), 60), "");
-    EXPECT_EQ(cgiLibrary().sessions.back().user, std::string(491, 'j'));
+    EXPECT_EQ(cgiLibrary.sessions.back().user, std::string(491, 'j'));
 }
 
 TEST_F(Appliance, RemovesASessionByItsIdItsUserOrWithAllOfThem) {
-    cgiLibrary().sessions.push_back({"desktop-1", "joe", "desktop", "", "", "", -1});
-    webApiLibrary().answer = [](const Call &, const std::string &) { return json(kSuccess); };
+    cgiLibrary.sessions.push_back({"desktop-1", "joe", "desktop", "", "", "", -1});
+    webApiLibrary.answer = [](const Call &, const std::string &) { return json(kSuccess); };
     const std::string first = session.CreateNodeSession("n1", "joe");
     EXPECT_NE(session.CreateTempSession("joe", 300), "");
     const std::string ann = session.CreateNodeSession("n1", "ann");

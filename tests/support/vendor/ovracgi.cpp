@@ -20,7 +20,7 @@ struct OvraCgiStore : Session {};
 namespace {
 
 void recordGone(json_object * /*record*/, void * /*data*/) {
-    --cgiLibrary().records;
+    --cgiLibrary.records;
 }
 
 json_object *recordOf(const Session &session) {
@@ -35,28 +35,23 @@ json_object *recordOf(const Session &session) {
     put(OVRA_CGI_FIELD_SID, session.id);
     put(OVRA_CGI_FIELD_APP, session.app);
     put(OVRA_CGI_FIELD_EXTRA, session.extra);
-    ++cgiLibrary().records;
+    ++cgiLibrary.records;
     json_object_set_userdata(record, nullptr, recordGone);
     return record;
 }
 
 } // namespace
 
-OvraVendor::CgiLibrary &OvraVendor::cgiLibrary() {
-    static CgiLibrary library;
-    return library;
-}
-
 extern "C" {
 
 int OvraCgiInit(const char * /*name*/, OvraCgi *handle) {
-    ++cgiLibrary().handles;
+    ++cgiLibrary.handles;
     handle->store = new OvraCgiStore;
     return 0;
 }
 
 void OvraCgiFree(OvraCgi *handle) {
-    --cgiLibrary().handles;
+    --cgiLibrary.handles;
     delete handle->store;
 }
 
@@ -70,7 +65,7 @@ int OvraCgiSetOption(OvraCgi *handle, int option, const void *value) {
     } else if (option == OVRA_CGI_OPT_TIMEOUT) {
         session.timeout = *static_cast<const int *>(value);
     }
-    return cgiLibrary().refusedOptions.count(option) == 0 ? 1 : 0;
+    return cgiLibrary.refusedOptions.count(option) == 0 ? 1 : 0;
 }
 
 const char *OvraCgiLoginUIJsonConfigTemplate() {
@@ -85,12 +80,12 @@ int OvraCgiLoginNoAuth(OvraCgi *handle, char *sid, size_t size, const char * /*c
     const char *const address = std::getenv("REMOTE_ADDR");
     session.client = address != nullptr ? address : "";
     std::snprintf(sid, size, "%s", session.id.c_str());
-    cgiLibrary().sessions.push_back(session);
+    cgiLibrary.sessions.push_back(session);
     return 1;
 }
 
 int OvraCgiRemoveSessionByFunc(OvraCgi * /*handle*/, OvraCgiTest test, void *argument) {
-    std::erase_if(cgiLibrary().sessions, [&](const Session &session) {
+    std::erase_if(cgiLibrary.sessions, [&](const Session &session) {
         json_object *record = recordOf(session);
         const bool removed = test(record, argument) == 0;
         json_object_put(record);
@@ -100,13 +95,13 @@ int OvraCgiRemoveSessionByFunc(OvraCgi * /*handle*/, OvraCgiTest test, void *arg
 }
 
 int OvraCgiRemoveSessionByIndex(OvraCgi * /*handle*/, int /*field*/, const char *value) {
-    std::erase_if(cgiLibrary().sessions,
+    std::erase_if(cgiLibrary.sessions,
                   [value](const Session &session) { return session.id == value; });
     return 0;
 }
 
 int OvraCgiGetSessionBySID(OvraCgi * /*handle*/, const char *sid, json_object **record) {
-    for (const Session &session : cgiLibrary().sessions) {
+    for (const Session &session : cgiLibrary.sessions) {
         if (session.id == sid) {
             *record = recordOf(session);
             return 1;

@@ -29,11 +29,6 @@ std::map<FILE *, pid_t> programs;
 
 } // namespace
 
-OvraVendor::CoreLibrary &OvraVendor::coreLibrary() {
-    static CoreLibrary library;
-    return library;
-}
-
 extern "C" {
 
 int OLIBCFileExist(const char *path) {
@@ -58,7 +53,7 @@ int OLIBCFileSetKeyValue(const char *path, const char *key, const char *value,
     std::vector<std::string> lines = linesOf(path);
     std::erase_if(lines, [&start](const std::string &line) { return line.starts_with(start); });
     lines.push_back(start + value + "\"");
-    std::ofstream file(coreLibrary().readOnly ? "/" : path);
+    std::ofstream file(coreLibrary.readOnly ? "/" : path);
     for (const std::string &each : lines) {
         file << each << '\n';
     }
@@ -88,14 +83,14 @@ FILE *OLIBCPopen(const char *path, const char *mode, ...) {
     close(ends[1]);
     FILE *stream = fdopen(ends[0], mode);
     programs[stream] = child;
-    ++coreLibrary().streams;
+    ++coreLibrary.streams;
     return stream;
 }
 
 int OLIBCPclose(FILE *stream) {
     const pid_t child = programs.at(stream);
     programs.erase(stream);
-    --coreLibrary().streams;
+    --coreLibrary.streams;
     fclose(stream);
     int status = -1;
     return waitpid(child, &status, 0) == child ? status : -1;

@@ -26,7 +26,7 @@ constexpr int kCannotConnect = 5;
 
 /// Null if it cannot be reached.
 Remote *findRemote(const OVRACred &cred) {
-    auto &remotes = credentialLibrary().remotes;
+    auto &remotes = credentialLibrary.remotes;
     const auto found =
         remotes.find(cred.protocol + "://" + cred.host + ":" + std::to_string(cred.port));
     return found != remotes.end() && found->second.reachable ? &found->second : nullptr;
@@ -41,7 +41,7 @@ Json::Value refusal(int code) {
 
 /// \param error  receives the number, if the operation has to fail
 bool fails(const char *operation, int *error = nullptr) {
-    const auto &fault = credentialLibrary().fault;
+    const auto &fault = credentialLibrary.fault;
     const std::optional<int> number = fault ? fault(operation) : std::nullopt;
     if (number && error != nullptr) {
         *error = *number;
@@ -51,32 +51,27 @@ bool fails(const char *operation, int *error = nullptr) {
 
 } // namespace
 
-OvraVendor::CredentialLibrary &OvraVendor::credentialLibrary() {
-    static CredentialLibrary library;
-    return library;
-}
-
 extern "C" {
 OVRACred *OVRACredAlloc() {
     if (fails(__func__)) {
         return nullptr;
     }
-    ++credentialLibrary().credentials;
+    ++credentialLibrary.credentials;
     return new OVRACred;
 }
 void OVRACredFree(OVRACred *cred) {
-    --credentialLibrary().credentials;
+    --credentialLibrary.credentials;
     delete cred;
 }
 OVRACredSess *OVRACredSessAlloc() {
     if (fails(__func__)) {
         return nullptr;
     }
-    ++credentialLibrary().sessions;
+    ++credentialLibrary.sessions;
     return new OVRACredSess;
 }
 void OVRACredSessFree(OVRACredSess *sess) {
-    --credentialLibrary().sessions;
+    --credentialLibrary.sessions;
     delete sess;
 }
 int OVRACredItemSetProtocol(OVRACred *cred, const char *protocol) {
@@ -111,11 +106,11 @@ struct CredRequest::Impl {
 
 CredRequest::CredRequest()
     : impl_(std::make_unique<Impl>()) {
-    ++credentialLibrary().requests;
+    ++credentialLibrary.requests;
 }
 
 CredRequest::~CredRequest() {
-    --credentialLibrary().requests;
+    --credentialLibrary.requests;
 }
 
 int CredRequest::SetURL(const std::string &protocol, const std::string &address, int port,
@@ -202,8 +197,8 @@ int CredRequestUtil::Logout(OVRACred *cred, OVRACredSess *sess) {
 int CredRequestFarlink::GetConnInfo(const std::string &alias, Json::Value &info,
                                     const void * /*options*/) {
     const int done = fails(__func__) ? 0 : 1;
-    const auto found = credentialLibrary().relay.find(alias);
-    if (found == credentialLibrary().relay.end()) {
+    const auto found = credentialLibrary.relay.find(alias);
+    if (found == credentialLibrary.relay.end()) {
         return 0;
     }
     info = found->second;

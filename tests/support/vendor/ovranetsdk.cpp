@@ -8,16 +8,11 @@
 
 #include <cstdio>
 
-OvraVendor::NetLibrary &OvraVendor::netLibrary() {
-    static NetLibrary library;
-    return library;
-}
-
 extern "C" {
 
 int OLIBNetGetInterfaceInfo(OLIBNetInterface *table, int size, int selector) {
     int filled = 0;
-    for (const OvraVendor::Interface &each : OvraVendor::netLibrary().interfaces) {
+    for (const OvraVendor::Interface &each : OvraVendor::netLibrary.interfaces) {
         const bool six = each.address.find(':') != std::string::npos;
         if ((selector & (six ? OLIB_NET_SELECT_IPV6 : OLIB_NET_SELECT_IPV4)) == 0) {
             continue;
@@ -34,11 +29,11 @@ int OLIBNetGetInterfaceInfo(OLIBNetInterface *table, int size, int selector) {
 }
 
 int OVRAPPPoECheckStatus(int index) {
-    return index == 1 && OvraVendor::netLibrary().pppoe ? 1 : 0;
+    return index == 1 && OvraVendor::netLibrary.pppoe ? 1 : 0;
 }
 
 int OVRAPPPoeNetInfoGet(char *buffer, int size, int /*unit*/, int /*flags*/) {
-    const auto &address = OvraVendor::netLibrary().pppoe;
+    const auto &address = OvraVendor::netLibrary.pppoe;
     if (!address || static_cast<int>(address->size()) >= size) {
         return -1;
     }

@@ -17,16 +17,11 @@ int copy(const std::optional<std::string> &text, char *buffer, int size) {
 
 } // namespace
 
-OvraVendor::SdkLibrary &OvraVendor::sdkLibrary() {
-    static SdkLibrary library;
-    return library;
-}
-
 extern "C" {
 int OLIBGetSerialNumber(char *buffer, int size) {
-    return copy(OvraVendor::sdkLibrary().serial, buffer, size);
+    return copy(OvraVendor::sdkLibrary.serial, buffer, size);
 }
 int OVRALnxGetHostname(char *buffer, int size) {
-    return copy(OvraVendor::sdkLibrary().hostName, buffer, size);
+    return copy(OvraVendor::sdkLibrary.hostName, buffer, size);
 }
 }

@@ -6,27 +6,22 @@
 
 #include <ovraw3/talo.h>
 
-OvraVendor::W3Library &OvraVendor::w3Library() {
-    static W3Library library;
-    return library;
-}
-
 namespace ovraw3 {
 
 Talo::Talo() {
-    ++OvraVendor::w3Library().clients;
+    ++OvraVendor::w3Library.clients;
 }
 
 Talo::~Talo() {
-    --OvraVendor::w3Library().clients;
+    --OvraVendor::w3Library.clients;
 }
 
 int Talo::GetHttpPort() {
-    return OvraVendor::w3Library().http;
+    return OvraVendor::w3Library.http;
 }
 
 int Talo::GetHttpsPort() {
-    return OvraVendor::w3Library().https;
+    return OvraVendor::w3Library.https;
 }
 
 } // namespace ovraw3

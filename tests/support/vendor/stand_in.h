@@ -1,8 +1,8 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
-// The inputs of the stand-ins for the vendor's libraries, and what they have recorded. Each library
-// owns its part; none is thread-safe.
+// The inputs of the stand-ins for the vendor's libraries, and what they have recorded. All
+// share them with the test; none is thread-safe.
 
 #include <json/value.h>
 
@@ -52,7 +52,7 @@ struct CredentialLibrary {
     /// with which it fails, if it does.
     std::function<std::optional<int>(const std::string &operation)> fault;
 };
-OVRA_VENDOR_EXPORT CredentialLibrary &credentialLibrary();
+inline OVRA_VENDOR_EXPORT CredentialLibrary credentialLibrary;
 
 /// libwebapi-Talo5.so
 struct WebApiLibrary {
@@ -60,7 +60,7 @@ struct WebApiLibrary {
     std::function<Json::Value(const Call &, const std::string &user)> answer;
     int runners = 0; ///< that are alive
 };
-OVRA_VENDOR_EXPORT WebApiLibrary &webApiLibrary();
+inline OVRA_VENDOR_EXPORT WebApiLibrary webApiLibrary;
 
 struct Session {
     std::string id, user, app, extra, ui, client;
@@ -73,7 +73,7 @@ struct CgiLibrary {
     std::set<int> refusedOptions;
     int handles = 0, records = 0; ///< that are alive
 };
-OVRA_VENDOR_EXPORT CgiLibrary &cgiLibrary();
+inline OVRA_VENDOR_EXPORT CgiLibrary cgiLibrary;
 
 /// libovraw3.so
 struct W3Library {
@@ -81,21 +81,21 @@ struct W3Library {
     int https = 5001;
     int clients = 0; ///< that are alive
 };
-OVRA_VENDOR_EXPORT W3Library &w3Library();
+inline OVRA_VENDOR_EXPORT W3Library w3Library;
 
 /// libovracore.so: its files and programs are real ones.
 struct CoreLibrary {
     bool readOnly = false; ///< no key can be written
     int streams = 0;       ///< that are open
 };
-OVRA_VENDOR_EXPORT CoreLibrary &coreLibrary();
+inline OVRA_VENDOR_EXPORT CoreLibrary coreLibrary;
 
 /// libovrasdk.so
 struct SdkLibrary {
     std::optional<std::string> serial = "SERIAL1";
     std::optional<std::string> hostName = "appliance";
 };
-OVRA_VENDOR_EXPORT SdkLibrary &sdkLibrary();
+inline OVRA_VENDOR_EXPORT SdkLibrary sdkLibrary;
 
 struct Interface {
     std::string name;
@@ -108,19 +108,19 @@ struct NetLibrary {
     std::vector<Interface> interfaces;
     std::optional<std::string> pppoe; ///< the first link's address, when it is up
 };
-OVRA_VENDOR_EXPORT NetLibrary &netLibrary();
+inline OVRA_VENDOR_EXPORT NetLibrary netLibrary;
 
 /// How much was not released, or released twice, as text; "" if nothing.
 inline std::string leftOver() {
     const std::pair<const char *, int> live[] = {
-        {"credential objects", credentialLibrary().credentials},
-        {"credential sessions", credentialLibrary().sessions},
-        {"credential requests", credentialLibrary().requests},
-        {"local runners", webApiLibrary().runners},
-        {"session store handles", cgiLibrary().handles},
-        {"session records", cgiLibrary().records},
-        {"web-engine clients", w3Library().clients},
-        {"streams of programs", coreLibrary().streams},
+        {"credential objects", credentialLibrary.credentials},
+        {"credential sessions", credentialLibrary.sessions},
+        {"credential requests", credentialLibrary.requests},
+        {"local runners", webApiLibrary.runners},
+        {"session store handles", cgiLibrary.handles},
+        {"session records", cgiLibrary.records},
+        {"web-engine clients", w3Library.clients},
+        {"streams of programs", coreLibrary.streams},
     };
     std::string text;
     for (const auto &[name, count] : live) {

@@ -6,24 +6,19 @@
 
 #include <ovrawebapi/api_runner.h>
 
-OvraVendor::WebApiLibrary &OvraVendor::webApiLibrary() {
-    static WebApiLibrary library;
-    return library;
-}
-
 namespace OVRA {
 
 APIRunner::APIRunner() {
-    ++OvraVendor::webApiLibrary().runners;
+    ++OvraVendor::webApiLibrary.runners;
 }
 
 APIRunner::~APIRunner() {
-    --OvraVendor::webApiLibrary().runners;
+    --OvraVendor::webApiLibrary.runners;
 }
 
 bool APIRunner::Exec(Json::Value &out, const char *api, int version, const char *method,
                      const Json::Value &params, const char *user) {
-    const auto &answer = OvraVendor::webApiLibrary().answer;
+    const auto &answer = OvraVendor::webApiLibrary.answer;
     if (!answer) {
         out = Json::Value();
         out["success"] = false;
