@@ -1,19 +1,10 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "cache_file.h"
-#include "clock.h"
-#include "support/local_node.h"
-#include "support/log_capture.h"
-#include "support/remote_node.h"
+#include "support/node_fixture.h"
 #include "transport/conn_cache.h"
 
-#include <ovradrcore/json.h>
-#include <ovradrnode/node_api.h>
 #include <ovradrnode/node_cache.h>
-#include <ovradrnode/sender.h>
-#include <ovraplatform/api_errors.h>
-#include <ovraplatform/api_registry.h>
 
-#include <gtest/gtest.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -29,27 +20,20 @@ using namespace OvraTest;
 
 namespace {
 
-std::int64_t now = 3'000'000'000'000;
-
 /// The nodes "n1" with the credential c1 and "n2" with d1, which has no right, and d2.
-class NodeInfo : public testing::Test {
+class NodeInfo : public TwoNodes {
 protected:
-    void SetUp() override {
-        provisionNode();
-        OvraDRCore::setSystemClock([] { return now; });
-        addCred("node_cred", "n1", "c1", "https", remote.port(), "s1");
+    NodeInfo() {
+        stopClock();
+        addNodeCred("c1", "s1");
         addCred("node_cred", "n2", "d1", "https", other.port(), "z1");
         addCred("node_cred", "n2", "d2", "https", other.port(), "z2");
         remote.answer("info", R"({"success":true,"data":{"hostname":"b","serial":"S",)"
                               R"("additional":{"timezone":"Asia/Tokyo"}}})");
     }
-    void TearDown() override { OvraDRCore::setSystemClock(nullptr); }
 
-    RemoteNode remote;
     RemoteNode other;
-    Conn conn = Conn::https("127.0.0.1", remote.port());
     NodeCache cache{"n1", false};
-    LogCapture log;
 };
 
 } // namespace
@@ -81,16 +65,11 @@ TEST_F(NodeInfo, ANodeThatRefusesOrIsAwayKeepsWhatItSaidLast) {
 }
 
 TEST_F(NodeInfo, TheLocalNodeNeedsAWholeAnswer) {
-    OvraPlatform::APIRegistry registry;
     Json::Value data;
     ASSERT_TRUE(OvraDRCore::fromString(
         data, R"({"hostname":"here","serial":"L","additional":{"timezone":"UTC"}})"));
-    registry.add("OVRA.DR.Node", 1, "info", OvraPlatform::APIRight::kAdministrator,
-                 OvraPlatform::APIQueue::kQuick,
-                 [&](const Json::Value &, const OvraPlatform::APICaller &) {
-                     return OvraPlatform::apiSuccess(data);
-                 });
-    registry.host();
+    host("OVRA.DR.Node", "info",
+         [&](const Json::Value &, const auto &) { return OvraPlatform::apiSuccess(data); });
     NodeCache local(DRNode::getLocalNodeId(), false);
     for (const char *stored : {"null", "[]", R"({"hostname":"old","serial":"L"})",
                                R"({"hostname":"old","serial":"L","additional":"x"})"}) {
@@ -158,9 +137,7 @@ TEST_F(NodeInfo, ProcessesStoppedInTheirProbesHoldOthersUpOnceAndHaveOldNewsLate
         remote.answer("probe", probes < stopped.size() ? Answer::silence() : Answer::html());
         ++probes;
     });
-    const auto send = [] {
-        return NodeSender("n1").process(WebAPI::getDRNodeInfoAPI({})).isSuccess();
-    };
+    const auto send = [this] { return NodeSender("n1").process(info).isSuccess(); };
     for (pid_t &child : stopped) {
         child = fork();
         if (child == 0) {

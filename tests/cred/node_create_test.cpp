@@ -1,11 +1,8 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "cred/flow_fixture.h"
 
-#include <ovradrcore/json.h>
 #include <ovradrnode/node_cache.h>
 #include <ovradrnode/node_create.h>
-
-#include <unistd.h>
 
 using namespace OvraDRNode;
 using namespace OvraTest;
@@ -52,8 +49,7 @@ TEST_F(CredFlow, ACheckCreatesNothing) {
     EXPECT_TRUE(create.check());
     EXPECT_EQ(remote.params("get"), R"({"name":"joe"})");
     remote.answer("get", R"({"success":false,"error":{"code":105}})");
-    EXPECT_FALSE(create.check());
-    EXPECT_EQ(create.GetErrCode(), 525);
+    EXPECT_EQ(codeOf(create.check(), create), 525);
     EXPECT_EQ(log.count("ERR", "node_create", "check", "Failed to check cred account [joe]"), 1);
     EXPECT_EQ(rows("node_cred"), "");
     EXPECT_EQ(sent("login-sid create"), 0);
@@ -61,51 +57,51 @@ TEST_F(CredFlow, ACheckCreatesNothing) {
 
 TEST_F(CredFlow, CreationFailsAtEachStepWithItsCodeAndWritesNothing) {
     const struct {
-        const char *what;
         const char *call;
         const char *answer;
         int code;
         bool asked; ///< for a session
     } cases[] = {
-        {"refused", "info", R"({"success":false,"error":{"code":999}})", 999, false},
-        {"no permission", "info", R"({"success":false,"error":{"code":105}})", 525, false},
-        {"no serial", "info", R"({"success":true,"data":{"node_id":"n1"}})", 519, false},
-        {"no node id", "info", R"({"success":true,"data":{"serial":"S"}})", 519, false},
-        {"empty serial", "info", R"({"success":true,"data":{"node_id":"n1","serial":""}})", 519,
-         false},
-        {"odd node id", "info", R"({"success":true,"data":{"node_id":{},"serial":"S"}})", 519,
-         false},
-        {"session refused", "create", R"({"success":false,"error":{"code":105}})", 509, true},
-        {"no session", "create", R"({"success":true,"data":{}})", 509, true},
-        {"empty session", "create", R"({"success":true,"data":{"session":""}})", 509, true},
-        {"dead session", "granted test_privilege", R"({"success":false,"error":{"code":119}})", 509,
-         true},
+        {"info", R"({"success":false,"error":{"code":999}})", 999, false},
+        {"info", R"({"success":false,"error":{"code":105}})", 525, false},
+        {"info", R"({"success":true,"data":{"node_id":"n1"}})", 519, false},
+        {"info", R"({"success":true,"data":{"serial":"S"}})", 519, false},
+        {"info", R"({"success":true,"data":{"node_id":"n1","serial":""}})", 519, false},
+        {"info", R"({"success":true,"data":{"node_id":{},"serial":"S"}})", 519, false},
+        {"create", R"({"success":false,"error":{"code":105}})", 509, true},
+        {"create", R"({"success":true,"data":{}})", 509, true},
+        {"create", R"({"success":true,"data":{"session":""}})", 509, true},
+        {"granted test_privilege", R"({"success":false,"error":{"code":119}})", 509, true},
     };
     for (const auto &each : cases) {
-        SetUpAnswers();
+        arrangeAnswers();
         remote.answer(each.call, each.answer);
         remote.forgetCalls();
         DRNodeCredCreate create;
-        ASSERT_TRUE(create.setCred(conn, "joe", "pw", "")) << each.what;
-        EXPECT_FALSE(create.process()) << each.what;
-        EXPECT_EQ(create.GetErrCode(), each.code) << each.what;
-        EXPECT_EQ(rows("node_cred"), "") << each.what;
-        EXPECT_EQ(sent("login-sid create"), each.asked ? 1 : 0) << each.what;
-        SetUpAnswers();
-        EXPECT_TRUE(create.process()) << each.what << ", and then again";
+        ASSERT_TRUE(create.setCred(conn, "joe", "pw", ""));
+        EXPECT_EQ(codeOf(create.process(), create), each.code) << each.answer;
+        EXPECT_EQ(rows("node_cred"), "") << each.answer;
+        EXPECT_EQ(sent("login-sid create"), each.asked ? 1 : 0) << each.answer;
+        arrangeAnswers();
+        EXPECT_TRUE(create.process()) << each.answer << ", and then again";
         EXPECT_EQ(create.GetErrCode(), 0);
         executeSql("DELETE FROM node_cred");
     }
     EXPECT_EQ(log.count("ERR", "node_create", "process",
                         "Failed to request session of remote node [127.0.0.1]"),
               4);
+    DRNodeCredCreate create;
+    ASSERT_TRUE(create.setCred(conn, "joe", "pw", ""));
+    remote.before("test_privilege", [this] { remote.die(); });
+    remote.answer("granted test_privilege", Answer::closed());
+    EXPECT_EQ(codeOf(create.process(), create), 509) << "dead between grant and write";
+    EXPECT_EQ(rows("node_cred"), "");
 }
 
 TEST_F(CredFlow, ANodeThatWasMetIsNotAskedAgainWhoItIs) {
     DRNodeCredCreate create;
     ASSERT_TRUE(create.setCred(conn, "joe", "pw", ""));
-    EXPECT_FALSE(create.processKnownNode()) << "no node was met";
-    EXPECT_EQ(create.GetErrCode(), 519);
+    EXPECT_EQ(codeOf(create.processKnownNode(), create), 519) << "no node was met";
     EXPECT_EQ(sent("login-sid create"), 0);
     ASSERT_TRUE(create.getRemoteNodeInfo());
     EXPECT_FALSE(create.isLocalNode());
@@ -119,8 +115,7 @@ TEST_F(CredFlow, ANodeThatWasMetIsNotAskedAgainWhoItIs) {
     ASSERT_TRUE(create.getRemoteNodeInfo());
     EXPECT_TRUE(create.isLocalNode());
     remote.answer("create", R"({"success":false,"error":{"code":105}})");
-    EXPECT_FALSE(create.processKnownNode());
-    EXPECT_EQ(create.GetErrCode(), 509);
+    EXPECT_EQ(codeOf(create.processKnownNode(), create), 509);
     EXPECT_EQ(log.count("ERR", "node_create", "processKnownNode",
                         "Failed to request session of remote node [127.0.0.1]"),
               1);
@@ -130,68 +125,41 @@ TEST_F(CredFlow, ARowThatCannotBeWrittenLeavesTheGrantedSessionOnTheRemote) {
     DRNodeCredCreate create;
     ASSERT_TRUE(create.setCred(conn, "joe", "pw", ""));
     querySql("DROP TABLE node_cred");
-    EXPECT_FALSE(create.process());
-    EXPECT_EQ(create.GetErrCode(), 404);
+    EXPECT_EQ(codeOf(create.process(), create), 404);
     EXPECT_EQ(sent("granted delete"), 0);
     EXPECT_EQ(log.count("Failed to insert record [INSERT INTO \"node_cred\""), 1);
     EXPECT_EQ(log.count("granted'"), 0) << "the logged statement hides the session";
     EXPECT_EQ(log.count("ERR", "node_create", "process", "Failed to insert crednode to db"), 1);
 }
 
-TEST_F(CredFlow, ARemoteThatDiesBetweenGrantAndWriteLeavesNothingHere) {
-    DRNodeCredCreate create;
-    ASSERT_TRUE(create.setCred(conn, "joe", "pw", ""));
-    remote.before("test_privilege", [this] { remote.die(); });
-    remote.answer("granted test_privilege", Answer::closed());
-    EXPECT_FALSE(create.process());
-    EXPECT_EQ(create.GetErrCode(), 509);
-    EXPECT_EQ(rows("node_cred"), "");
-}
-
 TEST_F(CredFlow, SetUpRefusesWhatCannotWork) {
     DRNodeCredCreate create;
-    EXPECT_FALSE(create.setCred(conn, "joe", "", "1"));
-    EXPECT_EQ(create.GetErrCode(), 401);
+    EXPECT_EQ(codeOf(create.setCred(conn, "joe", "", "1"), create), 401);
     EXPECT_EQ(log.count("ERR", "node_create", "setCred",
                         "Bad Parameter: conn[" + OvraDRCore::toString(conn.toJson()) +
                             "]/account[joe]/password"),
               1);
-    EXPECT_FALSE(create.setCred(conn, ""));
-    EXPECT_EQ(create.GetErrCode(), 401);
-    EXPECT_FALSE(create.setCred(""));
-    EXPECT_EQ(create.GetErrCode(), 401);
-    EXPECT_FALSE(create.setCred("no such"));
-    EXPECT_EQ(create.GetErrCode(), 516);
+    EXPECT_EQ(codeOf(create.setCred(conn, ""), create), 401);
+    EXPECT_EQ(codeOf(create.setCred(""), create), 401);
+    EXPECT_EQ(codeOf(create.setCred("no such"), create), 516);
     EXPECT_EQ(create.GetErrMsg().asString(), "no such");
-    EXPECT_FALSE(create.setCred(Conn::https("127.0.0.1", unusedPort()), "joe", "pw", ""));
-    EXPECT_EQ(create.GetErrCode(), 500);
+    const Conn dead = Conn::https("127.0.0.1", unusedPort());
+    EXPECT_EQ(codeOf(create.setCred(dead, "joe", "pw", ""), create), 500);
     EXPECT_FALSE(create.setConn(Conn()));
     EXPECT_EQ(create.GetErrMsg().asString(), "conn");
     EXPECT_FALSE(create.setSender(nullptr) || create.setCredSender(nullptr));
     EXPECT_EQ(create.GetErrCode(), 403);
-    EXPECT_FALSE(create.process());
-    EXPECT_EQ(create.GetErrCode(), 401);
+    EXPECT_EQ(codeOf(create.process(), create), 401);
     EXPECT_EQ(create.GetErrMsg().asString(), "account");
-}
-
-TEST_F(CredFlow, ALoginThatFailsLeavesAnObjectThatRefusesToGoOn) {
-    remote.answer("login", R"({"success":false,"error":{"code":404}})");
-    DRNodeCredCreate create;
-    EXPECT_FALSE(create.setCred(conn, "joe", "pw", "000000"));
-    EXPECT_EQ(create.GetErrCode(), 505);
-    EXPECT_FALSE(create.process());
-    EXPECT_EQ(create.GetErrCode(), 520);
-    EXPECT_FALSE(create.checkCredAccount());
-    EXPECT_EQ(create.GetErrCode(), 520);
-}
-
-TEST_F(CredFlow, ASessionWhoseAccountIsUnknownIsRefused) {
     for (const char *answer :
          {R"({"success":true,"data":{}})", R"({"success":true,"data":{"account":""}})",
           R"({"success":false,"error":{"code":119}})"}) {
         remote.answer("get", answer);
-        DRNodeCredCreate create;
-        EXPECT_FALSE(create.setCred(conn, "caller's"));
-        EXPECT_EQ(create.GetErrCode(), 528) << answer;
+        EXPECT_EQ(codeOf(create.setCred(conn, "caller's"), create), 528) << answer;
     }
+    remote.answer("login", R"({"success":false,"error":{"code":404}})");
+    DRNodeCredCreate loggedOut;
+    EXPECT_EQ(codeOf(loggedOut.setCred(conn, "joe", "pw", "000000"), loggedOut), 505);
+    EXPECT_EQ(codeOf(loggedOut.process(), loggedOut), 520);
+    EXPECT_EQ(codeOf(loggedOut.checkCredAccount(), loggedOut), 520);
 }

@@ -12,11 +12,10 @@ namespace {
 
 class CredDeletion : public CredFlow {
 protected:
-    void SetUp() override {
-        CredFlow::SetUp();
-        addCred("node_cred", "n1", "c1", "https", remote.port(), "shared");
-        addCred("node_cred", "n1", "c2", "https", remote.port(), "shared");
-        addCred("node_cred", "n1", "c3", "https", remote.port(), "own");
+    CredDeletion() {
+        addNodeCred("c1", "shared");
+        addNodeCred("c2", "shared");
+        addNodeCred("c3", "own");
         addCred("temp_cred", "n1", "t1", "https", remote.port(), "own");
     }
     bool remove(const std::string &credId) {
@@ -58,13 +57,6 @@ TEST_F(CredDeletion, TheRowGoesFirstAndStaysGoneWhateverTheRemoteSays) {
     EXPECT_EQ(rows("node_cred"), "");
 }
 
-TEST_F(CredDeletion, ADeadSessionNeedsNoRelease) {
-    remote.answer("own test_privilege", R"({"success":false,"error":{"code":119}})");
-    EXPECT_TRUE(remove("c3"));
-    EXPECT_EQ(sent("own delete"), 0);
-    EXPECT_EQ(log.count("session has been invalid, no need to delete"), 1);
-}
-
 TEST_F(CredDeletion, TheNodeInformationIsRefreshedAndGoesWithTheLastCredential) {
     executeSql("DELETE FROM temp_cred");
     remove("c1");
@@ -98,28 +90,27 @@ TEST_F(CredDeletion, ATemporaryOneGoesInTheSameWay) {
     EXPECT_FALSE(TempCredDelete("").process());
     executeSql("DROP TABLE temp_cred");
     EXPECT_FALSE(TempCredDelete("t1").process());
-    executeSql("DROP TABLE node_cred");
-    EXPECT_EQ(CredUtils::GetSessionUsedCount("own"), -1);
-    EXPECT_EQ(CredUtils::GetSessionUsedCount(""), -1);
 }
 
-TEST_F(CredDeletion, AnUnknownCredentialIsNoErrorAndAnUnreadableDatabaseIs) {
+TEST_F(CredDeletion, WhatIsUnknownOrDeadNeedsNoReleaseAndWhatCannotBeReadGetsNone) {
     EXPECT_TRUE(remove("c9"));
     EXPECT_EQ(log.count("WARN", "node_delete", "process", "Failed to get cred[c9] from db"), 1);
     EXPECT_EQ(log.count("Invalid session to notify remote delete"), 1);
     EXPECT_FALSE(remove(""));
+    EXPECT_TRUE(CredUtils::TestSessionValid(conn, "own"));
+    EXPECT_FALSE(CredUtils::TestSessionValid(conn, "") ||
+                 CredUtils::TestSessionValid(Conn(), "own") ||
+                 CredUtils::NotifyRemoteNodeDeleteSessionIfNotUsed(Conn(), "own"));
+    remote.answer("own test_privilege", R"({"success":false,"error":{"code":119}})");
+    EXPECT_TRUE(remove("c3"));
+    EXPECT_EQ(log.count("session has been invalid, no need to delete"), 1);
+    EXPECT_EQ(sent("own delete"), 0);
+    remote.forgetAnswers();
     executeSql("DROP TABLE node_cred");
     EXPECT_FALSE(remove("c1"));
-    EXPECT_EQ(remote.calls(), "");
-}
-
-TEST_F(CredDeletion, TheTestOfASession) {
-    EXPECT_TRUE(CredUtils::TestSessionValid(conn, "own"));
-    EXPECT_FALSE(CredUtils::TestSessionValid(conn, ""));
-    EXPECT_FALSE(CredUtils::TestSessionValid(Conn(), "own"));
-    EXPECT_FALSE(CredUtils::NotifyRemoteNodeDeleteSessionIfNotUsed(Conn(), "own"));
-    executeSql("DROP TABLE node_cred");
     EXPECT_FALSE(CredUtils::NotifyRemoteNodeDeleteSessionIfNotUsed(conn, "own"))
         << "what cannot be counted is not released";
-    EXPECT_EQ(sent("own delete"), 0);
+    EXPECT_EQ(CredUtils::GetSessionUsedCount("own"), -1);
+    EXPECT_EQ(CredUtils::GetSessionUsedCount(""), -1);
+    EXPECT_EQ(remote.calls(), "");
 }

@@ -20,10 +20,10 @@ protected:
     void arrange() {
         std::filesystem::remove_all("/tmp/.ovradrcache");
         executeSql("DELETE FROM node_cred; DELETE FROM temp_cred");
-        addCred("node_cred", "n1", "c1", "https", remote.port(), "canary-old");
+        addNodeCred("c1", "canary-old");
         addCred("temp_cred", "n1", "t1", "https", remote.port(), "canary-temp");
         remote.forgetAnswers();
-        SetUpAnswers();
+        arrangeAnswers();
         arrangeWayBack();
         remote.answer("login", R"({"success":true,"data":{"sid":"canary-sid"}})");
         remote.answer("create", R"({"success":true,"data":{"session":"canary-new",)"

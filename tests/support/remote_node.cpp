@@ -5,6 +5,8 @@
 
 #include <unistd.h>
 
+#include <algorithm>
+
 namespace OvraTest {
 
 RemoteNode::RemoteNode()
@@ -81,6 +83,11 @@ std::string RemoteNode::calls() const {
         all += (all.empty() ? "" : ", ") + call;
     }
     return all;
+}
+
+long RemoteNode::count(const std::string &call) const {
+    const std::lock_guard<std::mutex> lock(guard_);
+    return std::count(calls_.begin(), calls_.end(), call);
 }
 
 void RemoteNode::forgetCalls() {

@@ -30,6 +30,8 @@ public:
     void die();
     /// "session method" of each call so far, joined by ", ".
     std::string calls() const;
+    /// How many of them are `call`.
+    long count(const std::string &call) const;
     void forgetCalls();
     /// The parameters of the last call of `method`, as JSON text; "" if there was none.
     std::string params(const std::string &method) const;

@@ -1,177 +1,62 @@
 // SPDX-License-Identifier: Apache-2.0
 
-// The handling of every error number of the credential library, with a test double that fails on
+// The handling of every error number of the credential library, with its stand-in that fails on
 // demand: the real library cannot be made to return them all.
 
-#include "clock.h"
-#include "support/local_node.h"
-#include "support/log_capture.h"
+#include "support/node_fixture.h"
+#include "support/vendor/stand_in.h"
 #include "transport/conn_cache.h"
 #include "transport/node_valid_cred_cache.h"
 
-#include <ovracredential/cred_request.h>
-#include <ovradrcore/json.h>
-#include <ovradrnode/node_api.h>
-#include <ovradrnode/sender.h>
-
-#include <gtest/gtest.h>
-
 #include <ctime>
-#include <set>
-
-struct _tag_ovra_cred_ {};
-struct _tag_ovra_cred_sess_ {};
-
-namespace {
-
-/// The double's next behaviour.
-struct Script {
-    std::set<std::string> fail; ///< steps that fail
-    int error = 0;
-    int allocated = 0;
-    int sent = 0;
-    int probed = 0;
-    int lookedUp = 0;
-    std::int64_t now = 1'000'000'000'000; ///< every failed request takes 10 seconds
-    long timeout = 0;
-    int encryptMode = 0;
-    std::string upload;
-};
-Script script;
-
-int ok(const char *step) {
-    return script.fail.count(step) == 0 ? 1 : 0;
-}
-
-} // namespace
-
-OVRACred *OVRACredAlloc() {
-    if (ok("alloc") == 0) {
-        return nullptr;
-    }
-    ++script.allocated;
-    return new _tag_ovra_cred_;
-}
-void OVRACredFree(OVRACred *cred) {
-    --script.allocated;
-    delete cred;
-}
-OVRACredSess *OVRACredSessAlloc() {
-    if (ok("alloc sess") == 0) {
-        return nullptr;
-    }
-    ++script.allocated;
-    return new _tag_ovra_cred_sess_;
-}
-void OVRACredSessFree(OVRACredSess *sess) {
-    --script.allocated;
-    delete sess;
-}
-int OVRACredItemSetProtocol(OVRACred *, const char *) {
-    return 1 - ok("protocol");
-}
-int OVRACredItemSetHost(OVRACred *, const char *) {
-    return 1 - ok("host");
-}
-int OVRACredItemSetPort(OVRACred *, int) {
-    return 1 - ok("port");
-}
-int OVRACredItemSetRemoteAccount(OVRACred *, const char *) {
-    return 1 - ok("account");
-}
-int OVRACredItemSetRemotePasswd(OVRACred *, const char *) {
-    return 1 - ok("passwd");
-}
-int OVRACredSessItemSetAccessToken(OVRACredSess *, const char *) {
-    return 1 - ok("token");
-}
-
-namespace OVRA {
-struct CredRequest::Impl {};
-CredRequest::CredRequest() = default;
-CredRequest::~CredRequest() = default;
-int CredRequest::SetURL(const std::string &, const std::string &, int, const std::string &) {
-    return ok("url");
-}
-int CredRequest::SetDefaultTimeout(long seconds) {
-    EXPECT_EQ(seconds, 10) << "only probes set it";
-    return ok("timeout");
-}
-int CredRequest::SetResponseTimeout(long seconds) {
-    script.timeout = seconds;
-    return 1;
-}
-int CredRequest::SetEncryptMode(int mode) {
-    script.encryptMode = mode;
-    return 1;
-}
-int CredRequest::SetUploadFile(const std::string &path, const std::string &name) {
-    script.upload = path + " as " + name;
-    return 1;
-}
-int CredRequest::CreateWebAPIRequest(CredRequest &, OVRACred *, OVRACredSess *, const std::string &,
-                                     int, const std::string &, const Json::Value &) {
-    return ok("create");
-}
-int CredRequest::Process(bool reuse, int mode) {
-    EXPECT_TRUE(reuse);
-    ++(mode == 2 ? script.probed : script.sent);
-    const int done = mode == 2 ? ok("probe") : ok("process");
-    script.now += done == 0 ? 10'000 : 0;
-    return done;
-}
-std::string CredRequest::GetResponse() const {
-    return R"({"success":true})";
-}
-int CredRequest::GetError() const {
-    return script.error;
-}
-int CredRequestUtil::LoginWithOTP(OVRACred *, const std::string &, OVRACredSess *,
-                                  Json::Value *out) {
-    (*out)["success"] = ok("login answer") != 0;
-    return ok("login");
-}
-int CredRequestUtil::Logout(OVRACred *, OVRACredSess *) {
-    return 1;
-}
-int CredRequestFarlink::GetConnInfo(const std::string &alias, Json::Value &info, const void *) {
-    ++script.lookedUp;
-    info["host"] = alias + ".relay";
-    info["protocol"] = "https";
-    info["port"] = 6001;
-    return 0; // the answer counts, not this
-}
-} // namespace OVRA
 
 using namespace OvraDRNode;
 using namespace OvraTest;
+using OvraVendor::credentialLibrary;
 
 namespace {
 
-class CredError : public testing::Test {
+class CredError : public LocalNode {
 protected:
-    void SetUp() override {
-        script = Script();
+    CredError() {
+        remote.sessions = {"s"};
+        remote.answer = [](const auto &) { return OvraPlatform::apiSuccess(); };
+        credentialLibrary.fault = [this](const std::string &operation) {
+            ++asked[operation];
+            const bool fails = failing.count(operation) != 0;
+            now += fails && (operation == "Process" || operation == "probe") ? 10'000 : 0;
+            return fails ? std::optional(error) : std::nullopt;
+        };
         ConnCache(conn).UpdateWithData(true);
     }
-    int send(std::set<std::string> fail, int error = 0) {
-        script.fail = std::move(fail);
-        script.error = error;
+    ~CredError() override {
+        EXPECT_EQ(credentialLibrary.credentials + credentialLibrary.sessions, 0);
+    }
+    void fail(const std::set<std::string> &operations, int number = 0) {
+        failing = operations;
+        error = number;
+        asked.clear();
+    }
+    int send(const std::set<std::string> &operations, int number = 0) {
+        fail(operations, number);
         CredSessionSender sender(conn, "s");
-        (void)sender.process(WebAPI::getDRNodeInfoAPI({})); // the code is what is looked at
+        (void)sender.process(info); // the code is what is looked at
         message = sender.GetErrMsg();
         return sender.GetErrCode();
     }
-    int logIn(std::set<std::string> fail) {
-        script.fail = std::move(fail);
-        CredAccountSender sender(conn, "joe", "pw", "");
+    int logIn(const std::set<std::string> &operations, const std::string &password = "pw") {
+        fail(operations);
+        CredAccountSender sender(conn, "joe", password, "");
         (void)sender.init(); // the code is what is looked at
         return sender.GetErrCode();
     }
 
     Conn conn = Conn::https("h", 5001);
+    OvraVendor::Remote &remote = credentialLibrary.remotes["https://h:5001"];
+    std::set<std::string> failing;
+    int error = 0;
+    std::map<std::string, int> asked;
     Json::Value message;
-    LogCapture log;
 };
 
 } // namespace
@@ -184,12 +69,17 @@ TEST_F(CredError, LibraryNumbersBecomeCodesAndOnlyLostConnectionsMarkTheEndpoint
         const char *message;
         bool marked;
     } cases[] = {
-        {"process", 4, 525, "null", false}, {"process", 6, 526, "null", false},
-        {"process", 5, 500, "null", true},  {"process", 10, 500, "null", true},
-        {"process", 1, 524, "1", false},    {"process", 99, 524, "99", false},
-        {"process", 2, 524, "2", false},    {"process", 15, 524, "15", false},
-        {"process", 0, 0, "null", false},   {"create", 7, 524, "7", false},
-        {"create", 5, 500, "null", true},
+        {"Process", 4, 525, "null", false},
+        {"Process", 6, 526, "null", false},
+        {"Process", 5, 500, "null", true},
+        {"Process", 10, 500, "null", true},
+        {"Process", 1, 524, "1", false},
+        {"Process", 99, 524, "99", false},
+        {"Process", 2, 524, "2", false},
+        {"Process", 15, 524, "15", false},
+        {"Process", 0, 0, "null", false},
+        {"CreateWebAPIRequest", 7, 524, "7", false},
+        {"CreateWebAPIRequest", 5, 500, "null", true},
     };
     for (const auto &each : cases) {
         ConnCache(conn).UpdateWithData(true);
@@ -201,24 +91,23 @@ TEST_F(CredError, LibraryNumbersBecomeCodesAndOnlyLostConnectionsMarkTheEndpoint
         EXPECT_EQ(log.count("cred error [" + std::to_string(each.number) + "]"),
                   each.number == 0 ? 0 : 1);
     }
-    EXPECT_EQ(script.allocated, 0) << "every handle was freed";
 }
 
 TEST_F(CredError, EveryStepBeforeSendingHasItsCode) {
-    EXPECT_EQ(send({"alloc"}), 402);
-    EXPECT_EQ(send({"alloc sess"}), 402);
-    for (const char *item : {"protocol", "host", "port", "token"}) {
+    EXPECT_EQ(send({"OVRACredAlloc"}), 402);
+    EXPECT_EQ(send({"OVRACredSessAlloc"}), 402);
+    for (const char *item : {"OVRACredItemSetProtocol", "OVRACredItemSetHost",
+                             "OVRACredItemSetPort", "OVRACredSessItemSetAccessToken"}) {
         EXPECT_EQ(send({item}), 506) << item;
     }
-    EXPECT_EQ(logIn({"account"}), 506);
-    EXPECT_EQ(logIn({"passwd"}), 506);
+    EXPECT_EQ(logIn({"OVRACredItemSetRemoteAccount"}), 506);
+    EXPECT_EQ(logIn({"OVRACredItemSetRemotePasswd"}), 506);
     EXPECT_EQ(log.count("ERR", "sender", "initCred",
                         "Failed to set the credential infomation of host [joe]"),
               2);
-    EXPECT_EQ(logIn({"login", "login answer"}), 501) << "the mapped answer replaces 523";
-    EXPECT_EQ(logIn({"login"}), 523) << "it stays when the answer is a success";
-    EXPECT_EQ(script.sent, 0);
-    EXPECT_EQ(script.allocated, 0);
+    EXPECT_EQ(logIn({"LoginWithOTP"}, "no"), 501) << "the mapped answer replaces 523";
+    EXPECT_EQ(logIn({"LoginWithOTP"}), 523) << "it stays when the answer is a success";
+    EXPECT_TRUE(remote.calls.empty());
 }
 
 TEST_F(CredError, TheRequestSaysHowItTravels) {
@@ -227,18 +116,20 @@ TEST_F(CredError, TheRequestSaysHowItTravels) {
     request.setResponseTimeout(17);
     request.setUpload("/a", "b");
     EXPECT_TRUE(CredSessionSender(conn, "s").process(request).isSuccess());
-    EXPECT_EQ(script.encryptMode, 2);
-    EXPECT_EQ(script.timeout, 17);
-    EXPECT_EQ(script.upload, "/a as b");
-    script = Script();
     request.setEncryptRequired(false);
     request.setUpload("/a", "");
     EXPECT_TRUE(CredSessionSender(conn, "s").process(request).isSuccess());
-    EXPECT_EQ(script.encryptMode, 0);
-    EXPECT_EQ(script.upload, "") << "both or neither";
+    ASSERT_EQ(remote.calls.size(), 2U);
+    EXPECT_TRUE(remote.calls[0].reused && remote.calls[0].sealed && !remote.calls[1].sealed);
+    EXPECT_EQ(remote.calls[0].timeout, 17);
+    EXPECT_EQ(remote.calls[0].uploads, std::vector<std::string>{"/a as b"});
+    EXPECT_TRUE(remote.calls[1].uploads.empty()) << "both or neither";
 }
 
 TEST_F(CredError, ARelayEndpointIsResolvedBeforeUse) {
+    fail({"GetConnInfo"}); // the answer counts, not this
+    credentialLibrary.relay["alias"] = Conn::https("alias.relay", 6001).toJson();
+    credentialLibrary.relay["alias"]["host"] = "alias.relay";
     CredSessionSender sender(Conn::farlink("alias"), "s");
     EXPECT_TRUE(sender.getConn() == Conn::https("alias.relay", 6001));
     EXPECT_FALSE(sender.setConn(Conn()));
@@ -251,10 +142,9 @@ TEST_F(CredError, AProbeThatSaysNothingOfTheEndpointLeavesTheVerdictOfARefresh) 
         const char *step;
         int number;
         bool kept; ///< also by a probe that was asked for
-    } cases[] = {{"url", 1, false}, {"timeout", 1, false}, {"probe", 2, true}};
+    } cases[] = {{"SetURL", 1, false}, {"SetDefaultTimeout", 1, false}, {"probe", 2, true}};
     for (const auto &each : cases) {
-        script.fail = {each.step};
-        script.error = each.number;
+        fail({each.step}, each.number);
         const std::time_t old = std::time(nullptr) - 100;
         ConnCache(conn).UpdateWithData(true, old, old);
         EXPECT_TRUE(BaseSender::GetCachedConnectable(conn)) << each.step;
@@ -262,11 +152,8 @@ TEST_F(CredError, AProbeThatSaysNothingOfTheEndpointLeavesTheVerdictOfARefresh) 
         EXPECT_FALSE(BaseSender::IsConnectable(conn)) << each.step;
         EXPECT_EQ(ConnCache(conn).getStoredVerdict(), each.kept) << each.step;
     }
-    for (const std::string step : {"url", "timeout"}) {
-        EXPECT_EQ(log.count("ERR", "sender", "IsConnectableWithErrCheck",
-                            "Failed to set " + step + " of conn [" + text + "]"),
-                  2);
-    }
+    EXPECT_EQ(log.count("Failed to set url of conn [" + text + "]"), 2);
+    EXPECT_EQ(log.count("Failed to set timeout of conn [" + text + "]"), 2);
     EXPECT_EQ(log.count("Failed to check connectable of conn[" + text + "]"), 2);
 }
 
@@ -279,31 +166,31 @@ TEST_F(CredError, OneRequestAsksASilentEndpointOnceHoweverManyCredentialsItHas) 
         int code;
     } cases[] = {
         {"probe", 10, 2, 0, 500},
-        {"process", 10, 2, 2, 500},
-        {"process", 15, 2, 2, 524}, // the request may have arrived: 500 would deny it
+        {"Process", 10, 2, 2, 500},
+        {"Process", 15, 2, 2, 524}, // the request may have arrived: 500 would deny it
     };
-    OvraDRCore::setSystemClock([] { return script.now; });
-    provisionNode();
+    stopClock();
     for (int i = 0; i < 6; ++i) {
+        const int port = 5001 + i;
+        credentialLibrary.remotes["https://127.0.0.1:" + std::to_string(port)] = remote;
         addCred("temp_cred", "n1", "t" + std::to_string(i), "https", 5001 + i % 2, "s");
     }
     for (const auto &each : cases) {
-        script = Script{{each.step}, each.number};
+        fail({each.step}, each.number);
         NodeValidCredCache("n1").UpdateWithData("t0");
         NodeSender sender("n1");
-        EXPECT_FALSE(sender.process(WebAPI::getDRNodeInfoAPI({})).isValid());
-        EXPECT_EQ(script.probed, each.probed) << each.step << each.number;
-        EXPECT_EQ(script.sent, each.sent) << each.step << each.number;
+        EXPECT_FALSE(sender.process(info).isValid());
+        EXPECT_EQ(asked["probe"], each.probed) << each.step << each.number;
+        EXPECT_EQ(asked["Process"], each.sent) << each.step << each.number;
         EXPECT_EQ(sender.GetErrCode(), each.code) << each.step << each.number;
         executeSql("UPDATE temp_cred SET port = port + 2");
     }
     const Conn relayed("127.0.0.1", "flk", 443);
     addCred("node_cred", "n2", "c9", "flk", 443, "s");
     ConnCache(relayed).UpdateWithData(false);
-    script = Script{{}, 0, 0, 0, 0, 0, script.now};
+    fail({});
     CredNodeSender sender("c9");
-    EXPECT_FALSE(sender.process(WebAPI::getDRNodeInfoAPI({})).isValid());
+    EXPECT_FALSE(sender.process(info).isValid());
     EXPECT_EQ(sender.GetErrMsg(), relayed.toJson());
-    EXPECT_EQ(script.lookedUp, 0) << "the relay service is not asked where a dead alias is";
-    OvraDRCore::setSystemClock(nullptr);
+    EXPECT_EQ(asked["GetConnInfo"], 0) << "the relay service is not asked where a dead alias is";
 }

@@ -1,24 +1,15 @@
 // SPDX-License-Identifier: Apache-2.0
-#include "clock.h"
-#include "support/local_node.h"
-#include "support/remote_node.h"
+#include "support/node_fixture.h"
 #include "transport/conn_cache.h"
 #include "transport/node_valid_cred_cache.h"
 
-#include <ovradrcore/json.h>
 #include <ovradrnode/cred_permission_cache.h>
-#include <ovradrnode/node_api.h>
 #include <ovradrnode/node_candidates.h>
-#include <ovradrnode/sender.h>
-
-#include <gtest/gtest.h>
 
 using namespace OvraDRNode;
 using namespace OvraTest;
 
 namespace {
-
-std::int64_t now = 0;
 
 std::string textOf(const std::vector<NodeCandidate> &candidates) {
     std::string text;
@@ -31,10 +22,12 @@ std::string textOf(const std::vector<NodeCandidate> &candidates) {
     return text;
 }
 
+using NodeCandidates = TwoNodes;
+
 } // namespace
 
-TEST(NodeCandidates, AreListedAsTheSenderThenTriesThem) {
-    OvraDRCore::setSystemClock([] { return now; });
+TEST_F(NodeCandidates, AreListedAsTheSenderThenTriesThem) {
+    stopClock();
     const struct {
         const char *what;
         const char *remembered;
@@ -45,23 +38,22 @@ TEST(NodeCandidates, AreListedAsTheSenderThenTriesThem) {
         const char *listed;
         const char *used; // the session of the request
     } cases[] = {
-        {"nothing is known", "", 9, "", "", 9, "c1 next, c2 later, t1 later", "secret-c1"},
-        {"remembered", "c2", 1, "", "", 9, "c2 next*, c1 later, t1 later", "secret-c2"},
-        {"temporary", "t1", 9, "", "", 9, "t1 next*, c1 later, c2 later", "secret-t1"},
-        {"dead", "c1", 1, "", "c1", 1, "c1 unreachable*, c2 next, t1 later", "secret-c2"},
-        {"dead and stale", "c1", 9, "", "c1", 1, "c2 next, c1 unreachable*, t1 later", "secret-c2"},
+        {"nothing is known", "", 9, "", "", 9, "c1 next, c2 later, t1 later", "secret-c1 info"},
+        {"remembered", "c2", 1, "", "", 9, "c2 next*, c1 later, t1 later", "secret-c2 info"},
+        {"temporary", "t1", 9, "", "", 9, "t1 next*, c1 later, c2 later", "secret-t1 info"},
+        {"dead", "c1", 1, "", "c1", 1, "c1 unreachable*, c2 next, t1 later", "secret-c2 info"},
+        {"dead and stale", "c1", 9, "", "c1", 1, "c2 next, c1 unreachable*, t1 later",
+         "secret-c2 info"},
         {"right is lost, but it is too early to ask", "c1", 1, "c1", "", 1,
-         "c1 next*, c2 later, t1 later", "secret-c1"},
-        {"right is lost", "c1", 9, "c1", "", 1, "c2 next, c1 later*, t1 later", "secret-c2"},
+         "c1 next*, c2 later, t1 later", "secret-c1 info"},
+        {"right is lost", "c1", 9, "c1", "", 1, "c2 next, c1 later*, t1 later", "secret-c2 info"},
         {"old verdicts count for nothing", "c1", 9, "c1", "c1", 7, "c1 next*, c2 later, t1 later",
-         "secret-c1"},
+         "secret-c1 info"},
     };
-    provisionNode();
-    RemoteNode live;
     RemoteNode other; // the endpoint of c1
     for (const char *id : {"c1", "c2", "t1"}) {
         addCred(*id == 't' ? "temp_cred" : "node_cred", "n1", id, "https",
-                (std::string(id) == "c1" ? other : live).port(), std::string("secret-") + id);
+                (std::string(id) == "c1" ? other : remote).port(), std::string("secret-") + id);
     }
     for (const auto &each : cases) {
         now += 1'000'000'000;
@@ -74,19 +66,16 @@ TEST(NodeCandidates, AreListedAsTheSenderThenTriesThem) {
         for (const char *id : {"c1", "c2", "t1"}) {
             store(CredPermissionCache(id), std::string(id) != each.refused, each.verdictAge);
         }
-        store(ConnCache(Conn::https("127.0.0.1", live.port())), true, each.verdictAge);
+        store(ConnCache(conn), true, each.verdictAge);
         store(ConnCache(Conn::https("127.0.0.1", other.port())), *each.dead == '\0',
               each.verdictAge);
-        live.forgetCalls();
+        remote.forgetCalls();
         other.forgetCalls();
         EXPECT_EQ(textOf(listNodeCandidates("n1")), each.listed) << each.what;
-        EXPECT_EQ(live.calls() + other.calls(), "") << each.what << ": nothing is sent";
-        EXPECT_TRUE(NodeSender("n1").process(WebAPI::getDRNodeInfoAPI({})).isSuccess());
-        EXPECT_NE((live.calls() + other.calls()).find(std::string(each.used) + " info"),
-                  std::string::npos)
-            << each.what << ": " << live.calls() << ", " << other.calls();
+        EXPECT_EQ(remote.calls() + other.calls(), "") << each.what << ": nothing is sent";
+        EXPECT_TRUE(NodeSender("n1").process(info).isSuccess());
+        EXPECT_EQ(remote.count(each.used) + other.count(each.used), 1) << each.what;
     }
-    OvraDRCore::setSystemClock(nullptr);
     EXPECT_TRUE(listNodeCandidates("n9").empty());
     EXPECT_TRUE(listNodeCandidates(DRNode::getLocalNodeId()).empty());
 }

@@ -1,53 +1,30 @@
 // SPDX-License-Identifier: Apache-2.0
-#include "clock.h"
-#include "support/local_node.h"
-#include "support/log_capture.h"
-#include "support/remote_node.h"
+#include "support/node_fixture.h"
+#include "support/other_process.h"
 #include "transport/conn_cache.h"
 
-#include <ovradrcore/json.h>
-#include <ovradrnode/sender.h>
-#include <ovraplatform/api_errors.h>
-#include <ovraplatform/api_registry.h>
-
-#include <gtest/gtest.h>
-#include <sys/wait.h>
-#include <unistd.h>
-
 #include <chrono>
+#include <deque>
 
 using namespace OvraDRNode;
 using namespace OvraTest;
 
 namespace {
 
-std::int64_t fakeNow = 0;
-
-void setClock(std::int64_t milliseconds) {
-    fakeNow = milliseconds;
-    OvraDRCore::setSystemClock([] { return fakeNow; });
-}
-
 std::string text(const Conn &conn) {
     return OvraDRCore::toString(conn.toJson());
 }
 
-class Probe : public testing::Test {
-protected:
-    void TearDown() override { OvraDRCore::setSystemClock(nullptr); }
-    RemoteNode remote;
-    Conn conn = Conn::https("127.0.0.1", remote.port());
-    LogCapture log;
-};
+using Probe = TwoNodes;
 
 } // namespace
 
 TEST_F(Probe, TheVerdictIsKeptForItsLifetimeAndThenAskedAgain) {
-    setClock(1'000'000'000'000);
+    stopClock();
     EXPECT_TRUE(BaseSender::GetCachedConnectable(conn));
     EXPECT_TRUE(BaseSender::GetCachedConnectable(conn));
     EXPECT_EQ(remote.calls(), "probe");
-    setClock(fakeNow + 5001);
+    now += 5001;
     EXPECT_TRUE(BaseSender::GetCachedConnectable(conn));
     EXPECT_EQ(remote.calls(), "probe, probe");
     EXPECT_EQ(log.count("Update conn cache"), 0) << "the verdict never changed";
@@ -86,17 +63,13 @@ TEST_F(Probe, AHostThatSaysNothingAfterTheHandshakeCostsTheProbesTimeOutOnce) {
 }
 
 TEST_F(Probe, ManyProcessesThatAskAtOnceSendOneProbe) {
+    std::deque<OtherProcess> processes;
     for (int i = 0; i < 20; ++i) {
-        if (fork() == 0) {
-            _exit(BaseSender::GetCachedConnectable(conn) ? 0 : 1);
-        }
+        processes.emplace_back([this] { return BaseSender::GetCachedConnectable(conn) ? 0 : 1; });
     }
-    int good = 0;
-    int status = 0;
-    while (wait(&status) > 0) {
-        good += status == 0 ? 1 : 0;
+    for (OtherProcess &process : processes) {
+        EXPECT_EQ(process.wait(), 0);
     }
-    EXPECT_EQ(good, 20);
     EXPECT_EQ(remote.calls(), "probe");
 }
 
@@ -110,19 +83,14 @@ TEST_F(Probe, AStoredValueThatIsNoVerdictReadsAsConnectableAndIsAskedAgain) {
               R"({"conn":)" + text(conn) + R"(,"name":"conn cache"})");
 }
 
-TEST(LocalRun, ReachesTheHandlerAsTheAdministratorAndWrapsWhatItSays) {
-    OvraPlatform::APIRegistry registry;
-    registry.add("A", 1, "m", OvraPlatform::APIRight::kAdministrator,
-                 OvraPlatform::APIQueue::kQuick,
-                 [](const Json::Value &params, const OvraPlatform::APICaller &caller) {
-                     EXPECT_EQ(caller.user, "admin");
-                     return OvraPlatform::apiError(777, params["x"]);
-                 });
-    registry.host();
+TEST_F(Probe, ARequestOnThisApplianceIsTheAdministratorsAndItsErrorIsPassedOn) {
+    host("A", "m", [](const Json::Value &params, const OvraPlatform::APICaller &caller) {
+        EXPECT_EQ(caller.user, "admin");
+        return OvraPlatform::apiError(777, params["x"]);
+    });
     OvraDRCore::Request request("A", 1, "m", Json::Value());
     request.addParam("x", "why");
     const OvraDRCore::Response response = BaseSender::run(request);
-    EXPECT_TRUE(response.isValid());
     EXPECT_EQ(response.getErrCode(), 777);
     EXPECT_EQ(response.getErrMsg().asString(), "why");
 }

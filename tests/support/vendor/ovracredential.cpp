@@ -39,10 +39,23 @@ Json::Value refusal(int code) {
     return document;
 }
 
+/// \param error  receives the number, if the operation has to fail
+bool fails(const char *operation, int *error = nullptr) {
+    const auto &fault = credentialLibrary.fault;
+    const std::optional<int> number = fault ? fault(operation) : std::nullopt;
+    if (number && error != nullptr) {
+        *error = *number;
+    }
+    return number.has_value();
+}
+
 } // namespace
 
 extern "C" {
 OVRACred *OVRACredAlloc() {
+    if (fails(__func__)) {
+        return nullptr;
+    }
     ++credentialLibrary.credentials;
     return new OVRACred;
 }
@@ -51,6 +64,9 @@ void OVRACredFree(OVRACred *cred) {
     delete cred;
 }
 OVRACredSess *OVRACredSessAlloc() {
+    if (fails(__func__)) {
+        return nullptr;
+    }
     ++credentialLibrary.sessions;
     return new OVRACredSess;
 }
@@ -59,23 +75,23 @@ void OVRACredSessFree(OVRACredSess *sess) {
     delete sess;
 }
 int OVRACredItemSetProtocol(OVRACred *cred, const char *protocol) {
-    return (cred->protocol = protocol).empty() ? -1 : 0;
+    return fails(__func__) || (cred->protocol = protocol).empty() ? -1 : 0;
 }
 int OVRACredItemSetHost(OVRACred *cred, const char *host) {
-    return (cred->host = host).empty() ? -1 : 0;
+    return fails(__func__) || (cred->host = host).empty() ? -1 : 0;
 }
 int OVRACredItemSetPort(OVRACred *cred, int port) {
     cred->port = port;
-    return 0;
+    return fails(__func__) ? -1 : 0;
 }
 int OVRACredItemSetRemoteAccount(OVRACred *cred, const char *account) {
-    return (cred->account = account).empty() ? -1 : 0;
+    return fails(__func__) || (cred->account = account).empty() ? -1 : 0;
 }
 int OVRACredItemSetRemotePasswd(OVRACred *cred, const char *passwd) {
-    return (cred->password = passwd).empty() ? -1 : 0;
+    return fails(__func__) || (cred->password = passwd).empty() ? -1 : 0;
 }
 int OVRACredSessItemSetAccessToken(OVRACredSess *sess, const char *token) {
-    return (sess->token = token).empty() ? -1 : 0;
+    return fails(__func__) || (sess->token = token).empty() ? -1 : 0;
 }
 }
 
@@ -85,6 +101,7 @@ struct CredRequest::Impl {
     Remote *remote = nullptr; ///< null: cannot be reached
     Call call;
     std::string response;
+    int error = 0;
 };
 
 CredRequest::CredRequest()
@@ -99,14 +116,15 @@ CredRequest::~CredRequest() {
 int CredRequest::SetURL(const std::string &protocol, const std::string &address, int port,
                         const std::string &path) {
     impl_->remote = findRemote({protocol, address, "", "", port});
-    return path == "webapi/query.cgi" ? 1 : 0;
+    return fails(__func__) || path != "webapi/query.cgi" ? 0 : 1;
 }
 
 int CredRequest::SetDefaultTimeout(long seconds) {
-    return seconds > 0 ? 1 : 0;
+    return !fails(__func__) && seconds > 0 ? 1 : 0;
 }
 
 int CredRequest::SetResponseTimeout(long seconds) {
+    impl_->call.timeout = seconds;
     return seconds > 0 ? 1 : 0;
 }
 
@@ -115,8 +133,9 @@ int CredRequest::SetEncryptMode(int mode) {
     return 1;
 }
 
-int CredRequest::SetUploadFile(const std::string & /*path*/, const std::string & /*name*/) {
-    return 0;
+int CredRequest::SetUploadFile(const std::string &path, const std::string &name) {
+    impl_->call.uploads.push_back(path + " as " + name);
+    return 1;
 }
 
 int CredRequest::CreateWebAPIRequest(CredRequest &req, OVRACred *cred, OVRACredSess *sess,
@@ -124,11 +143,16 @@ int CredRequest::CreateWebAPIRequest(CredRequest &req, OVRACred *cred, OVRACredS
                                      const Json::Value &params) {
     req.impl_->remote = findRemote(*cred);
     req.impl_->call = {sess != nullptr ? sess->token : "", api, method, version, params};
-    return 1;
+    return fails(__func__, &req.impl_->error) ? 0 : 1;
 }
 
-int CredRequest::Process(bool /*reuse*/, int mode) {
+int CredRequest::Process(bool reuse, int mode) {
     Remote *const remote = impl_->remote;
+    impl_->error = remote != nullptr ? 0 : kCannotConnect;
+    if (fails(mode == 2 ? "probe" : __func__, &impl_->error)) {
+        return 0;
+    }
+    impl_->call.reused = reuse;
     if (remote != nullptr && mode != 2) {
         remote->calls.push_back(impl_->call);
         const bool known = remote->sessions.count(impl_->call.session) == 1;
@@ -143,22 +167,23 @@ std::string CredRequest::GetResponse() const {
 }
 
 int CredRequest::GetError() const {
-    return impl_->remote != nullptr ? 0 : kCannotConnect;
+    return impl_->error;
 }
 
 int CredRequestUtil::LoginWithOTP(OVRACred *cred, const std::string &otp, OVRACredSess *sess,
                                   Json::Value *out) {
     Remote *const remote = findRemote(*cred);
+    const int done = fails(__func__) || remote == nullptr ? 0 : 1;
     if (remote == nullptr || cred->account + "/" + cred->password + "/" + otp != remote->login) {
         *out = refusal(remote != nullptr ? remote->refusal : 100);
-        return remote != nullptr ? 1 : 0;
+        return done;
     }
     sess->token = "login-" + std::to_string(++remote->logins);
     remote->sessions.insert(sess->token);
     *out = Json::Value();
     (*out)["success"] = true;
     (*out)["data"]["sid"] = sess->token;
-    return 1;
+    return done;
 }
 
 int CredRequestUtil::Logout(OVRACred *cred, OVRACredSess *sess) {
@@ -171,12 +196,13 @@ int CredRequestUtil::Logout(OVRACred *cred, OVRACredSess *sess) {
 
 int CredRequestFarlink::GetConnInfo(const std::string &alias, Json::Value &info,
                                     const void * /*options*/) {
+    const int done = fails(__func__) ? 0 : 1;
     const auto found = credentialLibrary.relay.find(alias);
     if (found == credentialLibrary.relay.end()) {
         return 0;
     }
     info = found->second;
-    return 1;
+    return done;
 }
 
 } // namespace OVRA

@@ -26,6 +26,9 @@ struct Call {
     int version = 0;
     Json::Value params;
     bool sealed = false;
+    bool reused = false;                ///< may go over a connection that was left open
+    long timeout = 0;                   ///< seconds
+    std::vector<std::string> uploads{}; ///< "path as name"
 };
 
 /// A remote appliance, behind one endpoint.
@@ -45,6 +48,9 @@ struct CredentialLibrary {
     std::map<std::string, Remote> remotes;           ///< by "protocol://host:port"
     std::map<std::string, Json::Value> relay;        ///< what the relay service says of an alias
     int credentials = 0, sessions = 0, requests = 0; ///< that are alive
+    /// Asked at each operation, by its name ("probe" for the Process() of one): the error number
+    /// with which it fails, if it does.
+    std::function<std::optional<int>(const std::string &operation)> fault;
 };
 inline OVRA_VENDOR_EXPORT CredentialLibrary credentialLibrary;
 
