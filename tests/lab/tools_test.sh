@@ -20,15 +20,12 @@ layersRefuseWhatIsAbovePrivateOrASibling() {
     put apps/one/only_one.h '"service/http_server.h"'
     put apps/service/http_server.h '<ovraplatform/trust.h>'
     put apps/shared/session.h '<ovradrnode/sender.h>'
-    exitCodeOf "$root/tools/check-layers" "$scratch"
-    same "front doors and ways down: $output" "$code" 0
+    ends "front doors and ways down" 0 "" "$root/tools/check-layers" "$scratch"
 
     local file include reason
     while read -r file include reason; do
         put "$file" "$include"
-        exitCodeOf "$root/tools/check-layers" "$scratch"
-        same "$file includes $include" "$code" 1
-        holds "$file includes $include" "$output" "$file:1:"
+        ends "$file includes $include" 1 "$file:1:" "$root/tools/check-layers" "$scratch"
         holds "$file includes $include" "$output" "$reason"
         rm "$scratch/$file"
     done <<-'END'
@@ -70,15 +67,20 @@ buildLibrary() {
     g++ -shared -fPIC -fvisibility-inlines-hidden -o "$scratch/libovradr$1.so" "$scratch/$1.cpp"
 }
 
-exportsRefuseAForeignName() {
+exportsAreTheDeclaredNamesNoMoreAndNoLess() {
     makeLibraries
-    exitCodeOf "$scratch/tools/check-exports" "$scratch"
-    same "only names of their own: $output" "$code" 0
+    ends "only names of their own" 0 "" "$scratch/tools/check-exports" "$scratch"
     echo 'int helper() { return 3; }' >>"$scratch/core.cpp"
     buildLibrary core
-    exitCodeOf "$scratch/tools/check-exports" "$scratch"
-    same "a helper that got out" "$code" 1
-    holds "a helper that got out" "$output" helper
+    ends "a helper that got out" 1 helper "$scratch/tools/check-exports" "$scratch"
+    echo 'namespace OvraDRNode { struct __attribute__((visibility("hidden"))) B { virtual ~B(); }; }' >>"$scratch/include/node.h"
+    echo 'OvraDRNode::B::~B() {}' >>"$scratch/node.cpp"
+    buildLibrary node
+    echo 'extern int OVRACount; namespace OVRA { inline int g() { return 1; } int h(); }' >>"$scratch/platform/include/platform.h"
+    ends "a class that is hidden" 1 'vtable for OvraDRNode::B' "$scratch/tools/check-exports" "$scratch"
+    holds "a function that nobody defines" "$output" 'OVRA::h()'
+    holds "a variable that nobody defines" "$output" OVRACount
+    [[ $output != *'g()'* ]] || broken "a function that needs no library: $output"
 }
 
 scenesNameTheLineThatFailed() {
@@ -86,31 +88,13 @@ scenesNameTheLineThatFailed() {
     while read -r library head; do
         # It fails in line 3, which line 4 calls.
         printf '%s\n' "set -euo pipefail; . '$root/$library'" 'helper() {' '"$@"; }' 'scene() { helper "$@"; }' 'scene "$@"' >"$scratch/scene.sh"
-        exitCodeOf bash "$scratch/scene.sh" "$head" "this is wrong"
-        same "exit code of $head" "$code" 1
-        holds "an expectation" "$output" "scene.sh:3: FAILED: this is wrong"
+        ends "$head" 1 "scene.sh:3: FAILED: this is wrong" bash "$scratch/scene.sh" "$head" "this is wrong"
         holds "who asked for it" "$output" "scene.sh:4: called from here"
-        exitCodeOf bash "$scratch/scene.sh" grep -q this /dev/null
-        same "exit code of a command" "$code" 1
-        holds "a command that failed" "$output" "scene.sh:3: FAILED: exit code 1 of: "
+        ends "a command that failed" 1 "scene.sh:3: FAILED: exit code 1 of: " bash "$scratch/scene.sh" grep -q this /dev/null
     done <<-'END'
 	tests/lab/expect.sh broken
 	lab/lib/play.sh fail
 	END
-}
-
-exportsMissNothingThatIsDeclared() {
-    makeLibraries
-    echo 'namespace OvraDRNode { struct __attribute__((visibility("hidden"))) B { virtual ~B(); }; }' >>"$scratch/include/node.h"
-    echo 'OvraDRNode::B::~B() {}' >>"$scratch/node.cpp"
-    buildLibrary node
-    echo 'extern int OVRACount; namespace OVRA { inline int g() { return 1; } int h(); }' >>"$scratch/platform/include/platform.h"
-    exitCodeOf "$scratch/tools/check-exports" "$scratch"
-    same "hidden and undefined names" "$code" 1
-    holds "a class that is hidden" "$output" 'vtable for OvraDRNode::B'
-    holds "a function that nobody defines" "$output" 'OVRA::h()'
-    holds "a variable that nobody defines" "$output" OVRACount
-    [[ $output != *'g()'* ]] || broken "a function that needs no library: $output"
 }
 
 checkFacts() { missed "$1" "$2" "$3" "$root/tools/check-facts" "$scratch"; }
@@ -118,8 +102,7 @@ checkFacts() { missed "$1" "$2" "$3" "$root/tools/check-facts" "$scratch"; }
 # Removes one fact after another from a copy of the checkout.
 factsAreMissedWhereTheyAreForgotten() {
     "$root/tools/sources" all | tar -C "$root" --null -T - -c | tar -C "$scratch" -x
-    exitCodeOf "$root/tools/check-facts" "$scratch"
-    same "the checkout as it is: $output" "$code" 0
+    ends "the checkout as it is" 0 "" "$root/tools/check-facts" "$scratch"
 
     local errors=core/include/ovradrcore/err_recorder.h
     checkFacts 'failure.cpp: no ErrorEntry for code 599' "$errors" 's/kFailed = 407/kNew = 599, &/'
@@ -141,7 +124,7 @@ factsAreMissedWhereTheyAreForgotten() {
     checkFacts 'docs/ovradrd.md: no fact about a node: timezone' docs/ovradrd.md 's/known: `timezone`/known: zone/'
     checkFacts 'no request for the fact hostname' src/cache/node_cache.cpp 's/API({Word::kTimeZone/API({Word::kHostName, Word::kTimeZone/'
     checkFacts 'no row for getDRNodeInfoAPI' tests/api/node_api_test.cpp '/BUILT_BY(getDRNodeInfoAPI,/d'
-    checkFacts 'no row for `OVRA.DR.Node` 1 `stat`' tests/api/node_api_test.cpp 's/test_privilege 1"/stat 1"/'
+    checkFacts 'no row for `OVRA.DR.Node` 1 `stat`' tests/api/node_api_test.cpp 's/Node test_privilege 1/Node stat 1/'
     checkFacts 'docs/wire.md: no row for the method release' docs/wire.md '/^| `release`/d'
     checkFacts 'names `ovradr set up`' apps/ovradrd/main.cpp 's/`ovradr setup`/`ovradr set up`/'
     checkFacts 'does not name conn_test.cpp' tests/model/CMakeLists.txt 's/ conn_test.cpp//'
