@@ -11,6 +11,7 @@
 #include <csignal>
 #include <set>
 #include <thread>
+#include <tuple>
 
 namespace OvradrTest {
 
@@ -299,6 +300,21 @@ TEST(PendingRelease, NotesAreOneForEachSessionAndCredentialAndBounded) {
     EXPECT_FALSE(store.note(note)) << store.error();
     EXPECT_TRUE(store.note(other)) << "a known one";
     EXPECT_TRUE(store.forget(other.reference()) && store.note(note)) << "there is room again";
+}
+
+TEST_F(Life, NotesOfAnOlderVersionStayDue) {
+    std::ignore = PendingReleases().note({"s", {}, "n1", "c1"});
+    OvraTest::RawSqlite file(OvraApps::kPendingReleasesFile);
+    ASSERT_TRUE(
+        file.run("CREATE TABLE o (reference TEXT PRIMARY KEY, session, addr, protocol, port,"
+                 " node_id, cred_id, noted, attempts, next_try, code) WITHOUT ROWID;"
+                 "INSERT INTO o SELECT * FROM release; DROP TABLE release;"
+                 "ALTER TABLE o RENAME TO release; PRAGMA user_version = 1;"
+                 "CREATE INDEX release_next_try ON release (next_try)"));
+    ASSERT_EQ(pending().size(), 1U);
+    EXPECT_EQ(pending()[0].credId, "c1");
+    EXPECT_TRUE(PendingReleases().note({"s", {}, "n1", "c2"})) << "a second one of the session";
+    EXPECT_EQ(pending().size(), 2U);
 }
 
 TEST(SessionLock, KeepsFlowsWithOneNodeApartAndNoOthers) {
