@@ -48,7 +48,9 @@ public:
     void clearSender();
     [[nodiscard]] bool setCredAccount(const std::string &newAccount);
 
-    /// Authenticates by a login. `otp` may be empty.
+    /// Authenticates by a login. `otp` may be empty. A failed setCred() of any form leaves no
+    /// sender, so that nothing goes on with that of an earlier one; with bad parameters (401) it
+    /// changes nothing.
     [[nodiscard]] bool setCred(const Conn &conn, const std::string &newAccount,
                                const std::string &password, const std::string &otp);
     /// Authenticates by a session that the remote node granted before.
@@ -82,6 +84,7 @@ public:
     const DRNode &getNode() const { return node; }
 
 private:
+    [[nodiscard]] bool completes(bool done);
     [[nodiscard]] bool createFor(const char *function);
 
     DRNode node;

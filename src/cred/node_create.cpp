@@ -108,6 +108,13 @@ bool CredCreate::setCredAccount(const std::string &newAccount) {
     return true;
 }
 
+bool CredCreate::completes(bool done) {
+    if (!done) {
+        clearSender();
+    }
+    return done;
+}
+
 bool CredCreate::setCred(const Conn &conn, const std::string &newAccount,
                          const std::string &password, const std::string &otp) {
     if (!conn.isValid() || newAccount.empty() || password.empty()) {
@@ -116,8 +123,8 @@ bool CredCreate::setCred(const Conn &conn, const std::string &newAccount,
         SetErr(ERR::kBadParameter);
         return false;
     }
-    return setConn(conn) && setCredAccount(newAccount) &&
-           setCredSender(new CredAccountSender(conn, newAccount, password, otp));
+    return completes(setConn(conn) && setCredAccount(newAccount) &&
+                     setCredSender(new CredAccountSender(conn, newAccount, password, otp)));
 }
 
 bool CredCreate::setCred(const Conn &conn, const std::string &session) {
@@ -127,8 +134,9 @@ bool CredCreate::setCred(const Conn &conn, const std::string &session) {
         return false;
     }
     std::string foundAccount;
-    return setConn(conn) && setCredSender(new CredSessionSender(conn, session)) &&
-           queryCredAccountBySession(session, foundAccount) && setCredAccount(foundAccount);
+    return completes(setConn(conn) && setCredSender(new CredSessionSender(conn, session)) &&
+                     queryCredAccountBySession(session, foundAccount) &&
+                     setCredAccount(foundAccount));
 }
 
 bool CredCreate::setCred(const std::string &credId) {
@@ -144,8 +152,9 @@ bool CredCreate::setCred(const std::string &credId) {
         return false;
     }
     std::string foundAccount;
-    return setConn(record.conn) && setSender(new CredNodeSender(record)) &&
-           queryCredAccountBySession(record.session, foundAccount) && setCredAccount(foundAccount);
+    return completes(setConn(record.conn) && setSender(new CredNodeSender(record)) &&
+                     queryCredAccountBySession(record.session, foundAccount) &&
+                     setCredAccount(foundAccount));
 }
 
 bool CredCreate::checkParameter() const {

@@ -156,6 +156,8 @@ TEST_F(CredFlow, SetUpRefusesWhatCannotWork) {
           R"({"success":false,"error":{"code":119}})"}) {
         remote.answer("get", answer);
         EXPECT_EQ(codeOf(create.setCred(conn, "caller's"), create), 528) << answer;
+        EXPECT_TRUE(create.setCredAccount("joe"));
+        EXPECT_EQ(codeOf(create.process(), create), 520) << "with the session of a failed set-up";
     }
     remote.answer("login", R"({"success":false,"error":{"code":404}})");
     DRNodeCredCreate loggedOut;
