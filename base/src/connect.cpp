@@ -10,6 +10,7 @@
 #include <cerrno>
 #include <csignal>
 #include <cstring>
+#include <exception>
 #include <future>
 #include <iterator>
 #include <memory>
@@ -192,9 +193,16 @@ Expected<std::vector<SocketAddress>> resolveHost(const std::string &host, int po
     if (const auto numeric = parseAddress(host, port)) {
         return Addresses{*numeric};
     }
-    std::packaged_task<Expected<Addresses>()> task([host, port] { return lookUp(host, port); });
-    std::future<Expected<Addresses>> found = task.get_future();
-    if (const int error = startQuietly(std::move(task)); error != 0) {
+    std::promise<Expected<Addresses>> answer;
+    std::future<Expected<Addresses>> found = answer.get_future();
+    const int error = startQuietly([host, port, answer = std::move(answer)]() mutable {
+        try {
+            answer.set_value(lookUp(host, port));
+        } catch (const std::exception &) {
+            answer.set_exception(std::current_exception());
+        }
+    });
+    if (error != 0) {
         return systemError(error);
     }
     if (found.wait_until(deadline) != std::future_status::ready) {
