@@ -62,6 +62,13 @@ Expected<Addresses> lookUp(const std::string &host, int port) {
     return found;
 }
 
+/// Whether connect(2) has no address of ours to come from. It gives the same errno if the local
+/// ports of TCP are used up; those of UDP are others. Nothing is sent.
+bool lacksLocalAddress(const SocketAddress &peer) {
+    const UniqueFd fd(socket(peer.storage.ss_family, SOCK_DGRAM | SOCK_CLOEXEC, 0));
+    return fd && connect(fd.get(), peer.get(), peer.size) != 0 && errno == EADDRNOTAVAIL;
+}
+
 /// Starts a thread that the signals of the process do not reach. \return 0, or the errno
 template <typename Task>
 int startQuietly(Task task) {
@@ -135,7 +142,8 @@ private:
             running_.push_back({std::move(fd), address});
             nextStart_ = Clock::now() + kAttemptDelay;
         } else {
-            fail(errno);
+            const int error = errno;
+            fail(error == EADDRNOTAVAIL && lacksLocalAddress(address) ? ENETUNREACH : error);
         }
         return std::nullopt;
     }
@@ -177,7 +185,7 @@ private:
     Deadline deadline_;
     Clock::time_point nextStart_ = Clock::time_point::min();
     std::vector<Connection> running_;
-    int lastError_ = EADDRNOTAVAIL;
+    int lastError_ = ENETUNREACH;
     int shortage_ = 0;
 };
 
@@ -185,7 +193,7 @@ private:
 
 bool isShortage(int number) {
     return number == EMFILE || number == ENFILE || number == ENOMEM || number == ENOBUFS ||
-           number == EAGAIN;
+           number == EAGAIN || number == EADDRNOTAVAIL;
 }
 
 Expected<std::vector<SocketAddress>> resolveHost(const std::string &host, int port,
