@@ -11,6 +11,7 @@
 
 #include <json/value.h>
 
+#include <cstdint>
 #include <string>
 
 struct _tag_ovra_cred_;
@@ -97,6 +98,7 @@ protected:
 private:
     class CallTexts;
 
+    void SetCredRequestError(OVRA::CredRequest &request, std::int64_t begun) const;
     void freeHandles();
     [[nodiscard]] OvraDRCore::Response send(const OvraDRCore::Request &request, CallTexts &texts,
                                             const char *function) const;

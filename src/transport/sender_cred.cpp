@@ -132,6 +132,12 @@ void BaseCredSender::clear() {
 }
 
 void BaseCredSender::SetCredRequestError(OVRA::CredRequest &request) const {
+    SetCredRequestError(request, OvraDRCore::Cache::Now());
+}
+
+/// \param begun  when the attempt began (Cache::Now()): a process that was stopped in it has old
+/// news
+void BaseCredSender::SetCredRequestError(OVRA::CredRequest &request, std::int64_t begun) const {
     const int error = request.GetError();
     if (error == 0) {
         return;
@@ -150,7 +156,7 @@ void BaseCredSender::SetCredRequestError(OVRA::CredRequest &request) const {
         RequestScope::noteUnreachable(conn);
         const ConnCache cache(conn);
         cache.logChange(__func__, cache.getStoredVerdict(), false);
-        cache.UpdateWithData(false);
+        cache.UpdateWithFinding(false, begun);
         return;
     }
     case LibraryError::kUnanswered:
@@ -211,8 +217,9 @@ Response BaseCredSender::send(const Request &request, CallTexts &texts,
         credRequest.SetUploadFile(request.getUploadPath(), request.getUploadName());
     }
     const OvraDRCore::ReplyHandOver replyHandOver; // the credential library parses the reply first
+    const std::int64_t begun = OvraDRCore::Cache::Now();
     if (credRequest.Process(true, kSend) == 0) {
-        SetCredRequestError(credRequest);
+        SetCredRequestError(credRequest, begun);
         OVRA_LOG_IN(LogLevel::kNotice, function, "Failed to process cred request [%s]",
                     texts.request());
         return response;
