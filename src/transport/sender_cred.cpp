@@ -41,8 +41,8 @@ int loginError(int remoteCode) {
     return listed ? ERR::kLoginFailed + (remoteCode - kFirstLoginCode) : ERR::kLoginFailed;
 }
 
-/// Hands a text to the credential library, unless it would be cut at a NUL. \return whether it took
-/// it
+/// Hands a text to the credential library, unless it would be cut at a NUL.
+/// \return whether it was taken
 template <typename Object>
 bool setItem(int (*set)(Object *, const char *), Object *object, const std::string &item) {
     return item.find('\0') == std::string::npos && set(object, item.c_str()) == 0;
@@ -135,8 +135,7 @@ void BaseCredSender::SetCredRequestError(OVRA::CredRequest &request) const {
     SetCredRequestError(request, OvraDRCore::Cache::Now());
 }
 
-/// \param begun  when the attempt began (Cache::Now()): a process that was stopped in it has old
-/// news
+/// \param begun  when the attempt began, Cache::Now(): who was stopped in it has old news
 void BaseCredSender::SetCredRequestError(OVRA::CredRequest &request, std::int64_t begun) const {
     const int error = request.GetError();
     if (error == 0) {
