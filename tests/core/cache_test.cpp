@@ -12,6 +12,7 @@
 #include <linux/filter.h>
 #include <linux/seccomp.h>
 #include <spawn.h>
+#include <sys/file.h>
 #include <sys/prctl.h>
 #include <sys/stat.h>
 #include <sys/syscall.h>
@@ -403,6 +404,23 @@ TEST_F(CacheTest, ARefreshThatHangsHoldsOthersUpOnceAndNotForLong) {
     }
     EXPECT_EQ(log.count("Waited too long"), 2);
     released.set_value();
+}
+
+TEST_F(CacheTest, AWriterThatHangsHoldsOthersUpOnce) {
+    TestCache("a").UpdateWithData("old");
+    OvraTest::OtherProcess stopped([] {
+        const int fd = open(kPath, O_RDWR);
+        return flock(fd, LOCK_EX) == 0 && std::raise(SIGSTOP) == 0 ? 0 : 1;
+    });
+    waitpid(stopped.pid(), nullptr, WUNTRACED);
+    EXPECT_EQ(text(TestCache("a").Read()), "\"old\"") << "readers need no lock";
+    EXPECT_TRUE(TestCache("a").UpdateWithData("new"));
+    const auto start = std::chrono::steady_clock::now();
+    EXPECT_TRUE(TestCache("b").UpdateWithData("next"));
+    EXPECT_LT(std::chrono::steady_clock::now() - start, 1500ms);
+    EXPECT_EQ(text(TestCache("a").GetCachedData()), "\"new\"");
+    stopped.end(SIGCONT);
+    EXPECT_EQ(text(TestCache("b").GetCachedData()), "\"next\"");
 }
 
 TEST_F(CacheTest, ARefreshThatDiesIsTakenOverAtOnceThoughItsChildrenLive) {

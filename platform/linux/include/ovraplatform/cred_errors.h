@@ -13,7 +13,7 @@ namespace OvraPlatform {
 enum class CredError : int {
     kNone = 0,
     kBadArgument = 1,        ///< an unusable endpoint, path or call
-    kOutOfMemory = 2,        ///< this process has no memory, descriptor or thread left
+    kOutOfMemory = 2,        ///< no memory, descriptor, thread or local port is left here
     kInternal = 3,           ///< a failure without a number of its own
     kNoPermission = 4,       ///< HTTP status 401 or 403
     kCannotConnect = 5,      ///< no such name, refused, unreachable, or no TLS on that port
