@@ -1,12 +1,14 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "output.h"
 
+#include <ovrabase/expected.h>
 #include <ovradrcore/json.h>
 
 #include <json/writer.h>
 
 #include <algorithm>
 #include <array>
+#include <cerrno>
 #include <charconv>
 #include <clocale>
 #include <cstdio>
@@ -24,23 +26,19 @@ constexpr std::size_t kGap = 2;
 class UnicodeScope {
 public:
     UnicodeScope()
-        : locale_(newlocale(LC_CTYPE_MASK, "C.UTF-8", nullptr)) {
-        if (locale_ != nullptr) {
-            before_ = uselocale(locale_);
-        }
-    }
+        : before_(uselocale(unicode())) {} // without it, uselocale(nullptr) changes nothing
     UnicodeScope(const UnicodeScope &) = delete;
     UnicodeScope &operator=(const UnicodeScope &) = delete;
-    ~UnicodeScope() {
-        if (locale_ != nullptr) {
-            uselocale(before_);
-            freelocale(locale_);
-        }
-    }
+    ~UnicodeScope() { uselocale(before_); }
 
 private:
-    locale_t locale_;
-    locale_t before_ = nullptr;
+    /// Never freed: every cell of a table needs it, and to make it reads files.
+    static locale_t unicode() {
+        static const locale_t locale = newlocale(LC_CTYPE_MASK, "C.UTF-8", nullptr);
+        return locale;
+    }
+
+    locale_t before_;
 };
 
 /// One character of a text; `size` 1 and no character for a byte that is no UTF-8.
@@ -232,7 +230,15 @@ ExitCode tell(const Outcome &outcome, bool json) {
                        (failure.hint.empty() ? "" : printable(failure.hint) + "\n"),
                    stderr);
     }
-    return told || exit != ExitCode::kOk ? exit : ExitCode::kFailed;
+    if (told || exit != ExitCode::kOk) {
+        return exit;
+    }
+    if (errno != EPIPE) { // whoever closed a pipe has read enough
+        put("ovradr: The output could not be written: " + OvraBase::errnoText(errno) +
+                ".\nMake room, or write it elsewhere.\n",
+            stderr);
+    }
+    return ExitCode::kFailed;
 }
 
 } // namespace Ovradr
