@@ -69,10 +69,16 @@ TEST(AliasRegistry, IsTheSameAfterARestartAndRefusesRubbish) {
     EXPECT_EQ(enrol(registry, "nas", "key2", 0), refused(Refusal::kTaken));
     EXPECT_EQ(enrol(registry, "new", "key2", 0), 6002);
 
-    std::ofstream(kFile) << "rubbish";
-    const auto refusedFile = AliasRegistry(kFile, kLimits).load();
-    ASSERT_FALSE(refusedFile);
-    EXPECT_NE(refusedFile.error().text.find(kFile), std::string::npos);
+    // Half a list would free the other aliases, for somebody else to take.
+    for (const char *damaged : {"rubbish", "farlink-aliases-2 6000\n", "farlink-aliases-1 6000 1\n",
+                                "farlink-aliases-1 6000\nnas x 9 key1\nnew 6002 9 key2\n",
+                                "farlink-aliases-1 6000\nnas 6000 9\nnew 6002 9 key2\n",
+                                "farlink-aliases-1 6000\nN 6000 9 key1\n"}) {
+        std::ofstream(kFile) << damaged;
+        const auto refusedFile = AliasRegistry(kFile, kLimits).load();
+        ASSERT_FALSE(refusedFile) << damaged;
+        EXPECT_NE(refusedFile.error().text.find(kFile), std::string::npos);
+    }
     std::filesystem::remove(kFile);
     std::filesystem::create_directory(kFile);
     EXPECT_EQ(enrol(registry, "more", "key3", 0), refused(Refusal::kNotStored));
