@@ -3,6 +3,7 @@
 
 #include "session_owner.h"
 
+#include <ovrabase/address.h>
 #include <ovrabase/secret.h>
 #include <ovradrcore/json.h>
 #include <ovradrcore/log.h>
@@ -97,18 +98,21 @@ void CallDispatcher::serve(OvraService::HttpRequest request,
                            const OvraService::HttpServer::Answer &answer) {
     // std::function must be copyable.
     const auto held = std::make_shared<OvraService::HttpRequest>(std::move(request));
-    const bool taken = queues_.quick.submit([this, held, answer] {
+    const auto process = [this, held, answer] {
         Call call;
         call.secure = held->secure;
         call.caller.address = held->address;
         call.answer = answer;
         open(call, held->body);
-    });
-    if (!taken) {
+    };
+    const auto leave = [this, held, answer] {
         OvraBase::wipe(held->body);
         Call call;
         call.answer = answer;
         refuse(call);
+    };
+    if (!queues_.quick.submit(OvraBase::clientKey(held->address), process, leave)) {
+        leave();
     }
 }
 
@@ -192,8 +196,10 @@ void CallDispatcher::route(Call call) {
         return;
     }
     const auto held = std::make_shared<Call>(std::move(call));
-    if (!queues_.of(queue).submit([this, held] { run(*held); })) {
-        refuse(*held);
+    const auto leave = [this, held] { refuse(*held); };
+    if (!queues_.of(queue).submit(
+            OvraBase::clientKey(held->caller.address), [this, held] { run(*held); }, leave)) {
+        leave();
     }
 }
 
@@ -205,9 +211,14 @@ void CallDispatcher::login(Call call) {
                                                  "address failed: wait a minute"));
         return;
     }
-    if (!queues_.login.submit([this, held] { run(*held); }, *wait)) {
+    const auto leave = [this, held] {
         loginApi_.withdraw(held->wire.params, held->caller.address);
         refuse(*held);
+    };
+    if (!queues_.login.submit(
+            OvraBase::clientKey(held->caller.address), [this, held] { run(*held); }, leave,
+            *wait)) {
+        leave();
     }
 }
 
@@ -236,15 +247,15 @@ Json::Value CallDispatcher::serveLocal(const OvraPlatform::LocalCall &call) {
     caller.user = call.user;
     caller.administrator = true;
     caller.local = true;
-    const bool taken =
-        queues_.of(registry_.queue(call)).submit([this, call, caller, promise = promise] {
-            // Without a client the session library would note one in the environment, which threads
-            // must not change.
-            const OvraPlatform::ClientScope scope(kLoopback);
-            promise->set_value(registry_.dispatch(call, caller));
-        });
-    if (!taken) {
-        return busy();
+    const auto run = [this, call, caller, promise] {
+        // Without a client the session library would note one in the environment, which threads
+        // must not change.
+        const OvraPlatform::ClientScope scope(kLoopback);
+        promise->set_value(registry_.dispatch(call, caller));
+    };
+    const auto leave = [promise] { promise->set_value(busy()); };
+    if (!queues_.of(registry_.queue(call)).submit("", run, leave)) {
+        leave();
     }
     while (reply.wait_for(kLocalPause) != std::future_status::ready) {
         if (leaving_) {

@@ -20,12 +20,12 @@ namespace Ovradrd {
 /// The queues that calls run in.
 struct WorkQueues {
     OvraService::WorkQueue quick{
-        4, 512}; ///< reads calls, and runs those that answer from this machine alone
-    OvraService::WorkQueue outbound{16, 64};
-    OvraService::WorkQueue twoWay{16, 64};
-    OvraService::WorkQueue relay{8, 64};
+        4, {1024, 512}}; ///< reads calls, and runs those that answer from this machine alone
+    OvraService::WorkQueue outbound{16, {128, 64}};
+    OvraService::WorkQueue twoWay{16, {128, 64}};
+    OvraService::WorkQueue relay{8, {128, 64}};
     OvraService::WorkQueue login{
-        2, 64}; ///< log-ins: each hashes a password, with 64 MiB and a tenth of a second
+        2, {512, 64}}; ///< log-ins: each hashes a password, with 64 MiB and a tenth of a second
 
     OvraService::WorkQueue &of(OvraPlatform::APIQueue queue);
 };

@@ -140,18 +140,19 @@ TEST(FullQueues, RefuseAtOnceAndDoNotHoldUpTheLowerOnes) {
     std::optional<Ovradrd::CallDispatcher> dispatcher;
     Ovradrd::WorkQueues queues;
     dispatcher.emplace(registry, keys, guard, api, queues);
-    const auto serve = [&](const std::string &method) {
-        dispatcher->serve({"api=Test&version=1&method=" + method, "127.0.0.1", true},
-                          [&](const std::string &document) {
-                              ++replies.at(json(document)["error"]["code"].asInt());
-                          });
+    const auto serve = [&](const std::string &method, int client = 1) {
+        dispatcher->serve(
+            {"api=Test&version=1&method=" + method, "127.0.0." + std::to_string(client), true},
+            [&](const std::string &document) {
+                ++replies.at(json(document)["error"]["code"].asInt());
+            });
     };
     int places = 0;
     int refused = 0;
     for (const auto &[method, queue, threads] : rows) {
         places += threads;
         for (int i = 0; i < threads; ++i) {
-            serve(method);
+            serve(method, 2 + i);
         }
         EXPECT_TRUE(soon([&] { return inside == places; })) << method;
         for (int i = 0; i < 64 + 5; ++i) {
