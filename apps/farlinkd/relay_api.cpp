@@ -128,20 +128,26 @@ void RelayApi::handle(OvraService::HttpRequest &request, const Answer &answer) {
     const auto reply = [&answer](const Json::Value &document) {
         answer(OvraDRCore::toString(document));
     };
-    const auto call = OvraPlatform::decodeForm(request.body);
+    auto call = OvraPlatform::decodeForm(request.body);
     if (!call) {
         return reply(apiError(APIError::kBadRequest, call.error()));
     }
     if (call->api != OvraPlatform::kFarlinkApi || call->version != 1) {
         return reply(apiError(APIError::kNoSuchAPI, "this is a relay service: it has no such API"));
     }
-    const Json::Value params =
-        call->params.isObject() ? call->params : Json::Value(Json::objectValue);
     std::unique_lock lock(mutex_);
     if (!calls_.allow(request.address, Clock::now())) {
         return reply(
             apiError(APIError::kTooBusy, "too many calls from this address: wait a minute"));
     }
+    lock.unlock();
+    if (const auto fault = OvraPlatform::parseParams(*call);
+        fault != OvraDRCore::JsonFault::kNone) {
+        return reply(apiError(APIError::kBadRequest,
+                              std::string("a parameter ") + OvraDRCore::describe(fault)));
+    }
+    const Json::Value &params = call->params;
+    lock.lock();
     if (!OvraPlatform::isFarlinkAlias(memberString(params, "alias"))) {
         return reply(badAlias());
     }
