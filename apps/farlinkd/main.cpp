@@ -43,6 +43,7 @@ using OvraService::TlsIdentity;
 constexpr unsigned long kDescriptors = 16384;
 constexpr int kMaxAliases = 4000; // what fits into the file of aliases, with room to spare
 constexpr timespec kTick{1, 0};
+constexpr int kTicksOfMemory = 20; // between two times at which freed memory is returned
 
 struct Options {
     std::string address;
@@ -94,14 +95,18 @@ Expected<TlsIdentity> identityIn(const Options &options) {
 }
 
 void waitForEnd(const sigset_t &signals, RelayApi &api) {
-    while (sigtimedwait(&signals, nullptr, &kTick) < 0) {
+    for (int tick = 1; sigtimedwait(&signals, nullptr, &kTick) < 0; ++tick) {
         api.endOverdue();
+        if (tick % kTicksOfMemory == 0) {
+            OvraService::returnFreedMemory();
+        }
     }
 }
 
 int serve(const Options &options) {
     const sigset_t signals = OvraService::blockEndSignals();
     OvraService::raiseDescriptorLimit(kDescriptors);
+    OvraService::keepMemorySmall();
 
     const auto identity = identityIn(options);
     if (!identity) {
@@ -132,6 +137,7 @@ int serve(const Options &options) {
         {});
     OvraService::HttpLimits limits;
     limits.connections.total = 4096;
+    limits.body = limits.unjudged; // no call of the service is longer than a log-in
     HttpServer http(
         [&api](OvraService::HttpRequest request, const HttpServer::Answer &answer) {
             api.serve(std::move(request), answer);

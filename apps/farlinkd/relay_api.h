@@ -106,8 +106,8 @@ private:
     std::atomic<bool> dropping_ = false; ///< expired aliases; queued or in progress
     // Last, so that they are destroyed first: their jobs use everything above. One thread makes the
     // changes, which wait for the disk; nothing else does.
-    OvraService::WorkQueue changes_{1, 512};
-    OvraService::WorkQueue queue_{2, 512};
+    OvraService::WorkQueue changes_{1, {512, 64}};
+    OvraService::WorkQueue queue_{2, {1024, 512}};
 };
 
 } // namespace Farlinkd

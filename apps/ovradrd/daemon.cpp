@@ -188,7 +188,10 @@ tl::expected<void, StartError> Daemon::start() {
         [&self](HttpRequest request, const HttpServer::Answer &answer) {
             self.dispatcher->serve(std::move(request), answer);
         },
-        self.settings.limits, testFiles(self.settings.testFiles));
+        self.settings.limits, testFiles(self.settings.testFiles),
+        [&self](HttpRequest beginning, const HttpServer::Verdict &verdict) {
+            self.dispatcher->judge(std::move(beginning), verdict);
+        });
     if (const auto started = self.http->start(std::move(*https), std::move(*http), *self.identity);
         !started) {
         return failed(started.error());

@@ -64,12 +64,14 @@ void waitForEnd(Daemon &daemon, const sigset_t &signals) {
     const timespec period{kWorkPeriodSeconds, 0};
     while (sigtimedwait(&signals, nullptr, &period) < 0) {
         daemon.doPeriodicWork();
+        OvraService::returnFreedMemory();
     }
 }
 
 int serve() {
     const sigset_t signals = OvraService::blockEndSignals();
     OvraService::raiseDescriptorLimit(kDescriptors);
+    OvraService::keepMemorySmall();
 
     const auto settings = readSettings();
     if (!settings) {

@@ -40,6 +40,12 @@ int reportStartError(const char *program, const std::exception &why);
 /// lower limit is a warning in the log.
 void raiseDescriptorLimit(unsigned long count);
 
+/// Has the C library keep little of the memory that is freed. Call it before threads start.
+void keepMemorySmall();
+/// Gives all freed memory back to the system, which a large tree of small pieces otherwise leaves
+/// in the holes between what is still in use. Takes milliseconds: call it now and then.
+void returnFreedMemory();
+
 /// Blocks the signals that end a daemon (SIGTERM, SIGINT, SIGHUP) in this thread and those that it
 /// starts, so that one thread can wait for them, and ignores SIGPIPE. \return those signals
 sigset_t blockEndSignals();

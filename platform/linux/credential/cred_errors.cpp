@@ -22,7 +22,7 @@ const char *credErrorText(int error) {
         return "the endpoint's key is not the one trusted for it: find out why it changed, then "
                "forget the old one";
     case CredError::kReplyTooLarge:
-        return "the reply is too large";
+        return "the reply is too large: ask for less at once";
     case CredError::kReplyBroken:
         return "the reply is not one of a web API: check that the port is the appliance's";
     case CredError::kConnectionLost:

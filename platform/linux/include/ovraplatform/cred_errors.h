@@ -18,7 +18,7 @@ enum class CredError : int {
     kNoPermission = 4,       ///< HTTP status 401 or 403
     kCannotConnect = 5,      ///< no such name, refused, unreachable, or no TLS on that port
     kCertificateChanged = 6, ///< the endpoint's key is not the one trusted for it
-    kReplyTooLarge = 7,      ///< over 8 MiB
+    kReplyTooLarge = 7,      ///< over 8 MiB, or more JSON than OvraDRCore::JsonLimits
     kReplyBroken = 8,        ///< empty, not HTTP, or not a reply document
     kConnectionLost = 9,     ///< the connection ended before the reply was complete
     kTimedOut = 10,          ///< not done within the given time; nothing of the request was sent
