@@ -36,7 +36,7 @@ class CallDispatcher {
 public:
     /// Everything must outlive the dispatcher and the jobs in the queues.
     CallDispatcher(const OvraPlatform::APIRegistry &registry, const OvraPlatform::SealKeyPair &keys,
-                   OvraPlatform::ReplayGuard &guard, LoginApi &api, WorkQueues &queues);
+                   OvraPlatform::ReplayGuard &guard, WorkQueues &queues);
     CallDispatcher(const CallDispatcher &) = delete;
     CallDispatcher &operator=(const CallDispatcher &) = delete;
 
@@ -60,14 +60,12 @@ private:
     [[nodiscard]] bool unseal(Call &call);
     [[nodiscard]] bool admit(Call &call);
     void route(Call call);
-    void login(Call call);
     void refuse(const Call &call) const;
     void run(const Call &call) const;
 
     const OvraPlatform::APIRegistry &registry_;
     const OvraPlatform::SealKeyPair &keys_;
     OvraPlatform::ReplayGuard &guard_;
-    LoginApi &loginApi_;
     WorkQueues &queues_;
     std::atomic<bool> stopping_ = false;
     std::atomic<bool> leaving_ = false;
