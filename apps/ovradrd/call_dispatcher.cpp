@@ -88,11 +88,10 @@ struct CallDispatcher::Call {
 
 CallDispatcher::CallDispatcher(const OvraPlatform::APIRegistry &registry,
                                const OvraPlatform::SealKeyPair &keys,
-                               OvraPlatform::ReplayGuard &guard, LoginApi &api, WorkQueues &queues)
+                               OvraPlatform::ReplayGuard &guard, WorkQueues &queues)
     : registry_(registry)
     , keys_(keys)
     , guard_(guard)
-    , loginApi_(api)
     , queues_(queues) {}
 
 void CallDispatcher::serve(OvraService::HttpRequest request,
@@ -245,38 +244,16 @@ bool CallDispatcher::parse(Call &call) const {
 }
 
 void CallDispatcher::route(Call call) {
-    if (LoginApi::isLogin(call.wire)) {
-        login(std::move(call));
-        return;
-    }
-    const APIQueue queue = registry_.queue(call.wire);
-    if (queue == APIQueue::kQuick) {
+    OvraService::WorkQueue &queue =
+        LoginApi::isLogin(call.wire) ? queues_.login : queues_.of(registry_.queue(call.wire));
+    if (&queue == &queues_.quick) {
         run(call);
         return;
     }
     const auto held = std::make_shared<Call>(std::move(call));
     const auto leave = [this, held] { refuse(*held); };
-    if (!queues_.of(queue).submit(
+    if (!queue.submit(
             OvraBase::clientKey(held->caller.address), [this, held] { run(*held); }, leave)) {
-        leave();
-    }
-}
-
-void CallDispatcher::login(Call call) {
-    const auto held = std::make_shared<Call>(std::move(call));
-    const auto wait = loginApi_.admit(held->wire.params, held->caller.address);
-    if (!wait) {
-        held->reply(apiError(APIError::kTooBusy, "too many log-ins of this account or from this "
-                                                 "address failed: wait a minute"));
-        return;
-    }
-    const auto leave = [this, held] {
-        loginApi_.withdraw(held->wire.params, held->caller.address);
-        refuse(*held);
-    };
-    if (!queues_.login.submit(
-            OvraBase::clientKey(held->caller.address), [this, held] { run(*held); }, leave,
-            *wait)) {
         leave();
     }
 }

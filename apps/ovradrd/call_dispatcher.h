@@ -39,7 +39,7 @@ class CallDispatcher {
 public:
     /// Everything must outlive the dispatcher and the jobs in the queues.
     CallDispatcher(const OvraPlatform::APIRegistry &registry, const OvraPlatform::SealKeyPair &keys,
-                   OvraPlatform::ReplayGuard &guard, LoginApi &api, WorkQueues &queues);
+                   OvraPlatform::ReplayGuard &guard, WorkQueues &queues);
     CallDispatcher(const CallDispatcher &) = delete;
     CallDispatcher &operator=(const CallDispatcher &) = delete;
 
@@ -75,7 +75,6 @@ private:
     [[nodiscard]] bool admit(Call &call) const;
     [[nodiscard]] bool parse(Call &call) const;
     void route(Call call);
-    void login(Call call);
     void refuse(const Call &call) const;
     void run(const Call &call) const;
     static void note(const Call &call, const Json::Value &reply, Milliseconds time);
@@ -83,7 +82,6 @@ private:
     const OvraPlatform::APIRegistry &registry_;
     const OvraPlatform::SealKeyPair &keys_;
     OvraPlatform::ReplayGuard &guard_;
-    LoginApi &loginApi_;
     WorkQueues &queues_;
     std::atomic<bool> stopping_ = false;
     std::atomic<bool> leaving_ = false;

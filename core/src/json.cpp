@@ -16,9 +16,9 @@ namespace {
 constexpr const char *kMask = "***";
 
 /// Members whose values are login material, at any depth.
-constexpr std::array<std::string_view, 13> kSecretMembers = {
+constexpr std::array<std::string_view, 14> kSecretMembers = {
     "password", "passwd",       "otpcode", "otp_code",     "session",   "_sid",   "sid",
-    "token",    "access_token", "sealed",  "sealed_reply", "reply_key", "secret",
+    "token",    "access_token", "sealed",  "sealed_reply", "reply_key", "secret", "device_token",
 };
 
 bool isSecret(std::string_view name) {

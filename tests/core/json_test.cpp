@@ -132,7 +132,7 @@ TEST(JsonText, OfALogLineMasksLoginMaterialAtAnyDepthAndNothingElse) {
     Json::Value value;
     for (const char *secret :
          {"password", "passwd", "otpcode", "otp_code", "session", "_sid", "sid", "token",
-          "access_token", "sealed", "sealed_reply", "reply_key", "secret"}) {
+          "access_token", "sealed", "sealed_reply", "reply_key", "secret", "device_token"}) {
         const std::string open = R"({"l":[{"account":"joe",")"s + secret + "\":";
         ASSERT_TRUE(fromString(value, open + R"(["canary",2,null,{"n":1,"sid":"canary"}]}]})"));
         EXPECT_EQ(toLogString(value), toString(maskSecrets(value)));
