@@ -320,6 +320,7 @@ void HttpServer::Impl::take(Exchange &exchange, const char *data, std::size_t si
     } else {
         buffered += size;
         exchange.body.append(data, size);
+        connections.progress(exchange.watched, size);
         return;
     }
     giveBack(exchange);
