@@ -131,8 +131,8 @@ int serve(const Options &options) {
 
     RelayApi api(aliases, {options.address, options.host, tunnelPort}, {});
     TunnelServer tunnelServer(
-        [&api](const std::string &alias, const std::string &caller) {
-            return api.announce(alias, caller);
+        [&api](const std::string &alias, const std::string &caller, const std::string &client) {
+            return api.announce(alias, caller, client);
         },
         {});
     OvraService::HttpLimits limits;

@@ -9,6 +9,7 @@
 #include <ovraplatform/api_errors.h>
 #include <ovraplatform/farlink.h>
 
+#include <algorithm>
 #include <ctime>
 #include <functional>
 #include <memory>
@@ -302,8 +303,8 @@ bool RelayApi::isThere(const Agent &agent) const {
 void RelayApi::deliverCallers(Agent &agent, const Answer &answer) {
     Json::Value data(Json::objectValue);
     data["callers"] = Json::Value(Json::arrayValue);
-    for (const std::string &caller : agent.callers) {
-        data["callers"].append(caller);
+    for (const Caller &caller : agent.callers) {
+        data["callers"].append(caller.id);
     }
     agent.callers.clear();
     agent.seen = Clock::now();
@@ -358,7 +359,8 @@ void RelayApi::leave(const std::string &alias) {
     tunnelServer_->close(alias);
 }
 
-bool RelayApi::announce(const std::string &alias, const std::string &caller) {
+bool RelayApi::announce(const std::string &alias, const std::string &caller,
+                        const std::string &client) {
     const std::lock_guard lock(mutex_);
     const auto found = agents_.find(alias);
     if (found == agents_.end() || !isThere(found->second) ||
@@ -366,7 +368,13 @@ bool RelayApi::announce(const std::string &alias, const std::string &caller) {
         return false;
     }
     Agent &agent = found->second;
-    agent.callers.push_back(caller);
+    const auto ofClient =
+        std::count_if(agent.callers.begin(), agent.callers.end(),
+                      [&client](const Caller &each) { return each.client == client; });
+    if (static_cast<std::size_t>(ofClient) >= limits_.callersOfOne) {
+        return false; // also of those who hung up again: the appliance connects to each in vain
+    }
+    agent.callers.push_back({caller, client});
     if (agent.waiting) {
         deliverCallers(agent, std::exchange(agent.waiting, nullptr));
     }

@@ -356,6 +356,7 @@ std::size_t HttpServer::Impl::take(Exchange &exchange, const char *data, std::si
     } else {
         buffered += taken;
         exchange.body.append(data, taken);
+        connections.progress(exchange.watched, taken);
         if (taken < size) {
             askJudge(exchange);
         }

@@ -7,6 +7,8 @@
 #include "ovradrcore/log.h"
 #include "refresh_lock.h"
 
+#include <ovrabase/number.h>
+
 #include <algorithm>
 #include <chrono>
 #include <optional>
@@ -40,7 +42,7 @@ std::optional<Stored> load(const std::string &path, const std::string &name, int
     if (!entry || !fromString(stored.value, entry->value)) {
         return std::nullopt;
     }
-    stored.age = systemMilliseconds() - entry->end;
+    stored.age = OvraBase::saturatingDifference(systemMilliseconds(), entry->end);
     return stored;
 }
 

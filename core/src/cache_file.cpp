@@ -158,6 +158,11 @@ public:
     /// Replaces the older copy of the loaded bucket.
     bool store(BucketImage &image) {
         const std::size_t older = choice_.valid ? 1 - choice_.newer : 0;
+        if (choice_.sequence == BucketImage::kLastSequence) {
+            // Only a forged file gets there: both copies begin anew, the visible one last.
+            return storeCopy(fd_.get(), index_, older, image.finish(1)) &&
+                   storeCopy(fd_.get(), index_, choice_.newer, image.finish(2));
+        }
         return storeCopy(fd_.get(), index_, older, image.finish(choice_.sequence + 1));
     }
 
@@ -203,7 +208,7 @@ private:
         BucketImage low(2 * buckets_, index);
         BucketImage high(2 * buckets_, index + buckets_);
         for (const CacheEntry &entry : BucketImage::entries(chosenCopy(pair, choice))) {
-            if (entry.end < oldest - entry.lifetime) {
+            if (isLongPast(entry.end, entry.lifetime, oldest)) {
                 continue;
             }
             total += BucketImage::measure(entry);

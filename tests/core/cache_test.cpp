@@ -487,3 +487,28 @@ TEST_F(CacheTest, ADamagedCopyWithARightChecksumStaysWithinItsBounds) {
         EXPECT_FALSE(BucketImage::find(bent.data(), "name"));
     }
 }
+
+TEST_F(CacheTest, AForgedBucketWithExtremeNumbersIsReadAndReplaced) {
+    for (const std::uint64_t sequence : {std::uint64_t{1}, UINT64_MAX - 2, UINT64_MAX - 1}) {
+        TestCache cache("a");
+        ASSERT_TRUE(cache.UpdateWithData("makes the file"));
+        const auto index = static_cast<std::uint32_t>(cacheNameHash("a")) & 15U;
+        BucketImage image(16, index);
+        ASSERT_TRUE(image.add({"a", "\"forged\"", 0, INT64_MIN, INT64_MIN}));
+        const std::string_view forged = image.finish(sequence);
+        std::fstream file(kPath, std::ios::in | std::ios::out | std::ios::binary);
+        for (const std::size_t copy : {0U, 1U}) {
+            file.seekp(static_cast<std::streamoff>((2 * index + copy) * BucketImage::kSize));
+            file.write(forged.data(), static_cast<std::streamsize>(forged.size()));
+        }
+        file.close();
+        EXPECT_EQ(text(cache.GetCachedData()), "\"forged\"");
+        EXPECT_GT(cache.GetCachedAge(), 9e15) << "as old as can be";
+        for (const char *value : {"one", "two", "three"}) {
+            ASSERT_TRUE(cache.UpdateWithData(value));
+            EXPECT_EQ(text(cache.GetCachedData()), '"' + std::string(value) + '"') << sequence;
+        }
+    }
+    EXPECT_TRUE(isLongPast(0, INT64_MIN, 1)) << "no lifetime is that short";
+    EXPECT_FALSE(isLongPast(INT64_MIN, INT64_MAX, INT64_MIN / 2));
+}
