@@ -78,3 +78,19 @@ TEST(AliasRegistry, IsTheSameAfterARestartAndRefusesRubbish) {
     EXPECT_EQ(enrol(registry, "more", "key3", 0), refused(Refusal::kNotStored));
     EXPECT_FALSE(registry.find("more")) << "what is not stored does not hold";
 }
+
+TEST(AliasRegistry, TakesFromItsFileWhatFitsItsPorts) {
+    std::ofstream(kFile) << "farlink-aliases-1 6002\nfirst 6000 9 key1\nlow 5999 9 key1\n"
+                            "high 6003 9 key1\ntwice 6000 9 key1\n-bad 6001 9 key1\n"
+                            "last 6002 9 key2\n";
+    AliasRegistry registry(kFile, kLimits);
+    ASSERT_TRUE(registry.load());
+    std::string names;
+    for (const Alias &alias : registry.list()) {
+        names += alias.name + " ";
+    }
+    EXPECT_EQ(names, "first last ");
+    EXPECT_EQ(enrol(registry, "last", "key3", 8), refused(Refusal::kTaken));
+    EXPECT_EQ(enrol(registry, "last", "key3", 9), 6002) << "its lease is over";
+    EXPECT_EQ(enrol(registry, "new", "key3", 9), 6001) << "the only free one, after a round";
+}
