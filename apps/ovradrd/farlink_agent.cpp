@@ -1,27 +1,27 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "farlink_agent.h"
 
+#include <ovrabase/connect.h>
 #include <ovradrcore/log.h>
 #include <ovraplatform/api_errors.h>
 #include <ovraplatform/farlink.h>
 
-#include <fcntl.h>
-#include <netdb.h>
+#include <sys/socket.h>
 
 #include <algorithm>
+#include <chrono>
 #include <condition_variable>
-#include <cstring>
 #include <exception>
 #include <mutex>
 #include <optional>
 #include <thread>
 #include <utility>
+#include <vector>
 
 namespace Ovradrd {
 
 namespace {
 
-using OvraBase::UniqueFd;
 using OvraPlatform::FarlinkClient;
 using OvraPlatform::FarlinkFailure;
 using OvraPlatform::FarlinkKey;
@@ -32,7 +32,7 @@ using OvraPlatform::FarlinkSettings;
 constexpr std::chrono::seconds kLook{2};
 constexpr std::chrono::seconds kMinPause{1};
 constexpr std::chrono::seconds kMaxPause{60};
-constexpr timeval kDialTime{5, 0};
+constexpr std::chrono::seconds kDialTime{5};
 /// Between two enrolments.
 constexpr std::chrono::hours kMaxStay{1};
 /// Callers taken from one answer; a service that follows docs/wire.md never names more at once.
@@ -41,28 +41,19 @@ constexpr std::size_t kCallerSize = 32;
 
 /// Connects to the tunnel port and names the caller; without a descriptor on failure.
 OvraService::ConnectedClient dial(const std::string &host, int port, const std::string &caller) {
-    OvraService::ConnectedClient call;
-    addrinfo hints{};
-    hints.ai_socktype = SOCK_STREAM;
-    addrinfo *list = nullptr;
-    if (getaddrinfo(host.c_str(), std::to_string(port).c_str(), &hints, &list) != 0) {
-        return call;
-    }
-    const std::unique_ptr<addrinfo, decltype(&freeaddrinfo)> owner(list, &freeaddrinfo);
+    const auto deadline = std::chrono::steady_clock::now() + kDialTime;
+    auto connected = OvraBase::resolveHost(host, port, deadline)
+                         .and_then([deadline](std::vector<OvraBase::SocketAddress> addresses) {
+                             return OvraBase::connectFirst(std::move(addresses), deadline);
+                         });
     const std::string line = "FARLINK1 " + caller + "\n";
-    for (const addrinfo *entry = list; entry != nullptr; entry = entry->ai_next) {
-        UniqueFd fd(socket(entry->ai_family, SOCK_STREAM | SOCK_CLOEXEC, 0));
-        // Bounds connect(2) as well, see socket(7).
-        setsockopt(fd.get(), SOL_SOCKET, SO_SNDTIMEO, &kDialTime, sizeof kDialTime);
-        if (fd && connect(fd.get(), entry->ai_addr, entry->ai_addrlen) == 0 &&
-            send(fd.get(), line.data(), line.size(), MSG_NOSIGNAL) ==
-                static_cast<ssize_t>(line.size()) &&
-            fcntl(fd.get(), F_SETFL, O_NONBLOCK) == 0) {
-            std::memcpy(&call.address, entry->ai_addr, entry->ai_addrlen);
-            call.size = entry->ai_addrlen;
-            call.fd = std::move(fd);
-            break;
-        }
+    OvraService::ConnectedClient call;
+    // The line is far smaller than the buffer of a new connection: it fits at once.
+    if (connected && send(connected->socket.get(), line.data(), line.size(), MSG_NOSIGNAL) ==
+                         static_cast<ssize_t>(line.size())) {
+        call.fd = std::move(connected->socket);
+        call.address = connected->peer.storage;
+        call.size = connected->peer.size;
     }
     return call;
 }
