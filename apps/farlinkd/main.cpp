@@ -42,7 +42,7 @@ using OvraService::TlsIdentity;
 
 constexpr unsigned long kDescriptors = 16384;
 constexpr int kMaxAliases = 4000; // what fits into the file of aliases, with room to spare
-constexpr timespec kTick{1, 0};
+constexpr std::chrono::seconds kTick{1};
 
 struct Options {
     std::string address;
@@ -93,14 +93,14 @@ Expected<TlsIdentity> identityIn(const Options &options) {
     return TlsIdentity::load(key, certificate);
 }
 
-void waitForEnd(const sigset_t &signals, RelayApi &api) {
-    while (sigtimedwait(&signals, nullptr, &kTick) < 0) {
+void waitForEnd(const OvraService::EndSignals &signals, RelayApi &api) {
+    while (!signals.wait(kTick)) {
         api.endOverdue();
     }
 }
 
 int serve(const Options &options) {
-    const sigset_t signals = OvraService::blockEndSignals();
+    const OvraService::EndSignals signals;
     OvraService::raiseDescriptorLimit(kDescriptors);
 
     const auto identity = identityIn(options);
