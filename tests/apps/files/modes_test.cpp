@@ -41,8 +41,17 @@ TEST(ModesOfAllThatIsMade, DoNotDependOnTheUmask) {
     for (const auto &[path, mode] : usual) {
         EXPECT_TRUE((mode & 022U) == 0 || mode == 01777U) << path << std::oct << ' ' << mode;
     }
-    EXPECT_EQ(usual.at("/usr/ovra/ovradr/sbin"), 0755U);
-    EXPECT_EQ(usual.at("/tmp/.ovradrcache"), 0700U);
+    const std::string config = "/usr/ovra/etc/ovradr";
+    for (const std::string &open : {std::string("/usr/ovra/ovradr/sbin"), config}) {
+        EXPECT_EQ(usual.at(open), 0755U) << open;
+    }
+    for (const std::string &closed :
+         {std::string("/tmp/.ovradrcache"), std::string("/usr/ovra/var/ovradr")}) {
+        EXPECT_EQ(usual.at(closed), 0700U) << closed;
+    }
+    for (const char *secret : {"/node.db", "/ovradrd.key", "/ovradrd.seal"}) {
+        EXPECT_EQ(usual.at(config + secret), 0600U) << secret;
+    }
     for (const mode_t mask : {0U, 077U, 0777U}) {
         EXPECT_EQ(madeUnder(mask), usual) << std::oct << mask;
     }
