@@ -3,6 +3,8 @@
 # is not up to date, and prints what it runs. All output is in build/.
 
 JOBS ?= $(shell nproc)
+# Most of their time tests wait.
+TEST_JOBS ?= $(shell expr 2 '*' $(JOBS))
 stage := $(CURDIR)/build/stage
 
 .DEFAULT_GOAL := help
@@ -17,7 +19,7 @@ demo: deps-lab stage ## two appliances on this machine pair, talk and part
 
 test: deps-test deps-lab build-dev ## every test, each on its own node (TESTS=regex selects some)
 	@lab/lab way | sed 's/^/tests run by way of /'
-	ctest --preset dev -j $(JOBS) $(if $(TESTS),-R '$(TESTS)')
+	ctest --preset dev -j $(TEST_JOBS) $(if $(TESTS),-R '$(TESTS)')
 
 bench: deps-build deps-lab build/bench/build.ninja ## the benchmarks, compared with their baselines
 	@cmake --build build/bench -j $(JOBS) --target bench

@@ -18,6 +18,20 @@ namespace {
 constexpr char kHeading[] = "farlink-aliases-1";
 constexpr mode_t kMode = 0600;
 
+bool atEnd(std::istringstream &words) {
+    return (words >> std::ws).eof();
+}
+
+bool readHeading(std::istringstream &words, int &nextPort) {
+    std::string heading;
+    return words >> heading >> nextPort && heading == kHeading && atEnd(words);
+}
+
+bool readAlias(std::istringstream &words, Alias &alias) {
+    return words >> alias.name >> alias.port >> alias.expires >> alias.key && atEnd(words) &&
+           OvraPlatform::isFarlinkAlias(alias.name);
+}
+
 } // namespace
 
 AliasRegistry::AliasRegistry(std::string path, const Limits &limits)
@@ -30,22 +44,34 @@ OvraBase::Expected<void> AliasRegistry::load() {
     if (!text && text.error().number == ENOENT) {
         return {};
     }
+    const auto damaged = [this](const std::string &what) {
+        return OvraBase::Unexpected({path_ + " cannot be read or is no list of aliases" + what +
+                                     ": restore it, or move it away, and its aliases are free "
+                                     "again"});
+    };
     std::istringstream lines(text.value_or(""));
-    std::string heading;
-    if (!(lines >> heading >> nextPort_) || heading != kHeading) {
-        return OvraBase::Unexpected({path_ +
-                                     " cannot be read or is no list of aliases: restore it, "
-                                     "or move it away, and its aliases are free again"});
+    std::string line;
+    std::getline(lines, line);
+    if (std::istringstream words(line); !readHeading(words, nextPort_)) {
+        return damaged("");
+    }
+    if (nextPort_ < limits_.firstPort || nextPort_ > limits_.lastPort) {
+        nextPort_ = limits_.firstPort;
     }
     std::set<int> ports;
-    Alias alias;
-    while (lines >> alias.name >> alias.port >> alias.expires >> alias.key) {
-        if (OvraPlatform::isFarlinkAlias(alias.name) && alias.port >= limits_.firstPort &&
-            alias.port <= limits_.lastPort && ports.insert(alias.port).second) {
+    for (int number = 2; std::getline(lines, line); ++number) {
+        std::istringstream words(line);
+        Alias alias;
+        if (!readAlias(words, alias)) {
+            // To go on would free the alias, for somebody else to take.
+            return damaged(" (line " + std::to_string(number) + ")");
+        }
+        if (alias.port >= limits_.firstPort && alias.port <= limits_.lastPort &&
+            entries_.count(alias.name) == 0 && ports.insert(alias.port).second) {
             entries_[alias.name] = alias;
         } else {
             OVRA_WARN("The alias [%s] at port [%d] is dropped: its port is not, or no longer, one "
-                      "of this service",
+                      "of this service, or another line has the same",
                       alias.name.c_str(), alias.port);
         }
     }
@@ -160,8 +186,7 @@ int AliasRegistry::freePort() const {
     }
     const int count = limits_.lastPort - limits_.firstPort + 1;
     for (int i = 0; i < count; ++i) {
-        const int offset = (nextPort_ - limits_.firstPort + i) % count;
-        const int port = limits_.firstPort + (offset < 0 ? offset + count : offset);
+        const int port = limits_.firstPort + (nextPort_ - limits_.firstPort + i) % count;
         if (taken.count(port) == 0) {
             return port;
         }

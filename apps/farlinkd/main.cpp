@@ -43,6 +43,7 @@ using OvraService::TlsIdentity;
 constexpr unsigned long kDescriptors = 16384;
 constexpr int kMaxAliases = 4000; // what fits into the file of aliases, with room to spare
 constexpr std::chrono::seconds kTick{1};
+constexpr int kTicksOfMemory = 20; // between two times at which freed memory is returned
 
 struct Options {
     std::string address;
@@ -94,12 +95,16 @@ Expected<TlsIdentity> identityIn(const Options &options) {
 }
 
 void waitForEnd(const OvraService::EndSignals &signals, RelayApi &api) {
-    while (!signals.wait(kTick)) {
+    for (int tick = 1; !signals.wait(kTick); ++tick) {
         api.endOverdue();
+        if (tick % kTicksOfMemory == 0) {
+            OvraService::returnFreedMemory();
+        }
     }
 }
 
 int serve(const Options &options) {
+    OvraService::keepMemorySmall();
     const OvraService::EndSignals signals;
     OvraService::raiseDescriptorLimit(kDescriptors);
 
@@ -126,12 +131,13 @@ int serve(const Options &options) {
 
     RelayApi api(aliases, {options.address, options.host, tunnelPort}, {});
     TunnelServer tunnelServer(
-        [&api](const std::string &alias, const std::string &caller) {
-            return api.announce(alias, caller);
+        [&api](const std::string &alias, const std::string &caller, const std::string &client) {
+            return api.announce(alias, caller, client);
         },
         {});
     OvraService::HttpLimits limits;
     limits.connections.total = 4096;
+    limits.body = limits.unjudged; // no call of the service is longer than a log-in
     HttpServer http(
         [&api](OvraService::HttpRequest request, const HttpServer::Answer &answer) {
             api.serve(std::move(request), answer);

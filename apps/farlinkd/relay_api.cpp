@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "relay_api.h"
 
+#include <ovrabase/address.h>
 #include <ovrabase/encoding.h>
 #include <ovrabase/number.h>
 #include <ovradrcore/json.h>
@@ -8,6 +9,7 @@
 #include <ovraplatform/api_errors.h>
 #include <ovraplatform/farlink.h>
 
+#include <algorithm>
 #include <ctime>
 #include <functional>
 #include <memory>
@@ -109,8 +111,11 @@ bool RelayApi::openPort(const Alias &alias) {
 void RelayApi::serve(OvraService::HttpRequest request, const Answer &answer) {
     // std::function must be copyable.
     const auto held = std::make_shared<OvraService::HttpRequest>(std::move(request));
-    if (!queue_.submit([this, held, answer] { handle(*held, answer); })) {
-        answer(tooMuchToDo());
+    const auto leave = [answer] { answer(tooMuchToDo()); };
+    if (!queue_.submit(
+            OvraBase::clientKey(held->address), [this, held, answer] { handle(*held, answer); },
+            leave)) {
+        leave();
     }
 }
 
@@ -124,20 +129,26 @@ void RelayApi::handle(OvraService::HttpRequest &request, const Answer &answer) {
     const auto reply = [&answer](const Json::Value &document) {
         answer(OvraDRCore::toString(document));
     };
-    const auto call = OvraPlatform::decodeForm(request.body);
+    auto call = OvraPlatform::decodeForm(request.body);
     if (!call) {
         return reply(apiError(APIError::kBadRequest, call.error()));
     }
     if (call->api != OvraPlatform::kFarlinkApi || call->version != 1) {
         return reply(apiError(APIError::kNoSuchAPI, "this is a relay service: it has no such API"));
     }
-    const Json::Value params =
-        call->params.isObject() ? call->params : Json::Value(Json::objectValue);
     std::unique_lock lock(mutex_);
     if (!calls_.allow(request.address, Clock::now())) {
         return reply(
             apiError(APIError::kTooBusy, "too many calls from this address: wait a minute"));
     }
+    lock.unlock();
+    if (const auto fault = OvraPlatform::parseParams(*call);
+        fault != OvraDRCore::JsonFault::kNone) {
+        return reply(apiError(APIError::kBadRequest,
+                              std::string("a parameter ") + OvraDRCore::describe(fault)));
+    }
+    const Json::Value &params = call->params;
+    lock.lock();
     if (!OvraPlatform::isFarlinkAlias(memberString(params, "alias"))) {
         return reply(badAlias());
     }
@@ -165,8 +176,11 @@ void RelayApi::handle(OvraService::HttpRequest &request, const Answer &answer) {
     } else {
         return reply(apiError(APIError::kNoSuchMethod, "the relay service has no such method"));
     }
-    if (!changes_.submit([change, answer] { answer(OvraDRCore::toString(change())); })) {
-        answer(tooMuchToDo());
+    const auto leave = [answer] { answer(tooMuchToDo()); };
+    if (!changes_.submit(
+            OvraBase::clientKey(request.address),
+            [change, answer] { answer(OvraDRCore::toString(change())); }, leave)) {
+        leave();
     }
 }
 
@@ -289,8 +303,8 @@ bool RelayApi::isThere(const Agent &agent) const {
 void RelayApi::deliverCallers(Agent &agent, const Answer &answer) {
     Json::Value data(Json::objectValue);
     data["callers"] = Json::Value(Json::arrayValue);
-    for (const std::string &caller : agent.callers) {
-        data["callers"].append(caller);
+    for (const Caller &caller : agent.callers) {
+        data["callers"].append(caller.id);
     }
     agent.callers.clear();
     agent.seen = Clock::now();
@@ -345,7 +359,8 @@ void RelayApi::leave(const std::string &alias) {
     tunnelServer_->close(alias);
 }
 
-bool RelayApi::announce(const std::string &alias, const std::string &caller) {
+bool RelayApi::announce(const std::string &alias, const std::string &caller,
+                        const std::string &client) {
     const std::lock_guard lock(mutex_);
     const auto found = agents_.find(alias);
     if (found == agents_.end() || !isThere(found->second) ||
@@ -353,7 +368,13 @@ bool RelayApi::announce(const std::string &alias, const std::string &caller) {
         return false;
     }
     Agent &agent = found->second;
-    agent.callers.push_back(caller);
+    const auto ofClient =
+        std::count_if(agent.callers.begin(), agent.callers.end(),
+                      [&client](const Caller &each) { return each.client == client; });
+    if (static_cast<std::size_t>(ofClient) >= limits_.callersOfOne) {
+        return false; // also of those who hung up again: the appliance connects to each in vain
+    }
+    agent.callers.push_back({caller, client});
     if (agent.waiting) {
         deliverCallers(agent, std::exchange(agent.waiting, nullptr));
     }
@@ -379,7 +400,7 @@ void RelayApi::endOverdue() {
         }
     }
     // One at a time: while the disk is slow they must not fill the queue.
-    if (!dropping_.exchange(true) && !changes_.submit([this] { dropExpired(); })) {
+    if (!dropping_.exchange(true) && !changes_.submit("", [this] { dropExpired(); })) {
         dropping_ = false;
     }
 }

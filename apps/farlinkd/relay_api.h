@@ -18,10 +18,10 @@
 #include <atomic>
 #include <chrono>
 #include <cstddef>
-#include <deque>
 #include <map>
 #include <mutex>
 #include <string>
+#include <vector>
 
 namespace Farlinkd {
 
@@ -40,6 +40,7 @@ public:
         std::size_t proofsPerMinute = 30;
         std::size_t aliasesPerHour = 10;
         std::size_t callers = 64;           ///< of one appliance, not announced to it yet
+        std::size_t callersOfOne = 32;      ///< those of them of one client
         std::chrono::seconds challenge{60}; ///< how long it can be answered
         std::chrono::seconds hold = OvraPlatform::kFarlinkHold; ///< of a poll without a caller
     };
@@ -54,7 +55,9 @@ public:
     /// Handles one request; does not wait.
     void serve(OvraService::HttpRequest request, const OvraService::HttpServer::Answer &answer);
     /// Announces a caller to the appliance of the alias; false if it is not present.
-    [[nodiscard]] bool announce(const std::string &alias, const std::string &caller);
+    /// \param client  of the caller, see OvraBase::clientKey()
+    [[nodiscard]] bool announce(const std::string &alias, const std::string &caller,
+                                const std::string &client);
     /// Ends overdue polls for callers and expired aliases. Call it now and then.
     void endOverdue();
     /// Drops waiting requests, and waits for those in progress.
@@ -64,12 +67,16 @@ private:
     using Clock = std::chrono::steady_clock;
     using Answer = OvraService::HttpServer::Answer;
 
+    struct Caller {
+        std::string id;
+        std::string client;
+    };
     /// An appliance that has proved its ownership of an alias.
     struct Agent {
         std::string token;
         Clock::time_point seen;
-        std::deque<std::string> callers; ///< not announced to it yet
-        Answer waiting;                  ///< its poll, held back until there is a caller
+        std::vector<Caller> callers; ///< not announced to it yet
+        Answer waiting;              ///< its poll, held back until there is a caller
         Clock::time_point waitingSince;
     };
 
@@ -106,8 +113,8 @@ private:
     std::atomic<bool> dropping_ = false; ///< expired aliases; queued or in progress
     // Last, so that they are destroyed first: their jobs use everything above. One thread makes the
     // changes, which wait for the disk; nothing else does.
-    OvraService::WorkQueue changes_{1, 512};
-    OvraService::WorkQueue queue_{2, 512};
+    OvraService::WorkQueue changes_{1, {512, 64}};
+    OvraService::WorkQueue queue_{2, {1024, 512}};
 };
 
 } // namespace Farlinkd

@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "tunnel_server.h"
 
+#include <ovrabase/address.h>
 #include <ovradrcore/log.h>
 
 #include <fcntl.h>
@@ -15,6 +16,7 @@
 #include <algorithm>
 #include <array>
 #include <cerrno>
+#include <map>
 #include <mutex>
 #include <thread>
 #include <unordered_map>
@@ -59,6 +61,8 @@ struct Socket {
     UniqueFd fd;
     Kind kind = Kind::kListener;
     std::string alias;       ///< of a door, a caller, and an appliance that is connected
+    std::string client;      ///< of a caller, and of an appliance
+    bool calls = false;      ///< a caller
     std::string text;        ///< the caller's id; of one that arrives, the line so far
     Socket *peer = nullptr;  ///< once connected
     std::string out;         ///< what the peer said and this end has not taken yet
@@ -84,10 +88,10 @@ struct TunnelServer::Impl {
 
     void run();
     void runCommands();
-    void add(UniqueFd fd, Kind kind, const std::string &alias, std::uint32_t events);
+    Socket *add(UniqueFd fd, Kind kind, const std::string &alias, std::uint32_t events);
     void handle(int fd, std::uint32_t events);
     void acceptCallers(const Socket &listening);
-    void acceptCaller(const std::string &alias, UniqueFd fd);
+    void acceptCaller(const std::string &alias, UniqueFd fd, const std::string &client);
     void acceptAppliances(const Socket &tunnel);
     void readLine(Socket &socket);
     void connectThrough(Socket &caller, Socket &appliance);
@@ -97,7 +101,9 @@ struct TunnelServer::Impl {
     void drop(Socket &socket);
     void closeAlias(const std::string &alias);
     void endOverdue();
-    std::size_t count(Kind kind, const std::string *alias = nullptr) const;
+    [[nodiscard]] bool dropOldest(const std::vector<Socket *> &among);
+    template <typename IsOne>
+    [[nodiscard]] bool makeRoom(const IsOne &isOne, std::size_t most, const std::string &client);
     Socket *findWaiting(const std::string &caller);
 
     const Announce announce;
@@ -111,8 +117,9 @@ struct TunnelServer::Impl {
     std::thread thread;
 };
 
-void TunnelServer::Impl::add(UniqueFd fd, Kind kind, const std::string &alias,
-                             std::uint32_t events) {
+/// \return null if it cannot be watched
+Socket *TunnelServer::Impl::add(UniqueFd fd, Kind kind, const std::string &alias,
+                                std::uint32_t events) {
     auto socket = std::make_unique<Socket>();
     socket->kind = kind;
     socket->alias = alias;
@@ -121,18 +128,54 @@ void TunnelServer::Impl::add(UniqueFd fd, Kind kind, const std::string &alias,
     epoll_event event{};
     event.events = events;
     event.data.fd = number;
-    if (epoll_ctl(epoll.get(), EPOLL_CTL_ADD, number, &event) == 0) {
-        sockets[number] = std::move(socket);
+    if (epoll_ctl(epoll.get(), EPOLL_CTL_ADD, number, &event) != 0) {
+        return nullptr;
     }
+    return (sockets[number] = std::move(socket)).get();
 }
 
-std::size_t TunnelServer::Impl::count(Kind kind, const std::string *alias) const {
-    const auto number =
-        std::count_if(sockets.begin(), sockets.end(), [kind, alias](const auto &entry) {
-            return entry.second->kind == kind &&
-                   (alias == nullptr || entry.second->alias == *alias);
-        });
-    return static_cast<std::size_t>(number);
+/// Drops the one that has waited longest; false if none waits.
+bool TunnelServer::Impl::dropOldest(const std::vector<Socket *> &among) {
+    Socket *victim = nullptr;
+    for (Socket *const each : among) {
+        const bool waits = each->kind != Kind::kConnected;
+        if (waits && (victim == nullptr || each->since < victim->since)) {
+            victim = each;
+        }
+    }
+    if (victim == nullptr) {
+        return false;
+    }
+    drop(*victim);
+    return true;
+}
+
+/// Whether one more socket of the client may take a place; another one may be dropped for it.
+/// \param isOne  which sockets have such a place
+/// \param most   how many there may be
+template <typename IsOne>
+bool TunnelServer::Impl::makeRoom(const IsOne &isOne, std::size_t most, const std::string &client) {
+    std::map<std::string, std::vector<Socket *>> byClient;
+    std::size_t all = 0;
+    for (const auto &[fd, socket] : sockets) {
+        if (isOne(*socket)) {
+            byClient[socket->client].push_back(socket.get());
+            ++all;
+        }
+    }
+    const std::vector<Socket *> &own = byClient[client];
+    if (own.size() >= std::max<std::size_t>(most / limits.clientsShare, 1)) {
+        // An appliance says its line at once, so the silent one is none.
+        return own.front()->kind == Kind::kArriving && dropOldest(own);
+    }
+    if (all < most) {
+        return true;
+    }
+    const std::vector<Socket *> &greatest =
+        std::max_element(byClient.begin(), byClient.end(), [](const auto &a, const auto &b) {
+            return a.second.size() < b.second.size();
+        })->second;
+    return greatest.size() > own.size() + 1 && dropOldest(greatest);
 }
 
 Socket *TunnelServer::Impl::findWaiting(const std::string &caller) {
@@ -180,48 +223,66 @@ void TunnelServer::Impl::runCommands() {
     }
 }
 
+/// The next connection that waits at the listening socket, and its client.
+std::pair<UniqueFd, std::string> acceptNext(int listener) {
+    OvraBase::SocketAddress address;
+    address.size = sizeof address.storage;
+    UniqueFd fd(accept4(listener, reinterpret_cast<sockaddr *>(&address.storage), &address.size,
+                        SOCK_NONBLOCK | SOCK_CLOEXEC));
+    std::string client = fd ? OvraBase::clientKey(OvraBase::addressText(address.get())) : "";
+    return {std::move(fd), std::move(client)};
+}
+
 void TunnelServer::Impl::acceptCallers(const Socket &listening) {
     const std::string alias = listening.alias;
     const int listener = listening.fd.get();
     for (;;) {
-        UniqueFd fd(accept4(listener, nullptr, nullptr, SOCK_NONBLOCK | SOCK_CLOEXEC));
+        auto [fd, client] = acceptNext(listener);
         if (!fd) {
             return;
         }
-        acceptCaller(alias, std::move(fd));
+        acceptCaller(alias, std::move(fd), client);
     }
 }
 
-void TunnelServer::Impl::acceptCaller(const std::string &alias, UniqueFd fd) {
-    const std::size_t all = count(Kind::kWaiting) + count(Kind::kConnected) / 2;
-    const std::size_t ofAlias = count(Kind::kWaiting, &alias) + count(Kind::kConnected, &alias) / 2;
-    if (all >= limits.calls || ofAlias >= limits.perAlias) {
-        OVRA_NOTICE("A caller of [%s] is turned away: too many at once", alias.c_str());
+void TunnelServer::Impl::acceptCaller(const std::string &alias, UniqueFd fd,
+                                      const std::string &client) {
+    const auto calls = [](const Socket &socket) { return socket.calls; };
+    const auto callsAlias = [&alias](const Socket &socket) {
+        return socket.calls && socket.alias == alias;
+    };
+    if (!makeRoom(callsAlias, limits.perAlias, client) || !makeRoom(calls, limits.calls, client)) {
+        OVRA_NOTICE("A caller of [%s] from [%s] is turned away: too many at once", alias.c_str(),
+                    client.c_str());
         return;
     }
     const std::string caller = newCaller();
-    if (!announce(alias, caller)) {
+    if (!announce(alias, caller, client)) {
         return; // closing it says so
     }
     tune(fd.get());
-    const int number = fd.get();
     // Nothing is read before there is a receiver.
-    add(std::move(fd), Kind::kWaiting, alias, EPOLLRDHUP);
-    if (const auto added = sockets.find(number); added != sockets.end()) {
-        added->second->text = caller;
+    if (Socket *const added = add(std::move(fd), Kind::kWaiting, alias, EPOLLRDHUP)) {
+        added->text = caller;
+        added->client = client;
+        added->calls = true;
     }
 }
 
 void TunnelServer::Impl::acceptAppliances(const Socket &tunnel) {
+    const auto arrives = [](const Socket &socket) { return socket.kind == Kind::kArriving; };
     const int listener = tunnel.fd.get();
     for (;;) {
-        UniqueFd fd(accept4(listener, nullptr, nullptr, SOCK_NONBLOCK | SOCK_CLOEXEC));
+        auto [fd, client] = acceptNext(listener);
         if (!fd) {
             return;
         }
-        if (count(Kind::kArriving) < limits.arriving) {
-            tune(fd.get());
-            add(std::move(fd), Kind::kArriving, "", EPOLLIN);
+        if (!makeRoom(arrives, limits.arriving, client)) {
+            continue;
+        }
+        tune(fd.get());
+        if (Socket *const added = add(std::move(fd), Kind::kArriving, "", EPOLLIN)) {
+            added->client = client;
         }
     }
 }

@@ -17,18 +17,24 @@ namespace Farlinkd {
 /// connects to the tunnel port and names the caller in its first line. From then on the bytes pass
 /// both ways unread until both ends have closed. One thread carries all calls, with a bounded
 /// buffer for each direction.
+///
+/// The places are shared out by client: none has more than its share, and when no place is left,
+/// the client that has the most loses the one that has waited longest to a client that has fewer.
 class TunnelServer {
 public:
     struct Limits {
         std::size_t calls = 512; ///< all callers, waiting or put through
         std::size_t perAlias = 64;
-        std::size_t arriving = 128;               ///< appliances that have not named a caller
+        std::size_t arriving = 128; ///< appliances that have not named a caller
+        /// One client (OvraBase::clientKey()) gets one place in this many, of each of the three.
+        std::size_t clientsShare = 2;
         std::chrono::milliseconds line{5'000};    ///< for saying it
         std::chrono::milliseconds answer{10'000}; ///< how long a caller waits for the appliance
         std::chrono::milliseconds idle{120'000};
     };
     /// Announces a caller, in the tunnel server's thread; false if the appliance is not present.
-    using Announce = std::function<bool(const std::string &alias, const std::string &caller)>;
+    using Announce = std::function<bool(const std::string &alias, const std::string &caller,
+                                        const std::string &client)>;
 
     TunnelServer(Announce announce, const Limits &limits);
     TunnelServer(const TunnelServer &) = delete;

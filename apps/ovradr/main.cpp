@@ -59,6 +59,21 @@ Refusal surplusFailure(const CLI::App &app) {
                    kHelpHint);
 }
 
+/// The error for a command line that lacks something.
+Refusal missingFailure(const CLI::App &app, const std::string &what) {
+    const CLI::App *last = &app;
+    std::string path = app.get_name();
+    while (!last->get_subcommands().empty()) {
+        last = last->get_subcommands().front();
+        path += " " + last->get_name();
+    }
+    if (last->get_require_subcommand_min() > 0 && app.remaining_size(true) > 0) {
+        return failure(ExitCode::kUsage, "There is no such command.",
+                       "`" + path + " --help` shows those that there are.");
+    }
+    return failure(ExitCode::kUsage, what + ".", kHelpHint);
+}
+
 Outcome runChosen(const Command &chosen) {
     try {
         return chosen();
@@ -85,8 +100,7 @@ int run(int argc, char **argv) {
         if (error.get_exit_code() == 0) {
             return app.exit(error); // the help or the version
         }
-        const Refusal wrong = failure(ExitCode::kUsage, std::string(error.what()) + ".", kHelpHint);
-        return static_cast<int>(tell(wrong, json));
+        return static_cast<int>(tell(missingFailure(app, error.what()), json));
     }
     return static_cast<int>(tell(runChosen(chosen), json));
 }

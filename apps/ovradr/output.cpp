@@ -1,18 +1,20 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "output.h"
 
+#include <ovrabase/expected.h>
+#include <ovrabase/utf8.h>
 #include <ovradrcore/json.h>
 
 #include <json/writer.h>
 
 #include <algorithm>
 #include <array>
-#include <charconv>
+#include <cerrno>
 #include <clocale>
 #include <cstdio>
 #include <ctime>
 #include <cwchar>
-#include <cwctype>
+#include <string_view>
 
 namespace Ovradr {
 
@@ -24,79 +26,20 @@ constexpr std::size_t kGap = 2;
 class UnicodeScope {
 public:
     UnicodeScope()
-        : locale_(newlocale(LC_CTYPE_MASK, "C.UTF-8", nullptr)) {
-        if (locale_ != nullptr) {
-            before_ = uselocale(locale_);
-        }
-    }
+        : before_(uselocale(unicode())) {} // without it, uselocale(nullptr) changes nothing
     UnicodeScope(const UnicodeScope &) = delete;
     UnicodeScope &operator=(const UnicodeScope &) = delete;
-    ~UnicodeScope() {
-        if (locale_ != nullptr) {
-            uselocale(before_);
-            freelocale(locale_);
-        }
-    }
+    ~UnicodeScope() { uselocale(before_); }
 
 private:
-    locale_t locale_;
-    locale_t before_ = nullptr;
+    /// Never freed: every cell of a table needs it, and to make it reads files.
+    static locale_t unicode() {
+        static const locale_t locale = newlocale(LC_CTYPE_MASK, "C.UTF-8", nullptr);
+        return locale;
+    }
+
+    locale_t before_;
 };
-
-/// One character of a text; `size` 1 and no character for a byte that is no UTF-8.
-struct Character {
-    wchar_t code = 0;
-    std::size_t size = 1;
-    bool valid = false;
-};
-
-Character characterAt(const std::string &text, std::size_t position) {
-    Character found;
-    std::mbstate_t state{};
-    // Safe for threads, because it has a state of its own. NOLINTNEXTLINE(concurrency-mt-unsafe)
-    const auto size = std::mbrtowc(&found.code, &text[position], text.size() - position, &state);
-    if (size == 0) { // NUL
-        return {0, 1, true};
-    }
-    if (size <= text.size()) {
-        found.size = size;
-        found.valid = true;
-    }
-    return found;
-}
-
-/// Characters that are printable by the tables but change how the rest of the line shows: those
-/// that turn the direction of writing or separate lines (Unicode 15, general categories Cf, Zl and
-/// Zp).
-bool isDeceptive(wchar_t code) {
-    return code == 0x061C || (code >= 0x200B && code <= 0x200F) ||
-           (code >= 0x2028 && code <= 0x202E) || (code >= 0x2060 && code <= 0x206F) ||
-           code == 0xFEFF || (code >= 0xE0000 && code <= 0xE007F);
-}
-
-std::string hexEscape(const char *prefix, unsigned int number, std::size_t digits) {
-    std::array<char, 8> text{};
-    const auto end = std::to_chars(text.data(), text.data() + text.size(), number, 16).ptr;
-    const std::string hex(text.data(), end);
-    return prefix + std::string(hex.size() < digits ? digits - hex.size() : 0, '0') + hex;
-}
-
-std::string escaped(const Character &character, unsigned char byte) {
-    switch (character.valid ? character.code : 0) {
-    case L'\n':
-        return "\\n";
-    case L'\t':
-        return "\\t";
-    case L'\r':
-        return "\\r";
-    default:
-        break;
-    }
-    if (!character.valid || character.code < 0x80) {
-        return hexEscape("\\x", byte, 2);
-    }
-    return hexEscape("\\u", static_cast<unsigned int>(character.code), 4);
-}
 
 std::string padded(const std::string &text, std::size_t width) {
     const std::size_t used = displayWidth(text);
@@ -138,28 +81,17 @@ bool put(const std::string &text, FILE *stream) {
 } // namespace
 
 std::string printable(const std::string &text) {
-    const UnicodeScope unicode;
-    std::string safe;
-    for (std::size_t i = 0; i < text.size();) {
-        const Character character = characterAt(text, i);
-        const bool shown = character.valid &&
-                           std::iswprint(static_cast<std::wint_t>(character.code)) != 0 &&
-                           !isDeceptive(character.code);
-        safe += shown ? text.substr(i, character.size)
-                      : escaped(character, static_cast<unsigned char>(text[i]));
-        i += character.size;
-    }
-    return safe;
+    return OvraBase::shown(text);
 }
 
 std::size_t displayWidth(const std::string &text) {
     const UnicodeScope unicode;
     std::size_t width = 0;
-    for (std::size_t i = 0; i < text.size();) {
-        const Character character = characterAt(text, i);
-        const int columns = character.valid ? wcwidth(character.code) : 1;
+    for (std::string_view rest = text; !rest.empty();) {
+        const OvraBase::Utf8Character character = OvraBase::firstUtf8(rest);
+        const int columns = character.size > 0 ? wcwidth(static_cast<wchar_t>(character.code)) : 1;
         width += columns > 0 ? static_cast<std::size_t>(columns) : 0;
-        i += character.size;
+        rest.remove_prefix(std::max<std::size_t>(character.size, 1));
     }
     return width;
 }
@@ -204,7 +136,11 @@ std::string prettyJson(const Json::Value &value) {
     Json::StreamWriterBuilder builder;
     builder["indentation"] = "  ";
     builder["commentStyle"] = "None";
-    return Json::writeString(builder, value) + "\n";
+    std::string text = Json::writeString(builder, value) + "\n";
+    for (std::size_t at = 0; (at = text.find('\x7f', at)) != std::string::npos;) {
+        text.replace(at, 1, "\\u007f"); // the one character of ASCII that it leaves to the terminal
+    }
+    return text;
 }
 
 std::string timeText(std::int64_t seconds) {
@@ -232,7 +168,15 @@ ExitCode tell(const Outcome &outcome, bool json) {
                        (failure.hint.empty() ? "" : printable(failure.hint) + "\n"),
                    stderr);
     }
-    return told || exit != ExitCode::kOk ? exit : ExitCode::kFailed;
+    if (told || exit != ExitCode::kOk) {
+        return exit;
+    }
+    if (errno != EPIPE) { // whoever closed a pipe has read enough
+        put("ovradr: The output could not be written: " + OvraBase::errnoText(errno) +
+                ".\nMake room, or write it elsewhere.\n",
+            stderr);
+    }
+    return ExitCode::kFailed;
 }
 
 } // namespace Ovradr

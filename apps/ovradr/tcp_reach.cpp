@@ -17,7 +17,15 @@ OvraBase::Deadline deadline() {
     return std::chrono::steady_clock::now() + kReachTime;
 }
 
+Refusal shortage(const std::string &what, int error) {
+    return failure(ExitCode::kFailed, what + ": " + OvraBase::errnoText(error) + ".",
+                   "Raise the limits of this machine, or end what takes them up.");
+}
+
 Refusal connectFailure(const std::string &where, int error) {
+    if (OvraBase::isShortage(error)) {
+        return shortage("No connection to " + where + " can be made here", error);
+    }
     if (error == ECONNREFUSED) {
         return failure(ExitCode::kNotReachable, where + " refuses connections.",
                        "Check the port, and that ovradrd runs over there.");
@@ -36,9 +44,7 @@ Refusal connectFailure(const std::string &where, int error) {
 Expected<std::vector<OvraBase::SocketAddress>> resolveHost(const std::string &host, int port) {
     auto found = OvraBase::resolveHost(host, port, deadline());
     if (!found && OvraBase::isShortage(found.error().number)) {
-        return failure(ExitCode::kFailed,
-                       "The host cannot be looked up: " + found.error().text + ".",
-                       "Raise the limits of this process, or end what takes them up.");
+        return shortage("The host cannot be looked up here", found.error().number);
     }
     if (!found) {
         return failure(ExitCode::kNameUnknown,

@@ -3,6 +3,7 @@
 
 #include "session_owner.h"
 
+#include <ovrabase/address.h>
 #include <ovrabase/secret.h>
 #include <ovradrcore/json.h>
 #include <ovradrcore/log.h>
@@ -28,6 +29,7 @@ constexpr std::size_t kMaxReply = std::size_t{5} * 1024 * 1024;
 constexpr std::size_t kMaxName = 128;
 constexpr std::chrono::milliseconds kLocalPause{100};
 constexpr char kLoopback[] = "127.0.0.1";
+constexpr std::string_view kSealedField = "sealed=";
 
 Json::Value busy() {
     return apiError(APIError::kTooBusy,
@@ -67,7 +69,7 @@ OvraService::WorkQueue &WorkQueues::of(APIQueue queue) {
 
 /// A call on its way, and where its reply goes.
 struct CallDispatcher::Call {
-    OvraPlatform::WireCall wire;
+    OvraPlatform::ReceivedCall wire;
     std::optional<OvraPlatform::ReplyKey> replyKey;
     bool secure = false;
     APICaller caller;
@@ -86,55 +88,98 @@ struct CallDispatcher::Call {
 
 CallDispatcher::CallDispatcher(const OvraPlatform::APIRegistry &registry,
                                const OvraPlatform::SealKeyPair &keys,
-                               OvraPlatform::ReplayGuard &guard, LoginApi &api, WorkQueues &queues)
+                               OvraPlatform::ReplayGuard &guard, WorkQueues &queues)
     : registry_(registry)
     , keys_(keys)
     , guard_(guard)
-    , loginApi_(api)
     , queues_(queues) {}
 
 void CallDispatcher::serve(OvraService::HttpRequest request,
                            const OvraService::HttpServer::Answer &answer) {
+    submit(std::move(request), answer, [this](Call &call, std::string &body) { open(call, body); });
+}
+
+void CallDispatcher::judge(OvraService::HttpRequest beginning,
+                           const OvraService::HttpServer::Verdict &verdict) {
+    submit(std::move(beginning), verdict, [this, verdict](Call &call, std::string &body) {
+        openBeginning(call, body, verdict);
+        OvraBase::wipe(body);
+    });
+}
+
+/// Has what came from a client processed when it is its turn.
+void CallDispatcher::submit(OvraService::HttpRequest &&request,
+                            const OvraService::HttpServer::Answer &answer,
+                            std::function<void(Call &, std::string &body)> process) {
     // std::function must be copyable.
     const auto held = std::make_shared<OvraService::HttpRequest>(std::move(request));
-    const bool taken = queues_.quick.submit([this, held, answer] {
+    const auto job = [held, answer, process = std::move(process)] {
         Call call;
         call.secure = held->secure;
         call.caller.address = held->address;
         call.answer = answer;
-        open(call, held->body);
-    });
-    if (!taken) {
+        process(call, held->body);
+    };
+    const auto leave = [this, held, answer] {
         OvraBase::wipe(held->body);
         Call call;
         call.answer = answer;
         refuse(call);
+    };
+    if (!queues_.quick.submit(OvraBase::clientKey(held->address), job, leave)) {
+        leave();
     }
 }
 
 /// Reads the call and starts processing it.
 void CallDispatcher::open(Call &call, std::string &body) {
-    auto wire = OvraPlatform::decodeForm(body);
+    const bool readable = read(call, body);
     OvraBase::wipe(body);
+    if (readable && unseal(call) && admit(call) && parse(call)) {
+        route(std::move(call));
+    }
+}
+
+void CallDispatcher::openBeginning(Call &call, const std::string &beginning,
+                                   const OvraService::HttpServer::Verdict &verdict) {
+    // The field after the last separator is not complete.
+    const std::size_t end = beginning.rfind('&');
+    const bool judgeable = call.secure && end != std::string::npos &&
+                           beginning.compare(end + 1, kSealedField.size(), kSealedField) != 0;
+    if (judgeable) {
+        if (!read(call, std::string_view(beginning).substr(0, end)) || !admit(call)) {
+            return;
+        }
+        if (!call.caller.user.empty()) {
+            verdict(std::nullopt);
+            return;
+        }
+    }
+    call.reply(apiError(APIError::kTooLarge,
+                        "a request of more than 16 KiB needs https, no seal, and first of all api, "
+                        "version, method and a session: send less at once"));
+}
+
+/// Splits a body; false if it was refused.
+bool CallDispatcher::read(Call &call, std::string_view body) const {
+    auto wire = OvraPlatform::decodeForm(body);
     if (!wire) {
         call.reply(apiError(APIError::kBadRequest, wire.error()));
-        return;
+        return false;
     }
     if (wire->api.size() > kMaxName || wire->method.size() > kMaxName) {
         call.reply(apiError(APIError::kBadRequest, "the name of the API or method is too long"));
-        return;
+        return false;
     }
     call.wire = std::move(*wire);
-    if (unseal(call) && admit(call)) {
-        route(std::move(call));
-    }
+    return true;
 }
 
 /// Replaces the visible call with the sealed one; false if it was refused.
 bool CallDispatcher::unseal(Call &call) {
     const bool sealed = !call.wire.sealed.empty();
     if (!sealed) {
-        const bool hasSomething = !call.wire.sid.empty() || !call.wire.params.empty();
+        const bool hasSomething = !call.wire.sid.empty() || !call.wire.texts.empty();
         if (hasSomething && !call.secure) {
             call.reply(unsealed(guard_.now()));
             return false;
@@ -151,63 +196,65 @@ bool CallDispatcher::unseal(Call &call) {
         call.reply(OvraPlatform::sealRefusal(verdict, guard_.now()));
         return false;
     }
-    call.wire = std::move(opened.call);
+    static_cast<OvraPlatform::WireCall &>(call.wire) = std::move(opened.call);
     return true;
 }
 
-/// Identifies the caller; false if it was refused. An unknown session counts as none.
-bool CallDispatcher::admit(Call &call) {
-    if (call.wire.sid.empty()) {
-        return true;
-    }
-    const SessionOwner owner = findSessionOwner(call.wire.sid);
+/// Identifies the caller, and judges the call by its name and the caller's rights; false if it was
+/// refused. An unknown session counts as none.
+bool CallDispatcher::admit(Call &call) const {
+    const SessionOwner owner =
+        call.wire.sid.empty() ? SessionOwner{} : findSessionOwner(call.wire.sid);
     if (owner.state == SessionOwner::State::kNotKnown) {
         // A peer must not take the session for expired.
         call.reply(apiError(APIError::kInternal, "the sessions cannot be read now: see the log of "
                                                  "the appliance"));
         return false;
     }
-    if (owner.state == SessionOwner::State::kUnknown) {
-        return true;
+    if (owner.state == SessionOwner::State::kFound) {
+        if (owner.account.disabled) {
+            call.reply(
+                apiError(APIError::kNoPermission,
+                         "the account of the session is disabled: enable it, or use another"));
+            return false;
+        }
+        call.caller.user = owner.account.name;
+        call.caller.administrator = owner.account.administrator;
+        call.caller.session = call.wire.sid;
     }
-    if (owner.account.disabled) {
-        call.reply(apiError(APIError::kNoPermission,
-                            "the account of the session is disabled: enable it, or use another"));
+    if (const auto refused = registry_.refusal(call.wire, call.caller)) {
+        note(call, *refused, {});
+        call.reply(*refused);
         return false;
     }
-    call.caller.user = owner.account.name;
-    call.caller.administrator = owner.account.administrator;
-    call.caller.session = call.wire.sid;
     return true;
 }
 
-void CallDispatcher::route(Call call) {
-    if (LoginApi::isLogin(call.wire)) {
-        login(std::move(call));
-        return;
+/// Parses the parameters; false if it was refused.
+bool CallDispatcher::parse(Call &call) const {
+    using OvraDRCore::JsonFault;
+    const JsonFault fault = OvraPlatform::parseParams(call.wire);
+    if (fault != JsonFault::kNone) {
+        const bool isJson = fault != JsonFault::kNotJson;
+        call.reply(apiError(isJson ? APIError::kTooLarge : APIError::kBadRequest,
+                            std::string("a parameter ") + OvraDRCore::describe(fault) +
+                                (isJson ? ": send less at once" : "")));
     }
-    const APIQueue queue = registry_.queue(call.wire);
-    if (queue == APIQueue::kQuick) {
+    return fault == JsonFault::kNone;
+}
+
+void CallDispatcher::route(Call call) {
+    OvraService::WorkQueue &queue =
+        LoginApi::isLogin(call.wire) ? queues_.login : queues_.of(registry_.queue(call.wire));
+    if (&queue == &queues_.quick) {
         run(call);
         return;
     }
     const auto held = std::make_shared<Call>(std::move(call));
-    if (!queues_.of(queue).submit([this, held] { run(*held); })) {
-        refuse(*held);
-    }
-}
-
-void CallDispatcher::login(Call call) {
-    const auto held = std::make_shared<Call>(std::move(call));
-    const auto wait = loginApi_.admit(held->wire.params, held->caller.address);
-    if (!wait) {
-        held->reply(apiError(APIError::kTooBusy, "too many log-ins of this account or from this "
-                                                 "address failed: wait a minute"));
-        return;
-    }
-    if (!queues_.login.submit([this, held] { run(*held); }, *wait)) {
-        loginApi_.withdraw(held->wire.params, held->caller.address);
-        refuse(*held);
+    const auto leave = [this, held] { refuse(*held); };
+    if (!queue.submit(
+            OvraBase::clientKey(held->caller.address), [this, held] { run(*held); }, leave)) {
+        leave();
     }
 }
 
@@ -222,11 +269,15 @@ void CallDispatcher::run(const Call &call) const {
     const OvraPlatform::ClientScope scope(call.caller.address);
     const auto begun = std::chrono::steady_clock::now();
     const Json::Value reply = registry_.dispatch(call.wire, call.caller);
-    const std::chrono::duration<double, std::milli> time = std::chrono::steady_clock::now() - begun;
+    note(call, reply, std::chrono::steady_clock::now() - begun);
+    call.reply(reply);
+}
+
+/// Logs what became of a call.
+void CallDispatcher::note(const Call &call, const Json::Value &reply, Milliseconds time) {
     OVRA_DEBUG("[%s] version [%d] method [%s] of user [%s] from [%s]: code [%d] in [%.1f]ms",
                call.wire.api.c_str(), call.wire.version, call.wire.method.c_str(),
                call.caller.user.c_str(), call.caller.address.c_str(), codeOf(reply), time.count());
-    call.reply(reply);
 }
 
 Json::Value CallDispatcher::serveLocal(const OvraPlatform::LocalCall &call) {
@@ -236,15 +287,15 @@ Json::Value CallDispatcher::serveLocal(const OvraPlatform::LocalCall &call) {
     caller.user = call.user;
     caller.administrator = true;
     caller.local = true;
-    const bool taken =
-        queues_.of(registry_.queue(call)).submit([this, call, caller, promise = promise] {
-            // Without a client the session library would note one in the environment, which threads
-            // must not change.
-            const OvraPlatform::ClientScope scope(kLoopback);
-            promise->set_value(registry_.dispatch(call, caller));
-        });
-    if (!taken) {
-        return busy();
+    const auto run = [this, call, caller, promise] {
+        // Without a client the session library would note one in the environment, which threads
+        // must not change.
+        const OvraPlatform::ClientScope scope(kLoopback);
+        promise->set_value(registry_.dispatch(call, caller));
+    };
+    const auto leave = [promise] { promise->set_value(busy()); };
+    if (!queues_.of(registry_.queue(call)).submit("", run, leave)) {
+        leave();
     }
     while (reply.wait_for(kLocalPause) != std::future_status::ready) {
         if (leaving_) {

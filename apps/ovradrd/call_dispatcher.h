@@ -12,36 +12,44 @@
 #include <json/value.h>
 
 #include <atomic>
+#include <chrono>
+#include <functional>
 #include <optional>
 #include <string>
+#include <string_view>
 
 namespace Ovradrd {
 
 /// The queues that calls run in.
 struct WorkQueues {
     OvraService::WorkQueue quick{
-        4, 512}; ///< reads calls, and runs those that answer from this machine alone
-    OvraService::WorkQueue outbound{16, 64};
-    OvraService::WorkQueue twoWay{16, 64};
-    OvraService::WorkQueue relay{8, 64};
+        4, {1024, 512}}; ///< reads calls, and runs those that answer from this machine alone
+    OvraService::WorkQueue outbound{16, {128, 64}};
+    OvraService::WorkQueue twoWay{16, {128, 64}};
+    OvraService::WorkQueue relay{8, {128, 64}};
     OvraService::WorkQueue login{
-        2, 64}; ///< log-ins: each hashes a password, with 64 MiB and a tenth of a second
+        2, {512, 64}}; ///< log-ins: each hashes a password, with 64 MiB and a tenth of a second
 
     OvraService::WorkQueue &of(OvraPlatform::APIQueue queue);
 };
 
-/// The path of a call from arrival to reply: read, unseal, find the session and its rights, choose
-/// the queue, run the handler, seal the reply.
+/// The path of a call from arrival to reply: unseal, find the session, judge name and rights, only
+/// then parse the parameters, choose the queue, run the handler, seal the reply.
 class CallDispatcher {
 public:
     /// Everything must outlive the dispatcher and the jobs in the queues.
     CallDispatcher(const OvraPlatform::APIRegistry &registry, const OvraPlatform::SealKeyPair &keys,
-                   OvraPlatform::ReplayGuard &guard, LoginApi &api, WorkQueues &queues);
+                   OvraPlatform::ReplayGuard &guard, WorkQueues &queues);
     CallDispatcher(const CallDispatcher &) = delete;
     CallDispatcher &operator=(const CallDispatcher &) = delete;
 
     /// Carries out the call in `request`. Does not wait; thread-safe.
     void serve(OvraService::HttpRequest request, const OvraService::HttpServer::Answer &answer);
+
+    /// Says of a call whose body is longer than a log-in's, by its beginning, whether the rest is
+    /// worth having: api, version, method and session have to stand there. Does not wait;
+    /// thread-safe.
+    void judge(OvraService::HttpRequest beginning, const OvraService::HttpServer::Verdict &verdict);
 
     /// Carries out the call of a local process, with an administrator's rights, and waits for its
     /// reply. Thread-safe.
@@ -55,19 +63,25 @@ public:
 
 private:
     struct Call;
+    using Milliseconds = std::chrono::duration<double, std::milli>;
 
+    void submit(OvraService::HttpRequest &&request, const OvraService::HttpServer::Answer &answer,
+                std::function<void(Call &, std::string &body)> process);
     void open(Call &call, std::string &body);
+    void openBeginning(Call &call, const std::string &beginning,
+                       const OvraService::HttpServer::Verdict &verdict);
+    [[nodiscard]] bool read(Call &call, std::string_view body) const;
     [[nodiscard]] bool unseal(Call &call);
-    [[nodiscard]] bool admit(Call &call);
+    [[nodiscard]] bool admit(Call &call) const;
+    [[nodiscard]] bool parse(Call &call) const;
     void route(Call call);
-    void login(Call call);
     void refuse(const Call &call) const;
     void run(const Call &call) const;
+    static void note(const Call &call, const Json::Value &reply, Milliseconds time);
 
     const OvraPlatform::APIRegistry &registry_;
     const OvraPlatform::SealKeyPair &keys_;
     OvraPlatform::ReplayGuard &guard_;
-    LoginApi &loginApi_;
     WorkQueues &queues_;
     std::atomic<bool> stopping_ = false;
     std::atomic<bool> leaving_ = false;

@@ -11,6 +11,7 @@
 #include "service/work_queue.h"
 #include "test_files.h"
 
+#include <ovrabase/address.h>
 #include <ovradrnode/dr_node.h>
 #include <ovradrnode/node_db.h>
 #include <ovraplatform/api_registry.h>
@@ -180,11 +181,15 @@ tl::expected<void, StartError> Daemon::start() {
     }
     self.httpsPort = https->front().port;
     self.httpPort = http->front().port;
-    self.farlink.emplace([&self](ConnectedClient client) { self.http->adopt(std::move(client)); });
+    self.farlink.emplace([&self](ConnectedClient client) {
+        self.loginApi.noteRelay(
+            OvraBase::addressText(reinterpret_cast<const sockaddr *>(&client.address)));
+        self.http->adopt(std::move(client));
+    });
     self.addHandlers();
     self.queues.emplace();
     self.retries.emplace(self.queues->outbound);
-    self.dispatcher.emplace(self.registry, *self.keys, self.guard, self.loginApi, *self.queues);
+    self.dispatcher.emplace(self.registry, *self.keys, self.guard, *self.queues);
     self.local.emplace(OvraPlatform::kSocketFile, [&self](const LocalCall &call) {
         return self.dispatcher->serveLocal(call);
     });
@@ -195,7 +200,10 @@ tl::expected<void, StartError> Daemon::start() {
         [&self](HttpRequest request, const HttpServer::Answer &answer) {
             self.dispatcher->serve(std::move(request), answer);
         },
-        self.settings.limits, testFiles(self.settings.testFiles));
+        self.settings.limits, testFiles(self.settings.testFiles),
+        [&self](HttpRequest beginning, const HttpServer::Verdict &verdict) {
+            self.dispatcher->judge(std::move(beginning), verdict);
+        });
     if (const auto started = self.http->start(std::move(*https), std::move(*http), *self.identity);
         !started) {
         return failed(started.error());

@@ -1,61 +1,105 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
+#include <ovraplatform/appliance.h>
+#include <ovraplatform/database.h>
+
+#include <tl/expected.hpp>
+
 #include <chrono>
+#include <cstddef>
+#include <cstdint>
+#include <ctime>
 #include <functional>
-#include <map>
 #include <mutex>
 #include <optional>
 #include <string>
+#include <string_view>
+#include <vector>
 
 namespace Ovradrd {
 
-/// Slows down the guessing of passwords and one-time codes, per account and per client address (an
-/// IPv6 client's /64 network). Three failures are free; from then on log-ins of that account, or of
-/// that address, begin at least 0.25 s apart, and the time doubles with every further failure up to
-/// 8 s. One failure is forgiven per minute.
+/// Limits the guessing of passwords and one-time codes to 100 guesses an hour at one account, and
+/// keeps nobody out who logged in before.
 ///
-/// Simultaneous log-ins queue up, so that many connections guess no faster than one; one that would
-/// wait longer than kMaxWait is refused. Nothing survives the process. Thread-safe.
+/// Each client has a budget of guesses at each account. Those that logged in to the account before,
+/// known by their device token or, for 90 days, by their address, share one half of the account's
+/// guesses, all others the other half: however many strangers guess, they leave the known ones
+/// theirs. A stranger also has a budget for all accounts together. A log-in counts as a guess until
+/// it turns out to be right.
+///
+/// The counts are in a SQLite file, so they hold across restarts and processes. A file that cannot
+/// be used is logged; then guesses are counted in memory, and the file is tried again ten minutes
+/// later. Neither the system clock nor changes of it matter while the process runs; at its start
+/// counts that lie in the future mean that their budget is used up, and no more. Thread-safe.
 class LoginThrottle {
 public:
-    using TimePoint = std::chrono::steady_clock::time_point;
-    using Clock = std::function<TimePoint()>;
+    struct Clock {
+        std::function<std::chrono::milliseconds()> elapsed; ///< since any instant; is never set
+        std::function<std::time_t()> system;                ///< seconds of the system clock
+    };
 
-    static constexpr std::chrono::milliseconds kMaxWait{16000};
-    /// How many accounts, and addresses, are remembered; beyond that, those with the fewest
-    /// failures are dropped.
-    static constexpr std::size_t kMaxEntries = 4096;
+    /// A log-in and where it comes from.
+    struct Login {
+        std::string account;
+        std::string address; ///< numeric; "": through the relay, which hides it
+        std::string device;  ///< the client's device token; "": none
+    };
 
-    explicit LoginThrottle(Clock clock = std::chrono::steady_clock::now);
+    /// An admitted log-in.
+    class Attempt {
+        friend class LoginThrottle;
+        struct Charge {
+            std::string key;
+            std::int64_t cost; ///< milliseconds
+        };
+        std::vector<Charge> charges_;
+    };
 
-    /// Asks for a log-in. It counts as failed until withdraw() or recordSuccess() says otherwise.
-    /// \return how long to wait before the password is checked; std::nullopt: refuse it unchecked
-    ///         (then it is not counted).
-    std::optional<std::chrono::milliseconds> admit(const std::string &account,
-                                                   const std::string &address);
-    /// The log-in was no guess: it lacked the one-time code only, or could not be checked.
-    void withdraw(const std::string &account, const std::string &address);
-    /// The log-in was right: the failures of the account are forgotten. Those of the address stay,
-    /// so that a log-in to one's own account does not pay for guessing others.
-    void recordSuccess(const std::string &account, const std::string &address);
+    /// How many budgets are kept; beyond that, those of which least is used are forgotten.
+    static constexpr int kMaxBudgets = 16384;
+    /// How many known clients are kept of one account, and of all; beyond that, the oldest are
+    /// forgotten.
+    static constexpr int kMaxKnown = 32;
+    static constexpr int kMaxKnownOfAll = 65536;
+
+    explicit LoginThrottle(std::string path = OvraPlatform::kLoginsFile,
+                           Clock clock = systemClock());
+
+    /// Asks for a log-in and counts it as a guess.
+    /// \return how long to wait if there were too many guesses: nothing is counted, and the
+    ///         password must not be checked.
+    [[nodiscard]] tl::expected<Attempt, std::chrono::seconds> admit(const Login &login);
+    /// It was no guess: it lacked the one-time code only, or could not be checked.
+    void withdraw(const Attempt &attempt);
+    /// It was right: it was no guess, and the client is known from now on.
+    void recordSuccess(const Login &login, const Attempt &attempt);
 
 private:
-    struct Entry {
-        int failures = 0;
-        TimePoint counted; ///< failures are forgiven up to this time
-        TimePoint begun;   ///< when the last admitted log-in begins
-    };
-    using Entries = std::map<std::string, Entry>;
+    using Database = OvraPlatform::Database;
+    struct Budget;
+    struct Use;
 
-    static Entry &entryOf(Entries &entries, const std::string &key, TimePoint now);
-    static void dropSmallest(Entries &entries, TimePoint now);
-    static void undoFailure(Entries &entries, const std::string &key);
+    static Clock systemClock();
+    static bool isKnown(Database &database, const std::string &account, const std::string &client,
+                        std::int64_t since);
+    static bool remember(Database &database, const std::string &account, const std::string &client,
+                         std::int64_t now);
+    static bool refund(Database &database, const Attempt &attempt);
+    static bool bound(Database &database, std::int64_t now);
+    static bool sweep(Database &database, std::int64_t now);
 
-    Clock clock_;
+    bool change(const std::function<bool(Database &)> &work);
+    bool admitIn(Database &database, const Login &login, Attempt &attempt,
+                 std::chrono::milliseconds &wait) const;
+    std::int64_t now() const;
+
+    const std::string path_;
+    const Clock clock_;
+    const std::int64_t begin_; ///< of now(), at clock_.elapsed() == 0
     std::mutex mutex_;
-    Entries accounts_;
-    Entries addresses_;
+    std::int64_t fileFrom_ = 0; ///< from when on the file is tried again
+    std::optional<Database> memory_;
 };
 
 } // namespace Ovradrd

@@ -63,10 +63,12 @@ tl::expected<Ovradrd::Settings, StartError> readSettings() {
 void waitForEnd(Daemon &daemon, const OvraService::EndSignals &signals) {
     while (!signals.wait(kWorkPeriod)) {
         daemon.doPeriodicWork();
+        OvraService::returnFreedMemory();
     }
 }
 
 int serve() {
+    OvraService::keepMemorySmall();
     const OvraService::EndSignals signals;
     OvraService::raiseDescriptorLimit(kDescriptors);
 

@@ -27,7 +27,7 @@ void ReleaseRetries::begin() {
         }
         underWay_ = false;
     };
-    if (!queue_.submit(job)) {
+    if (!queue_.submit("", job)) {
         underWay_ = false;
     }
 }

@@ -4,9 +4,9 @@
 #include <chrono>
 #include <condition_variable>
 #include <cstddef>
+#include <cstdint>
 #include <memory>
 #include <mutex>
-#include <optional>
 #include <string>
 #include <thread>
 #include <unordered_map>
@@ -15,14 +15,19 @@ namespace OvraService {
 
 /// The limit of connections, and of the time each phase may take.
 struct ConnectionLimits {
-    /// From the connection, or the first header, to the end of the request: an inactivity time-out
-    /// alone would let a client send a byte now and then forever.
-    std::chrono::milliseconds arriving{20'000};
-    /// Between two requests, until the header of the second is complete. Longer than this system's
-    /// clients keep an idle connection, so that the client closes it.
-    std::chrono::milliseconds idle{60'000};
-    std::chrono::milliseconds replying{30'000}; ///< from the reply's first byte to its last
-    std::chrono::milliseconds sending{600'000}; ///< the same of a test file
+    /// From the connection to the end of the first request, TLS handshake included, and from the
+    /// first byte to the end of every further one: an inactivity time-out alone would let a client
+    /// send a byte now and then forever.
+    std::chrono::milliseconds arriving{15'000};
+    /// Between two requests, until the first byte of the second. Longer than this system's clients
+    /// keep an idle connection, so that the client closes it.
+    std::chrono::milliseconds idle{40'000};
+    std::chrono::milliseconds replying{15'000}; ///< from the reply's first byte to its last
+    std::chrono::milliseconds sending{600'000}; ///< of a test file, however slow its client
+    /// Bytes a second. A body or reply that travels this fast has all the time that it needs: the
+    /// bytes that have passed lengthen the time for the rest. The least of what links between
+    /// appliances carry, 64 kbit/s.
+    std::size_t leastRate = 8 * 1024;
     std::size_t total = 1024;
     std::size_t perClient = 768;
 };
@@ -38,7 +43,7 @@ public:
         kIdle,     ///< waits for the client's next request
         kWorking,  ///< waits for us, without a deadline: the queues bound it
         kReplying, ///< waits for the client to take the reply
-        kSending,  ///< the same for a test file
+        kSending,  ///< the same for a test file, which has its own limit besides
     };
     struct Connection;
 
@@ -53,9 +58,11 @@ public:
     Connection *open(int fd, const std::string &client);
     void close(Connection *connection);
 
-    /// A request begins: an idle connection's deadline becomes that of arriving, a new connection's
-    /// stays.
+    /// A request begins: an idle connection's deadline becomes that of arriving, unless its first
+    /// byte came earlier; a new connection's stays.
     void beginRequest(Connection *connection);
+    /// A part of the request's body has arrived.
+    void progress(Connection *connection, std::size_t bytes);
     void enter(Connection *connection, Phase phase);
 
 private:
@@ -63,7 +70,9 @@ private:
 
     void watch();
     void shutOverdue();
-    std::optional<std::chrono::milliseconds> limitOf(Phase phase) const;
+    void look(Connection &connection, Clock::time_point now) const;
+    void lengthen(Connection &connection, std::uint64_t bytes, Clock::time_point now) const;
+    bool isOverdue(const Connection &connection, Clock::time_point now) const;
     void uncount(Connection &connection);
     void shut(Connection &connection);
     [[nodiscard]] bool makeRoom(const std::string *client);

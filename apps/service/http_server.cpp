@@ -13,6 +13,7 @@
 #include <gnutls/gnutls.h>
 #include <microhttpd.h>
 
+#include <algorithm>
 #include <array>
 #include <atomic>
 #include <condition_variable>
@@ -100,7 +101,7 @@ __attribute__((format(printf, 2, 0))) void logLibrary(void * /*self*/, const cha
 
 /// One request, from its header to the end of its reply.
 struct Exchange {
-    enum class State { kArriving, kWorking, kAnswered };
+    enum class State { kArriving, kJudged, kWorking, kAnswered };
 
     MHD_Connection *connection = nullptr;
     Connections::Connection *watched = nullptr;
@@ -113,6 +114,8 @@ struct Exchange {
     unsigned int status = MHD_HTTP_OK;
     std::string document;
     std::string body;
+    std::size_t announced = 0;      ///< of the body
+    std::size_t allowed = 0;        ///< of the body, so far
     bool discard = false;           ///< the body is thrown away: the reply is there already
     bool dropped = false;           ///< the connection ends without a reply
     std::optional<ServedFile> file; ///< what is replied instead of the document
@@ -128,13 +131,32 @@ struct Exchange {
     /// Wakes the sleeping connection with the reply, or to its end; the first one counts.
     void answer(std::optional<std::string> text) {
         const std::lock_guard lock(mutex);
-        if (state != State::kWorking) {
+        if (state == State::kJudged && !text) {
+            discard = true;
+        } else if (state != State::kWorking) {
             return;
         }
         dropped = !text;
         document = std::move(text).value_or("");
         state = State::kAnswered;
         watch->enter(watched, Phase::kReplying);
+        MHD_resume_connection(connection);
+    }
+
+    /// Wakes the connection whose body was judged by its beginning.
+    void proceed(std::optional<std::string> refusal, std::size_t limit) {
+        const std::lock_guard lock(mutex);
+        if (state != State::kJudged) {
+            return;
+        }
+        state = State::kArriving;
+        if (refusal) {
+            document = *std::move(refusal);
+            discard = true;
+        } else {
+            allowed = limit;
+            body.reserve(std::min(announced, limit));
+        }
         MHD_resume_connection(connection);
     }
 };
@@ -147,8 +169,10 @@ struct HttpServer::Impl {
         std::unique_ptr<MHD_Daemon, StopMhd> daemon;
     };
 
-    Impl(Handler requestHandler, const HttpLimits &httpLimits, std::optional<FileSource> fileSource)
+    Impl(Handler requestHandler, const HttpLimits &httpLimits, std::optional<FileSource> fileSource,
+         Judge bodyJudge)
         : handler(std::move(requestHandler))
+        , judge(std::move(bodyJudge))
         , limits(httpLimits)
         , source(std::move(fileSource))
         , connections(httpLimits.connections) {}
@@ -174,7 +198,9 @@ struct HttpServer::Impl {
     MHD_Result begin(MHD_Connection *connection, bool secure, std::string_view url,
                      std::string_view method, void **context);
     void offerFile(Exchange &exchange, std::string_view url);
-    void take(Exchange &exchange, const char *data, std::size_t size);
+    std::size_t take(Exchange &exchange, const char *data, std::size_t size);
+    void askJudge(Exchange &exchange);
+    std::shared_ptr<Exchange> shared(Exchange &exchange);
     void handOver(Exchange &exchange);
     MHD_Result reply(Exchange &exchange);
     MHD_Result sendFile(Exchange &exchange);
@@ -182,6 +208,7 @@ struct HttpServer::Impl {
     void giveBack(Exchange &exchange);
 
     const Handler handler;
+    const Judge judge;
     const HttpLimits limits;
     const std::optional<FileSource> source;
     Connections connections;
@@ -232,15 +259,20 @@ MHD_Result HttpServer::Impl::onRequest(void *endpoint, MHD_Connection *connectio
             return server.begin(connection, here.secure, url, method, context);
         }
         Exchange &exchange = *static_cast<Exchange *>(*context);
-        if (*size > 0) {
-            server.take(exchange, data, *size);
-            *size = 0;
-            return MHD_YES;
-        }
         bool ready = false;
         {
             const std::lock_guard lock(exchange.mutex);
+            if (exchange.state == Exchange::State::kJudged) {
+                return MHD_YES; // the next part waits with it
+            }
             ready = exchange.discard || exchange.state == Exchange::State::kAnswered;
+            if (*size > 0 && exchange.dropped) {
+                return MHD_NO;
+            }
+        }
+        if (*size > 0) {
+            *size -= server.take(exchange, data, *size);
+            return MHD_YES;
         }
         if (ready) {
             return server.reply(exchange);
@@ -277,6 +309,8 @@ MHD_Result HttpServer::Impl::begin(MHD_Connection *connection, bool secure, std:
     connections.beginRequest(exchange->watched);
 
     const std::uint64_t length = announcedLength(connection);
+    exchange->announced = length;
+    exchange->allowed = judge ? limits.unjudged : limits.body;
     const bool reads = method == MHD_HTTP_METHOD_GET || method == MHD_HTTP_METHOD_HEAD;
     if (reads && source && url.starts_with(source->prefix)) {
         offerFile(*exchange, url);
@@ -306,23 +340,44 @@ MHD_Result HttpServer::Impl::begin(MHD_Connection *connection, bool secure, std:
     return handle->discard && length > kMaxThrownAway ? reply(*handle) : MHD_YES;
 }
 
-/// A part of the body.
-void HttpServer::Impl::take(Exchange &exchange, const char *data, std::size_t size) {
+/// A part of the body. \return how much of it was taken; the rest comes again.
+std::size_t HttpServer::Impl::take(Exchange &exchange, const char *data, std::size_t size) {
     if (exchange.discard) {
-        return;
+        return size;
     }
-    if (exchange.body.size() + size > limits.body) {
+    const std::size_t before = exchange.body.size();
+    const std::size_t taken = std::min(size, exchange.allowed - before);
+    if (before + size > limits.body) {
         exchange.refuse(MHD_HTTP_OK, APIError::kTooLarge,
                         "the request is too large: send less at once");
-    } else if (buffered + size > limits.bodies) {
+    } else if (buffered + taken > limits.bodies) {
         exchange.refuse(MHD_HTTP_OK, APIError::kTooBusy,
                         "too many large requests arrive at once: try again later");
     } else {
-        buffered += size;
-        exchange.body.append(data, size);
-        return;
+        buffered += taken;
+        exchange.body.append(data, taken);
+        connections.progress(exchange.watched, taken);
+        if (taken < size) {
+            askJudge(exchange);
+        }
+        return taken;
     }
     giveBack(exchange);
+    return size;
+}
+
+/// Has the beginning of the body judged while the connection sleeps, its deadline running on.
+void HttpServer::Impl::askJudge(Exchange &exchange) {
+    const std::shared_ptr<Exchange> held = shared(exchange);
+    {
+        const std::lock_guard lock(exchange.mutex);
+        exchange.state = Exchange::State::kJudged;
+        MHD_suspend_connection(exchange.connection);
+    }
+    judge({exchange.body, exchange.address, exchange.secure},
+          [held, limit = limits.body](std::optional<std::string> refusal) {
+              held->proceed(std::move(refusal), limit);
+          });
 }
 
 /// Wipes and frees the body of a request.
@@ -332,13 +387,14 @@ void HttpServer::Impl::giveBack(Exchange &exchange) {
     exchange.body = std::string();
 }
 
+std::shared_ptr<Exchange> HttpServer::Impl::shared(Exchange &exchange) {
+    const std::lock_guard lock(mutex);
+    return exchanges.at(&exchange);
+}
+
 /// The request is complete.
 void HttpServer::Impl::handOver(Exchange &exchange) {
-    std::shared_ptr<Exchange> shared;
-    {
-        const std::lock_guard lock(mutex);
-        shared = exchanges.at(&exchange);
-    }
+    const std::shared_ptr<Exchange> held = shared(exchange);
     HttpRequest request;
     {
         const std::lock_guard lock(exchange.mutex);
@@ -350,9 +406,9 @@ void HttpServer::Impl::handOver(Exchange &exchange) {
         MHD_suspend_connection(exchange.connection);
     }
     // From here on the exchange may be answered, or even destroyed, at any moment.
-    const Answer answer = [shared](std::string document) { shared->answer(std::move(document)); };
+    const Answer answer = [held](std::string document) { held->answer(std::move(document)); };
     if (closing) {
-        shared->answer(std::nullopt);
+        held->answer(std::nullopt);
         return;
     }
     handler(std::move(request), answer);
@@ -480,8 +536,10 @@ bool HttpServer::Impl::open(Listener listener, bool secure, const TlsIdentity &i
     return true;
 }
 
-HttpServer::HttpServer(Handler handler, const HttpLimits &limits, std::optional<FileSource> files)
-    : impl_(std::make_unique<Impl>(std::move(handler), limits, std::move(files))) {}
+HttpServer::HttpServer(Handler handler, const HttpLimits &limits, std::optional<FileSource> files,
+                       Judge judge)
+    : impl_(
+          std::make_unique<Impl>(std::move(handler), limits, std::move(files), std::move(judge))) {}
 
 HttpServer::~HttpServer() {
     stop();

@@ -22,6 +22,8 @@ namespace OvraService {
 struct HttpLimits {
     ConnectionLimits connections;
     std::size_t body = std::size_t{1} * 1024 * 1024;
+    /// Of a body, before the judge has seen it: what a log-in needs.
+    std::size_t unjudged = std::size_t{16} * 1024;
     /// For all bodies not handed over yet, together.
     std::size_t bodies = std::size_t{64} * 1024 * 1024;
 };
@@ -70,8 +72,14 @@ public:
     /// Receives every complete request, in a thread of the server: it must not wait.
     using Handler = std::function<void(HttpRequest request, Answer answer)>;
 
+    /// Receives the first HttpLimits::unjudged bytes of a longer body, and the address, and says
+    /// whether the rest is taken in: a refusal, or std::nullopt. Like a handler otherwise.
+    using Verdict = std::function<void(std::optional<std::string> refusal)>;
+    using Judge = std::function<void(HttpRequest beginning, Verdict verdict)>;
+
+    /// \param judge  if there is none, every body up to HttpLimits::body is taken in
     HttpServer(Handler handler, const HttpLimits &limits,
-               std::optional<FileSource> files = std::nullopt);
+               std::optional<FileSource> files = std::nullopt, Judge judge = {});
     HttpServer(const HttpServer &) = delete;
     HttpServer &operator=(const HttpServer &) = delete;
     /// Stops.

@@ -3,6 +3,7 @@
 
 #include <ovradrcore/log.h>
 
+#include <malloc.h>
 #include <pthread.h>
 #include <sys/resource.h>
 #include <unistd.h>
@@ -52,6 +53,23 @@ void raiseDescriptorLimit(unsigned long count) {
                   "the limit of open files",
                   static_cast<unsigned long long>(limit.rlim_cur));
     }
+}
+
+void keepMemorySmall() {
+#ifdef __GLIBC__
+    // Large pieces, bodies and replies, come from the system and go back to it at once; a fixed
+    // threshold is not raised by the first of them that is freed, as the default one is. Few
+    // arenas, because each keeps its own freed memory.
+    mallopt(M_MMAP_THRESHOLD, 128 * 1024);
+    mallopt(M_TRIM_THRESHOLD, 1024 * 1024);
+    mallopt(M_ARENA_MAX, 4);
+#endif
+}
+
+void returnFreedMemory() {
+#ifdef __GLIBC__
+    malloc_trim(0);
+#endif
 }
 
 struct EndSignals::State {

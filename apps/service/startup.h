@@ -41,6 +41,12 @@ int reportStartError(const char *program, const std::exception &why);
 /// lower limit is a warning in the log.
 void raiseDescriptorLimit(unsigned long count);
 
+/// Has the C library keep little of the memory that is freed. Call it before threads start.
+void keepMemorySmall();
+/// Gives all freed memory back to the system, which a large tree of small pieces otherwise leaves
+/// in the holes between what is still in use. Takes milliseconds: call it now and then.
+void returnFreedMemory();
+
 /// Waits in a thread of its own for the signals that end a daemon (SIGTERM, SIGINT, SIGHUP). They
 /// end the process in any case: at the latest 10 seconds after the first one came, also while it
 /// starts.

@@ -3,60 +3,133 @@
 
 #include <ovradrcore/log.h>
 
+#include <algorithm>
 #include <condition_variable>
+#include <deque>
 #include <exception>
+#include <iterator>
+#include <list>
 #include <map>
 #include <mutex>
+#include <optional>
 #include <thread>
+#include <unordered_map>
 #include <utility>
 #include <vector>
 
 namespace OvraService {
 
+namespace {
+
+/// How many threads one client may occupy: a quarter is left to the others.
+unsigned int shareOf(unsigned int threads) {
+    return threads > 1 ? threads - std::max(1U, threads / 4) : threads;
+}
+
+} // namespace
+
 struct WorkQueue::Impl {
-    explicit Impl(std::size_t most)
-        : capacity(most) {}
+    struct Waiting {
+        Job job;
+        Job refuse;
+    };
+    struct Client {
+        std::string name;
+        std::deque<Waiting> due;
+        std::size_t waiting = 0; ///< due and delayed
+        unsigned int running = 0;
+    };
+    using Clients = std::list<Client>;
+    struct Delayed {
+        Clients::iterator client;
+        Waiting entry;
+    };
+
+    Impl(unsigned int threadCount, const Limits &most)
+        : limits(most)
+        , share(shareOf(threadCount)) {}
 
     void work();
-    /// Waits for the next due job; an empty one if the queue stops.
-    Job take(std::unique_lock<std::mutex> &lock);
+    Clients::iterator take(std::unique_lock<std::mutex> &lock, Job &job);
+    void wakeDue();
+    Clients::iterator clientOf(const std::string &name);
+    void forgetIdle(Clients::iterator client);
+    std::optional<Waiting> makeRoom(const Client &client);
 
-    const std::size_t capacity;
+    const Limits limits;
+    const unsigned int share;
     std::mutex mutex;
     std::condition_variable jobsChanged;
     std::condition_variable jobEnded;
-    std::multimap<TimePoint, Job> waiting; ///< by the time at which each is due
+    Clients clients; ///< with a job, in the order of their turns
+    std::unordered_map<std::string, Clients::iterator> byName;
+    std::multimap<TimePoint, Delayed> delayed; ///< by the time at which each is due
+    std::size_t waiting = 0;
     unsigned int running = 0;
     bool stopping = false;
     std::vector<std::thread> threads;
 };
 
-WorkQueue::Job WorkQueue::Impl::take(std::unique_lock<std::mutex> &lock) {
+WorkQueue::Impl::Clients::iterator WorkQueue::Impl::clientOf(const std::string &name) {
+    const auto found = byName.find(name);
+    if (found != byName.end()) {
+        return found->second;
+    }
+    clients.push_back({name, {}, 0, 0});
+    return byName.emplace(name, std::prev(clients.end())).first->second;
+}
+
+void WorkQueue::Impl::forgetIdle(Clients::iterator client) {
+    if (client->waiting == 0 && client->running == 0) {
+        byName.erase(client->name);
+        clients.erase(client);
+    }
+}
+
+void WorkQueue::Impl::wakeDue() {
+    const auto end = delayed.upper_bound(std::chrono::steady_clock::now());
+    for (auto next = delayed.begin(); next != end; next = delayed.erase(next)) {
+        next->second.client->due.push_back(std::move(next->second.entry));
+    }
+}
+
+/// Waits for a job that may run, of the client whose turn it is. \return clients.end() if the queue
+/// stops.
+WorkQueue::Impl::Clients::iterator WorkQueue::Impl::take(std::unique_lock<std::mutex> &lock,
+                                                         Job &job) {
     while (!stopping) {
-        if (waiting.empty()) {
-            jobsChanged.wait(lock);
+        wakeDue();
+        const auto next =
+            std::find_if(clients.begin(), clients.end(), [this](const Client &client) {
+                return !client.due.empty() && client.running < share;
+            });
+        if (next == clients.end()) {
+            if (delayed.empty()) {
+                jobsChanged.wait(lock);
+            } else {
+                const TimePoint due = delayed.begin()->first;
+                jobsChanged.wait_until(lock, due);
+            }
             continue;
         }
-        const auto next = waiting.begin();
-        if (next->first > std::chrono::steady_clock::now()) {
-            const TimePoint due = next->first;
-            jobsChanged.wait_until(lock, due);
-            continue;
-        }
-        Job job = std::move(next->second);
-        waiting.erase(next);
-        if (!waiting.empty()) {
+        job = std::move(next->due.front().job);
+        next->due.pop_front();
+        --next->waiting;
+        ++next->running;
+        clients.splice(clients.end(), clients, next);
+        if (--waiting > 0) {
             // The thread woken for it may have been this one.
             jobsChanged.notify_one();
         }
-        return job;
+        return next;
     }
-    return {};
+    return clients.end();
 }
 
 void WorkQueue::Impl::work() {
     std::unique_lock lock(mutex);
-    while (Job job = take(lock)) {
+    Job job;
+    for (auto client = take(lock, job); job; client = take(lock, job)) {
         ++running;
         lock.unlock();
         try {
@@ -68,12 +141,38 @@ void WorkQueue::Impl::work() {
         job = nullptr;
         lock.lock();
         --running;
+        --client->running;
+        forgetIdle(client);
         jobEnded.notify_all();
     }
 }
 
-WorkQueue::WorkQueue(unsigned int threads, std::size_t capacity)
-    : impl_(std::make_unique<Impl>(capacity)) {
+/// Takes the last job from the client with the most waiting ones, if it has more than `client`.
+std::optional<WorkQueue::Impl::Waiting> WorkQueue::Impl::makeRoom(const Client &client) {
+    const auto longest =
+        std::max_element(clients.begin(), clients.end(),
+                         [](const Client &a, const Client &b) { return a.waiting < b.waiting; });
+    if (longest->waiting <= client.waiting + 1) {
+        return std::nullopt;
+    }
+    Waiting victim;
+    if (longest->due.empty()) {
+        const auto last = std::find_if(delayed.rbegin(), delayed.rend(), [&](const auto &entry) {
+            return entry.second.client == longest;
+        });
+        victim = std::move(last->second.entry);
+        delayed.erase(std::prev(last.base()));
+    } else {
+        victim = std::move(longest->due.back());
+        longest->due.pop_back();
+    }
+    --longest->waiting;
+    --waiting;
+    return victim;
+}
+
+WorkQueue::WorkQueue(unsigned int threads, const Limits &limits)
+    : impl_(std::make_unique<Impl>(threads, limits)) {
     try {
         for (unsigned int i = 0; i < threads; ++i) {
             impl_->threads.emplace_back([impl = impl_.get()] { impl->work(); });
@@ -95,28 +194,58 @@ void WorkQueue::end() {
     }
 }
 
-bool WorkQueue::submit(Job job, std::chrono::milliseconds delay) {
+bool WorkQueue::submit(const std::string &client, Job job, Job refuse,
+                       std::chrono::milliseconds delay) {
+    std::optional<Impl::Waiting> victim; // outlives the lock: its destructor may take others
     {
         const std::lock_guard lock(impl_->mutex);
-        if (impl_->stopping || impl_->waiting.size() >= impl_->capacity) {
+        if (impl_->stopping) {
             return false;
         }
-        impl_->waiting.emplace(std::chrono::steady_clock::now() + delay, std::move(job));
+        const auto owner = impl_->clientOf(client);
+        bool room = owner->waiting < impl_->limits.ofOneClient;
+        if (room && impl_->waiting >= impl_->limits.total) {
+            victim = impl_->makeRoom(*owner);
+            room = victim.has_value();
+        }
+        if (!room) {
+            impl_->forgetIdle(owner);
+            return false;
+        }
+        Impl::Waiting entry{std::move(job), std::move(refuse)};
+        if (delay.count() > 0) {
+            impl_->delayed.emplace(std::chrono::steady_clock::now() + delay,
+                                   Impl::Delayed{owner, std::move(entry)});
+        } else {
+            owner->due.push_back(std::move(entry));
+        }
+        ++owner->waiting;
+        ++impl_->waiting;
     }
     impl_->jobsChanged.notify_one();
+    if (victim && victim->refuse) {
+        victim->refuse();
+    }
     return true;
 }
 
 bool WorkQueue::stop(TimePoint deadline) {
-    std::multimap<TimePoint, Job> dropped;
+    std::vector<std::deque<Impl::Waiting>> dropped;
+    std::multimap<TimePoint, Impl::Delayed> droppedLater;
     std::unique_lock lock(impl_->mutex);
     impl_->stopping = true;
-    dropped.swap(impl_->waiting);
+    droppedLater.swap(impl_->delayed);
+    for (Impl::Client &client : impl_->clients) {
+        dropped.push_back(std::exchange(client.due, {}));
+        client.waiting = 0;
+    }
+    impl_->waiting = 0;
     impl_->jobsChanged.notify_all();
     // Another thread may wait for what a dropped job holds, or hold a lock that its destructor
     // takes.
     lock.unlock();
     dropped.clear();
+    droppedLater.clear();
     lock.lock();
     return impl_->jobEnded.wait_until(lock, deadline, [this] { return impl_->running == 0; });
 }

@@ -176,15 +176,12 @@ FlowResult changeCredential(OvraDRNode::DRNodeCredSet &flow, const DRNode &recor
         if (!flow.setCredId(record.credId)) {
             return false;
         }
+        flow.setStoredConn(conn);
         if (!flow.process()) {
             if (flow.IsSessionChanged()) {
                 releaseLater(noteFor(record, flow.getNewSession(), conn));
             }
             return false;
-        }
-        if (conn.isFarlink()) {
-            // The flow stores what the alias stands for today. The log says why this fails.
-            (void)DRNodeDB::SetConn(record.credId, conn);
         }
         return true;
     });

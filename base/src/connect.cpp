@@ -10,6 +10,7 @@
 #include <cerrno>
 #include <csignal>
 #include <cstring>
+#include <exception>
 #include <future>
 #include <iterator>
 #include <memory>
@@ -59,6 +60,13 @@ Expected<Addresses> lookUp(const std::string &host, int port) {
         }
     }
     return found;
+}
+
+/// Whether connect(2) has no address of ours to come from. It gives the same errno if the local
+/// ports of TCP are used up; those of UDP are others. Nothing is sent.
+bool lacksLocalAddress(const SocketAddress &peer) {
+    const UniqueFd fd(socket(peer.storage.ss_family, SOCK_DGRAM | SOCK_CLOEXEC, 0));
+    return fd && connect(fd.get(), peer.get(), peer.size) != 0 && errno == EADDRNOTAVAIL;
 }
 
 /// Starts a thread that the signals of the process do not reach. \return 0, or the errno
@@ -134,7 +142,8 @@ private:
             running_.push_back({std::move(fd), address});
             nextStart_ = Clock::now() + kAttemptDelay;
         } else {
-            fail(errno);
+            const int error = errno;
+            fail(error == EADDRNOTAVAIL && lacksLocalAddress(address) ? ENETUNREACH : error);
         }
         return std::nullopt;
     }
@@ -176,7 +185,7 @@ private:
     Deadline deadline_;
     Clock::time_point nextStart_ = Clock::time_point::min();
     std::vector<Connection> running_;
-    int lastError_ = EADDRNOTAVAIL;
+    int lastError_ = ENETUNREACH;
     int shortage_ = 0;
 };
 
@@ -184,7 +193,7 @@ private:
 
 bool isShortage(int number) {
     return number == EMFILE || number == ENFILE || number == ENOMEM || number == ENOBUFS ||
-           number == EAGAIN;
+           number == EAGAIN || number == EADDRNOTAVAIL;
 }
 
 Expected<std::vector<SocketAddress>> resolveHost(const std::string &host, int port,
@@ -192,9 +201,16 @@ Expected<std::vector<SocketAddress>> resolveHost(const std::string &host, int po
     if (const auto numeric = parseAddress(host, port)) {
         return Addresses{*numeric};
     }
-    std::packaged_task<Expected<Addresses>()> task([host, port] { return lookUp(host, port); });
-    std::future<Expected<Addresses>> found = task.get_future();
-    if (const int error = startQuietly(std::move(task)); error != 0) {
+    std::promise<Expected<Addresses>> answer;
+    std::future<Expected<Addresses>> found = answer.get_future();
+    const int error = startQuietly([host, port, answer = std::move(answer)]() mutable {
+        try {
+            answer.set_value(lookUp(host, port));
+        } catch (const std::exception &) {
+            answer.set_exception(std::current_exception());
+        }
+    });
+    if (error != 0) {
         return systemError(error);
     }
     if (found.wait_until(deadline) != std::future_status::ready) {

@@ -7,6 +7,8 @@
 #include "ovradrcore/log.h"
 #include "refresh_lock.h"
 
+#include <ovrabase/number.h>
+
 #include <algorithm>
 #include <chrono>
 #include <optional>
@@ -40,7 +42,7 @@ std::optional<Stored> load(const std::string &path, const std::string &name, int
     if (!entry || !fromString(stored.value, entry->value)) {
         return std::nullopt;
     }
-    stored.age = systemMilliseconds() - entry->end;
+    stored.age = OvraBase::saturatingDifference(systemMilliseconds(), entry->end);
     return stored;
 }
 
@@ -198,23 +200,18 @@ bool Cache::Update() const {
 }
 
 Cache::Refresh Cache::refresh(Json::Value &value) const {
-    const std::int64_t start = systemMilliseconds();
+    const std::int64_t start = Now();
     const bool fetched = [&] {
         const Refreshing mark(path_, name_);
         return GetUpdatedData(value);
     }();
-    const std::int64_t now = systemMilliseconds();
-    // The clock may have been set back.
-    const std::int64_t end = now < start ? now : std::min(now, start + kLongest);
-    const CacheFile file(path_);
     if (!fetched) {
-        file.write({failureOf(name_), "", now, now, 0}, now);
+        const std::int64_t now = Now();
+        CacheFile(path_).write({failureOf(name_), "", now, now, 0}, now);
         return Refresh::kFailed;
     }
-    return file.write({name_, toString(value), start, end, lifetime_ * kSecond},
-                      systemMilliseconds(), CacheFile::Younger::kKeep)
-               ? Refresh::kStored
-               : Refresh::kFetched; // whoever asked has it all the same
+    // Whoever asked has what could not be stored all the same.
+    return UpdateWithFinding(value, start) ? Refresh::kStored : Refresh::kFetched;
 }
 
 bool Cache::UpdateWithData(const Json::Value &value) const {
@@ -229,6 +226,18 @@ bool Cache::UpdateWithData(const Json::Value &value, long start, long end) const
     const std::int64_t ended = end == now / kSecond ? now : end * kSecond;
     return CacheFile(path_).write(
         {name_, toString(value), start * kSecond, ended, lifetime_ * kSecond}, now);
+}
+
+std::int64_t Cache::Now() {
+    return systemMilliseconds();
+}
+
+bool Cache::UpdateWithFinding(const Json::Value &value, std::int64_t start) const {
+    const std::int64_t now = Now();
+    // The clock may have been set back.
+    const std::int64_t end = now < start ? now : std::min(now, start + kLongest);
+    return CacheFile(path_).write({name_, toString(value), start, end, lifetime_ * kSecond}, now,
+                                  CacheFile::Younger::kKeep);
 }
 
 bool Cache::Remove() {

@@ -1,6 +1,8 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "cache_bucket.h"
 
+#include <ovrabase/number.h>
+
 #include <xxhash.h>
 
 #include <cstring>
@@ -78,6 +80,10 @@ CacheEntry toEntry(const EntryHeader &header, std::string_view name, std::string
 
 } // namespace
 
+bool isLongPast(std::int64_t end, std::int64_t lifetime, std::int64_t oldest) {
+    return end < OvraBase::saturatingDifference(oldest, lifetime);
+}
+
 std::uint64_t BucketImage::claimedSequence(const std::byte *copy) {
     return headerOf(copy).sequence;
 }
@@ -90,7 +96,7 @@ std::optional<std::uint64_t> BucketImage::check(const std::byte *copy, std::uint
     }
     if (header.magic != kMagic || header.bucketCount != bucketCount ||
         header.bucketIndex != bucketIndex || header.used > kCapacity || header.sequence == 0 ||
-        header.sequence == UINT64_MAX || header.checksum != checksumOf(copy, header.used)) {
+        header.sequence > kLastSequence || header.checksum != checksumOf(copy, header.used)) {
         return std::nullopt;
     }
     return header.sequence;
@@ -143,8 +149,7 @@ bool BucketImage::append(std::int64_t start, std::int64_t end, std::int64_t life
 bool BucketImage::copyFrom(const std::byte *copy, std::string_view name, std::int64_t oldest) {
     bool room = true;
     forEach(copy, [&](const EntryHeader &header, std::string_view key, std::string_view value) {
-        const bool longPast = header.end < oldest - header.lifetime;
-        if (key != name && !longPast) {
+        if (key != name && !isLongPast(header.end, header.lifetime, oldest)) {
             room = append(header.start, header.end, header.lifetime, key, value);
         }
         return room;

@@ -20,11 +20,16 @@ struct CacheEntry {
     std::int64_t lifetime = 0; ///< milliseconds
 };
 
+/// Whether an entry with that end and lifetime expired before `oldest`. In a forged file they may
+/// be any numbers.
+bool isLongPast(std::int64_t end, std::int64_t lifetime, std::int64_t oldest);
+
 /// One copy of a bucket as stored in the file: a header, then the entries back to back. Numbers are
 /// in host byte order: the file never leaves its machine.
 class BucketImage {
 public:
     static constexpr std::size_t kSize = 4096;
+    static constexpr std::uint64_t kLastSequence = UINT64_MAX - 1;
 
     /// The sequence number in the header, unchecked.
     static std::uint64_t claimedSequence(const std::byte *copy);

@@ -89,25 +89,39 @@ bool storeCopy(int fd, std::uint32_t index, std::size_t which, std::string_view 
     return pwrite(fd, bytes.data(), bytes.size(), offset) == static_cast<ssize_t>(bytes.size());
 }
 
+/// Whether the file at `path` is still the one that was opened, and nobody has written to it since:
+/// then whoever keeps its lock, which takes a writer microseconds, is stopped or hangs.
+bool isStuck(const std::string &path, const struct stat &opened) {
+    struct stat now {};
+    return lstat(path.c_str(), &now) == 0 && now.st_dev == opened.st_dev &&
+           now.st_ino == opened.st_ino && now.st_mtim.tv_sec == opened.st_mtim.tv_sec &&
+           now.st_mtim.tv_nsec == opened.st_mtim.tv_nsec;
+}
+
 /// A cache file under its exclusive lock.
 class LockedFile {
 public:
-    /// Opens and locks the file at `path`; a damaged or foreign one is replaced.
+    /// Opens and locks the file at `path`; one that is damaged, foreign or stuck is replaced.
     static std::optional<LockedFile> open(const std::string &path, bool create) {
         // Between opening and locking, growing may have replaced the file.
         for (int attempt = 0; attempt < 100; ++attempt) {
             LockedFile file;
             UniqueFd fd = openOrReplaceCacheFile(path, create ? O_RDWR | O_CREAT : O_RDWR);
-            if (!fd) {
+            struct stat status {};
+            if (!fd || fstat(fd.get(), &status) != 0) {
                 return std::nullopt;
             }
             auto locked = LockedFd::lock(std::move(fd), LOCK_EX, kLockWait);
+            if (!locked && isStuck(path, status) && unlink(path.c_str()) == 0) {
+                OVRA_WARN("Cache file [%s] was locked for too long, beginning a new one",
+                          path.c_str());
+                continue;
+            }
             if (!locked) {
                 OVRA_WARN("Cache file [%s] is locked for too long", path.c_str());
                 return std::nullopt;
             }
             file.fd_ = std::move(*locked);
-            struct stat status {};
             if (fstat(file.fd_.get(), &status) != 0) {
                 return std::nullopt;
             }
@@ -144,6 +158,11 @@ public:
     /// Replaces the older copy of the loaded bucket.
     bool store(BucketImage &image) {
         const std::size_t older = choice_.valid ? 1 - choice_.newer : 0;
+        if (choice_.sequence == BucketImage::kLastSequence) {
+            // Only a forged file gets there: both copies begin anew, the visible one last.
+            return storeCopy(fd_.get(), index_, older, image.finish(1)) &&
+                   storeCopy(fd_.get(), index_, choice_.newer, image.finish(2));
+        }
         return storeCopy(fd_.get(), index_, older, image.finish(choice_.sequence + 1));
     }
 
@@ -189,7 +208,7 @@ private:
         BucketImage low(2 * buckets_, index);
         BucketImage high(2 * buckets_, index + buckets_);
         for (const CacheEntry &entry : BucketImage::entries(chosenCopy(pair, choice))) {
-            if (entry.end < oldest - entry.lifetime) {
+            if (isLongPast(entry.end, entry.lifetime, oldest)) {
                 continue;
             }
             total += BucketImage::measure(entry);

@@ -16,9 +16,9 @@ namespace {
 constexpr const char *kMask = "***";
 
 /// Members whose values are login material, at any depth.
-constexpr std::array<std::string_view, 13> kSecretMembers = {
+constexpr std::array<std::string_view, 14> kSecretMembers = {
     "password", "passwd",       "otpcode", "otp_code",     "session",   "_sid",   "sid",
-    "token",    "access_token", "sealed",  "sealed_reply", "reply_key", "secret",
+    "token",    "access_token", "sealed",  "sealed_reply", "reply_key", "secret", "device_token",
 };
 
 bool isSecret(std::string_view name) {
@@ -64,17 +64,39 @@ std::string toLogString(const Json::Value &value) {
     return toString(maskSecrets(value));
 }
 
-bool fromString(Json::Value &value, const std::string &text) {
+JsonFault parseJson(Json::Value &value, std::string_view text, const JsonLimits &limits,
+                    JsonLimits *left) {
     try {
         Json::Value parsed;
-        if (!readJson(text, parsed)) {
-            return false;
+        JsonLimits rest = limits;
+        const JsonFault fault = readJson(text, rest, parsed);
+        if (fault == JsonFault::kNone) {
+            value = std::move(parsed);
         }
-        value = std::move(parsed);
-        return true;
+        if (left != nullptr) {
+            *left = rest;
+        }
+        return fault;
     } catch (const std::exception &) { // out of memory
-        return false;
+        return JsonFault::kTooMuchMemory;
     }
+}
+
+const char *describe(JsonFault fault) {
+    switch (fault) {
+    case JsonFault::kTooDeep:
+        return "nests arrays and objects too deeply";
+    case JsonFault::kTooManyValues:
+        return "holds too many values";
+    case JsonFault::kTooMuchMemory:
+        return "would take too much memory";
+    default:
+        return "is not JSON text";
+    }
+}
+
+bool fromString(Json::Value &value, const std::string &text) {
+    return parseJson(value, text) == JsonFault::kNone;
 }
 
 std::string memberString(const Json::Value &value, const char *key) {

@@ -3,7 +3,9 @@
 
 #include <ovrabase/utf8.h>
 
+#include <algorithm>
 #include <charconv>
+#include <cstddef>
 #include <optional>
 #include <string>
 #include <system_error>
@@ -12,8 +14,19 @@ namespace OvraDRCore {
 
 namespace {
 
-/// Arrays and objects inside each other; a level costs a few stack frames.
-constexpr int kMaxDepth = 200;
+// What jsoncpp and the C library (glibc, 64 bits) spend on a tree.
+/// A value in its array or object: a node of a red-black tree, with the key.
+constexpr std::size_t kValueMemory = 96;
+/// The tree of an array or object itself.
+constexpr std::size_t kTreeMemory = 64;
+
+/// A string's or a name's bytes, with length, end and the allocator's own part.
+std::size_t textMemory(std::size_t size) {
+    constexpr std::size_t kOverhead = 16;
+    constexpr std::size_t kUnit = 16;
+    constexpr std::size_t kLeast = 32;
+    return std::max(kLeast, (size + kOverhead + kUnit - 1) / kUnit * kUnit);
+}
 
 bool isDigit(char c) {
     return c >= '0' && c <= '9';
@@ -41,14 +54,38 @@ void appendUtf8(std::string &text, char32_t code) {
 /// Reads from left to right; every read...() is false at the first byte that is not of the grammar.
 class Reader {
 public:
-    explicit Reader(std::string_view text)
-        : rest_(text) {}
+    Reader(std::string_view text, JsonLimits &limits)
+        : rest_(text)
+        , left_(limits) {}
 
-    bool readDocument(Json::Value &value) {
-        return readValue(value, 0) && (skipBlanks(), rest_.empty());
+    JsonFault readDocument(Json::Value &value) {
+        return readValue(value, 0) && (skipBlanks(), rest_.empty()) ? JsonFault::kNone : fault_;
     }
 
 private:
+    bool refuse(JsonFault fault) {
+        fault_ = fault;
+        return false;
+    }
+
+    /// Asked before the memory is taken.
+    bool spend(std::size_t memory) {
+        return take(left_.memory, memory) || refuse(JsonFault::kTooMuchMemory);
+    }
+    bool addValue() {
+        return (take(left_.values, 1) || refuse(JsonFault::kTooManyValues)) && spend(kValueMemory);
+    }
+    static bool take(std::size_t &left, std::size_t amount) {
+        if (left < amount) {
+            return false;
+        }
+        left -= amount;
+        return true;
+    }
+    bool enter(int depth) {
+        return (depth < left_.depth || refuse(JsonFault::kTooDeep)) && spend(kTreeMemory);
+    }
+
     bool startsWith(char c) const { return !rest_.empty() && rest_.front() == c; }
 
     bool take(char c) {
@@ -70,19 +107,16 @@ private:
 
     bool readValue(Json::Value &value, int depth) {
         skipBlanks();
+        if (!addValue()) {
+            return false;
+        }
         switch (rest_.empty() ? '\0' : rest_.front()) {
         case '{':
-            return depth < kMaxDepth && readObject(value, depth + 1);
+            return enter(depth) && readObject(value, depth + 1);
         case '[':
-            return depth < kMaxDepth && readArray(value, depth + 1);
-        case '"': {
-            std::string text;
-            if (!readString(text)) {
-                return false;
-            }
-            value = Json::Value(text);
-            return true;
-        }
+            return enter(depth) && readArray(value, depth + 1);
+        case '"':
+            return readText(value);
         case 't':
             value = true;
             return takeWord("true");
@@ -97,6 +131,25 @@ private:
         }
     }
 
+    bool readText(Json::Value &value) {
+        rest_.remove_prefix(1);
+        const std::size_t size = plainSize();
+        if (size < rest_.size() && rest_[size] == '"') { // as most do: without a copy in between
+            if (!spend(textMemory(size))) {
+                return false;
+            }
+            value = Json::Value(rest_.data(), rest_.data() + size);
+            rest_.remove_prefix(size + 1);
+            return true;
+        }
+        std::string text;
+        if (!readStringEnd(text) || !spend(textMemory(text.size()))) {
+            return false;
+        }
+        value = Json::Value(text);
+        return true;
+    }
+
     bool readObject(Json::Value &value, int depth) {
         value = Json::Value(Json::objectValue);
         rest_.remove_prefix(1);
@@ -107,7 +160,7 @@ private:
         do {
             skipBlanks();
             std::string name;
-            if (!readString(name)) {
+            if (!take('"') || !readStringEnd(name) || !spend(textMemory(name.size()))) {
                 return false;
             }
             const auto before = value.size();
@@ -138,10 +191,8 @@ private:
         return take(']');
     }
 
-    bool readString(std::string &text) {
-        if (!take('"')) {
-            return false;
-        }
+    /// What follows the opening quote.
+    bool readStringEnd(std::string &text) {
         for (;;) {
             const std::size_t size = plainSize();
             text.append(rest_, 0, size);
@@ -270,12 +321,14 @@ private:
     }
 
     std::string_view rest_;
+    JsonLimits &left_;
+    JsonFault fault_ = JsonFault::kNotJson;
 };
 
 } // namespace
 
-bool readJson(std::string_view text, Json::Value &value) {
-    return Reader(text).readDocument(value);
+JsonFault readJson(std::string_view text, JsonLimits &limits, Json::Value &value) {
+    return Reader(text, limits).readDocument(value);
 }
 
 } // namespace OvraDRCore

@@ -1,15 +1,18 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
+#include "ovradrcore/json.h"
+
 #include <json/value.h>
 
 #include <string_view>
 
 namespace OvraDRCore {
 
-/// Parses a JSON text of RFC 8259, and nothing else: see fromString(). Independent of the locale.
-/// \return false, with `value` unspecified, if `text` is not one.
+/// Parses a JSON text of RFC 8259, and nothing else: see parseJson(). Independent of the locale.
+/// \param limits  what is used of them is taken off
+/// \return the fault, with `value` unspecified, if `text` is none or exceeds a limit.
 /// \throws std::exception  out of memory
-bool readJson(std::string_view text, Json::Value &value);
+JsonFault readJson(std::string_view text, JsonLimits &limits, Json::Value &value);
 
 } // namespace OvraDRCore

@@ -45,13 +45,13 @@ void writeEscape(char32_t code, std::string &text) {
 void writeCharacter(char32_t code, std::string &text) {
     constexpr std::string_view kMeanings = "\"\\\b\f\n\r\t";
     constexpr std::string_view kLetters = "\"\\bfnrt";
-    constexpr char32_t kAsciiEnd = 0x7F;
+    constexpr char32_t kAsciiEnd = 0x7F; // DEL, which terminals obey
     const std::size_t at =
         code < kAsciiEnd ? kMeanings.find(static_cast<char>(code)) : std::string_view::npos;
     if (at != std::string_view::npos) {
         text += '\\';
         text += kLetters[at];
-    } else if (code >= 0x20 && code <= kAsciiEnd) {
+    } else if (code >= 0x20 && code < kAsciiEnd) {
         text += static_cast<char>(code);
     } else if (code < 0x10000) {
         writeEscape(code, text);

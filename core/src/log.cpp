@@ -44,28 +44,6 @@ std::string_view stemOf(std::string_view path) {
     return name.substr(0, name.find('.'));
 }
 
-/// One character as a line shows it: control characters and bytes that are not UTF-8 escaped.
-std::string shown(std::string_view text, const OvraBase::Utf8Character &character) {
-    constexpr std::string_view kMeanings = "\n\r\t";
-    constexpr std::string_view kLetters = "nrt";
-    constexpr char32_t kFirstPrintable = 0xA0; // after DEL and U+0080 to U+009F
-    const bool valid = character.size > 0;
-    const char first = text.front();
-    const std::size_t at = kMeanings.find(first);
-    if (at != std::string_view::npos) {
-        return {'\\', kLetters[at]};
-    }
-    if (valid && ((first >= ' ' && first <= '~') || character.code >= kFirstPrintable)) {
-        return std::string(text.substr(0, character.size));
-    }
-    std::array<char, 8> hex{};
-    const bool wide = valid && character.size > 1;
-    std::snprintf(hex.data(), hex.size(), wide ? "\\u%04x" : "\\x%02x",
-                  wide ? static_cast<unsigned int>(character.code)
-                       : static_cast<unsigned int>(static_cast<unsigned char>(first)));
-    return hex.data();
-}
-
 /// The message as one line of at most kMaxMessage bytes and the note that it was truncated,
 /// whatever bytes it consists of. \param size  of the whole message; `text` is at least the start
 /// that a line can show
@@ -73,7 +51,7 @@ std::string oneLine(std::string_view text, std::size_t size) {
     std::string line;
     for (std::size_t done = 0; done < size;) {
         const OvraBase::Utf8Character character = OvraBase::firstUtf8(text.substr(done));
-        const std::string next = shown(text.substr(done), character);
+        const std::string next = OvraBase::shown(text.substr(done), character);
         if (line.size() + next.size() > kMaxMessage) {
             return line + "... (" + std::to_string(size - done) + " more bytes)";
         }

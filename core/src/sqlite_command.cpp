@@ -114,8 +114,6 @@ std::string InsertCommand::render(bool masked) const {
         names.append(separator).append(identifier(column.first));
         literals.append(separator).append(literalOf(column, masked));
     }
-    // Appended piece by piece: g++ 12 at -O2 warns falsely (-Wrestrict) of operator+ with a
-    // literal.
     std::string statement = "INSERT INTO ";
     statement.append(identifier(table())).append(" (").append(names);
     return statement.append(") VALUES (").append(literals).append(")");

@@ -30,6 +30,9 @@ public:
     /// The new endpoint and login (500, 401, or the error of the login).
     [[nodiscard]] bool setCred(const Conn &conn, const std::string &account,
                                const std::string &password, const std::string &otp);
+    /// What the row gets as its endpoint instead of the direct one of the log-in: the relay
+    /// endpoint that this stands for today. An invalid one changes nothing.
+    void setStoredConn(const Conn &conn) { storedConn = conn; }
     bool IsSessionChanged() const;
     /// The session that the remote node granted for this change, a secret; "" before
     /// requestRemoteSession().
@@ -46,6 +49,7 @@ private:
     DRNode record;
     CredAccountSender sender;
     std::string newSession;
+    Conn storedConn;
 };
 
 } // namespace OvraDRNode

@@ -11,6 +11,7 @@
 
 #include <json/value.h>
 
+#include <cstdint>
 #include <string>
 
 struct _tag_ovra_cred_;
@@ -34,7 +35,7 @@ public:
     /// Runs `request` on the local appliance with the administrator's rights.
     [[nodiscard]] static OvraDRCore::Response run(const OvraDRCore::Request &request);
     /// Probes the endpoint now (at most 10 seconds) and records the verdict for all processes,
-    /// except if this one has no memory, descriptor or thread left.
+    /// except if this one has no memory, descriptor, thread or local port left.
     [[nodiscard]] static bool IsConnectable(const Conn &conn);
     /// The recorded verdict; probes only if that is older than 5 seconds.
     static bool GetCachedConnectable(const Conn &conn);
@@ -97,6 +98,7 @@ protected:
 private:
     class CallTexts;
 
+    void SetCredRequestError(OVRA::CredRequest &request, std::int64_t begun) const;
     void freeHandles();
     [[nodiscard]] OvraDRCore::Response send(const OvraDRCore::Request &request, CallTexts &texts,
                                             const char *function) const;

@@ -7,7 +7,7 @@
 # signal if one ended it). Background processes keep running. FOLDER is private and gets a FIFO for
 # the exit code. SIGINT, SIGTERM or SIGHUP kill the command and all that it started.
 prootRun() {
-    local folder=$1 fifo=$1/status.$BASHPID code="" status
+    local folder=$1 fifo=$1/status.$BASHPID code="" part status
     shift
     mkfifo -m 600 "$fifo"
     # Opened read-write, so that neither side blocks.
@@ -23,12 +23,15 @@ prootRun() {
     trap 'killTraced "$prootPid"; exit 130' INT
     trap 'killTraced "$prootPid"; exit 143' TERM
     trap 'killTraced "$prootPid"; exit 129' HUP
-    until IFS= read -r -t 1 -u "$status" code; do
+    # The time may be over in the middle of the code: what has been read of it is kept.
+    until IFS= read -r -t 1 -u "$status" part; do
+        code+=$part
         kill -0 "$prootPid" 2>/dev/null && continue
         # It may have ended in between.
-        IFS= read -r -t 0.01 -u "$status" code || code=137
+        IFS= read -r -t 0.01 -u "$status" part || code="" part=137
         break
     done
+    code+=$part
     trap - INT TERM HUP
     exec {status}>&-
     return "$code"

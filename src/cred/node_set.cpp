@@ -163,7 +163,7 @@ bool DRNodeCredSet::requestRemoteSession() {
 }
 
 bool DRNodeCredSet::setCredRecord() {
-    const Conn &newConn = sender.getConn();
+    const Conn &newConn = storedConn.isValid() ? storedConn : sender.getConn();
     if (record.conn == newConn && newSession == record.session) {
         // The log line uses this name for the node.
         OVRA_INFO("No change of conn or session of credId[%s]", record.nodeId.c_str());

@@ -38,7 +38,8 @@ struct ProbeResult {
     bool connectable = false;
     /// False: the probe could not be set up, which says nothing about the endpoint.
     bool ran = true;
-    /// True: this process had no memory, descriptor or thread left, which says nothing either.
+    /// True: this process had no memory, descriptor, thread or local port left, which says nothing
+    /// either.
     bool lacked = false;
 };
 

@@ -9,8 +9,7 @@
 #include <ovradrcore/log.h>
 #include <ovrawebapi/api_runner.h>
 
-#include <algorithm>
-#include <ctime>
+#include <cstdint>
 #include <utility>
 
 namespace OvraDRNode {
@@ -40,11 +39,8 @@ OvraDRCore::ErrRecorder errorOf(const OvraDRCore::ErrRecorder &sender, const Res
 }
 
 bool BaseSender::IsConnectable(const Conn &conn) {
-    const std::time_t start = std::time(nullptr);
+    const std::int64_t start = OvraDRCore::Cache::Now();
     const ProbeResult probe = IsConnectableWithErrCheck(conn);
-    const std::time_t now = std::time(nullptr);
-    // A process that was stopped in its probe has old news, and other processes may know better.
-    const std::time_t end = std::min(now, start + OvraDRCore::Cache::kLongestRefresh);
     if (!probe.ran) {
         OVRA_NOTICE("Failed to check connectable of conn[%s]",
                     OvraDRCore::toString(conn.toJson()).c_str());
@@ -54,10 +50,7 @@ bool BaseSender::IsConnectable(const Conn &conn) {
     }
     const ConnCache cache(conn);
     cache.logChange(__func__, cache.getStoredVerdict(), probe.connectable);
-    const double age = cache.GetCachedAge();
-    if (end == now || age < 0 || age > std::difftime(now, end)) {
-        cache.UpdateWithData(probe.connectable, start, end);
-    }
+    cache.UpdateWithFinding(probe.connectable, start);
     return probe.connectable;
 }
 

@@ -41,8 +41,8 @@ int loginError(int remoteCode) {
     return listed ? ERR::kLoginFailed + (remoteCode - kFirstLoginCode) : ERR::kLoginFailed;
 }
 
-/// Hands a text to the credential library, unless it would be cut at a NUL. \return whether it took
-/// it
+/// Hands a text to the credential library, unless it would be cut at a NUL.
+/// \return whether it was taken
 template <typename Object>
 bool setItem(int (*set)(Object *, const char *), Object *object, const std::string &item) {
     return item.find('\0') == std::string::npos && set(object, item.c_str()) == 0;
@@ -132,6 +132,11 @@ void BaseCredSender::clear() {
 }
 
 void BaseCredSender::SetCredRequestError(OVRA::CredRequest &request) const {
+    SetCredRequestError(request, OvraDRCore::Cache::Now());
+}
+
+/// \param begun  when the attempt began, Cache::Now(): who was stopped in it has old news
+void BaseCredSender::SetCredRequestError(OVRA::CredRequest &request, std::int64_t begun) const {
     const int error = request.GetError();
     if (error == 0) {
         return;
@@ -150,7 +155,7 @@ void BaseCredSender::SetCredRequestError(OVRA::CredRequest &request) const {
         RequestScope::noteUnreachable(conn);
         const ConnCache cache(conn);
         cache.logChange(__func__, cache.getStoredVerdict(), false);
-        cache.UpdateWithData(false);
+        cache.UpdateWithFinding(false, begun);
         return;
     }
     case LibraryError::kUnanswered:
@@ -211,8 +216,9 @@ Response BaseCredSender::send(const Request &request, CallTexts &texts,
         credRequest.SetUploadFile(request.getUploadPath(), request.getUploadName());
     }
     const OvraDRCore::ReplyHandOver replyHandOver; // the credential library parses the reply first
+    const std::int64_t begun = OvraDRCore::Cache::Now();
     if (credRequest.Process(true, kSend) == 0) {
-        SetCredRequestError(credRequest);
+        SetCredRequestError(credRequest, begun);
         OVRA_LOG_IN(LogLevel::kNotice, function, "Failed to process cred request [%s]",
                     texts.request());
         return response;

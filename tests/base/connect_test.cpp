@@ -5,6 +5,7 @@
 #include <sys/resource.h>
 
 #include <cerrno>
+#include <fstream>
 
 using namespace OvraBase;
 using namespace std::chrono_literals;
@@ -52,7 +53,7 @@ TEST(Connect, ReachesTheOneAddressThatAnswersBesideThoseThatDoNot) {
     EXPECT_LT(std::chrono::steady_clock::now() - start, 30s);
     EXPECT_EQ(errorOf({silent.address, refusing}, 300ms), ETIMEDOUT);
     EXPECT_EQ(errorOf({refusing, refusing}, 60s), ECONNREFUSED);
-    EXPECT_EQ(errorOf({}, 60s), EADDRNOTAVAIL);
+    EXPECT_EQ(errorOf({}, 60s), ENETUNREACH);
 }
 
 TEST(Connect, TellsAShortageFromAHostThatIsNotThere) {
@@ -67,4 +68,20 @@ TEST(Connect, TellsAShortageFromAHostThatIsNotThere) {
     EXPECT_EQ(resolveHost("no-such-host.invalid", 1, in(60s)).error().number, EMFILE);
     setrlimit(RLIMIT_NOFILE, &limit);
     EXPECT_EQ(errorOf({living.address}, 60s), 0);
+}
+
+TEST(Connect, TellsAShortageOfLocalPortsFromAFamilyWithoutAnAddress) {
+    constexpr char kPorts[] = "/proc/sys/net/ipv4/ip_local_port_range";
+    const Listener living("127.0.0.1", false);
+    const SocketAddress ipv6 = *parseAddress("2001:db8::1", 1);
+    std::ofstream("/proc/sys/net/ipv6/conf/lo/disable_ipv6") << "1";
+    EXPECT_EQ(errorOf({ipv6}, 60s), ENETUNREACH);
+    if (!(std::ofstream(kPorts) << "1024 1025" << std::flush)) {
+        GTEST_SKIP() << "the ports of this sandbox cannot be limited";
+    }
+    const auto first = connectFirst({living.address}, in(60s));
+    const auto second = connectFirst({living.address}, in(60s));
+    const int error = errorOf({living.address, ipv6}, 60s);
+    EXPECT_EQ(error, EADDRNOTAVAIL);
+    EXPECT_TRUE(isShortage(error) && !isShortage(ENETUNREACH));
 }

@@ -12,6 +12,7 @@
 #include <linux/filter.h>
 #include <linux/seccomp.h>
 #include <spawn.h>
+#include <sys/file.h>
 #include <sys/prctl.h>
 #include <sys/stat.h>
 #include <sys/syscall.h>
@@ -408,6 +409,23 @@ TEST_F(CacheTest, ARefreshThatHangsHoldsOthersUpOnceAndNotForLong) {
     released.set_value();
 }
 
+TEST_F(CacheTest, AWriterThatHangsHoldsOthersUpOnce) {
+    TestCache("a").UpdateWithData("old");
+    OvraTest::OtherProcess stopped([] {
+        const int fd = open(kPath, O_RDWR);
+        return flock(fd, LOCK_EX) == 0 && std::raise(SIGSTOP) == 0 ? 0 : 1;
+    });
+    waitpid(stopped.pid(), nullptr, WUNTRACED);
+    EXPECT_EQ(text(TestCache("a").Read()), "\"old\"") << "readers need no lock";
+    EXPECT_TRUE(TestCache("a").UpdateWithData("new"));
+    const auto start = std::chrono::steady_clock::now();
+    EXPECT_TRUE(TestCache("b").UpdateWithData("next"));
+    EXPECT_LT(std::chrono::steady_clock::now() - start, 1500ms);
+    EXPECT_EQ(text(TestCache("a").GetCachedData()), "\"new\"");
+    stopped.end(SIGCONT);
+    EXPECT_EQ(text(TestCache("b").GetCachedData()), "\"next\"");
+}
+
 TEST_F(CacheTest, ARefreshThatDiesIsTakenOverAtOnceThoughItsChildrenLive) {
     TestCache("a").UpdateWithData("old");
     fakeNow += kLifetime + 1;
@@ -471,4 +489,29 @@ TEST_F(CacheTest, ADamagedCopyWithARightChecksumStaysWithinItsBounds) {
         EXPECT_EQ(BucketImage::entries(bent.data()).size(), 0U);
         EXPECT_FALSE(BucketImage::find(bent.data(), "name"));
     }
+}
+
+TEST_F(CacheTest, AForgedBucketWithExtremeNumbersIsReadAndReplaced) {
+    for (const std::uint64_t sequence : {std::uint64_t{1}, UINT64_MAX - 2, UINT64_MAX - 1}) {
+        TestCache cache("a");
+        ASSERT_TRUE(cache.UpdateWithData("makes the file"));
+        const auto index = static_cast<std::uint32_t>(cacheNameHash("a")) & 15U;
+        BucketImage image(16, index);
+        ASSERT_TRUE(image.add({"a", "\"forged\"", 0, INT64_MIN, INT64_MIN}));
+        const std::string_view forged = image.finish(sequence);
+        std::fstream file(kPath, std::ios::in | std::ios::out | std::ios::binary);
+        for (const std::size_t copy : {0U, 1U}) {
+            file.seekp(static_cast<std::streamoff>((2 * index + copy) * BucketImage::kSize));
+            file.write(forged.data(), static_cast<std::streamsize>(forged.size()));
+        }
+        file.close();
+        EXPECT_EQ(text(cache.GetCachedData()), "\"forged\"");
+        EXPECT_GT(cache.GetCachedAge(), 9e15) << "as old as can be";
+        for (const char *value : {"one", "two", "three"}) {
+            ASSERT_TRUE(cache.UpdateWithData(value));
+            EXPECT_EQ(text(cache.GetCachedData()), '"' + std::string(value) + '"') << sequence;
+        }
+    }
+    EXPECT_TRUE(isLongPast(0, INT64_MIN, 1)) << "no lifetime is that short";
+    EXPECT_FALSE(isLongPast(INT64_MIN, INT64_MAX, INT64_MIN / 2));
 }

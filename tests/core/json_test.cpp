@@ -34,7 +34,7 @@ TEST(JsonText, IsReadExactlyAndWrittenCompactly) {
         {"[0.1,5e0,-1E+2,1.5e-7,18446744073709551616]",
          "[0.1,5.0,-100.0,1.5e-07,18446744073709551616.0]"},
         {R"("\"\\\/\b\f\n\r\t\u0000\u001F\u007f")",
-         "\"\\\"\\\\/\\b\\f\\n\\r\\t\\u0000\\u001f\x7f\""},
+         "\"\\\"\\\\/\\b\\f\\n\\r\\t\\u0000\\u001f\\u007f\""},
         {"\"\u00e4\u20ac\U0001f600\"", R"("\u00e4\u20ac\ud83d\ude00")"},
         {R"({"\u00E4\u20aC\uD83D\uDE00\u0000":1})", R"({"\u00e4\u20ac\ud83d\ude00\u0000":1})"},
         {nested(200, "[", "]"), nested(200, "[", "]")},
@@ -76,6 +76,44 @@ TEST(JsonText, OfAnyOtherFormIsRefusedAndLeavesTheValue) {
     }
 }
 
+TEST(JsonText, IsReadWithinItsLimitsOnly) {
+    const auto times = [](int count, const std::string &item) {
+        std::string text;
+        for (int i = 0; i < count; ++i) {
+            text += (i == 0 ? "" : ",") + item;
+        }
+        return "[" + text + "]";
+    };
+    const std::string credential =
+        R"({"cred_id":"6f2c0000-0000-4000-8000-000000000000","addr":"2001:db8::1","port":5001,)"
+        R"("node_id":"6f2c0000-0000-4000-8000-000000000000","protocol":"https","temporary":false,)"
+        R"("session_reference":"0123456789abcdef"})";
+    const struct {
+        std::string text;
+        JsonLimits limits;
+        JsonFault fault;
+    } cases[] = {
+        {times(10'000, credential), {}, JsonFault::kNone},
+        {"\"" + std::string(8 << 20, 'x') + "\"", {}, JsonFault::kNone},
+        {times(4'000'000, "0"), {}, JsonFault::kTooManyValues},
+        {times(2, "[[0]]"), {.depth = 3, .values = 7, .memory = 7 * 96 + 5 * 64}, JsonFault::kNone},
+        {times(2, "[[0]]"), {.depth = 2}, JsonFault::kTooDeep},
+        {times(2, "[[0]]"), {.values = 6}, JsonFault::kTooManyValues},
+        {times(2, "[[0]]"), {.memory = 7 * 96 + 5 * 64 - 1}, JsonFault::kTooMuchMemory},
+        {R"("12345678901234567890")", {.memory = 96 + 47}, JsonFault::kTooMuchMemory},
+        {R"({"a":"\n"})", {.memory = 2 * 96 + 64 + 63}, JsonFault::kTooMuchMemory},
+    };
+    for (const auto &each : cases) {
+        Json::Value value("old");
+        EXPECT_EQ(parseJson(value, each.text, each.limits), each.fault) << each.text.substr(0, 40);
+        EXPECT_EQ(value == Json::Value("old"), each.fault != JsonFault::kNone);
+    }
+    JsonLimits left;
+    Json::Value value;
+    EXPECT_EQ(parseJson(value, "[1,2]", left, &left), JsonFault::kNone);
+    EXPECT_EQ(left.values, JsonLimits().values - 3);
+}
+
 TEST(JsonText, AndNumbersAreTheSameInEveryLocale) {
     struct Grouping : std::numpunct<char> {
         char do_decimal_point() const override { return ','; }
@@ -94,7 +132,7 @@ TEST(JsonText, OfALogLineMasksLoginMaterialAtAnyDepthAndNothingElse) {
     Json::Value value;
     for (const char *secret :
          {"password", "passwd", "otpcode", "otp_code", "session", "_sid", "sid", "token",
-          "access_token", "sealed", "sealed_reply", "reply_key", "secret"}) {
+          "access_token", "sealed", "sealed_reply", "reply_key", "secret", "device_token"}) {
         const std::string open = R"({"l":[{"account":"joe",")"s + secret + "\":";
         ASSERT_TRUE(fromString(value, open + R"(["canary",2,null,{"n":1,"sid":"canary"}]}]})"));
         EXPECT_EQ(toLogString(value), toString(maskSecrets(value)));

@@ -23,12 +23,12 @@ TEST(Log, LineNamesPlaceLevelAndProcess) {
 TEST(Log, ForeignTextCannotForgeALine) {
     LogCapture log;
     OVRA_ERR("user [%s] %c",
-             "x\nnode:1(f)[ERR][1]: forged\x1b[31m\r\t\x7f\u0080\u009f\u00a0\xff\xc3", '\0');
+             "x\nnode:1(f)[ERR][1]: forged\x1b[31m\r\t\x7f\u0080\u009f\u00a0\u202e\xff\xc3", '\0');
     ASSERT_EQ(log.lines().size(), 1U);
     EXPECT_EQ(
         log.count("ERR", "log_test", "TestBody",
                   "user [x\\nnode:1(f)[ERR][1]: forged\\x1b[31m\\r\\t\\x7f\\u0080\\u009f\u00a0"
-                  "\\xff\\xc3] \\x00"),
+                  "\\u202e\\xff\\xc3] \\x00"),
         1);
 }
 

@@ -83,7 +83,7 @@ TEST_F(Canary, NoSecretIsLoggedWhicheverStepFails) {
     std::string echo;
     for (const char *name :
          {"password", "passwd", "otpcode", "otp_code", "session", "_sid", "sid", "token",
-          "access_token", "sealed", "sealed_reply", "reply_key", "secret"}) {
+          "access_token", "sealed", "sealed_reply", "reply_key", "secret", "device_token"}) {
         echo += (echo.empty() ? "{\"" : ",\"") + std::string(name) + R"(":["canary-echo"])";
     }
     echo += "}";

@@ -44,9 +44,9 @@ public:
 
     Answer answer(const Received &request) {
         using namespace OvraPlatform;
-        const auto visible = decodeForm(request.body);
-        if (!visible) {
-            return document(apiError(APIError::kBadRequest, visible.error()));
+        auto visible = decodeForm(request.body);
+        if (!visible || parseParams(*visible) != OvraDRCore::JsonFault::kNone) {
+            return document(apiError(APIError::kBadRequest, "not a call"));
         }
         OpenedRequest opened;
         SealVerdict verdict = SealVerdict::kOpened;

@@ -13,8 +13,11 @@
 // Plain connections to a server on 127.0.0.1.
 namespace OvraTest {
 
-inline OvraBase::UniqueFd dial(int port) {
+/// \param from  the address that connects, of 127.0.0.0/8
+inline OvraBase::UniqueFd dial(int port, const char *from = "127.0.0.1") {
     OvraBase::UniqueFd fd(socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0));
+    const auto own = OvraBase::parseAddress(from, 0);
+    EXPECT_EQ(bind(fd.get(), own->get(), own->size), 0);
     const auto address = OvraBase::parseAddress("127.0.0.1", port);
     const timeval patience{20, 0};
     setsockopt(fd.get(), SOL_SOCKET, SO_RCVTIMEO, &patience, sizeof patience);

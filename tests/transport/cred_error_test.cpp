@@ -93,6 +93,27 @@ TEST_F(CredError, LibraryNumbersBecomeCodesAndOnlyLostConnectionsMarkTheEndpoint
     }
 }
 
+TEST_F(CredError, AProcessThatWasStoppedInItsRequestHasOldNews) {
+    stopClock();
+    for (const bool otherMeanwhile : {false, true}) {
+        ConnCache(conn).UpdateWithData(true);
+        credentialLibrary.fault = [&](const std::string &operation) -> std::optional<int> {
+            if (operation != "Process") {
+                return std::nullopt;
+            }
+            now += 100'000;
+            EXPECT_TRUE(!otherMeanwhile || ConnCache(conn).UpdateWithData(true));
+            now += 20'000;
+            return 5;
+        };
+        CredSessionSender sender(conn, "s");
+        EXPECT_FALSE(sender.process(info).isValid());
+        EXPECT_EQ(sender.GetErrCode(), 500);
+        EXPECT_EQ(ConnCache(conn).getStoredVerdict(), otherMeanwhile);
+        EXPECT_EQ(ConnCache(conn).GetCachedAge(), otherMeanwhile ? 20 : 109);
+    }
+}
+
 TEST_F(CredError, EveryStepBeforeSendingHasItsCode) {
     EXPECT_EQ(send({"OVRACredAlloc"}), 402);
     EXPECT_EQ(send({"OVRACredSessAlloc"}), 402);

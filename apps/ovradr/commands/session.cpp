@@ -133,7 +133,7 @@ void addFilters(CLI::App &command, SelectOptions &options) {
 } // namespace
 
 void addSessionCommands(CLI::App &app, Command &chosen) {
-    CLI::App *family = app.add_subcommand("session", "The sessions that this node granted.");
+    CLI::App *family = app.add_subcommand("session", "The sessions that nodes granted each other.");
     family->require_subcommand(1);
     const auto options = std::make_shared<SelectOptions>();
 

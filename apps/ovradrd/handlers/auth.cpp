@@ -9,6 +9,8 @@
 #include <ovraplatform/api_errors.h>
 #include <ovraplatform/session_store.h>
 
+#include <algorithm>
+
 namespace Ovradrd {
 
 namespace {
@@ -40,11 +42,6 @@ const char *refusalText(LoginResult result) {
     default:
         return "the accounts cannot be read now: see the log of the appliance";
     }
-}
-
-/// What the throttle counts by: whatever was sent, it stays short.
-std::string countedAccount(const Json::Value &params) {
-    return OvraDRCore::memberString(params, kAccount).substr(0, Params::kMaxAccount);
 }
 
 /// The form for log lines: people sometimes type their password as the account.
@@ -86,39 +83,52 @@ bool LoginApi::isLogin(const OvraPlatform::APICall &call) {
     return call.api == kApi && call.version == kApiVersion && call.method == kLogin;
 }
 
-std::optional<std::chrono::milliseconds> LoginApi::admit(const Json::Value &params,
-                                                         const std::string &address) {
-    return throttle_.admit(countedAccount(params), address);
+void LoginApi::noteRelay(const std::string &address) {
+    const std::lock_guard lock(mutex_);
+    if (std::find(relays_.begin(), relays_.end(), address) == relays_.end()) {
+        relays_.resize(std::min(relays_.size(), kMaxRelays - 1));
+        relays_.insert(relays_.begin(), address);
+    }
 }
 
-void LoginApi::withdraw(const Json::Value &params, const std::string &address) {
-    throttle_.withdraw(countedAccount(params), address);
+bool LoginApi::isRelay(const std::string &address) const {
+    const std::lock_guard lock(mutex_);
+    return std::find(relays_.begin(), relays_.end(), address) != relays_.end();
 }
 
 Json::Value LoginApi::login(const Json::Value &params, const APICaller &caller) {
     if (caller.local) {
-        // It was not admitted either: it was not in the log-in queue, and does not count.
         return apiError(OvraPlatform::APIError::kBadRequest, "a local caller needs no log-in");
     }
     Params in(params);
     const std::string account = in.text(kAccount, Params::kMaxAccount);
     const OvraBase::Secret password = in.secret("passwd", Params::kMaxPassword);
     const std::string code = in.optionalSecret("otp_code", Params::kMaxCode);
+    const std::string device = in.optionalSecret("device_token", Params::kMaxDevice);
     if (!in.ok()) {
-        withdraw(params, caller.address);
         return in.error();
+    }
+    const LoginThrottle::Login attempted{
+        account, isRelay(caller.address) ? std::string() : caller.address, device};
+    const auto attempt = throttle_.admit(attempted);
+    if (!attempt) {
+        return apiError(OvraPlatform::APIError::kTooBusy,
+                        "too many log-ins failed, of this account or from your address: try again "
+                        "in " +
+                            std::to_string(attempt.error().count()) +
+                            " seconds, or from where you logged in before");
     }
     const LoginResult result = AccountStore().verify(account, password.get(), code);
     switch (result) {
     case LoginResult::kOk:
-        throttle_.recordSuccess(account, caller.address);
+        throttle_.recordSuccess(attempted, *attempt);
         OVRA_NOTICE("[%s] logged in from [%s]", account.c_str(), caller.address.c_str());
         return openSession(account, caller);
     case LoginResult::kWrong:
     case LoginResult::kCodeWrong:
         break;
     default:
-        withdraw(params, caller.address);
+        throttle_.withdraw(*attempt);
         break;
     }
     OVRA_NOTICE("A log-in of [%s] from [%s] was refused with [%d]", loggable(account).c_str(),

@@ -8,13 +8,14 @@
 
 #include <json/value.h>
 
-#include <chrono>
-#include <optional>
+#include <cstddef>
+#include <mutex>
 #include <string>
+#include <vector>
 
 namespace Ovradrd {
 
-/// "OVRA.Core.Auth": log-in and log-out. Keeps count of the failed log-ins.
+/// "OVRA.Core.Auth": log-in and log-out. Keeps count of the guesses.
 class LoginApi {
 public:
     /// The lifetime of a log-in's session, in seconds.
@@ -25,20 +26,23 @@ public:
     /// Whether the call is a log-in, which has its own queue because it hashes a password.
     static bool isLogin(const OvraPlatform::APICall &call);
 
-    /// Asks for a log-in with these parameters from this address.
-    /// \return how long it must wait; std::nullopt: refuse it.
-    std::optional<std::chrono::milliseconds> admit(const Json::Value &params,
-                                                   const std::string &address);
-    /// The admitted log-in is not carried out after all.
-    void withdraw(const Json::Value &params, const std::string &address);
+    /// Everybody who calls through the relay has this address: no log-in makes it a known one.
+    /// Thread-safe.
+    void noteRelay(const std::string &address);
 
     /// Registers the methods; the api must outlive the registry.
     void addTo(OvraPlatform::APIRegistry &registry);
 
 private:
+    /// Of one relay service; the least recent one is forgotten.
+    static constexpr std::size_t kMaxRelays = 16;
+
+    bool isRelay(const std::string &address) const;
     Json::Value login(const Json::Value &params, const OvraPlatform::APICaller &caller);
 
     LoginThrottle throttle_;
+    mutable std::mutex mutex_;
+    std::vector<std::string> relays_; ///< addresses of it, the newest first
 };
 
 } // namespace Ovradrd

@@ -26,7 +26,8 @@ public:
     static constexpr std::size_t kMaxSession = 255;
     static constexpr std::size_t kMaxAccount = 255;
     static constexpr std::size_t kMaxPassword = 1024;
-    static constexpr std::size_t kMaxCode = 64; ///< of a one-time code
+    static constexpr std::size_t kMaxCode = 64;   ///< of a one-time code
+    static constexpr std::size_t kMaxDevice = 64; ///< of a device token
 
     /// \param params  an object; must outlive this
     explicit Params(const Json::Value &params)

@@ -14,8 +14,8 @@ namespace OvraBase {
 
 using Deadline = std::chrono::steady_clock::time_point;
 
-/// Whether the errno says that descriptors, memory or threads have run out here, which says nothing
-/// about the peer.
+/// Whether an errno of the functions below says that descriptors, memory, threads or local ports
+/// have run out here, which says nothing about the peer.
 bool isShortage(int number);
 
 /// The addresses of a host in the order of preference (RFC 6724). The system's resolver cannot be

@@ -23,6 +23,15 @@ std::optional<T> parseNumber(std::string_view text, T min = std::numeric_limits<
     return whole && number >= min && number <= max ? std::optional(number) : std::nullopt;
 }
 
+/// left - right, or the nearest number that the type has.
+template <typename T>
+T saturatingDifference(T left, T right) {
+    T difference{};
+    return !__builtin_sub_overflow(left, right, &difference) ? difference
+           : right < 0                                       ? std::numeric_limits<T>::max()
+                                                             : std::numeric_limits<T>::min();
+}
+
 /// A TCP port that can be connected to: 1 to 65535.
 inline std::optional<int> parsePort(std::string_view text) {
     return parseNumber(text, 1, kMaxPort);

@@ -5,6 +5,7 @@
 
 #include <json/value.h>
 
+#include <cstdint>
 #include <string>
 
 namespace OvraDRCore {
@@ -72,6 +73,12 @@ public:
     /// Stores `value` as measured from `start` to `end` (seconds of the system clock), even if a
     /// younger value is stored.
     bool UpdateWithData(const Json::Value &value, long start, long end) const;
+    /// Milliseconds of the system clock.
+    static std::int64_t Now();
+    /// Stores `value` as found by something that began at `start` (Now()) and has just ended. It is
+    /// as old as a refreshed value, and never replaces a younger one either.
+    /// \return false if it could not be stored.
+    bool UpdateWithFinding(const Json::Value &value, std::int64_t start) const;
     /// Deletes the entry; succeeds if there is none.
     bool Remove();
 

@@ -18,7 +18,8 @@ struct sqlite3;
 /// Hence a child may use the library like a fresh process. Objects that the parent made before the
 /// fork and that hold a connection to a database (SqliteDB and what derives from it) or have an
 /// operation under way are not to be used in the child; a FileLock of the parent holds nothing
-/// there.
+/// there. Connections that other threads are making at the moment of the fork stay open in the
+/// child, unused, until it executes another program or ends.
 namespace OvraDRCore {
 
 /// A section during which no other thread forks. Cheap: two atomic additions to a number of the

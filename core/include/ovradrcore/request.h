@@ -39,9 +39,8 @@ public:
     void addParam(const Json::Value &object);
     /// The parameters hold login material and must be sealed.
     void setEncryptRequired(bool required) { encryptRequired_ = required; }
-    /// \param seconds  how long the transport waits for the reply, 1 to kMaxResponseTimeout; any
-    /// other
-    ///                 value is logged and makes the request invalid
+    /// How long the transport waits for the reply.
+    /// \param seconds  1 to kMaxResponseTimeout; others are logged and make the request invalid
     void setResponseTimeout(long seconds);
     /// A file to upload, and the name under which it is sent. Both or neither.
     void setUpload(const std::string &path, const std::string &name);

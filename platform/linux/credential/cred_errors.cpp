@@ -10,9 +10,8 @@ const char *credErrorText(int error) {
     case CredError::kBadArgument:
         return "the endpoint or the call is not valid: check protocol, host and port";
     case CredError::kOutOfMemory:
-        return "this process has no memory, descriptor or thread left: end what takes them, or "
-               "raise its "
-               "limits";
+        return "no memory, descriptor, thread or local port is left here: end what takes them, or "
+               "raise the limits";
     case CredError::kInternal:
         return "the request failed: the system log says why";
     case CredError::kNoPermission:
@@ -23,7 +22,7 @@ const char *credErrorText(int error) {
         return "the endpoint's key is not the one trusted for it: find out why it changed, then "
                "forget the old one";
     case CredError::kReplyTooLarge:
-        return "the reply is too large";
+        return "the reply is too large: ask for less at once";
     case CredError::kReplyBroken:
         return "the reply is not one of a web API: check that the port is the appliance's";
     case CredError::kConnectionLost:

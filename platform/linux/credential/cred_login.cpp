@@ -1,5 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "credential/cred_objects.h"
+#include "credential/device_token.h"
 #include "http/web_call.h"
 #include "ovraplatform/api_errors.h"
 
@@ -53,6 +54,9 @@ CredExpected<Json::Value> login(const OVRACred &cred, const std::string &otp, OV
     call.params["passwd"] = cred.passwd.get();
     if (!otp.empty()) {
         call.params["otp_code"] = otp;
+    }
+    if (const auto device = OvraPlatform::deviceToken(*endpoint, cred.account); !device.empty()) {
+        call.params["device_token"] = device.get();
     }
     return OvraPlatform::callWebAPI(*endpoint, call,
                                     {std::chrono::steady_clock::now() + kLoginTime})

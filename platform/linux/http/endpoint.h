@@ -13,9 +13,8 @@ inline constexpr char kEntryPoint[] = "webapi/query.cgi";
 class Endpoint {
 public:
     /// \param protocol  "http" or "https"
-    /// \param host      a host name in ASCII (letters, digits, '-', '.', '_'), an IPv4 address, or
-    /// an
-    ///                  IPv6 address with or without brackets
+    /// \param host      a host name in ASCII (letters, digits, '-', '.', '_') or an address, one of
+    ///                  IPv6 with or without brackets
     /// \param port      1 to 65535
     /// \return std::nullopt if one of them is something else.
     [[nodiscard]] static std::optional<Endpoint> make(const std::string &protocol,
@@ -28,8 +27,8 @@ public:
     bool isIpv6() const { return host_.find(':') != std::string::npos; }
     /// "https://host:5001": the same text for the same endpoint.
     std::string key() const;
-    /// \param path  relative to the root; std::nullopt if a character in it would not be part of a
-    /// path
+    /// \param path  relative to the root
+    /// \return std::nullopt if a character in it would not be part of a path.
     [[nodiscard]] std::optional<std::string> url(const std::string &path) const;
 
 private:

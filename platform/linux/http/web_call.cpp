@@ -23,10 +23,29 @@ constexpr long kHttpForbidden = 403;
 constexpr long kHttpNotFound = 404;
 constexpr long kHttpServerError = 500;
 
+/// Parses a reply; what it may make us do is bounded, because a peer wrote it.
+CredExpected<Json::Value> parseReply(const std::string &text) {
+    Json::Value document;
+    switch (const OvraDRCore::JsonFault fault = OvraDRCore::parseJson(document, text)) {
+    case OvraDRCore::JsonFault::kNone:
+        return document;
+    case OvraDRCore::JsonFault::kNotJson:
+        return tl::unexpected(CredError::kReplyBroken);
+    default:
+        OVRA_NOTICE("A reply of [%zu] bytes is refused, because it %s", text.size(),
+                    OvraDRCore::describe(fault));
+        return tl::unexpected(CredError::kReplyTooLarge);
+    }
+}
+
 /// What came as a reply, parsed once for all callers.
 CredExpected<WebReply> readReply(std::string text) {
+    CredExpected<Json::Value> document = parseReply(text);
+    if (!document) {
+        return tl::unexpected(document.error());
+    }
     OvraDRCore::Response response;
-    response.setResp(text);
+    response.setResp(*std::move(document));
     if (!response.isValid()) {
         return tl::unexpected(CredError::kReplyBroken);
     }
@@ -168,12 +187,15 @@ private:
     }
 
     Ending read(const std::string &body, const ReplyKey &replyKey) {
-        Json::Value reply;
-        if (!OvraDRCore::fromString(reply, body) || !reply.isObject()) {
+        CredExpected<Json::Value> reply = parseReply(body);
+        if (!reply) {
+            return tl::unexpected(reply.error());
+        }
+        if (!reply->isObject()) {
             return tl::unexpected(CredError::kReplyBroken);
         }
-        return reply.isMember("sealed_reply") ? readSealed(reply, replyKey)
-                                              : readPlain(std::move(reply), body);
+        return reply->isMember("sealed_reply") ? readSealed(*reply, replyKey)
+                                               : readPlain(*std::move(reply), body);
     }
 
     Ending readSealed(const Json::Value &reply, const ReplyKey &replyKey) {

@@ -4,6 +4,7 @@
 #include "http/form_fields.h"
 
 #include <ovrabase/number.h>
+#include <ovrabase/secret.h>
 #include <ovradrcore/json.h>
 
 #include <algorithm>
@@ -103,7 +104,7 @@ std::optional<FormFields> splitForm(std::string_view body) {
 }
 
 /// Puts one field where it belongs, or says why it does not belong anywhere.
-tl::expected<void, std::string> takeField(WireCall &call, const std::string &name,
+tl::expected<void, std::string> takeField(ReceivedCall &call, std::string &name,
                                           std::string &value) {
     if (name == kApi) {
         call.api = std::move(value);
@@ -118,8 +119,8 @@ tl::expected<void, std::string> takeField(WireCall &call, const std::string &nam
         if (call.version <= 0) {
             return tl::unexpected(std::string("version is not a positive number"));
         }
-    } else if (!OvraDRCore::fromString(call.params[name], value)) {
-        return tl::unexpected(std::string("a parameter is not JSON text"));
+    } else {
+        call.texts.emplace_back(std::move(name), std::move(value));
     }
     return {};
 }
@@ -167,18 +168,20 @@ std::optional<std::string> encodeForm(const WireCall &call) {
     return fields ? std::optional(encodeForm(*fields)) : std::nullopt;
 }
 
-tl::expected<WireCall, std::string> decodeForm(std::string_view body) {
+tl::expected<ReceivedCall, std::string> decodeForm(std::string_view body) {
     const auto refused = [](const char *why) { return tl::unexpected(std::string(why)); };
     std::optional<FormFields> fields = splitForm(body);
     if (!fields) {
         return refused("the body is not a form, or has too many fields");
     }
-    WireCall call;
     std::set<std::string_view> seen;
-    for (auto &[name, value] : *fields) {
+    for (const auto &[name, value] : *fields) {
         if (!seen.insert(name).second) {
             return refused("a field stands twice");
         }
+    }
+    ReceivedCall call;
+    for (auto &[name, value] : *fields) {
         if (const auto taken = takeField(call, name, value); !taken) {
             return tl::unexpected(taken.error());
         }
@@ -186,10 +189,23 @@ tl::expected<WireCall, std::string> decodeForm(std::string_view body) {
     if (call.api.empty() || call.method.empty() || call.version == 0) {
         return refused("api, version and method are needed");
     }
-    if (!call.sealed.empty() && (!call.params.empty() || !call.sid.empty())) {
+    if (!call.sealed.empty() && (!call.texts.empty() || !call.sid.empty())) {
         return refused("a sealed request carries nothing beside the envelope");
     }
     return call;
+}
+
+OvraDRCore::JsonFault parseParams(ReceivedCall &call, const OvraDRCore::JsonLimits &limits) {
+    OvraDRCore::JsonLimits left = limits;
+    OvraDRCore::JsonFault fault = OvraDRCore::JsonFault::kNone;
+    for (auto &[name, text] : call.texts) {
+        if (fault == OvraDRCore::JsonFault::kNone) {
+            fault = OvraDRCore::parseJson(call.params[name], text, left, &left);
+        }
+        OvraBase::wipe(text);
+    }
+    call.texts.clear();
+    return fault;
 }
 
 } // namespace OvraPlatform

@@ -82,7 +82,9 @@ std::optional<Json::Value> SealKeyPair::unseal(const std::string &envelope) cons
     Json::Value plain;
     if (crypto_box_seal_open(bytesOf(text), sealed->data(), sealed->size(), public_.data(),
                              secret_.data()) != 0 ||
-        !OvraDRCore::fromString(plain, text) || !plain.isObject()) {
+        OvraDRCore::parseJson(plain, text, OvraDRCore::kRequestLimits) !=
+            OvraDRCore::JsonFault::kNone ||
+        !plain.isObject()) {
         return std::nullopt;
     }
     return plain;

@@ -115,7 +115,7 @@ void Database::Close::operator()(sqlite3 *database) const {
 Database::Database(std::string path, const DatabaseLayout &layout)
     : path_(std::move(path))
     , layout_(layout) {
-    if (!makeFile()) {
+    if (path_ != kInMemory && !makeFile()) {
         return;
     }
     const OvraDRCore::NoFork noFork;
@@ -193,7 +193,7 @@ bool Database::setUp() {
         return false;
     }
     const auto version = pragma("PRAGMA user_version");
-    const bool named = pragma("PRAGMA application_id") == layout_.applicationId;
+    const bool named = version && pragma("PRAGMA application_id") == layout_.applicationId;
     if (failed() || !execute("COMMIT")) {
         return false;
     }

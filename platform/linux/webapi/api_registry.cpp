@@ -97,7 +97,8 @@ APIQueue APIRegistry::queue(const APICall &call) const {
     return (*entry)->choice ? (*entry)->choice(call.params) : (*entry)->queue;
 }
 
-Json::Value APIRegistry::dispatch(const APICall &call, const APICaller &caller) const {
+std::optional<Json::Value> APIRegistry::refusal(const APICall &call,
+                                                const APICaller &caller) const {
     const auto found = find(call);
     if (!found) {
         return apiError(found.error(), refusalText(found.error()));
@@ -114,10 +115,17 @@ Json::Value APIRegistry::dispatch(const APICall &call, const APICaller &caller) 
         return apiError(APIError::kNoPermission,
                         "the call is for the appliance's own processes: make it on the appliance");
     }
+    return std::nullopt;
+}
+
+Json::Value APIRegistry::dispatch(const APICall &call, const APICaller &caller) const {
+    if (std::optional<Json::Value> refused = refusal(call, caller)) {
+        return *std::move(refused);
+    }
     if (!call.params.isNull() && !call.params.isObject()) {
         return apiError(APIError::kBadRequest, "the parameters are not an object");
     }
-    return runHandler(entry->handler, call, caller);
+    return runHandler((*find(call))->handler, call, caller);
 }
 
 void APIRegistry::host() {

@@ -69,12 +69,34 @@ TEST(AliasRegistry, IsTheSameAfterARestartAndRefusesRubbish) {
     EXPECT_EQ(enrol(registry, "nas", "key2", 0), refused(Refusal::kTaken));
     EXPECT_EQ(enrol(registry, "new", "key2", 0), 6002);
 
-    std::ofstream(kFile) << "rubbish";
-    const auto refusedFile = AliasRegistry(kFile, kLimits).load();
-    ASSERT_FALSE(refusedFile);
-    EXPECT_NE(refusedFile.error().text.find(kFile), std::string::npos);
+    // Half a list would free the other aliases, for somebody else to take.
+    for (const char *damaged : {"rubbish", "farlink-aliases-2 6000\n", "farlink-aliases-1 6000 1\n",
+                                "farlink-aliases-1 6000\nnas x 9 key1\nnew 6002 9 key2\n",
+                                "farlink-aliases-1 6000\nnas 6000 9\nnew 6002 9 key2\n",
+                                "farlink-aliases-1 6000\nN 6000 9 key1\n"}) {
+        std::ofstream(kFile) << damaged;
+        const auto refusedFile = AliasRegistry(kFile, kLimits).load();
+        ASSERT_FALSE(refusedFile) << damaged;
+        EXPECT_NE(refusedFile.error().text.find(kFile), std::string::npos);
+    }
     std::filesystem::remove(kFile);
     std::filesystem::create_directory(kFile);
     EXPECT_EQ(enrol(registry, "more", "key3", 0), refused(Refusal::kNotStored));
     EXPECT_FALSE(registry.find("more")) << "what is not stored does not hold";
+}
+
+TEST(AliasRegistry, TakesFromItsFileWhatFitsItsPorts) {
+    std::ofstream(kFile) << "farlink-aliases-1 6002\nfirst 6000 9 key1\nlow 5999 9 key1\n"
+                            "high 6003 9 key1\ntwice 6000 9 key1\n-bad 6001 9 key1\n"
+                            "last 6002 9 key2\n";
+    AliasRegistry registry(kFile, kLimits);
+    ASSERT_TRUE(registry.load());
+    std::string names;
+    for (const Alias &alias : registry.list()) {
+        names += alias.name + " ";
+    }
+    EXPECT_EQ(names, "first last ");
+    EXPECT_EQ(enrol(registry, "last", "key3", 8), refused(Refusal::kTaken));
+    EXPECT_EQ(enrol(registry, "last", "key3", 9), 6002) << "its lease is over";
+    EXPECT_EQ(enrol(registry, "new", "key3", 9), 6001) << "the only free one, after a round";
 }

@@ -64,7 +64,8 @@ protected:
     }
 
     std::string address = "192.0.2.1";
-    TunnelServer tunnelServer{[](const std::string &, const std::string &) { return false; }, {}};
+    TunnelServer tunnelServer{
+        [](const std::string &, const std::string &, const std::string &) { return false; }, {}};
     AliasRegistry aliases{"/usr/ovra/aliases", {20100, 20110, std::chrono::seconds(60), 2}};
     RelayApi api;
 };
@@ -73,7 +74,8 @@ class TheBoundedRelayApi : public TheRelayApi {
 protected:
     TheBoundedRelayApi()
         : TheRelayApi({.aliasesPerHour = 2,
-                       .callers = 2,
+                       .callers = 3,
+                       .callersOfOne = 2,
                        .challenge = std::chrono::seconds(2),
                        .hold = std::chrono::seconds(1)}) {}
 };
@@ -119,11 +121,11 @@ TEST_F(TheRelayApi, TellsTheApplianceOfItsCallersAndOfAnotherEnrolment) {
     const Json::Value first = call("enrol", proof(owner, "nas"))["data"]["token"];
     Reply waiting = begin("wait", named("nas", first));
     EXPECT_EQ(waiting.wait_for(std::chrono::milliseconds(100)), std::future_status::timeout);
-    EXPECT_TRUE(api.announce("nas", "caller-1"));
+    EXPECT_TRUE(api.announce("nas", "caller-1", "a"));
     EXPECT_EQ(waiting.get()["data"]["callers"][0], "caller-1");
-    EXPECT_TRUE(api.announce("nas", "caller-2")) << "between two questions";
+    EXPECT_TRUE(api.announce("nas", "caller-2", "a")) << "between two questions";
     EXPECT_EQ(call("wait", named("nas", first))["data"]["callers"][0], "caller-2");
-    EXPECT_FALSE(api.announce("nobody", "caller-3"));
+    EXPECT_FALSE(api.announce("nobody", "caller-3", "a"));
 
     waiting = begin("wait", named("nas", first));
     const Json::Value second = call("enrol", proof(owner, "nas"))["data"]["token"];
@@ -147,7 +149,7 @@ TEST_F(TheRelayApi, ServesEverybodyElseWhileAChangeIsBeingStored) {
     api.endOverdue();
     EXPECT_EQ(code(call("lookup", named("two"))), 106) << "not stored, so nobody has it";
     EXPECT_EQ(code(call("lookup", named("nas"))), 0);
-    EXPECT_TRUE(api.announce("nas", "caller"));
+    EXPECT_TRUE(api.announce("nas", "caller", "a"));
     EXPECT_EQ(waiting.get()["data"]["callers"][0], "caller");
     EXPECT_EQ(changes[0].wait_for(std::chrono::seconds(0)), std::future_status::timeout);
     flock(held.get(), LOCK_UN);
@@ -191,9 +193,11 @@ TEST_F(TheBoundedRelayApi, NewAliasesCallersChallengesAndPolls) {
     std::this_thread::sleep_for(std::chrono::milliseconds(3100));
     api.endOverdue();
     EXPECT_EQ(waiting.get()["data"]["callers"], Json::Value(Json::arrayValue));
-    EXPECT_TRUE(api.announce("nas-1", "caller-1"));
-    EXPECT_TRUE(api.announce("nas-1", "caller-2"));
-    EXPECT_FALSE(api.announce("nas-1", "caller-3")) << "it fetches none";
+    EXPECT_TRUE(api.announce("nas-1", "caller-1", "a"));
+    EXPECT_TRUE(api.announce("nas-1", "caller-2", "a"));
+    EXPECT_FALSE(api.announce("nas-1", "caller-3", "a")) << "one client's share";
+    EXPECT_TRUE(api.announce("nas-1", "caller-3", "b"));
+    EXPECT_FALSE(api.announce("nas-1", "caller-4", "c")) << "it fetches none";
     EXPECT_EQ(code(call("enrol", old)), 105) << "a challenge that is too old";
 }
 

@@ -3,6 +3,7 @@
 #include "tunnel_server.h"
 
 #include <condition_variable>
+#include <list>
 #include <mutex>
 #include <thread>
 
@@ -19,10 +20,12 @@ class ThroughTheTunnelServer : public testing::Test {
 protected:
     void begin(const TunnelServer::Limits &limits) {
         server = std::make_unique<TunnelServer>(
-            [this](const std::string &alias, const std::string &id) {
+            [this](const std::string &alias, const std::string &id, const std::string &client) {
                 const std::lock_guard lock(mutex);
-                rung = alias == "nas" ? id : "";
-                announced.notify_all();
+                if (client == "127.0.0.1") {
+                    rung = alias == "nas" ? id : "";
+                    announced.notify_all();
+                }
                 return there;
             },
             limits);
@@ -109,7 +112,8 @@ TEST_F(ThroughTheTunnelServer, AreBoundedAndEndWithTheAlias) {
         EXPECT_EQ(hear(client), "through");
         EXPECT_EQ(hearAll(dial(callerPort)), "") << "and once it is put through";
         const UniqueFd silent = dial(tunnelPort);
-        EXPECT_EQ(hearAll(dial(tunnelPort)), "") << "an appliance too many that says nothing";
+        const UniqueFd next = dial(tunnelPort);
+        EXPECT_EQ(hearAll(silent), "") << "an appliance that says nothing makes room";
         server->close("nas");
         EXPECT_EQ(hearAll(client), "");
         EXPECT_EQ(hearAll(appliance), "");
@@ -118,6 +122,21 @@ TEST_F(ThroughTheTunnelServer, AreBoundedAndEndWithTheAlias) {
     const UniqueFd client = dial(callerPort);
     const UniqueFd appliance = answer(caller());
     EXPECT_EQ(hearAll(client), "") << "in silence for too long";
+}
+
+TEST_F(ThroughTheTunnelServer, OneClientNeverTakesAllPlacesFromTheOthers) {
+    begin({.perAlias = 8, .arriving = 8, .line = kLong, .answer = kLong});
+    std::list<UniqueFd> hostile;
+    for (const char *attacker : {"127.0.0.2", "127.0.0.3", "127.0.0.4"}) {
+        for (int i = 0; i < 8; ++i) {
+            hostile.push_back(dial(callerPort, attacker));
+            hostile.push_back(dial(tunnelPort, attacker));
+        }
+        const UniqueFd client = dial(callerPort);
+        const UniqueFd appliance = answer(caller());
+        say(appliance, "through");
+        EXPECT_EQ(hear(client), "through");
+    }
 }
 
 TEST_F(ThroughTheTunnelServer, WhatTheOtherEndDoesNotTakeStaysWithTheSender) {

@@ -47,9 +47,9 @@ std::vector<std::string> places() {
     add("/usr/ovra/etc/ovradr/",
         {"node.info", "node.db", "node.db-journal", "ovradrd.conf", "ovradrd.key", "ovradrd.crt",
          "ovradrd.seal", "farlink.conf", ".lock"});
-    add("/usr/ovra/var/ovradr/",
-        {"accounts.db", "sessions.db", "sessions.db-journal", "releases.db", "known_endpoints",
-         "farlink.key", ".lock", "webapi.sock", "webapi.sock.lock"});
+    add("/usr/ovra/var/ovradr/", {"accounts.db", "sessions.db", "sessions.db-journal",
+                                  "releases.db", "logins.db", "device.key", "known_endpoints",
+                                  "farlink.key", ".lock", "webapi.sock", "webapi.sock.lock"});
     add("/run/lock/", {"drnode.info.lock"});
     add("/tmp/.ovradrcache", {"", "/dr_node_conn_cache", "/dr_node_conn_cache.lock"});
     return all;

@@ -69,13 +69,15 @@ TEST(CommandLine, WhatNeedsTheDatabaseSaysWhenItIsNotSetUp) {
 
 TEST(CommandLine, HelpAndVersionAreNoFailures) {
     EXPECT_EQ(run({"--version"}).out, "ovradr " OVRADR_VERSION "\n");
+    EXPECT_NE(run({"cred", "crate"}).err.find("no such command"), std::string::npos);
     const Result help = run({"call", "--help"});
     EXPECT_EQ(help.exit, 0);
     EXPECT_NE(help.out.find("Example"), std::string::npos) << help.out;
 }
 
 TEST(CommandLine, OutputThatCannotBeWrittenIsAFailure) {
-    EXPECT_EQ(WEXITSTATUS(std::system(OVRADR_PROGRAM " node id >/dev/full")), 1);
+    EXPECT_EQ(WEXITSTATUS(std::system(OVRADR_PROGRAM " node id >/dev/full 2>/tmp/said")), 1);
+    EXPECT_NE(readFile("/tmp/said").find("No space left on device"), std::string::npos);
 }
 
 } // namespace OvradrTest

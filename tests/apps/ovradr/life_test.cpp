@@ -6,6 +6,7 @@
 #include "shared/session_lock.h"
 
 #include <ovradrcore/json.h>
+#include <ovraplatform/farlink.h>
 
 #include <atomic>
 #include <csignal>
@@ -35,6 +36,7 @@ protected:
         addCred("node_cred", "n1", "c1", "https", remote.port(), "old");
         remote.forgetAnswers();
         admitBob(remote);
+        remote.answer("lookup", success(R"({"port":)" + std::to_string(remote.port()) + "}"));
         for (const char *method :
              {"probe", "login", "info", "create", "test_privilege", "logout", "delete"}) {
             remote.before(method, [this, method] { called(method); });
@@ -78,6 +80,7 @@ protected:
 
     const Arguments create = asBob(remote, {"cred", "create", url});
     const Arguments set = asBob(remote, {"cred", "set", "c1"});
+    const Arguments relayed{"--url", "flk:nas"};
     const Arguments drop{"cred", "delete", "c1", "--json"};
     std::atomic<int> calls = 0;
     std::atomic<int> fatal = 0;
@@ -109,9 +112,11 @@ TEST_F(Life, ADeletionSaysWhatBecameOfTheSession) {
 }
 
 TEST_F(Life, ACommandThatIsKilledAnywhereLeavesTheOldOrTheNewStateAndNoSessionUnseen) {
+    ASSERT_TRUE(OvraPlatform::writeFarlinkSettings({"127.0.0.1", remote.port(), ""}));
     const std::pair<Arguments, std::string> cases[] = {// with the sessions in the rows afterwards
                                                        {create, "old\ngranted-s3cret\n"},
                                                        {set, "granted-s3cret\n"},
+                                                       {set + relayed, "granted-s3cret\n"},
                                                        {drop, ""}};
     for (const auto &[command, after] : cases) {
         begin();
@@ -119,6 +124,7 @@ TEST_F(Life, ACommandThatIsKilledAnywhereLeavesTheOldOrTheNewStateAndNoSessionUn
         const int last = calls;
         EXPECT_EQ(sessions(), after);
         EXPECT_GE(last, 3);
+        const bool moves = command.back() == relayed.back();
         for (int call = 1; call <= last; ++call) {
             SCOPED_TRACE(command[1] + " killed at call " + std::to_string(call));
             begin();
@@ -126,6 +132,8 @@ TEST_F(Life, ACommandThatIsKilledAnywhereLeavesTheOldOrTheNewStateAndNoSessionUn
             runUntil(command, call);
             const std::string rows = sessions();
             EXPECT_TRUE(rows == "old\n" || rows == after) << rows;
+            EXPECT_EQ(querySql("SELECT protocol FROM node_cred WHERE protocol = 'flk'") == "flk\n",
+                      moves && rows == after);
             EXPECT_EQ(run({"session", "pending", "--retry"}).exit, 0);
             EXPECT_TRUE(pending().empty());
             const bool needed = rows.find("old") != std::string::npos;

@@ -27,6 +27,16 @@ TEST(Output, NothingThatATerminalObeysGetsThrough) {
     for (const auto &[raw, shown] : cases) {
         EXPECT_EQ(printable(raw), shown);
     }
+    // Every control and format character, and none beside them: RLM, isolates, tags, soft hyphen.
+    for (const char *hidden :
+         {"\u0085", "\u00ad", "\u061c", "\u200b", "\u200f", "\u202a", "\u2029", "\u2066", "\u2069",
+          "\ufeff", "\ufffb", "\U0001d17a", "\U000e0001", "\U000e007f"}) {
+        EXPECT_EQ(printable(hidden).substr(0, 2), "\\u");
+    }
+    for (const char *seen : {"\u00a0", "\u00ae", "\u200a", "\u2010", "\u202f", "\u2070", "~"}) {
+        EXPECT_EQ(printable(seen), seen);
+    }
+    EXPECT_EQ(prettyJson("\x7f\u202e"), "\"\\u007f\\u202e\"\n");
 }
 
 TEST(Output, ColumnsLineUpWhateverTheCellsHold) {

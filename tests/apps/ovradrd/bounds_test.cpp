@@ -70,7 +70,7 @@ TEST_F(Bounds, CutOffAClientWhoseRequestTakesTooLong) {
 }
 
 TEST_F(Bounds, OfAllBodiesTogetherRefuseWhatIsTooMuch) {
-    restart({.bodies = 100'000});
+    restart({.unjudged = 1 << 20, .bodies = 100'000});
     const auto tooMuch = [this] { return http({.body = std::string(50'000, 'x')}).code() == 107; };
     {
         const UniqueFd half = dial(port(false));
@@ -80,6 +80,40 @@ TEST_F(Bounds, OfAllBodiesTogetherRefuseWhatIsTooMuch) {
     }
     EXPECT_TRUE(soon([&] { return !tooMuch(); }))
         << "what the client that left had sent still counts";
+}
+
+TEST_F(Bounds, OfABodyAreThoseOfALogInUntilItsSessionIsKnown) {
+    addAccount("root", true);
+    const std::string call = "api=OVRA.DR.Node&version=1&method=test_privilege";
+    const std::string sid = "&_sid=" + session("root");
+    std::string zeros = "&x=[0";
+    for (int i = 0; i < 50'000; ++i) {
+        zeros += ",0";
+    }
+    zeros += "]";
+    const std::string text = "&x=%22" + std::string(900'000, 'x') + "%22";
+    const struct {
+        const char *what;
+        std::string body;
+        int code;
+        bool tls = true;
+    } bodies[] = {{"a session", call + sid + text, 0},
+                  {"and many values", call + sid + zeros, 0},
+                  {"and more of them", call + sid + zeros + "&y=" + zeros.substr(3), 108},
+                  {"and what is no JSON", call + sid + text.substr(0, text.size() - 3), 101},
+                  {"the session at the end", call + text + sid, 119},
+                  {"an unknown session", call + "&_sid=none" + zeros, 119},
+                  {"no such method", call + "s" + sid + text, 103},
+                  {"what needs none", std::string(kGetInfo) + text, 108},
+                  {"a seal", call + "&sealed=" + std::string(50'000, 'x'), 108},
+                  {"plain http", call + sid + text, 108, false}};
+    for (const auto &each : bodies) {
+        for (const bool chunked : {false, true}) {
+            EXPECT_EQ(http({.body = each.body, .tls = each.tls, .chunked = chunked}).code(),
+                      each.code)
+                << each.what;
+        }
+    }
 }
 
 TEST_F(Bounds, Leave500SlowConnectionsNoInfluenceAndHoldWhenMoreComeThanThereMayBe) {
@@ -136,22 +170,22 @@ TEST(FullQueues, RefuseAtOnceAndDoNotHoldUpTheLowerOnes) {
     Appliance::provision();
     const auto keys = OvraPlatform::SealKeyPair::load(OvraPlatform::kSealKeyFile).value();
     OvraPlatform::ReplayGuard guard;
-    Ovradrd::LoginApi api;
     std::optional<Ovradrd::CallDispatcher> dispatcher;
     Ovradrd::WorkQueues queues;
-    dispatcher.emplace(registry, keys, guard, api, queues);
-    const auto serve = [&](const std::string &method) {
-        dispatcher->serve({"api=Test&version=1&method=" + method, "127.0.0.1", true},
-                          [&](const std::string &document) {
-                              ++replies.at(json(document)["error"]["code"].asInt());
-                          });
+    dispatcher.emplace(registry, keys, guard, queues);
+    const auto serve = [&](const std::string &method, int client = 1) {
+        dispatcher->serve(
+            {"api=Test&version=1&method=" + method, "127.0.0." + std::to_string(client), true},
+            [&](const std::string &document) {
+                ++replies.at(json(document)["error"]["code"].asInt());
+            });
     };
     int places = 0;
     int refused = 0;
     for (const auto &[method, queue, threads] : rows) {
         places += threads;
         for (int i = 0; i < threads; ++i) {
-            serve(method);
+            serve(method, 2 + i);
         }
         EXPECT_TRUE(soon([&] { return inside == places; })) << method;
         for (int i = 0; i < 64 + 5; ++i) {

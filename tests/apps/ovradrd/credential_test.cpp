@@ -72,8 +72,18 @@ TEST_F(Credential, IsMadeByALogIn) {
     EXPECT_EQ(reply.data()["src_cred"]["node_id"], "n1");
     EXPECT_EQ(reply.data()["src_cred"]["port"], remote.port());
     EXPECT_EQ(rows("node_cred"), "n1|granted\n");
-    EXPECT_EQ(json(remote.params("login")),
-              json(R"({"account":"joe","passwd":"secret","otp_code":"123456"})"));
+    Json::Value sent = json(remote.params("login"));
+    const std::string device = sent["device_token"].asString();
+    sent.removeMember("device_token");
+    EXPECT_EQ(sent, json(R"({"account":"joe","passwd":"secret","otp_code":"123456"})"));
+    EXPECT_EQ(device.size(), 43U);
+    EXPECT_EQ(modeOf(OvraPlatform::kDeviceKeyFile), 0600U);
+    make();
+    EXPECT_EQ(json(remote.params("login"))["device_token"], device);
+    Json::Value other = byAccount();
+    other["account"] = "jim";
+    ask("create", other);
+    EXPECT_NE(json(remote.params("login"))["device_token"], device);
     EXPECT_EQ(reply.text.find("granted"), std::string::npos);
 }
 

@@ -1,119 +1,193 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "login_throttle.h"
+#include "platform/own_files.h"
+#include "platform/store/raw_sqlite.h"
+#include "support/log_capture.h"
 
-#include <gtest/gtest.h>
-
-#include <chrono>
-#include <future>
+#include <optional>
 #include <string>
-#include <vector>
 
 using Ovradrd::LoginThrottle;
-using std::chrono::milliseconds;
+using namespace std::chrono_literals;
 
 namespace {
 
-struct Throttle : testing::Test {
-    /// The delay of a log-in in milliseconds; -1: rejected.
-    long admit(const std::string &account, const std::string &address) {
-        const auto wait = throttle.admit(account, address);
-        return wait ? static_cast<long>(wait->count()) : -1;
+struct Throttle : OvraTest::OwnFiles {
+    void SetUp() override {
+        OwnFiles::SetUp();
+        restart();
     }
-    /// Log-ins that wait as required and then fail; the delay of the last.
-    long fail(int times, const std::string &account, const std::string &address) {
-        long wait = 0;
-        for (int i = 0; i < times; ++i) {
-            wait = admit(account, address);
-            now += milliseconds(wait);
+    std::string file() const { return path("state/logins.db"); }
+    /// A new one, whose clock shows `time`.
+    void restart() { open(file()); }
+    void open(const std::string &path) {
+        const LoginThrottle::Clock clock{[this] { return elapsed; }, [this] { return time; }};
+        throttle.emplace(path, clock);
+    }
+    void pass(std::chrono::seconds some) {
+        elapsed += some;
+        time += some.count();
+    }
+    static LoginThrottle::Login from(const std::string &address, const std::string &device = "",
+                                     const std::string &account = "ann") {
+        return {account, address, device};
+    }
+    /// How many of `tries` wrong log-ins at once are admitted.
+    int guess(int tries, const LoginThrottle::Login &login) {
+        int admitted = 0;
+        for (int i = 0; i < tries; ++i) {
+            admitted += throttle->admit(login) ? 1 : 0;
         }
-        return wait;
+        return admitted;
+    }
+    bool logIn(const LoginThrottle::Login &login) {
+        const auto attempt = throttle->admit(login);
+        if (attempt) {
+            throttle->recordSuccess(login, *attempt);
+        }
+        return attempt.has_value();
+    }
+    /// Strangers use up what they may.
+    void attack(const std::string &account = "ann") {
+        for (int i = 0; i < 30; ++i) {
+            guess(20, from("198.51.100." + std::to_string(i), "", account));
+        }
     }
 
-    LoginThrottle::TimePoint now{std::chrono::hours(1)};
-    LoginThrottle throttle{[this] { return now; }};
+    std::chrono::milliseconds elapsed{};
+    std::time_t time = 1'800'000'000;
+    std::optional<LoginThrottle> throttle;
 };
 
-TEST_F(Throttle, DoublesTheWaitAfterThreeFailures) {
-    for (const long wait : {0, 0, 0, 250, 500, 1000, 2000, 4000, 8000, 8000, 8000}) {
-        EXPECT_EQ(fail(1, "ann", "192.0.2.1"), wait);
+TEST_F(Throttle, Admits100GuessesAnHourAtOneAccountWhoeverGuessesAndHoweverOftenItIsRestarted) {
+    ASSERT_TRUE(logIn(from("192.0.2.1")) && logIn(from("192.0.2.2")) && logIn(from("192.0.2.3")));
+    int admitted = 0;
+    for (int second = 0; second < 2 * 3600; second += 30) {
+        if (second % 60 == 0) {
+            restart();
+        }
+        // Known addresses that are shared, a persistent stranger, and strangers of ever new ones.
+        for (const std::string &address :
+             {std::string("192.0.2.1"), std::string("192.0.2.2"), std::string("192.0.2.3"),
+              std::string("198.51.100.1"), "10.0." + std::to_string(second / 30) + ".1"}) {
+            admitted += guess(2, from(address));
+        }
+        if (second == 3570) {
+            EXPECT_LE(admitted, 100);
+            EXPECT_GT(admitted, 90);
+        }
+        pass(30s);
     }
-    EXPECT_EQ(admit("bob", "192.0.2.2"), 0);
+    EXPECT_LE(admitted, 40 + 2 * 60); // the bursts, then a guess a minute
 }
 
-TEST_F(Throttle, CountsForTheAccountAndForTheAddressOrIpv6NetworkByThemselves) {
-    for (const std::string i : {"0", "1", "2", "3", "4"}) {
-        fail(1, "ann", "192.0.2." + i);
-        fail(1, "user" + i, "198.51.100.1");
-        fail(1, "other" + i, "2001:db8:0:7::" + i);
+TEST_F(Throttle, KeepsNobodyOutWhoLoggedInBeforeNorAStrangerForAnothersGuesses) {
+    ASSERT_TRUE(logIn(from("192.0.2.1", "device")) && logIn(from("", "relayed")));
+    ASSERT_TRUE(logIn(from("2001:db8:0:7::1")));
+    EXPECT_EQ(guess(1000, from("198.51.100.1")), 10);
+    EXPECT_EQ(guess(1, from("198.51.100.2")), 1) << "one stranger took all";
+    attack();
+    restart();
+    const struct {
+        const char *who;
+        LoginThrottle::Login login;
+        bool admitted;
+    } rows[] = {
+        {"the address", from("192.0.2.1"), true},
+        {"its network", from("2001:db8:0:7:ffff::2"), true},
+        {"the device elsewhere", from("203.0.113.2", "device"), true},
+        {"the device through the relay", from("", "device"), true},
+        {"the device that came through the relay", from("203.0.113.2", "relayed"), true},
+        {"somebody else through the relay", from(""), false},
+        {"another device", from("203.0.113.2", "another"), false},
+        {"another network", from("2001:db8:0:8::1"), false},
+        {"another account", from("203.0.113.3", "", "bob"), true},
+        {"the device at another account", from("198.51.100.1", "device", "bob"), true},
+    };
+    for (const auto &row : rows) {
+        EXPECT_EQ(guess(1, row.login), row.admitted) << row.who;
     }
-    EXPECT_EQ(admit("ann", "192.0.2.99"), 1000);
-    EXPECT_EQ(admit("bob", "192.0.2.0"), 0);
-    EXPECT_EQ(admit("bill", "198.51.100.1"), 1000);
-    EXPECT_EQ(admit("sue", "2001:db8:0:7:ffff::1"), 1000);
-    EXPECT_EQ(admit("tom", "2001:db8:0:8::1"), 0);
+    const auto refused = throttle->admit(from("203.0.113.2"));
+    ASSERT_FALSE(refused);
+    EXPECT_EQ(refused.error(), 120s);
+    pass(120s);
+    EXPECT_EQ(guess(5, from("203.0.113.2")), 1);
 }
 
-TEST_F(Throttle, SpacesLoginsThatComeAtOnceAndTurnTheRestAway) {
-    fail(8, "ann", "192.0.2.1");
-    for (const long wait : {8000, 16000, -1}) {
-        EXPECT_EQ(admit("ann", "192.0.2.1"), wait);
+TEST_F(Throttle, CountsNoLogInThatIsRightOrCannotBeJudged) {
+    for (int i = 0; i < 100; ++i) {
+        ASSERT_TRUE(logIn(from("192.0.2.1"))) << i;
+        throttle->withdraw(throttle->admit(from("192.0.2.2")).value());
     }
-    EXPECT_EQ(admit("ann", "192.0.2.2"), -1);
-    now += std::chrono::seconds(8);
-    EXPECT_EQ(admit("ann", "192.0.2.1"), 16000);
+    // Nor does one's own account pay for guesses at others.
+    for (int i = 0; i < 100; ++i) {
+        guess(1, from("192.0.2.1", "", "user" + std::to_string(i)));
+        logIn(from("192.0.2.1"));
+    }
+    EXPECT_EQ(guess(1, from("192.0.2.1", "", "bob")), 0);
 }
 
-TEST_F(Throttle, AMinuteTakesOneFailureBack) {
-    fail(5, "ann", "192.0.2.1");
-    now += std::chrono::seconds(119);
-    EXPECT_EQ(admit("ann", "192.0.2.1"), 0); // long after the last one, but it counts: 4 + 1
-    EXPECT_EQ(admit("ann", "192.0.2.1"), 1000);
-    now += std::chrono::hours(1);
-    EXPECT_EQ(fail(3, "ann", "192.0.2.1"), 0);
+TEST_F(Throttle, ForgetsAnAddressAfter90DaysAndTheOldestOfManyClients) {
+    ASSERT_TRUE(logIn(from("192.0.2.1", "device")));
+    pass(std::chrono::hours(24 * 89));
+    attack();
+    EXPECT_EQ(guess(1, from("192.0.2.1")), 1);
+    pass(25h);
+    attack();
+    EXPECT_EQ(guess(1, from("192.0.2.1")), 0);
+    EXPECT_EQ(guess(1, from("203.0.113.1", "device")), 1);
+    for (int i = 0; i < LoginThrottle::kMaxKnown; ++i) {
+        pass(121s);
+        ASSERT_TRUE(logIn(from("", "device" + std::to_string(i)))) << i;
+    }
+    attack();
+    EXPECT_EQ(guess(1, from("", "device0")), 1);
+    EXPECT_EQ(guess(1, from("203.0.113.1", "device")), 0);
 }
 
-TEST_F(Throttle, ASuccessClearsTheAccountButNotTheAddress) {
-    fail(5, "ann", "192.0.2.1");
-    admit("ann", "192.0.2.9");
-    throttle.recordSuccess("ann", "192.0.2.9");
-    EXPECT_EQ(admit("ann", "192.0.2.9"), 0);
-    // Successes with one's own account allow no more guesses at others.
-    fail(1, "mallory", "192.0.2.1");
-    throttle.recordSuccess("mallory", "192.0.2.1");
-    EXPECT_EQ(admit("bob", "192.0.2.1"), 1000);
-}
-
-TEST_F(Throttle, AForgivenLoginIsNotCountedAndClearsNothing) {
-    fail(4, "ann", "192.0.2.1");
-    for (int i = 0; i < 5; ++i) {
-        EXPECT_EQ(fail(1, "ann", "192.0.2.1"), 500);
-        throttle.withdraw("ann", "192.0.2.1");
+TEST_F(Throttle, IsLedAstrayByNoClock) {
+    constexpr std::time_t kYear = 365L * 24 * 3600;
+    ASSERT_TRUE(logIn(from("", "device")));
+    for (const std::time_t jump : {-kYear, 2 * kYear, -kYear}) {
+        attack();
+        time += jump; // while it runs
+        EXPECT_EQ(guess(10, from("203.0.113.1")), 0) << jump;
+        restart();
+        EXPECT_EQ(guess(100, from("203.0.113.1")), jump > 0 ? 10 : 0) << jump; // one burst
+        attack();
+        pass(121s);
+        EXPECT_EQ(guess(3, from("203.0.113.2")), 1) << jump;
+        EXPECT_TRUE(logIn(from("", "device"))) << jump;
+        pass(1h);
     }
 }
 
-TEST_F(Throttle, AFloodOfNamesDoesNotMakeItForgetTheAccountThatIsGuessed) {
-    for (int i = 0; i < 6; ++i) {
-        fail(1, "ann", "192.0.2.1");
-        fail(1, "zoe", "192.0.2.2");
-    }
-    for (int i = 0; i < 6000; ++i) {
-        admit("name" + std::to_string(i),
-              "10.0." + std::to_string(i / 250) + "." + std::to_string(i % 250));
-    }
-    EXPECT_GE(admit("ann", "203.0.113.1"), 1000);
-    EXPECT_GE(admit("zoe", "203.0.113.2"), 1000);
+TEST_F(Throttle, StaysSmallUnderAFloodOfNamesAndForgetsNoAccountThatIsGuessed) {
+    attack();
+    OvraTest::RawSqlite raw(file());
+    ASSERT_TRUE(raw.run("WITH RECURSIVE n(i) AS (SELECT 1 UNION ALL SELECT i + 1 FROM n WHERE i < "
+                        "50000) INSERT INTO budget SELECT randomblob(16), " +
+                        std::to_string(time * 1000 + 180'000) + " FROM n"));
+    EXPECT_EQ(guess(1, from("203.0.113.1", "", "bob")), 1);
+    EXPECT_EQ(raw.cell("SELECT count(*) FROM budget"), std::to_string(LoginThrottle::kMaxBudgets));
+    EXPECT_EQ(guess(1, from("203.0.113.1")), 0);
+    pass(180s);
+    EXPECT_EQ(guess(1, from("203.0.113.1", "", "bob")), 1);
+    EXPECT_LT(raw.cell("SELECT count(*) FROM budget").size(), 3U);
 }
 
-TEST(ThrottleThreads, CountEveryFailure) {
-    LoginThrottle throttle;
-    std::vector<std::future<void>> threads(4);
-    for (auto &thread : threads) {
-        thread = std::async(std::launch::async, [&] { throttle.admit("ann", "192.0.2.1"); });
-    }
-    threads.clear(); // waits for them
-    const auto wait = throttle.admit("ann", "192.0.2.1");
-    ASSERT_TRUE(wait);
-    EXPECT_GT(*wait, milliseconds(250)); // the fourth waits for 250 ms, the fifth after it
+TEST_F(Throttle, CountsInMemoryWhileItsFileCannotBeUsedAndSaysSoOnce) {
+    OvraTest::writeFile(file(), std::string(8192, 'x'));
+    chmod(path("state").c_str(), 0700);
+    const LogCapture log;
+    EXPECT_EQ(guess(100, from("198.51.100.1")), 10);
+    EXPECT_EQ(log.count("counted in memory"), 1);
+    std::filesystem::remove(file());
+    pass(10min);
+    ASSERT_TRUE(logIn(from("192.0.2.1")));
+    EXPECT_EQ(OvraTest::RawSqlite(file()).cell("SELECT count(*) FROM known"), "1");
+    EXPECT_EQ(OvraTest::modeOf(file()), 0600U);
+    EXPECT_EQ(log.count("ERR"), 2); // what is wrong with the file, and what follows
 }
 
 } // namespace

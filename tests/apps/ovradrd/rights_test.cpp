@@ -10,6 +10,7 @@
 #include <algorithm>
 #include <ctime>
 #include <filesystem>
+#include <functional>
 
 namespace {
 
@@ -25,6 +26,7 @@ struct Scene {
     int nobody; ///< codes for a caller without a session, a user, and an administrator
     int user;
     int administrator;
+    int here = administrator; ///< for a process of the appliance
 };
 
 constexpr char kNode[] = "OVRA.DR.Node";
@@ -40,14 +42,14 @@ const Scene kScenes[] = {
     {kNode, "none", "{}", 1, 103, 103, 103},
     {kNode, "info", "{}", 2, 104, 104, 104},
     {"OVRA.Core.Auth", "login", "{}", 2, 104, 104, 104},
-    {"OVRA.Core.Auth", "login", "{}", 1, 106, 106, 106},
-    {"OVRA.Core.Auth", "logout", "{}", 1, 119, 0, 0},
+    {"OVRA.Core.Auth", "login", "{}", 1, 106, 106, 106, 101},
+    {"OVRA.Core.Auth", "logout", "{}", 1, 119, 0, 0, 119},
     {"OVRA.Core.Encryption", "getinfo", "{}", 1, 0, 0, 0},
     {kUser, "get", R"({"name":"user"})", 1, 119, 0, 0},
     {kUser, "get", R"({"name":"root"})", 1, 119, 105, 0},
     {kUser, "get", R"({"name":"none"})", 1, 119, 105, 106},
     {kUser, "get", "{}", 1, 119, 106, 106},
-    {"OVRA.Core.Farlink", "get", "{}", 1, 119, 105, 105},
+    {"OVRA.Core.Farlink", "get", "{}", 1, 119, 105, 105, 0},
     {kNode, "info", "{}", 1, 119, 0, 0},
     {kNode, "info", R"({"additional":"timezone"})", 1, 119, 106, 106},
     {kNode, "test_privilege", "{}", 1, 119, 105, 0},
@@ -58,9 +60,9 @@ const Scene kScenes[] = {
     {kNode, "test_connection", kOneEndpoint, 1, 119, 105, 500},
     {kNode, "test_connection", "{}", 1, 119, 105, 106},
     {kSession, "create", R"({"node_id":"n1"})", 1, 104, 104, 104},
-    {kSession, "create", R"({"node_id":"n1"})", 2, 119, 105, 0},
+    {kSession, "create", R"({"node_id":"n1"})", 2, 119, 105, 0, 527},
     {kSession, "create", R"({"node_id":""})", 2, 119, 105, 106},
-    {kSession, "temp_create", "{}", 1, 119, 105, 0},
+    {kSession, "temp_create", "{}", 1, 119, 105, 0, 527},
     {kSession, "get", R"({"session":"none"})", 1, 119, 528, 528},
     {kSession, "delete", R"({"session":"none"})", 1, 119, 105, 0},
     {kSession, "delete", "{}", 1, 119, 105, 106},
@@ -72,25 +74,63 @@ const Scene kScenes[] = {
     {kCredential, "test_set", "{}", 1, 119, 105, 106},
     {kCredential, "get", R"({"cred_id":"none"})", 1, 119, 105, 404},
     {kCredential, "delete", "{}", 1, 119, 105, 106},
-    {kCredential, "reverse_create", R"({"cred_id":"none"})", 1, 119, 105, 404},
-    {kCredential, "test_reverse_create", R"({"cred_id":"none"})", 1, 119, 105, 404},
-    {kCredential, "temp_reverse_create", R"({"cred_id":"none"})", 1, 119, 105, 404},
+    {kCredential, "reverse_create", R"({"cred_id":"none"})", 1, 119, 105, 404, 106},
+    {kCredential, "test_reverse_create", R"({"cred_id":"none"})", 1, 119, 105, 404, 106},
+    {kCredential, "temp_reverse_create", R"({"cred_id":"none"})", 1, 119, 105, 404, 106},
     {kCredential, "relay", R"({"cred_id":"none","webapi":{}})", 1, 119, 105, 404}};
 
 class Rights : public Appliance {};
 
 TEST_F(Rights, AreAskedForOfEveryCaller) {
-    addAccount("user", false);
+    addAccount("user", true); // not for long
     addAccount("root", true);
+    addAccount("disabled", true);
+    addAccount("gone", true);
+    OvraPlatform::AccountStore accounts;
+    const auto granted = [this](const char *user, const Scene &grant) {
+        const Json::Value params = json(grant.params);
+        return call(kSession, grant.version, grant.method, params, session(user))
+            .data()["session"]
+            .asString();
+    };
+    const Scene forNode{kSession, "create", R"({"node_id":"n1"})", 2, 0, 0, 0};
+    const Scene lent{kSession, "temp_create", "{}", 1, 0, 0, 0};
+    std::string ofUser = granted("user", forNode);
+    const std::string ofDisabled = granted("disabled", forNode);
+    const std::string ofGone = granted("gone", forNode);
+    ASSERT_TRUE(accounts.setAdministrator("user", false) &&
+                accounts.setDisabled("disabled", true) && accounts.remove("gone"));
+    const struct {
+        const char *name;
+        std::function<std::string()> session; ///< a call may end it
+        std::function<int(const Scene &)> code;
+    } roles[] = {
+        {"nobody", [] { return ""; }, &Scene::nobody},
+        {"an unknown session", [] { return std::string(43, 'x'); }, &Scene::nobody},
+        {"a node, whose account is gone", [&] { return ofGone; }, &Scene::nobody},
+        {"a node, whose account is disabled", [&] { return ofDisabled; },
+         [](const Scene &) { return 105; }},
+        {"a user", [] { return session("user"); }, &Scene::user},
+        {"an administrator", [] { return session("root"); }, &Scene::administrator},
+        {"a node", [&] { return granted("root", forNode); }, &Scene::administrator},
+        {"a lent session", [&] { return granted("root", lent); }, &Scene::administrator},
+        {"a node, whose account is no administrator any more",
+         [&] {
+             const bool ended = !OvraPlatform::SessionStore().find(ofUser);
+             return ended ? ofUser = session("user") : ofUser;
+         },
+         &Scene::user},
+    };
     for (const Scene &scene : kScenes) {
-        SCOPED_TRACE(std::string(scene.api) + " " + scene.method + " " + scene.params);
-        const auto code = [&](const std::string &sid) {
-            return call(scene.api, scene.version, scene.method, json(scene.params), sid).code();
-        };
-        EXPECT_EQ(code(""), scene.nobody);
-        EXPECT_EQ(code("unknown-session"), scene.nobody);
-        EXPECT_EQ(code(session("user")), scene.user);
-        EXPECT_EQ(code(session("root")), scene.administrator);
+        const Json::Value params = json(scene.params);
+        for (const auto &role : roles) {
+            EXPECT_EQ(call(scene.api, scene.version, scene.method, params, role.session()).code(),
+                      role.code(scene))
+                << scene.api << " " << scene.method << " " << scene.params << " by " << role.name;
+        }
+        const Json::Value here = callHere(scene.api, scene.version, scene.method, params);
+        EXPECT_EQ(here["success"] == true ? 0 : here["error"]["code"].asInt(), scene.here)
+            << scene.api << " " << scene.method << " " << scene.params << " by a local process";
     }
 }
 
@@ -199,12 +239,8 @@ TEST_F(Node, FindsTheFirstEndpointThatItReaches) {
               params["conns"][1]);
 }
 
-TEST_F(Node, ServesItsOwnProcessesAsAdministrators) {
+TEST_F(Node, TellsItsOwnProcessesHowItIsReached) {
     EXPECT_EQ(callHere("OVRA.Core.Farlink", 1, "get")["data"], json(R"({"enabled":false})"));
-    EXPECT_EQ(callHere(kNode, 1, "test_privilege")["success"], true);
-    EXPECT_EQ(callHere(kCredential, 1, "create")["error"]["code"], 106);
-    EXPECT_EQ(callHere("OVRA.Core.Auth", 1, "login")["error"]["code"], 101);
-    EXPECT_EQ(callHere("OVRA.Core.Auth", 1, "logout")["error"]["code"], 119);
 }
 
 } // namespace

@@ -1,10 +1,11 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "service/connections.h"
+#include "service/listener.h"
+#include "support/sockets.h"
 
 #include <gtest/gtest.h>
 #include <poll.h>
 #include <sys/socket.h>
-#include <unistd.h>
 
 #include <chrono>
 #include <list>
@@ -20,33 +21,37 @@ using OvraService::Connections;
 using Phase = Connections::Phase;
 using namespace std::chrono_literals;
 
-/// One end of a socket pair represents a client's connection.
+/// A client's connection over the loopback interface.
 class Client {
 public:
     Client(Connections &table, const std::string &name)
         : table_(table) {
-        if (socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, ends_) == 0) {
-            connection_ = table.open(ends_[0], name);
-        }
+        const auto listener = OvraService::Listener::listen("127.0.0.1", 0);
+        ours_ = OvraTest::dial(listener->port);
+        theirs_.reset(accept4(listener->socket.get(), nullptr, nullptr, SOCK_CLOEXEC));
+        connection_ = table.open(theirs_.get(), name);
     }
     Client(const Client &) = delete;
-    ~Client() {
-        table_.close(connection_);
-        close(ends_[0]);
-        close(ends_[1]);
-    }
+    ~Client() { table_.close(connection_); }
 
     void enter(Phase phase) { table_.enter(connection_, phase); }
     void beginRequest() { table_.beginRequest(connection_); }
+    void sendBody(std::size_t bytes) { table_.progress(connection_, bytes); }
+    void takeReply(const std::string &text) {
+        OvraTest::say(theirs_, text);
+        (void)OvraTest::hear(ours_);
+    }
+    void say(const std::string &text) { OvraTest::say(ours_, text); }
     /// Whether the connection is shut down within the time.
     bool isShut(std::chrono::milliseconds wait = 0ms) const {
-        pollfd end{ends_[1], POLLIN, 0};
+        pollfd end{ours_.get(), POLLIN, 0};
         return poll(&end, 1, static_cast<int>(wait.count())) == 1;
     }
 
 private:
     Connections &table_;
-    int ends_[2] = {-1, -1};
+    OvraBase::UniqueFd ours_;
+    OvraBase::UniqueFd theirs_;
     Connections::Connection *connection_ = nullptr;
 };
 
@@ -103,6 +108,43 @@ TEST(Connections, DoNotGiveANewConnectionMoreTimeBecauseItsHeaderCame) {
     const Client later(table, "b");
     EXPECT_TRUE(client.isShut(10s));
     EXPECT_FALSE(later.isShut());
+}
+
+TEST(Connections, EndSoonAfterTheFirstByteOfAFurtherRequest) {
+    Connections table({.arriving = 300ms, .idle = 60s});
+    Client silent(table, "a");
+    Client slow(table, "a");
+    Client early(table, "a"); // before the reply to its first request
+    for (Client *each : {&silent, &slow, &early}) {
+        each->enter(Phase::kWorking);
+    }
+    early.say("P");
+    std::this_thread::sleep_for(50ms);
+    for (Client *each : {&silent, &slow, &early}) {
+        each->enter(Phase::kIdle);
+    }
+    slow.say("P");
+    EXPECT_TRUE(slow.isShut(10s));
+    EXPECT_TRUE(early.isShut(10s));
+    EXPECT_FALSE(silent.isShut());
+}
+
+TEST(Connections, LastAsLongAsBodyOrReplyTravelFastEnough) {
+    Connections table({.arriving = 1500ms, .replying = 1500ms, .leastRate = 100});
+    for (const Phase phase : {Phase::kArriving, Phase::kReplying, Phase::kSending}) {
+        const auto run = [&](std::size_t bytes) {
+            Client client(table, "a");
+            client.enter(phase);
+            for (int i = 0; i < 25 && !client.isShut(); ++i) {
+                phase == Phase::kArriving ? client.sendBody(bytes)
+                                          : client.takeReply(std::string(bytes, 'x'));
+                std::this_thread::sleep_for(100ms);
+            }
+            return client.isShut();
+        };
+        EXPECT_FALSE(run(90)) << static_cast<int>(phase);
+        EXPECT_TRUE(run(1)) << static_cast<int>(phase);
+    }
 }
 
 } // namespace

@@ -92,6 +92,14 @@ std::string manyHeaders() {
     return bytes;
 }
 
+std::string manyZeros() {
+    std::string text;
+    for (int i = 0; i < 4'000'000; ++i) {
+        text += ",0";
+    }
+    return text;
+}
+
 TEST_F(CredRequestScene, TellsWhatWasWrongWithAnAnswerAndProbesForAnyOfTheEntryPoint) {
     using E = CredError;
     const std::string refusal = R"({"success":false,"error":{"code":105}})";
@@ -111,6 +119,8 @@ TEST_F(CredRequestScene, TellsWhatWasWrongWithAnAnswerAndProbesForAnyOfTheEntryP
                   {"a cut document", Answer::truncated(refusal), E::kConnectionLost, E::kNone},
                   {"7 MiB", Answer::success(R"({"x":")" + std::string(7 << 20, 'x') + "\"}"),
                    E::kNone, E::kNone},
+                  {"8 MB of numbers", Answer::success("{\"x\":[0" + manyZeros() + "]}"),
+                   E::kReplyTooLarge, E::kNone},
                   {"50 MB", Answer::huge(50'000'000, false), E::kReplyTooLarge, E::kNone},
                   {"9 MiB announced", Answer::huge(9 << 20, true), E::kReplyTooLarge, E::kNone},
                   {"headers without end", Answer::raw(manyHeaders()), E::kReplyTooLarge, E::kNone},

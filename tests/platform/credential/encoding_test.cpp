@@ -22,13 +22,15 @@ TEST(WireForm, BringsEveryValueBackAsItWas) {
     const auto body = encodeForm(call);
     ASSERT_TRUE(body);
     EXPECT_TRUE(body->starts_with("api=OVRA.DR.Node&version=2&method=info&_sid=")) << *body;
-    const auto read = decodeForm(*body);
-    ASSERT_TRUE(read);
+    auto read = decodeForm(*body);
+    ASSERT_TRUE(read && read->params.empty());
+    ASSERT_EQ(parseParams(*read), OvraDRCore::JsonFault::kNone);
     EXPECT_EQ(encodeForm(*read), body);
     EXPECT_EQ(read->sid, call.sid);
     EXPECT_EQ(OvraDRCore::toString(read->params), OvraDRCore::toString(call.params));
-    const auto others = decodeForm("method=get&&x=%22a+b%2f%2F%22&version=1&api=A&");
-    ASSERT_TRUE(others) << "as other clients write it";
+    auto others = decodeForm("method=get&&x=%22a+b%2f%2F%22&version=1&api=A&");
+    ASSERT_TRUE(others && parseParams(*others) == OvraDRCore::JsonFault::kNone)
+        << "as other clients write it";
     EXPECT_EQ(others->params["x"], "a b//");
 }
 
@@ -37,11 +39,20 @@ TEST(WireForm, RefusesWhatIsNoCall) {
          {"", "api=A&method=m", "api=A&version=0&method=m", "api=A&version=1x&method=m",
           "api=A&version=99999999999&method=m", "version=1&method=m", "api=A&version=1",
           "api=A&version=1&method=m&x", "api=A&version=1&method=m&x=%2",
-          "api=A&version=1&method=%zz", "api=A&version=1&method=m&x=text",
-          "api=A&version=1&method=m&x=1&x=2", "api=A&version=1&method=m&api=B",
-          "api=A&version=1&method=m&sealed=s&x=1", "api=A&version=1&method=m&sealed=s&_sid=t"}) {
+          "api=A&version=1&method=%zz", "api=A&version=1&method=m&x=1&x=2",
+          "api=A&version=1&method=m&api=B", "api=A&version=1&method=m&sealed=s&x=1",
+          "api=A&version=1&method=m&sealed=s&_sid=t"}) {
         ASSERT_FALSE(decodeForm(body)) << body;
         EXPECT_NE(decodeForm(body).error(), "") << body;
+    }
+    const std::pair<const char *, OvraDRCore::JsonFault> faults[] = {
+        {"x=text", OvraDRCore::JsonFault::kNotJson},
+        {"x=1,%22y%22:2", OvraDRCore::JsonFault::kNotJson},
+        {"x=[0,0]&y=[0,0]", OvraDRCore::JsonFault::kTooManyValues}};
+    for (const auto &[params, fault] : faults) {
+        auto call = decodeForm(std::string("api=A&version=1&method=m&") + params);
+        ASSERT_TRUE(call) << params;
+        EXPECT_EQ(parseParams(*call, {.values = 5}), fault) << params;
     }
     std::string many = "api=A&version=1&method=m";
     for (int i = 0; i < 1000; ++i) {

@@ -62,8 +62,7 @@ public:
     /// digit or "_". Names are case-sensitive.
     static bool isName(std::string_view name);
 
-    /// \param password  kMinPassword to kMaxPassword bytes of UTF-8; the caller keeps it and wipes
-    /// it
+    /// \param password  kMinPassword to kMaxPassword bytes of UTF-8, wiped by the caller
     [[nodiscard]] bool add(const std::string &name, std::string_view password, bool administrator);
     [[nodiscard]] bool setPassword(const std::string &name, std::string_view password);
     [[nodiscard]] bool setAdministrator(const std::string &name, bool administrator);

@@ -9,6 +9,7 @@
 
 #include <functional>
 #include <map>
+#include <optional>
 #include <string>
 #include <vector>
 
@@ -85,9 +86,15 @@ public:
     /// The queue of the call. An unregistered call is quick: it is refused at once.
     APIQueue queue(const APICall &call) const;
 
-    /// Runs the handler of the call and returns its reply. Never throws: errors 102, 103, 104 for
-    /// an unregistered call, 119 and 105 for a caller without the right, 101 for parameters that
-    /// are not an object, 100 for a handler that threw or returned no reply document.
+    /// The refusal of a call for its name or for the rights of its caller, whatever its parameters
+    /// are: errors 102, 103, 104 for an unregistered call, 119 and 105 for a caller without the
+    /// right; std::nullopt if there is nothing against it.
+    [[nodiscard]] std::optional<Json::Value> refusal(const APICall &call,
+                                                     const APICaller &caller) const;
+
+    /// Runs the handler of the call and returns its reply. Never throws: the errors of
+    /// refusal(), 101 for parameters that are not an object, 100 for a handler that threw or
+    /// returned no reply document.
     Json::Value dispatch(const APICall &call, const APICaller &caller) const;
 
     /// Hosts this registry: OVRA::APIRunner runs the calls of this process in it.

@@ -25,6 +25,8 @@ inline constexpr char kFarlinkKeyFile[] = "/usr/ovra/var/ovradr/farlink.key"; //
 inline constexpr char kSocketFile[] = "/usr/ovra/var/ovradr/webapi.sock";
 inline constexpr char kAccountsFile[] = "/usr/ovra/var/ovradr/accounts.db";
 inline constexpr char kSessionsFile[] = "/usr/ovra/var/ovradr/sessions.db";
+inline constexpr char kLoginsFile[] = "/usr/ovra/var/ovradr/logins.db";
+inline constexpr char kDeviceKeyFile[] = "/usr/ovra/var/ovradr/device.key"; ///< mode 0600
 inline constexpr char kKnownEndpointsFile[] = "/usr/ovra/var/ovradr/known_endpoints";
 
 /// The keys of kConfigFile.

@@ -13,12 +13,12 @@ namespace OvraPlatform {
 enum class CredError : int {
     kNone = 0,
     kBadArgument = 1,        ///< an unusable endpoint, path or call
-    kOutOfMemory = 2,        ///< this process has no memory, descriptor or thread left
+    kOutOfMemory = 2,        ///< no memory, descriptor, thread or local port is left here
     kInternal = 3,           ///< a failure without a number of its own
     kNoPermission = 4,       ///< HTTP status 401 or 403
     kCannotConnect = 5,      ///< no such name, refused, unreachable, or no TLS on that port
     kCertificateChanged = 6, ///< the endpoint's key is not the one trusted for it
-    kReplyTooLarge = 7,      ///< over 8 MiB
+    kReplyTooLarge = 7,      ///< over 8 MiB, or more JSON than OvraDRCore::JsonLimits
     kReplyBroken = 8,        ///< empty, not HTTP, or not a reply document
     kConnectionLost = 9,     ///< the connection ended before the reply was complete
     kTimedOut = 10,          ///< not done within the given time; nothing of the request was sent

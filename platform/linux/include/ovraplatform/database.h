@@ -16,6 +16,9 @@ struct sqlite3_stmt;
 
 namespace OvraPlatform {
 
+/// The path of a database without a file, gone with its connection.
+inline constexpr char kInMemory[] = ":memory:";
+
 /// What kind of file a store has.
 struct DatabaseLayout {
     const char *name;   ///< as named in messages, e.g. "session store"
@@ -69,6 +72,7 @@ private:
 class OVRAPLATFORM_EXPORT Database {
 public:
     /// Opens the file; creates it, mode 0600, and its folder (ensureStateDir()) if missing.
+    /// \param path  or kInMemory
     Database(std::string path, const DatabaseLayout &layout);
     Database(const Database &) = delete;
     Database &operator=(const Database &) = delete;
