@@ -42,7 +42,7 @@ using OvraService::TlsIdentity;
 
 constexpr unsigned long kDescriptors = 16384;
 constexpr int kMaxAliases = 4000; // what fits into the file of aliases, with room to spare
-constexpr timespec kTick{1, 0};
+constexpr std::chrono::seconds kTick{1};
 constexpr int kTicksOfMemory = 20; // between two times at which freed memory is returned
 
 struct Options {
@@ -94,8 +94,8 @@ Expected<TlsIdentity> identityIn(const Options &options) {
     return TlsIdentity::load(key, certificate);
 }
 
-void waitForEnd(const sigset_t &signals, RelayApi &api) {
-    for (int tick = 1; sigtimedwait(&signals, nullptr, &kTick) < 0; ++tick) {
+void waitForEnd(const OvraService::EndSignals &signals, RelayApi &api) {
+    for (int tick = 1; !signals.wait(kTick); ++tick) {
         api.endOverdue();
         if (tick % kTicksOfMemory == 0) {
             OvraService::returnFreedMemory();
@@ -104,9 +104,9 @@ void waitForEnd(const sigset_t &signals, RelayApi &api) {
 }
 
 int serve(const Options &options) {
-    const sigset_t signals = OvraService::blockEndSignals();
-    OvraService::raiseDescriptorLimit(kDescriptors);
     OvraService::keepMemorySmall();
+    const OvraService::EndSignals signals;
+    OvraService::raiseDescriptorLimit(kDescriptors);
 
     const auto identity = identityIn(options);
     if (!identity) {

@@ -4,22 +4,27 @@
 #include "endpoint.h"
 #include "node_ref.h"
 #include "output.h"
+#include "provision/data_files.h"
 #include "provision/node_database.h"
 #include "target.h"
 #include "tcp_reach.h"
 #include "trust.h"
 
+#include <ovrabase/safe_path.h>
 #include <ovracredential/cred_request.h>
 #include <ovradrcore/json.h>
 #include <ovradrnode/node_api.h>
 #include <ovradrnode/sender.h>
 #include <ovraplatform/api_errors.h>
+#include <ovraplatform/appliance.h>
 
 #include <array>
 #include <chrono>
 #include <cmath>
 #include <cstdio>
+#include <filesystem>
 #include <memory>
+#include <system_error>
 
 namespace Ovradr {
 
@@ -57,6 +62,26 @@ const char *stateWord(Diagnosis::Step::State state) {
     default:
         return "skipped";
     }
+}
+
+/// Whether nobody else can change what root runs or reads.
+Expected<std::string> checkPaths() {
+    std::vector<std::string> paths = {"/proc/self/exe", "/run/lock", "/tmp/.ovradrcache"};
+    for (const char *folder : {OvraPlatform::kConfigDir, OvraPlatform::kStateDir, kScriptFolder}) {
+        paths.emplace_back(folder);
+        std::error_code error;
+        for (const auto &entry : std::filesystem::directory_iterator(folder, error)) {
+            paths.push_back(entry.path().string());
+        }
+    }
+    for (const std::string &path : paths) {
+        if (const auto safe = OvraBase::checkPathToRun(path); !safe) {
+            return failure(ExitCode::kNotSetUp,
+                           "Root relies on " + path + ", and " + safe.error().text + ".",
+                           "Until then nothing here can be trusted.");
+        }
+    }
+    return std::string("nobody else can change what root runs or reads");
 }
 
 /// The same failure under another exit code.
@@ -365,6 +390,7 @@ void diagnoseAppliance(Diagnosis &diagnosis) {
         nodeId = *id;
         return "node " + nodeId;
     });
+    diagnosis.run("folders", checkPaths);
     diagnosis.run("daemon", [&nodeId]() -> Expected<std::string> {
         const Response info = BaseSender::run(WebAPI::getDRNodeInfoAPI({}));
         if (!info.isSuccess()) {

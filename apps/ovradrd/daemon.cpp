@@ -67,9 +67,16 @@ tl::expected<void, StartError> checkSetUp() {
         }
     }
     auto database = OvraDRNode::NodeDBHandler::GetHandler();
-    if (database.GetSchemaVersion() < 0) {
+    const int version = database.GetSchemaVersion();
+    if (version < 0) {
         return notSetUp("the node database cannot be read (" + database.GetErrMsg().asString() +
                         ")");
+    }
+    if (version > OvraDRNode::kNodeSchemaVersion) {
+        return tl::unexpected(StartError(
+            ExitCode::kNotSetUp, "the node database has schema " + std::to_string(version) +
+                                     ", which is newer than this program: install the version "
+                                     "that made it"));
     }
     return {};
 }

@@ -13,7 +13,7 @@
 #include <syslog.h>
 #include <unistd.h>
 
-#include <csignal>
+#include <chrono>
 #include <cstdio>
 #include <cstdlib>
 #include <ctime>
@@ -26,7 +26,7 @@ using Ovradrd::Daemon;
 using OvraService::ExitCode;
 using OvraService::StartError;
 
-constexpr time_t kWorkPeriodSeconds = 20;
+constexpr std::chrono::seconds kWorkPeriod{20};
 /// Descriptors for the connections that it may have, and for everything else.
 constexpr unsigned long kDescriptors = 4096;
 
@@ -60,18 +60,17 @@ tl::expected<Ovradrd::Settings, StartError> readSettings() {
 }
 
 /// Waits for the end, and has the daemon do its periodic work meanwhile.
-void waitForEnd(Daemon &daemon, const sigset_t &signals) {
-    const timespec period{kWorkPeriodSeconds, 0};
-    while (sigtimedwait(&signals, nullptr, &period) < 0) {
+void waitForEnd(Daemon &daemon, const OvraService::EndSignals &signals) {
+    while (!signals.wait(kWorkPeriod)) {
         daemon.doPeriodicWork();
         OvraService::returnFreedMemory();
     }
 }
 
 int serve() {
-    const sigset_t signals = OvraService::blockEndSignals();
-    OvraService::raiseDescriptorLimit(kDescriptors);
     OvraService::keepMemorySmall();
+    const OvraService::EndSignals signals;
+    OvraService::raiseDescriptorLimit(kDescriptors);
 
     const auto settings = readSettings();
     if (!settings) {

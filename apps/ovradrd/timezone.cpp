@@ -1,11 +1,12 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "timezone.h"
 
+#include <ovrabase/file.h>
+
 #include <algorithm>
 #include <cctype>
 #include <cstdlib>
 #include <filesystem>
-#include <fstream>
 #include <system_error>
 
 namespace Ovradrd {
@@ -53,9 +54,7 @@ std::string localTimezone(const TimezoneFiles &files) {
     if (!error) {
         return zoneOfPath(target.string());
     }
-    std::string line;
-    std::getline(std::ifstream(files.name), line);
-    const std::string name = zoneName(line);
+    const std::string name = zoneName(OvraBase::readFile(files.name).value_or(""));
     return name.empty() && !std::filesystem::exists(files.link, error) ? kUtc : name;
 }
 

@@ -62,15 +62,27 @@ int noPassPhrase(char *, int, int, void *) {
     return -1;
 }
 
-Key loadKey(const std::string &path) {
-    const Bio file(BIO_new_file(path.c_str(), "r"));
-    return Key(file ? PEM_read_bio_PrivateKey(file.get(), nullptr, noPassPhrase, nullptr)
-                    : nullptr);
+/// A view of the text.
+Bio bioOf(const std::string &text) {
+    return Bio(BIO_new_mem_buf(text.data(), static_cast<int>(text.size())));
+}
+
+Expected<Key> loadKey(const std::string &path) {
+    const Expected<OvraBase::Secret> text =
+        OvraBase::readPrivateFile(path, OvraBase::Links::kFollow);
+    if (!text) {
+        return unusable(path, text.error().text);
+    }
+    Key key(PEM_read_bio_PrivateKey(bioOf(text->get()).get(), nullptr, noPassPhrase, nullptr));
+    if (!key) {
+        return unusable(path, "it holds no private key that can be read without a pass phrase");
+    }
+    return key;
 }
 
 Certificate loadCertificate(const std::string &path) {
-    const Bio file(BIO_new_file(path.c_str(), "r"));
-    return Certificate(file ? PEM_read_bio_X509(file.get(), nullptr, noPassPhrase, nullptr)
+    const Expected<std::string> text = OvraBase::readFile(path);
+    return Certificate(text ? PEM_read_bio_X509(bioOf(*text).get(), nullptr, noPassPhrase, nullptr)
                             : nullptr);
 }
 
@@ -143,19 +155,19 @@ Expected<bool> createTlsKey(const std::string &path) {
     if (!made) {
         return made;
     }
-    if (!loadKey(path)) {
-        return unusable(path, "it holds no private key that can be read without a pass phrase");
+    if (const Expected<Key> stored = loadKey(path); !stored) {
+        return Unexpected(stored.error());
     }
     return made;
 }
 
 Expected<bool> createCertificate(const std::string &path, const std::string &keyPath,
                                  const ServerNames &names) {
-    const Key key = loadKey(keyPath);
+    const Expected<Key> key = loadKey(keyPath);
     if (!key) {
-        return unusable(keyPath, "it holds no private key");
+        return Unexpected(key.error());
     }
-    const Certificate certificate = makeCertificate(key.get(), names);
+    const Certificate certificate = makeCertificate(key->get(), names);
     const Bio text(BIO_new(BIO_s_mem()));
     if (!certificate || !text || PEM_write_bio_X509(text.get(), certificate.get()) != 1) {
         return cryptoFailure("No certificate can be made");
@@ -165,7 +177,7 @@ Expected<bool> createCertificate(const std::string &path, const std::string &key
         return made;
     }
     const Certificate stored = loadCertificate(path);
-    if (!stored || X509_check_private_key(stored.get(), key.get()) != 1) {
+    if (!stored || X509_check_private_key(stored.get(), key->get()) != 1) {
         return unusable(path, "it holds no certificate of the key in " + keyPath);
     }
     return made;

@@ -6,12 +6,24 @@
 #include <malloc.h>
 #include <pthread.h>
 #include <sys/resource.h>
+#include <unistd.h>
 
 #include <algorithm>
+#include <condition_variable>
+#include <csignal>
 #include <cstdio>
+#include <mutex>
 #include <system_error>
+#include <thread>
 
 namespace OvraService {
+
+namespace {
+
+/// What a daemon has for its end; a stop waits a few seconds for calls in progress.
+constexpr std::chrono::seconds kEndTime{10};
+
+} // namespace
 
 int reportStartError(const char *program, const StartError &why) {
     OVRA_ERR("%s does not start: %s", program, why.text.c_str());
@@ -60,7 +72,14 @@ void returnFreedMemory() {
 #endif
 }
 
-sigset_t blockEndSignals() {
+struct EndSignals::State {
+    std::mutex mutex;
+    std::condition_variable changed;
+    bool came = false;
+};
+
+EndSignals::EndSignals()
+    : state_(std::make_shared<State>()) {
     std::signal(SIGPIPE, SIG_IGN);
     sigset_t signals;
     sigemptyset(&signals);
@@ -68,7 +87,23 @@ sigset_t blockEndSignals() {
         sigaddset(&signals, signal);
     }
     pthread_sigmask(SIG_BLOCK, &signals, nullptr);
-    return signals;
+    std::thread([signals, state = state_] {
+        while (sigwaitinfo(&signals, nullptr) < 0) {
+        }
+        {
+            const std::lock_guard lock(state->mutex);
+            state->came = true;
+        }
+        state->changed.notify_all();
+        std::this_thread::sleep_for(kEndTime);
+        OVRA_WARN("Something does not end: it is left");
+        _exit(static_cast<int>(ExitCode::kFailed));
+    }).detach();
+}
+
+bool EndSignals::wait(std::chrono::seconds atMost) const {
+    std::unique_lock lock(state_->mutex);
+    return state_->changed.wait_for(lock, atMost, [this] { return state_->came; });
 }
 
 } // namespace OvraService

@@ -3,8 +3,9 @@
 
 #include <ovrabase/expected.h>
 
-#include <csignal>
+#include <chrono>
 #include <exception>
+#include <memory>
 #include <string>
 
 namespace OvraService {
@@ -46,8 +47,19 @@ void keepMemorySmall();
 /// in the holes between what is still in use. Takes milliseconds: call it now and then.
 void returnFreedMemory();
 
-/// Blocks the signals that end a daemon (SIGTERM, SIGINT, SIGHUP) in this thread and those that it
-/// starts, so that one thread can wait for them, and ignores SIGPIPE. \return those signals
-sigset_t blockEndSignals();
+/// Waits in a thread of its own for the signals that end a daemon (SIGTERM, SIGINT, SIGHUP). They
+/// end the process in any case: at the latest 10 seconds after the first one came, also while it
+/// starts.
+class EndSignals {
+public:
+    /// Blocks them in this thread and those that it starts, and ignores SIGPIPE.
+    EndSignals();
+    /// Whether one has come; waits for it at most that long.
+    bool wait(std::chrono::seconds atMost) const;
+
+private:
+    struct State;
+    std::shared_ptr<State> state_; // the thread's as well
+};
 
 } // namespace OvraService

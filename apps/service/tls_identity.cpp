@@ -26,7 +26,8 @@ using Credentials =
 
 Unexpected unreadable(const std::string &path, const OvraBase::Error &why) {
     return why.number == EPERM
-               ? Unexpected({path + " can be read by others: set its mode to 0600", why.number})
+               ? Unexpected(
+                     {path + ": " + why.text + ": set its owner, and its mode to 0600", why.number})
                : Unexpected(
                      {path + " cannot be read (" + why.text + "): run ovradr setup", why.number});
 }

@@ -8,8 +8,6 @@
 #include <array>
 #include <cerrno>
 #include <cstdlib>
-#include <filesystem>
-#include <system_error>
 
 namespace OvraBase {
 
@@ -43,15 +41,22 @@ private:
     std::string path_;
 };
 
-/// Opens a regular file for reading; EINVAL for anything else.
-Expected<UniqueFd> openRegular(const std::string &path, int flags, struct stat &status) {
+/// Opens a file for reading and judges it.
+Expected<UniqueFd> openOwn(const std::string &path, Links links, struct stat &status) {
     // Non-blocking, so that opening a FIFO in the file's place cannot hang.
-    UniqueFd fd(open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY | flags));
+    constexpr int kFlags = O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY;
+    UniqueFd fd(open(path.c_str(), links == Links::kRefuse ? kFlags | O_NOFOLLOW : kFlags));
+    if (!fd && errno == ELOOP) {
+        return Unexpected({"it is a symbolic link, or one that leads nowhere", ELOOP});
+    }
     if (!fd || fstat(fd.get(), &status) != 0) {
         return lastSystemError();
     }
-    if (!S_ISREG(status.st_mode)) {
-        return systemError(EINVAL);
+    if (Expected<void> own = judgeFile(path, status); !own) {
+        return Unexpected(own.error());
+    }
+    if (status.st_size < 0 || static_cast<std::size_t>(status.st_size) > kMaxTextFile) {
+        return Unexpected({"it is too large", EFBIG});
     }
     return fd;
 }
@@ -92,15 +97,41 @@ Expected<void> writeAndSync(int fd, std::string_view content, mode_t mode) {
 
 /// Opens the file that stands for a folder's lock. The folder itself would not do: to open it for
 /// reading, as everybody may, is all that flock(2) takes.
-UniqueFd openLock(int folder) {
+Expected<UniqueFd> openLock(const std::string &folderPath, int folder) {
     constexpr int kFlags = O_RDONLY | O_CREAT | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK;
+    const std::string path = folderPath + "/.lock";
     UniqueFd fd(openat(folder, ".lock", kFlags, 0600));
-    // The owner of the folder must be able to open it even if the superuser was here first.
     struct stat status {};
-    if (fd && geteuid() == 0 && fstat(folder, &status) == 0) {
-        (void)!fchown(fd.get(), status.st_uid, status.st_gid);
+    struct stat owner {};
+    if (!fd || fstat(fd.get(), &status) != 0 || fstat(folder, &owner) != 0) {
+        const int number = errno;
+        return Unexpected({path + " cannot be used: " + errnoText(number), number});
+    }
+    if (Expected<void> own = judgeFile(path, status); !own) {
+        return Unexpected({path + " cannot be used: " + own.error().text, own.error().number});
+    }
+    // The owner of the folder must be able to open it even if the superuser was here first, under
+    // whatever umask; and nobody else, who could hold it.
+    if ((status.st_mode & 07777U) != 0600) {
+        (void)!fchmod(fd.get(), 0600);
+    }
+    if (status.st_uid != owner.st_uid && geteuid() == 0) {
+        (void)!fchown(fd.get(), owner.st_uid, owner.st_gid);
     }
     return fd;
+}
+
+/// Whether a file may be kept as it is, or replaced: it is judged, and a link is not followed.
+/// \return whether there is one.
+Expected<bool> judgeOld(const std::string &path, struct stat &status) {
+    if (lstat(path.c_str(), &status) != 0) {
+        return errno == ENOENT ? Expected<bool>(false) : lastSystemError();
+    }
+    if (S_ISLNK(status.st_mode)) {
+        return Unexpected({"it is a symbolic link: put the file itself there", ELOOP});
+    }
+    return S_ISREG(status.st_mode) ? Expected<bool>(true)
+                                   : Unexpected({"it is not a regular file", EINVAL});
 }
 
 } // namespace
@@ -114,9 +145,25 @@ std::string folderOf(const std::string &path) {
     return end == std::string::npos ? "/" : path.substr(0, end + 1);
 }
 
-Expected<std::string> readFile(const std::string &path) {
+bool isTrustedOwner(const std::string &path, uid_t owner) {
+    struct stat folder {};
+    return owner == 0 || owner == geteuid() ||
+           (stat(folderOf(path).c_str(), &folder) == 0 && folder.st_uid == owner);
+}
+
+Expected<void> judgeFile(const std::string &path, const struct stat &status) {
+    if (!S_ISREG(status.st_mode)) {
+        return Unexpected({"it is not a regular file", EINVAL});
+    }
+    if ((status.st_mode & S_IWOTH) != 0 || !isTrustedOwner(path, status.st_uid)) {
+        return Unexpected({"it belongs to somebody else, or others may write to it", EPERM});
+    }
+    return {};
+}
+
+Expected<std::string> readFile(const std::string &path, Links links) {
     struct stat status {};
-    const Expected<UniqueFd> fd = openRegular(path, 0, status);
+    const Expected<UniqueFd> fd = openOwn(path, links, status);
     if (!fd) {
         return Unexpected(fd.error());
     }
@@ -131,16 +178,12 @@ Expected<std::string> readFile(const std::string &path) {
 
 Expected<Secret> readPrivateFile(const std::string &path, Links links) {
     struct stat status {};
-    const Expected<UniqueFd> fd =
-        openRegular(path, links == Links::kRefuse ? O_NOFOLLOW : 0, status);
+    const Expected<UniqueFd> fd = openOwn(path, links, status);
     if (!fd) {
         return Unexpected(fd.error());
     }
     if ((status.st_mode & (S_IRWXG | S_IRWXO)) != 0) {
-        return systemError(EPERM);
-    }
-    if (status.st_size < 0 || static_cast<std::size_t>(status.st_size) > kMaxTextFile) {
-        return systemError(EFBIG);
+        return Unexpected({"others can read it", EPERM});
     }
     std::string content;
     const WipeAtEnd wiped(content);
@@ -179,30 +222,28 @@ Expected<bool> createFile(const std::string &path, std::string_view content, mod
 }
 
 Expected<FileUpdate> FileUpdate::begin(const std::string &path) {
-    std::error_code failure;
-    const std::filesystem::path target = std::filesystem::canonical(path, failure);
-    const std::string resolved = failure ? path : target.string();
-    UniqueFd folder(open(folderOf(resolved).c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+    const std::string folderPath = folderOf(path);
+    UniqueFd folder(open(folderPath.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
     if (!folder) {
         return lastSystemError();
     }
-    UniqueFd file = openLock(folder.get());
+    Expected<UniqueFd> file = openLock(folderPath, folder.get());
     if (!file) {
-        return lastSystemError();
+        return Unexpected(file.error());
     }
-    Expected<LockedFd> locked = LockedFd::lock(std::move(file), LOCK_EX, kLockWait);
+    Expected<LockedFd> locked = LockedFd::lock(std::move(*file), LOCK_EX, kLockWait);
     if (!locked) {
         return Unexpected(locked.error());
     }
-    return FileUpdate(resolved, std::move(folder), std::move(*locked));
+    return FileUpdate(path, std::move(folder), std::move(*locked));
 }
 
 Expected<void> FileUpdate::commit(std::string_view content, mode_t modeWhenNew) const {
     mode_t mode = modeWhenNew;
     struct stat old {};
-    const bool exists = stat(path_.c_str(), &old) == 0;
-    if (exists && !S_ISREG(old.st_mode)) {
-        return systemError(EINVAL);
+    const Expected<bool> exists = judgeOld(path_, old);
+    if (!exists) {
+        return Unexpected(exists.error());
     }
     const std::string temporaryPath = path_ + ".new";
     unlink(temporaryPath.c_str());
@@ -212,10 +253,11 @@ Expected<void> FileUpdate::commit(std::string_view content, mode_t modeWhenNew) 
         return lastSystemError();
     }
     TemporaryFile temporary(temporaryPath);
-    if (exists) {
-        mode = old.st_mode & 07777U;
+    if (*exists) {
+        mode = old.st_mode & 0755U;
         // Only the superuser can change the owner; for others the file becomes their own.
-        if (fchown(fd.get(), old.st_uid, old.st_gid) != 0 && errno != EPERM) {
+        if (isTrustedOwner(path_, old.st_uid) && fchown(fd.get(), old.st_uid, old.st_gid) != 0 &&
+            errno != EPERM) {
             return lastSystemError();
         }
     }

@@ -2,6 +2,7 @@
 #include "cache_folder.h"
 
 #include "ovradrcore/log.h"
+#include "ovradrcore/util.h"
 
 #include <ovrabase/expected.h>
 
@@ -9,6 +10,7 @@
 
 #include <atomic>
 #include <cerrno>
+#include <cstdio>
 #include <filesystem>
 
 namespace OvraDRCore {
@@ -39,31 +41,60 @@ bool discard(const std::string &path) {
     return !error;
 }
 
+/// What is in it was not made by us: nothing of it is used, and nothing is done to it.
+bool moveAway(const std::string &directory) {
+    const std::string aside = directory + "." + GenerateUUID();
+    const bool moved = rename(directory.c_str(), aside.c_str()) == 0;
+    if (moved) {
+        OVRA_WARN("Cache directory [%s] was not one that only user %u may write: it is [%s] now",
+                  directory.c_str(), static_cast<unsigned int>(geteuid()), aside.c_str());
+    }
+    return moved;
+}
+
 } // namespace
 
 bool isOursAlone(const struct stat &status) {
-    return status.st_uid == geteuid() && (status.st_mode & (S_IWGRP | S_IWOTH)) == 0;
+    return status.st_uid == geteuid() && (status.st_mode & (S_IWGRP | S_IWOTH)) == 0 &&
+           (S_ISDIR(status.st_mode) || status.st_nlink <= 1);
 }
 
 bool checkCacheFolder(const std::string &directory, bool create) {
     struct stat status {};
-    if (lstat(directory.c_str(), &status) != 0) {
-        if (errno == ENOENT && !create) {
-            return false;
+    constexpr int kAttempts = 3; // somebody may put another one there
+    for (int attempt = 0; attempt < kAttempts; ++attempt) {
+        if (lstat(directory.c_str(), &status) != 0) {
+            if (errno == ENOENT && !create) {
+                return false;
+            }
+            // The umask may take rights of our own as well.
+            const bool made =
+                errno == ENOENT &&
+                ((mkdir(directory.c_str(), 0700) == 0 && chmod(directory.c_str(), 0700) == 0) ||
+                 errno == EEXIST);
+            if (!made || lstat(directory.c_str(), &status) != 0) {
+                return refuse(directory, "cannot be used: " + OvraBase::errnoText(errno));
+            }
         }
-        const bool made =
-            errno == ENOENT && (mkdir(directory.c_str(), 0700) == 0 || errno == EEXIST);
-        if (!made || lstat(directory.c_str(), &status) != 0) {
-            return refuse(directory, "cannot be used: " + OvraBase::errnoText(errno));
+        if (S_ISDIR(status.st_mode) && isOursAlone(status)) {
+            return true;
+        }
+        if (!moveAway(directory)) {
+            break;
         }
     }
-    return (S_ISDIR(status.st_mode) && isOursAlone(status)) ||
-           refuse(directory, "is not a directory of user " + std::to_string(geteuid()) +
+    return refuse(directory, "is not a directory of user " + std::to_string(geteuid()) +
                                  " that only he may write (remove it)");
 }
 
 UniqueFd openCacheFile(const std::string &path, int flags) {
-    return UniqueFd(open(path.c_str(), flags | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK, 0600));
+    UniqueFd fd(open(path.c_str(), flags | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK, 0600));
+    struct stat status {};
+    if (fd && (flags & O_CREAT) != 0 && fstat(fd.get(), &status) == 0 && isOursAlone(status) &&
+        (status.st_mode & 0777U) != 0600) {
+        (void)!fchmod(fd.get(), 0600); // regardless of the umask
+    }
+    return fd;
 }
 
 UniqueFd openOrReplaceCacheFile(const std::string &path, int flags) {

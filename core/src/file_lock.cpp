@@ -37,6 +37,9 @@ void openLockFile(const std::string &path, ForkClosedFd &fd) {
     // user (fs.protected_regular), and it has to be told apart from one that is missing.
     if (!fd && errno == ENOENT) {
         fd.reset(open(path.c_str(), kFlags | O_CREAT | O_EXCL, kMode));
+        if (fd) {
+            (void)!fchmod(fd.get(), kMode); // regardless of the umask
+        }
     }
 }
 
@@ -54,8 +57,27 @@ bool isNamed(const std::string &path, int fd) {
            named.st_dev == opened.st_dev && named.st_ino == opened.st_ino;
 }
 
-/// Takes away what is not a lock file of ours, if it is still there.
-bool removeForeign(const std::string &path) {
+/// Puts `file` at `path`. Whoever put something there cannot put it there again in between.
+bool putInPlace(const std::string &file, const std::string &path) {
+    if (renameat2(AT_FDCWD, file.c_str(), AT_FDCWD, path.c_str(), RENAME_EXCHANGE) == 0) {
+        // A folder may be full of anything: it stays under its new name.
+        return unlink(file.c_str()) == 0 || errno == EISDIR;
+    }
+    // A file system without that. Only for a folder this takes two steps.
+    return rename(file.c_str(), path.c_str()) == 0 ||
+           (errno == EISDIR && rename(path.c_str(), (path + "." + GenerateUUID()).c_str()) == 0 &&
+            rename(file.c_str(), path.c_str()) == 0);
+}
+
+/// Makes an empty file, regardless of the umask.
+bool makeFile(const std::string &path) {
+    const OvraBase::UniqueFd fd(
+        open(path.c_str(), O_RDONLY | O_CREAT | O_EXCL | O_CLOEXEC | O_NOFOLLOW, kMode));
+    return fd && fchmod(fd.get(), kMode) == 0;
+}
+
+/// Replaces what is not a lock file of ours, if it is still there.
+bool replaceForeign(const std::string &path) {
     // Two processes that replace it at once would take away each other's new file. Not longer than
     // a moment: everybody may lock the folder as well.
     const OvraBase::UniqueFd folder(
@@ -64,10 +86,8 @@ bool removeForeign(const std::string &path) {
     struct stat status {};
     bool gone = lstat(path.c_str(), &status) != 0 || isOursAlone(status);
     if (!gone) {
-        // A folder may be full of anything: it is moved away and nothing else is done to it.
-        gone = S_ISDIR(status.st_mode)
-                   ? rename(path.c_str(), (path + "." + GenerateUUID()).c_str()) == 0
-                   : unlink(path.c_str()) == 0;
+        const std::string aside = path + "." + GenerateUUID();
+        gone = makeFile(aside) && putInPlace(aside, path);
         if (gone) {
             OVRA_WARN("Lock file [%s] was not a file of user %u alone: it is replaced",
                       path.c_str(), static_cast<unsigned int>(geteuid()));
@@ -76,6 +96,7 @@ bool removeForeign(const std::string &path) {
                      "Remove it",
                      path.c_str(), static_cast<unsigned int>(geteuid()),
                      OvraBase::errnoText(errno).c_str());
+            unlink(aside.c_str());
         }
     }
     if (alone) {
@@ -97,7 +118,7 @@ bool makeWay(const std::string &path, int error) {
     case ENXIO:
     case EACCES:
     case EPERM:
-        return removeForeign(path);
+        return replaceForeign(path);
     default:
         OVRA_ERR("Cannot open lock file [%s]: %s", path.c_str(),
                  OvraBase::errnoText(error).c_str());

@@ -44,6 +44,13 @@ bool isBlank(const char *tail, const char *end) {
     return std::all_of(tail, end, [](char c) { return c == ' ' || c == '\n' || c == '\t'; });
 }
 
+std::string selectVersion(const std::string &infoTable) {
+    SelectCommand select;
+    select.AddField("version");
+    select.SetTable(SqliteTableHandler(infoTable, ""));
+    return select.ToStr();
+}
+
 } // namespace
 
 void SqliteDB::Close::operator()(sqlite3 *db) const {
@@ -54,11 +61,19 @@ void SqliteDB::Close::operator()(sqlite3 *db) const {
 SqliteDB::SqliteDB(const std::string &path, unsigned int busyTime, const std::string &infoTable)
     : infoTable_(infoTable) {
     const NoFork noFork;
-    OvraBase::SqliteHandle database;
-    // The first statement reports a failure to open.
-    OvraBase::openSqlite(path, 0, database);
-    db_.reset(database.release());
+    auto database = OvraBase::openSqlite(path, 0);
+    if (!database) {
+        whyClosed_ = database.error().text; // the first statement reports it
+        return;
+    }
+    db_.reset(database->release());
     wait_ = std::make_unique<SqliteWait>(db_.get(), std::chrono::seconds(busyTime));
+}
+
+SqliteDB::SqliteDB(const std::string &path, unsigned int busyTime, const std::string &infoTable,
+                   int newestSchema)
+    : SqliteDB(path, busyTime, infoTable) {
+    newestSchema_ = newestSchema;
 }
 
 SqliteDB::SqliteDB(SqliteDB &&) noexcept = default;
@@ -70,13 +85,47 @@ bool SqliteDB::fail(const std::string &what) const {
     return false;
 }
 
+bool SqliteDB::execute(const char *sql) const {
+    return sqlite3_exec(db_.get(), sql, nullptr, nullptr, nullptr) == SQLITE_OK ||
+           fail(sqlite3_errmsg(db_.get()));
+}
+
+bool SqliteDB::refuseNewerSchema() const {
+    const OvraBase::SqliteStatement statement =
+        OvraBase::prepareSqlite(db_.get(), selectVersion(infoTable_));
+    if (!statement || sqlite3_step(statement.get()) != SQLITE_ROW ||
+        sqlite3_column_int64(statement.get(), 0) <= *newestSchema_) {
+        return true;
+    }
+    return fail("its schema " + std::to_string(sqlite3_column_int64(statement.get(), 0)) +
+                " is newer than this program's " + std::to_string(*newestSchema_) +
+                ": install the version that made it");
+}
+
+/// The check and the statement are one transaction, so that nobody upgrades the file in between.
+bool SqliteDB::checkedRun(Access access, const std::string &sql, std::vector<SqliteValueList> *rows,
+                          bool firstOnly) {
+    if (!newestSchema_ || !db_ || sql.empty()) {
+        return run(sql, rows, firstOnly);
+    }
+    const NoFork noFork;
+    if (!execute(access == Access::kWrite ? "BEGIN IMMEDIATE" : "BEGIN")) {
+        return false;
+    }
+    if (refuseNewerSchema() && run(sql, rows, firstOnly) && execute("COMMIT")) {
+        return true;
+    }
+    sqlite3_exec(db_.get(), "ROLLBACK", nullptr, nullptr, nullptr);
+    return false;
+}
+
 bool SqliteDB::run(const std::string &sql, std::vector<SqliteValueList> *rows, bool firstOnly) {
     SetErr(ERR::kNone);
     if (sql.empty()) {
         return fail("the statement is incomplete, or its condition is invalid");
     }
     if (!db_) {
-        return fail("out of memory");
+        return fail(whyClosed_);
     }
     if (sql.size() > INT_MAX) {
         return fail("the statement is too large");
@@ -105,7 +154,7 @@ bool SqliteDB::run(const std::string &sql, std::vector<SqliteValueList> *rows, b
 
 bool SqliteDB::SelectRecord(const SelectCommand &command, SqliteValueList &row) {
     std::vector<SqliteValueList> rows;
-    if (!run(command.ToStr(), &rows, true)) {
+    if (!checkedRun(Access::kRead, command.ToStr(), &rows, true)) {
         return false;
     }
     row = rows.empty() ? SqliteValueList() : rows.front();
@@ -114,7 +163,7 @@ bool SqliteDB::SelectRecord(const SelectCommand &command, SqliteValueList &row) 
 
 bool SqliteDB::SelectRecords(const SelectCommand &command, std::vector<SqliteValueList> &rows) {
     std::vector<SqliteValueList> found;
-    if (!run(command.ToStr(), &found, false)) {
+    if (!checkedRun(Access::kRead, command.ToStr(), &found, false)) {
         return false;
     }
     rows.insert(rows.end(), found.begin(), found.end());
@@ -122,27 +171,25 @@ bool SqliteDB::SelectRecords(const SelectCommand &command, std::vector<SqliteVal
 }
 
 bool SqliteDB::InsertRecord(const InsertCommand &command) {
-    return run(command.ToStr(), nullptr, false);
+    return checkedRun(Access::kWrite, command.ToStr(), nullptr, false);
 }
 
 bool SqliteDB::UpdateRecord(const UpdateCommand &command) {
-    return run(command.ToStr(), nullptr, false);
+    return checkedRun(Access::kWrite, command.ToStr(), nullptr, false);
 }
 
 bool SqliteDB::DeleteRecord(const std::string &condition, const SqliteTableHandler &table) {
     DeleteCommand command;
     command.SetTable(table);
     command.SetCondition(condition);
-    return run(command.ToStr(), nullptr, false);
+    return checkedRun(Access::kWrite, command.ToStr(), nullptr, false);
 }
 
 int SqliteDB::GetSchemaVersion() {
-    SelectCommand select;
-    select.AddField("version");
-    select.SetTable(SqliteTableHandler(infoTable_, ""));
-    SqliteValueList row;
+    std::vector<SqliteValueList> rows;
     int version = -1;
-    if (SelectRecord(select, row) && !row.GetValue("version", version)) {
+    if (run(selectVersion(infoTable_), &rows, true) &&
+        (rows.empty() || !rows.front().GetValue("version", version))) {
         fail("it holds no schema version");
     }
     return version;

@@ -37,7 +37,12 @@ public:
     ~NodeAttrSqliteTable() override;
 };
 
-/// The node database, opened for one statement. It must have been provisioned (`ovradr setup`).
+/// The newest schema of the node database that this library reads and writes, and the one that
+/// `ovradr setup` makes.
+inline constexpr int kNodeSchemaVersion = 1;
+
+/// The node database, opened for one statement. It must have been provisioned (`ovradr setup`). One
+/// with a newer schema is neither read nor changed: every operation fails and says so.
 class OVRADRNODE_EXPORT NodeDBHandler : public OvraDRCore::SqliteDB {
 public:
     NodeDBHandler();

@@ -24,7 +24,7 @@ NodeAttrSqliteTable::NodeAttrSqliteTable()
 NodeAttrSqliteTable::~NodeAttrSqliteTable() = default;
 
 NodeDBHandler::NodeDBHandler()
-    : SqliteDB(Path::kDatabase, kBusyTime, Word::kInfoTable) {}
+    : SqliteDB(Path::kDatabase, kBusyTime, Word::kInfoTable, kNodeSchemaVersion) {}
 NodeDBHandler::~NodeDBHandler() = default;
 
 NodeDBHandler NodeDBHandler::GetHandler() {

@@ -8,6 +8,7 @@
 #include "paths.h"
 #include "words.h"
 
+#include <ovrabase/safe_path.h>
 #include <ovracore/ovracore.h>
 #include <ovradrcore/log.h>
 #include <ovradrcore/response.h>
@@ -39,8 +40,18 @@ std::string readFirstLine(std::FILE *stream) {
     return read ? line : "";
 }
 
+/// Runs a script, unless somebody else could have put it there: it runs with our rights.
+template <typename... Arguments>
+Pipe runScript(const char *script, Arguments... arguments) {
+    if (const auto safe = OvraBase::checkPathToRun(script); !safe) {
+        OVRA_ERR("[%s] is not run: %s", script, safe.error().text.c_str());
+        return {};
+    }
+    return Pipe(OLIBCPopen(script, "r", arguments..., nullptr));
+}
+
 std::string TestSyncSpeedMakeTestFile() {
-    const Pipe pipe(OLIBCPopen(Path::kSyncSpeedScript, "r", "setup", nullptr));
+    const Pipe pipe = runScript(Path::kSyncSpeedScript, "setup");
     if (!pipe) {
         OVRA_ERR("Failed to execute command %s.", Path::kSyncSpeedScript);
         return {};
@@ -59,9 +70,9 @@ Node::~Node() = default;
 
 std::string Node::TestDownloadSpeed(const std::string &url, int retries, int timeout) {
     SetErr(ERR::kFailed);
-    const Pipe pipe(OLIBCPopen(Path::kDownloadSpeedScript, "r", url.c_str(),
-                               OvraDRCore::ToString<int>(retries).c_str(),
-                               OvraDRCore::ToString<int>(timeout).c_str(), nullptr));
+    const Pipe pipe = runScript(Path::kDownloadSpeedScript, url.c_str(),
+                                OvraDRCore::ToString<int>(retries).c_str(),
+                                OvraDRCore::ToString<int>(timeout).c_str());
     if (!pipe) {
         OVRA_ERR("Failed to exec the command [%s].", Path::kDownloadSpeedScript);
         SetErr(ERR::kBadParameter);

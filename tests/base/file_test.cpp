@@ -42,6 +42,8 @@ TEST_F(Files, AreReadWholeOrNotAtAll) {
     EXPECT_EQ(readFile(folder).error().number, EINVAL);
     ASSERT_EQ(mkfifo(path("pipe").c_str(), 0600), 0);
     EXPECT_EQ(readFile(path("pipe")).error().number, EINVAL) << "must not wait for a writer";
+    put(path("open"), "x", 0666);
+    EXPECT_EQ(readFile(path("open")).error().number, EPERM) << "somebody else may have written it";
 }
 
 TEST_F(Files, ThatArePrivateAreReadByTheirOwnerOnlyAndThroughNoLink) {
@@ -70,10 +72,14 @@ TEST_F(Files, ThatExistAreNeverReplacedByCreation) {
 TEST_F(Files, KeepTheirModeWhenTheyAreReplacedAsNoFolderEverIs) {
     put(path("settings"), "old", 0640);
     ASSERT_EQ(symlink(path("settings").c_str(), path("link").c_str()), 0);
-    ASSERT_TRUE(FileUpdate::begin(path("link")).value().commit("new", 0600));
+    EXPECT_EQ(FileUpdate::begin(path("link"))->commit("new", 0600).error().number, ELOOP);
+    EXPECT_EQ(readFile(path("settings")).value(), "old");
+    ASSERT_TRUE(FileUpdate::begin(path("settings")).value().commit("new", 0600));
     EXPECT_EQ(readFile(path("settings")).value(), "new");
     EXPECT_EQ(modeOf(path("settings")), 0640U);
-    EXPECT_TRUE(std::filesystem::is_symlink(path("link")));
+    chmod(path(".lock").c_str(), 0666);
+    EXPECT_EQ(FileUpdate::begin(path("settings")).error().number, EPERM) << "others could hold it";
+    std::filesystem::remove(path(".lock"));
     ASSERT_TRUE(FileUpdate::begin(path("fresh")).value().commit("x", 0600));
     EXPECT_EQ(modeOf(path("fresh")), 0600U);
     std::filesystem::create_directory(path("folder"));

@@ -294,22 +294,25 @@ TEST_F(CacheTest, WhateverElseHasTheNameOfTheFileOrItsLockIsReplaced) {
     }
 }
 
-TEST_F(CacheTest, ADirectoryThatIsNotOursAloneIsRefusedOnceAndTheValueFetched) {
-    ASSERT_EQ(mkdir(kDir, 0700), 0);
-    ASSERT_EQ(chmod(kDir, 0777), 0);
-    TestCache cache("a");
-    EXPECT_FALSE(cache.UpdateWithData("x"));
-    EXPECT_FALSE(cache.Update());
-    EXPECT_EQ(text(cache.Read()), kFresh);
-    EXPECT_EQ(text(cache.GetCachedData()), "null");
-    EXPECT_EQ(text(TestCache("a", true, "/proc/none/c").Read()), kFresh);
-    EXPECT_EQ(log.count("going on without a cache"), 1);
-    EXPECT_EQ(log.lines().size(), 1U);
-    ASSERT_EQ(rmdir(kDir), 0) << "nothing was written there";
+TEST_F(CacheTest, ADirectoryThatIsNotOursAloneIsMovedAwayAndWithoutOneTheValueIsFetched) {
     ASSERT_EQ(mkdir("/tmp/elsewhere", 0700), 0);
-    ASSERT_EQ(symlink("/tmp/elsewhere", kDir), 0);
-    EXPECT_FALSE(cache.UpdateWithData("x"));
-    EXPECT_EQ(rmdir("/tmp/elsewhere"), 0);
+    const std::function<int()> planted[] = {
+        [] { return mkdir(kDir, 0700) + chmod(kDir, 0777); },
+        [] { return symlink("/tmp/elsewhere", kDir); },
+        [] { return mkfifo(kDir, 0600); },
+    };
+    for (const auto &plant : planted) {
+        std::filesystem::remove_all(kDir);
+        ASSERT_EQ(plant(), 0);
+        EXPECT_TRUE(TestCache("a").UpdateWithData("x"));
+        EXPECT_EQ(text(TestCache("a").GetCachedData()), "\"x\"");
+        EXPECT_EQ(modeOf(kDir), S_IFDIR | 0700U);
+    }
+    EXPECT_EQ(rmdir("/tmp/elsewhere"), 0) << "nothing was written there";
+    const TestCache without("a", true, "/proc/none/c");
+    EXPECT_FALSE(without.UpdateWithData("x"));
+    EXPECT_EQ(text(without.Read()), kFresh);
+    EXPECT_EQ(log.count("going on without a cache"), 1);
 }
 
 TEST_F(CacheTest, WritersThatAreKilledBesideOthersLoseAndTearNothing) {

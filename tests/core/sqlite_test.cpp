@@ -205,4 +205,12 @@ TEST_F(Sqlite, TheSchemaVersionIsThatOfProvisioning) {
     EXPECT_EQ(db.GetErrMsg().asString(), "it holds no schema version");
     execute("INSERT INTO info VALUES (3)");
     EXPECT_EQ(db.GetSchemaVersion(), 3);
+    ASSERT_EQ(insert("a", 1), "");
+    for (const int known : {2, 3}) {
+        SqliteDB checked(kPath, 1, "info", known);
+        std::vector<SqliteValueList> rows;
+        EXPECT_EQ(checked.DeleteRecord("id = 'b'", SqliteTableHandler("t", "")), known == 3);
+        EXPECT_EQ(checked.GetErrMsg().asString().find("its schema 3 is newer") == 0, known == 2);
+        EXPECT_EQ(checked.GetSchemaVersion(), 3);
+    }
 }

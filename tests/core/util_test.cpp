@@ -79,6 +79,23 @@ TEST(FileLock, GivesUpAfterTheWaitAndGoesWithItsProcessButNotWithAChildOfThat) {
     EXPECT_TRUE(lock.lock(LOCK_SH | LOCK_NB, 0));
 }
 
+TEST(FileLock, IsHadAgainstSomebodyWhoPutsThingsInItsPlaceAllTheTime) {
+    const std::string path = "/run/lock/e.lock";
+    chmod("/run/lock", 01777);
+    OvraTest::OtherProcess attacker([&] {
+        if (geteuid() != 0 || setgid(65534) != 0 || setuid(65534) != 0) {
+            return 1; // an ordinary user has no other one
+        }
+        for (unsigned int i = 0;; ++i) {
+            i % 2 == 0 ? mkdir(path.c_str(), 0777) : mknod(path.c_str(), 0666, 0);
+        }
+    });
+    for (int i = 0; i < 300; ++i) {
+        EXPECT_TRUE(FileLock("e.lock").lock(LOCK_EX | LOCK_NB, 1)) << i;
+        unlink(path.c_str());
+    }
+}
+
 TEST(FileLock, ReplacesWhateverSomebodyElsePutInItsPlace) {
     const std::string path = "/run/lock/c.lock";
     const std::pair<const char *, std::function<bool()>> planted[] = {

@@ -65,6 +65,10 @@ TEST_F(Speed, TheFirstLineOfTheScriptIsTakenWhole) {
         log.count("ERR", "node", "TestDownloadSpeed",
                   std::string("Failed to exec the command [") + kFolder + "TestDownloadSpeed.sh]."),
         1);
+    script("TestDownloadSpeed.sh", "echo one");
+    chmod("/usr/ovra/ovradr", 0777);
+    EXPECT_EQ(download(), "401") << "anybody could have put the script there";
+    EXPECT_EQ(log.count("is not run: others may write to /usr/ovra/ovradr:"), 1);
 }
 
 TEST_F(Speed, TheRemoteIsAskedEndpointByEndpointUntilOneWorks) {

@@ -144,13 +144,13 @@ Refusal keyFailure(const std::string &path, const OvraBase::Error &why) {
 
 Expected<SetUpStep> provisionTlsKey() {
     using OvraPlatform::kTlsKeyFile;
-    const OvraBase::Expected<bool> made = OvraService::createTlsKey(kTlsKeyFile);
-    if (!made) {
-        return keyFailure(kTlsKeyFile, made.error());
-    }
     const Expected<bool> tightened = makePrivate(kTlsKeyFile);
     if (!tightened) {
         return Refusal(tightened.error());
+    }
+    const OvraBase::Expected<bool> made = OvraService::createTlsKey(kTlsKeyFile);
+    if (!made) {
+        return keyFailure(kTlsKeyFile, made.error());
     }
     return SetUpStep{"HTTPS key", *made,
                      std::string(kTlsKeyFile) + (*tightened ? ", now closed to other users" : "")};

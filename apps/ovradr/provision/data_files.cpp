@@ -1,6 +1,8 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "provision/data_files.h"
 
+#include <ovradrcore/util.h>
+
 #include <unistd.h>
 
 #include <cerrno>
@@ -14,8 +16,6 @@ namespace {
 namespace fs = std::filesystem;
 
 constexpr const char *kDataFolder = "ovradrnode";
-/// Where the library runs them.
-constexpr const char *kScriptFolder = "/usr/ovra/ovradr/sbin";
 
 /// Makes `path` a link to `target`; true if it was not one before.
 Expected<bool> linkTo(const std::string &target, const fs::path &path) {
@@ -51,10 +51,8 @@ Expected<std::string> findDataFile(const std::string &name) {
 }
 
 Expected<SetUpStep> provisionScripts() {
-    std::error_code error;
-    fs::create_directories(kScriptFolder, error);
-    if (error) {
-        return fileFailure(kScriptFolder, error.value());
+    if (!OvraDRCore::File::CreateDir(kScriptFolder, 0755)) {
+        return fileFailure(kScriptFolder, errno);
     }
     SetUpStep step{"speed test scripts", false, kScriptFolder};
     for (const char *name : {"TestDownloadSpeed.sh", "TestSyncSpeed.sh"}) {

@@ -8,6 +8,9 @@
 
 namespace Ovradr {
 
+/// Where the library runs the scripts.
+inline constexpr char kScriptFolder[] = "/usr/ovra/ovradr/sbin";
+
 /// Finds a file that was installed with the program: beside it (../share/ovradrnode), else at the
 /// installed location.
 [[nodiscard]] Expected<std::string> findDataFile(const std::string &name);

@@ -18,10 +18,11 @@ Refusal fileFailure(const std::string &path, int error) {
 
 Expected<bool> makePrivate(const std::string &path) {
     struct stat status {};
-    if (stat(path.c_str(), &status) != 0) {
-        return fileFailure(path, errno);
+    // What a link leads to is not ours to change.
+    if (lstat(path.c_str(), &status) != 0) {
+        return errno == ENOENT ? Expected<bool>(false) : fileFailure(path, errno);
     }
-    if ((status.st_mode & 077U) == 0) {
+    if (!S_ISREG(status.st_mode) || (status.st_mode & 077U) == 0) {
         return false;
     }
     if (chmod(path.c_str(), status.st_mode & 0700U) != 0) {

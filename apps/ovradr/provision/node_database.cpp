@@ -3,12 +3,11 @@
 
 #include <ovrabase/file.h>
 #include <ovrabase/sqlite.h>
-#include <ovrabase/unique_fd.h>
 #include <ovradrnode/node_db.h>
 #include <ovraplatform/appliance.h>
 
-#include <fcntl.h>
 #include <sqlite3.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <array>
@@ -19,7 +18,12 @@ namespace Ovradr {
 
 namespace {
 
+using OvraDRNode::kNodeSchemaVersion;
+
 constexpr int kBusyMilliseconds = 20'000; // as long as the library waits
+
+constexpr const char *kRestore =
+    "Correct that, or restore the file from a backup; setup never replaces it.";
 
 /// What the library selects and stores.
 constexpr std::array kQueries = {
@@ -34,14 +38,13 @@ Refusal unusable(const std::string &path, const std::string &why, const std::str
 }
 
 Refusal sqliteFailure(const std::string &path, sqlite3 *database) {
-    return unusable(path, OvraBase::sqliteText(database, SQLITE_NOMEM),
-                    "Correct that, or restore the file from a backup; setup never replaces it.");
+    return unusable(path, OvraBase::sqliteText(database, SQLITE_NOMEM), kRestore);
 }
 
 Refusal newerSchema(const std::string &path, int version) {
     return unusable(path,
                     "its schema " + std::to_string(version) + " is newer than this program's " +
-                        std::to_string(kSchemaVersion),
+                        std::to_string(kNodeSchemaVersion),
                     "Install the version of this program that made it, or a newer one.");
 }
 
@@ -73,11 +76,11 @@ Expected<void> checkSchema(sqlite3 *database, const std::string &path) {
     if (!version) {
         return foreignDatabase(path);
     }
-    if (*version > kSchemaVersion) {
+    if (*version > kNodeSchemaVersion) {
         return newerSchema(path, *version);
     }
     for (const char *query : kQueries) {
-        if (*version != kSchemaVersion || !canPrepare(database, query)) {
+        if (*version != kNodeSchemaVersion || !canPrepare(database, query)) {
             return foreignDatabase(path);
         }
     }
@@ -114,9 +117,14 @@ Expected<bool> fill(sqlite3 *database, const std::string &path, const std::strin
 
 /// SQLite would create a file readable by others.
 Expected<void> touchPrivate(const std::string &path) {
-    const OvraBase::UniqueFd fd(open(path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0600));
-    if (!fd) {
+    // Not opened: that would follow a link, or wait for the other end of a FIFO.
+    if (mknod(path.c_str(), S_IFREG | 0600, 0) == 0 ? chmod(path.c_str(), 0600) != 0
+                                                    : errno != EEXIST) {
         return fileFailure(path, errno);
+    }
+    struct stat status {};
+    if (lstat(path.c_str(), &status) == 0 && !S_ISREG(status.st_mode)) {
+        return unusable(path, "it is not a regular file", "Move it away.");
     }
     return makePrivate(path).map([](bool) {});
 }
@@ -135,13 +143,13 @@ Expected<SetUpStep> provisionNodeDatabase(const std::string &path, const std::st
     if (const auto done = touchPrivate(path); !done) {
         return Refusal(done.error());
     }
-    OvraBase::SqliteHandle database;
-    if (OvraBase::openSqlite(path, kBusyMilliseconds, database) != SQLITE_OK) {
-        return sqliteFailure(path, database.get());
+    const auto database = OvraBase::openSqlite(path, kBusyMilliseconds);
+    if (!database) {
+        return unusable(path, database.error().text, kRestore);
     }
-    return fill(database.get(), path, *schema).map([&path](bool filled) {
+    return fill(database->get(), path, *schema).map([&path](bool filled) {
         return SetUpStep{"node database", filled,
-                         path + ", schema " + std::to_string(kSchemaVersion)};
+                         path + ", schema " + std::to_string(kNodeSchemaVersion)};
     });
 }
 
@@ -157,10 +165,10 @@ Expected<void> checkNodeDatabase() {
     }
     auto handler = OvraDRNode::NodeDBHandler::GetHandler();
     const int version = handler.GetSchemaVersion();
-    if (version == kSchemaVersion) {
+    if (version == kNodeSchemaVersion) {
         return {};
     }
-    if (version > kSchemaVersion) {
+    if (version > kNodeSchemaVersion) {
         return newerSchema(path, version);
     }
     return unusable(path, handler.GetErrMsg().asString(),

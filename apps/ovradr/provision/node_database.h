@@ -8,9 +8,6 @@
 
 namespace Ovradr {
 
-/// The schema version that node.sql creates and this program uses.
-inline constexpr int kSchemaVersion = 1;
-
 /// The node database of this appliance.
 std::string nodeDatabasePath();
 

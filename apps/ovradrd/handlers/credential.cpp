@@ -218,10 +218,12 @@ Json::Value list(const Json::Value &params, const APICaller & /*caller*/) {
     }
     // Unreadable tables read as empty ones, and a session audit would end those in use.
     auto database = OvraDRNode::NodeDBHandler::GetHandler();
-    if (database.GetSchemaVersion() < 0) {
+    const int version = database.GetSchemaVersion();
+    if (version < 0 || version > OvraDRNode::kNodeSchemaVersion) {
         return apiError(OvraPlatform::APIError::kInternal,
                         "the node database of the appliance cannot be read (" +
-                            database.GetErrMsg().asString() + "): try again");
+                            (version < 0 ? database.GetErrMsg().asString() : "it is newer") +
+                            "): try again");
     }
     Json::Value data(Json::objectValue);
     data["creds"] = Json::Value(Json::arrayValue);

@@ -6,6 +6,7 @@
 #include "ovrabase/secret.h"
 #include "ovrabase/unique_fd.h"
 
+#include <sys/stat.h>
 #include <sys/types.h>
 
 #include <cstddef>
@@ -22,15 +23,25 @@ inline constexpr std::size_t kMaxTextFile = 1UL << 20U;
 /// The parent folder of a path; "." for a bare name.
 std::string folderOf(const std::string &path);
 
-/// Reads a whole regular file. Never blocks on anything else in its place, such as a FIFO.
-/// \return EFBIG for a file over kMaxTextFile bytes, EINVAL if it is not a regular file.
-[[nodiscard]] Expected<std::string> readFile(const std::string &path);
+/// Whether a file of this owner may be relied on: the superuser's, our own user's, or that of whom
+/// its folder belongs to, who could replace it anyway.
+bool isTrustedOwner(const std::string &path, uid_t owner);
 
+/// Whether it is a regular file of a trusted owner to which not everybody may write.
+/// \return EINVAL or EPERM otherwise
+Expected<void> judgeFile(const std::string &path, const struct stat &status);
+
+/// What to do if the last component of a path is a symbolic link.
 enum class Links { kFollow, kRefuse };
 
+/// Reads a whole file that judgeFile() accepts. Never blocks on anything else in its place, such as
+/// a FIFO.
+/// \return EFBIG for a file over kMaxTextFile bytes, EINVAL if it is not a regular file, EPERM if
+///         others could have written it, ELOOP for a refused link
+[[nodiscard]] Expected<std::string> readFile(const std::string &path, Links links = Links::kFollow);
+
 /// As readFile(), for a file that only its owner can read.
-/// \param links  what to do if the last component of the path is a symbolic link
-/// \return EPERM if others can read it, ELOOP for a refused link
+/// \return EPERM if others can read it
 [[nodiscard]] Expected<Secret> readPrivateFile(const std::string &path, Links links);
 
 /// Creates a file atomically and durably unless it exists: an existing one is never replaced, even
@@ -53,15 +64,17 @@ void fillStandardDescriptors();
 /// PATH.new behind, which the next change overwrites.
 class FileUpdate {
 public:
-    /// Takes the lock; waits at most 5 seconds for it. A symbolic link at `path` is followed.
-    /// \return ETIMEDOUT if another process kept the lock.
+    /// Takes the lock; waits at most 5 seconds for it.
+    /// \return ETIMEDOUT if another process kept the lock; an error that names the lock file if
+    ///         something else has its place.
     [[nodiscard]] static Expected<FileUpdate> begin(const std::string &path);
 
-    /// Replaces the file by `content`, durably. Mode and, where permitted, owner of the old file
-    /// are kept.
+    /// Replaces the file by `content`, durably. Mode, without the right of others to write, and,
+    /// where permitted, a trusted owner of the old file are kept.
     /// \param modeWhenNew  mode of a file that did not exist, regardless of the umask
-    /// \return on failure the old file is unchanged (or, if the directory could not be
-    ///         synchronised, may return after a power failure).
+    /// \return ELOOP for a symbolic link, which is neither followed nor replaced, and EINVAL for
+    ///         anything else that is no file; on failure the old file is unchanged (or, if the
+    ///         directory could not be synchronised, may return after a power failure).
     [[nodiscard]] Expected<void> commit(std::string_view content, mode_t modeWhenNew) const;
 
 private:

@@ -1,6 +1,8 @@
 // SPDX-License-Identifier: Apache-2.0
 #pragma once
 
+#include <tl/expected.hpp>
+
 #include <memory>
 #include <string>
 
@@ -22,12 +24,18 @@ using SqliteHandle = std::unique_ptr<sqlite3, CloseSqlite>;
 /// A prepared statement; its connection must outlive it.
 using SqliteStatement = std::unique_ptr<sqlite3_stmt, FinalizeSqlite>;
 
-/// Opens an existing file for reading and writing, with extended result codes. Untrusted SQL in the
-/// file's schema is not run, and a misspelt column is an error, not a text.
+/// Why a file cannot be used.
+struct SqliteFailure {
+    int code; ///< SQLite's
+    std::string text;
+};
+
+/// Opens an existing file for reading and writing, with extended result codes. It is judged first
+/// (judgeFile()), and so is what SQLite opens beside it: SQLite follows links and waits for the
+/// other end of a FIFO. Untrusted SQL in the file's schema is not run, and a misspelt column is an
+/// error, not a text.
 /// \param busyMilliseconds  how long to wait for a lock that another connection holds
-/// \param database          also set on failure, for its message, unless out of memory
-/// \return SQLITE_OK, or the error code.
-int openSqlite(const std::string &path, int busyMilliseconds, SqliteHandle &database);
+tl::expected<SqliteHandle, SqliteFailure> openSqlite(const std::string &path, int busyMilliseconds);
 
 /// Prepares the first statement of `sql`; null on failure, and sqliteText() says why.
 /// \param tail  receives the rest of `sql`; may be null

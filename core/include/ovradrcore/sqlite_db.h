@@ -8,6 +8,7 @@
 #include "ovradrcore/sqlite_value.h"
 
 #include <memory>
+#include <optional>
 #include <string>
 #include <vector>
 
@@ -28,6 +29,10 @@ public:
     /// \param busyTime   seconds to wait for a lock that another process holds
     /// \param infoTable  the table in which provisioning keeps the schema version
     SqliteDB(const std::string &path, unsigned int busyTime, const std::string &infoTable);
+    /// \param newestSchema  a file with a newer schema than this is neither read nor changed: every
+    ///                      operation fails. One without a schema version is used as it is.
+    SqliteDB(const std::string &path, unsigned int busyTime, const std::string &infoTable,
+             int newestSchema);
     SqliteDB(SqliteDB &&) noexcept;
     SqliteDB &operator=(SqliteDB &&) noexcept;
     ~SqliteDB() override;
@@ -52,10 +57,17 @@ private:
         void operator()(sqlite3 *db) const;
     };
 
+    enum class Access { kRead, kWrite };
+    bool checkedRun(Access access, const std::string &sql, std::vector<SqliteValueList> *rows,
+                    bool firstOnly);
     bool run(const std::string &sql, std::vector<SqliteValueList> *rows, bool firstOnly);
+    bool refuseNewerSchema() const;
+    bool execute(const char *sql) const;
     bool fail(const std::string &what) const;
 
     std::string infoTable_;
+    std::optional<int> newestSchema_;
+    std::string whyClosed_;
     std::unique_ptr<SqliteWait> wait_;
     std::unique_ptr<sqlite3, Close> db_;
 };

@@ -28,8 +28,9 @@ Expected<void> readKeyFile(const std::string &path, const KeyFileKind &kind, uns
     const Expected<OvraBase::Secret> content =
         OvraBase::readPrivateFile(path, OvraBase::Links::kRefuse);
     if (!content && (content.error().number == EPERM || content.error().number == EINVAL)) {
-        return Unexpected({path + " must be a file that only its owner can read: chmod 600, and "
-                                  "make a new key if others may have read it"});
+        return Unexpected({path + " must be a file of our own that only its owner can read: " +
+                           content.error().text +
+                           "; chmod 600, and make a new key if others may have read it"});
     }
     if (!content) {
         return cannot("read", path, content.error());

@@ -119,15 +119,13 @@ Database::Database(std::string path, const DatabaseLayout &layout)
         return;
     }
     const OvraDRCore::NoFork noFork;
-    OvraBase::SqliteHandle opened;
-    const int code = OvraBase::openSqlite(path_, 0, opened);
-    database_.reset(opened.release());
-    wait_ = std::make_unique<OvraDRCore::SqliteWait>(database_.get(), kBusyTimeout);
-    if (code != SQLITE_OK) {
-        failSqlite(code);
-        database_.reset();
+    auto opened = OvraBase::openSqlite(path_, 0);
+    if (!opened) {
+        failSqlite(opened.error().code, opened.error().text);
         return;
     }
+    database_.reset(opened->release());
+    wait_ = std::make_unique<OvraDRCore::SqliteWait>(database_.get(), kBusyTimeout);
     if (!setUp()) {
         database_.reset();
     }
@@ -144,8 +142,12 @@ bool Database::fail(const std::string &sentence) {
 }
 
 bool Database::failSqlite(int code) {
-    return fail("The " + std::string(layout_.name) + " [" + path_ + "] cannot be used: " +
-                OvraBase::sqliteText(database_.get(), code) + ". " + adviceFor(code));
+    return failSqlite(code, OvraBase::sqliteText(database_.get(), code));
+}
+
+bool Database::failSqlite(int code, const std::string &text) {
+    return fail("The " + std::string(layout_.name) + " [" + path_ + "] cannot be used: " + text +
+                ". " + adviceFor(code));
 }
 
 /// The file is created without being opened: closing a descriptor of it would drop the locks that
@@ -166,9 +168,11 @@ bool Database::makeFile() {
         return fail("The " + std::string(layout_.name) + " [" + path_ +
                     "] is not a file of our own user. Remove it.");
     }
-    if ((status.st_mode & (S_IRWXG | S_IRWXO)) != 0) {
-        OVRA_WARN("The %s [%s] was open to other users; its mode is 0600 again.", layout_.name,
-                  path_.c_str());
+    if ((status.st_mode & 07777U) != (S_IRUSR | S_IWUSR)) {
+        if ((status.st_mode & (S_IRWXG | S_IRWXO)) != 0) {
+            OVRA_WARN("The %s [%s] was open to other users; its mode is 0600 again.", layout_.name,
+                      path_.c_str());
+        }
         if (chmod(path_.c_str(), S_IRUSR | S_IWUSR) != 0) {
             return fail("The mode of [" + path_ + "] cannot be set: " + OvraBase::errnoText(errno) +
                         ". Set it to 0600.");

@@ -109,8 +109,9 @@ Started LocalServer::Impl::takePlace() {
     }
     UniqueFd fd(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
     // The mode that the file gets from bind(2) is the socket's own, so that it is never open wider.
+    // After it, because the umask may have taken rights of our own; the folder is ours alone.
     if (!fd || fchmod(fd.get(), 0600) != 0 || !bindLocal(fd.get(), *address) ||
-        listen(fd.get(), kQueue) != 0) {
+        chmod(path.c_str(), 0600) != 0 || listen(fd.get(), kQueue) != 0) {
         return tl::unexpected("cannot listen on " + path + ": " + OvraBase::errnoText(errno));
     }
     listener = std::move(fd);

@@ -104,6 +104,7 @@ private:
     bool isPrevious(std::optional<std::int64_t> version) const;
     [[nodiscard]] bool makeTables();
     bool failSqlite(int code);
+    bool failSqlite(int code, const std::string &text);
     void rollback();
     std::optional<std::int64_t> pragma(const char *sql);
 
