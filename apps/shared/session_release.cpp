@@ -194,10 +194,12 @@ FlowResult deleteCredential(const DRNode &record, bool temporary) {
     });
 }
 
-Release retryRelease(const PendingRelease &pending, PendingReleases &store) {
-    const SessionLock lock(pending.nodeId, SessionLock::Purpose::kRelease);
+Release retryRelease(const PendingRelease &pending, PendingReleases &store, unsigned int patience) {
+    const SessionLock lock(pending.nodeId, SessionLock::Purpose::kRelease, patience);
     if (lock.isBusy()) {
-        return {Release::State::kLeft, OvraPlatform::APIError::kTooBusy, {}, true};
+        Release busy = left(OvraPlatform::APIError::kTooBusy);
+        busy.remembered = store.postpone(pending, busy.code);
+        return busy;
     }
     DRNode record;
     const bool inUse = DRNodeDB::GetCred(pending.credId, record) &&
