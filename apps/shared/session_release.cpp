@@ -166,7 +166,7 @@ FlowState createCredential(OvraDRNode::CredCreate &flow) {
         return FlowState::kDone;
     }
     const DRNode &record = flow.getNode();
-    releaseLater(noteFor(record, record.session, record.conn));
+    releaseLater(noteFor(record, flow.getGrantedSession(), record.conn));
     return FlowState::kFailed;
 }
 
@@ -178,9 +178,8 @@ FlowResult changeCredential(OvraDRNode::DRNodeCredSet &flow, const DRNode &recor
         }
         flow.setStoredConn(conn);
         if (!flow.process()) {
-            if (flow.IsSessionChanged()) {
-                releaseLater(noteFor(record, flow.getNewSession(), conn));
-            }
+            // If it is the present one, the note is removed with that of the present one.
+            releaseLater(noteFor(record, flow.getGrantedSession(), conn));
             return false;
         }
         return true;

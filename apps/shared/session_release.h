@@ -53,7 +53,7 @@ struct FlowResult {
 // flow runs anyway. Two rows never share a note.
 
 /// Creates a credential with a node that the flow has met (CredCreate::getRemoteNodeInfo()). If the
-/// row cannot be stored, the session that was granted for it is noted.
+/// row cannot be stored, or the session does not pass its test, that session is noted.
 [[nodiscard]] FlowState createCredential(OvraDRNode::CredCreate &flow);
 
 /// Changes a lasting credential, and finds out what happened to its previous session, which the

@@ -210,6 +210,13 @@ TEST_F(Life, ASessionWhoseRowCannotBeStoredIsNotedForRelease) {
         EXPECT_EQ(run(command, "secret word\n").exit, 9);
         ASSERT_EQ(pending().size(), 1U) << command[1];
         EXPECT_EQ(pending()[0].session, "granted-s3cret");
+
+        std::filesystem::remove(OvraApps::kPendingReleasesFile);
+        remote.answer("granted-s3cret test_privilege", refusal(105)); // it does not pass its test
+        EXPECT_EQ(run(command, "secret word\n").exit, 1);
+        ASSERT_EQ(pending().size(), 1U) << command[1];
+        EXPECT_EQ(pending()[0].session, "granted-s3cret");
+        remote.answer("granted-s3cret test_privilege", success("{}"));
     }
 }
 
