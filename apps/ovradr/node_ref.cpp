@@ -44,8 +44,10 @@ Expected<std::string> chooseId(const std::set<std::string> &ids, const std::stri
 Expected<std::string> localNode() {
     const std::string id = DRNode::getLocalNodeId();
     if (id.empty()) {
-        return failure(ExitCode::kNotSetUp, "This appliance has no node id, and none can be made.",
-                       "Run `ovradr setup` as root.");
+        return failure(ExitCode::kNotSetUp,
+                       "The node id of this appliance cannot be used, and none can be made.",
+                       "Run the command as root, and `ovradr setup` before it if that was never "
+                       "done.");
     }
     return id;
 }

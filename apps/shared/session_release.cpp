@@ -166,7 +166,7 @@ FlowState createCredential(OvraDRNode::CredCreate &flow) {
         return FlowState::kDone;
     }
     const DRNode &record = flow.getNode();
-    releaseLater(noteFor(record, record.session, record.conn));
+    releaseLater(noteFor(record, flow.getGrantedSession(), record.conn));
     return FlowState::kFailed;
 }
 
@@ -178,9 +178,8 @@ FlowResult changeCredential(OvraDRNode::DRNodeCredSet &flow, const DRNode &recor
         }
         flow.setStoredConn(conn);
         if (!flow.process()) {
-            if (flow.IsSessionChanged()) {
-                releaseLater(noteFor(record, flow.getNewSession(), conn));
-            }
+            // If it is the present one, the note is removed with that of the present one.
+            releaseLater(noteFor(record, flow.getGrantedSession(), conn));
             return false;
         }
         return true;
@@ -194,10 +193,12 @@ FlowResult deleteCredential(const DRNode &record, bool temporary) {
     });
 }
 
-Release retryRelease(const PendingRelease &pending, PendingReleases &store) {
-    const SessionLock lock(pending.nodeId, SessionLock::Purpose::kRelease);
+Release retryRelease(const PendingRelease &pending, PendingReleases &store, unsigned int patience) {
+    const SessionLock lock(pending.nodeId, SessionLock::Purpose::kRelease, patience);
     if (lock.isBusy()) {
-        return {Release::State::kLeft, OvraPlatform::APIError::kTooBusy, {}, true};
+        Release busy = left(OvraPlatform::APIError::kTooBusy);
+        busy.remembered = store.postpone(pending, busy.code);
+        return busy;
     }
     DRNode record;
     const bool inUse = DRNodeDB::GetCred(pending.credId, record) &&

@@ -53,7 +53,7 @@ struct FlowResult {
 // flow runs anyway. Two rows never share a note.
 
 /// Creates a credential with a node that the flow has met (CredCreate::getRemoteNodeInfo()). If the
-/// row cannot be stored, the session that was granted for it is noted.
+/// row cannot be stored, or the session does not pass its test, that session is noted.
 [[nodiscard]] FlowState createCredential(OvraDRNode::CredCreate &flow);
 
 /// Changes a lasting credential, and finds out what happened to its previous session, which the
@@ -68,8 +68,13 @@ FlowResult changeCredential(OvraDRNode::DRNodeCredSet &flow, const OvraDRNode::D
 /// gone before.
 FlowResult deleteCredential(const OvraDRNode::DRNode &record, bool temporary);
 
+/// How long retryRelease() waits for a flow that keeps the lock, in seconds. Short and then put
+/// off, or the releases at a node whose flow does not end would hold up those at all others.
+inline constexpr unsigned int kRetryPatience = 10;
+
 /// Tries a release that is pending, and removes or postpones its note. Behind a flow that keeps the
-/// lock the note stays as it is (kLeft with 107).
-Release retryRelease(const PendingRelease &pending, PendingReleases &store);
+/// lock it is postponed (kLeft with 107).
+Release retryRelease(const PendingRelease &pending, PendingReleases &store,
+                     unsigned int patience = kRetryPatience);
 
 } // namespace OvraApps

@@ -82,6 +82,9 @@ public:
 
     /// The record as built so far.
     const DRNode &getNode() const { return node; }
+    /// The session that the remote node granted, a secret; "" before requestRemoteSession(). It may
+    /// live although the creation failed.
+    const std::string &getGrantedSession() const { return grantedSession; }
 
 private:
     [[nodiscard]] bool completes(bool done);
@@ -89,6 +92,7 @@ private:
 
     DRNode node;
     std::string account;
+    std::string grantedSession;
     BaseSender *sender = nullptr;
 };
 

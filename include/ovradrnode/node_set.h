@@ -35,8 +35,8 @@ public:
     void setStoredConn(const Conn &conn) { storedConn = conn; }
     bool IsSessionChanged() const;
     /// The session that the remote node granted for this change, a secret; "" before
-    /// requestRemoteSession().
-    const std::string &getNewSession() const { return newSession; }
+    /// requestRemoteSession(). It may live although the change failed.
+    const std::string &getGrantedSession() const { return grantedSession; }
     /// Whether the new login reaches the node that the credential belongs to (518 if another).
     [[nodiscard]] bool check();
     [[nodiscard]] bool checkRemoteNodeInfo();
@@ -49,6 +49,7 @@ private:
     DRNode record;
     CredAccountSender sender;
     std::string newSession;
+    std::string grantedSession;
     Conn storedConn;
 };
 

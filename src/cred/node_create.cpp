@@ -259,6 +259,7 @@ bool CredCreate::requestRemoteSession() {
         OVRA_ERR("Empty session field in resp[%s]", toLogString(response.toJson()).c_str());
         return false;
     }
+    grantedSession = session;
     if (!CredUtils::TestSessionValid(node.conn, session)) {
         OVRA_ERR("Invalie session[%s] of conn[%s]", text(node.conn).c_str(), session.c_str());
         return false;

@@ -154,6 +154,7 @@ bool DRNodeCredSet::requestRemoteSession() {
         OVRA_ERR("Empty session field in resp[%s]", toLogString(response.toJson()).c_str());
         return false;
     }
+    grantedSession = session;
     if (!CredUtils::TestSessionValid(sender.getConn(), session)) {
         OVRA_ERR("Invalie session of conn[%s]", text(sender.getConn()).c_str());
         return false;

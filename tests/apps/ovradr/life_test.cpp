@@ -4,6 +4,7 @@
 #include "scripted_node.h"
 #include "shared/pending_releases.h"
 #include "shared/session_lock.h"
+#include "shared/session_release.h"
 
 #include <ovradrcore/json.h>
 #include <ovraplatform/farlink.h>
@@ -209,6 +210,13 @@ TEST_F(Life, ASessionWhoseRowCannotBeStoredIsNotedForRelease) {
         EXPECT_EQ(run(command, "secret word\n").exit, 9);
         ASSERT_EQ(pending().size(), 1U) << command[1];
         EXPECT_EQ(pending()[0].session, "granted-s3cret");
+
+        std::filesystem::remove(OvraApps::kPendingReleasesFile);
+        remote.answer("granted-s3cret test_privilege", refusal(105)); // it does not pass its test
+        EXPECT_EQ(run(command, "secret word\n").exit, 1);
+        ASSERT_EQ(pending().size(), 1U) << command[1];
+        EXPECT_EQ(pending()[0].session, "granted-s3cret");
+        remote.answer("granted-s3cret test_privilege", success("{}"));
     }
 }
 
@@ -261,6 +269,14 @@ TEST_F(Life, ASessionIsNotReleasedWhileACredentialIsMadeWithIt) {
     EXPECT_EQ(run(create, "secret word\n").exit, 0);
     EXPECT_EQ(releasing->finish().json()["data"]["tried"][0]["session"], "kept");
     EXPECT_TRUE(ended.empty());
+}
+
+TEST_F(Life, AReleaseBehindAFlowThatDoesNotEndIsPutOff) {
+    const OvraApps::SessionLock flow("n1", OvraApps::SessionLock::Purpose::kObtain, 0);
+    PendingReleases store;
+    ASSERT_TRUE(store.note({"s", OvraDRNode::Conn::https("127.0.0.1", 1), "n1", "c0"}));
+    EXPECT_EQ(OvraApps::retryRelease(pending()[0], store, 0).code, 107);
+    EXPECT_EQ(pending()[0].attempts, 1);
 }
 
 TEST(PendingRelease, IsDueAgainAfterPausesThatGrow) {
