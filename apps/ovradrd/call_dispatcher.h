@@ -24,8 +24,10 @@ struct WorkQueues {
     OvraService::WorkQueue outbound{16, {128, 64}};
     OvraService::WorkQueue twoWay{16, {128, 64}};
     OvraService::WorkQueue relay{8, {128, 64}};
-    OvraService::WorkQueue login{
-        2, {512, 64}}; ///< log-ins: each hashes a password, with 64 MiB and a tenth of a second
+    // Log-ins: each hashes a password, with 64 MiB and a tenth of a second. Those of clients that
+    // logged in before do not wait for those of strangers.
+    OvraService::WorkQueue login{2, {512, 64}};
+    OvraService::WorkQueue knownLogin{1, {512, 64}};
 
     OvraService::WorkQueue &of(OvraPlatform::APIQueue queue);
 };
@@ -36,7 +38,7 @@ class CallDispatcher {
 public:
     /// Everything must outlive the dispatcher and the jobs in the queues.
     CallDispatcher(const OvraPlatform::APIRegistry &registry, const OvraPlatform::SealKeyPair &keys,
-                   OvraPlatform::ReplayGuard &guard, WorkQueues &queues);
+                   OvraPlatform::ReplayGuard &guard, LoginApi &api, WorkQueues &queues);
     CallDispatcher(const CallDispatcher &) = delete;
     CallDispatcher &operator=(const CallDispatcher &) = delete;
 
@@ -60,12 +62,14 @@ private:
     [[nodiscard]] bool unseal(Call &call);
     [[nodiscard]] bool admit(Call &call);
     void route(Call call);
+    OvraService::WorkQueue &loginQueue(const Call &call);
     void refuse(const Call &call) const;
     void run(const Call &call) const;
 
     const OvraPlatform::APIRegistry &registry_;
     const OvraPlatform::SealKeyPair &keys_;
     OvraPlatform::ReplayGuard &guard_;
+    LoginApi &loginApi_;
     WorkQueues &queues_;
     std::atomic<bool> stopping_ = false;
     std::atomic<bool> leaving_ = false;
