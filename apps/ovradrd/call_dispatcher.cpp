@@ -88,10 +88,11 @@ struct CallDispatcher::Call {
 
 CallDispatcher::CallDispatcher(const OvraPlatform::APIRegistry &registry,
                                const OvraPlatform::SealKeyPair &keys,
-                               OvraPlatform::ReplayGuard &guard, WorkQueues &queues)
+                               OvraPlatform::ReplayGuard &guard, LoginApi &api, WorkQueues &queues)
     : registry_(registry)
     , keys_(keys)
     , guard_(guard)
+    , loginApi_(api)
     , queues_(queues) {}
 
 void CallDispatcher::serve(OvraService::HttpRequest request,
@@ -245,7 +246,7 @@ bool CallDispatcher::parse(Call &call) const {
 
 void CallDispatcher::route(Call call) {
     OvraService::WorkQueue &queue =
-        LoginApi::isLogin(call.wire) ? queues_.login : queues_.of(registry_.queue(call.wire));
+        LoginApi::isLogin(call.wire) ? loginQueue(call) : queues_.of(registry_.queue(call.wire));
     if (&queue == &queues_.quick) {
         run(call);
         return;
@@ -256,6 +257,11 @@ void CallDispatcher::route(Call call) {
             OvraBase::clientKey(held->caller.address), [this, held] { run(*held); }, leave)) {
         leave();
     }
+}
+
+OvraService::WorkQueue &CallDispatcher::loginQueue(const Call &call) {
+    const bool known = loginApi_.isOfKnownClient(call.wire.params, call.caller.address);
+    return known ? queues_.knownLogin : queues_.login;
 }
 
 /// There is no place for the call.

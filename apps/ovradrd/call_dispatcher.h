@@ -27,8 +27,10 @@ struct WorkQueues {
     OvraService::WorkQueue outbound{16, {128, 64}};
     OvraService::WorkQueue twoWay{16, {128, 64}};
     OvraService::WorkQueue relay{8, {128, 64}};
-    OvraService::WorkQueue login{
-        2, {512, 64}}; ///< log-ins: each hashes a password, with 64 MiB and a tenth of a second
+    // Log-ins: each hashes a password, with 64 MiB and a tenth of a second. Those of clients that
+    // logged in before do not wait for those of strangers.
+    OvraService::WorkQueue login{2, {512, 64}};
+    OvraService::WorkQueue knownLogin{1, {512, 64}};
 
     OvraService::WorkQueue &of(OvraPlatform::APIQueue queue);
 };
@@ -39,7 +41,7 @@ class CallDispatcher {
 public:
     /// Everything must outlive the dispatcher and the jobs in the queues.
     CallDispatcher(const OvraPlatform::APIRegistry &registry, const OvraPlatform::SealKeyPair &keys,
-                   OvraPlatform::ReplayGuard &guard, WorkQueues &queues);
+                   OvraPlatform::ReplayGuard &guard, LoginApi &api, WorkQueues &queues);
     CallDispatcher(const CallDispatcher &) = delete;
     CallDispatcher &operator=(const CallDispatcher &) = delete;
 
@@ -75,6 +77,7 @@ private:
     [[nodiscard]] bool admit(Call &call) const;
     [[nodiscard]] bool parse(Call &call) const;
     void route(Call call);
+    OvraService::WorkQueue &loginQueue(const Call &call);
     void refuse(const Call &call) const;
     void run(const Call &call) const;
     static void note(const Call &call, const Json::Value &reply, Milliseconds time);
@@ -82,6 +85,7 @@ private:
     const OvraPlatform::APIRegistry &registry_;
     const OvraPlatform::SealKeyPair &keys_;
     OvraPlatform::ReplayGuard &guard_;
+    LoginApi &loginApi_;
     WorkQueues &queues_;
     std::atomic<bool> stopping_ = false;
     std::atomic<bool> leaving_ = false;

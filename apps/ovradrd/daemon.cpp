@@ -189,7 +189,7 @@ tl::expected<void, StartError> Daemon::start() {
     self.addHandlers();
     self.queues.emplace();
     self.retries.emplace(self.queues->outbound);
-    self.dispatcher.emplace(self.registry, *self.keys, self.guard, *self.queues);
+    self.dispatcher.emplace(self.registry, *self.keys, self.guard, self.loginApi, *self.queues);
     self.local.emplace(OvraPlatform::kSocketFile, [&self](const LocalCall &call) {
         return self.dispatcher->serveLocal(call);
     });
@@ -241,8 +241,8 @@ bool Daemon::stop() {
     }
     if (self.queues) {
         WorkQueues &queues = *self.queues;
-        for (WorkQueue *queue :
-             {&queues.login, &queues.relay, &queues.twoWay, &queues.outbound, &queues.quick}) {
+        for (WorkQueue *queue : {&queues.login, &queues.knownLogin, &queues.relay, &queues.twoWay,
+                                 &queues.outbound, &queues.quick}) {
             ended = queue->stop(deadline) && ended;
         }
     }

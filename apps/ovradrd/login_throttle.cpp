@@ -99,9 +99,38 @@ LoginThrottle::LoginThrottle(std::string path, Clock clock)
     , clock_(std::move(clock))
     , begin_(std::int64_t{clock_.system()} * 1000 - clock_.elapsed().count()) {}
 
+std::int64_t LoginThrottle::addressesSince() const {
+    return std::int64_t{clock_.system()} - kAddressKnownFor;
+}
+
+std::string LoginThrottle::placeOf(const Login &login) {
+    return keyOf({"address", OvraBase::clientKey(login.address)});
+}
+
 /// Milliseconds of the system clock of the start, unmoved by what was done to it since.
 std::int64_t LoginThrottle::now() const {
     return begin_ + clock_.elapsed().count();
+}
+
+void LoginThrottle::giveFileUp() {
+    fileFrom_ = now() + kFilePause.count();
+    OVRA_ERR("The guesses at passwords are counted in memory for ten minutes, or until a restart: "
+             "[%s] cannot be used",
+             path_.c_str());
+}
+
+bool LoginThrottle::knows(const Login &login) {
+    if (now() < fileFrom_) {
+        return false;
+    }
+    Database file(path_, kLayout);
+    const std::string account = keyOf({login.account});
+    const bool known = isKnown(file, account, keyOf({"device", login.device}), 0) ||
+                       isKnown(file, account, placeOf(login), addressesSince());
+    if (!file.isOpen() || file.failed()) {
+        giveFileUp();
+    }
+    return known;
 }
 
 /// Carries out the work in one transaction of the file, or in memory.
@@ -116,10 +145,7 @@ bool LoginThrottle::change(const std::function<bool(Database &)> &work) {
         if (file.isOpen() && done(file)) {
             return true;
         }
-        fileFrom_ = now() + kFilePause.count();
-        OVRA_ERR("The guesses at passwords are counted in memory for ten minutes, or until a "
-                 "restart: [%s] cannot be used",
-                 path_.c_str());
+        giveFileUp();
     }
     if (!memory_) {
         memory_.emplace(OvraPlatform::kInMemory, kLayout);
@@ -152,7 +178,7 @@ bool LoginThrottle::admitIn(Database &database, const Login &login, Attempt &att
     const Budget client{kClientBurst, kClientInterval};
     const Budget stranger{kStrangerBurst, kStrangerInterval};
     const std::string account = keyOf({login.account});
-    const std::string place = keyOf({"address", OvraBase::clientKey(login.address)});
+    const std::string place = placeOf(login);
     const std::string device = keyOf({"device", login.device});
     const std::int64_t time = now();
     if (!bound(database, time)) {
@@ -161,8 +187,8 @@ bool LoginThrottle::admitIn(Database &database, const Login &login, Attempt &att
 
     // The budgets of each way in which it may be admitted.
     std::vector<std::vector<Use>> ways;
-    const std::int64_t since = std::int64_t{clock_.system()} - kAddressKnownFor;
-    for (const auto &[own, from] : {std::pair(device, std::int64_t{0}), std::pair(place, since)}) {
+    for (const auto &[own, from] :
+         {std::pair(device, std::int64_t{0}), std::pair(place, addressesSince())}) {
         if (isKnown(database, account, own, from)) {
             ways.push_back({{keyOf({account, own}), client}, {keyOf({account, "known"}), pool}});
         }
@@ -274,9 +300,7 @@ void LoginThrottle::recordSuccess(const Login &login, const Attempt &attempt) {
     const std::string account = keyOf({login.account});
     (void)change([&](Database &database) {
         return refund(database, attempt) &&
-               (login.address.empty() ||
-                remember(database, account, keyOf({"address", OvraBase::clientKey(login.address)}),
-                         time)) &&
+               (login.address.empty() || remember(database, account, placeOf(login), time)) &&
                (login.device.empty() ||
                 remember(database, account, keyOf({"device", login.device}), time));
     });

@@ -6,6 +6,7 @@
 
 #include <tl/expected.hpp>
 
+#include <atomic>
 #include <chrono>
 #include <cstddef>
 #include <cstdint>
@@ -66,6 +67,8 @@ public:
     explicit LoginThrottle(std::string path = OvraPlatform::kLoginsFile,
                            Clock clock = systemClock());
 
+    /// Whether the client logged in to the account before.
+    [[nodiscard]] bool knows(const Login &login);
     /// Asks for a log-in and counts it as a guess.
     /// \return how long to wait if there were too many guesses: nothing is counted, and the
     ///         password must not be checked.
@@ -81,6 +84,7 @@ private:
     struct Use;
 
     static Clock systemClock();
+    static std::string placeOf(const Login &login);
     static bool isKnown(Database &database, const std::string &account, const std::string &client,
                         std::int64_t since);
     static bool remember(Database &database, const std::string &account, const std::string &client,
@@ -93,12 +97,14 @@ private:
     bool admitIn(Database &database, const Login &login, Attempt &attempt,
                  std::chrono::milliseconds &wait) const;
     std::int64_t now() const;
+    std::int64_t addressesSince() const;
+    void giveFileUp();
 
     const std::string path_;
     const Clock clock_;
     const std::int64_t begin_; ///< of now(), at clock_.elapsed() == 0
     std::mutex mutex_;
-    std::int64_t fileFrom_ = 0; ///< from when on the file is tried again
+    std::atomic<std::int64_t> fileFrom_ = 0; ///< from when on the file is tried again
     std::optional<Database> memory_;
 };
 

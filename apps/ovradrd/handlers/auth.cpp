@@ -26,6 +26,7 @@ constexpr int kApiVersion = 1;
 constexpr char kLogin[] = "login";
 constexpr char kLogout[] = "logout";
 constexpr char kAccount[] = "account";
+constexpr char kDeviceToken[] = "device_token";
 
 const char *refusalText(LoginResult result) {
     switch (result) {
@@ -91,9 +92,18 @@ void LoginApi::noteRelay(const std::string &address) {
     }
 }
 
-bool LoginApi::isRelay(const std::string &address) const {
+/// "" for the relay's address.
+std::string LoginApi::placeOf(const std::string &address) const {
     const std::lock_guard lock(mutex_);
-    return std::find(relays_.begin(), relays_.end(), address) != relays_.end();
+    const bool relay = std::find(relays_.begin(), relays_.end(), address) != relays_.end();
+    return relay ? std::string() : address;
+}
+
+bool LoginApi::isOfKnownClient(const Json::Value &params, const std::string &address) {
+    const std::string account = OvraDRCore::memberString(params, kAccount);
+    return AccountStore::isName(account) &&
+           throttle_.knows(
+               {account, placeOf(address), OvraDRCore::memberString(params, kDeviceToken)});
 }
 
 Json::Value LoginApi::login(const Json::Value &params, const APICaller &caller) {
@@ -104,12 +114,11 @@ Json::Value LoginApi::login(const Json::Value &params, const APICaller &caller) 
     const std::string account = in.text(kAccount, Params::kMaxAccount);
     const OvraBase::Secret password = in.secret("passwd", Params::kMaxPassword);
     const std::string code = in.optionalSecret("otp_code", Params::kMaxCode);
-    const std::string device = in.optionalSecret("device_token", Params::kMaxDevice);
+    const std::string device = in.optionalSecret(kDeviceToken, Params::kMaxDevice);
     if (!in.ok()) {
         return in.error();
     }
-    const LoginThrottle::Login attempted{
-        account, isRelay(caller.address) ? std::string() : caller.address, device};
+    const LoginThrottle::Login attempted{account, placeOf(caller.address), device};
     const auto attempt = throttle_.admit(attempted);
     if (!attempt) {
         return apiError(OvraPlatform::APIError::kTooBusy,

@@ -26,6 +26,9 @@ public:
     /// Whether the call is a log-in, which has its own queue because it hashes a password.
     static bool isLogin(const OvraPlatform::APICall &call);
 
+    /// Whether a log-in with these parameters, which may be anything, comes from a client that
+    /// logged in to the account before. Thread-safe.
+    bool isOfKnownClient(const Json::Value &params, const std::string &address);
     /// Everybody who calls through the relay has this address: no log-in makes it a known one.
     /// Thread-safe.
     void noteRelay(const std::string &address);
@@ -37,7 +40,7 @@ private:
     /// Of one relay service; the least recent one is forgotten.
     static constexpr std::size_t kMaxRelays = 16;
 
-    bool isRelay(const std::string &address) const;
+    std::string placeOf(const std::string &address) const;
     Json::Value login(const Json::Value &params, const OvraPlatform::APICaller &caller);
 
     LoginThrottle throttle_;

@@ -170,9 +170,10 @@ TEST(FullQueues, RefuseAtOnceAndDoNotHoldUpTheLowerOnes) {
     Appliance::provision();
     const auto keys = OvraPlatform::SealKeyPair::load(OvraPlatform::kSealKeyFile).value();
     OvraPlatform::ReplayGuard guard;
+    Ovradrd::LoginApi api;
     std::optional<Ovradrd::CallDispatcher> dispatcher;
     Ovradrd::WorkQueues queues;
-    dispatcher.emplace(registry, keys, guard, queues);
+    dispatcher.emplace(registry, keys, guard, api, queues);
     const auto serve = [&](const std::string &method, int client = 1) {
         dispatcher->serve(
             {"api=Test&version=1&method=" + method, "127.0.0." + std::to_string(client), true},

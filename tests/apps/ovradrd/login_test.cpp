@@ -69,20 +69,17 @@ TEST_F(Login, RefusesParametersThatAreNoLogIn) {
 
 TEST_F(Login, RefusesFurtherGuessesAlsoAfterARestartButNoLogInThatIsRight) {
     addAccount("alice", false);
-    for (int i = 0; i < 40; ++i) {
+    for (int i = 0; i < 12; ++i) {
         ASSERT_EQ(login("alice", kPassword).code(), 0) << i;
     }
-    for (int i = 0; i < 2; ++i) {
-        std::map<int, int> codes;
-        for (int guess = 0; guess < 20; ++guess) {
-            ++codes[login("alice", "wrong password").code()];
-        }
-        // As the known client and as a stranger at this address it has the same ten.
-        EXPECT_EQ(codes, (i == 0 ? std::map<int, int>{{400, 10}, {107, 10}}
-                                 : std::map<int, int>{{107, 20}}));
-        EXPECT_EQ(call("OVRA.DR.Node", 1, "info", {}, session("alice")).code(), 0);
-        restart({});
+    const auto guess = [this] { return login("alice", "wrong password").code(); };
+    for (int i = 0; i < 10; ++i) {
+        EXPECT_EQ(guess(), 400) << i;
     }
+    EXPECT_EQ(guess(), 107);
+    EXPECT_EQ(call("OVRA.DR.Node", 1, "info", {}, session("alice")).code(), 0);
+    restart({});
+    EXPECT_EQ(guess(), 107);
 }
 
 TEST_F(Login, LetsInWhoLoggedInBeforeWhileStrangersGuess) {

@@ -88,6 +88,9 @@ TEST_F(Throttle, KeepsNobodyOutWhoLoggedInBeforeNorAStrangerForAnothersGuesses) 
     EXPECT_EQ(guess(1, from("198.51.100.2")), 1) << "one stranger took all";
     attack();
     restart();
+    EXPECT_TRUE(throttle->knows(from("203.0.113.2", "device")) &&
+                throttle->knows(from("192.0.2.1")));
+    EXPECT_FALSE(throttle->knows(from("198.51.100.1")) || throttle->knows(from("")));
     const struct {
         const char *who;
         LoginThrottle::Login login;
