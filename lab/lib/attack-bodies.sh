@@ -1,20 +1,22 @@
 # SPDX-License-Identifier: Apache-2.0
 # shellcheck shell=bash
-# The scene attack-bodies, for lab/scene: 16 strangers post bodies of 1 MiB to node 2, while an honest
-# client makes calls over a kept connection and others log in.
+# Two scenes for lab/scene. attack-bodies: 16 strangers post bodies of 1 MiB to node 2, while an honest
+# client makes calls over a kept connection and others log in. attack-reply: node 1 is paired with a
+# node 2 that answers with 8 MiB.
 
 # What the attack may cost on a machine that has time for it. One with fewer than four processors also
 # carries the attackers and the clients, and another one may have other work: times may be longer there,
-# twice, or as often as there are processes for each processor, at most eight times.
+# twice, or as often as there are processes for each processor, at most four times.
 callLimit=50 loginLimit=2 growthLimit=40 heldLimit=10
 busy=$(awk -v processors="$(nproc)" '{
     busy = int($1 / processors + 0.99); least = processors < 4 ? 2 : 1
-    print (busy < least ? least : busy > 8 ? 8 : busy) }' /proc/loadavg)
+    print (busy < least ? least : busy > 4 ? 4 : busy) }' /proc/loadavg)
 
-# What the daemon of node 2 has in memory (RSS), in MiB. With proot every process is visible.
+# daemonMemory [NODE]: what the daemon of node 2 has in memory (RSS), in MiB. With proot every process is
+# visible.
 daemonMemory() {
     # shellcheck disable=SC2016 # expanded in the node
-    "$lab" run 2 -- bash -c '
+    "$lab" run "${1-2}" -- bash -c '
         for pid in $(pgrep -x ovradrd); do
             grep -sqzxF "OVRADR_LAB_ID=$OVRADR_LAB_ID" "/proc/$pid/environ" &&
                 grep -sqzxF "OVRADR_LAB_NODE=$OVRADR_LAB_NODE" "/proc/$pid/environ" &&
@@ -29,7 +31,7 @@ kept() {
                 -d "api=OVRA.DR.Node&version=1&method=info&_sid=$3" \
                 -w "%{time_total} %{http_code} %{size_download}\n" -K - || [ $? -eq 124 ]' calls "$1" "$url" "$sid"
 }
-# quantiles: of the calls in the last output: sets count, failed, median, p99 and longest in ms.
+# quantiles CALLS: sets count, failed, median, p99 and longest in ms.
 quantiles() {
     read -r count failed median p99 longest < <(sort -n <<<"$1" | awk '
         { time[NR] = $1 * 1000; if ($2 != 200 || $3 < 100) failed++ }
@@ -42,13 +44,14 @@ bound() {
     line "$1" "$2${4-}" "(at most $3${4-})"
     awk "BEGIN { exit !($2 <= $3) }" || missed+="$1: $2 is more than $3. "
 }
+posted() { "$lab" run 1 -- wc -l "$load/attack" | cut -d ' ' -f 1; } # bodies of 1 MiB
 logIn() {
     "$lab" run 1 -- curl -sk --max-time 20 -w '\n%{time_total}\n' "$url/webapi/query.cgi" \
         -d "api=OVRA.Core.Auth&version=1&method=login&account=%22replica%22&passwd=%22$password%22" || true
 }
 
 playAttack-bodies() {
-    local sid before peak after slowest=0 answer attack sampler k addresses=() way
+    local sid before peak after slowest=0 answer attack sampler k addresses=() way begun
     way=$(<"$OVRADR_LAB_DIR/way")
     for k in $(seq 16); do
         if [[ $way == proot ]]; then
@@ -69,13 +72,19 @@ playAttack-bodies() {
     on 1 0 mkdir -p "$load"
     "$lab" run 1 -- bash "$here/lib/bodies.sh" 16 "$url/webapi/query.cgi" "$load" "${addresses[@]}" &
     attack=$!
-    sleep 3
+    for k in $(seq 100); do
+        ! "$lab" run 1 -- test -s "$load/attack" || break
+        sleep 0.2
+    done
+    on 1 0 test -s "$load/attack"
+    begun=$(posted)
     (while sleep 0.2; do daemonMemory; done) >"$work/memory" &
     sampler=$!
     quantiles "$(kept 1000)"
     kill "$sampler"
     wait "$sampler" || true
     peak=$(sort -n "$work/memory" | tail -n 1)
+    line "bodies posted meanwhile" "$(($(posted) - begun))"
     line "honest calls under attack" "$count"
     bound "of them failed" "$failed" 0
     line "median of an honest call" "$median ms"
@@ -90,10 +99,53 @@ playAttack-bodies() {
     bound "slowest of five log-ins" "$slowest" $((loginLimit * busy)) " s"
     on 1 0 touch "$load/stop"
     wait "$attack" || true
-    on 1 0 cat "$load/attack"
-    line "bodies of 1 MiB that the attackers posted" "$(grep -c . <<<"$output" || true)"
     sleep 25
     after=$(daemonMemory)
     bound "of the growth kept half a minute later" "$(plus "$after" "-$before")" "$heldLimit" " MiB"
+    [[ -z $missed ]] || fail "$missed"
+}
+
+# Of a process that reads one reply of 8 MiB: the text, and the tree up to where its reader stops.
+replyLimit=96
+playAttack-reply() {
+    local before peak sampler k
+    url=http://$("$lab" addr 2):5000
+    key=$(fingerprint 2 http)
+    create 0 --json
+    credId=$(value .data.cred_id)
+    info 0
+    before=$(daemonMemory 1)
+    stopDaemon
+    "$lab" run 2 -- sh -c "perl '$here/lib/hostile.pl' $("$lab" addr 2) 5000 >/tmp/hostile.out 2>&1 &"
+    sleep "$(plus "$lifetime" 0.5)"
+
+    # shellcheck disable=SC2016 # expanded in the node
+    peak=$("$lab" run 1 -- bash -c '
+        ovradr call --cred "$1" "$2" OVRA.DR.Node info >/usr/ovra/reply 2>&1 & pid=$!
+        while status=$(cat "/proc/$pid/status" 2>/dev/null) && [[ $status == *VmHWM* ]]; do
+            most=$(awk "/^VmHWM:/ { printf \"%.1f\", \$2 / 1024 }" <<<"$status")
+        done
+        wait $pid && code=0 || code=$?
+        echo "$most $code"' call "$credId" "$remote")
+    [[ ${peak#* } != 0 ]] || fail "a reply of 8 MiB of numbers is taken"
+    on 1 0 cat /usr/ovra/reply
+    [[ $output == *"too large"* ]] || missed+="It is not refused for its size: $output. "
+    bound "memory of ovradr call" "${peak% *}" "$replyLimit" " MiB"
+
+    (while sleep 0.05; do daemonMemory 1; done) >"$work/memory" &
+    sampler=$!
+    for k in 1 2 3 4 5; do
+        "$lab" run 1 -- ovradr call local OVRA.DR.Node.Credential relay --param "cred_id=\"$credId\"" \
+            --param 'webapi={"api":"OVRA.DR.Node","version":1,"method":"info","params":{}}' \
+            >"$work/relayed.$k" 2>&1 &
+    done
+    sleep 6
+    kill "$sampler"
+    wait "$sampler" || true
+    grep -l "too large" "$work"/relayed.? >/dev/null || missed+="The daemon takes it. "
+    peak=$(sort -n "$work/memory" | tail -n 1)
+    bound "growth of the daemon, five replies at once" "$(plus "$peak" "-$before")" $((5 * 64)) " MiB"
+    sleep 22
+    bound "of it kept half a minute later" "$(plus "$(daemonMemory 1)" "-$before")" "$heldLimit" " MiB"
     [[ -z $missed ]] || fail "$missed"
 }
