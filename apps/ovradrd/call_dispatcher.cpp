@@ -86,12 +86,14 @@ struct CallDispatcher::Call {
 
 CallDispatcher::CallDispatcher(const OvraPlatform::APIRegistry &registry,
                                const OvraPlatform::SealKeyPair &keys,
-                               OvraPlatform::ReplayGuard &guard, LoginApi &api, WorkQueues &queues)
+                               OvraPlatform::ReplayGuard &guard, LoginApi &api, WorkQueues &queues,
+                               bool logsCalls)
     : registry_(registry)
     , keys_(keys)
     , guard_(guard)
     , loginApi_(api)
-    , queues_(queues) {}
+    , queues_(queues)
+    , logsCalls_(logsCalls) {}
 
 void CallDispatcher::serve(OvraService::HttpRequest request,
                            const OvraService::HttpServer::Answer &answer) {
@@ -136,6 +138,7 @@ bool CallDispatcher::unseal(Call &call) {
     if (!sealed) {
         const bool hasSomething = !call.wire.sid.empty() || !call.wire.params.empty();
         if (hasSomething && !call.secure) {
+            noteRefusal(call, APIError::kSealRefused);
             call.reply(unsealed(guard_.now()));
             return false;
         }
@@ -148,6 +151,7 @@ bool CallDispatcher::unseal(Call &call) {
         call.replyKey = opened.replyKey;
     }
     if (verdict != OvraPlatform::SealVerdict::kOpened) {
+        noteRefusal(call, APIError::kSealRefused);
         call.reply(OvraPlatform::sealRefusal(verdict, guard_.now()));
         return false;
     }
@@ -171,6 +175,7 @@ bool CallDispatcher::admit(Call &call) {
         return true;
     }
     if (owner.account.disabled) {
+        noteRefusal(call, APIError::kNoPermission);
         call.reply(apiError(APIError::kNoPermission,
                             "the account of the session is disabled: enable it, or use another"));
         return false;
@@ -201,6 +206,7 @@ void CallDispatcher::login(Call call) {
     const auto held = std::make_shared<Call>(std::move(call));
     const auto wait = loginApi_.admit(held->wire.params, held->caller.address);
     if (!wait) {
+        noteRefusal(*held, APIError::kTooBusy);
         held->reply(apiError(APIError::kTooBusy, "too many log-ins of this account or from this "
                                                  "address failed: wait a minute"));
         return;
@@ -218,14 +224,26 @@ void CallDispatcher::refuse(const Call &call) const {
     }
 }
 
-void CallDispatcher::run(const Call &call) const {
+void CallDispatcher::noteRefusal(const Call &call, int code) {
+    refusals_.note(call.caller.address, code,
+                   "[" + call.wire.api + "] method [" + call.wire.method + "] of user [" +
+                       call.caller.user + "]");
+}
+
+void CallDispatcher::run(const Call &call) {
     const OvraPlatform::ClientScope scope(call.caller.address);
     const auto begun = std::chrono::steady_clock::now();
     const Json::Value reply = registry_.dispatch(call.wire, call.caller);
     const std::chrono::duration<double, std::milli> time = std::chrono::steady_clock::now() - begun;
-    OVRA_DEBUG("[%s] version [%d] method [%s] of user [%s] from [%s]: code [%d] in [%.1f]ms",
-               call.wire.api.c_str(), call.wire.version, call.wire.method.c_str(),
-               call.caller.user.c_str(), call.caller.address.c_str(), codeOf(reply), time.count());
+    const int code = codeOf(reply);
+    if (code == APIError::kNoPermission || code == APIError::kNoSession) {
+        noteRefusal(call, code);
+    }
+    if (logsCalls_) {
+        OVRA_DEBUG("[%s] version [%d] method [%s] of user [%s] from [%s]: code [%d] in [%.1f]ms",
+                   call.wire.api.c_str(), call.wire.version, call.wire.method.c_str(),
+                   call.caller.user.c_str(), call.caller.address.c_str(), code, time.count());
+    }
     call.reply(reply);
 }
 

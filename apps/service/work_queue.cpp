@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "service/work_queue.h"
 
+#include <ovrabase/secret.h>
 #include <ovradrcore/log.h>
 
 #include <condition_variable>
@@ -66,6 +67,7 @@ void WorkQueue::Impl::work() {
         }
         // What the job holds is released before it counts as ended.
         job = nullptr;
+        OvraBase::wipeStack();
         lock.lock();
         --running;
         jobEnded.notify_all();
