@@ -8,6 +8,7 @@
 #include "service/certificate.h"
 #include "service/http_server.h"
 #include "service/listener.h"
+#include "service/memory.h"
 #include "service/startup.h"
 #include "service/tls_identity.h"
 #include "tunnel_server.h"
@@ -208,6 +209,7 @@ int run(int argc, char **argv) {
 
 int main(int argc, char **argv) {
     OvraBase::fillStandardDescriptors();
+    OvraService::protectMemory();
     openlog("farlinkd", LOG_NDELAY, LOG_DAEMON);
     try {
         return Farlinkd::run(argc, argv);

@@ -1,6 +1,8 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "tunnel_server.h"
 
+#include "service/rate_limit.h"
+
 #include <ovrabase/address.h>
 #include <ovradrcore/log.h>
 
@@ -113,7 +115,8 @@ struct TunnelServer::Impl {
     std::mutex mutex; ///< of the two below
     std::vector<Command> commands;
     bool stopping = false;
-    std::unordered_map<int, std::unique_ptr<Socket>> sockets; ///< of the thread alone
+    std::unordered_map<int, std::unique_ptr<Socket>> sockets;           ///< of the thread alone
+    OvraService::RateLimit linesOfRefusals{1, std::chrono::minutes(1)}; ///< the same
     std::thread thread;
 };
 
@@ -252,8 +255,10 @@ void TunnelServer::Impl::acceptCaller(const std::string &alias, UniqueFd fd,
         return socket.calls && socket.alias == alias;
     };
     if (!makeRoom(callsAlias, limits.perAlias, client) || !makeRoom(calls, limits.calls, client)) {
-        OVRA_NOTICE("A caller of [%s] from [%s] is turned away: too many at once", alias.c_str(),
-                    client.c_str());
+        if (linesOfRefusals.allow(client, Clock::now())) {
+            OVRA_NOTICE("A caller of [%s] from [%s] is turned away: too many at once",
+                        alias.c_str(), client.c_str());
+        }
         return;
     }
     const std::string caller = newCaller();

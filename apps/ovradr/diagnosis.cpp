@@ -171,8 +171,8 @@ private:
     Expected<std::string> key() {
         const auto met =
             OvraPlatform::peerFingerprint(conn_.protocol, conn_.addr, conn_.port, kKeySeconds);
-        for (const CredError told :
-             {CredError::kTrustUnavailable, CredError::kOutOfMemory, CredError::kTimedOut}) {
+        for (const CredError told : {CredError::kTrustUnavailable, CredError::kOutOfMemory,
+                                     CredError::kTimedOut, CredError::kTlsTooOld}) {
             if (met == tl::unexpected(told)) {
                 return endpointFailure(conn_, told);
             }

@@ -210,6 +210,10 @@ Refusal failureOf(int code, const Json::Value &detail) {
 }
 
 Refusal failureOf(const OvraDRCore::ErrRecorder &error) {
+    const OvraPlatform::CredError noReply = OvraPlatform::lastLoginError();
+    if (error.GetErrCode() == ERR::kLoginFailed && noReply != OvraPlatform::CredError::kNone) {
+        return failureOf(ERR::kCredLibrary, static_cast<int>(noReply));
+    }
     return failureOf(error.GetErrCode(), error.GetErrMsg());
 }
 

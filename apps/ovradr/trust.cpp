@@ -32,6 +32,7 @@ ExitCode exitOf(CredError error) {
     case CredError::kHttpStatus:
     case CredError::kReplyBroken:
     case CredError::kReplyTooLarge:
+    case CredError::kTlsTooOld:
         return ExitCode::kNotReachable;
     case CredError::kCertificateChanged:
         return ExitCode::kCertificate;

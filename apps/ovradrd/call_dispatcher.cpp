@@ -88,12 +88,14 @@ struct CallDispatcher::Call {
 
 CallDispatcher::CallDispatcher(const OvraPlatform::APIRegistry &registry,
                                const OvraPlatform::SealKeyPair &keys,
-                               OvraPlatform::ReplayGuard &guard, LoginApi &api, WorkQueues &queues)
+                               OvraPlatform::ReplayGuard &guard, LoginApi &api, WorkQueues &queues,
+                               bool logsCalls)
     : registry_(registry)
     , keys_(keys)
     , guard_(guard)
     , loginApi_(api)
-    , queues_(queues) {}
+    , queues_(queues)
+    , logsCalls_(logsCalls) {}
 
 void CallDispatcher::serve(OvraService::HttpRequest request,
                            const OvraService::HttpServer::Answer &answer) {
@@ -182,6 +184,7 @@ bool CallDispatcher::unseal(Call &call) {
     if (!sealed) {
         const bool hasSomething = !call.wire.sid.empty() || !call.wire.texts.empty();
         if (hasSomething && !call.secure) {
+            noteRefusal(call, APIError::kSealRefused);
             call.reply(unsealed(guard_.now()));
             return false;
         }
@@ -194,6 +197,7 @@ bool CallDispatcher::unseal(Call &call) {
         call.replyKey = opened.replyKey;
     }
     if (verdict != OvraPlatform::SealVerdict::kOpened) {
+        noteRefusal(call, APIError::kSealRefused);
         call.reply(OvraPlatform::sealRefusal(verdict, guard_.now()));
         return false;
     }
@@ -203,7 +207,7 @@ bool CallDispatcher::unseal(Call &call) {
 
 /// Identifies the caller, and judges the call by its name and the caller's rights; false if it was
 /// refused. An unknown session counts as none.
-bool CallDispatcher::admit(Call &call) const {
+bool CallDispatcher::admit(Call &call) {
     const SessionOwner owner =
         call.wire.sid.empty() ? SessionOwner{} : findSessionOwner(call.wire.sid);
     if (owner.state == SessionOwner::State::kNotKnown) {
@@ -214,6 +218,7 @@ bool CallDispatcher::admit(Call &call) const {
     }
     if (owner.state == SessionOwner::State::kFound) {
         if (owner.account.disabled) {
+            noteRefusal(call, APIError::kNoPermission);
             call.reply(
                 apiError(APIError::kNoPermission,
                          "the account of the session is disabled: enable it, or use another"));
@@ -271,7 +276,13 @@ void CallDispatcher::refuse(const Call &call) const {
     }
 }
 
-void CallDispatcher::run(const Call &call) const {
+void CallDispatcher::noteRefusal(const Call &call, int code) {
+    refusals_.note(call.caller.address, code,
+                   "[" + call.wire.api + "] method [" + call.wire.method + "] of user [" +
+                       call.caller.user + "]");
+}
+
+void CallDispatcher::run(const Call &call) {
     const OvraPlatform::ClientScope scope(call.caller.address);
     const auto begun = std::chrono::steady_clock::now();
     const Json::Value reply = registry_.dispatch(call.wire, call.caller);
@@ -279,11 +290,18 @@ void CallDispatcher::run(const Call &call) const {
     call.reply(reply);
 }
 
-/// Logs what became of a call.
+/// Logs a refusal and, if that is wanted, every call.
 void CallDispatcher::note(const Call &call, const Json::Value &reply, Milliseconds time) {
-    OVRA_DEBUG("[%s] version [%d] method [%s] of user [%s] from [%s]: code [%d] in [%.1f]ms",
-               call.wire.api.c_str(), call.wire.version, call.wire.method.c_str(),
-               call.caller.user.c_str(), call.caller.address.c_str(), codeOf(reply), time.count());
+    const int code = codeOf(reply);
+    if (code == APIError::kNoPermission || code == APIError::kNoSession ||
+        (code == APIError::kTooBusy && LoginApi::isLogin(call.wire))) {
+        noteRefusal(call, code);
+    }
+    if (logsCalls_) {
+        OVRA_DEBUG("[%s] version [%d] method [%s] of user [%s] from [%s]: code [%d] in [%.1f]ms",
+                   call.wire.api.c_str(), call.wire.version, call.wire.method.c_str(),
+                   call.caller.user.c_str(), call.caller.address.c_str(), code, time.count());
+    }
 }
 
 Json::Value CallDispatcher::serveLocal(const OvraPlatform::LocalCall &call) {

@@ -2,6 +2,7 @@
 #pragma once
 
 #include "handlers/auth.h"
+#include "refusal_log.h"
 #include "service/http_server.h"
 #include "service/work_queue.h"
 
@@ -40,8 +41,10 @@ struct WorkQueues {
 class CallDispatcher {
 public:
     /// Everything must outlive the dispatcher and the jobs in the queues.
+    /// \param logsCalls  every call gets a line at level debug, and not only the refused ones
     CallDispatcher(const OvraPlatform::APIRegistry &registry, const OvraPlatform::SealKeyPair &keys,
-                   OvraPlatform::ReplayGuard &guard, LoginApi &api, WorkQueues &queues);
+                   OvraPlatform::ReplayGuard &guard, LoginApi &api, WorkQueues &queues,
+                   bool logsCalls = false);
     CallDispatcher(const CallDispatcher &) = delete;
     CallDispatcher &operator=(const CallDispatcher &) = delete;
 
@@ -56,6 +59,9 @@ public:
     /// Carries out the call of a local process, with an administrator's rights, and waits for its
     /// reply. Thread-safe.
     Json::Value serveLocal(const OvraPlatform::LocalCall &call);
+
+    /// Writes what is due of the log lines of refused calls. Call it now and then.
+    void tellRefusals() { refusals_.tell(); }
 
     /// From here on leaves remote calls for which there is no place without an answer: "too busy"
     /// would end the caller's search for another way.
@@ -74,19 +80,22 @@ private:
                        const OvraService::HttpServer::Verdict &verdict);
     [[nodiscard]] bool read(Call &call, std::string_view body) const;
     [[nodiscard]] bool unseal(Call &call);
-    [[nodiscard]] bool admit(Call &call) const;
+    [[nodiscard]] bool admit(Call &call);
     [[nodiscard]] bool parse(Call &call) const;
     void route(Call call);
     OvraService::WorkQueue &loginQueue(const Call &call);
     void refuse(const Call &call) const;
-    void run(const Call &call) const;
-    static void note(const Call &call, const Json::Value &reply, Milliseconds time);
+    void run(const Call &call);
+    void note(const Call &call, const Json::Value &reply, Milliseconds time);
+    void noteRefusal(const Call &call, int code);
 
     const OvraPlatform::APIRegistry &registry_;
     const OvraPlatform::SealKeyPair &keys_;
     OvraPlatform::ReplayGuard &guard_;
     LoginApi &loginApi_;
     WorkQueues &queues_;
+    const bool logsCalls_;
+    RefusalLog refusals_;
     std::atomic<bool> stopping_ = false;
     std::atomic<bool> leaving_ = false;
 };

@@ -189,7 +189,8 @@ tl::expected<void, StartError> Daemon::start() {
     self.addHandlers();
     self.queues.emplace();
     self.retries.emplace(self.queues->outbound);
-    self.dispatcher.emplace(self.registry, *self.keys, self.guard, self.loginApi, *self.queues);
+    self.dispatcher.emplace(self.registry, *self.keys, self.guard, self.loginApi, *self.queues,
+                            self.settings.logsCalls);
     self.local.emplace(OvraPlatform::kSocketFile, [&self](const LocalCall &call) {
         return self.dispatcher->serveLocal(call);
     });
@@ -223,6 +224,7 @@ int Daemon::httpPort() const {
 void Daemon::doPeriodicWork() {
     (void)OvraPlatform::SessionStore().sweep(); // the log says why not; the next one is soon
     impl_->retries->begin();
+    impl_->dispatcher->tellRefusals();
 }
 
 bool Daemon::stop() {

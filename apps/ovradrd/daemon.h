@@ -19,6 +19,7 @@ struct Settings {
     int httpsPort = 0;
     OvraService::HttpLimits limits;
     std::size_t testFiles = 16; ///< sent at the same time
+    bool logsCalls = false;     ///< every call, at level debug
 };
 
 /// The whole daemon: web server, local socket, queues and handlers. One per process.

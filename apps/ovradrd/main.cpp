@@ -3,6 +3,7 @@
 // ovradrd: the web-API daemon of an appliance.
 
 #include "daemon.h"
+#include "service/memory.h"
 #include "version.h"
 
 #include <ovrabase/file.h>
@@ -67,15 +68,16 @@ void waitForEnd(Daemon &daemon, const OvraService::EndSignals &signals) {
     }
 }
 
-int serve() {
+int serve(bool logsCalls) {
     OvraService::keepMemorySmall();
     const OvraService::EndSignals signals;
     OvraService::raiseDescriptorLimit(kDescriptors);
 
-    const auto settings = readSettings();
+    auto settings = readSettings();
     if (!settings) {
         return fail(settings.error());
     }
+    settings->logsCalls = logsCalls;
     Daemon daemon(*settings);
     if (const auto started = daemon.start(); !started) {
         return fail(started.error());
@@ -98,17 +100,20 @@ int serve() {
 
 int main(int argc, char **argv) {
     OvraBase::fillStandardDescriptors();
+    OvraService::protectMemory();
     openlog("ovradrd", LOG_NDELAY, LOG_DAEMON);
     try {
         CLI::App app("The web-API daemon of an appliance", "ovradrd");
         app.footer(kFooter);
+        bool logsCalls = false;
+        app.add_flag("--log-calls", logsCalls, "Logs every call, at level debug");
         app.set_version_flag("--version", std::string("ovradrd ") + Ovradrd::kVersion);
         try {
             app.parse(argc, argv);
         } catch (const CLI::ParseError &error) {
             return app.exit(error) == 0 ? EXIT_SUCCESS : static_cast<int>(ExitCode::kUsage);
         }
-        return serve();
+        return serve(logsCalls);
     } catch (const std::exception &error) {
         return OvraService::reportStartError("ovradrd", error);
     }

@@ -2,6 +2,7 @@
 #include "service/http_server.h"
 
 #include "service/byte_range.h"
+#include "service/rate_limit.h"
 
 #include <ovrabase/address.h>
 #include <ovrabase/number.h>
@@ -90,8 +91,18 @@ struct DestroyResponse {
     void operator()(MHD_Response *response) const { MHD_destroy_response(response); }
 };
 
+/// A few lines a minute: whoever sends rubbish must not fill the log with what the library says of
+/// it.
 __attribute__((format(printf, 2, 0))) void logLibrary(void * /*self*/, const char *format,
                                                       va_list arguments) {
+    static std::mutex mutex;
+    static RateLimit lines(10, std::chrono::minutes(1));
+    {
+        const std::lock_guard lock(mutex);
+        if (!lines.allow("", std::chrono::steady_clock::now())) {
+            return;
+        }
+    }
     std::array<char, 512> line{};
     std::vsnprintf(line.data(), line.size(), format, arguments);
     OVRA_DEBUG("%s", line.data());

@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "service/work_queue.h"
 
+#include <ovrabase/secret.h>
 #include <ovradrcore/log.h>
 
 #include <algorithm>
@@ -139,6 +140,7 @@ void WorkQueue::Impl::work() {
         }
         // What the job holds is released before it counts as ended.
         job = nullptr;
+        OvraBase::wipeStack();
         lock.lock();
         --running;
         --client->running;

@@ -13,7 +13,8 @@ prootRun() {
     # Opened read-write, so that neither side blocks.
     exec {status}<>"$fifo"
     rm -f "$fifo"
-    PROOT_TMP_DIR=$folder perl "$labLib/old-syscalls.pl" proot -v -1 "${viewArgs[@]}" -w / \
+    # proot, and who looks for its processes, reads the memory of the daemons.
+    OVRADR_DUMPABLE=1 PROOT_TMP_DIR=$folder perl "$labLib/old-syscalls.pl" proot -v -1 "${viewArgs[@]}" -w / \
         /bin/bash -c 'status=$1 folder=$2; shift 2
             cd -- "$folder" 2>/dev/null || cd /
             eval "\"\$@\" $status>&-" && code=0 || code=$?

@@ -289,6 +289,11 @@ void MisbehavingServer::changeCertificate() {
         SSL_CTX_use_PrivateKey(context_.get(), certificate_->key()) != 1) {
         throw std::runtime_error("no TLS for the test server");
     }
+    if (options_.oldTls) {
+        SSL_CTX_set_security_level(context_.get(), 0); // allows what is broken
+        SSL_CTX_set_min_proto_version(context_.get(), 0);
+        SSL_CTX_set_max_proto_version(context_.get(), TLS1_1_VERSION);
+    }
 }
 
 void MisbehavingServer::closeConnections() {

@@ -86,6 +86,7 @@ class MisbehavingServer {
 public:
     struct Options {
         bool tls = false;
+        bool oldTls = false; ///< speaks TLS 1.1 and nothing newer
         std::string address = "127.0.0.1";
         int port = 0; ///< 0: a free one
     };

@@ -2,8 +2,10 @@
 #pragma once
 
 #include <string.h>
+#include <sys/mman.h>
 
 #include <array>
+#include <cerrno>
 #include <cstddef>
 #include <string>
 #include <string_view>
@@ -17,6 +19,17 @@ inline void wipe(std::string &text) {
     text.clear();
 }
 
+/// Overwrites what the calls that this thread has made have left on its stack, 128 KiB of it.
+void wipeStack();
+
+/// Keeps the bytes from being swapped out, as far as RLIMIT_MEMLOCK allows. For good: others may
+/// have asked the same for the rest of their pages.
+inline void keepInMemory(const void *bytes, std::size_t size) {
+    const int error = errno;
+    (void)mlock(bytes, size);
+    errno = error;
+}
+
 /// Text that is wiped on destruction and replacement. It never grows beyond its initial capacity,
 /// so that reallocation leaves no copy behind.
 class Secret {
@@ -24,9 +37,11 @@ public:
     /// Capacity in bytes, enough for any password.
     static constexpr std::size_t kMaxSize = 1024;
 
-    Secret() { text_.reserve(kMaxSize); }
+    Secret()
+        : Secret(std::string_view()) {}
     explicit Secret(std::string_view text) {
         text_.reserve(text.size() > kMaxSize ? text.size() : kMaxSize);
+        keepInMemory(text_.data(), text_.capacity());
         text_.assign(text);
     }
     /// Takes the text; `text` is wiped and left empty.
@@ -70,8 +85,13 @@ private:
 template <std::size_t Size>
 struct SecretBytes : std::array<unsigned char, Size> {
     SecretBytes()
-        : std::array<unsigned char, Size>{} {}
-    SecretBytes(const SecretBytes &) = default;
+        : std::array<unsigned char, Size>{} {
+        keepInMemory(this->data(), Size);
+    }
+    SecretBytes(const SecretBytes &other)
+        : std::array<unsigned char, Size>(other) {
+        keepInMemory(this->data(), Size);
+    }
     SecretBytes &operator=(const SecretBytes &) = default;
     ~SecretBytes() { explicit_bzero(this->data(), Size); }
 };

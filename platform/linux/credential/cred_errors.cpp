@@ -38,6 +38,12 @@ const char *credErrorText(int error) {
         return "the request could not be sealed: check that the endpoint is an appliance's";
     case CredError::kUnanswered:
         return "no answer in time: check whether the request was carried out";
+    case CredError::kTlsTooOld:
+        return "the endpoint speaks only versions of TLS that are broken (older than 1.2): update "
+               "that appliance, or allow TLS 1.2 on it";
+    case CredError::kReplyForged:
+        return "the reply carries no valid seal, so somebody on the way may have changed it: use "
+               "https, and check whether the request was carried out";
     case CredError::kTrustUnavailable:
         return "the file of trusted keys cannot be read or written: the system log says why";
     }

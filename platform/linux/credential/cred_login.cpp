@@ -13,6 +13,20 @@
 #include <string>
 #include <utility>
 
+namespace OvraPlatform {
+
+namespace {
+
+thread_local CredError lastError = CredError::kNone;
+
+} // namespace
+
+CredError lastLoginError() {
+    return lastError;
+}
+
+} // namespace OvraPlatform
+
 namespace OVRA {
 
 using OvraPlatform::CredError;
@@ -59,7 +73,7 @@ CredExpected<Json::Value> login(const OVRACred &cred, const std::string &otp, OV
         call.params["device_token"] = device.get();
     }
     return OvraPlatform::callWebAPI(*endpoint, call,
-                                    {std::chrono::steady_clock::now() + kLoginTime})
+                                    {std::chrono::steady_clock::now() + kLoginTime, false})
         .and_then([&sess](const WebReply &reply) -> CredExpected<Json::Value> {
             Json::Value document;
             const std::string sid = reply.response.getDataFieldtoStr("sid");
@@ -95,6 +109,7 @@ int CredRequestUtil::LoginWithOTP(OVRACred *cred, const std::string &otp, OVRACr
     }
     try {
         const auto document = login(*cred, otp, *sess);
+        OvraPlatform::lastError = document ? CredError::kNone : document.error();
         *out = document ? *document : noAnswer(document.error());
         return document ? 1 : 0;
     } catch (const std::exception &failure) {

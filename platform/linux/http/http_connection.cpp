@@ -37,6 +37,12 @@ bool curlReady() {
     return ready;
 }
 
+/// Where a TLS context keeps its connection.
+int tlsContextIndex() {
+    static const int index = SSL_CTX_get_ex_new_index(0, nullptr, nullptr, nullptr, nullptr);
+    return index;
+}
+
 /// Sets one option after the other and remembers whether all were taken.
 class Options {
 public:
@@ -224,12 +230,11 @@ bool HttpConnection::setUp() {
             .set(CURLOPT_FORBID_REUSE, 1L);
     } else {
         // The verifier replaces libcurl's check of the chain, and checks the host as well.
-        options.set(CURLOPT_SSL_VERIFYPEER, 1L)
-            .set(CURLOPT_SSL_VERIFYHOST, 0L)
-            .set(CURLOPT_SSL_CTX_FUNCTION, &HttpConnection::onTlsContext)
-            .set(CURLOPT_SSL_CTX_DATA, this);
+        options.set(CURLOPT_SSL_VERIFYPEER, 1L).set(CURLOPT_SSL_VERIFYHOST, 0L);
     }
-    return options.ok();
+    return options.set(CURLOPT_SSL_CTX_FUNCTION, &HttpConnection::onTlsContext)
+        .set(CURLOPT_SSL_CTX_DATA, this)
+        .ok();
 }
 
 CredExpected<long> HttpConnection::status(const std::string &url, Deadline deadline) {
@@ -310,6 +315,7 @@ CredExpected<HttpAnswer> HttpConnection::perform(const std::string &url, Deadlin
     attempt_ = Attempt();
     notConnected_.reset();
     replyTooLarge_ = false;
+    tlsTooOld_ = false;
     const SigpipeGuard noSigpipe;
     const CURLcode code = transfer_.perform(handle_.get());
     if (code != CURLE_OK) {
@@ -343,6 +349,7 @@ CredError HttpConnection::errorOfTransfer(CURLcode code) const {
     case CURLE_COULDNT_RESOLVE_HOST:
     case CURLE_COULDNT_CONNECT:
     case CURLE_SSL_CONNECT_ERROR:
+        return tlsTooOld_ ? CredError::kTlsTooOld : CredError::kCannotConnect;
     case CURLE_PEER_FAILED_VERIFICATION:
         return CredError::kCannotConnect;
     case CURLE_FILESIZE_EXCEEDED:
@@ -391,8 +398,22 @@ std::size_t HttpConnection::onHeader(char *, std::size_t size, std::size_t count
 }
 
 CURLcode HttpConnection::onTlsContext(CURL *, void *context, void *self) {
-    static_cast<HttpConnection *>(self)->verifier_.install(static_cast<SSL_CTX *>(context));
+    auto *tls = static_cast<SSL_CTX *>(context);
+    auto *connection = static_cast<HttpConnection *>(self);
+    if (connection->purpose_ != Purpose::kProbe) {
+        connection->verifier_.install(tls);
+    }
+    SSL_CTX_set_ex_data(tls, tlsContextIndex(), self);
+    SSL_CTX_set_info_callback(tls, &HttpConnection::onTlsEvent);
     return CURLE_OK;
+}
+
+/// Whichever end refuses the other's version says so by the same alert (RFC 8446, 6.2).
+void HttpConnection::onTlsEvent(const SSL *tls, int event, int value) {
+    if ((event & SSL_CB_ALERT) != 0 && (value & 0xFF) == SSL_AD_PROTOCOL_VERSION) {
+        static_cast<HttpConnection *>(SSL_CTX_get_ex_data(SSL_get_SSL_CTX(tls), tlsContextIndex()))
+            ->tlsTooOld_ = true;
+    }
 }
 
 /// Called when a connection is ready (TLS included) and before anything of the request is sent.

@@ -95,6 +95,7 @@ private:
     static std::size_t onBody(char *data, std::size_t size, std::size_t count, void *self);
     static std::size_t onHeader(char *data, std::size_t size, std::size_t count, void *self);
     static CURLcode onTlsContext(CURL *handle, void *context, void *self);
+    static void onTlsEvent(const SSL *tls, int event, int value);
     static int onRequest(void *self, char *peer, char *local, int peerPort, int localPort);
     static curl_socket_t onOpenSocket(void *self, curlsocktype type, curl_sockaddr *address);
     static int onSocketOptions(void *self, curl_socket_t socket, curlsocktype type);
@@ -112,6 +113,7 @@ private:
     Deadline connectDeadline_;
     std::optional<CredError> notConnected_;
     bool replyTooLarge_ = false;
+    bool tlsTooOld_ = false;
     bool endsWhenSilent_ = false; ///< the present socket has been told to
     // Last, so that they go first: closing a connection calls back.
     std::unique_ptr<CURL, FreeHandle> handle_;

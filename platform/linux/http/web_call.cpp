@@ -7,6 +7,7 @@
 #include "seal/seal_key_cache.h"
 #include "seal/sealing.h"
 
+#include <ovrabase/secret.h>
 #include <ovradrcore/json.h>
 #include <ovradrcore/log.h>
 
@@ -65,7 +66,7 @@ CredExpected<std::string> bodyOf(HttpAnswer answer) {
 CredExpected<std::string> post(const Endpoint &endpoint, const WireCall &call,
                                const WebCallOptions &options) {
     const auto url = endpoint.url(kEntryPoint);
-    const auto fields = toFormFields(call);
+    auto fields = toFormFields(call);
     if (!url || !fields) {
         return tl::unexpected(CredError::kBadArgument);
     }
@@ -81,9 +82,14 @@ CredExpected<std::string> post(const Endpoint &endpoint, const WireCall &call,
     if (!connection) {
         return tl::unexpected(CredError::kOutOfMemory);
     }
+    std::string body = options.upload ? "" : encodeForm(*fields);
     CredExpected<HttpAnswer> answer =
         options.upload ? connection->postFile(*url, *fields, *options.upload, options.deadline)
-                       : connection->post(*url, encodeForm(*fields), options.deadline);
+                       : connection->post(*url, body, options.deadline);
+    OvraBase::wipe(body);
+    for (auto &[name, value] : *fields) {
+        OvraBase::wipe(value);
+    }
     if (answer && options.reuse) {
         ConnectionPool::instance().keep(endpoint, trust, std::move(connection));
     }
@@ -201,7 +207,7 @@ private:
     Ending readSealed(const Json::Value &reply, const ReplyKey &replyKey) {
         std::optional<std::string> text = openReply(replyKey, reply);
         if (!text) {
-            return tl::unexpected(CredError::kSealFailed);
+            return tl::unexpected(CredError::kReplyForged);
         }
         CredExpected<WebReply> opened = readReply(std::move(*text));
         // Only a time that came sealed is believed: a wrong one would let an attacker hold the
@@ -223,7 +229,7 @@ private:
             return std::nullopt;
         }
         if (!isPlainRefusal(response)) {
-            return tl::unexpected(CredError::kSealFailed);
+            return tl::unexpected(CredError::kReplyForged);
         }
         return WebReply{body, std::move(response)};
     }

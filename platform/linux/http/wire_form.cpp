@@ -151,7 +151,12 @@ std::optional<FormFields> toFormFields(const WireCall &call) {
 }
 
 std::string encodeForm(const FormFields &fields) {
+    std::size_t size = 0;
+    for (const auto &[name, value] : fields) {
+        size += 3 * (name.size() + value.size()) + 2;
+    }
     std::string body;
+    body.reserve(size); // a text that moves would leave copies of what is secret
     for (const auto &[name, value] : fields) {
         if (!body.empty()) {
             body += '&';

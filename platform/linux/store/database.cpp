@@ -45,7 +45,11 @@ const char *adviceFor(int code) {
 } // namespace
 
 void Statement::Finalize::operator()(sqlite3_stmt *statement) const {
+    sqlite3 *const database = sqlite3_db_handle(statement);
     OvraBase::FinalizeSqlite()(statement);
+    // The pages hold the secrets of every row near the one that was read, and a connection may be
+    // kept for long; the kernel has the file at hand.
+    sqlite3_db_release_memory(database);
 }
 
 Statement &Statement::bind(int index, std::string_view text) {
@@ -288,6 +292,7 @@ bool Transaction::commit() {
         return false;
     }
     open_ = false;
+    sqlite3_db_release_memory(database_.database_.get()); // of the pages that were changed
     return true;
 }
 

@@ -7,6 +7,7 @@
 #include "webapi/local_wire.h"
 
 #include <ovrabase/file.h>
+#include <ovrabase/secret.h>
 #include <ovrabase/unique_fd.h>
 #include <ovradrcore/file_lock.h>
 #include <ovradrcore/json.h>
@@ -131,6 +132,7 @@ void LocalServer::Impl::serveConnections() {
             accept4(listener.get(), nullptr, nullptr, SOCK_CLOEXEC | SOCK_NONBLOCK));
         if (peer) {
             serve(peer.get());
+            OvraBase::wipeStack(); // of the passwords and codes in the call
         } else if (errno == EMFILE || errno == ENFILE || errno == ENOMEM || errno == ENOBUFS) {
             std::this_thread::sleep_for(kPauseWithoutDescriptors);
         }

@@ -165,6 +165,9 @@ TEST_F(CredRequestScene, TellsWhyItCannotConnect) {
     server.refuse();
     EXPECT_EQ(call().error, CredError::kCannotConnect);
     EXPECT_EQ(::call(plain).error, CredError::kCannotConnect) << "no TLS on that port";
+    MisbehavingServer old({.tls = true, .oldTls = true});
+    EXPECT_EQ(::call(old).error, CredError::kTlsTooOld);
+    EXPECT_EQ(probe("https", old.port()).error, CredError::kTlsTooOld);
     EXPECT_EQ(probe("http", unusedPort()).error, CredError::kCannotConnect);
     EXPECT_EQ(probe("http", 5000, "no-such-host.invalid").error, CredError::kCannotConnect);
 

@@ -188,7 +188,10 @@ TEST_F(SealedCallScene, BelievesNothingThatCouldBeForged) {
           R"({"success":false,"error":{"code":400}})", R"({"sealed_reply":"AAAA"})",
           R"({"success":false,"error":{"code":109,"msg":{"reason":"stale","time":1}}})"}) {
         server->answerOnce(Answer::json(forged));
-        EXPECT_EQ(call(), CredError::kSealFailed) << forged;
+        EXPECT_EQ(call(), CredError::kReplyForged) << forged;
+        server->answerOnce(Answer::json(forged));
+        EXPECT_EQ(login(), 0);
+        EXPECT_EQ(OvraPlatform::lastLoginError(), CredError::kReplyForged) << forged;
     }
     server->answerOnce(Answer::json(R"({"success":false,"error":{"code":107}})"));
     EXPECT_EQ(call(), CredError::kNone) << "that it is busy says nothing that could harm";

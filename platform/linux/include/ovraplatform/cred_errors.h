@@ -24,14 +24,21 @@ enum class CredError : int {
     kTimedOut = 10,          ///< not done within the given time; nothing of the request was sent
     kHttpStatus = 11,        ///< an HTTP status that is not an answer
     kUploadUnreadable = 12,  ///< the file to send cannot be read, or cannot be sent as required
-    kSealFailed = 13,        ///< the request could not be sealed, or the reply not opened
+    kSealFailed = 13,        ///< the request could not be sealed
     kTrustUnavailable = 14,  ///< the file of trusted keys can be neither read nor written
     kUnanswered = 15,        ///< sent, and no answer in time: it may have been carried out
+    // 16 and 17: of the trusted keys
+    kTlsTooOld = 18,   ///< the endpoint speaks no TLS 1.2 or newer
+    kReplyForged = 19, ///< the reply to a sealed request carries no valid seal
 };
 
 /// A value, or the error; never kNone.
 template <typename T>
 using CredExpected = tl::expected<T, CredError>;
+
+/// Why the last log-in of this thread got no reply that can be believed; kNone if it got one. The
+/// error 501 of the node library does not tell that from a wrong password.
+OVRAPLATFORM_EXPORT CredError lastLoginError();
 
 /// What the number means and what to do, for people; never null.
 OVRAPLATFORM_EXPORT const char *credErrorText(int error);
