@@ -8,6 +8,7 @@
 #include <ovradrcore/log.h>
 #include <ovraplatform/api_errors.h>
 #include <ovraplatform/client_scope.h>
+#include <ovraplatform/peer_keys.h>
 
 #include <chrono>
 #include <future>
@@ -220,6 +221,8 @@ void CallDispatcher::refuse(const Call &call) const {
 
 void CallDispatcher::run(const Call &call) const {
     const OvraPlatform::ClientScope scope(call.caller.address);
+    const OvraPlatform::PeerKeyScope peer(call.caller.administrator ? call.wire.params
+                                                                    : Json::Value());
     const auto begun = std::chrono::steady_clock::now();
     const Json::Value reply = registry_.dispatch(call.wire, call.caller);
     const std::chrono::duration<double, std::milli> time = std::chrono::steady_clock::now() - begun;

@@ -54,8 +54,9 @@ CredExpected<Json::Value> login(const OVRACred &cred, const std::string &otp, OV
     if (!otp.empty()) {
         call.params["otp_code"] = otp;
     }
-    return OvraPlatform::callWebAPI(*endpoint, call,
-                                    {std::chrono::steady_clock::now() + kLoginTime})
+    OvraPlatform::WebCallOptions options{std::chrono::steady_clock::now() + kLoginTime};
+    options.firstContact = true;
+    return OvraPlatform::callWebAPI(*endpoint, call, options)
         .and_then([&sess](const WebReply &reply) -> CredExpected<Json::Value> {
             Json::Value document;
             const std::string sid = reply.response.getDataFieldtoStr("sid");

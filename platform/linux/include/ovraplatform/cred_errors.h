@@ -27,6 +27,8 @@ enum class CredError : int {
     kSealFailed = 13,        ///< the request could not be sealed, or the reply not opened
     kTrustUnavailable = 14,  ///< the file of trusted keys can be neither read nor written
     kUnanswered = 15,        ///< sent, and no answer in time: it may have been carried out
+    kNotTrusted = 16,        ///< nobody has trusted a key of the endpoint yet, or it was withdrawn
+    kTrustLost = 17,         ///< the file of trusted keys is missing or damaged
 };
 
 /// A value, or the error; never kNone.
