@@ -40,7 +40,8 @@ AliasRegistry::AliasRegistry(std::string path, const Limits &limits)
     , nextPort_(limits.firstPort) {}
 
 OvraBase::Expected<void> AliasRegistry::load() {
-    const OvraBase::Expected<std::string> text = OvraBase::readFile(path_, OvraBase::Links::kRefuse);
+    const OvraBase::Expected<std::string> text =
+        OvraBase::readFile(path_, OvraBase::Links::kRefuse);
     if (!text && text.error().number == ENOENT) {
         return {};
     }

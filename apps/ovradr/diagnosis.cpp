@@ -153,12 +153,17 @@ private:
             return withExit(direct.error(), ExitCode::kNameUnknown);
         }
         conn_ = *direct;
-        const auto found = resolveHost(conn_.addr, conn_.port);
+        const Expected<Conn> place = placeOf(subject_.conn);
+        if (!place) {
+            return withExit(place.error(), ExitCode::kNameUnknown);
+        }
+        place_ = *place;
+        const auto found = resolveHost(place_.addr, place_.port);
         if (!found) {
             return Refusal(found.error());
         }
         addresses_ = *found;
-        std::string text = subject_.conn.isFarlink() ? targetText(conn_) + ": " : "";
+        std::string text = subject_.conn.isFarlink() ? targetText(place_) + ": " : "";
         for (const OvraBase::SocketAddress &address : addresses_) {
             text +=
                 (&address == addresses_.data() ? "" : ", ") + OvraBase::addressText(address.get());
@@ -166,7 +171,7 @@ private:
         return text;
     }
 
-    Expected<std::string> connect() { return connectAny(addresses_, conn_); }
+    Expected<std::string> connect() { return connectAny(addresses_, place_); }
 
     Expected<std::string> key() {
         const auto met =
@@ -186,16 +191,28 @@ private:
         if (subject_.own) {
             return expectedKey(peer);
         }
-        const bool judged = sendsSecrets() || peer.pinned == TrustVerdict::kDifferent;
-        if (judged && !peer.acceptedBySystem) {
-            if (const auto trusted = trustPeer(conn_, subject_.fingerprint); !trusted) {
-                return Refusal(trusted.error());
-            }
+        trusted_ = peer.isTrusted() && subject_.fingerprint.empty();
+        if (!trusted_ && peer.pinned == TrustVerdict::kLost && subject_.fingerprint.empty()) {
+            return lostKey(peer);
         }
-        trusted_ = sendsSecrets() || peer.acceptedBySystem || peer.pinned == TrustVerdict::kTrusted;
-        return peer.fingerprint + "; trusted: " +
-               (sendsSecrets() && !peer.acceptedBySystem ? "yes, it is the known key"
-                                                         : trustText(peer));
+        if (trusted_ || (!sendsSecrets() && peer.pinned == TrustVerdict::kUnknown)) {
+            return peer.fingerprint + "; trusted: " + trustText(peer);
+        }
+        if (const auto trusted = trustPeer(conn_, subject_.fingerprint); !trusted) {
+            return Refusal(trusted.error());
+        }
+        trusted_ = true;
+        return peer.fingerprint + "; trusted: yes, it is the known key";
+    }
+
+    Expected<std::string> lostKey(const PeerIdentity &peer) const {
+        return failure(ExitCode::kCertificate,
+                       "The key of " + targetText(conn_) + ", " + peer.fingerprint +
+                           ", may have been lost: " + OvraPlatform::kKnownEndpointsFile +
+                           " cannot be relied on, " + OvraPlatform::TrustStore().problem() + ".",
+                       "Compare it with what `ovradr conn local` shows over there, then run "
+                       "`ovradr conn trust " +
+                           targetText(conn_) + "`.");
     }
 
     /// An endpoint of this appliance must show the key that is in its file.
@@ -308,7 +325,8 @@ private:
 
     const DiagnosisSubject &subject_;
     Diagnosis &diagnosis_;
-    Conn conn_; ///< the direct endpoint
+    Conn conn_;  ///< the endpoint as senders use it
+    Conn place_; ///< where it is reached
     std::vector<OvraBase::SocketAddress> addresses_;
     bool trusted_ = false;
     std::unique_ptr<BaseSender> sender_;
@@ -391,6 +409,17 @@ void diagnoseAppliance(Diagnosis &diagnosis) {
         return "node " + nodeId;
     });
     diagnosis.run("folders", checkPaths);
+    diagnosis.run("trusted keys", []() -> Expected<std::string> {
+        const std::string problem = OvraPlatform::TrustStore().problem();
+        if (!problem.empty()) {
+            return failure(ExitCode::kNotSetUp,
+                           std::string(OvraPlatform::kKnownEndpointsFile) +
+                               " cannot be relied on: " + problem + ".",
+                           "Endpoints that it does not name are refused: restore it from a backup, "
+                           "or correct it and run `ovradr conn trust` for each.");
+        }
+        return std::string(OvraPlatform::kKnownEndpointsFile);
+    });
     diagnosis.run("daemon", [&nodeId]() -> Expected<std::string> {
         const Response info = BaseSender::run(WebAPI::getDRNodeInfoAPI({}));
         if (!info.isSuccess()) {

@@ -33,27 +33,45 @@ Refusal whyNotReachable(const Conn &conn) {
     return endpointFailure(conn, static_cast<OvraPlatform::CredError>(request.GetError()));
 }
 
-/// Asks the relay service once more, to learn why it named no endpoint.
-Refusal relayFailure(const Conn &conn) {
-    const auto settings =
-        OvraPlatform::readFarlinkSettings().value_or(OvraPlatform::FarlinkSettings());
-    if (settings.host.empty()) {
+/// The relay service of this appliance.
+Expected<OvraPlatform::FarlinkSettings> relay() {
+    auto settings = OvraPlatform::readFarlinkSettings();
+    if (!settings || settings->host.empty()) {
         return failure(ExitCode::kNotReachable, "No relay service is set up on this appliance.",
                        "Run `ovradr farlink enable --server URL`.");
     }
-    const OvraPlatform::FarlinkReply reply =
-        OvraPlatform::FarlinkClient(settings).lookUp(conn.addr);
-    return failure(ExitCode::kNotReachable,
-                   targetText(conn) + " is not reached through " + settings.host +
-                       (reply ? "" : ": " + reply.error().text) + ".",
-                   "`ovradr farlink status`, here and over there, says more.");
+    return *settings;
 }
 
 } // namespace
 
 Expected<Conn> directEndpoint(const Conn &conn) {
-    const Conn direct = Conn::translateFarlink(conn);
-    return direct.isValid() ? Expected<Conn>(direct) : relayFailure(conn);
+    if (!conn.isFarlink()) {
+        return conn;
+    }
+    return relay().and_then([&conn](const auto &) {
+        const Conn direct = Conn::translateFarlink(conn);
+        return direct.isValid()
+                   ? Expected<Conn>(direct)
+                   : failure(ExitCode::kUsage, targetText(conn) + " cannot be an alias.",
+                             "An alias has 3 to 63 letters, digits and inner hyphens.");
+    });
+}
+
+Expected<Conn> placeOf(const Conn &conn) {
+    if (!conn.isFarlink()) {
+        return conn;
+    }
+    return relay().and_then([&conn](const auto &settings) -> Expected<Conn> {
+        const auto place = OvraPlatform::FarlinkClient(settings).lookUp(conn.addr);
+        if (place) {
+            return Conn::https(place->host, place->port);
+        }
+        return failure(ExitCode::kNotReachable,
+                       targetText(conn) + " is not reached through " + settings.host + ": " +
+                           place.error().text + ".",
+                       "`ovradr farlink status`, here and over there, says more.");
+    });
 }
 
 Expected<void> probeEndpoint(const Conn &conn) {

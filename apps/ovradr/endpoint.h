@@ -9,9 +9,12 @@
 
 namespace Ovradr {
 
-/// The endpoint to connect to: for a relay endpoint what the relay service names now, any other
-/// unchanged.
+/// The endpoint as the senders use it: for a relay endpoint the host name of its alias, any other
+/// unchanged. Nobody is asked.
 [[nodiscard]] Expected<OvraDRNode::Conn> directEndpoint(const OvraDRNode::Conn &conn);
+
+/// Where to connect to: for a relay endpoint what the relay service names now, any other unchanged.
+[[nodiscard]] Expected<OvraDRNode::Conn> placeOf(const OvraDRNode::Conn &conn);
 
 /// Probes a direct endpoint, at most 10 seconds and 5 more to learn why it does not answer. All
 /// processes share the verdict.

@@ -6,7 +6,6 @@
 #include <ovradrcore/json.h>
 #include <ovradrcore/response.h>
 #include <ovraplatform/api_errors.h>
-#include <ovraplatform/cred_errors.h>
 
 #include <unistd.h>
 
@@ -26,6 +25,7 @@ constexpr std::array kExitNames = {
 };
 
 namespace ERR = OvraDRCore::ERR;
+using OvraPlatform::CredError;
 namespace APIError = OvraPlatform::APIError;
 
 struct ErrorEntry {
@@ -188,6 +188,31 @@ Refusal failure(ExitCode exit, const std::string &message, const std::string &hi
         exit, number, kExitNames.at(static_cast<std::size_t>(number)), message, hint, {}, {}});
 }
 
+ExitCode exitOf(CredError error) {
+    switch (error) {
+    case CredError::kBadArgument:
+        return ExitCode::kUsage;
+    case CredError::kNoPermission:
+        return ExitCode::kNotPermitted;
+    case CredError::kCannotConnect:
+    case CredError::kConnectionLost:
+    case CredError::kTimedOut:
+    case CredError::kHttpStatus:
+    case CredError::kReplyBroken:
+    case CredError::kReplyTooLarge:
+    case CredError::kTlsTooOld:
+        return ExitCode::kNotReachable;
+    case CredError::kCertificateChanged:
+    case CredError::kNotTrusted:
+        return ExitCode::kCertificate;
+    case CredError::kTrustUnavailable:
+    case CredError::kTrustLost:
+        return ExitCode::kNotSetUp;
+    default:
+        return ExitCode::kFailed;
+    }
+}
+
 Refusal storeFailure(ExitCode exit, const std::string &sentences) {
     const std::size_t end = sentences.find(". ");
     return failure(exit, sentences.substr(0, end == std::string::npos ? end : end + 1),
@@ -204,6 +229,9 @@ Refusal failureOf(int code, const Json::Value &detail) {
                   "Error " + std::to_string(code), kSystemLog};
     if (entry != kErrors.end()) {
         found = {entry->exit, code, entry->name, entry->message, entry->hint};
+    }
+    if (code == ERR::kCredLibrary && detail.isInt()) {
+        found.exit = exitOf(static_cast<CredError>(detail.asInt()));
     }
     addDetail(found, saysItAll(code) ? "" : detailText(code, detail));
     return Refusal(found);

@@ -2,6 +2,7 @@
 #pragma once
 
 #include <ovradrcore/err_recorder.h>
+#include <ovraplatform/cred_errors.h>
 
 #include <json/value.h>
 #include <tl/expected.hpp>
@@ -54,6 +55,9 @@ using Refusal = tl::unexpected<Failure>;
 
 /// A failure found by this program itself.
 Refusal failure(ExitCode exit, const std::string &message, const std::string &hint);
+
+/// The exit code for an error of the credential request library.
+ExitCode exitOf(OvraPlatform::CredError error);
 
 /// Why a store of this appliance cannot be used.
 /// \param sentences  the first one says what is wrong, the others what to do

@@ -40,10 +40,9 @@ void addFingerprintOption(CLI::App &command, std::string &fingerprint) {
         ->check(checkFingerprint);
 }
 
-Expected<Conn> trustedEndpoint(const Conn &conn, const std::string &fingerprint) {
-    return directEndpoint(conn).and_then([&fingerprint](const Conn &direct) {
-        return trustPeer(direct, fingerprint).map([&direct] { return direct; });
-    });
+Expected<void> trustedEndpoint(const Conn &conn, const std::string &fingerprint) {
+    return directEndpoint(conn).and_then(
+        [&fingerprint](const Conn &direct) { return trustPeer(direct, fingerprint); });
 }
 
 Expected<void> logIn(const RemoteLogin &login, const std::string &host,

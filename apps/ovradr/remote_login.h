@@ -31,13 +31,11 @@ CLI::Option *addRemoteLoginOptions(CLI::App &command, RemoteLogin &login);
 /// --fingerprint; `fingerprint` must outlive `command`.
 void addFingerprintOption(CLI::App &command, std::string &fingerprint);
 
-/// Resolves an endpoint and makes sure that its key is trusted before anything secret is sent to
-/// it.
+/// Makes sure that the key of an endpoint is trusted before anything secret is sent to it.
 /// \param conn         may be a relay endpoint
 /// \param fingerprint  the required key, or ""
-/// \return the direct endpoint
-[[nodiscard]] Expected<OvraDRNode::Conn> trustedEndpoint(const OvraDRNode::Conn &conn,
-                                                         const std::string &fingerprint);
+[[nodiscard]] Expected<void> trustedEndpoint(const OvraDRNode::Conn &conn,
+                                             const std::string &fingerprint);
 
 /// Logs in; returns the library's error code, 0 on success.
 using LoginAttempt = std::function<int(const std::string &password, const std::string &code)>;

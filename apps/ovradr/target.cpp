@@ -3,6 +3,7 @@
 
 #include <ovrabase/address.h>
 #include <ovrabase/number.h>
+#include <ovraplatform/peer_trust.h>
 
 #include <optional>
 #include <string_view>
@@ -80,7 +81,10 @@ std::string targetText(const Conn &conn) {
     if (conn.isFarlink()) {
         return "flk:" + conn.addr;
     }
-    return conn.protocol + "://" + OvraBase::joinHostPort(conn.addr, conn.port);
+    const std::string known = OvraPlatform::trustKey(conn.protocol, conn.addr, conn.port);
+    return known.starts_with("flk:")
+               ? known
+               : conn.protocol + "://" + OvraBase::joinHostPort(conn.addr, conn.port);
 }
 
 } // namespace Ovradr

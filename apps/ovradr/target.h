@@ -18,8 +18,7 @@ inline constexpr int kDefaultHttpsPort = 5001;
 /// lost silently.
 [[nodiscard]] Expected<OvraDRNode::Conn> parseTarget(const std::string &text);
 
-/// The endpoint as parseTarget() reads it, always with its port; for a direct endpoint also the
-/// name under which its key is stored.
+/// The endpoint as parseTarget() reads it, always with its port; for an alias without one.
 std::string targetText(const OvraDRNode::Conn &conn);
 
 } // namespace Ovradr

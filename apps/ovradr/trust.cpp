@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "trust.h"
 
+#include "endpoint.h"
 #include "output.h"
 #include "prompt.h"
 #include "target.h"
@@ -20,29 +21,6 @@ using OvraPlatform::CredError;
 using OvraPlatform::PeerIdentity;
 using OvraPlatform::TrustVerdict;
 
-ExitCode exitOf(CredError error) {
-    switch (error) {
-    case CredError::kBadArgument:
-        return ExitCode::kUsage;
-    case CredError::kNoPermission:
-        return ExitCode::kNotPermitted;
-    case CredError::kCannotConnect:
-    case CredError::kConnectionLost:
-    case CredError::kTimedOut:
-    case CredError::kHttpStatus:
-    case CredError::kReplyBroken:
-    case CredError::kReplyTooLarge:
-    case CredError::kTlsTooOld:
-        return ExitCode::kNotReachable;
-    case CredError::kCertificateChanged:
-        return ExitCode::kCertificate;
-    case CredError::kTrustUnavailable:
-        return ExitCode::kNotSetUp;
-    default:
-        return ExitCode::kFailed;
-    }
-}
-
 Refusal keyFailure(const Conn &conn, const PeerIdentity &identity, const std::string &what,
                    const std::string &hint) {
     return failure(
@@ -53,29 +31,59 @@ Refusal keyFailure(const Conn &conn, const PeerIdentity &identity, const std::st
 Refusal changedKey(const Conn &conn, const PeerIdentity &identity) {
     return keyFailure(conn, identity, "is not the one that was trusted for it",
                       "Somebody may be in between. When you know that the key was changed, run "
-                      "`ovradr conn forget " +
-                          targetText(conn) + "` and try again.");
+                      "`ovradr conn trust " +
+                          targetText(conn) + "`.");
 }
 
-bool askWhetherToTrust(const Conn &conn, const PeerIdentity &identity) {
-    std::fprintf(stderr, "The key of %s is not known yet:\n  %s\n",
-                 printable(targetText(conn)).c_str(), identity.fingerprint.c_str());
-    return confirm("`ovradr conn local` over there shows the same. Trust this key?");
-}
-
-Expected<void> pin(const Conn &conn, const PeerIdentity &identity) {
-    switch (OvraPlatform::expectFingerprint(conn.protocol, conn.addr, conn.port,
-                                            identity.fingerprint)) {
+/// What is known of an endpoint whose key a person has to judge.
+const char *standing(TrustVerdict verdict) {
+    switch (verdict) {
     case TrustVerdict::kTrusted:
-        return {};
+        return "is trusted already";
+    case TrustVerdict::kForgotten:
+        return "was forgotten";
+    case TrustVerdict::kLost:
+        return "may have been lost with the file of trusted keys";
     case TrustVerdict::kDifferent:
-        return changedKey(conn, identity);
+    case TrustVerdict::kVouched:
+        return "is another one than before";
     default:
-        return endpointFailure(conn, CredError::kTrustUnavailable);
+        return "is not known yet";
     }
 }
 
 } // namespace
+
+bool askWhetherToTrust(const Conn &conn, const PeerIdentity &identity) {
+    std::fprintf(stderr,
+                 "The key of %s %s. It shows now:\n  %s\n"
+                 "Compare that with what `ovradr conn local` prints on that appliance.\n",
+                 printable(targetText(conn)).c_str(), standing(identity.pinned),
+                 identity.fingerprint.c_str());
+    return confirm("Is it the same?");
+}
+
+Refusal nobodyToAsk(const Conn &conn, const PeerIdentity &identity) {
+    return keyFailure(conn, identity,
+                      std::string(standing(identity.pinned)) + ", and nobody can be asked",
+                      "Compare it with what `ovradr conn local` shows over there, and give it "
+                      "with --fingerprint.");
+}
+
+Refusal notNamed(const Conn &conn, const PeerIdentity &identity) {
+    return keyFailure(conn, identity, "is not the one that --fingerprint names",
+                      "Do not go on before you know why.");
+}
+
+Refusal notTrusted(const Conn &conn, const PeerIdentity &identity) {
+    return keyFailure(conn, identity, "was not trusted", "Nothing was sent to it.");
+}
+
+std::string trustedValue(const PeerIdentity &identity, const std::string &expected) {
+    return expected.empty() && identity.acceptedBySystem
+               ? std::string(OvraPlatform::TrustStore::kSystem)
+               : identity.fingerprint;
+}
 
 std::string checkFingerprint(const std::string &text) {
     return OvraBase::isFingerprint(text) ? ""
@@ -83,6 +91,12 @@ std::string checkFingerprint(const std::string &text) {
 }
 
 Refusal endpointFailure(const Conn &conn, CredError error) {
+    const Expected<Conn> relayed = parseTarget(targetText(conn));
+    if (error == CredError::kCannotConnect && relayed && relayed->isFarlink()) {
+        if (const auto place = placeOf(*relayed); !place) {
+            return Refusal(place.error()); // the relay service knows more
+        }
+    }
     // The sentence of the library says what is wrong and, behind a colon, what to do.
     const std::string text = OvraPlatform::credErrorText(static_cast<int>(error));
     const std::size_t colon = text.find(": ");
@@ -96,20 +110,22 @@ Refusal endpointFailure(const Conn &conn, CredError error) {
 }
 
 std::string trustWord(const PeerIdentity &identity) {
-    if (identity.acceptedBySystem) {
-        return "system";
+    if (identity.isTrusted()) {
+        return identity.pinned == TrustVerdict::kTrusted ? "pinned" : "system";
+    }
+    if (identity.isChanged()) {
+        return "changed";
     }
     switch (identity.pinned) {
-    case TrustVerdict::kTrusted:
-        return "pinned";
-    case TrustVerdict::kUnknown:
-        return "unknown";
-    case TrustVerdict::kDifferent:
-        return "changed";
+    case TrustVerdict::kForgotten:
+        return "forgotten";
+    case TrustVerdict::kLost:
+        return "lost";
     case TrustVerdict::kUnavailable:
-        break;
+        return "unavailable";
+    default:
+        return "unknown";
     }
-    return "unavailable";
 }
 
 std::string trustText(const PeerIdentity &identity) {
@@ -123,7 +139,16 @@ std::string trustText(const PeerIdentity &identity) {
     if (word == "unknown") {
         return "not yet";
     }
-    return word == "changed" ? "no, another key is known" : "the known keys cannot be read";
+    if (word == "changed") {
+        return identity.pinned == TrustVerdict::kVouched
+                   ? "no, this system's certificates vouched for it before and do not now"
+                   : "no, another key is known";
+    }
+    if (word == "forgotten") {
+        return "no, its key was forgotten";
+    }
+    return word == "lost" ? "no, the file of trusted keys is damaged or missing"
+                          : "the known keys cannot be read";
 }
 
 Expected<void> trustPeer(const Conn &conn, const std::string &expected) {
@@ -134,27 +159,33 @@ Expected<void> trustPeer(const Conn &conn, const std::string &expected) {
     }
     const PeerIdentity &identity = *met;
     if (!expected.empty() && identity.fingerprint != expected) {
-        return keyFailure(conn, identity, "is not the one that --fingerprint names",
-                          "Do not go on before you know why.");
+        return notNamed(conn, identity);
     }
-    if (identity.acceptedBySystem || identity.pinned == TrustVerdict::kTrusted) {
-        return {};
-    }
-    if (identity.pinned == TrustVerdict::kDifferent) {
+    if (identity.isChanged()) {
         return changedKey(conn, identity);
     }
     if (identity.pinned == TrustVerdict::kUnavailable) {
         return endpointFailure(conn, CredError::kTrustUnavailable);
     }
+    // A key that is named is pinned, whoever else vouches for it.
+    if (identity.pinned == TrustVerdict::kTrusted || (expected.empty() && identity.isTrusted())) {
+        return {};
+    }
     if (expected.empty() && !isInteractive()) {
-        return keyFailure(conn, identity, "is not trusted yet, and nobody can be asked",
-                          "Compare it with what `ovradr conn local` shows over there, and give it "
-                          "with --fingerprint.");
+        return nobodyToAsk(conn, identity);
     }
     if (expected.empty() && !askWhetherToTrust(conn, identity)) {
-        return keyFailure(conn, identity, "was not trusted", "Nothing was sent to it.");
+        return notTrusted(conn, identity);
     }
-    return pin(conn, identity);
+    switch (OvraPlatform::trustEndpoint(conn.protocol, conn.addr, conn.port,
+                                        trustedValue(identity, expected))) {
+    case TrustVerdict::kTrusted:
+        return {};
+    case TrustVerdict::kDifferent:
+        return changedKey(conn, identity);
+    default:
+        return endpointFailure(conn, CredError::kTrustUnavailable);
+    }
 }
 
 } // namespace Ovradr

@@ -26,9 +26,22 @@ std::string trustText(const OvraPlatform::PeerIdentity &identity);
 /// The same as one word for scripts.
 std::string trustWord(const OvraPlatform::PeerIdentity &identity);
 
+/// Shows a person the key of an endpoint, which nobody has checked, and asks whether it is the one
+/// that the other appliance shows. Only where isInteractive().
+bool askWhetherToTrust(const OvraDRNode::Conn &conn, const OvraPlatform::PeerIdentity &identity);
+/// What a person's consent is kept as: the key, or that the system's certificates vouch for it.
+/// \param expected  the key that the person named, or ""
+std::string trustedValue(const OvraPlatform::PeerIdentity &identity, const std::string &expected);
+
+/// Why a key is not trusted: a person is needed; it is not the named one; the person said no.
+Refusal nobodyToAsk(const OvraDRNode::Conn &conn, const OvraPlatform::PeerIdentity &identity);
+Refusal notNamed(const OvraDRNode::Conn &conn, const OvraPlatform::PeerIdentity &identity);
+Refusal notTrusted(const OvraDRNode::Conn &conn, const OvraPlatform::PeerIdentity &identity);
+
 /// Makes sure that the key of a direct endpoint is trusted before anything secret is sent to it. A
-/// key seen for the first time is trusted if it is the expected one, or if the user at the terminal
-/// confirms it.
+/// key that is not known is trusted if it is the expected one, or if the user at the terminal
+/// confirms it; an expected one is pinned whoever else vouches for it. Another key than the known
+/// one is refused.
 /// \param expected  the required fingerprint, or ""
 /// \return success if the key is trusted, else what is in the way.
 [[nodiscard]] Expected<void> trustPeer(const OvraDRNode::Conn &conn, const std::string &expected);

@@ -9,6 +9,7 @@
 #include <ovradrcore/log.h>
 #include <ovraplatform/api_errors.h>
 #include <ovraplatform/client_scope.h>
+#include <ovraplatform/peer_keys.h>
 
 #include <chrono>
 #include <future>
@@ -284,6 +285,8 @@ void CallDispatcher::noteRefusal(const Call &call, int code) {
 
 void CallDispatcher::run(const Call &call) {
     const OvraPlatform::ClientScope scope(call.caller.address);
+    const OvraPlatform::PeerKeyScope peer(call.caller.administrator ? call.wire.params
+                                                                    : Json::Value());
     const auto begun = std::chrono::steady_clock::now();
     const Json::Value reply = registry_.dispatch(call.wire, call.caller);
     note(call, reply, std::chrono::steady_clock::now() - begun);

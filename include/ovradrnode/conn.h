@@ -59,8 +59,8 @@ public:
     static Conn localHttps(const std::string &addr);
     /// Invalid if the relay service is not enabled.
     static Conn localFarlink();
-    /// The direct endpoint behind a relay endpoint (queries the relay service); any other endpoint
-    /// is returned unchanged. Invalid if the relay does not know it.
+    /// The direct endpoint behind a relay endpoint, as the credential library names it; any other
+    /// endpoint is returned unchanged. Invalid if there is none.
     static Conn translateFarlink(const Conn &conn);
 
     std::string addr;

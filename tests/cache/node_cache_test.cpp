@@ -25,6 +25,7 @@ class NodeInfo : public TwoNodes {
 protected:
     NodeInfo() {
         stopClock();
+        other.trust();
         addNodeCred("c1", "s1");
         addCred("node_cred", "n2", "d1", "https", other.port(), "z1");
         addCred("node_cred", "n2", "d2", "https", other.port(), "z2");

@@ -28,6 +28,7 @@ public:
 class Dispatch : public TwoNodes {
 protected:
     Dispatch() {
+        other.trust();
         addNodeCred("c1", "s1");
         addNodeCred("c2", "s2");
         addCred("node_cred", "n2", "c3", "https", other.port(), "s3");

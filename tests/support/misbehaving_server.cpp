@@ -7,6 +7,7 @@
 #include <linux/filter.h>
 #include <netinet/in.h>
 #include <netinet/tcp.h>
+#include <openssl/pem.h>
 #include <openssl/ssl.h>
 #include <pthread.h>
 #include <sys/socket.h>
@@ -15,7 +16,9 @@
 #include <algorithm>
 #include <cerrno>
 #include <csignal>
+#include <cstdio>
 #include <cstdlib>
+#include <memory>
 #include <optional>
 #include <stdexcept>
 #include <thread>
@@ -269,6 +272,18 @@ std::string MisbehavingServer::fingerprint() const {
     EVP_EncodeBlock(base64, digest, static_cast<int>(digestSize));
     const std::string text = reinterpret_cast<const char *>(base64);
     return "SHA256:" + text.substr(0, text.find('='));
+}
+
+void MisbehavingServer::addTo(const std::string &folder) const {
+    const std::lock_guard lock(mutex_);
+    X509 *certificate = certificate_->certificate();
+    char name[16];
+    std::snprintf(name, sizeof name, "/%08lx.0", X509_subject_name_hash(certificate));
+    const std::unique_ptr<FILE, int (*)(FILE *)> file(std::fopen((folder + name).c_str(), "w"),
+                                                      std::fclose);
+    if (!file || PEM_write_X509(file.get(), certificate) != 1) {
+        throw std::runtime_error("no certificate for the system");
+    }
 }
 
 void MisbehavingServer::answerOnce(Answer answer) {

@@ -110,6 +110,8 @@ public:
     /// Computes every answer from now on.
     void answerWith(Responder responder);
 
+    /// Adds its certificate to a folder of certificates that a system trusts.
+    void addTo(const std::string &folder) const;
     /// A new key and certificate for future connections.
     void changeCertificate();
     /// From now on accepts connections and sends nothing on them, not even TLS.

@@ -62,6 +62,10 @@ private:
 /// A local node, and a remote one for which it has no credential.
 class TwoNodes : public LocalNode {
 protected:
+    TwoNodes() {
+        remote.trust();
+        log.clear();
+    }
     void addNodeCred(const std::string &credId, const std::string &session) {
         addCred("node_cred", "n1", credId, "https", remote.port(), session);
     }

@@ -2,6 +2,7 @@
 #include "support/remote_node.h"
 
 #include <ovradrcore/json.h>
+#include <ovraplatform/peer_trust.h>
 
 #include <unistd.h>
 
@@ -16,6 +17,10 @@ RemoteNode::RemoteNode()
     }) {
     unlink("/tmp/remote_node.seal");
     server.answerWith([this](const Received &received) { return respond(received); });
+}
+
+void RemoteNode::trust() const {
+    OvraPlatform::trustEndpoint("https", "127.0.0.1", port(), server.fingerprint());
 }
 
 std::optional<SealingDaemon::Reply> RemoteNode::prepared(const std::string &call) const {

@@ -21,6 +21,8 @@ public:
     RemoteNode();
 
     int port() const { return server.port(); }
+    /// Has this appliance know its key.
+    void trust() const;
     /// \param call  "method" or "session method"; "probe" for a bare request
     void answer(const std::string &call, const SealingDaemon::Reply &reply);
     void forgetAnswers();

@@ -19,7 +19,7 @@ void require(bool ok) {
 
 } // namespace
 
-TestCertificate::TestCertificate(const std::string &names)
+TestCertificate::TestCertificate(const std::string &names, long seconds)
     : key_(EVP_PKEY_Q_keygen(nullptr, nullptr, "EC", "P-256"), EVP_PKEY_free)
     , certificate_(X509_new(), X509_free) {
     require(key_ && certificate_);
@@ -30,7 +30,7 @@ TestCertificate::TestCertificate(const std::string &names)
     require(X509_set_version(made, X509_VERSION_3) == 1 && X509_set_issuer_name(made, name) == 1 &&
             ASN1_INTEGER_set(X509_get_serialNumber(made), 1) == 1 &&
             X509_gmtime_adj(X509_getm_notBefore(made), -kOneHour) != nullptr &&
-            X509_gmtime_adj(X509_getm_notAfter(made), kOneHour) != nullptr &&
+            X509_gmtime_adj(X509_getm_notAfter(made), seconds) != nullptr &&
             X509_set_pubkey(made, key_.get()) == 1);
     X509_EXTENSION *extension =
         X509V3_EXT_conf_nid(nullptr, nullptr, NID_subject_alt_name, names.c_str());

@@ -9,11 +9,13 @@
 
 namespace OvraTest {
 
-/// A fresh P-256 key with a self-signed certificate, valid for an hour.
+/// A fresh P-256 key with a self-signed certificate.
 class TestCertificate {
 public:
     /// \param names  as OpenSSL writes a subjectAltName, e.g. "DNS:localhost,IP:127.0.0.1"
-    explicit TestCertificate(const std::string &names = "DNS:localhost,IP:127.0.0.1");
+    /// \param seconds  how long it is valid from now on; negative: it has ended
+    explicit TestCertificate(const std::string &names = "DNS:localhost,IP:127.0.0.1",
+                             long seconds = 3600);
 
     EVP_PKEY *key() const { return key_.get(); }
     X509 *certificate() const { return certificate_.get(); }

@@ -8,6 +8,7 @@
 #include <ovradrcore/log.h>
 #include <ovradrnode/node_db.h>
 #include <ovradrnode/sender.h>
+#include <ovraplatform/peer_trust.h>
 #include <ovraplatform/session_store.h>
 
 #include <gtest/gtest.h>
@@ -85,6 +86,7 @@ TEST(Fork, AChildOfAProcessWithThreadsAtWorkDoesWhatItsParentCan) {
     std::atomic<int> &step = shared();
     const OtherProcess remote([&step] {
         const MisbehavingServer server({.tls = true});
+        OvraPlatform::trustEndpoint("https", "127.0.0.1", server.port(), server.fingerprint());
         step = server.port();
         return pause();
     });

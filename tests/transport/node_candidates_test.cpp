@@ -51,6 +51,7 @@ TEST_F(NodeCandidates, AreListedAsTheSenderThenTriesThem) {
          "secret-c1 info"},
     };
     RemoteNode other; // the endpoint of c1
+    other.trust();
     for (const char *id : {"c1", "c2", "t1"}) {
         addCred(*id == 't' ? "temp_cred" : "node_cred", "n1", id, "https",
                 (std::string(id) == "c1" ? other : remote).port(), std::string("secret-") + id);

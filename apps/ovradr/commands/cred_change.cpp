@@ -119,7 +119,7 @@ Expected<std::string> expectedKey(const SetOptions &options, const Conn &present
     if (!met) {
         return endpointFailure(direct, met.error());
     }
-    const std::string known = targetText(Conn::translateFarlink(present));
+    const std::string known = OvraPlatform::trustKey(present.protocol, present.addr, present.port);
     const bool same = OvraPlatform::TrustStore().lookup(known, met->fingerprint) ==
                       OvraPlatform::TrustVerdict::kTrusted;
     return same ? met->fingerprint : "";
@@ -189,9 +189,8 @@ Outcome set(const SetOptions &options) {
     if (moves) {
         return move(options, record, *conn);
     }
-    const Expected<Conn> direct = trustedEndpoint(*conn, options.fingerprint);
-    if (!direct) {
-        return Refusal(direct.error());
+    if (const auto trusted = trustedEndpoint(*conn, options.fingerprint); !trusted) {
+        return Refusal(trusted.error());
     }
     DRNodeCredSet flow(record.credId);
     bool proved = false;
@@ -199,7 +198,7 @@ Outcome set(const SetOptions &options) {
         proved = flow.setCred(*conn, options.login.account, password, code);
         return proved ? 0 : flow.GetErrCode();
     };
-    if (const auto tried = logIn(options.login, direct->addr, attempt); !tried) {
+    if (const auto tried = logIn(options.login, conn->addr, attempt); !tried) {
         return Refusal(tried.error());
     }
     return proved ? runUpdate(flow, record, *conn, options) : setFailure(flow, *conn);

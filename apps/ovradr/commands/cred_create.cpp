@@ -87,14 +87,14 @@ Outcome runFlow(CredCreate &flow, const Conn &conn, const CreateOptions &options
     return report;
 }
 
-Outcome createByAccount(const CreateOptions &options, const Conn &conn, const Conn &direct) {
+Outcome createByAccount(const CreateOptions &options, const Conn &conn) {
     const std::unique_ptr<CredCreate> flow = newFlow(options.temporary);
     bool proved = false;
     const auto attempt = [&](const std::string &password, const std::string &code) {
         proved = flow->setCred(conn, options.login.account, password, code);
         return proved ? 0 : flow->GetErrCode();
     };
-    if (const auto tried = logIn(options.login, direct.addr, attempt); !tried) {
+    if (const auto tried = logIn(options.login, conn.addr, attempt); !tried) {
         return Refusal(tried.error());
     }
     return proved ? runFlow(*flow, conn, options) : flowFailure(*flow, conn);
@@ -157,11 +157,10 @@ Outcome create(const CreateOptions &options) {
     if (const auto usable = checkNodeDatabase(); !usable) {
         return Refusal(usable.error());
     }
-    const Expected<Conn> direct = trustedEndpoint(*conn, options.fingerprint);
-    if (!direct) {
-        return Refusal(direct.error());
+    if (const auto trusted = trustedEndpoint(*conn, options.fingerprint); !trusted) {
+        return Refusal(trusted.error());
     }
-    return options.sessionFile.empty() ? createByAccount(options, *conn, *direct)
+    return options.sessionFile.empty() ? createByAccount(options, *conn)
                                        : createBySession(options, *conn);
 }
 

@@ -10,9 +10,11 @@
 #include <ovracore/ovracore.h>
 #include <ovradrcore/util.h>
 #include <ovradrnode/dr_node.h>
+#include <ovradrnode/node_db.h>
 #include <ovranet/ovranet.h>
 #include <ovraplatform/appliance.h>
 #include <ovraplatform/sealed_box.h>
+#include <ovraplatform/trust_store.h>
 
 #include <unistd.h>
 
@@ -166,6 +168,26 @@ Expected<SetUpStep> provisionCertificate() {
     return SetUpStep{"HTTPS certificate", *made, kTlsCertificateFile};
 }
 
+/// Makes the file of trusted keys, unless it may have been lost: then only a person trusts anew.
+Expected<SetUpStep> provisionTrust() {
+    using OvraPlatform::kKnownEndpointsFile;
+    OvraPlatform::TrustStore store;
+    const std::string problem = store.problem();
+    std::vector<OvraDRNode::DRNode> creds;
+    OvraDRNode::DRNodeDB::List(creds, OvraDRNode::DRNodeDB::CRED_TYPE_NODE |
+                                          OvraDRNode::DRNodeDB::CRED_TYPE_TEMP);
+    if (!problem.empty() && !creds.empty()) {
+        return SetUpStep{"trusted keys", false,
+                         std::string(kKnownEndpointsFile) + ": " + problem +
+                             ", though this node has credentials; see `ovradr doctor`"};
+    }
+    if (!store.create()) {
+        return failure(ExitCode::kNotSetUp, std::string(kKnownEndpointsFile) + " cannot be used.",
+                       "Correct or restore it; the system log says more.");
+    }
+    return SetUpStep{"trusted keys", !problem.empty(), kKnownEndpointsFile};
+}
+
 Expected<SetUpStep> provisionNodeId() {
     const std::string file = std::string(OvraPlatform::kConfigDir) + "/node.info";
     const bool there = OLIBCFileExist(file.c_str()) != 0;
@@ -221,6 +243,7 @@ Outcome setUp(const Settings &settings) {
         provisionTlsKey,
         provisionCertificate,
         provisionSealKey,
+        provisionTrust,
         provisionNodeId,
         provisionScripts,
     };

@@ -6,6 +6,7 @@
 #include <ovradrcore/err_recorder.h>
 #include <ovradrnode/node.h>
 #include <ovraplatform/api_errors.h>
+#include <ovraplatform/farlink.h>
 
 #include <algorithm>
 #include <string>
@@ -52,7 +53,10 @@ std::string downloadableUrl(const std::string &url) {
     Conn conn(url.substr(host + 3, colon - host - 3), url.substr(0, host), 0);
     std::string port = url.substr(colon + 1, path - colon - 1);
     if (conn.isFarlink()) {
-        conn = Conn::translateFarlink(conn);
+        const auto settings =
+            OvraPlatform::readFarlinkSettings().value_or(OvraPlatform::FarlinkSettings());
+        const auto place = OvraPlatform::FarlinkClient(settings).lookUp(conn.addr);
+        conn = place ? Conn::https(place->host, place->port) : Conn();
         port = std::to_string(conn.port);
     }
     if (conn.protocol != "http" && conn.protocol != "https") {

@@ -107,7 +107,8 @@ public:
 
 class OVRA_PLATFORM_EXPORT CredRequestFarlink {
 public:
-    /// Asks the relay service where `alias` can be reached now.
+    /// Names the endpoint of an alias of the relay. Nobody is asked: where the alias is reached is
+    /// looked up when a request connects, and its key is known by the alias.
     /// \param info     receives an object with "host", "protocol" and "port"
     /// \param options  reserved, null
     /// \return non-zero on success.

@@ -20,7 +20,7 @@ const char *credErrorText(int error) {
         return "cannot connect: check name, address and port, and that the appliance runs";
     case CredError::kCertificateChanged:
         return "the endpoint's key is not the one trusted for it: find out why it changed, then "
-               "forget the old one";
+               "run ovradr conn trust";
     case CredError::kReplyTooLarge:
         return "the reply is too large: ask for less at once";
     case CredError::kReplyBroken:
@@ -46,6 +46,12 @@ const char *credErrorText(int error) {
                "https, and check whether the request was carried out";
     case CredError::kTrustUnavailable:
         return "the file of trusted keys cannot be read or written: the system log says why";
+    case CredError::kNotTrusted:
+        return "the endpoint's key is not trusted yet, or no longer: run ovradr conn trust, and "
+               "compare it with the one shown on that appliance";
+    case CredError::kTrustLost:
+        return "the file of trusted keys is missing or damaged and may have had a key of the "
+               "endpoint: run ovradr doctor, then ovradr conn trust";
     }
     return "unknown error";
 }

@@ -72,8 +72,10 @@ CredExpected<Json::Value> login(const OVRACred &cred, const std::string &otp, OV
     if (const auto device = OvraPlatform::deviceToken(*endpoint, cred.account); !device.empty()) {
         call.params["device_token"] = device.get();
     }
-    return OvraPlatform::callWebAPI(*endpoint, call,
-                                    {std::chrono::steady_clock::now() + kLoginTime, false})
+    OvraPlatform::WebCallOptions options{std::chrono::steady_clock::now() + kLoginTime};
+    options.reuse = false;
+    options.firstContact = true;
+    return OvraPlatform::callWebAPI(*endpoint, call, options)
         .and_then([&sess](const WebReply &reply) -> CredExpected<Json::Value> {
             Json::Value document;
             const std::string sid = reply.response.getDataFieldtoStr("sid");

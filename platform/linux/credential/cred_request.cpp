@@ -3,7 +3,7 @@
 
 #include "credential/cred_objects.h"
 #include "http/web_call.h"
-#include "relay/alias_place.h"
+#include "trust/peer_keys.h"
 
 #include <ovrabase/secret.h>
 #include <ovradrcore/log.h>
@@ -29,16 +29,12 @@ constexpr int kModeRequest = 0;
 constexpr int kModeProbe = 2;
 constexpr int kPlain = 0;
 constexpr int kSealed = 2;
-constexpr char kRelayWord[] = "flk";
-constexpr int kHttps = 443; // until the alias is looked up
 
 } // namespace
 
 struct CredRequest::Impl {
     std::optional<Endpoint> endpoint;
     std::string url;
-    std::string path;
-    std::string alias; ///< to be looked up; then `endpoint` and `url` are of the last look-up
     std::optional<WireCall> call;
     long seconds = kDefaultSeconds;
     int encryptMode = kPlain;
@@ -81,35 +77,9 @@ struct CredRequest::Impl {
             });
     }
 
-    bool setEndpoint(const std::string &protocol, const std::string &address, int port) {
-        auto made = Endpoint::make(protocol, address, port);
-        auto where = made ? made->url(path) : std::nullopt;
-        if (!where) {
-            return false;
-        }
-        endpoint = std::move(made);
-        url = std::move(*where);
-        return true;
-    }
-
-    CredExpected<void> findAlias() {
-        return OvraPlatform::findAlias(alias, std::chrono::seconds(seconds))
-            .and_then([this](const OvraPlatform::AliasPlace &place) -> CredExpected<void> {
-                if (setEndpoint("https", place.host, place.port)) {
-                    return {};
-                }
-                return tl::unexpected(CredError::kCannotConnect);
-            });
-    }
-
     CredExpected<void> process(bool reuse, int mode) {
         const OvraPlatform::Deadline deadline =
             std::chrono::steady_clock::now() + std::chrono::seconds(seconds);
-        if (!alias.empty()) {
-            if (const auto found = findAlias(); !found) {
-                return found;
-            }
-        }
         switch (mode) {
         case kModeRequest:
             return send(reuse, deadline);
@@ -133,12 +103,13 @@ CredRequest::~CredRequest() = default;
 int CredRequest::SetURL(const std::string &protocol, const std::string &address, int port,
                         const std::string &path) {
     try {
-        const bool relayed = protocol == kRelayWord;
-        impl_->path = path;
-        if (!impl_->setEndpoint(relayed ? "https" : protocol, address, relayed ? kHttps : port)) {
+        auto endpoint = Endpoint::of(protocol, address, port);
+        auto url = endpoint ? endpoint->url(path) : std::nullopt;
+        if (!url) {
             return impl_->refuse(CredError::kBadArgument);
         }
-        impl_->alias = relayed ? address : "";
+        impl_->endpoint = std::move(endpoint);
+        impl_->url = std::move(*url);
         return 1;
     } catch (const std::exception &) {
         return impl_->refuse(CredError::kOutOfMemory);
@@ -191,6 +162,7 @@ int CredRequest::CreateWebAPIRequest(CredRequest &req, OVRACred *cred, OVRACredS
         call.params = params;
         if (sess != nullptr) {
             call.sid = sess->token.get();
+            OvraPlatform::nameOwnKeys(call.params);
         }
         return 1;
     } catch (const std::exception &) {

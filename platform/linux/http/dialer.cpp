@@ -1,6 +1,8 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "http/dialer.h"
 
+#include "relay/alias_place.h"
+
 #include <ovradrcore/cache.h>
 #include <ovradrcore/log.h>
 #include <ovradrcore/no_fork.h>
@@ -47,9 +49,8 @@ CredError errorOf(const OvraBase::Error &error) {
     return error.number == ETIMEDOUT ? CredError::kTimedOut : CredError::kCannotConnect;
 }
 
-} // namespace
-
-CredExpected<OvraBase::UniqueFd> dial(const Endpoint &endpoint, OvraBase::Deadline deadline) {
+CredExpected<OvraBase::UniqueFd> dialDirectly(const Endpoint &endpoint,
+                                              OvraBase::Deadline deadline) {
     using OvraBase::SocketAddress;
     const AddressCache cache(endpoint);
     std::string last;
@@ -79,6 +80,18 @@ CredExpected<OvraBase::UniqueFd> dial(const Endpoint &endpoint, OvraBase::Deadli
             OVRA_INFO("No connection to [%s]: [%s]", endpoint.key().c_str(), error.text.c_str());
             return errorOf(error);
         });
+}
+
+} // namespace
+
+CredExpected<OvraBase::UniqueFd> dial(const Endpoint &endpoint, OvraBase::Deadline deadline) {
+    const std::string alias = endpoint.alias();
+    if (alias.empty()) {
+        return dialDirectly(endpoint, deadline);
+    }
+    return findAlias(alias, deadline).and_then([deadline](const Endpoint &place) {
+        return dialDirectly(place, deadline);
+    });
 }
 
 } // namespace OvraPlatform

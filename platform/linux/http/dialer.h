@@ -9,7 +9,8 @@
 namespace OvraPlatform {
 
 /// A TCP connection to the endpoint, over whichever of its addresses accepts first. The one that
-/// worked is tried first the next time, by every process of the appliance.
+/// worked is tried first the next time, by every process of the appliance. For an alias the relay
+/// is asked now where it is reached.
 [[nodiscard]] CredExpected<OvraBase::UniqueFd> dial(const Endpoint &endpoint,
                                                     OvraBase::Deadline deadline);
 

@@ -1,6 +1,8 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "http/endpoint.h"
 
+#include "ovraplatform/farlink.h"
+
 #include <ovrabase/address.h>
 #include <ovrabase/number.h>
 
@@ -11,6 +13,9 @@ namespace OvraPlatform {
 namespace {
 
 constexpr std::size_t kMaxPath = 1024;
+constexpr char kRelayWord[] = "flk";
+constexpr std::string_view kAliasSuffix = ".farlink.alt";
+constexpr int kAliasPort = 443;
 
 bool isAlphanumeric(char c) {
     return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z') || (c >= '0' && c <= '9');
@@ -40,7 +45,31 @@ std::optional<Endpoint> Endpoint::make(const std::string &protocol, const std::s
     if (endpoint.host_.empty()) {
         return std::nullopt;
     }
+    if (endpoint.host_.ends_with(kAliasSuffix)) {
+        endpoint.port_ = kAliasPort;
+        return endpoint.isTls() && isFarlinkAlias(endpoint.alias()) ? std::optional(endpoint)
+                                                                    : std::nullopt;
+    }
     return endpoint;
+}
+
+std::optional<Endpoint> Endpoint::of(const std::string &protocol, const std::string &host,
+                                     int port) {
+    return protocol == kRelayWord ? make("https", hostOfAlias(host), kAliasPort)
+                                  : make(protocol, host, port);
+}
+
+std::string Endpoint::hostOfAlias(const std::string &alias) {
+    return OvraBase::toLower(alias).append(kAliasSuffix);
+}
+
+std::string Endpoint::alias() const {
+    return host_.ends_with(kAliasSuffix) ? host_.substr(0, host_.size() - kAliasSuffix.size()) : "";
+}
+
+std::string Endpoint::trustKey() const {
+    const std::string name = alias();
+    return name.empty() ? key() : std::string(kRelayWord) + ":" + name;
 }
 
 std::string Endpoint::key() const {

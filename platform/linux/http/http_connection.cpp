@@ -172,7 +172,10 @@ std::unique_ptr<HttpConnection> HttpConnection::open(const Endpoint &endpoint, P
 HttpConnection::HttpConnection(const Endpoint &endpoint, Purpose purpose)
     : endpoint_(endpoint)
     , purpose_(purpose)
-    , verifier_(endpoint, purpose == Purpose::kObserve)
+    , verifier_(endpoint, purpose == Purpose::kObserve ? CertificateVerifier::Mode::kObserve
+                          : purpose == Purpose::kFirstContact
+                              ? CertificateVerifier::Mode::kFirstContact
+                              : CertificateVerifier::Mode::kVerify)
     , handle_(curl_easy_init()) {}
 
 HttpConnection::~HttpConnection() {
@@ -328,12 +331,8 @@ CredExpected<HttpAnswer> HttpConnection::perform(const std::string &url, Deadlin
 }
 
 CredError HttpConnection::errorOf(CURLcode code) const {
-    const CertificateVerifier::Verdict verdict = verifier_.verdict();
-    if (verdict == CertificateVerifier::Verdict::kChanged) {
-        return CredError::kCertificateChanged;
-    }
-    if (verdict == CertificateVerifier::Verdict::kUnavailable) {
-        return CredError::kTrustUnavailable;
+    if (const CredError distrusted = verifier_.error(); distrusted != CredError::kNone) {
+        return distrusted;
     }
     if (attempt_.endedInSilence || code == CURLE_OPERATION_TIMEDOUT) {
         return attempt_.mayHaveArrived ? CredError::kUnanswered : CredError::kTimedOut;
@@ -428,10 +427,10 @@ int HttpConnection::onRequest(void *self, char *, char *, int, int) {
     if (attempt.count > kMaxAttempts || attempt.mayHaveArrived) {
         return CURL_PREREQFUNC_ABORT;
     }
-    if (connection->purpose_ == Purpose::kRequests && !connection->verifier_.pinNewKey()) {
+    if (connection->isForRequests() && !connection->verifier_.settle()) {
         return CURL_PREREQFUNC_ABORT;
     }
-    attempt.mayHaveArrived = connection->purpose_ == Purpose::kRequests;
+    attempt.mayHaveArrived = connection->isForRequests();
     attempt.socket = connection->socket_;
     attempt.delivered = deliveredBytes(attempt.socket);
     if (!connection->endsWhenSilent_) {

@@ -43,9 +43,11 @@ struct Upload {
 class HttpConnection {
 public:
     enum class Purpose {
-        kRequests, ///< the certificate is verified, new keys are pinned, the connection is kept
-        kProbe,    ///< the certificate is not checked; nothing secret may be sent
-        kObserve,  ///< the certificate is verified but passes anyway; nothing is sent
+        kRequests, ///< the certificate is verified, the connection is kept
+        /// As kRequests, but on the first connection the key of an unknown endpoint is pinned.
+        kFirstContact,
+        kProbe,   ///< the certificate is not checked; nothing secret may be sent
+        kObserve, ///< the certificate is verified but passes anyway; nothing is sent
     };
 
     /// Null if there is no memory.
@@ -100,6 +102,10 @@ private:
     static curl_socket_t onOpenSocket(void *self, curlsocktype type, curl_sockaddr *address);
     static int onSocketOptions(void *self, curl_socket_t socket, curlsocktype type);
     static int onCloseSocket(void *self, curl_socket_t socket);
+
+    bool isForRequests() const {
+        return purpose_ == Purpose::kRequests || purpose_ == Purpose::kFirstContact;
+    }
 
     Endpoint endpoint_;
     Purpose purpose_;

@@ -6,6 +6,7 @@
 #include "ovraplatform/api_errors.h"
 #include "seal/seal_key_cache.h"
 #include "seal/sealing.h"
+#include "trust/peer_keys.h"
 
 #include <ovrabase/secret.h>
 #include <ovradrcore/json.h>
@@ -77,7 +78,9 @@ CredExpected<std::string> post(const Endpoint &endpoint, const WireCall &call,
         connection = ConnectionPool::instance().take(endpoint, trust);
     }
     if (!connection) {
-        connection = HttpConnection::open(endpoint, HttpConnection::Purpose::kRequests);
+        connection = HttpConnection::open(endpoint, options.firstContact
+                                                        ? HttpConnection::Purpose::kFirstContact
+                                                        : HttpConnection::Purpose::kRequests);
     }
     if (!connection) {
         return tl::unexpected(CredError::kOutOfMemory);
@@ -101,21 +104,20 @@ CredExpected<WebReply> callPlain(const Endpoint &endpoint, const WireCall &call,
     return post(endpoint, call, options).and_then(readReply);
 }
 
-/// Over plain http the key itself must be the first one seen.
-CredExpected<void> judgeSealKey(const Endpoint &endpoint, const PublicKey &key) {
-    TrustStore store;
+/// Over plain http the key itself must be the trusted one.
+CredExpected<void> judgeSealKey(const Endpoint &endpoint, const PublicKey &key, bool firstContact) {
     const std::string fingerprint = fingerprintOf(key);
-    switch (store.pin(endpoint.key(), fingerprint)) {
-    case TrustVerdict::kTrusted:
-        return {};
-    case TrustVerdict::kDifferent:
-        OVRA_ERR("The key [%s] of [%s] is not the one trusted for it: find out why it changed, "
-                 "then forget the old one",
-                 fingerprint.c_str(), endpoint.key().c_str());
-        return tl::unexpected(CredError::kCertificateChanged);
-    default:
-        return tl::unexpected(CredError::kTrustUnavailable);
+    TrustStore store;
+    TrustVerdict verdict = store.lookup(endpoint.trustKey(), fingerprint);
+    if (verdict == TrustVerdict::kUnknown &&
+        (firstContact || isNamedByPeer(endpoint, fingerprint))) {
+        verdict = store.pin(endpoint.trustKey(), fingerprint);
     }
+    if (verdict == TrustVerdict::kTrusted) {
+        return {};
+    }
+    logDistrust(endpoint, fingerprint, verdict);
+    return tl::unexpected(errorOfTrust(verdict));
 }
 
 /// What an appliance says without the seal, because it could not open it.
@@ -182,8 +184,9 @@ private:
         }
         return fetchSealKey(endpoint_, options_)
             .and_then([this](const PublicKey &fetched) -> CredExpected<PublicKey> {
-                const auto judged =
-                    endpoint_.isTls() ? CredExpected<void>() : judgeSealKey(endpoint_, fetched);
+                const auto judged = endpoint_.isTls()
+                                        ? CredExpected<void>()
+                                        : judgeSealKey(endpoint_, fetched, options_.firstContact);
                 return judged.map([&fetched] { return fetched; });
             })
             .map([&](const PublicKey &fetched) {

@@ -17,6 +17,8 @@ struct WebCallOptions {
     bool reuse = true;   ///< a kept connection may carry it, and it may be kept
     bool sealed = false; ///< seal the parameters also where TLS protects them
     std::optional<Upload> upload;
+    /// Somebody logs in: the key of an endpoint that is unknown is trusted from now on.
+    bool firstContact = false;
 };
 
 struct WebReply {
@@ -26,7 +28,7 @@ struct WebReply {
 
 /// Calls a web API of a remote appliance and returns its reply document, opened if it was sealed.
 ///
-/// Over plain http every call is sealed to the key that the endpoint had at first contact. A call
+/// Over plain http every call is sealed to the key that is trusted for the endpoint. A call
 /// refused because the clocks differ, or because the appliance has a new key, is sealed again and
 /// sent once more.
 [[nodiscard]] CredExpected<WebReply> callWebAPI(const Endpoint &endpoint, const WireCall &call,

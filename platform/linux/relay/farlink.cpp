@@ -22,6 +22,8 @@ namespace {
 constexpr std::size_t kMinAlias = 3;
 constexpr std::size_t kMaxAlias = 63;
 constexpr std::chrono::seconds kAnswerTime{10};
+constexpr const char *kNoRelay = "no relay service is set up on this appliance; run ovradr farlink "
+                                 "enable, or use a direct endpoint";
 
 /// "" if the file has no such line.
 std::string setting(const char *key) {
@@ -29,6 +31,12 @@ std::string setting(const char *key) {
     const int length =
         OLIBCFileGetKeyValue(kFarlinkFile, key, value.data(), static_cast<int>(value.size()), 0);
     return length > 0 ? std::string(value.data(), static_cast<std::size_t>(length)) : std::string();
+}
+
+/// Whether it is reached directly.
+bool isServer(const FarlinkSettings &settings) {
+    const auto endpoint = Endpoint::make("https", settings.host, settings.port);
+    return endpoint && endpoint->alias().empty();
 }
 
 tl::unexpected<FarlinkFailure> noAnswer(CredError error) {
@@ -48,6 +56,21 @@ FarlinkReply verdictOn(WebReply reply) {
                                          CredError::kNone, code});
 }
 
+/// What the answer to a look-up says; never another alias.
+tl::expected<AliasPlace, FarlinkFailure> placeIn(const OvraDRCore::Response &reply,
+                                                 const FarlinkSettings &settings) {
+    const Json::Value port = reply.getDataField("port");
+    const std::string host = reply.getDataFieldtoStr("host");
+    const AliasPlace place{host.empty() ? settings.host : host, port.isInt() ? port.asInt() : 0};
+    const auto endpoint = Endpoint::make("https", place.host, place.port);
+    if (!endpoint || !endpoint->alias().empty()) {
+        return tl::unexpected(FarlinkFailure{"the answer of the relay service names no place where "
+                                             "the alias is reached: update the service",
+                                             CredError::kNone, 0});
+    }
+    return place;
+}
+
 } // namespace
 
 bool isFarlinkAlias(const std::string &text) {
@@ -63,10 +86,8 @@ tl::expected<FarlinkSettings, std::string> readFarlinkSettings() {
     settings.alias = setting(FarlinkSetting::kAlias);
     const std::string port = setting(FarlinkSetting::kPort);
     settings.port = port.empty() ? kFarlinkPort : OvraBase::parsePort(port).value_or(0);
-    const bool usable =
-        settings.port != 0 &&
-        (settings.host.empty() || Endpoint::make("https", settings.host, settings.port)) &&
-        (settings.alias.empty() || isFarlinkAlias(settings.alias));
+    const bool usable = settings.port != 0 && (settings.host.empty() || isServer(settings)) &&
+                        (settings.alias.empty() || isFarlinkAlias(settings.alias));
     if (!usable) {
         return tl::unexpected(
             std::string(kFarlinkFile) +
@@ -101,10 +122,12 @@ FarlinkReply FarlinkClient::call(const char *method, const Json::Value &params,
     return reply ? verdictOn(std::move(*reply)) : noAnswer(reply.error());
 }
 
-FarlinkReply FarlinkClient::lookUp(const std::string &alias, std::chrono::milliseconds time) const {
+tl::expected<AliasPlace, FarlinkFailure>
+FarlinkClient::lookUp(const std::string &alias, std::chrono::milliseconds time) const {
     Json::Value params(Json::objectValue);
-    params["alias"] = alias;
-    return call("lookup", params, std::min<std::chrono::milliseconds>(time, kAnswerTime));
+    params["alias"] = OvraBase::toLower(alias);
+    return call("lookup", params, std::min<std::chrono::milliseconds>(time, kAnswerTime))
+        .and_then([this](const OvraDRCore::Response &reply) { return placeIn(reply, settings_); });
 }
 
 FarlinkReply FarlinkClient::enrol(const FarlinkKey &key) const {
@@ -133,27 +156,24 @@ FarlinkReply FarlinkClient::release(const std::string &token) const {
     return call("release", params, kAnswerTime);
 }
 
-CredExpected<AliasPlace> findAlias(const std::string &alias, std::chrono::milliseconds time) {
+CredExpected<Endpoint> findAlias(const std::string &alias, OvraBase::Deadline deadline) {
     const auto settings = readFarlinkSettings();
     if (!settings || settings->host.empty()) {
         OVRA_NOTICE("[%s] cannot be looked up: %s", alias.c_str(),
-                    settings ? "no relay service is set up on this appliance; run "
-                               "ovradr farlink enable, or use a direct endpoint"
-                             : settings.error().c_str());
+                    settings ? kNoRelay : settings.error().c_str());
         return tl::unexpected(CredError::kCannotConnect);
     }
-    const FarlinkReply reply = FarlinkClient(*settings).lookUp(OvraBase::toLower(alias), time);
-    const Json::Value port = reply ? reply->getDataField("port") : Json::Value();
-    if (!port.isInt()) {
-        OVRA_NOTICE("The relay service [%s] does not tell where [%s] is reached: [%s]",
-                    settings->host.c_str(), alias.c_str(),
-                    reply ? "its answer has no port" : reply.error().text.c_str());
-        const CredError error = reply ? CredError::kNone : withoutRequest(reply.error().error);
-        const bool told = error == CredError::kTimedOut || error == CredError::kOutOfMemory;
-        return tl::unexpected(told ? error : CredError::kCannotConnect);
+    const auto time =
+        std::chrono::ceil<std::chrono::milliseconds>(deadline - std::chrono::steady_clock::now());
+    const auto place = FarlinkClient(*settings).lookUp(alias, time);
+    if (place) {
+        return *Endpoint::make("https", place->host, place->port);
     }
-    const std::string host = reply->getDataFieldtoStr("host");
-    return AliasPlace{host.empty() ? settings->host : host, port.asInt()};
+    OVRA_NOTICE("The relay service [%s] does not tell where [%s] is reached: [%s]",
+                settings->host.c_str(), alias.c_str(), place.error().text.c_str());
+    const CredError error = withoutRequest(place.error().error);
+    const bool told = error == CredError::kTimedOut || error == CredError::kOutOfMemory;
+    return tl::unexpected(told ? error : CredError::kCannotConnect);
 }
 
 } // namespace OvraPlatform
@@ -163,16 +183,21 @@ namespace OVRA {
 int CredRequestFarlink::GetConnInfo(const std::string &alias, Json::Value &info, const void *) {
     info = Json::Value();
     try {
-        const auto place = OvraPlatform::findAlias(alias, OvraPlatform::kAnswerTime);
-        if (!place) {
+        const auto endpoint = OvraPlatform::Endpoint::of("flk", alias, 0);
+        const auto settings = OvraPlatform::readFarlinkSettings();
+        if (!endpoint || !settings || settings->host.empty()) {
+            OVRA_NOTICE("[%s] cannot be reached: %s", alias.c_str(),
+                        !endpoint  ? "it is no alias"
+                        : settings ? OvraPlatform::kNoRelay
+                                   : settings.error().c_str());
             return 0;
         }
-        info["host"] = place->host;
+        info["host"] = endpoint->host();
         info["protocol"] = "https";
-        info["port"] = place->port;
+        info["port"] = endpoint->port();
         return 1;
     } catch (const std::exception &error) {
-        OVRA_ERR("[%s] cannot be looked up: [%s]", alias.c_str(), error.what());
+        OVRA_ERR("[%s] cannot be reached: [%s]", alias.c_str(), error.what());
         info = Json::Value();
         return 0;
     }

@@ -1,6 +1,8 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "trust/certificate_verifier.h"
 
+#include "trust/peer_keys.h"
+
 #include <ovrabase/encoding.h>
 #include <ovradrcore/log.h>
 #include <ovradrcore/no_fork.h>
@@ -19,20 +21,6 @@ struct FreeOpenSsl {
     void operator()(unsigned char *bytes) const { OPENSSL_free(bytes); }
 };
 
-CertificateVerifier::Verdict verdictOf(TrustVerdict trust) {
-    switch (trust) {
-    case TrustVerdict::kTrusted:
-        return CertificateVerifier::Verdict::kPinned;
-    case TrustVerdict::kUnknown:
-        return CertificateVerifier::Verdict::kNew;
-    case TrustVerdict::kDifferent:
-        return CertificateVerifier::Verdict::kChanged;
-    case TrustVerdict::kUnavailable:
-        break;
-    }
-    return CertificateVerifier::Verdict::kUnavailable;
-}
-
 } // namespace
 
 std::string fingerprintOf(const X509 *certificate) {
@@ -46,9 +34,32 @@ std::string fingerprintOf(const X509 *certificate) {
     return OvraBase::fingerprintOf(encoded, static_cast<std::size_t>(size));
 }
 
-CertificateVerifier::CertificateVerifier(Endpoint endpoint, bool observe)
+CredError errorOfTrust(TrustVerdict verdict) {
+    switch (verdict) {
+    case TrustVerdict::kTrusted:
+        return CredError::kNone;
+    case TrustVerdict::kDifferent:
+    case TrustVerdict::kVouched: // the present key is not what was vouched for
+        return CredError::kCertificateChanged;
+    case TrustVerdict::kUnknown:
+    case TrustVerdict::kForgotten:
+        return CredError::kNotTrusted;
+    case TrustVerdict::kLost:
+        return CredError::kTrustLost;
+    case TrustVerdict::kUnavailable:
+        break;
+    }
+    return CredError::kTrustUnavailable;
+}
+
+void logDistrust(const Endpoint &endpoint, const std::string &fingerprint, TrustVerdict verdict) {
+    OVRA_ERR("The key [%s] of [%s]: %s", fingerprint.c_str(), endpoint.trustKey().c_str(),
+             credErrorText(static_cast<int>(errorOfTrust(verdict))));
+}
+
+CertificateVerifier::CertificateVerifier(Endpoint endpoint, Mode mode)
     : endpoint_(std::move(endpoint))
-    , observe_(observe) {}
+    , mode_(mode) {}
 
 void CertificateVerifier::install(SSL_CTX *context) {
     SSL_CTX_set_options(context, SSL_OP_NO_RENEGOTIATION);
@@ -58,16 +69,13 @@ void CertificateVerifier::install(SSL_CTX *context) {
 
 int CertificateVerifier::verify(X509_STORE_CTX *chain, void *self) {
     auto *verifier = static_cast<CertificateVerifier *>(self);
-    verifier->verdict_ = Verdict::kUnavailable;
+    verifier->error_ = CredError::kTrustUnavailable;
     try {
-        verifier->verdict_ = verifier->verdictOn(chain);
+        verifier->error_ = verifier->judge(chain);
     } catch (const std::exception &error) {
         OVRA_ERR("A certificate cannot be judged: [%s]", error.what());
     }
-    const bool trusted = verifier->verdict_ == Verdict::kSystem ||
-                         verifier->verdict_ == Verdict::kPinned ||
-                         verifier->verdict_ == Verdict::kNew;
-    if (trusted || verifier->observe_) {
+    if (verifier->error_ == CredError::kNone) {
         X509_STORE_CTX_set_error(chain, X509_V_OK);
         return 1;
     }
@@ -75,39 +83,61 @@ int CertificateVerifier::verify(X509_STORE_CTX *chain, void *self) {
     return 0;
 }
 
-CertificateVerifier::Verdict CertificateVerifier::verdictOn(X509_STORE_CTX *chain) {
+CredError CertificateVerifier::judge(X509_STORE_CTX *chain) {
+    lesson_ = Lesson::kNone;
     fingerprint_ = fingerprintOf(X509_STORE_CTX_get0_cert(chain));
     if (fingerprint_.empty()) {
-        return Verdict::kUnavailable;
+        return CredError::kTrustUnavailable;
     }
-    if (systemAccepts(chain)) {
-        return Verdict::kSystem;
+    const TrustVerdict known = TrustStore().lookup(endpoint_.trustKey(), fingerprint_);
+    const bool systemCounts = known == TrustVerdict::kUnknown || known == TrustVerdict::kVouched;
+    acceptedBySystem_ = (systemCounts || mode_ == Mode::kObserve) && systemAccepts(chain);
+    if (mode_ == Mode::kObserve || known == TrustVerdict::kTrusted) {
+        return CredError::kNone;
     }
-    const TrustVerdict trust = TrustStore().lookup(endpoint_.key(), fingerprint_);
-    if (trust == TrustVerdict::kDifferent && !observe_) {
-        OVRA_ERR("The key [%s] of [%s] is not the one trusted for it: find out why it changed, "
-                 "then forget the old one",
-                 fingerprint_.c_str(), endpoint_.key().c_str());
+    if (systemCounts && acceptedBySystem_) {
+        lesson_ = known == TrustVerdict::kUnknown ? Lesson::kVouch : Lesson::kNone;
+        return CredError::kNone;
     }
-    return verdictOf(trust);
+    // Of an alias the relay chooses who answers, so that the first one may be anybody.
+    const bool firstContact = mode_ == Mode::kFirstContact && endpoint_.alias().empty();
+    if (known == TrustVerdict::kUnknown &&
+        (firstContact || isNamedByPeer(endpoint_, fingerprint_))) {
+        lesson_ = Lesson::kPin;
+        return CredError::kNone;
+    }
+    logDistrust(endpoint_, fingerprint_, known);
+    return errorOfTrust(known);
 }
 
+/// A certificate for the host of an alias would say nothing: nobody else can vouch for a name of
+/// our own.
 bool CertificateVerifier::systemAccepts(X509_STORE_CTX *chain) const {
     X509_VERIFY_PARAM *wanted = X509_STORE_CTX_get0_param(chain);
     const std::string &host = endpoint_.host();
     // The certificate must list an address as an address, a name as a name.
     const bool set = X509_VERIFY_PARAM_set1_ip_asc(wanted, host.c_str()) == 1 ||
                      X509_VERIFY_PARAM_set1_host(wanted, host.c_str(), host.size()) == 1;
-    return set && X509_verify_cert(chain) == 1;
+    return endpoint_.alias().empty() && set && X509_verify_cert(chain) == 1;
 }
 
-bool CertificateVerifier::pinNewKey() {
-    if (verdict_ != Verdict::kNew) {
+bool CertificateVerifier::settle() {
+    const Lesson lesson = std::exchange(lesson_, Lesson::kNone);
+    mode_ = mode_ == Mode::kFirstContact ? Mode::kVerify : mode_;
+    if (lesson == Lesson::kNone) {
         return true;
     }
     const OvraDRCore::NoFork::Pause forksPass; // it may wait for the file
-    verdict_ = verdictOf(TrustStore().pin(endpoint_.key(), fingerprint_));
-    return verdict_ == Verdict::kPinned;
+    if (lesson == Lesson::kVouch) {
+        // Without the note the certificate is good all the same.
+        const TrustVerdict noted = TrustStore().vouch(endpoint_.trustKey());
+        error_ = noted == TrustVerdict::kVouched || noted == TrustVerdict::kUnavailable
+                     ? CredError::kNone
+                     : errorOfTrust(noted);
+    } else {
+        error_ = errorOfTrust(TrustStore().pin(endpoint_.trustKey(), fingerprint_));
+    }
+    return error_ == CredError::kNone;
 }
 
 } // namespace OvraPlatform

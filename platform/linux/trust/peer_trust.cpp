@@ -3,7 +3,6 @@
 
 #include "http/web_call.h"
 
-#include <ovrabase/encoding.h>
 #include <ovradrcore/log.h>
 
 #include <chrono>
@@ -27,8 +26,7 @@ CredExpected<PeerIdentity> identityOverTls(const Endpoint &endpoint, Deadline de
     if (verifier.fingerprint().empty()) {
         return tl::unexpected(CredError::kCannotConnect);
     }
-    return PeerIdentity{verifier.fingerprint(),
-                        verifier.verdict() == CertificateVerifier::Verdict::kSystem};
+    return PeerIdentity{verifier.fingerprint(), verifier.isAcceptedBySystem()};
 }
 
 CredExpected<PeerIdentity> identityOverHttp(const Endpoint &endpoint, Deadline deadline) {
@@ -41,17 +39,26 @@ CredExpected<PeerIdentity> identify(const Endpoint &endpoint, Deadline deadline)
     auto identity = endpoint.isTls() ? identityOverTls(endpoint, deadline)
                                      : identityOverHttp(endpoint, deadline);
     if (identity) {
-        identity->pinned = TrustStore().lookup(endpoint.key(), identity->fingerprint);
+        identity->pinned = TrustStore().lookup(endpoint.trustKey(), identity->fingerprint);
     }
     return identity;
 }
 
 } // namespace
 
+std::string trustKey(const std::string &protocol, const std::string &host, int port) {
+    try {
+        const auto endpoint = Endpoint::of(protocol, host, port);
+        return endpoint ? endpoint->trustKey() : "";
+    } catch (const std::exception &) {
+        return {};
+    }
+}
+
 CredExpected<PeerIdentity> peerFingerprint(const std::string &protocol, const std::string &host,
                                            int port, long seconds) {
     try {
-        const auto endpoint = Endpoint::make(protocol, host, port);
+        const auto endpoint = Endpoint::of(protocol, host, port);
         if (!endpoint || seconds < 1 || seconds > kMaxSeconds) {
             return tl::unexpected(CredError::kBadArgument);
         }
@@ -63,16 +70,12 @@ CredExpected<PeerIdentity> peerFingerprint(const std::string &protocol, const st
     }
 }
 
-TrustVerdict expectFingerprint(const std::string &protocol, const std::string &host, int port,
-                               const std::string &fingerprint) {
+TrustVerdict trustEndpoint(const std::string &protocol, const std::string &host, int port,
+                           const std::string &value, bool replace) {
     try {
-        const auto endpoint = Endpoint::make(protocol, host, port);
-        if (!endpoint || !OvraBase::isFingerprint(fingerprint)) {
-            return TrustVerdict::kUnavailable;
-        }
-        return TrustStore().pin(endpoint->key(), fingerprint);
+        return TrustStore().trust(trustKey(protocol, host, port), value, replace);
     } catch (const std::exception &error) {
-        OVRA_ERR("A fingerprint could not be kept: [%s]", error.what());
+        OVRA_ERR("An endpoint could not be trusted: [%s]", error.what());
         return TrustVerdict::kUnavailable;
     }
 }

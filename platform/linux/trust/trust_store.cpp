@@ -6,7 +6,6 @@
 #include <ovradrcore/log.h>
 
 #include <sys/stat.h>
-#include <unistd.h>
 
 #include <algorithm>
 #include <atomic>
@@ -17,8 +16,12 @@ namespace OvraPlatform {
 
 namespace {
 
-/// When the file changed whose damage was logged last, so that a damaged line is logged once, not
-/// at every request.
+constexpr std::string_view kHeading = "# ovradr-trust 1";
+/// What the heading of any version begins with.
+constexpr std::string_view kAnyHeading = "# ovradr-trust ";
+
+/// When the file changed whose damage was logged last, so that damage is logged once, not at every
+/// request.
 std::atomic<std::int64_t> toldOf{0};
 
 std::int64_t nanoseconds(const timespec &time) {
@@ -27,157 +30,293 @@ std::int64_t nanoseconds(const timespec &time) {
 }
 
 bool isEndpoint(const std::string &text) {
-    const bool protocol = text.starts_with("https://") || text.starts_with("http://");
+    const bool protocol =
+        text.starts_with("https://") || text.starts_with("http://") || text.starts_with("flk:");
     return protocol && std::all_of(text.begin(), text.end(), [](char c) { return c > ' '; });
+}
+
+/// The system's certificates vouch for HTTPS endpoints only, and for no alias.
+bool isValueFor(const std::string &endpoint, const std::string &value) {
+    return OvraBase::isFingerprint(value) || value == TrustStore::kForgotten ||
+           (value == TrustStore::kSystem && endpoint.starts_with("https://"));
+}
+
+void logUnchangeable(const std::string &path, const std::string &why) {
+    OVRA_ERR("The trusted keys in [%s] cannot be changed: [%s]", path.c_str(), why.c_str());
 }
 
 } // namespace
 
-/// A line as it is in the file, and its content if it is ours.
+/// A line as it is in the file.
 struct TrustStore::Line {
     std::string text;
-    std::optional<Entry> entry;
+    Entry entry; ///< the first word and the rest, whatever they are
 
     explicit Line(std::string line)
-        : text(std::move(line)) {
-        const std::size_t blank = text.find(' ');
-        if (blank == std::string::npos) {
-            return;
+        : text(std::move(line))
+        , entry{text.substr(0, text.find(' ')),
+                text.substr(std::min(text.find(' '), text.size()))} {
+        if (!entry.value.empty()) {
+            entry.value.erase(0, 1);
         }
-        Entry parsed{text.substr(0, blank), text.substr(blank + 1)};
-        if (isEndpoint(parsed.endpoint) && OvraBase::isFingerprint(parsed.fingerprint)) {
-            entry = std::move(parsed);
+    }
+    explicit Line(const Entry &of)
+        : text(of.endpoint + " " + of.value)
+        , entry(of) {}
+
+    bool says() const { return !text.empty() && text.front() != '#'; }
+    bool isSound() const {
+        return isEndpoint(entry.endpoint) && isValueFor(entry.endpoint, entry.value);
+    }
+    bool isFor(const std::string &endpoint) const { return says() && entry.endpoint == endpoint; }
+};
+
+struct TrustStore::Content {
+    std::vector<Line> lines;
+    bool hasHeading = false;
+    std::string problem; ///< "" if it is sound
+
+    explicit Content(const std::string &text) {
+        for (std::size_t begin = 0; begin < text.size();) {
+            const std::size_t end = std::min(text.find('\n', begin), text.size());
+            lines.emplace_back(text.substr(begin, end - begin));
+            begin = end + 1;
+        }
+        hasHeading = !lines.empty() && lines.front().text == kHeading;
+        const auto isDamaged = [](const Line &line) { return line.says() && !line.isSound(); };
+        const auto damaged = std::find_if(lines.begin(), lines.end(), isDamaged);
+        if (damaged != lines.end()) {
+            problem =
+                "its line " + std::to_string(damaged - lines.begin() + 1) + " cannot be understood";
+        } else if (!hasHeading && std::none_of(lines.begin(), lines.end(),
+                                               [](const Line &line) { return line.says(); })) {
+            // With endpoints and without a heading it is of the version before, which wrote none.
+            problem = "it is empty";
         }
     }
 
-    bool isDamaged() const { return !entry && !text.empty() && text.front() != '#'; }
-    bool isFor(const std::string &endpoint) const { return entry && entry->endpoint == endpoint; }
+    bool isNewer() const {
+        return !hasHeading && !lines.empty() && lines.front().text.starts_with(kAnyHeading);
+    }
+    auto find(const std::string &endpoint) {
+        return std::find_if(lines.begin(), lines.end(),
+                            [&](const Line &line) { return line.isFor(endpoint); });
+    }
+    TrustVerdict verdictOn(const std::string &endpoint, const std::string &fingerprint) {
+        const auto line = find(endpoint);
+        if (line == lines.end()) {
+            return problem.empty() ? TrustVerdict::kUnknown : TrustVerdict::kLost;
+        }
+        const std::string &value = line->entry.value;
+        if (!line->isSound()) {
+            return TrustVerdict::kLost;
+        }
+        if (value == kForgotten) {
+            return TrustVerdict::kForgotten;
+        }
+        if (value == kSystem) {
+            return TrustVerdict::kVouched;
+        }
+        return value == fingerprint ? TrustVerdict::kTrusted : TrustVerdict::kDifferent;
+    }
+    void put(const Entry &entry) {
+        if (const auto line = find(entry.endpoint); line != lines.end()) {
+            *line = Line(entry);
+        } else {
+            lines.emplace_back(entry);
+        }
+    }
+    void addHeading() {
+        if (!hasHeading) {
+            lines.insert(lines.begin(), Line(std::string(kHeading)));
+            hasHeading = true;
+        }
+    }
 };
 
 TrustStore::TrustStore(std::string path)
     : path_(std::move(path)) {}
 
-std::optional<std::vector<TrustStore::Line>> TrustStore::read() const {
-    const OvraBase::Expected<std::string> content = OvraBase::readFile(path_);
-    if (!content && content.error().number != ENOENT) {
+std::optional<TrustStore::Content> TrustStore::read() const {
+    const OvraBase::Expected<std::string> text = OvraBase::readFile(path_);
+    if (!text && text.error().number != ENOENT) {
         OVRA_ERR("The trusted keys in [%s] cannot be read (%s): repair the file", path_.c_str(),
-                 content.error().text.c_str());
+                 text.error().text.c_str());
         return std::nullopt;
     }
-    const std::string text = content.value_or("");
-    std::vector<Line> lines;
-    for (std::size_t begin = 0; begin < text.size();) {
-        const std::size_t end = std::min(text.find('\n', begin), text.size());
-        lines.emplace_back(text.substr(begin, end - begin));
-        begin = end + 1;
+    Content content(text.value_or(""));
+    if (content.isNewer()) {
+        OVRA_ERR("[%s] is of a newer version than this program: install that", path_.c_str());
+        return std::nullopt;
     }
-    const auto damaged = std::count_if(lines.begin(), lines.end(),
-                                       [](const Line &line) { return line.isDamaged(); });
+    if (!text) {
+        content.problem = "it is missing";
+    }
     const std::int64_t changed = std::get<2>(stamp());
-    if (damaged > 0 && toldOf.exchange(changed) != changed) {
-        OVRA_WARN("[%s] has %ld lines that cannot be understood; they count for nothing: correct "
-                  "or remove them",
-                  path_.c_str(), static_cast<long>(damaged));
+    if (text && !content.problem.empty() && toldOf.exchange(changed) != changed) {
+        OVRA_WARN("[%s] is damaged, %s: endpoints that it does not name are refused until a person "
+                  "trusts them (ovradr conn trust)",
+                  path_.c_str(), content.problem.c_str());
     }
-    return lines;
+    return content;
 }
 
-bool TrustStore::write(const OvraBase::FileUpdate &file, const std::vector<Line> &lines) const {
+bool TrustStore::write(const OvraBase::FileUpdate &file, const Content &content) const {
     std::string text;
-    for (const Line &line : lines) {
+    for (const Line &line : content.lines) {
         text += line.text + '\n';
     }
     const OvraBase::Expected<void> written = text.size() > OvraBase::kMaxTextFile
                                                  ? OvraBase::systemError(EFBIG)
                                                  : file.commit(text, 0600);
     if (!written) {
-        OVRA_ERR(
-            "The trusted keys in [%s] cannot be written (%s): make room, forget endpoints that "
-            "are not used any more, or correct the rights",
-            path_.c_str(), written.error().text.c_str());
+        OVRA_ERR("The trusted keys in [%s] cannot be written (%s): make room, remove endpoints "
+                 "that are not used any more, or correct the rights",
+                 path_.c_str(), written.error().text.c_str());
     }
     return written.has_value();
 }
 
+bool TrustStore::create() {
+    if (!ensureStateDir(OvraBase::folderOf(path_))) {
+        return false;
+    }
+    const auto file = OvraBase::FileUpdate::begin(path_);
+    if (!file) {
+        logUnchangeable(path_, file.error().text);
+        return false;
+    }
+    auto content = read();
+    const bool mayBegin =
+        content && std::none_of(content->lines.begin(), content->lines.end(),
+                                [](const Line &line) { return line.says() && !line.isSound(); });
+    if (!mayBegin || content->hasHeading) {
+        return content && content->problem.empty();
+    }
+    content->addHeading();
+    return write(*file, *content);
+}
+
+std::string TrustStore::problem() const {
+    const auto content = read();
+    return content ? content->problem : "it cannot be read, or is of a newer version";
+}
+
 TrustVerdict TrustStore::lookup(const std::string &endpoint, const std::string &fingerprint) const {
-    const auto lines = read();
-    if (!lines) {
+    auto content = read();
+    return content ? content->verdictOn(endpoint, fingerprint) : TrustVerdict::kUnavailable;
+}
+
+TrustVerdict TrustStore::add(const Entry &entry) {
+    if (!isEndpoint(entry.endpoint) || !isValueFor(entry.endpoint, entry.value)) {
         return TrustVerdict::kUnavailable;
     }
-    const auto line = std::find_if(lines->begin(), lines->end(),
-                                   [&](const Line &each) { return each.isFor(endpoint); });
-    if (line == lines->end()) {
-        return TrustVerdict::kUnknown;
+    const auto file = OvraBase::FileUpdate::begin(path_);
+    if (!file) {
+        logUnchangeable(path_, file.error().text);
+        return TrustVerdict::kUnavailable;
     }
-    return line->entry->fingerprint == fingerprint ? TrustVerdict::kTrusted
-                                                   : TrustVerdict::kDifferent;
+    auto content = read();
+    if (!content) {
+        return TrustVerdict::kUnavailable;
+    }
+    const TrustVerdict verdict = content->verdictOn(entry.endpoint, entry.value);
+    if (verdict != TrustVerdict::kUnknown) {
+        return verdict;
+    }
+    content->put(entry);
+    content->addHeading();
+    if (!write(*file, *content)) {
+        return TrustVerdict::kUnavailable;
+    }
+    OVRA_NOTICE("The key [%s] of [%s] is trusted from now on", entry.value.c_str(),
+                entry.endpoint.c_str());
+    return content->verdictOn(entry.endpoint, entry.value);
 }
 
 TrustVerdict TrustStore::pin(const std::string &endpoint, const std::string &fingerprint) {
-    if (!isEndpoint(endpoint) || !OvraBase::isFingerprint(fingerprint) ||
+    return add({endpoint, fingerprint});
+}
+
+TrustVerdict TrustStore::vouch(const std::string &endpoint) {
+    return add({endpoint, kSystem});
+}
+
+TrustVerdict TrustStore::trust(const std::string &endpoint, const std::string &value,
+                               bool replace) {
+    if (!isEndpoint(endpoint) || !isValueFor(endpoint, value) || value == kForgotten ||
         !ensureStateDir(OvraBase::folderOf(path_))) {
         return TrustVerdict::kUnavailable;
     }
     const auto file = OvraBase::FileUpdate::begin(path_);
     if (!file) {
-        OVRA_ERR("The trusted keys in [%s] cannot be changed: [%s]", path_.c_str(),
-                 file.error().text.c_str());
+        logUnchangeable(path_, file.error().text);
         return TrustVerdict::kUnavailable;
     }
-    const TrustVerdict verdict = lookup(endpoint, fingerprint);
-    if (verdict != TrustVerdict::kUnknown) {
-        return verdict;
-    }
-    auto lines = read();
-    if (!lines) {
+    auto content = read();
+    if (!content) {
         return TrustVerdict::kUnavailable;
     }
-    lines->emplace_back(endpoint + " " + fingerprint);
-    if (!write(*file, *lines)) {
+    const TrustVerdict before = content->verdictOn(endpoint, value);
+    if (before == TrustVerdict::kTrusted || (before == TrustVerdict::kDifferent && !replace)) {
+        return before;
+    }
+    content->put({endpoint, value});
+    content->addHeading();
+    if (!write(*file, *content)) {
         return TrustVerdict::kUnavailable;
     }
-    OVRA_NOTICE("The key [%s] of [%s] is trusted from now on", fingerprint.c_str(),
+    OVRA_NOTICE("A person trusts the key [%s] of [%s] from now on", value.c_str(),
                 endpoint.c_str());
     return TrustVerdict::kTrusted;
 }
 
 bool TrustStore::forget(const std::string &endpoint) {
-    if (access(path_.c_str(), F_OK) != 0 && errno == ENOENT) {
-        return true;
+    if (auto known = read(); known && known->find(endpoint) == known->lines.end()) {
+        return true; // also where there is no folder yet
     }
     const auto file = OvraBase::FileUpdate::begin(path_);
     if (!file) {
-        OVRA_ERR("The trusted keys in [%s] cannot be changed: [%s]", path_.c_str(),
-                 file.error().text.c_str());
+        logUnchangeable(path_, file.error().text);
         return false;
     }
-    auto lines = read();
-    if (!lines) {
+    auto content = read();
+    if (!content) {
         return false;
     }
-    const auto kept = std::remove_if(lines->begin(), lines->end(),
-                                     [&](const Line &line) { return line.isFor(endpoint); });
-    if (kept == lines->end()) {
+    if (content->find(endpoint) == content->lines.end()) {
         return true;
     }
-    lines->erase(kept, lines->end());
-    if (!write(*file, *lines)) {
+    content->put({endpoint, kForgotten});
+    if (content->problem.empty()) {
+        content->addHeading();
+    }
+    if (!write(*file, *content)) {
         return false;
     }
     OVRA_NOTICE("The key of [%s] is not trusted any more", endpoint.c_str());
     return true;
 }
 
+std::optional<TrustStore::Entry> TrustStore::find(const std::string &endpoint) const {
+    auto content = read();
+    if (!content) {
+        return std::nullopt;
+    }
+    const auto line = content->find(endpoint);
+    return line == content->lines.end() ? std::nullopt : std::optional(line->entry);
+}
+
 std::optional<std::vector<TrustStore::Entry>> TrustStore::list() const {
-    const auto lines = read();
-    if (!lines) {
+    const auto content = read();
+    if (!content) {
         return std::nullopt;
     }
     std::vector<Entry> entries;
-    for (const Line &line : *lines) {
+    for (const Line &line : content->lines) {
         const auto same = [&line](const Entry &entry) { return line.isFor(entry.endpoint); };
-        if (line.entry && std::none_of(entries.begin(), entries.end(), same)) {
-            entries.push_back(*line.entry);
+        if (line.says() && line.isSound() && std::none_of(entries.begin(), entries.end(), same)) {
+            entries.push_back(line.entry);
         }
     }
     return entries;

@@ -7,6 +7,7 @@
 #include <ovracredential/cred_request.h>
 #include <ovraplatform/appliance.h>
 #include <ovraplatform/farlink.h>
+#include <ovraplatform/peer_trust.h>
 
 #include <filesystem>
 #include <fstream>
@@ -33,6 +34,9 @@ protected:
         int port = 0;
         EXPECT_EQ(std::sscanf(relay.line().c_str(), "farlinkd: ready, https %d", &port), 1);
         settings = {"127.0.0.1", port, "nas"};
+        const auto met = OvraPlatform::peerFingerprint("https", "127.0.0.1", port, 10);
+        EXPECT_TRUE(met);
+        OvraPlatform::trustEndpoint("https", "127.0.0.1", port, met->fingerprint);
         agent.start();
     }
     ~TheFarlinkAgent() override {
@@ -41,12 +45,11 @@ protected:
     }
 
     static std::string call() { return OvraTest::hearAll(OvraTest::dial(kPort)); }
-    /// Where an appliance finds the alias: the text of its information.
-    static Json::Value lookUp(const std::string &alias) {
-        Json::Value info;
-        const int found = OVRA::CredRequestFarlink::GetConnInfo(alias, info, nullptr);
-        EXPECT_EQ(found != 0, !info.isNull());
-        return info;
+    /// Where an appliance finds the alias: "HOST PORT", or "".
+    static std::string lookUp(const std::string &alias) {
+        const auto place =
+            OvraPlatform::FarlinkClient(*OvraPlatform::readFarlinkSettings()).lookUp(alias);
+        return place ? place->host + " " + std::to_string(place->port) : "";
     }
 
     OvraTest::DaemonProgram relay{{FARLINKD_PROGRAM, "--address", "127.0.0.1", "--port", "0",
@@ -61,23 +64,23 @@ protected:
 } // namespace
 
 TEST_F(TheFarlinkAgent, IsReachedUnderItsAliasUntilTheRelayIsSwitchedOff) {
-    EXPECT_TRUE(lookUp("nas").isNull()) << "no relay is set up";
+    Json::Value info;
+    EXPECT_EQ(OVRA::CredRequestFarlink::GetConnInfo("nas", info, nullptr), 0) << "no relay";
     ASSERT_TRUE(OvraPlatform::writeFarlinkSettings(settings));
     ASSERT_TRUE(soon([this] { return agent.status().connected; })) << agent.status().problem;
     EXPECT_EQ(agent.status().port, kPort);
-    Json::Value found;
-    EXPECT_TRUE(soon([&] { return !(found = lookUp("NAS")).isNull(); }));
-    EXPECT_EQ(found["port"], kPort);
-    EXPECT_EQ(found["host"], "127.0.0.1") << "that of the service, which names none";
-    EXPECT_EQ(found["protocol"], "https");
+    EXPECT_TRUE(soon([] { return lookUp("NAS") == "127.0.0.1 " + std::to_string(kPort); }))
+        << "the host of the service, which names none";
+    EXPECT_NE(OVRA::CredRequestFarlink::GetConnInfo("NAS", info, nullptr), 0);
+    EXPECT_EQ(info["host"], "nas.farlink.alt") << "whatever the relay says";
     EXPECT_EQ(call(), "welcome");
-    EXPECT_TRUE(lookUp("nobody").isNull());
+    EXPECT_EQ(lookUp("nobody"), "");
 
     ASSERT_TRUE(OvraPlatform::writeFarlinkSettings({}));
     EXPECT_EQ(call(), "") << "nobody answers";
     EXPECT_TRUE(soon([this] { return !agent.status().connected; }));
     EXPECT_EQ(agent.status().problem, "");
-    EXPECT_TRUE(lookUp("nas").isNull());
+    EXPECT_EQ(lookUp("nas"), "");
 
     ASSERT_TRUE(OvraPlatform::writeFarlinkSettings(settings));
     EXPECT_TRUE(soon([] { return call() == "welcome"; })) << agent.status().problem;

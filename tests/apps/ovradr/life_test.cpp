@@ -28,7 +28,10 @@ using OvraTest::querySql;
 /// A credential "c1" with the session "old"; the remote deletes sessions on request.
 class Life : public ScriptedNode {
 protected:
-    Life() { begin(); }
+    Life() {
+        remote.trust();
+        begin();
+    }
 
     void begin() {
         std::filesystem::remove(OvraApps::kPendingReleasesFile);

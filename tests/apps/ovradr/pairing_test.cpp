@@ -2,6 +2,8 @@
 // The program against a node with scripted answers.
 #include "scripted_node.h"
 
+#include <ovraplatform/appliance.h>
+
 #include <chrono>
 #include <thread>
 
@@ -67,29 +69,59 @@ TEST_F(Pairing, NothingSecretIsSentToAKeyThatNobodyTrusts) {
     EXPECT_EQ(run({"conn", "forget", url}).exit, 7) << "and nothing was pinned";
 }
 
-TEST_F(Pairing, AKeyThatChangedIsRefusedUntilTheOldOneIsForgotten) {
+TEST_F(Pairing, AKeyThatChangedOrWasForgottenOrLostIsRefusedUntilAPersonTrustsIt) {
     pair();
+    const std::string old = remote.server.fingerprint();
     remote.server.changeCertificate();
+    const Arguments trust{"conn", "trust", url};
+    const Arguments named = trust + Arguments{"--fingerprint", remote.server.fingerprint()};
+    const Arguments forget{"conn", "forget", url};
     remote.server.closeConnections();
     remote.forgetCalls();
     EXPECT_EQ(logIn(remote, create).exit, 6);
     EXPECT_EQ(remote.calls(), "");
     EXPECT_EQ(tested()["trust"], "changed");
-    EXPECT_EQ(run({"conn", "forget", url}).exit, 0);
+    EXPECT_EQ(run(trust).exit, 6) << "nobody can be asked";
+    EXPECT_EQ(run(trust + Arguments{"--fingerprint", old}).exit, 6) << "it shows another one";
+    Terminal terminal(trust);
+    ASSERT_TRUE(terminal.shows(old) && terminal.shows(remote.server.fingerprint()));
+    ASSERT_TRUE(terminal.answers("Is it the same? [y/N]", "y"));
+    EXPECT_EQ(terminal.finish(), 0);
+    EXPECT_EQ(tested()["trust"], "pinned");
+
+    EXPECT_EQ(run(forget).exit, 0);
+    EXPECT_EQ(run(forget).exit, 7);
+    EXPECT_EQ(tested()["trust"], "forgotten");
+    remote.forgetCalls();
+    EXPECT_EQ(run({"call", "n1", "OVRA.DR.Node", "info"}).exit, 6);
+    EXPECT_EQ(run({"doctor", "n1"}).exit, 6);
+    EXPECT_EQ(remote.calls().find("s3cret"), std::string::npos) << remote.calls();
+    EXPECT_EQ(run(named + Arguments{"--json"}).json()["data"]["before"], "forgotten");
     EXPECT_EQ(logIn(remote, create).exit, 0);
+
+    std::filesystem::remove(OvraPlatform::kKnownEndpointsFile);
+    EXPECT_EQ(run({"setup"}).exit, 0);
+    EXPECT_EQ(tested()["trust"], "lost") << "set-up makes no new one for a node with credentials";
+    EXPECT_EQ(run({"doctor"}).exit, 9);
+    EXPECT_EQ(run({"doctor", url}).exit, 6);
+    EXPECT_EQ(run(named).exit, 0);
+    EXPECT_EQ(run({"call", "n1", "OVRA.DR.Node", "info"}).exit, 0);
+    // An alias is known by its name, whether or not it is reached now.
+    EXPECT_EQ(run({"conn", "trust", "flk:nas3", "--fingerprint", old}).exit, 0);
+    EXPECT_EQ(run({"conn", "forget", "flk:NAS3"}).exit, 0);
 }
 
 TEST_F(Pairing, AtATerminalTheKeyThePasswordAndTheCodeAreAskedFor) {
     const Arguments command = create + Arguments{"--account", "bob"};
     Terminal distrustful(command);
-    ASSERT_TRUE(distrustful.answers("Trust this key? [y/N]", ""));
+    ASSERT_TRUE(distrustful.answers("Is it the same? [y/N]", ""));
     EXPECT_EQ(distrustful.finish(), 6);
     EXPECT_EQ(tested()["trust"], "unknown");
 
     remote.answer("login", refusal(403));
     Terminal terminal(command);
     ASSERT_TRUE(terminal.shows(remote.server.fingerprint())) << terminal.screen();
-    ASSERT_TRUE(terminal.answers("Trust this key? [y/N]", "y"));
+    ASSERT_TRUE(terminal.answers("Is it the same? [y/N]", "y"));
     ASSERT_TRUE(terminal.answers("Password of bob on 127.0.0.1: ", "secret word"));
     ASSERT_TRUE(terminal.shows("One-time code: ")) << terminal.screen();
     remote.answer("login", success(R"({"sid":"login-s3cret"})"));
@@ -189,6 +221,7 @@ TEST_F(Pairing, ANodeIsFoundByTheBeginningOfItsId) {
 }
 
 TEST_F(Pairing, WhatTheNodeSaysAboutARefusalIsTheAdvice) {
+    remote.trust();
     addCred("node_cred", "n1", "c-1", "https", remote.port(), "s");
     remote.answer("test_privilege", R"({"success":false,"error":{"code":105,"msg":)"
                                     R"("the account is disabled: enable it"}})");

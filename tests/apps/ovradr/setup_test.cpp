@@ -46,7 +46,7 @@ TEST(Setup, MakesAWholeApplianceAndTheSecondTimeNothing) {
     ASSERT_EQ(first.exit, 0) << first.out << first.err;
     EXPECT_EQ(madeBy(first.json())
                   .rfind("settings, node database, HTTPS key, HTTPS certificate, "
-                         "sealing key, node id, ",
+                         "sealing key, trusted keys, node id, ",
                          0),
               0U)
         << first.out;

@@ -11,6 +11,7 @@ namespace OvradrTest {
 TEST(SpeedCommand, EveryEndpointThatWasTriedIsNamedWithItsOutcome) {
     ASSERT_EQ(run({"setup", "--address", "127.0.0.1,127.0.0.2"}).exit, 0);
     OvraTest::RemoteNode remote;
+    remote.trust();
     OvraTest::addCred("node_cred", "n1", "c1", "https", remote.port(), "s1");
     remote.answer("test_download_speed", R"({"success":false,"error":{"code":407}})");
     const Result none = run({"speed", "n1"});

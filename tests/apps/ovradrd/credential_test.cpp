@@ -23,6 +23,7 @@ protected:
         writeFile(OvraPlatform::kConfigFile, "address=\"127.0.0.1\"\n");
         addAccount("root", true);
         sid = session("root");
+        remote.trust();
         remote.answer("login", R"({"success":true,"data":{"sid":"login-sid"}})");
         remote.answer("info", R"({"success":true,"data":{"node_id":"n1","serial":"S1"}})");
         remote.answer("login-sid create", R"({"success":true,"data":{"session":"granted"}})");
@@ -119,6 +120,7 @@ TEST_F(Credential, InBothDirectionsIsMadeThereAndBack) {
     const Json::Value asked = json(remote.params("create"));
     EXPECT_EQ(asked["cred_direction"], "unidirection");
     EXPECT_EQ(asked["conn"]["addr"], "10.0.0.1");
+    EXPECT_EQ(asked["_keys"].size(), 2U) << "those by which the way back is known";
 }
 
 TEST_F(Credential, InBothDirectionsIsNotBegunWithoutAnAddressOrAnAccountOfOnesOwn) {

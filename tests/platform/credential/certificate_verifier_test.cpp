@@ -2,6 +2,7 @@
 #include "platform/own_files.h"
 #include "support/test_certificate.h"
 #include "trust/certificate_verifier.h"
+#include "trust/peer_keys.h"
 
 #include <ovrabase/encoding.h>
 
@@ -13,7 +14,6 @@
 namespace {
 
 using namespace OvraPlatform;
-using Verdict = CertificateVerifier::Verdict;
 
 struct Free {
     void operator()(SSL_CTX *context) const { SSL_CTX_free(context); }
@@ -49,40 +49,86 @@ bool shakeHands(CertificateVerifier &judge, const OvraTest::TestCertificate &ser
 
 class JudgeScene : public OvraTest::OwnFiles {
 protected:
-    static CertificateVerifier judge(const std::string &host = "nas.example",
-                                     bool observe = false) {
-        return {Endpoint::make("https", host, 5001).value(), observe};
+    using Mode = CertificateVerifier::Mode;
+
+    /// What the handshake ends with, and what is then remembered.
+    CredError judge(const std::string &host, const OvraTest::TestCertificate &server,
+                    const OvraTest::TestCertificate *system, Mode mode = Mode::kVerify) {
+        CertificateVerifier each(Endpoint::make("https", host, 5001).value(), mode);
+        const bool done = shakeHands(each, server, system);
+        EXPECT_EQ(done, each.error() == CredError::kNone);
+        return done && mode != Mode::kObserve && !each.settle() ? CredError::kInternal
+                                                                : each.error();
+    }
+    static std::string known(const std::string &endpoint) {
+        return TrustStore().find(endpoint).value_or(TrustStore::Entry()).value;
     }
 
-    OvraTest::TestCertificate server_{"DNS:nas.example,IP:192.0.2.7"};
-    OvraTest::TestCertificate other_;
+    OvraTest::TestCertificate server_{"DNS:nas.example,IP:192.0.2.7,DNS:nas.farlink.alt"};
+    OvraTest::TestCertificate other_{"DNS:nas.example"};
+    const std::string key_ = fingerprintOf(server_.certificate());
 };
 
-TEST_F(JudgeScene, AcceptsWhatTheSystemAcceptsForThatNameOrAddressWhateverWasPinned) {
-    TrustStore().pin("https://nas.example:5001", fingerprintOf(other_.certificate()));
-    for (const auto &[host, verdict] : {std::pair{"nas.example", Verdict::kSystem},
-                                        {"192.0.2.7", Verdict::kSystem},
-                                        {"other.example", Verdict::kNew},
-                                        {"192.0.2.8", Verdict::kNew}}) {
-        CertificateVerifier each = judge(host);
-        EXPECT_TRUE(shakeHands(each, server_, &server_)) << host;
-        EXPECT_EQ(each.verdict(), verdict) << host;
+TEST_F(JudgeScene, AcceptsWhatTheSystemAcceptsForThatNameOrAddressAndRequiresItFromThenOn) {
+    EXPECT_TRUE(TrustStore().create());
+    for (const char *host : {"nas.example", "192.0.2.7"}) {
+        const std::string endpoint = "https://" + std::string(host) + ":5001";
+        EXPECT_EQ(judge(host, server_, &server_), CredError::kNone);
+        EXPECT_EQ(known(endpoint), TrustStore::kSystem);
+        EXPECT_EQ(judge(host, server_, &server_), CredError::kNone);
+        // Self-signed now, or expired, or the store cannot be read: the system does not accept it.
+        EXPECT_EQ(judge(host, server_, nullptr), CredError::kCertificateChanged);
+        EXPECT_EQ(judge(host, other_, nullptr, Mode::kFirstContact),
+                  CredError::kCertificateChanged);
+        EXPECT_EQ(known(endpoint), TrustStore::kSystem);
     }
+    const OvraTest::TestCertificate expired("DNS:nas.example", -60);
+    EXPECT_EQ(judge("nas.example", expired, &expired), CredError::kCertificateChanged);
+    for (const char *host : {"other.example", "192.0.2.8"}) {
+        EXPECT_EQ(judge(host, server_, &server_), CredError::kNotTrusted) << host;
+    }
+    EXPECT_TRUE(TrustStore().forget("https://nas.example:5001"));
+    EXPECT_EQ(judge("nas.example", server_, &server_), CredError::kNotTrusted);
 }
 
-TEST_F(JudgeScene, EndsTheHandshakeWithAnotherKeyAndWhenThePinnedKeysCannotBeRead) {
-    TrustStore().pin("https://nas.example:5001", fingerprintOf(other_.certificate()));
-    CertificateVerifier strict = judge();
-    EXPECT_FALSE(shakeHands(strict, server_, nullptr));
-    EXPECT_EQ(strict.verdict(), Verdict::kChanged);
-    CertificateVerifier observer = judge("nas.example", true);
-    EXPECT_TRUE(shakeHands(observer, server_, nullptr));
-    EXPECT_EQ(observer.verdict(), Verdict::kChanged);
+TEST_F(JudgeScene, AsksForThePinnedKeyWhoeverElseAcceptsTheCertificate) {
+    TrustStore().trust("https://nas.example:5001", key_, false);
+    EXPECT_EQ(judge("nas.example", server_, nullptr), CredError::kNone);
+    EXPECT_EQ(judge("nas.example", other_, &other_), CredError::kCertificateChanged);
+    EXPECT_EQ(judge("nas.example", other_, nullptr), CredError::kCertificateChanged);
+    EXPECT_EQ(judge("nas.example", other_, nullptr, Mode::kObserve), CredError::kNone);
+    // Nobody vouches for an alias, and none is trusted at first contact.
+    for (const Mode mode : {Mode::kVerify, Mode::kFirstContact}) {
+        EXPECT_EQ(judge("nas.farlink.alt", server_, &server_, mode), CredError::kNotTrusted);
+    }
+    TrustStore().trust("flk:nas", key_, false);
+    EXPECT_EQ(judge("nas.farlink.alt", server_, nullptr), CredError::kNone);
+    EXPECT_EQ(judge("nas.farlink.alt", other_, &other_), CredError::kCertificateChanged);
+}
+
+TEST_F(JudgeScene, PinsANewKeyAtALogInOrWhenItsPeerNamedItAndWithASoundFile) {
+    EXPECT_EQ(judge("nas.example", server_, &server_, Mode::kFirstContact), CredError::kTrustLost);
+    EXPECT_TRUE(TrustStore().create());
+    EXPECT_EQ(judge("nas.example", server_, nullptr), CredError::kNotTrusted);
+    Json::Value call;
+    call["conn"]["addr"] = "192.0.2.7";
+    call["conn"]["protocol"] = "https";
+    call["conn"]["port"] = 5001;
+    call["_keys"].append(key_);
+    {
+        const PeerKeyScope peer(call);
+        EXPECT_EQ(judge("192.0.2.7", other_, nullptr), CredError::kNotTrusted) << "another key";
+        EXPECT_EQ(judge("nas.example", server_, nullptr), CredError::kNotTrusted) << "not its own";
+        EXPECT_EQ(judge("192.0.2.7", server_, nullptr), CredError::kNone);
+        EXPECT_EQ(known("https://192.0.2.7:5001"), key_);
+        EXPECT_TRUE(TrustStore().forget("https://192.0.2.7:5001"));
+        EXPECT_EQ(judge("192.0.2.7", server_, nullptr), CredError::kNotTrusted) << "withdrawn";
+    }
+    EXPECT_EQ(judge("nas.example", server_, nullptr, Mode::kFirstContact), CredError::kNone);
+    EXPECT_EQ(known("https://nas.example:5001"), key_);
     std::filesystem::remove(kKnownEndpointsFile);
     std::filesystem::create_directory(kKnownEndpointsFile);
-    CertificateVerifier blind = judge();
-    EXPECT_FALSE(shakeHands(blind, server_, nullptr));
-    EXPECT_EQ(blind.verdict(), Verdict::kUnavailable);
+    EXPECT_EQ(judge("nas.example", server_, &server_), CredError::kTrustUnavailable);
 }
 
 } // namespace

@@ -23,11 +23,16 @@ using namespace OvraPlatform;
 using namespace OvraTest;
 using namespace std::chrono_literals;
 
-/// A credential for 127.0.0.1 and a session.
+void trust(const MisbehavingServer &server) {
+    EXPECT_EQ(trustEndpoint("https", "127.0.0.1", server.port(), server.fingerprint()),
+              TrustVerdict::kTrusted);
+}
+
+/// A credential and a session.
 struct Objects {
-    explicit Objects(const MisbehavingServer &server) {
+    explicit Objects(const MisbehavingServer &server, const char *host = "127.0.0.1") {
         EXPECT_EQ(OVRACredItemSetProtocol(cred.get(), "https"), 0);
-        EXPECT_EQ(OVRACredItemSetHost(cred.get(), "127.0.0.1"), 0);
+        EXPECT_EQ(OVRACredItemSetHost(cred.get(), host), 0);
         EXPECT_EQ(OVRACredItemSetPort(cred.get(), server.port()), 0);
         EXPECT_EQ(OVRACredSessItemSetAccessToken(sess.get(), "sid-1"), 0);
     }
@@ -48,8 +53,9 @@ Result process(OVRA::CredRequest &request, bool reuse = true, int mode = 0) {
 }
 
 /// Calls OVRA.Test "get" on the server.
-Result call(const MisbehavingServer &server, bool reuse = true, long seconds = 5) {
-    const Objects objects(server);
+Result call(const MisbehavingServer &server, bool reuse = true, long seconds = 5,
+            const char *host = "127.0.0.1") {
+    const Objects objects(server, host);
     OVRA::CredRequest request;
     Json::Value params;
     params["text"] = "a&b";
@@ -68,6 +74,10 @@ Result probe(const std::string &protocol, int port, const std::string &host = "1
 }
 
 struct CredRequestScene : OwnFiles {
+    void SetUp() override {
+        OwnFiles::SetUp();
+        trust(server);
+    }
     Result call(bool reuse = true, long seconds = 5) const {
         return ::call(server, reuse, seconds);
     }
@@ -139,6 +149,10 @@ TEST_F(CredRequestScene, TellsWhatWasWrongWithAnAnswerAndProbesForAnyOfTheEntryP
     for (const auto &scene : scenes) {
         for (const std::string how : {"http", "https", "call"}) {
             MisbehavingServer peer({.tls = how != "http"});
+            std::filesystem::remove_all(kStateDir);
+            if (how == "call") {
+                trust(peer);
+            }
             peer.answer(scene.answer);
             const auto begin = std::chrono::steady_clock::now();
             const E expected = how == "call" ? scene.call : scene.probe;
@@ -156,7 +170,6 @@ TEST_F(CredRequestScene, TellsWhatWasWrongWithAnAnswerAndProbesForAnyOfTheEntryP
             EXPECT_EQ(requests[0].body.empty(), how != "call");
             EXPECT_TRUE(how == "call" || TrustStore().list()->empty()) << scene.name;
         }
-        std::filesystem::remove_all(kStateDir);
     }
 }
 
@@ -222,14 +235,14 @@ TEST_F(CredRequestScene, RefusesWhatCannotBeSent) {
 }
 
 TEST_F(CredRequestScene, KeepsAConnectionForTheNextRequestUntilThePeerClosesIt) {
-    call(); // pins the key, which ends the first connection
+    call();
     const int before = server.connections();
     for (int i = 0; i < 5; ++i) {
         EXPECT_TRUE(call().ok);
     }
-    EXPECT_EQ(server.connections(), before + 1);
+    EXPECT_EQ(server.connections(), before);
     EXPECT_TRUE(call(false).ok);
-    EXPECT_EQ(server.connections(), before + 2);
+    EXPECT_EQ(server.connections(), before + 1);
     server.closeConnections();
     std::this_thread::sleep_for(50ms);
     EXPECT_TRUE(call().ok) << "one that the peer has closed is replaced";
@@ -291,25 +304,47 @@ TEST_F(CredRequestScene, RefusesAnEndpointWhoseKeyHasChangedAlsoOnAKeptConnectio
     EXPECT_EQ(server.requests().size(), 1U) << "nothing may be sent to it";
 
     EXPECT_TRUE(TrustStore().forget(endpoint()));
+    EXPECT_EQ(call().error, CredError::kNotTrusted);
+    trust(server);
     EXPECT_TRUE(call().ok);
     EXPECT_TRUE(call().ok) << "on a connection that is kept until trust is taken back";
+    EXPECT_EQ(trustEndpoint("https", "127.0.0.1", server.port(), "SHA256:" + std::string(43, 'A')),
+              TrustVerdict::kDifferent);
     EXPECT_TRUE(TrustStore().forget(endpoint()));
-    EXPECT_EQ(
-        expectFingerprint("https", "127.0.0.1", server.port(), "SHA256:" + std::string(43, 'A')),
-        TrustVerdict::kTrusted);
-    EXPECT_EQ(call().error, CredError::kCertificateChanged);
+    EXPECT_EQ(call().error, CredError::kNotTrusted);
 }
 
-TEST_F(CredRequestScene, SendsNothingWhenAKeyCannotBePinned) {
-    OtherProcess full([this] {
-        limitFileSize(0);
-        return static_cast<int>(call().error);
-    });
-    EXPECT_EQ(full.wait(), static_cast<int>(CredError::kTrustUnavailable));
-    EXPECT_TRUE(server.requests().empty());
+TEST_F(CredRequestScene, AsksForTheKeyOfTheAliasWhateverTheRelaySays) {
+    MisbehavingServer relay({.tls = true});
+    MisbehavingServer liar({.tls = true});
+    trust(relay);
+    std::filesystem::create_directories(kConfigDir);
+    ASSERT_TRUE(writeFarlinkSettings({"127.0.0.1", relay.port(), ""}));
+    const auto reach = [&](const std::string &port) {
+        relay.answer(Answer::success(R"({"port":)" + port + "}"));
+        return ::call(server, false, 5, "nas.farlink.alt").error;
+    };
+    const std::string honest = std::to_string(server.port());
+    EXPECT_EQ(reach(honest), CredError::kNotTrusted) << "nobody has trusted the alias yet";
+    EXPECT_EQ(trustEndpoint("flk", "NAS", 0, server.fingerprint()), TrustVerdict::kTrusted);
+    EXPECT_EQ(reach(honest), CredError::kNone);
+    EXPECT_EQ(reach(std::to_string(liar.port())), CredError::kCertificateChanged);
+    EXPECT_EQ(reach(honest + R"(,"host":"other.farlink.alt")"), CredError::kCannotConnect);
+    // The other lie: a certificate that the system accepts for the relay's own host.
+    std::filesystem::create_directory(path("certs"));
+    liar.addTo(path("certs"));
+    if (mount(path("certs").c_str(), "/etc/ssl/certs", nullptr, MS_BIND, nullptr) == 0) {
+        const auto met = peerFingerprint("https", "127.0.0.1", liar.port(), 5);
+        EXPECT_TRUE(met && met->acceptedBySystem);
+        EXPECT_EQ(reach(std::to_string(liar.port())), CredError::kCertificateChanged);
+        umount("/etc/ssl/certs");
+    }
+    EXPECT_TRUE(liar.requests().empty());
+    EXPECT_EQ(reach(honest), CredError::kNone);
 }
 
 TEST_F(CredRequestScene, ShowsTheFingerprintWithoutTrustingIt) {
+    EXPECT_TRUE(std::filesystem::remove(kKnownEndpointsFile) && TrustStore().create());
     const auto identity = peerFingerprint("https", "127.0.0.1", server.port(), 5);
     ASSERT_TRUE(identity);
     EXPECT_EQ(identity->fingerprint, server.fingerprint());
@@ -318,13 +353,12 @@ TEST_F(CredRequestScene, ShowsTheFingerprintWithoutTrustingIt) {
     EXPECT_TRUE(TrustStore().list()->empty());
     EXPECT_TRUE(server.requests().empty());
 
-    EXPECT_EQ(expectFingerprint("https", "127.0.0.1", server.port(), server.fingerprint()),
-              TrustVerdict::kTrusted);
+    trust(server);
     EXPECT_EQ(peerFingerprint("https", "127.0.0.1", server.port(), 5).value().pinned,
               TrustVerdict::kTrusted);
     EXPECT_EQ(peerFingerprint("https", "127.0.0.1", unusedPort(), 5).error(),
               CredError::kCannotConnect);
-    EXPECT_EQ(expectFingerprint("https", "127.0.0.1", server.port(), "SHA256:x"),
+    EXPECT_EQ(trustEndpoint("https", "127.0.0.1", server.port(), "SHA256:x"),
               TrustVerdict::kUnavailable);
 }
 

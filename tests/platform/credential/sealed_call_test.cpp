@@ -34,13 +34,17 @@ std::string serve(const WireCall &call) {
 
 class SealedCallScene : public OwnFiles {
 protected:
-    /// \param clock  the daemon's
-    std::unique_ptr<MisbehavingServer> start(bool tls,
-                                             std::function<UnixMillis()> clock = wallClock) {
+    /// \param clock    the daemon's
+    /// \param trusted  whether its key is known
+    std::unique_ptr<MisbehavingServer>
+    start(bool tls, std::function<UnixMillis()> clock = wallClock, bool trusted = true) {
         daemon_ =
             std::make_unique<SealingDaemon>(path("seal"), serve, ReplayGuard::Clocks{clock, clock});
         auto server = std::make_unique<MisbehavingServer>(MisbehavingServer::Options{.tls = tls});
         server->answerWith([this](const Received &request) { return daemon_->answer(request); });
+        if (trusted) {
+            trust(*server, tls);
+        }
         OVRACredItemSetProtocol(cred_.get(), tls ? "https" : "http");
         OVRACredItemSetHost(cred_.get(), "127.0.0.1");
         OVRACredItemSetPort(cred_.get(), server->port());
@@ -48,6 +52,11 @@ protected:
         OVRACredItemSetRemotePasswd(cred_.get(), "hunter2");
         OVRACredSessItemSetAccessToken(sess_.get(), "sid-1");
         return server;
+    }
+
+    void trust(const MisbehavingServer &server, bool tls) {
+        trustEndpoint(tls ? "https" : "http", "127.0.0.1", server.port(),
+                      tls ? server.fingerprint() : daemon_->fingerprint(), true);
     }
 
     CredError call(int encryptMode = 0) {
@@ -176,8 +185,30 @@ TEST_F(SealedCallScene, RefusesAnHttpEndpointWhoseKeyHasChanged) {
     EXPECT_EQ(call(), CredError::kCertificateChanged);
     EXPECT_EQ(peerFingerprint("http", "127.0.0.1", server->port(), 5).value().fingerprint,
               daemon_->fingerprint());
-    EXPECT_TRUE(TrustStore().forget("http://127.0.0.1:" + std::to_string(server->port())));
+    trust(*server, false);
     EXPECT_EQ(call(), CredError::kNone);
+}
+
+TEST_F(SealedCallScene, TrustsANewKeyAtALogInAndNowhereElse) {
+    for (const bool tls : {true, false}) {
+        std::filesystem::remove_all(kStateDir);
+        const auto server = start(tls, wallClock, false);
+        EXPECT_EQ(call(), CredError::kTrustLost);
+        EXPECT_EQ(login(), 0) << "there is no file that says that it is unknown";
+        EXPECT_TRUE(TrustStore().create());
+        EXPECT_EQ(call(), CredError::kNotTrusted);
+        OtherProcess full([this] {
+            limitFileSize(0);
+            return login() == 0 ? reply_["error"]["msg"]["cred_error"].asInt() : -1;
+        });
+        EXPECT_EQ(full.wait(), static_cast<int>(CredError::kTrustUnavailable));
+        EXPECT_FALSE(carries(*server, "sealed=") || carries(*server, "ann")) << tls;
+        EXPECT_NE(login(), 0) << tls;
+        EXPECT_EQ(call(), CredError::kNone) << tls;
+        EXPECT_TRUE(TrustStore().forget((tls ? "https" : "http") + std::string("://127.0.0.1:") +
+                                        std::to_string(server->port())));
+        EXPECT_EQ(login(), 0) << "a person has withdrawn it";
+    }
 }
 
 TEST_F(SealedCallScene, BelievesNothingThatCouldBeForged) {

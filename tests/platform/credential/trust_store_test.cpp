@@ -15,60 +15,88 @@ std::string fingerprint(const std::string &of) {
     return OvraBase::fingerprintOf(reinterpret_cast<const unsigned char *>(of.data()), of.size());
 }
 
+using V = TrustVerdict;
+
 class TrustScene : public OvraTest::OwnFiles {
 protected:
     std::string file() const { return path("known_endpoints"); }
     TrustStore store() const { return TrustStore(file()); }
 };
 
-TEST_F(TrustScene, TrustsTheKeyThatAnEndpointHadFirstUntilItForgets) {
+TEST_F(TrustScene, TrustsTheKeyThatAnEndpointHadFirstUntilAPersonForgets) {
     const std::string key = fingerprint("a");
-    EXPECT_EQ(store().lookup("https://a:1", key), TrustVerdict::kUnknown);
-    EXPECT_EQ(store().pin("https://a:1", key), TrustVerdict::kTrusted);
-    EXPECT_EQ(store().lookup("https://a:1", key), TrustVerdict::kTrusted);
-    EXPECT_EQ(store().lookup("https://a:1", fingerprint("b")), TrustVerdict::kDifferent);
-    EXPECT_EQ(store().pin("https://a:1", fingerprint("b")), TrustVerdict::kDifferent);
-    for (const char *other : {"http://a:1", "https://a:2", "https://b:1"}) {
-        EXPECT_EQ(store().lookup(other, key), TrustVerdict::kUnknown) << other;
+    EXPECT_TRUE(store().create());
+    EXPECT_EQ(store().lookup("https://a:1", key), V::kUnknown);
+    EXPECT_EQ(store().pin("https://a:1", key), V::kTrusted);
+    EXPECT_EQ(store().pin("https://a:1", fingerprint("b")), V::kDifferent);
+    EXPECT_EQ(store().trust("https://a:1", fingerprint("b"), false), V::kDifferent);
+    EXPECT_EQ(store().lookup("https://a:1", key), V::kTrusted);
+    for (const char *other : {"http://a:1", "https://a:2", "https://b:1", "flk:a"}) {
+        EXPECT_EQ(store().lookup(other, key), V::kUnknown) << other;
     }
     EXPECT_EQ(OvraTest::modeOf(file()), 0600U);
-    store().pin("https://b:1", key);
-    store().pin("https://c:1", fingerprint("c"));
-    EXPECT_TRUE(store().forget("https://b:1"));
-    EXPECT_EQ(store().lookup("https://b:1", key), TrustVerdict::kUnknown);
-    const auto entries = store().list().value();
-    ASSERT_EQ(entries.size(), 2U);
-    EXPECT_EQ(entries[0].endpoint, "https://a:1");
-    EXPECT_EQ(entries[1].fingerprint, fingerprint("c"));
+    EXPECT_EQ(store().vouch("https://b:1"), V::kVouched);
+    EXPECT_EQ(store().vouch("flk:b"), V::kUnavailable) << "nobody vouches for an alias";
+    for (const char *known : {"https://a:1", "https://b:1"}) {
+        EXPECT_TRUE(store().forget(known));
+        EXPECT_EQ(store().pin(known, key), V::kForgotten) << "only a person trusts it again";
+        EXPECT_EQ(store().vouch(known), V::kForgotten);
+    }
+    EXPECT_EQ(store().trust("https://b:1", key, false), V::kTrusted);
+    EXPECT_EQ(store().trust("https://b:1", fingerprint("b"), true), V::kTrusted);
+    EXPECT_EQ(OvraTest::readFile(file()),
+              "# ovradr-trust 1\nhttps://a:1 forgotten\nhttps://b:1 " + fingerprint("b") + "\n");
 }
 
-TEST_F(TrustScene, KeepsLinesThatCountForNothingAndRefusesToJudgeWithoutItsFile) {
-    const std::string strange = "# a comment\n\nhttps://a:1 SHA256:short\nrubbish\n"
-                                "https://b:1  " +
-                                fingerprint("b") + "\n";
-    OvraTest::writeFile(file(), strange + "https://c:1 " + fingerprint("c")); // no newline
-    EXPECT_EQ(store().lookup("https://a:1", fingerprint("a")), TrustVerdict::kUnknown);
-    EXPECT_EQ(store().lookup("https://b:1", fingerprint("b")), TrustVerdict::kUnknown);
-    EXPECT_EQ(store().lookup("https://c:1", fingerprint("c")), TrustVerdict::kTrusted);
-    EXPECT_EQ(store().pin("https://a:1", fingerprint("a")), TrustVerdict::kTrusted);
-    EXPECT_TRUE(OvraTest::readFile(file()).starts_with(strange));
-    EXPECT_EQ(store().lookup("https://c:1", fingerprint("c")), TrustVerdict::kTrusted);
-    // The first of two lines counts.
-    OvraTest::writeFile(file(), "https://a:1 " + fingerprint("1") + "\nhttps://a:1 " +
-                                    fingerprint("2") + "\n");
-    EXPECT_EQ(store().lookup("https://a:1", fingerprint("2")), TrustVerdict::kDifferent);
-    EXPECT_EQ(store().list()->size(), 1U);
-    EXPECT_TRUE(store().forget("https://a:1"));
-    EXPECT_EQ(store().lookup("https://a:1", fingerprint("2")), TrustVerdict::kUnknown);
-    std::filesystem::remove(file());
+TEST_F(TrustScene, TakesNobodyForUnknownWithoutASoundFile) {
+    const std::string head = "# ovradr-trust 1\n";
+    const std::string a = "https://a:1 " + fingerprint("a") + "\n";
+    const struct {
+        const char *name;
+        std::optional<std::string> text;
+        V a;     ///< of the endpoint a
+        V other; ///< of one that is not named
+    } files[] = {
+        {"missing", std::nullopt, V::kLost, V::kLost},
+        {"empty", "", V::kLost, V::kLost},
+        {"only a comment", "# a comment\n\n", V::kLost, V::kLost},
+        {"of the version before", a, V::kTrusted, V::kUnknown},
+        {"sound", head + "# a comment\n" + a, V::kTrusted, V::kUnknown},
+        {"the first of two counts", head + "https://a:1 system\n" + a, V::kVouched, V::kUnknown},
+        {"a cut line", head + "https://a:1 SHA256:short\n" + a, V::kLost, V::kLost},
+        {"a line without value", head + "https://a:1", V::kLost, V::kLost},
+        {"rubbish beside it", head + a + "rubbish", V::kTrusted, V::kLost},
+        {"zeros", std::string(300, '\0'), V::kLost, V::kLost},
+        {"of a newer version", "# ovradr-trust 2\n" + a, V::kUnavailable, V::kUnavailable},
+    };
+    for (const auto &each : files) {
+        if (each.text) {
+            OvraTest::writeFile(file(), *each.text);
+        }
+        const std::string key = fingerprint("a");
+        EXPECT_EQ(store().lookup("https://a:1", key), each.a) << each.name;
+        EXPECT_EQ(store().lookup("https://b:1", key), each.other) << each.name;
+        EXPECT_EQ(store().problem().empty(), each.other == V::kUnknown) << each.name;
+        const bool unknown = each.other == V::kUnknown;
+        EXPECT_EQ(store().pin("https://b:1", key), unknown ? V::kTrusted : each.other) << each.name;
+        EXPECT_EQ(store().vouch("https://c:1"), unknown ? V::kVouched : each.other) << each.name;
+        // A person's word counts, and nothing else is lost by it.
+        const V said = each.a == V::kUnavailable ? V::kUnavailable : V::kTrusted;
+        EXPECT_EQ(store().trust("https://d:1", key, false), said) << each.name;
+        EXPECT_EQ(store().lookup("https://d:1", key), said) << each.name;
+        const std::string now = OvraTest::readFile(file());
+        EXPECT_EQ(now.starts_with(head), said == V::kTrusted) << each.name;
+        EXPECT_NE(now.find(each.text.value_or("")), std::string::npos) << each.name;
+        std::filesystem::remove(file());
+    }
     std::filesystem::create_directory(file());
-    EXPECT_EQ(store().lookup("https://a:1", fingerprint("a")), TrustVerdict::kUnavailable);
-    EXPECT_EQ(store().pin("https://a:1", fingerprint("a")), TrustVerdict::kUnavailable);
-    EXPECT_FALSE(store().list());
-    EXPECT_FALSE(store().forget("https://a:1"));
+    EXPECT_EQ(store().lookup("https://a:1", fingerprint("a")), V::kUnavailable);
+    EXPECT_EQ(store().trust("https://a:1", fingerprint("a"), true), V::kUnavailable);
+    EXPECT_FALSE(store().list() || store().forget("https://a:1") || store().create());
 }
 
 TEST_F(TrustScene, LosesNoKeyOfProcessesThatPinAtOnce) {
+    EXPECT_TRUE(store().create());
     const auto pinMany = [this](const std::string &name) {
         for (int i = 1; i <= 25; ++i) {
             store().pin("https://" + name + ":" + std::to_string(i), fingerprint(name));

@@ -27,9 +27,10 @@ enum class CredError : int {
     kSealFailed = 13,        ///< the request could not be sealed
     kTrustUnavailable = 14,  ///< the file of trusted keys can be neither read nor written
     kUnanswered = 15,        ///< sent, and no answer in time: it may have been carried out
-    // 16 and 17: of the trusted keys
-    kTlsTooOld = 18,   ///< the endpoint speaks no TLS 1.2 or newer
-    kReplyForged = 19, ///< the reply to a sealed request carries no valid seal
+    kNotTrusted = 16,        ///< nobody has trusted a key of the endpoint yet, or it was withdrawn
+    kTrustLost = 17,         ///< the file of trusted keys is missing or damaged
+    kTlsTooOld = 18,         ///< the endpoint speaks no TLS 1.2 or newer
+    kReplyForged = 19,       ///< the reply to a sealed request carries no valid seal
 };
 
 /// A value, or the error; never kNone.

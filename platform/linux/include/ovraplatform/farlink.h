@@ -50,15 +50,21 @@ struct FarlinkFailure {
 /// A successful answer, or why there is none.
 using FarlinkReply = tl::expected<OvraDRCore::Response, FarlinkFailure>;
 
-/// The calls of an appliance to its relay service. Its key is trusted on first use.
+/// Where to connect to for an alias now, over HTTPS; whom to trust there is known by the alias.
+struct AliasPlace {
+    std::string host;
+    int port = 0;
+};
+
+/// The calls of an appliance to its relay service, whose key a person has trusted.
 class OVRAPLATFORM_EXPORT FarlinkClient {
 public:
     explicit FarlinkClient(FarlinkSettings settings)
         : settings_(std::move(settings)) {}
 
-    /// Where the alias is reached now: "port", and "host" if it differs from that of the service.
+    /// Where the alias is reached now.
     /// \param time  how long it may take, but 10 seconds at most
-    [[nodiscard]] FarlinkReply
+    [[nodiscard]] tl::expected<AliasPlace, FarlinkFailure>
     lookUp(const std::string &alias,
            std::chrono::milliseconds time = std::chrono::seconds(10)) const;
     /// Proves that this appliance holds the key of its alias, or claims a free alias: "port",

@@ -21,46 +21,73 @@ namespace OvraPlatform {
 /// What the store says about an endpoint's key.
 enum class TrustVerdict {
     kTrusted,     ///< it is the pinned one
-    kUnknown,     ///< no key is pinned for the endpoint
+    kUnknown,     ///< nothing is known of the endpoint
     kDifferent,   ///< another key is pinned
+    kVouched,     ///< no key is pinned: the system's certificates vouched for the endpoint before
+    kForgotten,   ///< a person has withdrawn its key
+    kLost,        ///< the file is missing or damaged, so that a key of the endpoint may be lost
     kUnavailable, ///< the file cannot be read or written; an ERR line says why
 };
 
-/// The keys that endpoints had at first contact: a text file of mode 0600 with a line "ENDPOINT
-/// FINGERPRINT" for each, shared by all processes of the appliance.
+/// The keys by which endpoints are known: a text file of mode 0600 with a line "ENDPOINT VALUE" for
+/// each, shared by all processes of the appliance; docs/files.md describes it.
 ///
+/// Of an endpoint that the file does not name only a sound file says that it is unknown: without
+/// the file, or with a damaged one, its key may be lost, and nobody but a person trusts it anew.
 /// A change is made under a lock and replaces the file atomically, so that readers need no lock and
-/// a crash leaves either the old file or the new one. Foreign lines are kept and ignored; of two
-/// lines for one endpoint the first counts.
+/// a crash leaves either the old file or the new one. Foreign lines are kept; of two lines for one
+/// endpoint the first counts.
 class OVRAPLATFORM_EXPORT TrustStore {
 public:
+    /// The values that are no fingerprint.
+    static constexpr char kSystem[] = "system";
+    static constexpr char kForgotten[] = "forgotten";
+
     struct Entry {
-        std::string endpoint;    ///< "https://host:5001", in lower case
-        std::string fingerprint; ///< "SHA256:..."
+        std::string endpoint; ///< "https://host:5001" in lower case, or "flk:alias"
+        std::string value;    ///< "SHA256:...", kSystem or kForgotten
     };
     /// Changes when the file does.
     using Stamp = std::tuple<dev_t, ino_t, std::int64_t, std::int64_t, off_t>;
 
     explicit TrustStore(std::string path = kKnownEndpointsFile);
 
+    /// Makes the file where it is missing or empty, and gives one of an older version its heading;
+    /// not for an appliance that may have lost keys.
+    /// \return whether there is a sound file now
+    [[nodiscard]] bool create();
+    /// What is wrong with the file, as a sentence without its end; "" if it is sound.
+    [[nodiscard]] std::string problem() const;
+
     TrustVerdict lookup(const std::string &endpoint, const std::string &fingerprint) const;
-    /// Trusts the key from now on, unless another one is pinned.
-    /// \return kTrusted, kDifferent or kUnavailable
+    /// Trusts the key of an endpoint that is unknown, from now on.
+    /// \return as lookup() afterwards, or kUnavailable
     TrustVerdict pin(const std::string &endpoint, const std::string &fingerprint);
-    /// Drops the key of the endpoint. \return false if the file could not be changed; an endpoint
-    /// without a key is not a failure.
+    /// Notes that the system's certificates vouch for an endpoint that is unknown; as pin().
+    TrustVerdict vouch(const std::string &endpoint);
+    /// A person's decision: trusts a key, or with kSystem what the system's certificates vouch for.
+    /// Makes the file if need be.
+    /// \param replace  also in place of another pinned key
+    /// \return kTrusted; kDifferent if another key is pinned, which stays; kUnavailable
+    TrustVerdict trust(const std::string &endpoint, const std::string &value, bool replace);
+    /// A person's decision: withdraws what is known of the endpoint; only trust() makes it known
+    /// again. \return false if the file could not be changed; an endpoint that is not named in it
+    /// is not a failure.
     [[nodiscard]] bool forget(const std::string &endpoint);
-    /// Every pinned key in file order; std::nullopt if the file cannot be read.
+    /// What is known of the endpoint; std::nullopt if that is nothing or cannot be read.
+    std::optional<Entry> find(const std::string &endpoint) const;
+    /// Every endpoint in file order; std::nullopt if the file cannot be read.
     std::optional<std::vector<Entry>> list() const;
     /// For callers that cache a lookup: it is valid as long as the stamp is unchanged.
     Stamp stamp() const;
 
 private:
     struct Line;
+    struct Content;
 
-    std::optional<std::vector<Line>> read() const;
-    [[nodiscard]] bool write(const OvraBase::FileUpdate &file,
-                             const std::vector<Line> &lines) const;
+    std::optional<Content> read() const;
+    TrustVerdict add(const Entry &entry);
+    [[nodiscard]] bool write(const OvraBase::FileUpdate &file, const Content &content) const;
 
     std::string path_;
 };
