@@ -1,8 +1,9 @@
 # SPDX-License-Identifier: Apache-2.0
 # shellcheck shell=bash
-# Two scenes for lab/scene. attack-bodies: 16 strangers post bodies of 1 MiB to node 2, while an honest
-# client makes calls over a kept connection and others log in. attack-reply: node 1 is paired with a
-# node 2 that answers with 8 MiB.
+# A scene for lab/scene: 16 strangers post bodies of 1 MiB to node 2, while an honest client makes calls
+# over a kept connection and others log in.
+# shellcheck source=lab/lib/measure.sh
+. "$here/lib/measure.sh"
 
 # What the attack may cost on a machine that has time for it. One with fewer than four processors also
 # carries the attackers and the clients, and another one may have other work: times may be longer there,
@@ -12,17 +13,6 @@ busy=$(awk -v processors="$(nproc)" '{
     busy = int($1 / processors + 0.99); least = processors < 4 ? 2 : 1
     print (busy < least ? least : busy > 4 ? 4 : busy) }' /proc/loadavg)
 
-# daemonMemory [NODE]: what the daemon of node 2 has in memory (RSS), in MiB. With proot every process is
-# visible.
-daemonMemory() {
-    # shellcheck disable=SC2016 # expanded in the node
-    "$lab" run "${1-2}" -- bash -c '
-        for pid in $(pgrep -x ovradrd); do
-            grep -sqzxF "OVRADR_LAB_ID=$OVRADR_LAB_ID" "/proc/$pid/environ" &&
-                grep -sqzxF "OVRADR_LAB_NODE=$OVRADR_LAB_NODE" "/proc/$pid/environ" &&
-                awk "/^VmRSS:/ { printf \"%.1f\\n\", \$2 / 1024 }" "/proc/$pid/status"
-        done'
-}
 # Calls of the honest client, a hundred a second, for 15 seconds at most; prints the time of each in ms and its HTTP status.
 kept() {
     "$lab" run 1 -- sh -c '
@@ -37,12 +27,6 @@ quantiles() {
         { time[NR] = $1 * 1000; if ($2 != 200 || $3 < 100) failed++ }
         END { printf "%d %d %.1f %.1f %.1f\n", NR, failed, time[int((NR + 1) / 2)],
                      time[int(NR * 0.99 + 0.5)], time[NR] }')
-}
-# bound WHAT FIGURE LIMIT [UNIT]: prints a figure, and notes if it exceeds its limit.
-missed=
-bound() {
-    line "$1" "$2${4-}" "(at most $3${4-})"
-    awk "BEGIN { exit !($2 <= $3) }" || missed+="$1: $2 is more than $3. "
 }
 posted() { "$lab" run 1 -- wc -l "$load/attack" | cut -d ' ' -f 1; } # bodies of 1 MiB
 logIn() {
@@ -102,50 +86,5 @@ playAttack-bodies() {
     sleep 25
     after=$(daemonMemory)
     bound "of the growth kept half a minute later" "$(plus "$after" "-$before")" "$heldLimit" " MiB"
-    [[ -z $missed ]] || fail "$missed"
-}
-
-# Of a process that reads one reply of 8 MiB: the text, and the tree up to where its reader stops.
-replyLimit=96
-playAttack-reply() {
-    local before peak sampler k
-    url=http://$("$lab" addr 2):5000
-    key=$(fingerprint 2 http)
-    create 0 --json
-    credId=$(value .data.cred_id)
-    info 0
-    before=$(daemonMemory 1)
-    stopDaemon
-    "$lab" run 2 -- sh -c "perl '$here/lib/hostile.pl' $("$lab" addr 2) 5000 >/tmp/hostile.out 2>&1 &"
-    sleep "$(plus "$lifetime" 0.5)"
-
-    # shellcheck disable=SC2016 # expanded in the node
-    peak=$("$lab" run 1 -- bash -c '
-        ovradr call --cred "$1" "$2" OVRA.DR.Node info >/usr/ovra/reply 2>&1 & pid=$!
-        while status=$(cat "/proc/$pid/status" 2>/dev/null) && [[ $status == *VmHWM* ]]; do
-            most=$(awk "/^VmHWM:/ { printf \"%.1f\", \$2 / 1024 }" <<<"$status")
-        done
-        wait $pid && code=0 || code=$?
-        echo "$most $code"' call "$credId" "$remote")
-    [[ ${peak#* } != 0 ]] || fail "a reply of 8 MiB of numbers is taken"
-    on 1 0 cat /usr/ovra/reply
-    [[ $output == *"too large"* ]] || missed+="It is not refused for its size: $output. "
-    bound "memory of ovradr call" "${peak% *}" "$replyLimit" " MiB"
-
-    (while sleep 0.05; do daemonMemory 1; done) >"$work/memory" &
-    sampler=$!
-    for k in 1 2 3 4 5; do
-        "$lab" run 1 -- ovradr call local OVRA.DR.Node.Credential relay --param "cred_id=\"$credId\"" \
-            --param 'webapi={"api":"OVRA.DR.Node","version":1,"method":"info","params":{}}' \
-            >"$work/relayed.$k" 2>&1 &
-    done
-    sleep 6
-    kill "$sampler"
-    wait "$sampler" || true
-    grep -l "too large" "$work"/relayed.? >/dev/null || missed+="The daemon takes it. "
-    peak=$(sort -n "$work/memory" | tail -n 1)
-    bound "growth of the daemon, five replies at once" "$(plus "$peak" "-$before")" $((5 * 64)) " MiB"
-    sleep 22
-    bound "of it kept half a minute later" "$(plus "$(daemonMemory 1)" "-$before")" "$heldLimit" " MiB"
     [[ -z $missed ]] || fail "$missed"
 }

@@ -55,7 +55,10 @@ nodeState() {
 }
 
 # bwrapPid FILE: the pid that bubblewrap wrote with --info-fd; false if it has not yet.
-bwrapPid() { jq -er '."child-pid"' "$1" 2>/dev/null; }
+bwrapPid() {
+    local pid
+    pid=$(jq -er '."child-pid"' "$1" 2>/dev/null) && [[ -n $pid ]] && echo "$pid" # an empty file is no error to jq
+}
 
 # stopNodes FOLDER COUNT: tells every node's daemon to exit, and waits up to 5 seconds for that.
 stopNodes() {

@@ -111,7 +111,7 @@ damagedCaches() {
     info 0
     on 1 0 sh -c 'rm -r /tmp/.ovradrcache; ln -s /tmp /tmp/.ovradrcache'
     info 0
-    logSays 1 "going on without a cache"
+    logSays 1 "was not one that only user 0 may write"
 }
 
 killedDaemon() {
@@ -170,7 +170,7 @@ operationHereAndThere() {
         exampleFails 500 "$node" "$dead"
         exampleFails 401 "$node"
     done
-    logSays 2 "method [test_connection]"
+    logSays 2 "No connection to [https://127.0.0.1:1]" # node 2 has tried it too
     on 1 0 env OVRADR_CRED="$there" "$example" "$remote" "$answers"
     OVRADR_CRED=none exampleFails 519 "$remote" "$answers"
     exampleFails 507 stranger "$answers"

@@ -87,7 +87,7 @@ TEST(AliasRegistry, IsTheSameAfterARestartAndRefusesRubbish) {
 
 TEST(AliasRegistry, TakesFromItsFileWhatFitsItsPorts) {
     std::ofstream(kFile) << "farlink-aliases-1 6002\nfirst 6000 9 key1\nlow 5999 9 key1\n"
-                            "high 6003 9 key1\ntwice 6000 9 key1\n-bad 6001 9 key1\n"
+                            "high 6003 9 key1\ntwice 6000 9 key1\n"
                             "last 6002 9 key2\n";
     AliasRegistry registry(kFile, kLimits);
     ASSERT_TRUE(registry.load());

@@ -45,9 +45,14 @@ std::string askEverything() {
     return all + useDaemon();
 }
 
-/// The contents of the files that nothing has a reason to write.
+constexpr char kTrustHeading[] = "# ovradr-trust 1\n";
+
+/// The contents of the files that nothing has a reason to write; setup gives that of trusted keys
+/// its heading.
 std::string unchangeable() {
-    std::string all = readFile(kAliases) + readFile(kState + "known_endpoints");
+    std::string all = readFile(kState + "known_endpoints");
+    all.erase(0, all.rfind(kTrustHeading, 0) == 0 ? std::strlen(kTrustHeading) : 0);
+    all += readFile(kAliases);
     for (const char *name : {"node.info", "ovradrd.key", "ovradrd.crt", "ovradrd.seal"}) {
         all += readFile(kConfig + name);
     }
@@ -84,7 +89,8 @@ TEST(Fixtures, DISABLED_AreMade) {
     ASSERT_TRUE(PendingReleases().note({"a session", {}, "n1", "c1"}));
     ASSERT_TRUE(OvraPlatform::SessionStore().create({"ann", "", "", "", "", -1, true}));
     writeFile(kState + "known_endpoints",
-              "https://192.0.2.1:5001 SHA256:" + std::string(42, 'x') + "A\n");
+              kTrustHeading + ("https://192.0.2.1:5001 SHA256:" + std::string(42, 'x')) +
+                  "A\nhttps://192.0.2.2:5001 system\nflk:nas2 forgotten\n");
     writeFile(kConfig + "farlink.conf", "host=\"relay.example\"\nport=\"5443\"\nalias=\"nas1\"\n");
     writeFile(kAliases,
               "farlink-aliases-1 20001\nnas1 20000 4102444800 " + std::string(43, 'k') + "\n");
@@ -136,6 +142,8 @@ TEST(FilesOfANewerVersion, AreRefusedAndLeftAsTheyAre) {
             {kState + "releases.db", nextLayout, "layout 99"},
             {kConfig + "ovradrd.seal", heading, "ovradrd.seal"},
             {kAliases, heading, "aliases"},
+            {kState + "known_endpoints",
+             [](const std::string &path) { writeFile(path, "# ovradr-trust 2\n"); }, "newer"},
         };
     for (const auto &[path, change, told] : cases) {
         unpack(newestArchive());

@@ -64,7 +64,7 @@ TEST_F(Login, RefusesParametersThatAreNoLogIn) {
     }
     Json::Value huge = OvraTest::json(R"({"passwd":"x"})");
     huge["account"] = std::string(500'000, 'a');
-    EXPECT_EQ(call("OVRA.Core.Auth", 1, "login", huge).code(), 106);
+    EXPECT_EQ(call("OVRA.Core.Auth", 1, "login", huge).code(), 108);
 }
 
 TEST_F(Login, RefusesFurtherGuessesAlsoAfterARestartButNoLogInThatIsRight) {
