@@ -35,7 +35,7 @@ logIn() {
 }
 
 playAttack-bodies() {
-    local sid before peak after slowest=0 answer attack sampler k addresses=() way begun
+    local sid before peak slowest=0 answer attack sampler k addresses=() way begun
     way=$(<"$OVRADR_LAB_DIR/way")
     for k in $(seq 16); do
         if [[ $way == proot ]]; then
@@ -83,8 +83,6 @@ playAttack-bodies() {
     bound "slowest of five log-ins" "$slowest" $((loginLimit * busy)) " s"
     on 1 0 touch "$load/stop"
     wait "$attack" || true
-    sleep 25
-    after=$(daemonMemory)
-    bound "of the growth kept half a minute later" "$(plus "$after" "-$before")" "$heldLimit" " MiB"
+    boundHeld 2 "$before" "$heldLimit"
     [[ -z $missed ]] || fail "$missed"
 }

@@ -44,7 +44,6 @@ playAttack-reply() {
     grep -l "too large" "$work"/relayed.? >/dev/null || missed+="The daemon takes it. "
     peak=$(sort -n "$work/memory" | tail -n 1)
     bound "growth of the daemon, five replies at once" "$(plus "$peak" "-$before")" $((5 * 64)) " MiB"
-    sleep 22
-    bound "of it kept half a minute later" "$(plus "$(daemonMemory 1)" "-$before")" "$heldLimit" " MiB"
+    boundHeld 1 "$before" "$heldLimit"
     [[ -z $missed ]] || fail "$missed"
 }

@@ -19,3 +19,14 @@ bound() {
     line "$1" "$2${4-}" "(at most $3${4-})"
     awk "BEGIN { exit !($2 <= $3) }" || missed+="$1: $2 is more than $3. "
 }
+# boundHeld NODE BEFORE LIMIT: bounds what the daemon of the node has in MiB more than before, when it has
+# had a minute to give memory back (it looks every 20 s).
+boundHeld() {
+    local held k
+    for k in $(seq 30); do
+        held=$(plus "$(daemonMemory "$1")" "-$2")
+        awk "BEGIN { exit !($held > $3) }" || break
+        sleep 2
+    done
+    bound "of it kept within a minute" "$held" "$3" " MiB"
+}
