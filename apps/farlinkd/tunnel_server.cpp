@@ -101,6 +101,7 @@ struct TunnelServer::Impl {
     bool flush(Socket &to);
     void setInterest(Socket &socket) const;
     void drop(Socket &socket);
+    void remove(int fd);
     void closeAlias(const std::string &alias);
     void endOverdue();
     [[nodiscard]] bool dropOldest(const std::vector<Socket *> &among);
@@ -115,7 +116,10 @@ struct TunnelServer::Impl {
     std::mutex mutex; ///< of the two below
     std::vector<Command> commands;
     bool stopping = false;
-    std::unordered_map<int, std::unique_ptr<Socket>> sockets;           ///< of the thread alone
+    std::unordered_map<int, std::unique_ptr<Socket>> sockets; ///< of the thread alone
+    /// The same. Open until the events of this turn are handled: the next socket would get the
+    /// number, and an event that is not its own.
+    std::vector<std::unique_ptr<Socket>> removed;
     OvraService::RateLimit linesOfRefusals{1, std::chrono::minutes(1)}; ///< the same
     std::thread thread;
 };
@@ -194,8 +198,14 @@ Socket *TunnelServer::Impl::findWaiting(const std::string &caller) {
 void TunnelServer::Impl::drop(Socket &socket) {
     const int fd = socket.fd.get();
     const int other = socket.peer == nullptr ? -1 : socket.peer->fd.get();
-    sockets.erase(fd);
-    sockets.erase(other);
+    remove(fd);
+    remove(other);
+}
+
+void TunnelServer::Impl::remove(int fd) {
+    if (auto node = sockets.extract(fd)) {
+        removed.push_back(std::move(node.mapped()));
+    }
 }
 
 void TunnelServer::Impl::closeAlias(const std::string &alias) {
@@ -206,7 +216,7 @@ void TunnelServer::Impl::closeAlias(const std::string &alias) {
         }
     }
     for (const int fd : all) {
-        sockets.erase(fd);
+        remove(fd);
     }
 }
 
@@ -465,6 +475,7 @@ void TunnelServer::Impl::run() {
             endOverdue();
             swept = Clock::now();
         }
+        removed.clear();
     }
 }
 

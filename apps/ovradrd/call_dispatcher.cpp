@@ -285,8 +285,8 @@ void CallDispatcher::noteRefusal(const Call &call, int code) {
 
 void CallDispatcher::run(const Call &call) {
     const OvraPlatform::ClientScope scope(call.caller.address);
-    const OvraPlatform::PeerKeyScope peer(call.caller.administrator ? call.wire.params
-                                                                    : Json::Value());
+    const Json::Value nothing;
+    const OvraPlatform::PeerKeyScope peer(call.caller.administrator ? call.wire.params : nothing);
     const auto begun = std::chrono::steady_clock::now();
     const Json::Value reply = registry_.dispatch(call.wire, call.caller);
     note(call, reply, std::chrono::steady_clock::now() - begun);

@@ -166,7 +166,6 @@ struct Exchange {
             discard = true;
         } else {
             allowed = limit;
-            body.reserve(std::min(announced, limit));
         }
         MHD_resume_connection(connection);
     }
@@ -365,8 +364,9 @@ std::size_t HttpServer::Impl::take(Exchange &exchange, const char *data, std::si
         exchange.refuse(MHD_HTTP_OK, APIError::kTooBusy,
                         "too many large requests arrive at once: try again later");
     } else {
-        buffered += taken;
+        exchange.body.reserve(std::min(exchange.announced, exchange.allowed));
         exchange.body.append(data, taken);
+        buffered += taken;
         connections.progress(exchange.watched, taken);
         if (taken < size) {
             askJudge(exchange);
@@ -384,6 +384,10 @@ void HttpServer::Impl::askJudge(Exchange &exchange) {
         const std::lock_guard lock(exchange.mutex);
         exchange.state = Exchange::State::kJudged;
         MHD_suspend_connection(exchange.connection);
+    }
+    if (closing) {
+        held->answer(std::nullopt);
+        return;
     }
     judge({exchange.body, exchange.address, exchange.secure},
           [held, limit = limits.body](std::optional<std::string> refusal) {

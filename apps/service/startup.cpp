@@ -96,6 +96,7 @@ EndSignals::EndSignals()
         }
         state->changed.notify_all();
         std::this_thread::sleep_for(kEndTime);
+        alarm(1); // what does not end may be the system log
         OVRA_WARN("Something does not end: it is left");
         _exit(static_cast<int>(ExitCode::kFailed));
     }).detach();

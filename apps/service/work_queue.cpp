@@ -10,7 +10,6 @@
 #include <exception>
 #include <iterator>
 #include <list>
-#include <map>
 #include <mutex>
 #include <optional>
 #include <thread>
@@ -36,15 +35,10 @@ struct WorkQueue::Impl {
     };
     struct Client {
         std::string name;
-        std::deque<Waiting> due;
-        std::size_t waiting = 0; ///< due and delayed
+        std::deque<Waiting> waiting;
         unsigned int running = 0;
     };
     using Clients = std::list<Client>;
-    struct Delayed {
-        Clients::iterator client;
-        Waiting entry;
-    };
 
     Impl(unsigned int threadCount, const Limits &most)
         : limits(most)
@@ -52,7 +46,6 @@ struct WorkQueue::Impl {
 
     void work();
     Clients::iterator take(std::unique_lock<std::mutex> &lock, Job &job);
-    void wakeDue();
     Clients::iterator clientOf(const std::string &name);
     void forgetIdle(Clients::iterator client);
     std::optional<Waiting> makeRoom(const Client &client);
@@ -64,7 +57,6 @@ struct WorkQueue::Impl {
     std::condition_variable jobEnded;
     Clients clients; ///< with a job, in the order of their turns
     std::unordered_map<std::string, Clients::iterator> byName;
-    std::multimap<TimePoint, Delayed> delayed; ///< by the time at which each is due
     std::size_t waiting = 0;
     unsigned int running = 0;
     bool stopping = false;
@@ -76,21 +68,14 @@ WorkQueue::Impl::Clients::iterator WorkQueue::Impl::clientOf(const std::string &
     if (found != byName.end()) {
         return found->second;
     }
-    clients.push_back({name, {}, 0, 0});
+    clients.push_back({name, {}, 0});
     return byName.emplace(name, std::prev(clients.end())).first->second;
 }
 
 void WorkQueue::Impl::forgetIdle(Clients::iterator client) {
-    if (client->waiting == 0 && client->running == 0) {
+    if (client->waiting.empty() && client->running == 0) {
         byName.erase(client->name);
         clients.erase(client);
-    }
-}
-
-void WorkQueue::Impl::wakeDue() {
-    const auto end = delayed.upper_bound(std::chrono::steady_clock::now());
-    for (auto next = delayed.begin(); next != end; next = delayed.erase(next)) {
-        next->second.client->due.push_back(std::move(next->second.entry));
     }
 }
 
@@ -99,23 +84,16 @@ void WorkQueue::Impl::wakeDue() {
 WorkQueue::Impl::Clients::iterator WorkQueue::Impl::take(std::unique_lock<std::mutex> &lock,
                                                          Job &job) {
     while (!stopping) {
-        wakeDue();
         const auto next =
             std::find_if(clients.begin(), clients.end(), [this](const Client &client) {
-                return !client.due.empty() && client.running < share;
+                return !client.waiting.empty() && client.running < share;
             });
         if (next == clients.end()) {
-            if (delayed.empty()) {
-                jobsChanged.wait(lock);
-            } else {
-                const TimePoint due = delayed.begin()->first;
-                jobsChanged.wait_until(lock, due);
-            }
+            jobsChanged.wait(lock);
             continue;
         }
-        job = std::move(next->due.front().job);
-        next->due.pop_front();
-        --next->waiting;
+        job = std::move(next->waiting.front().job);
+        next->waiting.pop_front();
         ++next->running;
         clients.splice(clients.end(), clients, next);
         if (--waiting > 0) {
@@ -152,23 +130,14 @@ void WorkQueue::Impl::work() {
 /// Takes the last job from the client with the most waiting ones, if it has more than `client`.
 std::optional<WorkQueue::Impl::Waiting> WorkQueue::Impl::makeRoom(const Client &client) {
     const auto longest =
-        std::max_element(clients.begin(), clients.end(),
-                         [](const Client &a, const Client &b) { return a.waiting < b.waiting; });
-    if (longest->waiting <= client.waiting + 1) {
+        std::max_element(clients.begin(), clients.end(), [](const Client &a, const Client &b) {
+            return a.waiting.size() < b.waiting.size();
+        });
+    if (longest->waiting.size() <= client.waiting.size() + 1) {
         return std::nullopt;
     }
-    Waiting victim;
-    if (longest->due.empty()) {
-        const auto last = std::find_if(delayed.rbegin(), delayed.rend(), [&](const auto &entry) {
-            return entry.second.client == longest;
-        });
-        victim = std::move(last->second.entry);
-        delayed.erase(std::prev(last.base()));
-    } else {
-        victim = std::move(longest->due.back());
-        longest->due.pop_back();
-    }
-    --longest->waiting;
+    Waiting victim = std::move(longest->waiting.back());
+    longest->waiting.pop_back();
     --waiting;
     return victim;
 }
@@ -196,8 +165,7 @@ void WorkQueue::end() {
     }
 }
 
-bool WorkQueue::submit(const std::string &client, Job job, Job refuse,
-                       std::chrono::milliseconds delay) {
+bool WorkQueue::submit(const std::string &client, Job job, Job refuse) {
     std::optional<Impl::Waiting> victim; // outlives the lock: its destructor may take others
     {
         const std::lock_guard lock(impl_->mutex);
@@ -205,7 +173,7 @@ bool WorkQueue::submit(const std::string &client, Job job, Job refuse,
             return false;
         }
         const auto owner = impl_->clientOf(client);
-        bool room = owner->waiting < impl_->limits.ofOneClient;
+        bool room = owner->waiting.size() < impl_->limits.ofOneClient;
         if (room && impl_->waiting >= impl_->limits.total) {
             victim = impl_->makeRoom(*owner);
             room = victim.has_value();
@@ -214,14 +182,7 @@ bool WorkQueue::submit(const std::string &client, Job job, Job refuse,
             impl_->forgetIdle(owner);
             return false;
         }
-        Impl::Waiting entry{std::move(job), std::move(refuse)};
-        if (delay.count() > 0) {
-            impl_->delayed.emplace(std::chrono::steady_clock::now() + delay,
-                                   Impl::Delayed{owner, std::move(entry)});
-        } else {
-            owner->due.push_back(std::move(entry));
-        }
-        ++owner->waiting;
+        owner->waiting.push_back({std::move(job), std::move(refuse)});
         ++impl_->waiting;
     }
     impl_->jobsChanged.notify_one();
@@ -233,13 +194,10 @@ bool WorkQueue::submit(const std::string &client, Job job, Job refuse,
 
 bool WorkQueue::stop(TimePoint deadline) {
     std::vector<std::deque<Impl::Waiting>> dropped;
-    std::multimap<TimePoint, Impl::Delayed> droppedLater;
     std::unique_lock lock(impl_->mutex);
     impl_->stopping = true;
-    droppedLater.swap(impl_->delayed);
     for (Impl::Client &client : impl_->clients) {
-        dropped.push_back(std::exchange(client.due, {}));
-        client.waiting = 0;
+        dropped.push_back(std::exchange(client.waiting, {}));
     }
     impl_->waiting = 0;
     impl_->jobsChanged.notify_all();
@@ -247,7 +205,6 @@ bool WorkQueue::stop(TimePoint deadline) {
     // takes.
     lock.unlock();
     dropped.clear();
-    droppedLater.clear();
     lock.lock();
     return impl_->jobEnded.wait_until(lock, deadline, [this] { return impl_->running == 0; });
 }

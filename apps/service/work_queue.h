@@ -39,10 +39,8 @@ public:
     /// full
     ///                queue: the last one of the client with the most waiting jobs does, but never
     ///                the only one of a client. May be empty
-    /// \param delay   its minimum time in the queue; occupies no thread
     /// \return false if too many jobs wait, or the queue stops; neither runs then.
-    [[nodiscard]] bool submit(const std::string &client, Job job, Job refuse = {},
-                              std::chrono::milliseconds delay = {});
+    [[nodiscard]] bool submit(const std::string &client, Job job, Job refuse = {});
 
     /// Accepts no more jobs and drops the waiting ones.
     /// \return whether all jobs in progress ended by `deadline`.

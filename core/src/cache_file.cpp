@@ -89,13 +89,30 @@ bool storeCopy(int fd, std::uint32_t index, std::size_t which, std::string_view 
     return pwrite(fd, bytes.data(), bytes.size(), offset) == static_cast<ssize_t>(bytes.size());
 }
 
-/// Whether the file at `path` is still the one that was opened, and nobody has written to it since:
-/// then whoever keeps its lock, which takes a writer microseconds, is stopped or hangs.
-bool isStuck(const std::string &path, const struct stat &opened) {
+/// The file at `path`, if it is still the one that was opened.
+std::optional<struct stat> lookAgain(const std::string &path, const struct stat &opened) {
     struct stat now {};
-    return lstat(path.c_str(), &now) == 0 && now.st_dev == opened.st_dev &&
-           now.st_ino == opened.st_ino && now.st_mtim.tv_sec == opened.st_mtim.tv_sec &&
-           now.st_mtim.tv_nsec == opened.st_mtim.tv_nsec;
+    const bool same = lstat(path.c_str(), &now) == 0 && now.st_dev == opened.st_dev &&
+                      now.st_ino == opened.st_ino;
+    return same ? std::optional(now) : std::nullopt;
+}
+
+/// Takes the file at `path` away if it is still the one that was opened, and nobody has written to
+/// it since: then whoever keeps its lock, which takes a writer microseconds, is stopped or hangs.
+/// \return whether the path is free for a new file, or has one
+bool replaceStuck(const std::string &path, const struct stat &opened) {
+    // Those who have waited at once would take away each other's new file.
+    const auto alone = LockedFd::lock(
+        UniqueFd(open(OvraBase::folderOf(path).c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC)),
+        LOCK_EX, kLockWait);
+    const std::optional<struct stat> now = lookAgain(path, opened);
+    const bool stuck = now && now->st_mtim.tv_sec == opened.st_mtim.tv_sec &&
+                       now->st_mtim.tv_nsec == opened.st_mtim.tv_nsec;
+    if (!alone || !stuck || unlink(path.c_str()) != 0) {
+        return !now;
+    }
+    OVRA_WARN("Cache file [%s] was locked for too long, beginning a new one", path.c_str());
+    return true;
 }
 
 /// A cache file under its exclusive lock.
@@ -112,9 +129,7 @@ public:
                 return std::nullopt;
             }
             auto locked = LockedFd::lock(std::move(fd), LOCK_EX, kLockWait);
-            if (!locked && isStuck(path, status) && unlink(path.c_str()) == 0) {
-                OVRA_WARN("Cache file [%s] was locked for too long, beginning a new one",
-                          path.c_str());
+            if (!locked && locked.error().number == ETIMEDOUT && replaceStuck(path, status)) {
                 continue;
             }
             if (!locked) {
@@ -185,7 +200,10 @@ public:
             written = split(grown->get(), index, oldest, total);
         }
         const bool worthIt = total * kMinLoadToGrow >= std::uint64_t{buckets_} * BucketImage::kSize;
-        if (!written || !worthIt || rename(temporary.c_str(), path.c_str()) != 0) {
+        // Who was stopped in here may have lost its place to a new file.
+        struct stat status {};
+        const bool inPlace = fstat(fd_.get(), &status) == 0 && lookAgain(path, status);
+        if (!written || !worthIt || !inPlace || rename(temporary.c_str(), path.c_str()) != 0) {
             unlink(temporary.c_str());
             return false;
         }

@@ -15,8 +15,8 @@ bool isOursAlone(const struct stat &status);
 
 /// Whether the directory may be trusted. Nobody else can replace it between this check and the
 /// opening of a file in it: its parent folder is sticky or ours. One that is not ours alone is
-/// moved away, where that is permitted. Why it cannot be used is logged once per process. \param
-/// create  make a missing one, mode 0700
+/// moved away, where that is permitted. Why it cannot be used is logged once per process.
+/// \param create  make a missing one, mode 0700
 bool checkCacheFolder(const std::string &directory, bool create);
 
 /// open(2) that never follows a link, never blocks on a FIFO and never passes to another program.

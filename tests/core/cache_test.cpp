@@ -417,11 +417,15 @@ TEST_F(CacheTest, AWriterThatHangsHoldsOthersUpOnce) {
     });
     waitpid(stopped.pid(), nullptr, WUNTRACED);
     EXPECT_EQ(text(TestCache("a").Read()), "\"old\"") << "readers need no lock";
+    auto another =
+        std::async(std::launch::async, [] { return TestCache("c").UpdateWithData("c"); });
     EXPECT_TRUE(TestCache("a").UpdateWithData("new"));
+    EXPECT_TRUE(another.get()) << "whoever of the two replaced it, the other uses the new one";
     const auto start = std::chrono::steady_clock::now();
     EXPECT_TRUE(TestCache("b").UpdateWithData("next"));
     EXPECT_LT(std::chrono::steady_clock::now() - start, 1500ms);
     EXPECT_EQ(text(TestCache("a").GetCachedData()), "\"new\"");
+    EXPECT_EQ(text(TestCache("c").GetCachedData()), "\"c\"");
     stopped.end(SIGCONT);
     EXPECT_EQ(text(TestCache("b").GetCachedData()), "\"next\"");
 }

@@ -14,11 +14,11 @@ enum class LogLevel { kErr = 3, kWarn = 4, kNotice = 5, kInfo = 6, kDebug = 7 };
 /// \param file      source path; the line shows its stem (no folder, no extension)
 /// \param line      source line
 /// \param function  the function name in the line
-/// \param format    as for printf(3). Control and format characters (DEL, U+0080 to U+009F and
-/// those
-///                  that turn the direction of writing among them) and bytes that are not UTF-8 are
-///                  escaped, so that one event is one line; a line over 7,000 bytes is truncated
-///                  and says so.
+/// \param format    as for printf(3). Control and format characters (DEL, U+0080 to U+009F,
+///                  and those that turn the direction of writing) and bytes that are not UTF-8 are
+///                  escaped, so that one event is one line.
+///
+///                  A line over 7,000 bytes is truncated and says so.
 OVRADRCORE_EXPORT void logMessage(LogLevel level, const char *file, int line, const char *function,
                                   const char *format, ...) __attribute__((format(printf, 5, 6)));
 

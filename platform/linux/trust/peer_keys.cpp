@@ -8,6 +8,7 @@
 #include <ovrabase/encoding.h>
 #include <ovrabase/file.h>
 #include <ovradrcore/json.h>
+#include <ovradrcore/no_fork.h>
 
 #include <openssl/pem.h>
 
@@ -38,6 +39,7 @@ std::string ownTlsKey() {
     if (!text) {
         return {};
     }
+    const OvraDRCore::NoFork noFork; // a child would wait for the locks of the TLS library
     const std::unique_ptr<BIO, FreeOpenSsl> bio(
         BIO_new_mem_buf(text->data(), static_cast<int>(text->size())));
     const std::unique_ptr<X509, FreeOpenSsl> certificate(

@@ -139,6 +139,31 @@ TEST_F(ThroughTheTunnelServer, OneClientNeverTakesAllPlacesFromTheOthers) {
     }
 }
 
+TEST_F(ThroughTheTunnelServer, OneThatMadeRoomAndHangsUpTakesNobodyWithIt) {
+    begin({.perAlias = 8, .line = kLong, .answer = kLong});
+    std::list<UniqueFd> hostile;
+    for (const char client : std::string("22225551")) {
+        hostile.push_back(dial(callerPort, (std::string("127.0.0.") + client).c_str()));
+    }
+    (void)caller(); // all have a place
+    auto elsewhere = Listener::listen("127.0.0.1", 0);
+    const int otherPort = elsewhere->port;
+    server->open("other", std::move(*elsewhere));
+    std::unique_lock held(mutex);
+    const UniqueFd stop = dial(otherPort, "127.0.0.6"); // the server's thread waits in it
+    std::this_thread::sleep_for(std::chrono::milliseconds(300));
+    hostile.push_back(dial(callerPort, "127.0.0.3"));
+    hostile.push_back(dial(callerPort, "127.0.0.4"));
+    const UniqueFd client = dial(callerPort);
+    for (UniqueFd &each : hostile) {
+        shutdown(each.get(), SHUT_WR);
+    }
+    held.unlock();
+    const UniqueFd appliance = answer(caller());
+    say(appliance, "through");
+    EXPECT_EQ(hear(client), "through");
+}
+
 TEST_F(ThroughTheTunnelServer, WhatTheOtherEndDoesNotTakeStaysWithTheSender) {
     begin({});
     const UniqueFd client = dial(callerPort);
