@@ -79,12 +79,6 @@ Refusal notTrusted(const Conn &conn, const PeerIdentity &identity) {
     return keyFailure(conn, identity, "was not trusted", "Nothing was sent to it.");
 }
 
-std::string trustedValue(const PeerIdentity &identity, const std::string &expected) {
-    return expected.empty() && identity.acceptedBySystem
-               ? std::string(OvraPlatform::TrustStore::kSystem)
-               : identity.fingerprint;
-}
-
 std::string checkFingerprint(const std::string &text) {
     return OvraBase::isFingerprint(text) ? ""
                                          : "a fingerprint is SHA256: and 43 characters of base64";
@@ -177,8 +171,8 @@ Expected<void> trustPeer(const Conn &conn, const std::string &expected) {
     if (expected.empty() && !askWhetherToTrust(conn, identity)) {
         return notTrusted(conn, identity);
     }
-    switch (OvraPlatform::trustEndpoint(conn.protocol, conn.addr, conn.port,
-                                        trustedValue(identity, expected))) {
+    switch (
+        OvraPlatform::trustEndpoint(conn.protocol, conn.addr, conn.port, identity.fingerprint)) {
     case TrustVerdict::kTrusted:
         return {};
     case TrustVerdict::kDifferent:

@@ -29,9 +29,6 @@ std::string trustWord(const OvraPlatform::PeerIdentity &identity);
 /// Shows a person the key of an endpoint, which nobody has checked, and asks whether it is the one
 /// that the other appliance shows. Only where isInteractive().
 bool askWhetherToTrust(const OvraDRNode::Conn &conn, const OvraPlatform::PeerIdentity &identity);
-/// What a person's consent is kept as: the key, or that the system's certificates vouch for it.
-/// \param expected  the key that the person named, or ""
-std::string trustedValue(const OvraPlatform::PeerIdentity &identity, const std::string &expected);
 
 /// Why a key is not trusted: a person is needed; it is not the named one; the person said no.
 Refusal nobodyToAsk(const OvraDRNode::Conn &conn, const OvraPlatform::PeerIdentity &identity);

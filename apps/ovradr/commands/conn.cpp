@@ -129,7 +129,7 @@ Outcome trust(const Conn &conn, const std::string &expected) {
             return Refusal(agreed.error());
         }
     }
-    const std::string value = met ? trustedValue(*met, expected) : expected;
+    const std::string value = met ? met->fingerprint : expected;
     if (OvraPlatform::trustEndpoint(conn.protocol, conn.addr, conn.port, value, true) !=
         OvraPlatform::TrustVerdict::kTrusted) {
         return endpointFailure(conn, CredError::kTrustUnavailable);
