@@ -8,7 +8,7 @@ TEST_JOBS ?= $(shell expr 2 '*' $(JOBS))
 stage := $(CURDIR)/build/stage
 
 .DEFAULT_GOAL := help
-.PHONY: help build build-dev test demo bench vendor format check clean stage deps-build deps-test deps-lab deps-check
+.PHONY: help build build-dev test torture demo bench vendor format check clean stage deps-build deps-test deps-lab deps-check
 
 help: ## this list
 	@sed -n 's/^\([a-z-]*\):.*## /\1\t/p' $(MAKEFILE_LIST) | while IFS="$$(printf '\t')" read -r target text; do \
@@ -20,6 +20,10 @@ demo: deps-lab stage ## two appliances on this machine pair, talk and part
 test: deps-test deps-lab build-dev ## every test, each on its own node (TESTS=regex selects some)
 	@lab/lab way | sed 's/^/tests run by way of /'
 	ctest --preset dev -j $(TEST_JOBS) $(if $(TESTS),-R '$(TESTS)')
+
+torture: deps-test deps-check deps-lab build-dev ## what crashes, failing calls and rubbish leave (OVRA_TORTURE=N: how long)
+	OVRA_TORTURE=$(or $(OVRA_TORTURE),100) ctest --preset dev -L torture -j $(JOBS)
+	tools/fuzz 600
 
 bench: deps-build deps-lab build/bench/build.ninja ## the benchmarks, compared with their baselines
 	@cmake --build build/bench -j $(JOBS) --target bench

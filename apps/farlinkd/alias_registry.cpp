@@ -76,6 +76,9 @@ OvraBase::Expected<void> AliasRegistry::load() {
                       alias.name.c_str(), alias.port);
         }
     }
+    if (lines.bad()) {
+        return OvraBase::Unexpected({"there is no memory to read " + path_, ENOMEM});
+    }
     return {};
 }
 
@@ -170,6 +173,10 @@ bool AliasRegistry::store(const Entries &entries, int nextPort) const {
     text << kHeading << ' ' << nextPort << '\n';
     for (const auto &[name, alias] : entries) {
         text << name << ' ' << alias.port << ' ' << alias.expires << ' ' << alias.key << '\n';
+    }
+    if (!text) { // a stream takes exceptions for itself
+        OVRA_ERR("[%s] is not written: there is no memory for the list", path_.c_str());
+        return false;
     }
     const auto stored = OvraBase::FileUpdate::begin(path_).and_then(
         [&text](const OvraBase::FileUpdate &file) { return file.commit(text.str(), kMode); });

@@ -145,6 +145,11 @@ std::string folderOf(const std::string &path) {
     return end == std::string::npos ? "/" : path.substr(0, end + 1);
 }
 
+Expected<void> syncFolderOf(const std::string &path) {
+    const UniqueFd folder(open(folderOf(path).c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+    return folder && fsync(folder.get()) == 0 ? Expected<void>() : lastSystemError();
+}
+
 bool isTrustedOwner(const std::string &path, uid_t owner) {
     struct stat folder {};
     return owner == 0 || owner == geteuid() ||
@@ -217,8 +222,10 @@ Expected<bool> createFile(const std::string &path, std::string_view content, mod
     if (link(temporaryPath.c_str(), path.c_str()) != 0) {
         return errno == EEXIST ? Expected<bool>(false) : lastSystemError();
     }
-    const UniqueFd folder(open(folderOf(path).c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
-    return folder && fsync(folder.get()) == 0 ? Expected<bool>(true) : lastSystemError();
+    if (const Expected<void> synced = syncFolderOf(path); !synced) {
+        return Unexpected(synced.error());
+    }
+    return true;
 }
 
 Expected<FileUpdate> FileUpdate::begin(const std::string &path) {

@@ -133,7 +133,8 @@ public:
                 continue;
             }
             if (!locked) {
-                OVRA_WARN("Cache file [%s] is locked for too long", path.c_str());
+                OVRA_WARN("Cache file [%s] cannot be locked: %s", path.c_str(),
+                          locked.error().text.c_str());
                 return std::nullopt;
             }
             file.fd_ = std::move(*locked);
@@ -158,10 +159,15 @@ public:
     }
 
     /// Reads the bucket of `name` into `pair`, which must outlive the use of the bucket.
-    void load(std::string_view name, Pair &pair) {
+    /// \return false if it cannot be read: what is in it is unknown, and nothing is stored over it.
+    [[nodiscard]] bool load(std::string_view name, Pair &pair) {
         index_ = bucketOf(name, buckets_);
-        choice_ = readPair(fd_.get(), index_, pair) ? choose(pair, buckets_, index_) : Choice{};
+        if (!readPair(fd_.get(), index_, pair)) {
+            return false;
+        }
+        choice_ = choose(pair, buckets_, index_);
         copy_ = choice_.valid ? chosenCopy(pair, choice_) : nullptr;
+        return true;
     }
 
     /// The valid copy of the loaded bucket; null if there is none.
@@ -320,9 +326,16 @@ bool CacheFile::write(const CacheEntry &entry, std::int64_t now, Younger younger
         OVRA_WARN("Failed to open cache file [%s]", path_.c_str());
         return false;
     }
+    const auto failed = [this](const char *what) {
+        OVRA_WARN("Failed to %s cache file [%s]: %s", what, path_.c_str(),
+                  OvraBase::errnoText(errno).c_str());
+        return false;
+    };
     const std::int64_t oldest = now - kKeepStale;
     Pair pair;
-    file->load(entry.name, pair);
+    if (!file->load(entry.name, pair)) {
+        return failed("read");
+    }
     if (younger == Younger::kKeep && file->copy() != nullptr) {
         const std::optional<CacheEntry> stored = BucketImage::find(file->copy(), entry.name);
         if (stored && stored->end > entry.end && stored->end <= now) {
@@ -332,7 +345,9 @@ bool CacheFile::write(const CacheEntry &entry, std::int64_t now, Younger younger
     BucketImage image = file->image();
     bool fits = compose(*file, entry, oldest, image);
     while (!fits && file->grow(path_, oldest)) {
-        file->load(entry.name, pair);
+        if (!file->load(entry.name, pair)) {
+            return failed("read");
+        }
         fits = compose(*file, entry, oldest, image);
     }
     if (!fits) { // evict the oldest
@@ -342,12 +357,7 @@ bool CacheFile::write(const CacheEntry &entry, std::int64_t now, Younger younger
             image.add(other);
         }
     }
-    if (!file->store(image)) {
-        OVRA_WARN("Failed to write cache file [%s]: %s", path_.c_str(),
-                  OvraBase::errnoText(errno).c_str());
-        return false;
-    }
-    return true;
+    return file->store(image) || failed("write");
 }
 
 bool CacheFile::remove(std::string_view name) const {
@@ -359,7 +369,9 @@ bool CacheFile::remove(std::string_view name) const {
         return access(path_.c_str(), F_OK) != 0;
     }
     Pair pair;
-    file->load(name, pair);
+    if (!file->load(name, pair)) {
+        return false;
+    }
     if (file->copy() == nullptr || !BucketImage::find(file->copy(), name)) {
         return true;
     }

@@ -105,7 +105,10 @@ UniqueFd openOrReplaceCacheFile(const std::string &path, int flags) {
             return fd;
         }
         struct stat status {};
-        if (fd && fstat(fd.get(), &status) == 0 && S_ISREG(status.st_mode) && isOursAlone(status)) {
+        if (fd && fstat(fd.get(), &status) != 0) {
+            return {};
+        }
+        if (fd && S_ISREG(status.st_mode) && isOursAlone(status)) {
             return fd;
         }
         if (!discard(path)) {

@@ -105,10 +105,14 @@ bool SqliteDB::refuseNewerSchema() const {
 /// The check and the statement are one transaction, so that nobody upgrades the file in between.
 bool SqliteDB::checkedRun(Access access, const std::string &sql, std::vector<SqliteValueList> *rows,
                           bool firstOnly) {
+    const NoFork noFork;
+    // Else a power failure might bring the journal of a change back, and undo the change.
+    if (access == Access::kWrite && db_ && !sql.empty() && !execute("PRAGMA synchronous = EXTRA")) {
+        return false;
+    }
     if (!newestSchema_ || !db_ || sql.empty()) {
         return run(sql, rows, firstOnly);
     }
-    const NoFork noFork;
     if (!execute(access == Access::kWrite ? "BEGIN IMMEDIATE" : "BEGIN")) {
         return false;
     }

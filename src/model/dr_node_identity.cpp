@@ -7,6 +7,7 @@
 #include "paths.h"
 #include "words.h"
 
+#include <ovrabase/file.h>
 #include <ovracore/ovracore.h>
 #include <ovradrcore/file_lock.h>
 #include <ovradrcore/log.h>
@@ -45,8 +46,8 @@ std::optional<std::string> storedNodeId() {
     return buffer.data();
 }
 
-/// The stored id, or "" if there is none; std::nullopt if the lock could not be had, so that nobody
-/// knows.
+/// The stored id, or "" if there is none; std::nullopt if the lock could not be had, or the file
+/// not be read, so that nobody knows.
 std::optional<std::string> ReadNodeIdFromConf() {
     FileLock lock(Path::kIdentityLock);
     if (OLIBCFileExist(Path::kIdentityFile) == 0) {
@@ -62,7 +63,7 @@ std::optional<std::string> ReadNodeIdFromConf() {
     } else if (id->empty()) {
         OVRA_WARN("Invalid nodeId [%s]", id->c_str());
     }
-    return id.value_or("");
+    return id;
 }
 
 std::string generateNodeId() {
@@ -76,7 +77,7 @@ std::string generateNodeId() {
 }
 
 /// Does not read again what was read: of two processes that both found no id, the later one wins.
-/// \param unread  the file could not be read for want of the lock: an id that it holds is kept
+/// \param unread  the file could not be locked or read just now: an id that it holds is kept
 std::string CreateNodeId(bool unread) {
     FileLock lock(Path::kIdentityLock);
     std::string id = generateNodeId();
@@ -143,7 +144,10 @@ bool DRNode::resetLocalNodeId() {
     FileLock lock(Path::kIdentityLock);
     const bool locked = lock.lock(kWriteLock, kLockWait);
     if (locked) {
-        unlink(Path::kIdentityFile);
+        // Else a power failure might bring the old id back.
+        if (unlink(Path::kIdentityFile) == 0) {
+            (void)OvraBase::syncFolderOf(Path::kIdentityFile);
+        }
     } else {
         OVRA_ERR("Failed to lock [%s]", Path::kIdentityLock);
     }

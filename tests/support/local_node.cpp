@@ -30,11 +30,11 @@ void provisionNode() {
     executeSql(std::string(std::istreambuf_iterator<char>(file), {}));
 }
 
-std::string querySql(const std::string &sql) {
+std::string querySql(const std::string &sql, const char *path) {
     sqlite3 *db = nullptr;
     std::string rows;
     char *error = nullptr;
-    if (sqlite3_open(kNodeDatabase, &db) != SQLITE_OK ||
+    if (sqlite3_open(path, &db) != SQLITE_OK ||
         sqlite3_exec(db, sql.c_str(), collect, &rows, &error) != SQLITE_OK) {
         std::cerr << "test set-up failed: " << (error != nullptr ? error : "open") << "\n";
         std::abort();

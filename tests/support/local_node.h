@@ -11,9 +11,9 @@ inline constexpr const char *kIdentityFile = "/usr/ovra/etc/ovradr/node.info";
 /// Creates the folders and the node database in the test's sandbox, as set-up would.
 void provisionNode();
 
-/// Runs statements on the node database without the library.
+/// Runs statements on a database without the library.
 /// \return the rows, columns joined by '|', rows by '\n'
-std::string querySql(const std::string &sql);
+std::string querySql(const std::string &sql, const char *path = kNodeDatabase);
 inline void executeSql(const std::string &sql) {
     querySql(sql);
 }

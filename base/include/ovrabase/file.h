@@ -23,6 +23,9 @@ inline constexpr std::size_t kMaxTextFile = 1UL << 20U;
 /// The parent folder of a path; "." for a bare name.
 std::string folderOf(const std::string &path);
 
+/// Synchronises the parent folder: a name made or removed there stays so after a power failure.
+[[nodiscard]] Expected<void> syncFolderOf(const std::string &path);
+
 /// Whether a file of this owner may be relied on: the superuser's, our own user's, or that of whom
 /// its folder belongs to, who could replace it anyway.
 bool isTrustedOwner(const std::string &path, uid_t owner);

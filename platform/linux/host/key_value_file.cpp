@@ -157,7 +157,11 @@ std::string replaceKeyValue(std::string_view text, std::string_view key, std::st
 
 int OLIBCFileExist(const char *path) {
     struct stat status {};
-    return path != nullptr && stat(path, &status) == 0 ? 1 : 0;
+    if (path == nullptr) {
+        return 0;
+    }
+    // What cannot be looked at just now is not missing: a new identity would be made over it.
+    return stat(path, &status) == 0 || (errno != ENOENT && errno != ENOTDIR) ? 1 : 0;
 }
 
 int OLIBCFileGetKeyValue(const char *path, const char *key, char *buffer, int size, int /*flag*/) {

@@ -53,31 +53,39 @@ void Statement::Finalize::operator()(sqlite3_stmt *statement) const {
 }
 
 Statement &Statement::bind(int index, std::string_view text) {
-    sqlite3_bind_text64(statement_.get(), index, text.data() == nullptr ? "" : text.data(),
-                        text.size(), SQLITE_TRANSIENT, SQLITE_UTF8);
-    return *this;
+    return noteBound(sqlite3_bind_text64(statement_.get(), index,
+                                         text.data() == nullptr ? "" : text.data(), text.size(),
+                                         SQLITE_TRANSIENT, SQLITE_UTF8));
 }
 
 Statement &Statement::bind(int index, std::int64_t number) {
-    sqlite3_bind_int64(statement_.get(), index, number);
-    return *this;
+    return noteBound(sqlite3_bind_int64(statement_.get(), index, number));
 }
 
 Statement &Statement::bindBlob(int index, std::string_view bytes) {
-    sqlite3_bind_blob64(statement_.get(), index, bytes.data(), bytes.size(), SQLITE_TRANSIENT);
-    return *this;
+    return noteBound(
+        sqlite3_bind_blob64(statement_.get(), index, bytes.data(), bytes.size(), SQLITE_TRANSIENT));
 }
 
 Statement &Statement::bindOptional(int index, std::string_view text) {
     if (text.empty()) {
-        sqlite3_bind_null(statement_.get(), index);
-        return *this;
+        return noteBound(sqlite3_bind_null(statement_.get(), index));
     }
     return bind(index, text);
 }
 
+Statement &Statement::noteBound(int code) {
+    bound_ = bound_ == SQLITE_OK ? code : bound_;
+    return *this;
+}
+
+bool Statement::isBound() {
+    return statement_ != nullptr &&
+           (bound_ == SQLITE_OK || database_->failSqlite(bound_, sqlite3_errstr(bound_)));
+}
+
 bool Statement::step() {
-    if (statement_ == nullptr) {
+    if (!isBound()) {
         return false;
     }
     const int code = sqlite3_step(statement_.get());
@@ -88,7 +96,7 @@ bool Statement::step() {
 }
 
 bool Statement::run() {
-    if (statement_ == nullptr) {
+    if (!isBound()) {
         return false;
     }
     const int code = sqlite3_step(statement_.get());
@@ -191,9 +199,11 @@ std::optional<std::int64_t> Database::pragma(const char *sql) {
 }
 
 bool Database::setUp() {
-    // What is deleted, ids and secrets, is overwritten in the file. One transaction around what is
-    // read, because each statement by itself would lock and check the file anew.
-    if (!execute("PRAGMA secure_delete = ON; BEGIN")) {
+    // What is deleted, ids and secrets, is overwritten in the file. The end of a change, which is
+    // that its journal is removed, is synchronised too: a power failure might bring the journal
+    // back, and undo what was acknowledged. One transaction around what is read, because each
+    // statement by itself would lock and check the file anew.
+    if (!execute("PRAGMA secure_delete = ON; PRAGMA synchronous = EXTRA; BEGIN")) {
         return false;
     }
     const auto version = pragma("PRAGMA user_version");

@@ -55,12 +55,17 @@ private:
         void operator()(sqlite3_stmt *statement) const;
     };
 
+    /// What was not bound would be NULL: such a statement does not run.
+    [[nodiscard]] bool isBound();
+    Statement &noteBound(int code);
+
     Statement(class Database *database, sqlite3_stmt *statement)
         : database_(database)
         , statement_(statement) {}
 
     OvraDRCore::NoFork noFork_;
     class Database *database_;
+    int bound_ = 0; ///< SQLite's code for the first value that could not be bound
     std::unique_ptr<sqlite3_stmt, Finalize> statement_;
 };
 
