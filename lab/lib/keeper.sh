@@ -45,7 +45,7 @@ startProots() {
         mkdir "$lab/n$i/root"
         prootView "$lab/n$i/root" "$labRoot" "$labPrefix" "$lab"
         printf '%s\0' "${viewArgs[@]}" >"$lab/n$i/proot.args"
-        PROOT_TMP_DIR=$lab/n$i perl "$labLib/old-syscalls.pl" proot -v -1 "${viewArgs[@]}" -w / \
+        OVRADR_DUMPABLE=1 PROOT_TMP_DIR=$lab/n$i perl "$labLib/old-syscalls.pl" proot -v -1 "${viewArgs[@]}" -w / \
             /bin/bash "$labLib/node.sh" "$lab" "$i" 9<&- </dev/null &
         done
 }
