@@ -12,6 +12,7 @@
 #include <condition_variable>
 #include <csignal>
 #include <cstdio>
+#include <cstdlib>
 #include <mutex>
 #include <system_error>
 #include <thread>
@@ -59,10 +60,13 @@ void keepMemorySmall() {
 #ifdef __GLIBC__
     // Large pieces, bodies and replies, come from the system and go back to it at once; a fixed
     // threshold is not raised by the first of them that is freed, as the default one is. Few
-    // arenas, because each keeps its own freed memory.
+    // arenas, because each keeps its own freed memory; the environment may say otherwise
+    // (mallopt(3)).
     mallopt(M_MMAP_THRESHOLD, 128 * 1024);
     mallopt(M_TRIM_THRESHOLD, 1024 * 1024);
-    mallopt(M_ARENA_MAX, 4);
+    if (std::getenv("MALLOC_ARENA_MAX") == nullptr) { // NOLINT(concurrency-mt-unsafe)
+        mallopt(M_ARENA_MAX, 4);
+    }
 #endif
 }
 

@@ -14,6 +14,8 @@ lib=$(dirname "${BASH_SOURCE[0]}")
 . "$lib/way.sh"
 # shellcheck source=lab/lib/view.sh
 . "$lib/view.sh"
+# shellcheck source=lab/lib/proot.sh
+. "$lib/proot.sh"
 # shellcheck source=lab/lib/state.sh
 . "$lib/state.sh"
 
@@ -45,9 +47,8 @@ startProots() {
         mkdir "$lab/n$i/root"
         prootView "$lab/n$i/root" "$labRoot" "$labPrefix" "$lab"
         printf '%s\0' "${viewArgs[@]}" >"$lab/n$i/proot.args"
-        OVRADR_DUMPABLE=1 PROOT_TMP_DIR=$lab/n$i perl "$labLib/old-syscalls.pl" proot -v -1 "${viewArgs[@]}" -w / \
-            /bin/bash "$labLib/node.sh" "$lab" "$i" 9<&- </dev/null &
-        done
+        asProot "$lab/n$i" /bin/bash "$labLib/node.sh" "$lab" "$i" 9<&- </dev/null &
+    done
 }
 
 PATH=$(insidePath "$labPrefix")
