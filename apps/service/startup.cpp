@@ -62,11 +62,13 @@ void keepMemorySmall() {
     // threshold is not raised by the first of them that is freed, as the default one is. Few
     // arenas, because each keeps its own freed memory; the environment may say otherwise
     // (mallopt(3)).
+    // NOLINTBEGIN(concurrency-mt-unsafe): called before there are threads
     mallopt(M_MMAP_THRESHOLD, 128 * 1024);
     mallopt(M_TRIM_THRESHOLD, 1024 * 1024);
-    if (std::getenv("MALLOC_ARENA_MAX") == nullptr) { // NOLINT(concurrency-mt-unsafe)
+    if (std::getenv("MALLOC_ARENA_MAX") == nullptr) {
         mallopt(M_ARENA_MAX, 4);
     }
+    // NOLINTEND(concurrency-mt-unsafe)
 #endif
 }
 
@@ -101,7 +103,8 @@ EndSignals::EndSignals()
         state->changed.notify_all();
         std::this_thread::sleep_for(kEndTime);
         alarm(1); // what does not end may be the system log
-        OVRA_WARN("Something does not end: it is left");
+        OVRA_LOG_IN(OvraDRCore::LogLevel::kWarn, "EndSignals",
+                    "Something does not end: it is left");
         _exit(static_cast<int>(ExitCode::kFailed));
     }).detach();
 }

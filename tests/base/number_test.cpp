@@ -30,12 +30,9 @@ TEST(Utf8, IsTheShortestFormOfACharacterThatThereIs) {
          {"", "az~", "\u0080\u07ff", "\u0800\ud7ff\ue000\uffff", "\U00010000\U0010ffff"}) {
         EXPECT_TRUE(isUtf8(text)) << text;
     }
-    for (const char *text :
-         {"a\x80", "\xbf", "\xc1\xbf", "\xc3",
-          "\xc3"
-          "a",
-          "\xe0\x9f\xbf", "\xe2\x82", "\xed\xa0\x80", "\xed\xbf\xbf", "\xf0\x8f\xbf\xbf",
-          "\xf0\x9f\x98", "\xf4\x90\x80\x80", "\xf8\x88\x80\x80\x80", "\xff"}) {
+    for (const char *text : {"a\x80", "\xbf", "\xc1\xbf", "\xc3", "\xc3z", "\xe0\x9f\xbf",
+                             "\xe2\x82", "\xed\xa0\x80", "\xed\xbf\xbf", "\xf0\x8f\xbf\xbf",
+                             "\xf0\x9f\x98", "\xf4\x90\x80\x80", "\xf8\x88\x80\x80\x80", "\xff"}) {
         EXPECT_FALSE(isUtf8(text)) << text;
     }
     EXPECT_EQ(firstUtf8("\U0001f600x").code, U'\U0001f600');

@@ -64,7 +64,7 @@ std::vector<Conn> localConns(Json::Value &refusal) {
 /// The account of this appliance with whose rights another node comes back.
 std::string readLocalAccount(Params &in, const APICaller &caller) {
     constexpr char kName[] = "local_account";
-    const std::string named = in.optionalText(kName, Params::kMaxAccount);
+    std::string named = in.optionalText(kName, Params::kMaxAccount);
     if (named.empty() && !caller.local) {
         return caller.user;
     }

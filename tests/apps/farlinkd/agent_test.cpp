@@ -31,8 +31,10 @@ class TheFarlinkAgent : public testing::Test {
 protected:
     TheFarlinkAgent() {
         makeFolders();
-        int port = 0;
-        EXPECT_EQ(std::sscanf(relay.line().c_str(), "farlinkd: ready, https %d", &port), 1);
+        constexpr std::string_view kReady = "farlinkd: ready, https ";
+        const std::string line = relay.line();
+        EXPECT_EQ(line.rfind(kReady, 0), 0U) << line;
+        const int port = std::stoi(line.substr(kReady.size()));
         settings = {"127.0.0.1", port, "nas"};
         const auto met = OvraPlatform::peerFingerprint("https", "127.0.0.1", port, 10);
         EXPECT_TRUE(met);
