@@ -7,7 +7,6 @@
 #include <string>
 
 using OvraFuzz::require;
-using OvraPlatform::WireCall;
 
 // A body that is accepted can be written again and means the same.
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t *data, std::size_t size) {

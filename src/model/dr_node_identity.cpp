@@ -57,7 +57,7 @@ std::optional<std::string> ReadNodeIdFromConf() {
         OVRA_ERR("Failed to lock [%s]", Path::kIdentityLock);
         return std::nullopt;
     }
-    const std::optional<std::string> id = storedNodeId();
+    std::optional<std::string> id = storedNodeId();
     if (!id) {
         OVRA_ERR("Failed to get nodeId");
     } else if (id->empty()) {
@@ -130,7 +130,7 @@ std::string DRNode::getLocalNodeId() {
     if (stored && !stored->empty()) {
         return *stored;
     }
-    const std::string id = CreateNodeId(!stored);
+    std::string id = CreateNodeId(!stored);
     if (id.empty()) {
         OVRA_ERR("Failed to create nodeId");
     }
