@@ -126,6 +126,11 @@ TEST_F(Pairing, AtATerminalTheKeyThePasswordAndTheCodeAreAskedFor) {
     EXPECT_EQ(distrustful.finish(), 6);
     EXPECT_EQ(tested()["trust"], "unknown");
 
+    remote.answer("login", R"({"success":false,"error":{"code":107,"msg":"full: try in 9 s"}})");
+    const Result throttled = logIn(remote, create);
+    EXPECT_NE(throttled.err.find("Try in 9 s."), std::string::npos) << throttled.err;
+    EXPECT_EQ(run({"conn", "forget", url}).exit, 0);
+
     remote.answer("login", refusal(403));
     Terminal terminal(command);
     ASSERT_TRUE(terminal.shows(remote.server.fingerprint())) << terminal.screen();
