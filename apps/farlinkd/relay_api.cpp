@@ -12,7 +12,9 @@
 #include <algorithm>
 #include <ctime>
 #include <functional>
+#include <iterator>
 #include <memory>
+#include <string_view>
 #include <utility>
 #include <vector>
 
@@ -136,6 +138,10 @@ void RelayApi::handle(OvraService::HttpRequest &request, const Answer &answer) {
     if (call->api != OvraPlatform::kFarlinkApi || call->version != 1) {
         return reply(apiError(APIError::kNoSuchAPI, "this is a relay service: it has no such API"));
     }
+    constexpr std::string_view kMethods[] = {"lookup", "challenge", "wait", "enrol", "release"};
+    if (std::find(std::begin(kMethods), std::end(kMethods), call->method) == std::end(kMethods)) {
+        return reply(apiError(APIError::kNoSuchMethod, "the relay service has no such method"));
+    }
     std::unique_lock lock(mutex_);
     if (!calls_.allow(request.address, Clock::now())) {
         return reply(
@@ -171,10 +177,8 @@ void RelayApi::handle(OvraService::HttpRequest &request, const Answer &answer) {
                 apiError(APIError::kNoPermission, "the proof of the key is not valid: try again"));
         }
         change = [this, params, address = request.address] { return enrol(params, address); };
-    } else if (call->method == "release") {
-        change = [this, params] { return release(params); };
     } else {
-        return reply(apiError(APIError::kNoSuchMethod, "the relay service has no such method"));
+        change = [this, params] { return release(params); };
     }
     const auto leave = [answer] { answer(tooMuchToDo()); };
     if (!changes_.submit(

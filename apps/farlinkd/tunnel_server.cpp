@@ -20,6 +20,7 @@
 #include <cerrno>
 #include <map>
 #include <mutex>
+#include <optional>
 #include <thread>
 #include <unordered_map>
 #include <utility>
@@ -104,9 +105,9 @@ struct TunnelServer::Impl {
     void remove(int fd);
     void closeAlias(const std::string &alias);
     void endOverdue();
-    [[nodiscard]] bool dropOldest(const std::vector<Socket *> &among);
     template <typename IsOne>
-    [[nodiscard]] bool makeRoom(const IsOne &isOne, std::size_t most, const std::string &client);
+    [[nodiscard]] std::optional<Socket *> placeFor(const IsOne &isOne, std::size_t most,
+                                                   const std::string &client) const;
     Socket *findWaiting(const std::string &caller);
 
     const Announce announce;
@@ -141,27 +142,27 @@ Socket *TunnelServer::Impl::add(UniqueFd fd, Kind kind, const std::string &alias
     return (sockets[number] = std::move(socket)).get();
 }
 
-/// Drops the one that has waited longest; false if none waits.
-bool TunnelServer::Impl::dropOldest(const std::vector<Socket *> &among) {
-    Socket *victim = nullptr;
+namespace {
+
+/// The one that has waited longest; std::nullopt if none waits.
+std::optional<Socket *> oldestOf(const std::vector<Socket *> &among) {
+    std::optional<Socket *> oldest;
     for (Socket *const each : among) {
-        const bool waits = each->kind != Kind::kConnected;
-        if (waits && (victim == nullptr || each->since < victim->since)) {
-            victim = each;
+        if (each->kind != Socket::Kind::kConnected && (!oldest || each->since < (*oldest)->since)) {
+            oldest = each;
         }
     }
-    if (victim == nullptr) {
-        return false;
-    }
-    drop(*victim);
-    return true;
+    return oldest;
 }
 
-/// Whether one more socket of the client may take a place; another one may be dropped for it.
-/// \param isOne  which sockets have such a place
-/// \param most   how many there may be
+} // namespace
+
+/// Whose place one more socket of the client may take: null for a free one, std::nullopt if there
+/// is none for it. \param isOne  which sockets have such a place \param most   how many there may
+/// be
 template <typename IsOne>
-bool TunnelServer::Impl::makeRoom(const IsOne &isOne, std::size_t most, const std::string &client) {
+std::optional<Socket *> TunnelServer::Impl::placeFor(const IsOne &isOne, std::size_t most,
+                                                     const std::string &client) const {
     std::map<std::string, std::vector<Socket *>> byClient;
     std::size_t all = 0;
     for (const auto &[fd, socket] : sockets) {
@@ -173,16 +174,16 @@ bool TunnelServer::Impl::makeRoom(const IsOne &isOne, std::size_t most, const st
     const std::vector<Socket *> &own = byClient[client];
     if (own.size() >= std::max<std::size_t>(most / limits.clientsShare, 1)) {
         // An appliance says its line at once, so the silent one is none.
-        return own.front()->kind == Kind::kArriving && dropOldest(own);
+        return own.front()->kind == Kind::kArriving ? oldestOf(own) : std::nullopt;
     }
     if (all < most) {
-        return true;
+        return nullptr;
     }
     const std::vector<Socket *> &greatest =
         std::max_element(byClient.begin(), byClient.end(), [](const auto &a, const auto &b) {
             return a.second.size() < b.second.size();
         })->second;
-    return greatest.size() > own.size() + 1 && dropOldest(greatest);
+    return greatest.size() > own.size() + 1 ? oldestOf(greatest) : std::nullopt;
 }
 
 Socket *TunnelServer::Impl::findWaiting(const std::string &caller) {
@@ -260,11 +261,16 @@ void TunnelServer::Impl::acceptCallers(const Socket &listening) {
 
 void TunnelServer::Impl::acceptCaller(const std::string &alias, UniqueFd fd,
                                       const std::string &client) {
-    const auto calls = [](const Socket &socket) { return socket.calls; };
     const auto callsAlias = [&alias](const Socket &socket) {
         return socket.calls && socket.alias == alias;
     };
-    if (!makeRoom(callsAlias, limits.perAlias, client) || !makeRoom(calls, limits.calls, client)) {
+    const auto ofAlias = placeFor(callsAlias, limits.perAlias, client);
+    const Socket *const leaving = ofAlias.value_or(nullptr);
+    const auto stays = [leaving](const Socket &socket) {
+        return socket.calls && &socket != leaving;
+    };
+    const auto ofAll = placeFor(stays, limits.calls, client);
+    if (!ofAlias || !ofAll) {
         if (linesOfRefusals.allow(client, Clock::now())) {
             OVRA_NOTICE("A caller of [%s] from [%s] is turned away: too many at once",
                         alias.c_str(), client.c_str());
@@ -274,6 +280,11 @@ void TunnelServer::Impl::acceptCaller(const std::string &alias, UniqueFd fd,
     const std::string caller = newCaller();
     if (!announce(alias, caller, client)) {
         return; // closing it says so
+    }
+    for (Socket *const victim : {*ofAlias, *ofAll}) {
+        if (victim != nullptr) {
+            drop(*victim);
+        }
     }
     tune(fd.get());
     // Nothing is read before there is a receiver.
@@ -292,8 +303,12 @@ void TunnelServer::Impl::acceptAppliances(const Socket &tunnel) {
         if (!fd) {
             return;
         }
-        if (!makeRoom(arrives, limits.arriving, client)) {
+        const auto place = placeFor(arrives, limits.arriving, client);
+        if (!place) {
             continue;
+        }
+        if (*place != nullptr) {
+            drop(**place);
         }
         tune(fd.get());
         if (Socket *const added = add(std::move(fd), Kind::kArriving, "", EPOLLIN)) {

@@ -6,6 +6,7 @@
 #include <ovradrcore/json.h>
 #include <ovradrcore/response.h>
 #include <ovraplatform/api_errors.h>
+#include <ovraplatform/login_refusal.h>
 
 #include <unistd.h>
 
@@ -241,6 +242,10 @@ Refusal failureOf(const OvraDRCore::ErrRecorder &error) {
     const OvraPlatform::CredError noReply = OvraPlatform::lastLoginError();
     if (error.GetErrCode() == ERR::kLoginFailed && noReply != OvraPlatform::CredError::kNone) {
         return failureOf(ERR::kCredLibrary, static_cast<int>(noReply));
+    }
+    const OvraPlatform::LoginRefusal refusal = OvraPlatform::lastLoginRefusal();
+    if (error.GetErrCode() == ERR::kLoginFailed && refusal.code != 0) {
+        return failureOf(refusal.code, refusal.detail);
     }
     return failureOf(error.GetErrCode(), error.GetErrMsg());
 }

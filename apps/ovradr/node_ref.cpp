@@ -68,6 +68,26 @@ Expected<std::set<std::string>> listNodes() {
     return ids;
 }
 
+Expected<std::vector<DRNode>> allCredentials() {
+    std::vector<OvraDRCore::SqliteValueList> rows;
+    for (const OvraDRCore::SqliteTableHandler &table :
+         {OvraDRCore::SqliteTableHandler(OvraDRNode::NodeCredSqliteTable()),
+          OvraDRCore::SqliteTableHandler(OvraDRNode::TempCredSqliteTable())}) {
+        OvraDRCore::SelectCommand command;
+        command.SelectAll();
+        command.SetTable(table);
+        if (!OvraDRNode::NodeDBHandler::GetHandler().SelectRecords(command, rows)) {
+            return failure(ExitCode::kNotSetUp, "The credentials of this node cannot be read.",
+                           "The system log says why; correct that and try again.");
+        }
+    }
+    std::vector<DRNode> records(rows.size());
+    for (std::size_t i = 0; i < rows.size(); ++i) {
+        (void)records[i].FromSqliteValues(rows[i]); // an incomplete row counts too
+    }
+    return records;
+}
+
 Expected<std::string> resolveNode(const std::string &text) {
     Expected<std::string> local = localNode();
     if (!local || text == kLocalWord || text == *local) {

@@ -7,6 +7,7 @@
 
 #include <set>
 #include <string>
+#include <vector>
 
 namespace Ovradr {
 
@@ -15,6 +16,9 @@ namespace Ovradr {
 
 /// The ids of this node and of all nodes that a credential reaches.
 [[nodiscard]] Expected<std::set<std::string>> listNodes();
+
+/// Every credential of this node, lasting and temporary; a failure if not all can be read.
+[[nodiscard]] Expected<std::vector<OvraDRNode::DRNode>> allCredentials();
 
 /// The one of `ids` that equals `text` or is the only one to begin with it.
 /// \param what  what the ids name, e.g. "node"

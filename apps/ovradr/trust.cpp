@@ -2,6 +2,7 @@
 #include "trust.h"
 
 #include "endpoint.h"
+#include "node_ref.h"
 #include "output.h"
 #include "prompt.h"
 #include "target.h"
@@ -53,6 +54,21 @@ const char *standing(TrustVerdict verdict) {
 }
 
 } // namespace
+
+void endLossOfKeys() {
+    OvraPlatform::TrustStore store;
+    if (store.problem().empty()) {
+        return;
+    }
+    const auto creds = allCredentials();
+    if (creds && std::all_of(creds->begin(), creds->end(), [&store](const auto &record) {
+            const Conn &conn = record.conn;
+            return store.find(OvraPlatform::trustKey(conn.protocol, conn.addr, conn.port))
+                .has_value();
+        })) {
+        (void)store.create(); // else it stays as it is, and `ovradr doctor` says so
+    }
+}
 
 bool askWhetherToTrust(const Conn &conn, const PeerIdentity &identity) {
     std::fprintf(stderr,
@@ -116,6 +132,7 @@ std::string trustWord(const PeerIdentity &identity) {
     case TrustVerdict::kLost:
         return "lost";
     case TrustVerdict::kUnavailable:
+    case TrustVerdict::kShortage:
         return "unavailable";
     default:
         return "unknown";
@@ -158,7 +175,7 @@ Expected<void> trustPeer(const Conn &conn, const std::string &expected) {
     if (identity.isChanged()) {
         return changedKey(conn, identity);
     }
-    if (identity.pinned == TrustVerdict::kUnavailable) {
+    if (trustWord(identity) == "unavailable") {
         return endpointFailure(conn, CredError::kTrustUnavailable);
     }
     // A key that is named is pinned, whoever else vouches for it.
@@ -174,6 +191,7 @@ Expected<void> trustPeer(const Conn &conn, const std::string &expected) {
     switch (
         OvraPlatform::trustEndpoint(conn.protocol, conn.addr, conn.port, identity.fingerprint)) {
     case TrustVerdict::kTrusted:
+        endLossOfKeys();
         return {};
     case TrustVerdict::kDifferent:
         return changedKey(conn, identity);

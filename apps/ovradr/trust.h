@@ -35,6 +35,10 @@ Refusal nobodyToAsk(const OvraDRNode::Conn &conn, const OvraPlatform::PeerIdenti
 Refusal notNamed(const OvraDRNode::Conn &conn, const OvraPlatform::PeerIdentity &identity);
 Refusal notTrusted(const OvraDRNode::Conn &conn, const OvraPlatform::PeerIdentity &identity);
 
+/// After a person trusted a key: once one is known for every endpoint of a credential, no key is
+/// taken for lost any more with a file of trusted keys that was.
+void endLossOfKeys();
+
 /// Makes sure that the key of a direct endpoint is trusted before anything secret is sent to it. A
 /// key that is not known is trusted if it is the expected one, or if the user at the terminal
 /// confirms it; an expected one is pinned whoever else vouches for it. Another key than the known

@@ -187,6 +187,7 @@ tl::expected<void, StartError> Daemon::start() {
         self.http->adopt(std::move(client));
     });
     self.addHandlers();
+    self.loginApi.recall();
     self.queues.emplace();
     self.retries.emplace(self.queues->outbound);
     self.dispatcher.emplace(self.registry, *self.keys, self.guard, self.loginApi, *self.queues,

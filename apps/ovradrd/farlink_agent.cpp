@@ -71,7 +71,7 @@ struct FarlinkAgent::State {
     std::mutex mutex;
     std::condition_variable changed;
     bool stopping = false;
-    bool ended = true;
+    bool ended = false;
     Status status;
     std::function<void(OvraService::ConnectedClient)> take; ///< empty once it stops
 
@@ -228,12 +228,13 @@ FarlinkAgent::FarlinkAgent(std::function<void(OvraService::ConnectedClient)> tak
 }
 
 void FarlinkAgent::start() {
-    state_->ended = false;
-    std::thread([state = state_] { runToTheEnd(state); }).detach();
+    thread_ = std::thread([state = state_] { runToTheEnd(state); });
 }
 
 FarlinkAgent::~FarlinkAgent() {
-    stop(std::chrono::steady_clock::now());
+    if (!stop(std::chrono::steady_clock::now())) {
+        thread_.detach();
+    }
 }
 
 FarlinkAgent::Status FarlinkAgent::status() const {
@@ -246,7 +247,16 @@ bool FarlinkAgent::stop(std::chrono::steady_clock::time_point deadline) {
     state_->stopping = true;
     state_->take = nullptr;
     state_->changed.notify_all();
-    return state_->changed.wait_until(lock, deadline, [this] { return state_->ended; });
+    if (!thread_.joinable()) {
+        return true;
+    }
+    if (!state_->changed.wait_until(lock, deadline, [this] { return state_->ended; })) {
+        return false;
+    }
+    // What libraries keep for the thread is freed only after its function has returned.
+    lock.unlock();
+    thread_.join();
+    return true;
 }
 
 } // namespace Ovradrd

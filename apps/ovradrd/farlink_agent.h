@@ -8,6 +8,7 @@
 #include <functional>
 #include <memory>
 #include <string>
+#include <thread>
 
 namespace Ovradrd {
 
@@ -33,7 +34,7 @@ public:
     /// Begins.
     void start();
     Status status() const;
-    /// Takes no more callers. \return whether the thread ended by `deadline`, or never began
+    /// Takes no more callers. \return whether the thread is gone by `deadline`, or never began
     bool stop(std::chrono::steady_clock::time_point deadline);
 
 private:
@@ -42,6 +43,7 @@ private:
     static void runToTheEnd(const std::shared_ptr<State> &state);
 
     std::shared_ptr<State> state_;
+    std::thread thread_;
 };
 
 } // namespace Ovradrd

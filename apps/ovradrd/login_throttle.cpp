@@ -119,18 +119,37 @@ void LoginThrottle::giveFileUp() {
              path_.c_str());
 }
 
-bool LoginThrottle::knows(const Login &login) {
-    if (now() < fileFrom_) {
-        return false;
-    }
+void LoginThrottle::recall() {
+    std::unordered_map<std::string, std::int64_t> known;
     Database file(path_, kLayout);
-    const std::string account = keyOf({login.account});
-    const bool known = isKnown(file, account, keyOf({"device", login.device}), 0) ||
-                       isKnown(file, account, placeOf(login), addressesSince());
-    if (!file.isOpen() || file.failed()) {
-        giveFileUp();
+    if (file.isOpen()) {
+        Statement row = file.prepare("SELECT account, client, used FROM known");
+        while (row.step()) {
+            known[row.text(0) + row.text(1)] = row.number(2);
+        }
     }
-    return known;
+    const std::lock_guard lock(knownMutex_);
+    known_ = std::move(known);
+}
+
+bool LoginThrottle::knows(const Login &login) const {
+    const std::string account = keyOf({login.account});
+    const std::lock_guard lock(knownMutex_);
+    const auto isIn = [&](const std::string &client, std::int64_t since) {
+        const auto found = known_.find(account + client);
+        return found != known_.end() && found->second > since;
+    };
+    return isIn(keyOf({"device", login.device}), 0) || isIn(placeOf(login), addressesSince());
+}
+
+void LoginThrottle::learn(const std::string &account, const std::string &client,
+                          std::int64_t used) {
+    std::unique_lock lock(knownMutex_);
+    known_[account + client] = used;
+    if (known_.size() > std::size_t{2} * kMaxKnownOfAll) {
+        lock.unlock();
+        recall(); // without those that the file has forgotten
+    }
 }
 
 /// Carries out the work in one transaction of the file, or in memory.
@@ -298,12 +317,22 @@ void LoginThrottle::withdraw(const Attempt &attempt) {
 void LoginThrottle::recordSuccess(const Login &login, const Attempt &attempt) {
     const std::int64_t time = clock_.system();
     const std::string account = keyOf({login.account});
+    std::vector<std::string> clients;
+    if (!login.address.empty()) {
+        clients.push_back(placeOf(login));
+    }
+    if (!login.device.empty()) {
+        clients.push_back(keyOf({"device", login.device}));
+    }
     (void)change([&](Database &database) {
         return refund(database, attempt) &&
-               (login.address.empty() || remember(database, account, placeOf(login), time)) &&
-               (login.device.empty() ||
-                remember(database, account, keyOf({"device", login.device}), time));
+               std::all_of(clients.begin(), clients.end(), [&](const std::string &client) {
+                   return remember(database, account, client, time);
+               });
     });
+    for (const std::string &client : clients) {
+        learn(account, client, time);
+    }
 }
 
 } // namespace Ovradrd

@@ -16,6 +16,7 @@
 #include <optional>
 #include <string>
 #include <string_view>
+#include <unordered_map>
 #include <vector>
 
 namespace Ovradrd {
@@ -67,8 +68,11 @@ public:
     explicit LoginThrottle(std::string path = OvraPlatform::kLoginsFile,
                            Clock clock = systemClock());
 
-    /// Whether the client logged in to the account before.
-    [[nodiscard]] bool knows(const Login &login);
+    /// Reads which clients are known, for knows(); before the first log-in.
+    void recall();
+    /// Whether the client logged in to the account before, as far as memory goes: for whoever must
+    /// not wait for the disk. admit() looks at the file.
+    [[nodiscard]] bool knows(const Login &login) const;
     /// Asks for a log-in and counts it as a guess.
     /// \return how long to wait if there were too many guesses: nothing is counted, and the
     ///         password must not be checked.
@@ -99,6 +103,7 @@ private:
     std::int64_t now() const;
     std::int64_t addressesSince() const;
     void giveFileUp();
+    void learn(const std::string &account, const std::string &client, std::int64_t used);
 
     const std::string path_;
     const Clock clock_;
@@ -106,6 +111,8 @@ private:
     std::mutex mutex_;
     std::atomic<std::int64_t> fileFrom_ = 0; ///< from when on the file is tried again
     std::optional<Database> memory_;
+    mutable std::mutex knownMutex_;
+    std::unordered_map<std::string, std::int64_t> known_; ///< account and client -> last used
 };
 
 } // namespace Ovradrd

@@ -127,13 +127,25 @@ FlowResult runWithRelease(const DRNode &record, bool temporary, const Conn &conn
     return result;
 }
 
-/// Has a session released later, unless a credential uses it by then.
-void releaseLater(const PendingRelease &pending) {
+/// Runs a flow that obtains a session, which is noted while no row uses it: whoever kills this
+/// process then leaves the note. If the flow fails, it is released later.
+/// \param record  has the credential's id
+template <typename Flow, typename Run>
+bool runWithGrant(Flow &flow, const DRNode &record, const Conn &conn, Run run) {
     PendingReleases store;
-    if (!pending.session.empty() && !store.note(pending)) {
+    bool noted = false;
+    flow.setGrantObserver(
+        [&](const std::string &session) { noted = store.note(noteFor(record, session, conn)); });
+    const bool done = run();
+    flow.setGrantObserver({});
+    const PendingRelease pending = noteFor(record, flow.getGrantedSession(), conn);
+    if (done) {
+        (void)store.remove(pending); // one that stays is found in use
+    } else if (!noted && !pending.session.empty()) {
         OVRA_ERR("The session [%s] at node [%s] is left behind: end it there",
                  pending.reference().c_str(), pending.nodeId.c_str());
     }
+    return done;
 }
 
 } // namespace
@@ -162,12 +174,10 @@ FlowState createCredential(OvraDRNode::CredCreate &flow) {
     if (lock.isBusy()) {
         return FlowState::kBusy;
     }
-    if (flow.processKnownNode()) {
-        return FlowState::kDone;
-    }
     const DRNode &record = flow.getNode();
-    releaseLater(noteFor(record, flow.getGrantedSession(), record.conn));
-    return FlowState::kFailed;
+    const bool done =
+        runWithGrant(flow, record, record.conn, [&flow] { return flow.processKnownNode(); });
+    return done ? FlowState::kDone : FlowState::kFailed;
 }
 
 FlowResult changeCredential(OvraDRNode::DRNodeCredSet &flow, const DRNode &record,
@@ -177,12 +187,7 @@ FlowResult changeCredential(OvraDRNode::DRNodeCredSet &flow, const DRNode &recor
             return false;
         }
         flow.setStoredConn(conn);
-        if (!flow.process()) {
-            // If it is the present one, the note is removed with that of the present one.
-            releaseLater(noteFor(record, flow.getGrantedSession(), conn));
-            return false;
-        }
-        return true;
+        return runWithGrant(flow, record, conn, [&flow] { return flow.process(); });
     });
 }
 

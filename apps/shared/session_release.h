@@ -52,8 +52,8 @@ struct FlowResult {
 // stays noted if the release failed, even if this process is killed; if it cannot be noted, the
 // flow runs anyway. Two rows never share a note.
 
-/// Creates a credential with a node that the flow has met (CredCreate::getRemoteNodeInfo()). If the
-/// row cannot be stored, or the session does not pass its test, that session is noted.
+/// Creates a credential with a node that the flow has met (CredCreate::getRemoteNodeInfo()). Its
+/// session is noted as soon as the other node has granted it, until the row that uses it is stored.
 [[nodiscard]] FlowState createCredential(OvraDRNode::CredCreate &flow);
 
 /// Changes a lasting credential, and finds out what happened to its previous session, which the

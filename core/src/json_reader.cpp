@@ -5,7 +5,9 @@
 
 #include <algorithm>
 #include <charconv>
+#include <climits>
 #include <cstddef>
+#include <cstdint>
 #include <optional>
 #include <string>
 #include <system_error>
@@ -283,7 +285,8 @@ private:
         return rest_.size() < before;
     }
 
-    /// An integer of 64 bits keeps its exact value; every other number has to fit a double.
+    /// An integer of 64 bits keeps its exact value; every other number has to fit a double, or to
+    /// be nearer to zero than any double.
     bool readNumber(Json::Value &value) {
         const char *const start = rest_.data();
         const bool negative = take('-');
@@ -307,7 +310,27 @@ private:
         const char *const end = rest_.data();
         return (whole && convert<Json::LargestInt>(start, end, value)) ||
                (whole && !negative && convert<Json::LargestUInt>(start, end, value)) ||
-               convert<double>(start, end, value);
+               convert<double>(start, end, value) || convertTiny({start, end}, value);
+    }
+
+    /// A number that is out of the range of a double, as zero unless it is too large.
+    static bool convertTiny(std::string_view number, Json::Value &value) {
+        const std::size_t exponentAt = std::min(number.find_first_of("eE"), number.size());
+        const std::size_t point = std::min(number.find('.'), exponentAt);
+        const std::size_t digit = number.find_first_of("123456789");
+        std::string_view exponent = number.substr(exponentAt);
+        exponent.remove_prefix(std::min(exponent.find_first_of("-0123456789"), exponent.size()));
+        int power = 0;
+        if (std::from_chars(exponent.data(), exponent.data() + exponent.size(), power).ec ==
+            std::errc::result_out_of_range) {
+            power = exponent.front() == '-' ? INT_MIN : INT_MAX;
+        }
+        const auto left = static_cast<std::int64_t>(point) - static_cast<std::int64_t>(digit);
+        if (left + power >= 0) { // 10 to a power that is not negative
+            return false;
+        }
+        value = number.front() == '-' ? -0.0 : 0.0;
+        return true;
     }
 
     template <typename Number>

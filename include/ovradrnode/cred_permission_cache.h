@@ -8,6 +8,7 @@
 
 #include <json/value.h>
 
+#include <cstdint>
 #include <string>
 
 namespace OvraDRNode {
@@ -38,10 +39,16 @@ public:
     ///                 credential and is not stored
     bool SetNoPrivilege(const OvraDRCore::Request &request) const;
     bool SetPrivilege(const OvraDRCore::Request &request, bool has) const;
+    /// As found by an attempt that began at `begun` (Now()): who was stopped in it has old news,
+    /// which never replaces a younger verdict.
+    bool SetPrivilege(const OvraDRCore::Request &request, bool has, std::int64_t begun) const;
     bool UpdateWithData(const Json::Value &value) const;
     bool UpdateWithData(const Json::Value &value, long start, long end) const;
 
 private:
+    bool isStorable(const OvraDRCore::Request &request, bool has) const;
+    void logChange(const char *function, bool has) const;
+
     std::string credId;
 };
 

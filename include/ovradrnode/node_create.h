@@ -11,7 +11,9 @@
 #include <ovradrcore/response.h>
 #include <ovradrcore/sqlite_command.h>
 
+#include <functional>
 #include <string>
+#include <utility>
 
 namespace OvraDRNode {
 
@@ -85,6 +87,11 @@ public:
     /// The session that the remote node granted, a secret; "" before requestRemoteSession(). It may
     /// live although the creation failed.
     const std::string &getGrantedSession() const { return grantedSession; }
+    /// Tells `observer` that session as soon as it is known, before it is tested or stored, so that
+    /// it can be noted where it outlives this process.
+    void setGrantObserver(std::function<void(const std::string &session)> observer) {
+        grantObserver = std::move(observer);
+    }
 
 private:
     [[nodiscard]] bool completes(bool done);
@@ -93,6 +100,7 @@ private:
     DRNode node;
     std::string account;
     std::string grantedSession;
+    std::function<void(const std::string &)> grantObserver;
     BaseSender *sender = nullptr;
 };
 

@@ -8,7 +8,9 @@
 
 #include <ovradrcore/err_recorder.h>
 
+#include <functional>
 #include <string>
+#include <utility>
 
 namespace OvraDRNode {
 
@@ -37,6 +39,10 @@ public:
     /// The session that the remote node granted for this change, a secret; "" before
     /// requestRemoteSession(). It may live although the change failed.
     const std::string &getGrantedSession() const { return grantedSession; }
+    /// As CredCreate::setGrantObserver().
+    void setGrantObserver(std::function<void(const std::string &session)> observer) {
+        grantObserver = std::move(observer);
+    }
     /// Whether the new login reaches the node that the credential belongs to (518 if another).
     [[nodiscard]] bool check();
     [[nodiscard]] bool checkRemoteNodeInfo();
@@ -50,6 +56,7 @@ private:
     CredAccountSender sender;
     std::string newSession;
     std::string grantedSession;
+    std::function<void(const std::string &)> grantObserver;
     Conn storedConn;
 };
 

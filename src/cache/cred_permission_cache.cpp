@@ -65,15 +65,21 @@ bool CredPermissionCache::GetCachedHasPrivilege() const {
     return HasPrivilege(GetCachedData());
 }
 
+/// \param function  the function name in the log line
+void CredPermissionCache::logChange(const char *function, bool has) const {
+    const bool old = GetCachedHasPrivilege();
+    if (old != has) {
+        OVRA_LOG_IN(OvraDRCore::LogLevel::kNotice, function,
+                    "Set cred [%s] permission cache from [%s] to [%s]", credId.c_str(), word(old),
+                    word(has));
+    }
+}
+
 bool CredPermissionCache::SetCacheData(bool has) const {
     if (credId.empty()) {
         return false;
     }
-    const bool old = GetCachedHasPrivilege();
-    if (old != has) {
-        OVRA_NOTICE("Set cred [%s] permission cache from [%s] to [%s]", credId.c_str(), word(old),
-                    word(has));
-    }
+    logChange(__func__, has);
     return UpdateWithData(has);
 }
 
@@ -81,21 +87,36 @@ bool CredPermissionCache::SetHasPrivilege() const {
     return SetCacheData(true);
 }
 
-bool CredPermissionCache::SetNoPrivilege(const OvraDRCore::Request &request) const {
+/// Whether what was found of the request says something about this credential.
+bool CredPermissionCache::isStorable(const OvraDRCore::Request &request, bool has) const {
     if (credId.empty()) {
         return false;
     }
-    if (WebAPI::isRelayTestPrivilegeAPI(request)) {
-        OVRA_NOTICE("Not update no permission of credId[%s] in cache for relay test privilege "
+    if (!has && WebAPI::isRelayTestPrivilegeAPI(request)) {
+        OVRA_LOG_IN(OvraDRCore::LogLevel::kNotice, "SetNoPrivilege",
+                    "Not update no permission of credId[%s] in cache for relay test privilege "
                     "request",
                     credId.c_str());
         return false;
     }
-    return SetCacheData(false);
+    return true;
+}
+
+bool CredPermissionCache::SetNoPrivilege(const OvraDRCore::Request &request) const {
+    return isStorable(request, false) && SetCacheData(false);
 }
 
 bool CredPermissionCache::SetPrivilege(const OvraDRCore::Request &request, bool has) const {
     return has ? SetHasPrivilege() : SetNoPrivilege(request);
+}
+
+bool CredPermissionCache::SetPrivilege(const OvraDRCore::Request &request, bool has,
+                                       std::int64_t begun) const {
+    if (!isStorable(request, has)) {
+        return false;
+    }
+    logChange("SetCacheData", has);
+    return UpdateWithFinding(has, begun);
 }
 
 bool CredPermissionCache::UpdateWithData(const Json::Value &value) const {

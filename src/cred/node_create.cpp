@@ -260,6 +260,9 @@ bool CredCreate::requestRemoteSession() {
         return false;
     }
     grantedSession = session;
+    if (grantObserver) {
+        grantObserver(session);
+    }
     if (!CredUtils::TestSessionValid(node.conn, session)) {
         OVRA_ERR("Invalie session[%s] of conn[%s]", text(node.conn).c_str(), session.c_str());
         return false;

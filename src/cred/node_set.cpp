@@ -155,6 +155,9 @@ bool DRNodeCredSet::requestRemoteSession() {
         return false;
     }
     grantedSession = session;
+    if (grantObserver) {
+        grantObserver(session);
+    }
     if (!CredUtils::TestSessionValid(sender.getConn(), session)) {
         OVRA_ERR("Invalie session of conn[%s]", text(sender.getConn()).c_str());
         return false;

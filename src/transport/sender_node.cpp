@@ -156,14 +156,14 @@ bool NodeSender::processByCred(const DRNode &node, const Request &request, Respo
         return false;
     }
     CredNodeSender sender(node);
+    const std::int64_t begun = OvraDRCore::Cache::Now();
     response = sender.process(request);
     const bool gotThrough = hasGotThrough(response);
     if (gotThrough) {
-        NodeValidCredCache(node.nodeId).UpdateWithData(node.credId);
-        CredPermissionCache(node.credId).SetHasPrivilege();
+        NodeValidCredCache(node.nodeId).UpdateWithFinding(node.credId, begun);
     }
-    if (isNoPermission(response)) {
-        CredPermissionCache(node.credId).SetNoPrivilege(request);
+    if (gotThrough || isNoPermission(response)) {
+        CredPermissionCache(node.credId).SetPrivilege(request, gotThrough, begun);
     }
     if (sender.GetErrCode() != ERR::kNone) {
         SetErr(&sender);
@@ -266,13 +266,14 @@ Response CredNodeSender::process(const Request &request) {
         return {};
     }
     SetErr(ERR::kFailed);
+    const std::int64_t begun = OvraDRCore::Cache::Now();
     CredSessionSender sender(node.conn, node.session);
     if (!sender.getConn().isValid()) {
         RequestScope::noteUnreachable(node.conn); // the relay service does not say where it is
     }
     Response response = sender.process(request);
     if (!failedWith(sender, LibraryError::kOutOfMemory)) {
-        CredPermissionCache(node.credId).SetPrivilege(request, hasGotThrough(response));
+        CredPermissionCache(node.credId).SetPrivilege(request, hasGotThrough(response), begun);
     }
     if (sender.GetErrCode() != ERR::kNone) {
         SetErr(&sender);

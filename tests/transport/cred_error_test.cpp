@@ -8,6 +8,8 @@
 #include "transport/conn_cache.h"
 #include "transport/node_valid_cred_cache.h"
 
+#include <ovradrnode/cred_permission_cache.h>
+
 #include <ctime>
 
 using namespace OvraDRNode;
@@ -111,6 +113,35 @@ TEST_F(CredError, AProcessThatWasStoppedInItsRequestHasOldNews) {
         EXPECT_EQ(sender.GetErrCode(), 500);
         EXPECT_EQ(ConnCache(conn).getStoredVerdict(), otherMeanwhile);
         EXPECT_EQ(ConnCache(conn).GetCachedAge(), otherMeanwhile ? 20 : 109);
+    }
+}
+
+TEST_F(CredError, ARightThatAStoppedProcessLearntOfReplacesNoYoungerOne) {
+    stopClock();
+    addCred("node_cred", "n1", "c1", "https", 5001, "s");
+    credentialLibrary.remotes["https://127.0.0.1:5001"] = remote;
+    const CredPermissionCache permission("c1");
+    const NodeValidCredCache works("n1");
+    for (const bool answered : {false, true}) {
+        for (const bool otherMeanwhile : {false, true}) {
+            ConnCache(Conn::https("127.0.0.1", 5001)).UpdateWithData(true);
+            EXPECT_TRUE(works.UpdateWithData("c1") && permission.UpdateWithData(true));
+            credentialLibrary.fault = [&](const std::string &operation) -> std::optional<int> {
+                if (operation != "Process") {
+                    return std::nullopt;
+                }
+                now += 100'000;
+                EXPECT_TRUE(!otherMeanwhile ||
+                            (permission.UpdateWithData(!answered) && works.UpdateWithData("c2")));
+                now += 20'000;
+                return answered ? std::nullopt : std::optional(9);
+            };
+            NodeSender sender("n1");
+            EXPECT_EQ(sender.process(info).isSuccess(), answered);
+            EXPECT_EQ(permission.GetCachedHasPrivilege(), otherMeanwhile ? !answered : answered);
+            EXPECT_EQ(permission.GetCachedAge(), otherMeanwhile ? 20 : 109);
+            EXPECT_EQ(works.getStoredCredId(), otherMeanwhile ? "c2" : "c1");
+        }
     }
 }
 

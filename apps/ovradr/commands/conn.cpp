@@ -134,6 +134,7 @@ Outcome trust(const Conn &conn, const std::string &expected) {
         OvraPlatform::TrustVerdict::kTrusted) {
         return endpointFailure(conn, CredError::kTrustUnavailable);
     }
+    endLossOfKeys();
     Report report;
     report.data["endpoint"] = targetText(conn);
     report.data["trusted"] = value;

@@ -1,5 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "commands/commands.h"
+#include "node_ref.h"
 #include "output.h"
 #include "provision/data_files.h"
 #include "provision/node_database.h"
@@ -173,10 +174,11 @@ Expected<SetUpStep> provisionTrust() {
     using OvraPlatform::kKnownEndpointsFile;
     OvraPlatform::TrustStore store;
     const std::string problem = store.problem();
-    std::vector<OvraDRNode::DRNode> creds;
-    OvraDRNode::DRNodeDB::List(creds, OvraDRNode::DRNodeDB::CRED_TYPE_NODE |
-                                          OvraDRNode::DRNodeDB::CRED_TYPE_TEMP);
-    if (!problem.empty() && !creds.empty()) {
+    const auto creds = allCredentials();
+    if (!creds) {
+        return Refusal(creds.error());
+    }
+    if (!problem.empty() && !creds->empty()) {
         return SetUpStep{"trusted keys", false,
                          std::string(kKnownEndpointsFile) + ": " + problem +
                              ", though this node has credentials; see `ovradr doctor`"};

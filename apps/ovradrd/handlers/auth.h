@@ -26,6 +26,8 @@ public:
     /// Whether the call is a log-in, which has its own queue because it hashes a password.
     static bool isLogin(const OvraPlatform::APICall &call);
 
+    /// Reads which clients are known; before the first log-in.
+    void recall() { throttle_.recall(); }
     /// Whether a log-in with these parameters, which may be anything, comes from a client that
     /// logged in to the account before. Thread-safe.
     bool isOfKnownClient(const Json::Value &params, const std::string &address);

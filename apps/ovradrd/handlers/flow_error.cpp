@@ -2,6 +2,7 @@
 #include "handlers/flow_error.h"
 
 #include <ovraplatform/api_errors.h>
+#include <ovraplatform/login_refusal.h>
 
 namespace Ovradrd {
 
@@ -18,6 +19,10 @@ Json::Value flowError(const OvraDRCore::ErrRecorder &flow, int otherwise) {
         return OvraPlatform::apiError(ERR::kNoPrivilege,
                                       "the other node refused the session: it is unknown, expired, "
                                       "or lacks the right");
+    }
+    const OvraPlatform::LoginRefusal refusal = OvraPlatform::lastLoginRefusal();
+    if (recorded == ERR::kLoginFailed && refusal.code != 0) {
+        return OvraPlatform::apiError(refusal.code, refusal.detail);
     }
     const int code = recorded == ERR::kNone ? otherwise : recorded;
     const Json::Value &message = flow.GetErrMsg();

@@ -3,6 +3,7 @@
 #include "credential/device_token.h"
 #include "http/web_call.h"
 #include "ovraplatform/api_errors.h"
+#include "ovraplatform/login_refusal.h"
 
 #include <ovradrcore/json.h>
 #include <ovradrcore/log.h>
@@ -18,11 +19,28 @@ namespace OvraPlatform {
 namespace {
 
 thread_local CredError lastError = CredError::kNone;
+thread_local LoginRefusal lastRefusal;
+
+/// The codes that judge account, password and one-time code.
+constexpr int kFirstLoginCode = 400;
+constexpr int kLastLoginCode = 404;
+
+LoginRefusal refusalOf(const Json::Value &document) {
+    const OvraDRCore::Response response(document);
+    const int code = response.getErrCode();
+    const bool judged = code >= kFirstLoginCode && code <= kLastLoginCode;
+    return response.isSuccess() || judged ? LoginRefusal()
+                                          : LoginRefusal{code, response.getErrMsg()};
+}
 
 } // namespace
 
 CredError lastLoginError() {
     return lastError;
+}
+
+LoginRefusal lastLoginRefusal() {
+    return lastRefusal;
 }
 
 } // namespace OvraPlatform
@@ -106,11 +124,17 @@ CredExpected<bool> logout(const OVRACred &cred, const OVRACredSess &sess) {
 
 int CredRequestUtil::LoginWithOTP(OVRACred *cred, const std::string &otp, OVRACredSess *sess,
                                   Json::Value *out) {
+    OvraPlatform::lastError = CredError::kBadArgument;
     if (cred == nullptr || sess == nullptr || out == nullptr) {
         return 0;
     }
     try {
+        OvraPlatform::lastError = CredError::kOutOfMemory;
+        OvraPlatform::lastRefusal = {};
         const auto document = login(*cred, otp, *sess);
+        if (document) {
+            OvraPlatform::lastRefusal = OvraPlatform::refusalOf(*document);
+        }
         OvraPlatform::lastError = document ? CredError::kNone : document.error();
         *out = document ? *document : noAnswer(document.error());
         return document ? 1 : 0;

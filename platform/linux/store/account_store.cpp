@@ -7,6 +7,7 @@
 #include <ovrabase/secret.h>
 #include <ovrabase/utf8.h>
 #include <ovradrcore/log.h>
+#include <ovradrcore/no_fork.h>
 
 #include <sodium.h>
 
@@ -48,6 +49,7 @@ std::string hashPassword(std::string_view password) {
 /// What the password of an account that does not exist is checked against: the hash of a password
 /// that nobody knows.
 const std::string &dummyHash() {
+    const OvraDRCore::NoFork whole; // a child would wait for ever for the end of its making
     static const std::string hash = [] {
         std::array<char, 32> password{};
         randombytes_buf(password.data(), password.size());

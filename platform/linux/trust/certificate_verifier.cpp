@@ -46,6 +46,8 @@ CredError errorOfTrust(TrustVerdict verdict) {
         return CredError::kNotTrusted;
     case TrustVerdict::kLost:
         return CredError::kTrustLost;
+    case TrustVerdict::kShortage:
+        return CredError::kOutOfMemory;
     case TrustVerdict::kUnavailable:
         break;
     }
@@ -129,11 +131,16 @@ bool CertificateVerifier::settle() {
     }
     const OvraDRCore::NoFork::Pause forksPass; // it may wait for the file
     if (lesson == Lesson::kVouch) {
+        TrustStore store;
+        TrustVerdict noted = store.vouch(endpoint_.trustKey());
+        if (noted ==
+            TrustVerdict::kDifferent) { // somebody pinned a key meanwhile, perhaps this one
+            noted = store.lookup(endpoint_.trustKey(), fingerprint_);
+        }
         // Without the note the certificate is good all the same.
-        const TrustVerdict noted = TrustStore().vouch(endpoint_.trustKey());
-        error_ = noted == TrustVerdict::kVouched || noted == TrustVerdict::kUnavailable
-                     ? CredError::kNone
-                     : errorOfTrust(noted);
+        const bool isGood = noted == TrustVerdict::kVouched ||
+                            noted == TrustVerdict::kUnavailable || noted == TrustVerdict::kShortage;
+        error_ = isGood ? CredError::kNone : errorOfTrust(noted);
     } else {
         error_ = errorOfTrust(TrustStore().pin(endpoint_.trustKey(), fingerprint_));
     }

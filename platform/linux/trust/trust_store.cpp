@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "ovraplatform/trust_store.h"
 
+#include <ovrabase/connect.h>
 #include <ovrabase/encoding.h>
 #include <ovrabase/file.h>
 #include <ovradrcore/log.h>
@@ -19,6 +20,9 @@ namespace {
 constexpr std::string_view kHeading = "# ovradr-trust 1";
 /// What the heading of any version begins with.
 constexpr std::string_view kAnyHeading = "# ovradr-trust ";
+/// Stands in a file that was begun anew after one was lost. A program that does not know it takes
+/// it for damage, which has the same effect.
+constexpr std::string_view kLostLine = "lost";
 
 /// When the file changed whose damage was logged last, so that damage is logged once, not at every
 /// request.
@@ -41,8 +45,10 @@ bool isValueFor(const std::string &endpoint, const std::string &value) {
            (value == TrustStore::kSystem && endpoint.starts_with("https://"));
 }
 
-void logUnchangeable(const std::string &path, const std::string &why) {
-    OVRA_ERR("The trusted keys in [%s] cannot be changed: [%s]", path.c_str(), why.c_str());
+/// What it says of the keys that a file cannot be used.
+TrustVerdict verdictOf(const OvraBase::Error &error) {
+    return OvraBase::isShortage(error.number) ? TrustVerdict::kShortage
+                                              : TrustVerdict::kUnavailable;
 }
 
 } // namespace
@@ -74,6 +80,7 @@ struct TrustStore::Line {
 struct TrustStore::Content {
     std::vector<Line> lines;
     bool hasHeading = false;
+    bool isGone = false; ///< whether it holds nothing, not even a heading
     std::string problem; ///< "" if it is sound
 
     explicit Content(const std::string &text) {
@@ -85,12 +92,15 @@ struct TrustStore::Content {
         hasHeading = !lines.empty() && lines.front().text == kHeading;
         const auto isDamaged = [](const Line &line) { return line.says() && !line.isSound(); };
         const auto damaged = std::find_if(lines.begin(), lines.end(), isDamaged);
+        // With endpoints and without a heading it is of the version before, which wrote none.
+        isGone = !hasHeading && std::none_of(lines.begin(), lines.end(),
+                                             [](const Line &line) { return line.says(); });
         if (damaged != lines.end()) {
-            problem =
-                "its line " + std::to_string(damaged - lines.begin() + 1) + " cannot be understood";
-        } else if (!hasHeading && std::none_of(lines.begin(), lines.end(),
-                                               [](const Line &line) { return line.says(); })) {
-            // With endpoints and without a heading it is of the version before, which wrote none.
+            problem = damaged->text == kLostLine
+                          ? "it was lost, and begun anew without the keys of all endpoints"
+                          : "its line " + std::to_string(damaged - lines.begin() + 1) +
+                                " cannot be understood";
+        } else if (isGone) {
             problem = "it is empty";
         }
     }
@@ -134,20 +144,26 @@ struct TrustStore::Content {
     }
 };
 
+/// What a change begins with.
+struct TrustStore::Change {
+    OvraBase::FileUpdate file; ///< holds the lock
+    Content content;           ///< as it is under the lock
+};
+
 TrustStore::TrustStore(std::string path)
     : path_(std::move(path)) {}
 
-std::optional<TrustStore::Content> TrustStore::read() const {
+tl::expected<TrustStore::Content, TrustVerdict> TrustStore::read() const {
     const OvraBase::Expected<std::string> text = OvraBase::readFile(path_);
     if (!text && text.error().number != ENOENT) {
         OVRA_ERR("The trusted keys in [%s] cannot be read (%s): repair the file", path_.c_str(),
                  text.error().text.c_str());
-        return std::nullopt;
+        return tl::unexpected(verdictOf(text.error()));
     }
     Content content(text.value_or(""));
     if (content.isNewer()) {
         OVRA_ERR("[%s] is of a newer version than this program: install that", path_.c_str());
-        return std::nullopt;
+        return tl::unexpected(TrustVerdict::kUnavailable);
     }
     if (!text) {
         content.problem = "it is missing";
@@ -161,7 +177,20 @@ std::optional<TrustStore::Content> TrustStore::read() const {
     return content;
 }
 
-bool TrustStore::write(const OvraBase::FileUpdate &file, const Content &content) const {
+tl::expected<TrustStore::Change, TrustVerdict> TrustStore::beginChange() const {
+    auto file = OvraBase::FileUpdate::begin(path_);
+    if (!file) {
+        OVRA_ERR("The trusted keys in [%s] cannot be changed: [%s]", path_.c_str(),
+                 file.error().text.c_str());
+        return tl::unexpected(verdictOf(file.error()));
+    }
+    return read().map([&file](Content &&content) {
+        return Change{std::move(*file), std::move(content)};
+    });
+}
+
+tl::expected<void, TrustVerdict> TrustStore::write(const OvraBase::FileUpdate &file,
+                                                   const Content &content) const {
     std::string text;
     for (const Line &line : content.lines) {
         text += line.text + '\n';
@@ -174,27 +203,28 @@ bool TrustStore::write(const OvraBase::FileUpdate &file, const Content &content)
                  "that are not used any more, or correct the rights",
                  path_.c_str(), written.error().text.c_str());
     }
-    return written.has_value();
+    return written.map_error(verdictOf);
 }
 
 bool TrustStore::create() {
     if (!ensureStateDir(OvraBase::folderOf(path_))) {
         return false;
     }
-    const auto file = OvraBase::FileUpdate::begin(path_);
-    if (!file) {
-        logUnchangeable(path_, file.error().text);
+    auto change = beginChange();
+    if (!change) {
         return false;
     }
-    auto content = read();
-    const bool mayBegin =
-        content && std::none_of(content->lines.begin(), content->lines.end(),
-                                [](const Line &line) { return line.says() && !line.isSound(); });
-    if (!mayBegin || content->hasHeading) {
-        return content && content->problem.empty();
+    Content &content = change->content;
+    if (content.hasHeading && content.problem.empty()) {
+        return true;
     }
-    content->addHeading();
-    return write(*file, *content);
+    std::erase_if(content.lines, [](const Line &line) { return line.text == kLostLine; });
+    if (std::any_of(content.lines.begin(), content.lines.end(),
+                    [](const Line &line) { return line.says() && !line.isSound(); })) {
+        return false;
+    }
+    content.addHeading();
+    return write(change->file, content).has_value();
 }
 
 std::string TrustStore::problem() const {
@@ -204,34 +234,30 @@ std::string TrustStore::problem() const {
 
 TrustVerdict TrustStore::lookup(const std::string &endpoint, const std::string &fingerprint) const {
     auto content = read();
-    return content ? content->verdictOn(endpoint, fingerprint) : TrustVerdict::kUnavailable;
+    return content ? content->verdictOn(endpoint, fingerprint) : content.error();
 }
 
 TrustVerdict TrustStore::add(const Entry &entry) {
     if (!isEndpoint(entry.endpoint) || !isValueFor(entry.endpoint, entry.value)) {
         return TrustVerdict::kUnavailable;
     }
-    const auto file = OvraBase::FileUpdate::begin(path_);
-    if (!file) {
-        logUnchangeable(path_, file.error().text);
-        return TrustVerdict::kUnavailable;
+    auto change = beginChange();
+    if (!change) {
+        return change.error();
     }
-    auto content = read();
-    if (!content) {
-        return TrustVerdict::kUnavailable;
-    }
-    const TrustVerdict verdict = content->verdictOn(entry.endpoint, entry.value);
+    Content &content = change->content;
+    const TrustVerdict verdict = content.verdictOn(entry.endpoint, entry.value);
     if (verdict != TrustVerdict::kUnknown) {
         return verdict;
     }
-    content->put(entry);
-    content->addHeading();
-    if (!write(*file, *content)) {
-        return TrustVerdict::kUnavailable;
+    content.put(entry);
+    content.addHeading();
+    if (const auto written = write(change->file, content); !written) {
+        return written.error();
     }
     OVRA_NOTICE("The key [%s] of [%s] is trusted from now on", entry.value.c_str(),
                 entry.endpoint.c_str());
-    return content->verdictOn(entry.endpoint, entry.value);
+    return content.verdictOn(entry.endpoint, entry.value);
 }
 
 TrustVerdict TrustStore::pin(const std::string &endpoint, const std::string &fingerprint) {
@@ -248,23 +274,22 @@ TrustVerdict TrustStore::trust(const std::string &endpoint, const std::string &v
         !ensureStateDir(OvraBase::folderOf(path_))) {
         return TrustVerdict::kUnavailable;
     }
-    const auto file = OvraBase::FileUpdate::begin(path_);
-    if (!file) {
-        logUnchangeable(path_, file.error().text);
-        return TrustVerdict::kUnavailable;
+    auto change = beginChange();
+    if (!change) {
+        return change.error();
     }
-    auto content = read();
-    if (!content) {
-        return TrustVerdict::kUnavailable;
-    }
-    const TrustVerdict before = content->verdictOn(endpoint, value);
+    Content &content = change->content;
+    const TrustVerdict before = content.verdictOn(endpoint, value);
     if (before == TrustVerdict::kTrusted || (before == TrustVerdict::kDifferent && !replace)) {
         return before;
     }
-    content->put({endpoint, value});
-    content->addHeading();
-    if (!write(*file, *content)) {
-        return TrustVerdict::kUnavailable;
+    if (content.isGone) {
+        content.lines.emplace_back(std::string(kLostLine)); // what else it held is still unknown
+    }
+    content.put({endpoint, value});
+    content.addHeading();
+    if (const auto written = write(change->file, content); !written) {
+        return written.error();
     }
     OVRA_NOTICE("A person trusts the key [%s] of [%s] from now on", value.c_str(),
                 endpoint.c_str());
@@ -275,23 +300,19 @@ bool TrustStore::forget(const std::string &endpoint) {
     if (auto known = read(); known && known->find(endpoint) == known->lines.end()) {
         return true; // also where there is no folder yet
     }
-    const auto file = OvraBase::FileUpdate::begin(path_);
-    if (!file) {
-        logUnchangeable(path_, file.error().text);
+    auto change = beginChange();
+    if (!change) {
         return false;
     }
-    auto content = read();
-    if (!content) {
-        return false;
-    }
-    if (content->find(endpoint) == content->lines.end()) {
+    Content &content = change->content;
+    if (content.find(endpoint) == content.lines.end()) {
         return true;
     }
-    content->put({endpoint, kForgotten});
-    if (content->problem.empty()) {
-        content->addHeading();
+    content.put({endpoint, kForgotten});
+    if (content.problem.empty()) {
+        content.addHeading();
     }
-    if (!write(*file, *content)) {
+    if (!write(change->file, content)) {
         return false;
     }
     OVRA_NOTICE("The key of [%s] is not trusted any more", endpoint.c_str());

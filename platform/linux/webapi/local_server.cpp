@@ -67,6 +67,10 @@ Started clearPlace(const std::string &path, const sockaddr_un &address) {
     return {};
 }
 
+std::string stopsReply() {
+    return OvraDRCore::toString(apiError(APIError::kTooBusy, "the daemon stops: try again later"));
+}
+
 } // namespace
 
 struct LocalServer::Impl {
@@ -79,6 +83,8 @@ struct LocalServer::Impl {
     Started takePlace();
     void serveConnections();
     void serve(int peer);
+    void refuseRest() const;
+    bool isStopping() const;
     Json::Value answer(const std::string &request);
 
     const std::string path;
@@ -146,10 +152,10 @@ void LocalServer::Impl::serve(int peer) {
         if (isPeerTrusted(peer)) {
             const std::optional<std::string> request =
                 receiveFrame(peer, now + kReadTime, stopEvent.get());
-            if (!request) {
+            if (!request && !isStopping()) {
                 return;
             }
-            reply = OvraDRCore::toString(answer(*request));
+            reply = request ? OvraDRCore::toString(answer(*request)) : stopsReply();
         } else {
             OVRA_WARN("A process of another user was refused on [%s]", path.c_str());
             reply = OvraDRCore::toString(apiError(
@@ -163,6 +169,19 @@ void LocalServer::Impl::serve(int peer) {
         (void)sendFrame(peer, reply, std::chrono::steady_clock::now() + kWriteTime);
     } catch (const std::exception &error) {
         OVRA_ERR("A local call could not be served: [%s]", error.what());
+    }
+}
+
+bool LocalServer::Impl::isStopping() const {
+    pollfd event{stopEvent.get(), POLLIN, 0};
+    return poll(&event, 1, 0) > 0;
+}
+
+/// Answers those whose connection nobody has taken yet; for when nobody will any more.
+void LocalServer::Impl::refuseRest() const {
+    while (const UniqueFd peer{
+        accept4(listener.get(), nullptr, nullptr, SOCK_CLOEXEC | SOCK_NONBLOCK)}) {
+        (void)sendFrame(peer.get(), stopsReply(), std::chrono::steady_clock::now() + kWriteTime);
     }
 }
 
@@ -225,6 +244,7 @@ void LocalServer::stop() {
     }
     impl_->threads.clear();
     unlink(impl_->path.c_str());
+    impl_->refuseRest();
     impl_->listener.reset();
     impl_->lock.unlock();
 }

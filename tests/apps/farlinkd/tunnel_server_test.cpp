@@ -164,6 +164,21 @@ TEST_F(ThroughTheTunnelServer, OneThatMadeRoomAndHangsUpTakesNobodyWithIt) {
     EXPECT_EQ(hear(client), "through");
 }
 
+TEST_F(ThroughTheTunnelServer, OneThatIsTurnedAwayTakesNobodysPlace) {
+    begin({.perAlias = 8, .line = kLong, .answer = kLong});
+    std::list<UniqueFd> waiting;
+    for (const char client : std::string("22225551")) {
+        waiting.push_back(dial(callerPort, (std::string("127.0.0.") + client).c_str()));
+    }
+    EXPECT_NE(caller(), "") << "all have a place";
+    there = false;
+    EXPECT_EQ(hearAll(dial(callerPort, "127.0.0.3")), "") << "the appliance is not there";
+    char byte = 0;
+    for (const UniqueFd &each : waiting) {
+        EXPECT_EQ(recv(each.get(), &byte, 1, MSG_DONTWAIT), -1);
+    }
+}
+
 TEST_F(ThroughTheTunnelServer, WhatTheOtherEndDoesNotTakeStaysWithTheSender) {
     begin({});
     const UniqueFd client = dial(callerPort);

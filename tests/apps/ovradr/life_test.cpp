@@ -142,6 +142,9 @@ TEST_F(Life, ACommandThatIsKilledAnywhereLeavesTheOldOrTheNewStateAndNoSessionUn
             EXPECT_TRUE(pending().empty());
             const bool needed = rows.find("old") != std::string::npos;
             EXPECT_EQ(remote.calls().find("old delete") == std::string::npos, needed);
+            const bool granted = remote.calls().find("granted-s3cret") != std::string::npos;
+            const bool used = rows.find("granted-s3cret") != std::string::npos;
+            EXPECT_EQ(ended.count("granted-s3cret") != 0, granted && !used);
         }
     }
 }

@@ -104,8 +104,16 @@ TEST_F(Pairing, AKeyThatChangedOrWasForgottenOrLostIsRefusedUntilAPersonTrustsIt
     EXPECT_EQ(tested()["trust"], "lost") << "set-up makes no new one for a node with credentials";
     EXPECT_EQ(run({"doctor"}).exit, 9);
     EXPECT_EQ(run({"doctor", url}).exit, 6);
+    OvraTest::executeSql("ALTER TABLE node_cred RENAME TO away");
+    EXPECT_EQ(run({"setup"}).exit, 9) << "it may have credentials";
+    EXPECT_EQ(tested()["trust"], "lost");
+    OvraTest::executeSql("ALTER TABLE away RENAME TO node_cred");
+    OvraTest::addCred("node_cred", "n2", "c2", "https", 5001, "s2");
     EXPECT_EQ(run(named).exit, 0);
     EXPECT_EQ(run({"call", "n1", "OVRA.DR.Node", "info"}).exit, 0);
+    EXPECT_EQ(run({"doctor"}).exit, 9) << "the key of the other credential is still lost";
+    EXPECT_EQ(run({"conn", "trust", "https://127.0.0.1", "--fingerprint", old}).exit, 0);
+    EXPECT_EQ(readFile(OvraPlatform::kKnownEndpointsFile).find("lost"), std::string::npos);
     // An alias is known by its name, whether or not it is reached now.
     EXPECT_EQ(run({"conn", "trust", "flk:nas3", "--fingerprint", old}).exit, 0);
     EXPECT_EQ(run({"conn", "forget", "flk:NAS3"}).exit, 0);
@@ -117,6 +125,11 @@ TEST_F(Pairing, AtATerminalTheKeyThePasswordAndTheCodeAreAskedFor) {
     ASSERT_TRUE(distrustful.answers("Is it the same? [y/N]", ""));
     EXPECT_EQ(distrustful.finish(), 6);
     EXPECT_EQ(tested()["trust"], "unknown");
+
+    remote.answer("login", R"({"success":false,"error":{"code":107,"msg":"full: try in 9 s"}})");
+    const Result throttled = logIn(remote, create);
+    EXPECT_NE(throttled.err.find("Try in 9 s."), std::string::npos) << throttled.err;
+    EXPECT_EQ(run({"conn", "forget", url}).exit, 0);
 
     remote.answer("login", refusal(403));
     Terminal terminal(command);

@@ -23,6 +23,7 @@ struct Throttle : OvraTest::OwnFiles {
     void open(const std::string &path) {
         const LoginThrottle::Clock clock{[this] { return elapsed; }, [this] { return time; }};
         throttle.emplace(path, clock);
+        throttle->recall();
     }
     void pass(std::chrono::seconds some) {
         elapsed += some;
@@ -84,6 +85,7 @@ TEST_F(Throttle, Admits100GuessesAnHourAtOneAccountWhoeverGuessesAndHoweverOften
 TEST_F(Throttle, KeepsNobodyOutWhoLoggedInBeforeNorAStrangerForAnothersGuesses) {
     ASSERT_TRUE(logIn(from("192.0.2.1", "device")) && logIn(from("", "relayed")));
     ASSERT_TRUE(logIn(from("2001:db8:0:7::1")));
+    EXPECT_TRUE(throttle->knows(from("192.0.2.1")) && throttle->knows(from("", "relayed")));
     EXPECT_EQ(guess(1000, from("198.51.100.1")), 10);
     EXPECT_EQ(guess(1, from("198.51.100.2")), 1) << "one stranger took all";
     attack();

@@ -91,7 +91,20 @@ TEST_F(JudgeScene, AcceptsWhatTheSystemAcceptsForThatNameOrAddressAndRequiresItF
     EXPECT_EQ(judge("nas.example", server_, &server_), CredError::kNotTrusted);
 }
 
+TEST_F(JudgeScene, ThatSomebodyPinnedAKeyMeanwhileIsAnErrorOnlyIfItIsAnother) {
+    EXPECT_TRUE(TrustStore().create());
+    for (const OvraTest::TestCertificate *pinned : {&server_, &other_}) {
+        CertificateVerifier each(Endpoint::make("https", "nas.example", 5001).value(),
+                                 Mode::kVerify);
+        EXPECT_TRUE(shakeHands(each, server_, &server_));
+        TrustStore().trust("https://nas.example:5001", fingerprintOf(pinned->certificate()), true);
+        EXPECT_EQ(each.settle(), pinned == &server_);
+        EXPECT_TRUE(std::filesystem::remove(kKnownEndpointsFile) && TrustStore().create());
+    }
+}
+
 TEST_F(JudgeScene, AsksForThePinnedKeyWhoeverElseAcceptsTheCertificate) {
+    EXPECT_TRUE(TrustStore().create());
     TrustStore().trust("https://nas.example:5001", key_, false);
     EXPECT_EQ(judge("nas.example", server_, nullptr), CredError::kNone);
     EXPECT_EQ(judge("nas.example", other_, &other_), CredError::kCertificateChanged);

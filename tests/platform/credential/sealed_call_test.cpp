@@ -6,6 +6,7 @@
 
 #include <ovracredential/cred_request.h>
 #include <ovraplatform/cred_errors.h>
+#include <ovraplatform/login_refusal.h>
 #include <ovraplatform/peer_trust.h>
 
 #include <gtest/gtest.h>
@@ -224,9 +225,18 @@ TEST_F(SealedCallScene, BelievesNothingThatCouldBeForged) {
         EXPECT_EQ(login(), 0);
         EXPECT_EQ(OvraPlatform::lastLoginError(), CredError::kReplyForged) << forged;
     }
-    server->answerOnce(Answer::json(R"({"success":false,"error":{"code":107}})"));
+    const Answer busy = Answer::json(R"({"success":false,"error":{"code":107,"msg":"in 9 s"}})");
+    server->answerOnce(busy);
     EXPECT_EQ(call(), CredError::kNone) << "that it is busy says nothing that could harm";
     EXPECT_EQ(reply_["error"]["code"], 107);
+    server->answerOnce(busy);
+    EXPECT_NE(login(), 0);
+    EXPECT_EQ(OvraPlatform::lastLoginRefusal().code, 107);
+    EXPECT_EQ(OvraPlatform::lastLoginRefusal().detail, "in 9 s");
+    EXPECT_NE(login(), 0);
+    EXPECT_EQ(OvraPlatform::lastLoginRefusal().code, 0);
+    EXPECT_EQ(OVRA::CredRequestUtil::LoginWithOTP(nullptr, "", nullptr, nullptr), 0);
+    EXPECT_EQ(OvraPlatform::lastLoginError(), CredError::kBadArgument);
 }
 
 TEST_F(SealedCallScene, SendsNoFileOverPlainHttpAndNothingToAnEndpointThatHasNoKey) {

@@ -5,6 +5,7 @@
 #include <ovraplatform/trust_store.h>
 
 #include <gtest/gtest.h>
+#include <sys/resource.h>
 
 namespace {
 
@@ -56,10 +57,11 @@ TEST_F(TrustScene, TakesNobodyForUnknownWithoutASoundFile) {
         std::optional<std::string> text;
         V a;     ///< of the endpoint a
         V other; ///< of one that is not named
+        bool gone = false;
     } files[] = {
-        {"missing", std::nullopt, V::kLost, V::kLost},
-        {"empty", "", V::kLost, V::kLost},
-        {"only a comment", "# a comment\n\n", V::kLost, V::kLost},
+        {"missing", std::nullopt, V::kLost, V::kLost, true},
+        {"empty", "", V::kLost, V::kLost, true},
+        {"only a comment", "# a comment\n\n", V::kLost, V::kLost, true},
         {"of the version before", a, V::kTrusted, V::kUnknown},
         {"sound", head + "# a comment\n" + a, V::kTrusted, V::kUnknown},
         {"the first of two counts", head + "https://a:1 system\n" + a, V::kVouched, V::kUnknown},
@@ -87,12 +89,27 @@ TEST_F(TrustScene, TakesNobodyForUnknownWithoutASoundFile) {
         const std::string now = OvraTest::readFile(file());
         EXPECT_EQ(now.starts_with(head), said == V::kTrusted) << each.name;
         EXPECT_NE(now.find(each.text.value_or("")), std::string::npos) << each.name;
+        EXPECT_EQ(store().lookup("https://e:1", key), each.other) << each.name;
+        EXPECT_EQ(store().create(), unknown || each.gone) << each.name;
+        EXPECT_EQ(store().problem().empty(), unknown || each.gone) << each.name;
         std::filesystem::remove(file());
     }
     std::filesystem::create_directory(file());
     EXPECT_EQ(store().lookup("https://a:1", fingerprint("a")), V::kUnavailable);
     EXPECT_EQ(store().trust("https://a:1", fingerprint("a"), true), V::kUnavailable);
     EXPECT_FALSE(store().list() || store().forget("https://a:1") || store().create());
+}
+
+TEST_F(TrustScene, ALackOfDescriptorsSaysNothingOfAKey) {
+    EXPECT_TRUE(store().create());
+    rlimit own{};
+    getrlimit(RLIMIT_NOFILE, &own);
+    const rlimit none{0, own.rlim_max};
+    setrlimit(RLIMIT_NOFILE, &none);
+    const V looked = store().lookup("https://a:1", fingerprint("a"));
+    const V pinned = store().pin("https://a:1", fingerprint("a"));
+    setrlimit(RLIMIT_NOFILE, &own);
+    EXPECT_TRUE(looked == V::kShortage && pinned == V::kShortage);
 }
 
 TEST_F(TrustScene, LosesNoKeyOfProcessesThatPinAtOnce) {

@@ -188,19 +188,29 @@ TEST_F(LocalCallScene, ServesMoreCallersThanItHasThreads) {
 
 TEST_F(LocalCallScene, StopsAtOnceButAnswersTheCallUnderWay) {
     std::promise<void> entered;
-    LocalServer server(kSocketFile, [&](const LocalCall &call) {
-        entered.set_value();
-        std::this_thread::sleep_for(200ms);
-        return echo(call);
-    });
+    LocalServer server(
+        kSocketFile,
+        [&](const LocalCall &call) {
+            entered.set_value();
+            std::this_thread::sleep_for(200ms);
+            return echo(call);
+        },
+        2);
     ASSERT_TRUE(server.start());
     const OvraBase::UniqueFd idle = connectRaw(); // sends nothing, and must not delay the stop
     auto caller = std::async(std::launch::async, [] { return ask(); });
     entered.get_future().wait();
+    const OvraBase::UniqueFd late = connectRaw(); // no thread is left for it
     const auto begin = std::chrono::steady_clock::now();
     server.stop();
     EXPECT_LT(std::chrono::steady_clock::now() - begin, 2s);
     EXPECT_EQ(codeOf(caller.get()), 0);
+    for (const int unserved : {idle.get(), late.get()}) {
+        Json::Value reply;
+        const auto text = receiveFrame(unserved, std::chrono::steady_clock::now() + 5s);
+        EXPECT_TRUE(OvraDRCore::fromString(reply, text.value_or("")));
+        EXPECT_EQ(codeOf(reply), APIError::kTooBusy) << "nothing was done";
+    }
     EXPECT_NE(access(kSocketFile, F_OK), 0) << "the socket file must be gone";
 }
 

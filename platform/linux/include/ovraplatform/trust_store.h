@@ -5,6 +5,7 @@
 #include "ovraplatform/export.h"
 
 #include <sys/types.h>
+#include <tl/expected.hpp>
 
 #include <cstdint>
 #include <optional>
@@ -27,6 +28,7 @@ enum class TrustVerdict {
     kForgotten,   ///< a person has withdrawn its key
     kLost,        ///< the file is missing or damaged, so that a key of the endpoint may be lost
     kUnavailable, ///< the file cannot be read or written; an ERR line says why
+    kShortage,    ///< this process has no descriptor or memory left to read the file
 };
 
 /// The keys by which endpoints are known: a text file of mode 0600 with a line "ENDPOINT VALUE" for
@@ -52,8 +54,9 @@ public:
 
     explicit TrustStore(std::string path = kKnownEndpointsFile);
 
-    /// Makes the file where it is missing or empty, and gives one of an older version its heading;
-    /// not for an appliance that may have lost keys.
+    /// Makes the file where it is missing or empty, gives one of an older version its heading, and
+    /// ends the state of one that was lost and begun anew by trust(): not while a key of the
+    /// appliance may still be lost.
     /// \return whether there is a sound file now
     [[nodiscard]] bool create();
     /// What is wrong with the file, as a sentence without its end; "" if it is sound.
@@ -66,7 +69,7 @@ public:
     /// Notes that the system's certificates vouch for an endpoint that is unknown; as pin().
     TrustVerdict vouch(const std::string &endpoint);
     /// A person's decision: trusts a key, or with kSystem what the system's certificates vouch for.
-    /// Makes the file if need be.
+    /// Makes the file if need be; all other endpoints stay lost then, see create().
     /// \param replace  also in place of another pinned key
     /// \return kTrusted; kDifferent if another key is pinned, which stays; kUnavailable
     TrustVerdict trust(const std::string &endpoint, const std::string &value, bool replace);
@@ -84,10 +87,13 @@ public:
 private:
     struct Line;
     struct Content;
+    struct Change;
 
-    std::optional<Content> read() const;
+    tl::expected<Content, TrustVerdict> read() const;
+    tl::expected<Change, TrustVerdict> beginChange() const;
     TrustVerdict add(const Entry &entry);
-    [[nodiscard]] bool write(const OvraBase::FileUpdate &file, const Content &content) const;
+    [[nodiscard]] tl::expected<void, TrustVerdict> write(const OvraBase::FileUpdate &file,
+                                                         const Content &content) const;
 
     std::string path_;
 };
