@@ -24,6 +24,16 @@ install(FILES "${PROJECT_BINARY_DIR}/OvraDRNodeConfig.cmake"
               "${PROJECT_BINARY_DIR}/OvraDRNodeConfigVersion.cmake"
   DESTINATION "${ovra_cmake_dir}")
 
+# systemd looks for them below /usr/lib and /usr/local/lib, whatever the architecture.
+if(TARGET ovradrd)
+  foreach(daemon ovradrd farlinkd)
+    configure_file("dist/systemd/${daemon}.service.in" "${PROJECT_BINARY_DIR}/${daemon}.service" @ONLY)
+    install(FILES "${PROJECT_BINARY_DIR}/${daemon}.service" DESTINATION lib/systemd/system)
+  endforeach()
+  install(FILES dist/systemd/ovradr.tmpfiles DESTINATION lib/tmpfiles.d RENAME ovradr.conf)
+  install(FILES dist/systemd/farlinkd.sysusers DESTINATION lib/sysusers.d RENAME farlinkd.conf)
+endif()
+
 # The packages are relocatable, so an installed tree can be moved.
 file(RELATIVE_PATH ovra_pc_to_prefix
   "/prefix/${CMAKE_INSTALL_LIBDIR}/pkgconfig" "/prefix")

@@ -9,6 +9,7 @@
 #include "service/http_server.h"
 #include "service/listener.h"
 #include "service/memory.h"
+#include "service/service_manager.h"
 #include "service/startup.h"
 #include "service/tls_identity.h"
 #include "tunnel_server.h"
@@ -21,7 +22,6 @@
 #include <ovraplatform/farlink.h>
 
 #include <CLI/CLI.hpp>
-#include <syslog.h>
 
 #include <array>
 #include <cerrno>
@@ -95,18 +95,40 @@ Expected<TlsIdentity> identityIn(const Options &options) {
     return TlsIdentity::load(key, certificate);
 }
 
-void waitForEnd(const OvraService::EndSignals &signals, RelayApi &api) {
-    for (int tick = 1; !signals.wait(kTick); ++tick) {
+/// \return what to tell the service manager
+std::string reload(const Options &options, HttpServer &http) {
+    OvraService::tellReloading();
+    const auto identity = identityIn(options);
+    const auto renewed = identity ? http.renew(*identity) : OvraBase::Unexpected(identity.error());
+    if (!renewed) {
+        OVRA_ERR("Goes on with its certificate from before: %s", renewed.error().text.c_str());
+        return "Goes on with its certificate from before: " + renewed.error().text;
+    }
+    OVRA_NOTICE("Key and certificate were read again");
+    return "Key and certificate were read again";
+}
+
+void serveUntilEnd(const OvraService::Signals &signals, const Options &options, RelayApi &api,
+                   HttpServer &http) {
+    for (int tick = 1;; ++tick) {
+        const OvraService::Order order = signals.wait(kTick);
+        if (order == OvraService::Order::kEnd) {
+            return;
+        }
+        if (order == OvraService::Order::kReload) {
+            OvraService::tellReady(reload(options, http));
+        }
         api.endOverdue();
         if (tick % kTicksOfMemory == 0) {
             OvraService::returnFreedMemory();
+            OvraService::tellAlive();
         }
     }
 }
 
 int serve(const Options &options) {
     OvraService::keepMemorySmall();
-    const OvraService::EndSignals signals;
+    const OvraService::Signals signals;
     OvraService::raiseDescriptorLimit(kDescriptors);
 
     const auto identity = identityIn(options);
@@ -160,7 +182,11 @@ int serve(const Options &options) {
                 OvraService::certificateFingerprint(certificateIn(options)).c_str());
     std::fflush(stdout);
 
-    waitForEnd(signals, api);
+    OvraService::tellReady("https " + std::to_string(port) + ", tunnels " +
+                           std::to_string(tunnelPort));
+
+    serveUntilEnd(signals, options, api, http);
+    OvraService::tellStopping();
     OVRA_NOTICE("Stops");
     http.quiesce();
     api.stop();
@@ -210,7 +236,7 @@ int run(int argc, char **argv) {
 int main(int argc, char **argv) {
     OvraBase::fillStandardDescriptors();
     OvraService::protectMemory();
-    openlog("farlinkd", LOG_NDELAY, LOG_DAEMON);
+    OvraService::openLog("farlinkd");
     try {
         return Farlinkd::run(argc, argv);
     } catch (const std::exception &error) {

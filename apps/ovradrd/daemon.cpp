@@ -222,6 +222,21 @@ int Daemon::httpPort() const {
     return impl_->httpPort;
 }
 
+Expected<bool> Daemon::reload(const Settings &settings) {
+    Impl &self = *impl_;
+    const auto tls =
+        TlsIdentity::load(OvraPlatform::kTlsKeyFile, OvraPlatform::kTlsCertificateFile);
+    if (!tls) {
+        return OvraBase::Unexpected(tls.error());
+    }
+    if (auto renewed = self.http->renew(*tls); !renewed) {
+        return OvraBase::Unexpected(renewed.error());
+    }
+    return settings.addresses != self.settings.addresses ||
+           settings.httpPort != self.settings.httpPort ||
+           settings.httpsPort != self.settings.httpsPort;
+}
+
 void Daemon::doPeriodicWork() {
     (void)OvraPlatform::SessionStore().sweep(); // the log says why not; the next one is soon
     impl_->retries->begin();

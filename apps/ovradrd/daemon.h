@@ -40,6 +40,12 @@ public:
     int httpsPort() const;
     int httpPort() const;
 
+    /// Takes over what may change while it serves: the TLS key and certificate, for new
+    /// connections. \param settings  as they are now \return whether they name other addresses or
+    /// ports than those served, which takes a restart;
+    ///         an error if key and certificate cannot be used: then those from before stay
+    [[nodiscard]] OvraBase::Expected<bool> reload(const Settings &settings);
+
     /// The periodic work of every few seconds: sweeps expired sessions and has pending releases
     /// tried. Returns at once.
     void doPeriodicWork();

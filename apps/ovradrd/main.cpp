@@ -4,6 +4,7 @@
 
 #include "daemon.h"
 #include "service/memory.h"
+#include "service/service_manager.h"
 #include "version.h"
 
 #include <ovrabase/file.h>
@@ -11,7 +12,6 @@
 #include <ovraplatform/appliance.h>
 
 #include <CLI/CLI.hpp>
-#include <syslog.h>
 #include <unistd.h>
 
 #include <chrono>
@@ -33,8 +33,8 @@ constexpr unsigned long kDescriptors = 4096;
 
 constexpr char kFooter[] =
     "Serves in the foreground until SIGTERM or SIGINT; prints one line when it is ready. Settings\n"
-    "are read from /usr/ovra/etc/ovradr/ovradrd.conf at the start; everything else goes to the\n"
-    "system log. `ovradr setup` makes what it needs.\n\n"
+    "are read from /usr/ovra/etc/ovradr/ovradrd.conf at the start, key and certificate also on\n"
+    "SIGHUP; everything else goes to the system log. `ovradr setup` makes what it needs.\n\n"
     "Exit codes: 0 ended by a signal, 1 failed, 2 wrong usage, 3 a port is in use, 9 not set up.";
 
 int fail(const StartError &why) {
@@ -60,17 +60,46 @@ tl::expected<Ovradrd::Settings, StartError> readSettings() {
     return settings;
 }
 
+/// \return what to tell the service manager
+std::string reload(Daemon &daemon) {
+    OvraService::tellReloading();
+    const auto settings = readSettings();
+    if (!settings) {
+        OVRA_ERR("Goes on with its settings from before: %s", settings.error().text.c_str());
+        return "Goes on with its settings from before: " + settings.error().text;
+    }
+    const auto restart = daemon.reload(*settings);
+    if (!restart) {
+        OVRA_ERR("Goes on with its certificate from before: %s", restart.error().text.c_str());
+        return "Goes on with its certificate from before: " + restart.error().text;
+    }
+    if (*restart) {
+        OVRA_WARN("The settings name other addresses or ports: restart ovradrd to serve there");
+        return "Restart to serve at the addresses and ports of the settings";
+    }
+    OVRA_NOTICE("Key and certificate were read again");
+    return "Key and certificate were read again";
+}
+
 /// Waits for the end, and has the daemon do its periodic work meanwhile.
-void waitForEnd(Daemon &daemon, const OvraService::EndSignals &signals) {
-    while (!signals.wait(kWorkPeriod)) {
+void serveUntilEnd(Daemon &daemon, const OvraService::Signals &signals) {
+    for (;;) {
+        const OvraService::Order order = signals.wait(kWorkPeriod);
+        if (order == OvraService::Order::kEnd) {
+            return;
+        }
+        if (order == OvraService::Order::kReload) {
+            OvraService::tellReady(reload(daemon));
+        }
         daemon.doPeriodicWork();
         OvraService::returnFreedMemory();
+        OvraService::tellAlive();
     }
 }
 
 int serve(bool logsCalls) {
     OvraService::keepMemorySmall();
-    const OvraService::EndSignals signals;
+    const OvraService::Signals signals;
     OvraService::raiseDescriptorLimit(kDescriptors);
 
     auto settings = readSettings();
@@ -87,7 +116,11 @@ int serve(bool logsCalls) {
     std::printf("ovradrd: ready, https %d, http %d\n", daemon.httpsPort(), daemon.httpPort());
     std::fflush(stdout);
 
-    waitForEnd(daemon, signals);
+    OvraService::tellReady("https " + std::to_string(daemon.httpsPort()) + ", http " +
+                           std::to_string(daemon.httpPort()));
+
+    serveUntilEnd(daemon, signals);
+    OvraService::tellStopping();
     OVRA_NOTICE("Stops");
     if (!daemon.stop()) {
         OVRA_NOTICE("Calls that wait for other appliances are left");
@@ -101,7 +134,7 @@ int serve(bool logsCalls) {
 int main(int argc, char **argv) {
     OvraBase::fillStandardDescriptors();
     OvraService::protectMemory();
-    openlog("ovradrd", LOG_NDELAY, LOG_DAEMON);
+    OvraService::openLog("ovradrd");
     try {
         CLI::App app("The web-API daemon of an appliance", "ovradrd");
         app.footer(kFooter);

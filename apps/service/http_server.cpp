@@ -194,6 +194,7 @@ struct HttpServer::Impl {
     Impl &operator=(const Impl &) = delete;
 
     bool open(Listener listener, bool secure, const TlsIdentity &identity);
+    OvraBase::Expected<void> use(const TlsIdentity &next);
 
     // What the library calls.
     static MHD_Result onAccept(void *endpoint, const sockaddr *address, socklen_t size);
@@ -223,6 +224,8 @@ struct HttpServer::Impl {
     const std::optional<FileSource> source;
     Connections connections;
     gnutls_datum_t ticketKey{};
+    std::atomic<gnutls_certificate_credentials_t> newest = nullptr; ///< for new connections
+    std::vector<TlsCredentials> identities; ///< connections may have the earlier ones
     std::atomic<bool> closing = false;
     std::atomic<std::size_t> buffered = 0;
     std::atomic<std::size_t> files = 0; ///< that are being sent
@@ -254,8 +257,10 @@ void HttpServer::Impl::onConnection(void *endpoint, MHD_Connection *connection, 
     if (here.secure) {
         const MHD_ConnectionInfo *tls =
             MHD_get_connection_info(connection, MHD_CONNECTION_INFO_GNUTLS_SESSION);
-        gnutls_session_ticket_enable_server(static_cast<gnutls_session_t>(tls->tls_session),
-                                            &here.server->ticketKey);
+        auto *const session = static_cast<gnutls_session_t>(tls->tls_session);
+        gnutls_session_ticket_enable_server(session, &here.server->ticketKey);
+        // Instead of those that the library has set, and cannot change.
+        gnutls_credentials_set(session, GNUTLS_CRD_CERTIFICATE, here.server->newest.load());
     }
 }
 
@@ -510,6 +515,17 @@ void HttpServer::Impl::end(Exchange *exchange) {
     ended.notify_all();
 }
 
+OvraBase::Expected<void> HttpServer::Impl::use(const TlsIdentity &next) {
+    auto credentials = next.credentials();
+    if (!credentials) {
+        return OvraBase::Unexpected(credentials.error());
+    }
+    const std::lock_guard lock(mutex);
+    newest = credentials->get();
+    identities.push_back(std::move(*credentials));
+    return {};
+}
+
 bool HttpServer::Impl::open(Listener listener, bool secure, const TlsIdentity &identity) {
     auto endpoint = std::make_unique<Endpoint>();
     endpoint->server = this;
@@ -567,6 +583,9 @@ OvraBase::Expected<void> HttpServer::start(std::vector<Listener> https, std::vec
             {"the key for TLS session tickets cannot be made: is the kernel "
              "out of random numbers?"});
     }
+    if (auto taken = impl_->use(identity); !taken) {
+        return taken;
+    }
     for (const bool secure : {true, false}) {
         for (Listener &listener : secure ? https : http) {
             if (!impl_->open(std::move(listener), secure, identity)) {
@@ -575,6 +594,10 @@ OvraBase::Expected<void> HttpServer::start(std::vector<Listener> https, std::vec
         }
     }
     return {};
+}
+
+OvraBase::Expected<void> HttpServer::renew(const TlsIdentity &identity) {
+    return impl_->use(identity);
 }
 
 void HttpServer::adopt(ConnectedClient client) {

@@ -89,6 +89,9 @@ public:
     /// \param identity  for those that speak TLS; must outlive the server
     [[nodiscard]] OvraBase::Expected<void>
     start(std::vector<Listener> https, std::vector<Listener> http, const TlsIdentity &identity);
+    /// New connections get this key and certificate; those that there are keep theirs. In any
+    /// thread while the server runs.
+    [[nodiscard]] OvraBase::Expected<void> renew(const TlsIdentity &identity);
     /// Serves an already connected client like one of the https sockets. In any thread while the
     /// server runs.
     void adopt(ConnectedClient client);

@@ -6,6 +6,7 @@
 #include <malloc.h>
 #include <pthread.h>
 #include <sys/resource.h>
+#include <syslog.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -43,6 +44,11 @@ int reportStartError(const char *program, const std::exception &why) {
                            : std::string(why.what())});
 }
 
+void openLog(const char *program) {
+    const bool hasLog = access("/dev/log", F_OK) == 0; // _PATH_LOG, where syslog(3) writes
+    openlog(program, LOG_NDELAY | (hasLog ? 0 : LOG_PERROR), LOG_DAEMON);
+}
+
 void raiseDescriptorLimit(unsigned long count) {
     rlimit limit{};
     if (getrlimit(RLIMIT_NOFILE, &limit) != 0 || limit.rlim_cur >= count) {
@@ -78,13 +84,21 @@ void returnFreedMemory() {
 #endif
 }
 
-struct EndSignals::State {
+struct Signals::State {
+    void give(Order next) {
+        {
+            const std::lock_guard lock(mutex);
+            order = next;
+        }
+        changed.notify_all();
+    }
+
     std::mutex mutex;
     std::condition_variable changed;
-    bool came = false;
+    Order order = Order::kNone;
 };
 
-EndSignals::EndSignals()
+Signals::Signals()
     : state_(std::make_shared<State>()) {
     std::signal(SIGPIPE, SIG_IGN);
     sigset_t signals;
@@ -94,24 +108,28 @@ EndSignals::EndSignals()
     }
     pthread_sigmask(SIG_BLOCK, &signals, nullptr);
     std::thread([signals, state = state_] {
-        while (sigwaitinfo(&signals, nullptr) < 0) {
+        for (int signal = 0; signal != SIGTERM && signal != SIGINT;) {
+            signal = sigwaitinfo(&signals, nullptr);
+            if (signal == SIGHUP) {
+                state->give(Order::kReload);
+            }
         }
-        {
-            const std::lock_guard lock(state->mutex);
-            state->came = true;
-        }
-        state->changed.notify_all();
+        state->give(Order::kEnd);
         std::this_thread::sleep_for(kEndTime);
         alarm(1); // what does not end may be the system log
-        OVRA_LOG_IN(OvraDRCore::LogLevel::kWarn, "EndSignals",
-                    "Something does not end: it is left");
+        OVRA_LOG_IN(OvraDRCore::LogLevel::kWarn, "Signals", "Something does not end: it is left");
         _exit(static_cast<int>(ExitCode::kFailed));
     }).detach();
 }
 
-bool EndSignals::wait(std::chrono::seconds atMost) const {
+Order Signals::wait(std::chrono::seconds atMost) const {
     std::unique_lock lock(state_->mutex);
-    return state_->changed.wait_for(lock, atMost, [this] { return state_->came; });
+    state_->changed.wait_for(lock, atMost, [this] { return state_->order != Order::kNone; });
+    const Order order = state_->order;
+    if (order == Order::kReload) {
+        state_->order = Order::kNone;
+    }
+    return order;
 }
 
 } // namespace OvraService

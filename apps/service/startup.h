@@ -37,6 +37,9 @@ int reportStartError(const char *program, const StartError &why);
 /// The same for an exception that ended the start, such as a thread that the system refuses.
 int reportStartError(const char *program, const std::exception &why);
 
+/// Opens the system log for a daemon; where there is none, what is logged goes to standard error.
+void openLog(const char *program);
+
 /// Raises the soft limit of open file descriptors to `count`, as far as the hard limit allows; a
 /// lower limit is a warning in the log.
 void raiseDescriptorLimit(unsigned long count);
@@ -47,15 +50,21 @@ void keepMemorySmall();
 /// in the holes between what is still in use. Takes milliseconds: call it now and then.
 void returnFreedMemory();
 
-/// Waits in a thread of its own for the signals that end a daemon (SIGTERM, SIGINT, SIGHUP). They
-/// end the process in any case: at the latest 10 seconds after the first one came, also while it
-/// starts.
-class EndSignals {
+/// What a signal asks of a daemon.
+enum class Order {
+    kNone,
+    kReload, ///< SIGHUP
+    kEnd,    ///< SIGTERM, SIGINT
+};
+
+/// Waits in a thread of its own for the signals that a daemon takes. Those that end it do so in any
+/// case: at the latest 10 seconds after the first one came, also while it starts.
+class Signals {
 public:
     /// Blocks them in this thread and those that it starts, and ignores SIGPIPE.
-    EndSignals();
-    /// Whether one has come; waits for it at most that long.
-    bool wait(std::chrono::seconds atMost) const;
+    Signals();
+    /// What has been asked; waits for it at most that long. A reload is told once, the end always.
+    Order wait(std::chrono::seconds atMost) const;
 
 private:
     struct State;

@@ -6,8 +6,6 @@
 #include <gnutls/gnutls.h>
 
 #include <cerrno>
-#include <memory>
-#include <type_traits>
 #include <utility>
 
 namespace OvraService {
@@ -15,14 +13,6 @@ namespace OvraService {
 namespace {
 
 using OvraBase::Unexpected;
-
-struct FreeCredentials {
-    void operator()(gnutls_certificate_credentials_t credentials) const {
-        gnutls_certificate_free_credentials(credentials);
-    }
-};
-using Credentials =
-    std::unique_ptr<std::remove_pointer_t<gnutls_certificate_credentials_t>, FreeCredentials>;
 
 Unexpected unreadable(const std::string &path, const OvraBase::Error &why) {
     return why.number == EPERM
@@ -51,21 +41,29 @@ OvraBase::Expected<TlsIdentity> TlsIdentity::load(const std::string &keyFile,
     if (!certificate) {
         return unreadable(certificateFile, certificate.error());
     }
+    TlsIdentity identity{std::move(*key), std::move(*certificate)};
+    if (const auto usable = identity.credentials(); !usable) {
+        return Unexpected({keyFile + " and " + certificateFile +
+                           " are not a key and its certificate (" + usable.error().text +
+                           "): put the right ones there, or remove both and run ovradr setup"});
+    }
+    return identity;
+}
+
+OvraBase::Expected<TlsCredentials> TlsIdentity::credentials() const {
     gnutls_certificate_credentials_t raw = nullptr;
     if (gnutls_certificate_allocate_credentials(&raw) != GNUTLS_E_SUCCESS) {
         return Unexpected({"no memory for the TLS key"});
     }
-    const Credentials credentials(raw);
-    const gnutls_datum_t keyDatum = datumOf(key->get());
-    const gnutls_datum_t certificateDatum = datumOf(*certificate);
-    const int code = gnutls_certificate_set_x509_key_mem(credentials.get(), &certificateDatum,
-                                                         &keyDatum, GNUTLS_X509_FMT_PEM);
+    TlsCredentials credentials(raw);
+    const gnutls_datum_t keyDatum = datumOf(key.get());
+    const gnutls_datum_t certificateDatum = datumOf(certificate);
+    const int code =
+        gnutls_certificate_set_x509_key_mem(raw, &certificateDatum, &keyDatum, GNUTLS_X509_FMT_PEM);
     if (code < 0) {
-        return Unexpected({keyFile + " and " + certificateFile +
-                           " are not a key and its certificate (" + gnutls_strerror(code) +
-                           "): put the right ones there, or remove both and run ovradr setup"});
+        return Unexpected({gnutls_strerror(code)});
     }
-    return TlsIdentity{std::move(*key), std::move(*certificate)};
+    return credentials;
 }
 
 } // namespace OvraService

@@ -7,6 +7,7 @@
 
 #include <cstdio>
 #include <cstdlib>
+#include <cstring>
 #include <string>
 #include <vector>
 
@@ -44,10 +45,15 @@ public:
     }
     ~DaemonProgram() { fclose(output_); }
 
-    /// The next line of its output; "" at the end.
+    /// The next line of its output that is not of its log; "" at the end.
     std::string line() {
         char text[512] = "";
-        return fgets(text, sizeof(text), output_) != nullptr ? text : "";
+        while (fgets(text, sizeof(text), output_) != nullptr) {
+            if (strstr(text, ")[") == nullptr) {
+                return text;
+            }
+        }
+        return "";
     }
 
 private:

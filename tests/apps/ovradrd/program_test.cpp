@@ -8,9 +8,14 @@
 #include "support/soon.h"
 
 #include <ovraplatform/appliance.h>
+#include <ovraplatform/peer_trust.h>
 
+#include <poll.h>
 #include <sys/resource.h>
+#include <sys/socket.h>
+#include <sys/un.h>
 
+#include <array>
 #include <chrono>
 #include <csignal>
 #include <filesystem>
@@ -114,6 +119,52 @@ TEST_F(TheProgram, ServesUntilItIsToldToEndAndAgainAfterItWasKilled) {
         EXPECT_EQ(std::filesystem::exists(OvraPlatform::kSocketFile), signal == SIGKILL);
     }
     EXPECT_EQ(Appliance::callHere(kNode, 1, "info")["error"]["code"], 100);
+}
+
+TEST_F(TheProgram, TellsTheServiceManagerHowItIsAndServesARenewedKeyOnSighup) {
+    configure();
+    const int manager = socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0);
+    const sockaddr_un address{AF_UNIX, "/tmp/manager"};
+    ASSERT_EQ(bind(manager, reinterpret_cast<const sockaddr *>(&address), sizeof(address)), 0);
+    const auto told = [manager](const std::string &what) {
+        pollfd wait{manager, POLLIN, 0};
+        for (std::array<char, 512> text{}; poll(&wait, 1, 10'000) > 0; text = {}) {
+            if (recv(manager, text.data(), text.size() - 1, 0) > 0 &&
+                std::string(text.data()).find(what) != std::string::npos) {
+                return true;
+            }
+        }
+        return false;
+    };
+    Program program([] { setenv("NOTIFY_SOCKET", "/tmp/manager", 1); });
+    EXPECT_TRUE(told("READY=1\nSTATUS=https " + https));
+    const auto reload = [&](const char *outcome) {
+        kill(program.pid(), SIGHUP);
+        EXPECT_TRUE(told("RELOADING=1\nMONOTONIC_USEC="));
+        EXPECT_TRUE(told("READY=1\nSTATUS=" + std::string(outcome))) << outcome;
+        EXPECT_TRUE(told("WATCHDOG=1"));
+        const auto met = OvraPlatform::peerFingerprint("https", "127.0.0.1", std::stoi(https), 10);
+        return met ? met->fingerprint : std::string();
+    };
+    const std::string before =
+        OvraService::certificateFingerprint(OvraPlatform::kTlsCertificateFile);
+    writeFile(OvraPlatform::kConfigFile, "http_port=\"x\"\n");
+    EXPECT_EQ(reload("Goes on with its settings"), before);
+    configure("address=\"127.0.0.2\"\n");
+    EXPECT_EQ(reload("Restart to serve"), before);
+    configure();
+    std::filesystem::remove(OvraPlatform::kTlsKeyFile);
+    EXPECT_EQ(reload("Goes on with its certificate"), before);
+    std::filesystem::remove(OvraPlatform::kTlsCertificateFile);
+    ASSERT_TRUE(OvraService::createTlsKey(OvraPlatform::kTlsKeyFile));
+    ASSERT_TRUE(OvraService::createCertificate(OvraPlatform::kTlsCertificateFile,
+                                               OvraPlatform::kTlsKeyFile, {"nas", {}}));
+    EXPECT_EQ(reload("Key and certificate were read again"),
+              OvraService::certificateFingerprint(OvraPlatform::kTlsCertificateFile));
+    kill(program.pid(), SIGTERM);
+    EXPECT_TRUE(told("STOPPING=1"));
+    EXPECT_EQ(program.wait(), 0);
+    close(manager);
 }
 
 TEST_F(TheProgram, EndsInTimeWhileACallWaitsForAnotherAppliance) {
