@@ -4,6 +4,7 @@
 #include "shared/pending_releases.h"
 #include "support/local_node.h"
 #include "support/other_process.h"
+#include "support/torture.h"
 
 #include <ovradrcore/cache.h>
 #include <ovradrnode/node_db.h>
@@ -30,6 +31,7 @@ using OvraTest::Fault;
 using OvraTest::FaultPlan;
 using OvraTest::Lie;
 using OvraTest::OtherProcess;
+using OvraTest::tortureScale;
 
 namespace {
 
@@ -48,12 +50,6 @@ Shared &shared = *static_cast<Shared *>(
 
 void tell(char *place, std::size_t size, const std::string &text) {
     std::strncpy(place, text.c_str(), size - 1);
-}
-
-/// How much longer than in the daily run.
-int scale() {
-    const char *const text = std::getenv("OVRA_TORTURE");
-    return text != nullptr ? std::max(1, std::atoi(text)) : 1;
 }
 
 /// One operation: any process may find what there was before it, or after it, and nothing else.
@@ -249,7 +245,7 @@ public:
         inChild([&] { return std::to_string(scene.change()); });
         after_ = inChild(scene.state);
         const bool memory = plan.fault == Fault::kNoMemory || plan.fault == Fault::kNoMemoryAtAll;
-        const int step = memory && scale() == 1 ? 8 : 1;
+        const int step = memory && tortureScale() == 1 ? 8 : 1;
         for (calls_ = 1; calls_ < 20'000; calls_ += calls_ < 64 ? 1 : step) {
             restoreNode();
             std::string told = before_ == "id" && scene.change != makeIdentity ? shared.told : "";
@@ -384,7 +380,7 @@ void killAtRandom(long changes, bool (*change)(long), void (*check)(long)) {
 
 TEST(TortureAtRandom, CacheUpdates) {
     killAtRandom(
-        100 * scale(), [](long i) { return TestCache("a").UpdateWithData(Json::Int64(i)); },
+        100 * tortureScale(), [](long i) { return TestCache("a").UpdateWithData(Json::Int64(i)); },
         [](long last) {
             const long found =
                 std::stol("0" + inChild([] { return TestCache("a").GetCachedData().asString(); }));
@@ -394,7 +390,7 @@ TEST(TortureAtRandom, CacheUpdates) {
 
 TEST(TortureAtRandom, Identities) {
     killAtRandom(
-        20 * scale(),
+        20 * tortureScale(),
         [](long) {
             shared.told[0] = '\0';
             return DRNode::resetLocalNodeId() && makeIdentity();

@@ -156,6 +156,10 @@ bool isDropped(int fd) {
     return journal;
 }
 
+bool isLock(int command) {
+    return command == F_SETLK || command == F_SETLKW || command == F_OFD_SETLK;
+}
+
 template <typename Real, typename... Offset>
 ssize_t writeTo(Real *real, int fd, const void *data, std::size_t size, Offset... offset) {
     const Verdict verdict = judge(Call::kWrite);
@@ -213,6 +217,13 @@ bool OvraTest::endFaults() {
                    ? real arguments                                                                \
                    : static_cast<result>(verdict == Verdict::kFail ? -1 : 0);                      \
     }
+#define OVRA_LOCK(name, parameters, isLock, arguments)                                             \
+    OVRA_REPLACE(int, name, parameters) {                                                          \
+        static int(*const real) parameters = next<int parameters>(#name);                          \
+        const Verdict verdict = judge(Call::kLook);                                                \
+        const bool lie = armed && plan.lie == Lie::kLock && isLock;                                \
+        return verdict == Verdict::kPass ? (lie ? 0 : real arguments) : -1;                        \
+    }
 #define OVRA_WRITE(name, parameters, ...)                                                          \
     OVRA_REPLACE(ssize_t, name, parameters) {                                                      \
         static ssize_t(*const real) parameters = next<ssize_t parameters>(#name);                  \
@@ -241,9 +252,9 @@ OVRA_COUNT(kLook, ssize_t, pread, (int fd, void *data, std::size_t size, off_t a
            (fd, data, size, at))
 OVRA_COUNT(kLook, ssize_t, pread64, (int fd, void *data, std::size_t size, off_t at),
            (fd, data, size, at))
-OVRA_COUNT(kLook, int, flock, (int fd, int operation), (fd, operation))
-OVRA_COUNT(kLook, int, fcntl, (int fd, int command, void *argument), (fd, command, argument))
-OVRA_COUNT(kLook, int, fcntl64, (int fd, int command, void *argument), (fd, command, argument))
+OVRA_LOCK(flock, (int fd, int operation), true, (fd, operation))
+OVRA_LOCK(fcntl, (int fd, int command, void *argument), isLock(command), (fd, command, argument))
+OVRA_LOCK(fcntl64, (int fd, int command, void *argument), isLock(command), (fd, command, argument))
 OVRA_COUNT(kChange, int, mkdir, (const char *path, mode_t mode), (path, mode))
 OVRA_COUNT(kChange, int, mknod, (const char *path, mode_t mode, dev_t device), (path, mode, device))
 OVRA_COUNT(kChange, int, chmod, (const char *path, mode_t mode), (path, mode))

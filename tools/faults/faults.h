@@ -21,6 +21,7 @@ enum class Lie {
     kSync,    ///< synchronising does nothing
     kRename,  ///< renaming over a file writes into that file
     kJournal, ///< what is written to a rollback journal is dropped
+    kLock,    ///< locking succeeds and does nothing
 };
 
 struct FaultPlan {
