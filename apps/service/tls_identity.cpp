@@ -1,6 +1,8 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "service/tls_identity.h"
 
+#include "service/certificate.h"
+
 #include <ovrabase/file.h>
 
 #include <gnutls/gnutls.h>
@@ -60,9 +62,11 @@ OvraBase::Expected<TlsIdentity> TlsIdentity::load(const std::string &keyFile,
     const gnutls_datum_t certificateDatum = datumOf(*certificate);
     const int code = gnutls_certificate_set_x509_key_mem(credentials.get(), &certificateDatum,
                                                          &keyDatum, GNUTLS_X509_FMT_PEM);
-    if (code < 0) {
+    const std::string problem =
+        code < 0 ? gnutls_strerror(code) : pairProblem(key->get(), *certificate);
+    if (!problem.empty()) {
         return Unexpected({keyFile + " and " + certificateFile +
-                           " are not a key and its certificate (" + gnutls_strerror(code) +
+                           " are not a key and its certificate (" + problem +
                            "): put the right ones there, or remove both and run ovradr setup"});
     }
     return TlsIdentity{std::move(*key), std::move(*certificate)};
