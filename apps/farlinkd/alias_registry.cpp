@@ -17,6 +17,8 @@ namespace {
 
 constexpr char kHeading[] = "farlink-aliases-1";
 constexpr mode_t kMode = 0600;
+/// What an owner's key consists of (RFC 4648, section 5).
+constexpr char kBase64Url[] = "ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz0123456789-_";
 
 bool atEnd(std::istringstream &words) {
     return (words >> std::ws).eof();
@@ -29,7 +31,8 @@ bool readHeading(std::istringstream &words, int &nextPort) {
 
 bool readAlias(std::istringstream &words, Alias &alias) {
     return words >> alias.name >> alias.port >> alias.expires >> alias.key && atEnd(words) &&
-           OvraPlatform::isFarlinkAlias(alias.name);
+           OvraPlatform::isFarlinkAlias(alias.name) &&
+           alias.key.find_first_not_of(kBase64Url) == std::string::npos;
 }
 
 } // namespace

@@ -57,6 +57,8 @@ Unexpected unusable(const std::string &path, const std::string &why) {
     return Unexpected({path + " cannot be used: " + why});
 }
 
+constexpr char kNoKey[] = "no sound private key that can be read without a pass phrase";
+
 /// A key that needs a pass phrase is refused: the daemon cannot prompt.
 int noPassPhrase(char *, int, int, void *) {
     return -1;
@@ -67,23 +69,38 @@ Bio bioOf(const std::string &text) {
     return Bio(BIO_new_mem_buf(text.data(), static_cast<int>(text.size())));
 }
 
+/// Both halves belong together, which OpenSSL does not ask when it reads them.
+bool isWhole(EVP_PKEY *key) {
+    const std::unique_ptr<EVP_PKEY_CTX, FreeWith<EVP_PKEY_CTX_free>> check(
+        EVP_PKEY_CTX_new(key, nullptr));
+    return check && EVP_PKEY_pairwise_check(check.get()) == 1;
+}
+
+Key readKey(const std::string &text) {
+    Key key(PEM_read_bio_PrivateKey(bioOf(text).get(), nullptr, noPassPhrase, nullptr));
+    return key && isWhole(key.get()) ? std::move(key) : nullptr;
+}
+
+Certificate readCertificate(const std::string &text) {
+    return Certificate(PEM_read_bio_X509(bioOf(text).get(), nullptr, noPassPhrase, nullptr));
+}
+
 Expected<Key> loadKey(const std::string &path) {
     const Expected<OvraBase::Secret> text =
         OvraBase::readPrivateFile(path, OvraBase::Links::kFollow);
     if (!text) {
         return unusable(path, text.error().text);
     }
-    Key key(PEM_read_bio_PrivateKey(bioOf(text->get()).get(), nullptr, noPassPhrase, nullptr));
+    Key key = readKey(text->get());
     if (!key) {
-        return unusable(path, "it holds no private key that can be read without a pass phrase");
+        return unusable(path, std::string("it holds ") + kNoKey);
     }
     return key;
 }
 
 Certificate loadCertificate(const std::string &path) {
     const Expected<std::string> text = OvraBase::readFile(path);
-    return Certificate(text ? PEM_read_bio_X509(bioOf(*text).get(), nullptr, noPassPhrase, nullptr)
-                            : nullptr);
+    return text ? readCertificate(*text) : nullptr;
 }
 
 std::string_view contentOf(BIO *bio) {
@@ -181,6 +198,17 @@ Expected<bool> createCertificate(const std::string &path, const std::string &key
         return unusable(path, "it holds no certificate of the key in " + keyPath);
     }
     return made;
+}
+
+std::string pairProblem(const std::string &key, const std::string &certificate) {
+    const Key readable = readKey(key);
+    const Certificate read = readCertificate(certificate);
+    if (!readable || !read) {
+        return std::string("there is ") + (readable ? "no certificate" : kNoKey);
+    }
+    return X509_check_private_key(read.get(), readable.get()) == 1
+               ? ""
+               : "the certificate is not of this key";
 }
 
 std::string certificateFingerprint(const std::string &path) {

@@ -27,6 +27,11 @@ struct ServerNames {
 [[nodiscard]] OvraBase::Expected<bool>
 createCertificate(const std::string &path, const std::string &keyPath, const ServerNames &names);
 
+/// Why no client could connect to a server with this key and this certificate, e.g. "the
+/// certificate is not of this key"; "" if they are sound. The key's halves are compared, too: a
+/// server starts with ones that do not belong together.
+std::string pairProblem(const std::string &key, const std::string &certificate);
+
 /// The fingerprint of the certificate's public key as clients see it ("SHA256:..."); "" if the file
 /// holds none.
 std::string certificateFingerprint(const std::string &path);

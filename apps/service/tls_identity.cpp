@@ -1,6 +1,8 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "service/tls_identity.h"
 
+#include "service/certificate.h"
+
 #include <ovrabase/file.h>
 
 #include <gnutls/gnutls.h>
@@ -60,8 +62,10 @@ OvraBase::Expected<TlsCredentials> TlsIdentity::credentials() const {
     const gnutls_datum_t certificateDatum = datumOf(certificate);
     const int code =
         gnutls_certificate_set_x509_key_mem(raw, &certificateDatum, &keyDatum, GNUTLS_X509_FMT_PEM);
-    if (code < 0) {
-        return Unexpected({gnutls_strerror(code)});
+    const std::string problem =
+        code < 0 ? gnutls_strerror(code) : pairProblem(key.get(), certificate);
+    if (!problem.empty()) {
+        return Unexpected({problem});
     }
     return credentials;
 }

@@ -16,7 +16,7 @@ namespace OvraPlatform {
 
 namespace {
 
-constexpr KeyFileKind kKind = {"ovradr-device-1 ", crypto_generichash_KEYBYTES, "remove it"};
+constexpr KeyFileKind kKind = {"ovradr-device", crypto_generichash_KEYBYTES, "remove it"};
 
 using Key = OvraBase::SecretBytes<crypto_generichash_KEYBYTES>;
 

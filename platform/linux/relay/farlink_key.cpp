@@ -13,9 +13,9 @@ namespace OvraPlatform {
 
 namespace {
 
-/// Precedes the key in its file and the signed text.
+/// Precedes the signed text.
 constexpr char kHeading[] = "ovradr-farlink-1 ";
-constexpr KeyFileKind kKind = {kHeading, crypto_sign_SECRETKEYBYTES,
+constexpr KeyFileKind kKind = {"ovradr-farlink", crypto_sign_SECRETKEYBYTES,
                                "restore it, or remove it and choose another alias"};
 
 std::string signedText(const std::string &alias, const std::string &challenge) {

@@ -10,7 +10,7 @@ namespace OvraPlatform {
 
 namespace {
 
-constexpr KeyFileKind kKind = {"ovradr-seal-1 ", crypto_box_SECRETKEYBYTES,
+constexpr KeyFileKind kKind = {"ovradr-seal", crypto_box_SECRETKEYBYTES,
                                "restore it, or remove it and set the appliance up again"};
 
 } // namespace

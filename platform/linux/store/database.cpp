@@ -21,6 +21,9 @@ namespace {
 /// Changes take milliseconds; a process that holds the file longer than this is stuck.
 constexpr std::chrono::seconds kBusyTimeout{5};
 
+/// Of SQLite's pages, in bytes (sqlite.org/fileformat.html, 1.3.2).
+constexpr off_t kSmallestPage = 512;
+
 const char *adviceFor(int code) {
     switch (code & 0xFF) {
     case SQLITE_CORRUPT:
@@ -179,6 +182,13 @@ bool Database::makeFile() {
         status.st_uid != geteuid()) {
         return fail("The " + std::string(layout_.name) + " [" + path_ +
                     "] is not a file of our own user. Remove it.");
+    }
+    // SQLite would take it for a new one and write over it. The journal of a change that did not
+    // end brings back what it was.
+    if (status.st_size != 0 && status.st_size < kSmallestPage &&
+        access((path_ + "-journal").c_str(), F_OK) != 0) {
+        return fail("The " + std::string(layout_.name) + " [" + path_ +
+                    "] is damaged: it is too short. Move it away, then a new one is made.");
     }
     if ((status.st_mode & 07777U) != (S_IRUSR | S_IWUSR)) {
         if ((status.st_mode & (S_IRWXG | S_IRWXO)) != 0) {

@@ -11,6 +11,7 @@
 #include <ovradrnode/sender.h>
 
 #include <csignal>
+#include <cstdlib>
 #include <filesystem>
 
 namespace OvradrTest {
@@ -51,6 +52,21 @@ inline std::string useDaemon(const std::function<void()> &prepare = [] {}) {
     const std::string said = daemon.line();
     kill(daemon.pid(), SIGTERM);
     return daemon.wait() >= 0 ? said : "";
+}
+
+/// The files of a version (tests/fixtures) and no others.
+inline void unpack(const fs::path &archive) {
+    startAnew();
+    const std::string command = "tar -C / -xzf '" + archive.string() + "'";
+    ASSERT_EQ(std::system(command.c_str()), 0) << command; // NOLINT: no other thread
+}
+
+inline fs::path newestArchive() {
+    fs::path newest;
+    for (const auto &entry : fs::directory_iterator(OVRA_FIXTURES)) {
+        newest = entry.path().extension() == ".gz" ? std::max(newest, entry.path()) : newest;
+    }
+    return newest;
 }
 
 } // namespace OvradrTest
