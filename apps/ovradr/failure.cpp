@@ -38,7 +38,7 @@ struct ErrorEntry {
 };
 
 constexpr const char *kAdministrator =
-    "Use an account that is an administrator on the other appliance.";
+    "Use an account of the other appliance with the role pairing or administrator.";
 constexpr const char *kSameVersion = "Check that both appliances run versions that fit together.";
 constexpr const char *kCheckName = "Check how it is written, and what the other appliance offers.";
 constexpr const char *kPairAgain = "Make a new credential with `ovradr cred create`.";

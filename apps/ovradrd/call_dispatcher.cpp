@@ -226,7 +226,7 @@ bool CallDispatcher::admit(Call &call) {
             return false;
         }
         call.caller.user = owner.account.name;
-        call.caller.administrator = owner.account.administrator;
+        call.caller.role = owner.account.role;
         call.caller.session = call.wire.sid;
     }
     if (const auto refused = registry_.refusal(call.wire, call.caller)) {
@@ -286,7 +286,8 @@ void CallDispatcher::noteRefusal(const Call &call, int code) {
 void CallDispatcher::run(const Call &call) {
     const OvraPlatform::ClientScope scope(call.caller.address);
     const Json::Value nothing;
-    const OvraPlatform::PeerKeyScope peer(call.caller.administrator ? call.wire.params : nothing);
+    const OvraPlatform::PeerKeyScope peer(
+        call.caller.role >= OvraPlatform::Role::kPairing ? call.wire.params : nothing);
     const auto begun = std::chrono::steady_clock::now();
     const Json::Value reply = registry_.dispatch(call.wire, call.caller);
     note(call, reply, std::chrono::steady_clock::now() - begun);
@@ -312,7 +313,7 @@ Json::Value CallDispatcher::serveLocal(const OvraPlatform::LocalCall &call) {
     std::future<Json::Value> reply = promise->get_future();
     APICaller caller;
     caller.user = call.user;
-    caller.administrator = true;
+    caller.role = OvraPlatform::Role::kAdministrator;
     caller.local = true;
     const auto run = [this, call, caller, promise] {
         // Without a client the session library would note one in the environment, which threads

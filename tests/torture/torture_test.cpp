@@ -141,7 +141,8 @@ void prepareStores() {
     fs::create_directories("/usr/ovra/var/ovradr");
     fs::permissions("/usr/ovra/var/ovradr", fs::perms::owner_all);
     const bool made = grant("joe") && grant("ann") && note() && enrol("old") &&
-                      TrustStore().create() && AccountStore().add("joe", "password", false);
+                      TrustStore().create() &&
+                      AccountStore().add("joe", "password", OvraPlatform::Role::kUser);
     if (!made) {
         std::abort();
     }

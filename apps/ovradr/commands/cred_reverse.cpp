@@ -9,6 +9,7 @@
 #include <ovradrnode/node_api.h>
 #include <ovradrnode/sender.h>
 #include <ovraplatform/api_errors.h>
+#include <ovraplatform/role.h>
 
 #include <memory>
 #include <vector>
@@ -21,6 +22,7 @@ using OvraDRCore::memberString;
 using OvraDRNode::Conn;
 using OvraDRNode::CredReverseCreate;
 using OvraDRNode::DRNode;
+using OvraPlatform::Role;
 namespace ERR = OvraDRCore::ERR;
 
 struct ReverseOptions {
@@ -45,12 +47,15 @@ Expected<void> checkAccount(const std::string &account) {
         return found;
     }
     const Json::Value &data = answer.getData();
-    if (data["administrator"].isBool() && data["administrator"].asBool()) {
+    const std::string role = memberString(data, "role");
+    if (role == OvraPlatform::roleWord(Role::kPairing) ||
+        role == OvraPlatform::roleWord(Role::kAdministrator)) {
         return {};
     }
     return failure(ExitCode::kNotPermitted,
-                   "The account " + account + " of this appliance is not an administrator.",
-                   "The other appliance would get no session with it; use another account.");
+                   "The account " + account + " of this appliance may not pair.",
+                   "The other appliance would get no session with it; use one with the role "
+                   "pairing or administrator.");
 }
 
 /// The endpoints to offer: the named ones, or all of this appliance.
@@ -140,8 +145,8 @@ void addCredReverseCommand(CLI::App &family, Command &chosen) {
     command->add_option("CRED_ID", options->credId, "Its id, or the beginning of it")->required();
     command
         ->add_option("--account", options->account,
-                     "Account of this appliance, an administrator, with whose rights the other "
-                     "one comes")
+                     "Account of this appliance that may pair, with whose rights the other one "
+                     "comes")
         ->required();
     command
         ->add_option("--endpoint", options->endpoints,

@@ -9,6 +9,8 @@
 
 #include <unistd.h>
 
+#include <algorithm>
+#include <array>
 #include <cctype>
 #include <memory>
 #include <vector>
@@ -19,12 +21,14 @@ namespace {
 
 using OvraPlatform::Account;
 using OvraPlatform::AccountStore;
+using OvraPlatform::Role;
 using OvraPlatform::SessionRecord;
 using OvraPlatform::SessionStore;
 
 struct UserOptions {
     std::string name;
     bool administrator = false;
+    std::string role;
     bool off = false;
     bool show = false;
     PasswordSource password;
@@ -53,7 +57,8 @@ Expected<Account> findAccount(AccountStore &store, const std::string &name) {
 Json::Value toJson(const Account &account) {
     Json::Value json;
     json["name"] = account.name;
-    json["administrator"] = account.administrator;
+    json["role"] = OvraPlatform::roleWord(account.role);
+    json["administrator"] = account.isAdministrator();
     json["disabled"] = account.disabled;
     json["remote_login"] = account.remoteLogin;
     json["one_time_code"] = account.oneTimeCode;
@@ -84,6 +89,26 @@ Expected<int> endSessions(const std::string &user) {
     return done ? Expected<int>(ended) : storeFailure(ExitCode::kNotSetUp, sessions.error());
 }
 
+constexpr std::array kRoles = {Role::kUser, Role::kPairing, Role::kAdministrator};
+
+/// For the command line: "" if it is a role, otherwise what is wrong.
+std::string checkRole(const std::string &word) {
+    const bool known = std::any_of(kRoles.begin(), kRoles.end(), [&word](Role role) {
+        return word == OvraPlatform::roleWord(role);
+    });
+    return known ? "" : "a role is user, pairing or administrator";
+}
+
+Role chosenRole(const UserOptions &options) {
+    const auto *const named = std::find_if(kRoles.begin(), kRoles.end(), [&options](Role role) {
+        return options.role == OvraPlatform::roleWord(role);
+    });
+    if (named != kRoles.end()) {
+        return *named;
+    }
+    return options.administrator ? Role::kAdministrator : Role::kUser;
+}
+
 std::string endedText(int sessions) {
     return sessions == 0 ? "" : " Its sessions (" + std::to_string(sessions) + ") have ended.";
 }
@@ -107,12 +132,12 @@ Outcome add(const UserOptions &options) {
     if (!password) {
         return Refusal(password.error());
     }
-    if (!store.add(options.name, password->get(), options.administrator)) {
+    if (!store.add(options.name, password->get(), chosenRole(options))) {
         return storeFailure(ExitCode::kFailed, store.error());
     }
     return changed(store, options.name,
-                   std::string(options.administrator ? "Administrator" : "User") + " " +
-                       options.name + " was added.");
+                   "The account " + options.name + " was added, with the role " +
+                       OvraPlatform::roleWord(chosenRole(options)) + ".");
 }
 
 Outcome list() {
@@ -130,7 +155,7 @@ Outcome list() {
     for (const Account &account : accounts) {
         report.data["users"].append(toJson(account));
         const char *login = !account.remoteLogin ? "not over the network" : "yes";
-        rows.push_back({account.name, account.administrator ? "administrator" : "user",
+        rows.push_back({account.name, OvraPlatform::roleWord(account.role),
                         account.disabled ? "disabled" : login, account.oneTimeCode ? "yes" : "no",
                         timeText(account.created)});
     }
@@ -264,11 +289,18 @@ void addUserCommands(CLI::App &app, Command &chosen) {
     const auto options = std::make_shared<UserOptions>();
 
     CLI::App *adding = addUserCommand(*family, "add", "Add an account.", options, chosen, add);
-    adding->add_flag("--admin", options->administrator, "The account is an administrator");
+    CLI::Option *admin =
+        adding->add_flag("--admin", options->administrator, "Short for --role administrator");
+    adding
+        ->add_option("--role", options->role,
+                     "user (the default), pairing (may pair, and send requests of the node web "
+                     "API) or administrator")
+        ->check(checkRole)
+        ->excludes(admin);
     addPasswordOptions(*adding, options->password);
     adding->footer("Without an option the password is asked for.\n"
                    "Examples:\n"
-                   "  ovradr user add repl --admin\n"
+                   "  ovradr user add repl --role pairing\n"
                    "  ovradr user add repl --admin --password-file /root/repl.password");
 
     CLI::App *listing = family->add_subcommand("list", "List the accounts.");

@@ -33,6 +33,7 @@ using OvraDRNode::DRNodeDB;
 using OvraPlatform::APICaller;
 using OvraPlatform::apiError;
 using OvraPlatform::apiSuccess;
+using OvraPlatform::Role;
 
 constexpr char kDirection[] = "cred_direction";
 constexpr char kUnidirection[] = "unidirection";
@@ -61,7 +62,8 @@ std::vector<Conn> localConns(Json::Value &refusal) {
     return conns;
 }
 
-/// The account of this appliance with whose rights another node comes back.
+/// The account of this appliance with whose rights another node comes back. Nobody gives away more
+/// rights than he has.
 std::string readLocalAccount(Params &in, const APICaller &caller) {
     constexpr char kName[] = "local_account";
     std::string named = in.optionalText(kName, Params::kMaxAccount);
@@ -70,10 +72,12 @@ std::string readLocalAccount(Params &in, const APICaller &caller) {
     }
     OvraPlatform::AccountStore accounts;
     const auto account = accounts.find(named);
-    if (!account || !account->administrator || account->disabled) {
-        in.refuse(kName, "local_account has to name an administrator of this appliance, with whose "
-                         "rights the other node comes back; only a caller with a session of its "
-                         "own may leave it out");
+    if (!account || !account->mayPair()) {
+        in.refuse(kName, "local_account has to name an account of this appliance that may pair, "
+                         "with whose rights the other node comes back; only a caller with a "
+                         "session of its own may leave it out");
+    } else if (named != caller.user && caller.role != Role::kAdministrator) {
+        in.refuse(kName, "local_account is the account of somebody else: leave it out");
     }
     return named;
 }
@@ -346,18 +350,29 @@ Json::Value testReverse(const Json::Value &params, const APICaller &caller) {
                                          [](CredReverseCreate &flow) { return flow.check(); });
 }
 
-Json::Value relay(const Json::Value &params, const APICaller & /*caller*/) {
+/// Whether the caller may have it relayed. The next node judges it by the rights of this one's
+/// account there, of which only an administrator may use all.
+bool mayRelay(const APICaller &caller, const OvraDRCore::Request &request) {
+    return caller.role == Role::kAdministrator || request.getAPI() == kNodeApi;
+}
+
+Json::Value relay(const Json::Value &params, const APICaller &caller) {
     Params in(params);
     const std::string credId = readCredId(in);
-    const Json::Value request = in.object("webapi");
+    const OvraDRCore::Request request(in.object("webapi"));
     if (!in.ok()) {
         return in.error();
+    }
+    if (request.isValid() && !mayRelay(caller, request)) {
+        return apiError(OvraPlatform::APIError::kNoPermission,
+                        "only requests of OVRA.DR.Node are relayed for this account: use an "
+                        "administrator's account");
     }
     DRNode record;
     if (!DRNodeDB::GetCred(credId, record)) {
         return noSuchCredential();
     }
-    RelayOperation operation(record, OvraDRCore::Request(request));
+    RelayOperation operation(record, request);
     if (!operation.IsValidParam()) {
         return OvraPlatform::apiBadParameter(
             "webapi", "webapi has to be a request (api, method, version, params), and no relay");
@@ -378,13 +393,12 @@ void addCredentialAPI(OvraPlatform::APIRegistry &registry) {
     using OvraPlatform::APIQueue;
     const auto add = [&registry](const char *method, APIQueue queue,
                                  const OvraPlatform::APIHandler &handler) {
-        registry.add(kCredentialApi, 1, method, OvraPlatform::APIRight::kAdministrator, queue,
-                     handler);
+        registry.add(kCredentialApi, 1, method, OvraPlatform::APIRight::kPairing, queue, handler);
     };
     add("get", APIQueue::kQuick, get);
     add("list", APIQueue::kQuick, list);
-    registry.add(kCredentialApi, 1, "create", OvraPlatform::APIRight::kAdministrator,
-                 APIQueue::kTwoWay, create, queueOfCreate);
+    registry.add(kCredentialApi, 1, "create", OvraPlatform::APIRight::kPairing, APIQueue::kTwoWay,
+                 create, queueOfCreate);
     add("temp_create", APIQueue::kOutbound, createTemporary);
     add("test_create", APIQueue::kOutbound, testCreate);
     add("set", APIQueue::kOutbound,

@@ -103,9 +103,9 @@ void addNodeAPI(OvraPlatform::APIRegistry &registry) {
     using OvraPlatform::APIQueue;
     using OvraPlatform::APIRight;
     registry.add(kNodeApi, 1, "info", APIRight::kSession, APIQueue::kQuick, info);
-    registry.add(kNodeApi, 1, "test_privilege", APIRight::kAdministrator, APIQueue::kQuick,
+    registry.add(kNodeApi, 1, "test_privilege", APIRight::kPairing, APIQueue::kQuick,
                  testPrivilege);
-    registry.add(kNodeApi, 1, "test_connection", APIRight::kAdministrator, APIQueue::kOutbound,
+    registry.add(kNodeApi, 1, "test_connection", APIRight::kPairing, APIQueue::kOutbound,
                  testConnection);
 }
 

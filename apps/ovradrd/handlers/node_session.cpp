@@ -70,13 +70,22 @@ Json::Value get(const Json::Value &params, const APICaller & /*caller*/) {
     return OvraPlatform::apiSuccess(data);
 }
 
-Json::Value remove(const Json::Value &params, const APICaller & /*caller*/) {
+/// One's own; any for an administrator.
+Json::Value remove(const Json::Value &params, const APICaller &caller) {
     Params in(params);
     const std::string session = in.text("session", Params::kMaxSession);
     if (!in.ok()) {
         return in.error();
     }
     NodeSession sessions;
+    if (caller.role != OvraPlatform::Role::kAdministrator) {
+        const std::string owner = sessions.GetUserBySession(session);
+        if (!owner.empty() && owner != caller.user) {
+            return OvraPlatform::apiError(
+                OvraPlatform::APIError::kNoPermission,
+                "the session of somebody else: use an administrator's account");
+        }
+    }
     sessions.DeleteBySessionId(session);
     return sessions.GetErrCode() == OvraDRCore::ERR::kNone
                ? OvraPlatform::apiSuccess()
@@ -89,12 +98,11 @@ void addNodeSessionAPI(OvraPlatform::APIRegistry &registry) {
     using OvraPlatform::APIQueue;
     using OvraPlatform::APIRight;
     constexpr char kApi[] = "OVRA.DR.Node.Session";
-    registry.add(kApi, 2, "create", APIRight::kAdministrator, APIQueue::kQuick, create);
-    registry.add(kApi, 1, "temp_create", APIRight::kAdministrator, APIQueue::kQuick,
-                 createTemporary);
+    registry.add(kApi, 2, "create", APIRight::kPairing, APIQueue::kQuick, create);
+    registry.add(kApi, 1, "temp_create", APIRight::kPairing, APIQueue::kQuick, createTemporary);
     // The holder of a session id may act as its user anyway.
     registry.add(kApi, 1, "get", APIRight::kSession, APIQueue::kQuick, get);
-    registry.add(kApi, 1, "delete", APIRight::kAdministrator, APIQueue::kQuick, remove);
+    registry.add(kApi, 1, "delete", APIRight::kPairing, APIQueue::kQuick, remove);
 }
 
 } // namespace Ovradrd

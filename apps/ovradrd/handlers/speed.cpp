@@ -118,9 +118,9 @@ Json::Value testSyncSpeed(const Json::Value &params, const APICaller & /*caller*
 void addSpeedAPI(OvraPlatform::APIRegistry &registry) {
     using OvraPlatform::APIQueue;
     using OvraPlatform::APIRight;
-    registry.add(kNodeApi, 1, "test_download_speed", APIRight::kAdministrator, APIQueue::kOutbound,
+    registry.add(kNodeApi, 1, "test_download_speed", APIRight::kPairing, APIQueue::kOutbound,
                  testDownloadSpeed);
-    registry.add(kNodeApi, 1, "test_sync_speed", APIRight::kAdministrator, APIQueue::kTwoWay,
+    registry.add(kNodeApi, 1, "test_sync_speed", APIRight::kPairing, APIQueue::kTwoWay,
                  testSyncSpeed);
 }
 

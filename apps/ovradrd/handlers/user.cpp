@@ -20,7 +20,7 @@ Json::Value getUser(const Json::Value &params, const APICaller &caller) {
     if (!in.ok()) {
         return in.error();
     }
-    if (name != caller.user && !caller.administrator) {
+    if (name != caller.user && caller.role != OvraPlatform::Role::kAdministrator) {
         return apiError(APIError::kNoPermission,
                         "the account of somebody else: use an administrator's account");
     }
@@ -35,7 +35,8 @@ Json::Value getUser(const Json::Value &params, const APICaller &caller) {
     }
     Json::Value data(Json::objectValue);
     data["name"] = account->name;
-    data["administrator"] = account->administrator;
+    data["role"] = OvraPlatform::roleWord(account->role);
+    data["administrator"] = account->isAdministrator();
     data["disabled"] = account->disabled;
     data["one_time_code"] = account->oneTimeCode;
     return OvraPlatform::apiSuccess(data);

@@ -19,8 +19,9 @@ namespace OvraPlatform {
 
 namespace {
 
-// "OvAc". last_step is the TOTP step whose code was accepted last.
-constexpr DatabaseLayout kLayout = {"account store", 0x4F764163, 1, R"(
+// "OvAc". last_step is the TOTP step whose code was accepted last; role is a number of Role, and
+// before layout 2 was whether the account is an administrator.
+constexpr DatabaseLayout kLayout = {"account store", 0x4F764163, 2, R"(
     CREATE TABLE account (
         name      TEXT PRIMARY KEY,
         hash      TEXT NOT NULL,
@@ -31,6 +32,10 @@ constexpr DatabaseLayout kLayout = {"account store", 0x4F764163, 1, R"(
         last_step INTEGER NOT NULL DEFAULT -1,
         created   INTEGER NOT NULL
     ) STRICT, WITHOUT ROWID;
+)",
+                                    R"(
+    ALTER TABLE account RENAME COLUMN admin TO role;
+    UPDATE account SET role = 2 WHERE role != 0;
 )"};
 
 constexpr unsigned long long kOpsLimit = crypto_pwhash_OPSLIMIT_INTERACTIVE;
@@ -66,10 +71,22 @@ bool isNameCharacter(char c) {
     return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z') || (c >= '0' && c <= '9') || c == '_';
 }
 
+/// A number that this version does not know grants nothing.
+Role roleOf(std::int64_t number) {
+    switch (number) {
+    case static_cast<int>(Role::kAdministrator):
+        return Role::kAdministrator;
+    case static_cast<int>(Role::kPairing):
+        return Role::kPairing;
+    default:
+        return Role::kUser;
+    }
+}
+
 Account readAccount(const Statement &row) {
     Account account;
     account.name = row.text(0);
-    account.administrator = row.number(1) != 0;
+    account.role = roleOf(row.number(1));
     account.disabled = row.number(2) != 0;
     account.remoteLogin = row.number(3) != 0;
     account.oneTimeCode = row.number(4) != 0;
@@ -110,7 +127,7 @@ bool AccountStore::changedOne(const std::string &name) {
     return database_.changes() == 1 || database_.refuse("There is no account [" + name + "].");
 }
 
-bool AccountStore::add(const std::string &name, std::string_view password, bool administrator) {
+bool AccountStore::add(const std::string &name, std::string_view password, Role role) {
     if (!isOpen()) {
         return false;
     }
@@ -130,11 +147,11 @@ bool AccountStore::add(const std::string &name, std::string_view password, bool 
     }
     const bool done =
         database_
-            .prepare("INSERT INTO account (name, hash, admin, created) SELECT ?1, ?2, ?3, ?4 "
+            .prepare("INSERT INTO account (name, hash, role, created) SELECT ?1, ?2, ?3, ?4 "
                      "WHERE (SELECT count(*) FROM account) < ?5 ON CONFLICT DO NOTHING")
             .bind(1, name)
             .bind(2, hash)
-            .bind(3, administrator ? 1 : 0)
+            .bind(3, static_cast<int>(role))
             .bind(4, now())
             .bind(5, kMaxAccounts)
             .run();
@@ -173,8 +190,8 @@ bool AccountStore::setColumn(const char *sql, const std::string &name, std::int6
     return database_.prepare(sql).bind(1, name).bind(2, value).run() && changedOne(name);
 }
 
-bool AccountStore::setAdministrator(const std::string &name, bool administrator) {
-    return setColumn("UPDATE account SET admin = ?2 WHERE name = ?1", name, administrator ? 1 : 0);
+bool AccountStore::setRole(const std::string &name, Role role) {
+    return setColumn("UPDATE account SET role = ?2 WHERE name = ?1", name, static_cast<int>(role));
 }
 
 bool AccountStore::setDisabled(const std::string &name, bool disabled) {
@@ -220,7 +237,7 @@ std::optional<Account> AccountStore::find(const std::string &name) {
         return std::nullopt;
     }
     database_.clearError();
-    Statement row = database_.prepare("SELECT name, admin, disabled, remote, totp IS NOT NULL, "
+    Statement row = database_.prepare("SELECT name, role, disabled, remote, totp IS NOT NULL, "
                                       "created FROM account WHERE name = ?1");
     row.bind(1, name);
     return row.step() ? std::optional(readAccount(row)) : std::nullopt;
@@ -231,7 +248,7 @@ bool AccountStore::list(std::vector<Account> &accounts) {
         return false;
     }
     database_.clearError();
-    Statement row = database_.prepare("SELECT name, admin, disabled, remote, totp IS NOT NULL, "
+    Statement row = database_.prepare("SELECT name, role, disabled, remote, totp IS NOT NULL, "
                                       "created FROM account ORDER BY name");
     while (row.step()) {
         accounts.push_back(readAccount(row));

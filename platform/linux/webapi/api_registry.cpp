@@ -107,7 +107,11 @@ std::optional<Json::Value> APIRegistry::refusal(const APICall &call,
     if (entry->right != APIRight::kNone && caller.user.empty()) {
         return apiError(APIError::kNoSession, "the session is unknown or expired: log in again");
     }
-    if (entry->right == APIRight::kAdministrator && !caller.administrator) {
+    if (entry->right == APIRight::kPairing && caller.role < Role::kPairing) {
+        return apiError(APIError::kNoPermission, "the call needs the right to pair: use an account "
+                                                 "with the role pairing or administrator");
+    }
+    if (entry->right == APIRight::kAdministrator && caller.role != Role::kAdministrator) {
         return apiError(APIError::kNoPermission,
                         "the call needs an administrator: use an administrator's account");
     }

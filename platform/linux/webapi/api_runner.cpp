@@ -95,7 +95,7 @@ Json::Value runHere(const OvraPlatform::LocalCall &call,
                     const OvraPlatform::APIRegistry &registry) {
     OvraPlatform::APICaller caller;
     caller.user = call.user;
-    caller.administrator = true;
+    caller.role = OvraPlatform::Role::kAdministrator;
     caller.local = true;
     return registry.dispatch(call, caller);
 }

@@ -97,7 +97,7 @@ TEST(FilesOfThisAndOlderVersions, AreRead) {
         const std::string kept = unchangeable();
         const std::string told = askEverything();
         for (const char *part :
-             {"ann", "n1", "value", "nas1", "farlinkd: ready", "ovradrd: ready"}) {
+             {"ann   administrator", "n1", "value", "nas1", "farlinkd: ready", "ovradrd: ready"}) {
             EXPECT_TRUE(holds(told, part)) << entry.path() << ": " << part << "\n" << told;
         }
         std::vector<OvraApps::PendingRelease> notes;

@@ -59,7 +59,10 @@ void Appliance::provision() {
 
 void Appliance::addAccount(const std::string &name, bool administrator) {
     OvraPlatform::AccountStore accounts;
-    require(accounts.add(name, kPassword, administrator), accounts.error().c_str());
+    require(accounts.add(name, kPassword,
+                         administrator ? OvraPlatform::Role::kAdministrator
+                                       : OvraPlatform::Role::kUser),
+            accounts.error().c_str());
 }
 
 std::string Appliance::session(const std::string &user, int timeout) {

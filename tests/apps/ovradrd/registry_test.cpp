@@ -15,6 +15,7 @@ using OvraPlatform::APIRight;
 
 const std::map<APIRight, std::string> kRights{{APIRight::kNone, "anybody"},
                                               {APIRight::kSession, "session"},
+                                              {APIRight::kPairing, "pairing"},
                                               {APIRight::kAdministrator, "administrator"},
                                               {APIRight::kLocal, "local"}};
 const std::map<APIQueue, std::string> kQueues{{APIQueue::kQuick, "quick"},

@@ -14,6 +14,7 @@
 
 namespace {
 
+using OvraPlatform::Role;
 using OvraTest::Appliance;
 using OvraTest::json;
 using OvraTest::Reply;
@@ -26,7 +27,8 @@ struct Scene {
     int nobody; ///< codes for a caller without a session, a user, and an administrator
     int user;
     int administrator;
-    int here = administrator; ///< for a process of the appliance
+    int here = administrator;    ///< for a process of the appliance
+    int pairing = administrator; ///< for an account that may pair
 };
 
 constexpr char kNode[] = "OVRA.DR.Node";
@@ -45,9 +47,9 @@ const Scene kScenes[] = {
     {"OVRA.Core.Auth", "login", "{}", 1, 106, 106, 106, 101},
     {"OVRA.Core.Auth", "logout", "{}", 1, 119, 0, 0, 119},
     {"OVRA.Core.Encryption", "getinfo", "{}", 1, 0, 0, 0},
-    {kUser, "get", R"({"name":"user"})", 1, 119, 0, 0},
-    {kUser, "get", R"({"name":"root"})", 1, 119, 105, 0},
-    {kUser, "get", R"({"name":"none"})", 1, 119, 105, 106},
+    {kUser, "get", R"({"name":"user"})", 1, 119, 0, 0, 0, 105},
+    {kUser, "get", R"({"name":"root"})", 1, 119, 105, 0, 0, 105},
+    {kUser, "get", R"({"name":"none"})", 1, 119, 105, 106, 106, 105},
     {kUser, "get", "{}", 1, 119, 106, 106},
     {"OVRA.Core.Farlink", "get", "{}", 1, 119, 105, 105, 0},
     {kNode, "info", "{}", 1, 119, 0, 0},
@@ -86,6 +88,7 @@ TEST_F(Rights, AreAskedForOfEveryCaller) {
     addAccount("root", true);
     addAccount("disabled", true);
     addAccount("gone", true);
+    addAccount("pair", false);
     OvraPlatform::AccountStore accounts;
     const auto granted = [this](const char *user, const Scene &grant) {
         const Json::Value params = json(grant.params);
@@ -98,7 +101,7 @@ TEST_F(Rights, AreAskedForOfEveryCaller) {
     std::string ofUser = granted("user", forNode);
     const std::string ofDisabled = granted("disabled", forNode);
     const std::string ofGone = granted("gone", forNode);
-    ASSERT_TRUE(accounts.setAdministrator("user", false) &&
+    ASSERT_TRUE(accounts.setRole("user", Role::kUser) && accounts.setRole("pair", Role::kPairing) &&
                 accounts.setDisabled("disabled", true) && accounts.remove("gone"));
     const struct {
         const char *name;
@@ -113,6 +116,8 @@ TEST_F(Rights, AreAskedForOfEveryCaller) {
         {"a user", [] { return session("user"); }, &Scene::user},
         {"an administrator", [] { return session("root"); }, &Scene::administrator},
         {"a node", [&] { return granted("root", forNode); }, &Scene::administrator},
+        {"an account that may pair", [] { return session("pair"); }, &Scene::pairing},
+        {"a node of that", [&] { return granted("pair", forNode); }, &Scene::pairing},
         {"a lent session", [&] { return granted("root", lent); }, &Scene::administrator},
         {"a node, whose account is no administrator any more",
          [&] {
@@ -131,6 +136,40 @@ TEST_F(Rights, AreAskedForOfEveryCaller) {
         const Json::Value here = callHere(scene.api, scene.version, scene.method, params);
         EXPECT_EQ(here["success"] == true ? 0 : here["error"]["code"].asInt(), scene.here)
             << scene.api << " " << scene.method << " " << scene.params << " by a local process";
+    }
+}
+
+TEST_F(Rights, OfAnAccountThatMayPairAreItsOwnAndNobodyElses) {
+    addAccount("root", true);
+    addAccount("pair", false);
+    ASSERT_TRUE(OvraPlatform::AccountStore().setRole("pair", Role::kPairing));
+    OvraTest::addCred("node_cred", "n1", "c1", "http", 1, "s");
+    const std::string own = session("pair");
+    const std::string others = session("root");
+    const std::string other = R"({"session":")" + others + R"("})";
+    constexpr char kBack[] = R"({"cred_id":"c1","local_account":"root"})";
+    constexpr char kBothWays[] =
+        R"({"auth":"session","session":"s","conn":{"addr":"127.0.0.1","protocol":"http","port":1},
+            "cred_direction":"bidirection","local_account":"root"})";
+    const auto relayed = [](const char *api, const char *method) {
+        return std::string(R"({"cred_id":"c1","webapi":{"version":1,"api":")") + api +
+               R"(","method":")" + method + R"("}})";
+    };
+    const std::tuple<const char *, const char *, std::string, int, int> cases[] = {
+        // with the codes for it and for an administrator of a node that has no address
+        {kSession, "delete", other, 105, 0},
+        {kCredential, "reverse_create", kBack, 106, 401},
+        {kCredential, "test_reverse_create", kBack, 106, 401},
+        {kCredential, "temp_reverse_create", kBack, 106, 401},
+        {kCredential, "create", kBothWays, 106, 401},
+        {kCredential, "relay", relayed(kNode, "info"), 500, 500},
+        {kCredential, "relay", relayed(kSession, "temp_create"), 105, 500},
+        {kCredential, "relay", relayed(kCredential, "create"), 105, 500},
+    };
+    for (const auto &[api, method, params, code, ofRoot] : cases) {
+        EXPECT_EQ(call(api, 1, method, json(params), own).code(), code) << method << params;
+        EXPECT_EQ(call(api, 1, method, json(params), session("root")).code(), ofRoot)
+            << method << params;
     }
 }
 
@@ -157,9 +196,9 @@ TEST_F(Session, IsWorthWhatItsAccountIsWorthNow) {
     OvraPlatform::AccountStore accounts;
     const auto code = [&] { return call(kNode, 1, "test_privilege", {}, sid).code(); };
     EXPECT_EQ(code(), 0);
-    ASSERT_TRUE(accounts.setAdministrator("alice", false));
+    ASSERT_TRUE(accounts.setRole("alice", Role::kUser));
     EXPECT_EQ(code(), 105);
-    ASSERT_TRUE(accounts.setAdministrator("alice", true));
+    ASSERT_TRUE(accounts.setRole("alice", Role::kAdministrator));
     ASSERT_TRUE(accounts.setDisabled("alice", true));
     EXPECT_EQ(code(), 105);
     ASSERT_TRUE(accounts.remove("alice"));

@@ -57,7 +57,7 @@ struct Accounts : OvraTest::OwnFiles {
 
 TEST_F(Accounts, LogInAsTheirStateAllows) {
     for (const char *name : {"plain", "disabled", "local", "coded", "disabledCoded"}) {
-        ASSERT_TRUE(store().add(name, kPassword, false)) << store().error();
+        ASSERT_TRUE(store().add(name, kPassword, Role::kUser)) << store().error();
     }
     ASSERT_TRUE(store().setDisabled("disabled", true) && store().setRemoteLogin("local", false) &&
                 store().setTotp("coded", kSecret) && store().setTotp("disabledCoded", kSecret) &&
@@ -87,7 +87,7 @@ TEST_F(Accounts, LogInAsTheirStateAllows) {
 }
 
 TEST_F(Accounts, AnUnknownNameTakesAsLongAsAWrongPassword) {
-    ASSERT_TRUE(store().add("ann", kPassword, false));
+    ASSERT_TRUE(store().add("ann", kPassword, Role::kUser));
     verify("warm", "up");
     // CPU time, not wall-clock time spent waiting for a processor.
     const auto cost = [&](const char *name) {
@@ -112,7 +112,7 @@ TEST_F(Accounts, AnUnknownNameTakesAsLongAsAWrongPassword) {
 }
 
 TEST_F(Accounts, ACodeIsAcceptedOnceAndNoEarlierOneAfterIt) {
-    ASSERT_TRUE(store().add("ann", kPassword, false) && store().setTotp("ann", kSecret));
+    ASSERT_TRUE(store().add("ann", kPassword, Role::kUser) && store().setTotp("ann", kSecret));
     EXPECT_EQ(verify("ann", kPassword, kCode), 0);
     EXPECT_EQ(verify("ann", kPassword, kCode), 404);
     EXPECT_EQ(verify("ann", kPassword, kEarlierCode), 404);
@@ -125,7 +125,7 @@ TEST_F(Accounts, ACodeIsAcceptedOnceAndNoEarlierOneAfterIt) {
 }
 
 TEST_F(Accounts, OfTwoLogInsAtOnceWithTheSameCodeOneIsLetIn) {
-    ASSERT_TRUE(store().add("ann", kPassword, false) && store().setTotp("ann", kSecret));
+    ASSERT_TRUE(store().add("ann", kPassword, Role::kUser) && store().setTotp("ann", kSecret));
     // The store reads the clock after it has read the account and before it checks the code.
     int meanwhile = -1;
     AccountStore slower(file(), [&] {
@@ -137,7 +137,7 @@ TEST_F(Accounts, OfTwoLogInsAtOnceWithTheSameCodeOneIsLetIn) {
 }
 
 TEST_F(Accounts, OfEightLogInsAtOnceWithTheSameCodeOneIsLetInAndNoneLater) {
-    ASSERT_TRUE(store().add("ann", kPassword, false) && store().setTotp("ann", kSecret));
+    ASSERT_TRUE(store().add("ann", kPassword, Role::kUser) && store().setTotp("ann", kSecret));
     for (std::size_t round = rounds(10); round > 0; --round, time += 30) {
         ASSERT_TRUE(RawSqlite(file()).run("UPDATE account SET hash = '" + cheapHash() + "'"));
         const std::string code = OvraTest::totp(kSecret, time);
@@ -154,14 +154,16 @@ TEST_F(Accounts, OfEightLogInsAtOnceWithTheSameCodeOneIsLetInAndNoneLater) {
 }
 
 TEST_F(Accounts, AreListedByName) {
-    ASSERT_TRUE(store().add("bob", kPassword, false) && store().add("ann", kPassword, true));
+    ASSERT_TRUE(store().add("bob", kPassword, Role::kUser) &&
+                store().add("ann", kPassword, Role::kAdministrator));
     ASSERT_TRUE(store().setTotp("ann", "gezd gnbv gy3t qojq gezd gnbv gy3t qojq"));
     std::vector<Account> accounts;
     ASSERT_TRUE(store().list(accounts));
     ASSERT_EQ(accounts.size(), 2U);
     EXPECT_EQ(accounts[0].name, "ann");
-    EXPECT_TRUE(accounts[0].administrator && accounts[0].oneTimeCode && accounts[0].remoteLogin);
-    EXPECT_FALSE(accounts[0].disabled || accounts[1].administrator || accounts[1].oneTimeCode);
+    EXPECT_TRUE(accounts[0].isAdministrator() && accounts[0].oneTimeCode &&
+                accounts[0].remoteLogin);
+    EXPECT_FALSE(accounts[0].disabled || accounts[1].isAdministrator() || accounts[1].oneTimeCode);
     EXPECT_EQ(accounts[0].created, time);
     ASSERT_TRUE(store().remove("ann"));
     EXPECT_FALSE(store().exists("ann"));
@@ -170,9 +172,9 @@ TEST_F(Accounts, AreListedByName) {
 
 TEST_F(Accounts, WhatCannotBeDoneIsRefusedWithAReason) {
     AccountStore accounts = store();
-    ASSERT_TRUE(accounts.add("ann", kPassword, false));
+    ASSERT_TRUE(accounts.add("ann", kPassword, Role::kUser));
     const auto reason = [&](bool done) { return done ? std::string("done") : accounts.error(); };
-    EXPECT_EQ(reason(accounts.add("ann", "other password", true)),
+    EXPECT_EQ(reason(accounts.add("ann", "other password", Role::kUser)),
               "There is an account [ann] already.");
     EXPECT_EQ(reason(accounts.setDisabled("bob", true)), "There is no account [bob].");
     EXPECT_NE(reason(accounts.setPassword("ann", "short")).find("8 to 1024"), std::string::npos);
@@ -182,7 +184,7 @@ TEST_F(Accounts, WhatCannotBeDoneIsRefusedWithAReason) {
     }
     EXPECT_NE(reason(accounts.setTotp("ann", "GEZDGNBV")).find("base32"), std::string::npos);
     EXPECT_EQ(verify("ann", kPassword), 0);
-    EXPECT_FALSE(accounts.find("ann")->administrator);
+    EXPECT_FALSE(accounts.find("ann")->isAdministrator());
 }
 
 TEST(AccountNames, AreOfASafeSet) {
@@ -198,7 +200,7 @@ TEST(AccountNames, AreOfASafeSet) {
 }
 
 TEST_F(Accounts, AHashOfAnotherCostIsRenewedAtTheNextLogIn) {
-    ASSERT_TRUE(store().add("ann", kPassword, false));
+    ASSERT_TRUE(store().add("ann", kPassword, Role::kUser));
     const std::string cheap = cheapHash();
     RawSqlite raw(file());
     ASSERT_TRUE(raw.run("UPDATE account SET hash = '" + cheap + "'"));
@@ -214,7 +216,7 @@ TEST_F(Accounts, ADamagedStoreLetsNobodyIn) {
     chmod(path("state").c_str(), 0700);
     EXPECT_EQ(verify("ann", kPassword), static_cast<int>(LoginResult::kStoreFailed));
     EXPECT_FALSE(store().exists("ann"));
-    EXPECT_FALSE(store().add("ann", kPassword, true));
+    EXPECT_FALSE(store().add("ann", kPassword, Role::kAdministrator));
 }
 
 } // namespace

@@ -18,15 +18,16 @@ int codeOf(const Json::Value &reply) {
 Json::Value echo(const Json::Value &params, const APICaller &caller) {
     Json::Value data;
     data["params"] = params;
-    data["caller"] = caller.user + (caller.administrator ? " administrator" : "") +
+    data["caller"] = caller.user +
+                     (caller.role == OvraPlatform::Role::kAdministrator ? " administrator" : "") +
                      (caller.local ? " local" : "");
     return apiSuccess(data);
 }
 
 const APICaller kNobody{};
-const APICaller kUser{"ann", false, "s1", "192.0.2.1", false};
-const APICaller kAdministrator{"root", true, "s2", "192.0.2.1", false};
-const APICaller kLocal{"admin", true, "", "", true};
+const APICaller kUser{"ann", Role::kUser, "s1", "192.0.2.1", false};
+const APICaller kAdministrator{"root", Role::kAdministrator, "s2", "192.0.2.1", false};
+const APICaller kLocal{"admin", Role::kAdministrator, "", "", true};
 
 TEST(APIRegistry, AnswersWithTheCodeOfTheWireFormAndKnowsTheQueueOfACall) {
     APIRegistry registry;

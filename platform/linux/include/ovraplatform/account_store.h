@@ -4,6 +4,7 @@
 #include "ovraplatform/appliance.h"
 #include "ovraplatform/database.h"
 #include "ovraplatform/export.h"
+#include "ovraplatform/role.h"
 
 #include <cstdint>
 #include <ctime>
@@ -18,11 +19,15 @@ namespace OvraPlatform {
 /// An account of the appliance, as it may be shown.
 struct Account {
     std::string name;
-    bool administrator = false;
+    Role role = Role::kUser;
     bool disabled = false;
     bool remoteLogin = true; ///< may log in over the network
     bool oneTimeCode = false;
     std::int64_t created = 0; ///< seconds of the system clock
+
+    bool isAdministrator() const { return role == Role::kAdministrator; }
+    /// Whether another node may be paired with it and act with its rights.
+    bool mayPair() const { return role >= Role::kPairing && !disabled; }
 };
 
 /// The result of a log-in; the numbers are the log-in codes of the web API.
@@ -63,9 +68,9 @@ public:
     static bool isName(std::string_view name);
 
     /// \param password  kMinPassword to kMaxPassword bytes of UTF-8, wiped by the caller
-    [[nodiscard]] bool add(const std::string &name, std::string_view password, bool administrator);
+    [[nodiscard]] bool add(const std::string &name, std::string_view password, Role role);
     [[nodiscard]] bool setPassword(const std::string &name, std::string_view password);
-    [[nodiscard]] bool setAdministrator(const std::string &name, bool administrator);
+    [[nodiscard]] bool setRole(const std::string &name, Role role);
     [[nodiscard]] bool setDisabled(const std::string &name, bool disabled);
     [[nodiscard]] bool setRemoteLogin(const std::string &name, bool permitted);
     /// From now on a log-in needs a code generated from `secret` (base32, see totp.h).

@@ -3,6 +3,7 @@
 
 #include "ovraplatform/api_call.h"
 #include "ovraplatform/export.h"
+#include "ovraplatform/role.h"
 
 #include <json/value.h>
 #include <tl/expected.hpp>
@@ -19,6 +20,7 @@ namespace OvraPlatform {
 enum class APIRight {
     kNone,          ///< anybody, even without a session
     kSession,       ///< any user who is logged in
+    kPairing,       ///< a logged-in user who may pair
     kAdministrator, ///< an administrator who is logged in
     kLocal,         ///< a process of this appliance
 };
@@ -36,7 +38,7 @@ enum class APIQueue {
 /// On whose behalf a handler runs.
 struct APICaller {
     std::string user; ///< empty: nobody is logged in
-    bool administrator = false;
+    Role role = Role::kUser;
     std::string session; ///< the session id; empty for a local caller
     std::string address; ///< the client's address; empty for a local caller
     bool local = false;  ///< a process of this appliance, not a remote client
