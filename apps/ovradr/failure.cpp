@@ -1,14 +1,13 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "failure.h"
 
+#include "access.h"
 #include "target.h"
 
 #include <ovradrcore/json.h>
 #include <ovradrcore/response.h>
 #include <ovraplatform/api_errors.h>
 #include <ovraplatform/login_refusal.h>
-
-#include <unistd.h>
 
 #include <algorithm>
 #include <array>
@@ -215,11 +214,12 @@ ExitCode exitOf(CredError error) {
 }
 
 Refusal storeFailure(ExitCode exit, const std::string &sentences) {
+    if (auto allowed = checkUser(); !allowed) {
+        return Refusal(allowed.error());
+    }
     const std::size_t end = sentences.find(". ");
     return failure(exit, sentences.substr(0, end == std::string::npos ? end : end + 1),
-                   geteuid() != 0             ? "Run the command as root."
-                   : end == std::string::npos ? ""
-                                              : sentences.substr(end + 2));
+                   end == std::string::npos ? "" : sentences.substr(end + 2));
 }
 
 Refusal failureOf(int code, const Json::Value &detail) {

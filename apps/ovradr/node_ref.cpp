@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "node_ref.h"
 
+#include "access.h"
 #include "provision/node_database.h"
 
 #include <ovradrnode/node_db.h>
@@ -42,6 +43,9 @@ Expected<std::string> chooseId(const std::set<std::string> &ids, const std::stri
 }
 
 Expected<std::string> localNode() {
+    if (const auto allowed = checkUser(); !allowed) {
+        return Refusal(allowed.error());
+    }
     const std::string id = DRNode::getLocalNodeId();
     if (id.empty()) {
         return failure(ExitCode::kNotSetUp,

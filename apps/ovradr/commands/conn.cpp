@@ -1,4 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
+#include "access.h"
 #include "commands/commands.h"
 #include "endpoint.h"
 #include "output.h"
@@ -66,7 +67,9 @@ Outcome test(const Conn &conn) {
     report.text = listing({{"endpoint", targetText(conn)},
                            {"connectable", "yes, in " + std::to_string(took) + " ms"},
                            {"key", met ? met->fingerprint : "none shown"},
-                           {"trusted", met ? trustText(*met) : ""}});
+                           {"trusted", !met          ? ""
+                                       : checkUser() ? trustText(*met)
+                                                     : "only root can tell"}});
     return report;
 }
 
@@ -80,6 +83,9 @@ std::string knownText(const std::optional<TrustStore::Entry> &known) {
 }
 
 Outcome forget(const Conn &conn) {
+    if (const auto allowed = checkUser(); !allowed) {
+        return Refusal(allowed.error());
+    }
     const std::string endpoint = trustKey(conn);
     TrustStore store;
     if (!store.list()) {
@@ -180,11 +186,11 @@ void addTrustCommand(CLI::App &family, Command &chosen) {
                     "  ovradr conn trust https://nas2\n"
                     "  ovradr conn trust flk:nas3 --fingerprint SHA256:...");
     command->callback([&chosen, options] {
-        chosen = [options] {
+        chosen = forOwnUser([options] {
             return parseTarget(options->url).and_then([&options](const Conn &conn) {
                 return trust(conn, options->fingerprint);
             });
-        };
+        });
     });
 }
 
@@ -196,7 +202,7 @@ void addConnCommands(CLI::App &app, Command &chosen) {
     CLI::App *localCommand =
         family->add_subcommand("local", "List where this appliance serves, and with which keys.");
     localCommand->footer("Example:\n  ovradr conn local");
-    localCommand->callback([&chosen] { chosen = local; });
+    localCommand->callback([&chosen] { chosen = forOwnUser(local); });
     addUrlCommand(*family, "test", "Test whether an endpoint answers, and with which key.",
                   "ovradr conn test https://nas2", chosen, test);
     addTrustCommand(*family, chosen);

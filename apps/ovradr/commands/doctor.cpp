@@ -1,4 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
+#include "access.h"
 #include "commands/commands.h"
 #include "diagnosis.h"
 #include "endpoint.h"
@@ -142,7 +143,8 @@ void addDoctorCommand(CLI::App &app, Command &chosen) {
                     "  ovradr doctor\n"
                     "  ovradr doctor 3f2a\n"
                     "  ovradr doctor https://nas2 --account repl");
-    command->callback([&chosen, options] { chosen = [options] { return doctor(*options); }; });
+    command->callback(
+        [&chosen, options] { chosen = forOwnUser([options] { return doctor(*options); }); });
 }
 
 } // namespace Ovradr

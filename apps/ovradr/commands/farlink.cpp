@@ -1,4 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
+#include "access.h"
 #include "commands/commands.h"
 #include "output.h"
 #include "target.h"
@@ -227,16 +228,16 @@ void addFarlinkCommands(CLI::App &app, Command &chosen) {
     enableCommand->footer("Example:\n"
                           "  ovradr farlink enable --server https://relay.example --alias nas1");
     enableCommand->callback(
-        [&chosen, options] { chosen = [options] { return enable(*options); }; });
+        [&chosen, options] { chosen = forOwnUser([options] { return enable(*options); }); });
     CLI::App *disableCommand = family->add_subcommand("disable", "Use no relay service any more.");
     disableCommand->add_flag("--release", options->release, "Give the alias up, for anybody");
     disableCommand->footer("Example:\n  ovradr farlink disable");
     disableCommand->callback(
-        [&chosen, options] { chosen = [options] { return disable(*options); }; });
+        [&chosen, options] { chosen = forOwnUser([options] { return disable(*options); }); });
     CLI::App *statusCommand = family->add_subcommand(
         "status", "Show which service is used, and whether this appliance is reached there.");
     statusCommand->footer("Example:\n  ovradr farlink status");
-    statusCommand->callback([&chosen] { chosen = status; });
+    statusCommand->callback([&chosen] { chosen = forOwnUser(status); });
 }
 
 } // namespace Ovradr

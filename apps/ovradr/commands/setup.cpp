@@ -1,4 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
+#include "access.h"
 #include "commands/commands.h"
 #include "node_ref.h"
 #include "output.h"
@@ -285,7 +286,8 @@ void addSetupCommand(CLI::App &app, Command &chosen) {
                     "Examples:\n"
                     "  ovradr setup\n"
                     "  ovradr setup --hostname nas1 --address 192.0.2.10,2001:db8::10");
-    command->callback([&chosen, settings] { chosen = [settings] { return setUp(*settings); }; });
+    command->callback(
+        [&chosen, settings] { chosen = forOwnUser([settings] { return setUp(*settings); }); });
 }
 
 } // namespace Ovradr

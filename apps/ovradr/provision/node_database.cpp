@@ -1,6 +1,8 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "provision/node_database.h"
 
+#include "access.h"
+
 #include <ovrabase/file.h>
 #include <ovrabase/sqlite.h>
 #include <ovradrnode/node_db.h>
@@ -159,6 +161,9 @@ Expected<void> checkNodeDatabase() {
         return failure(ExitCode::kNotSetUp,
                        "This appliance is not set up: it has no node database.",
                        "Run `ovradr setup`.");
+    }
+    if (auto allowed = checkUser(); !allowed) {
+        return allowed;
     }
     if (access(path.c_str(), R_OK | W_OK) != 0) {
         return fileFailure(path, errno);

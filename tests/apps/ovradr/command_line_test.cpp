@@ -5,6 +5,8 @@
 #include <gtest/gtest.h>
 
 #include <cstdlib>
+#include <iterator>
+#include <sstream>
 
 namespace OvradrTest {
 
@@ -65,6 +67,26 @@ TEST(CommandLine, WhatNeedsTheDatabaseSaysWhenItIsNotSetUp) {
         EXPECT_NE(result.err.find("ovradr setup"), std::string::npos) << result.err;
     }
     EXPECT_FALSE(std::filesystem::exists("/usr/ovra/etc/ovradr/node.db"));
+}
+
+TEST(CommandLine, SaysToAnOrdinaryUserWhichFileHeCannotReadAndNothingElse) {
+    const std::string told = "ovradr: /usr/ovra/etc/ovradr/node.db cannot be read by this user.\n"
+                             "Run the command as root.\n";
+    EXPECT_EQ(runAsNobody({"setup"}).err.find("cannot be read by this user"), std::string::npos);
+    ASSERT_EQ(run({"setup"}).exit, 0);
+    for (const char *line :
+         {"setup", "node list", "node info local", "doctor", "doctor https://127.0.0.1:1",
+          "cred list", "user list", "session list", "session pending", "conn local",
+          "conn forget https://127.0.0.1:1", "conn trust https://127.0.0.1:1", "farlink status",
+          "farlink disable", "call local A m"}) {
+        std::istringstream words(line);
+        const Result result = runAsNobody({std::istream_iterator<std::string>(words), {}});
+        if (result.exit == kNoOtherUser) {
+            GTEST_SKIP() << "there is only one user here";
+        }
+        EXPECT_EQ(result.exit, 9) << line;
+        EXPECT_EQ(result.out + result.err, told) << line;
+    }
 }
 
 TEST(CommandLine, HelpAndVersionAreNoFailures) {

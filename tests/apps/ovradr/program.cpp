@@ -3,6 +3,7 @@
 
 #include <ovradrcore/json.h>
 
+#include <grp.h>
 #include <gtest/gtest.h>
 #include <poll.h>
 #include <pty.h>
@@ -69,12 +70,14 @@ Json::Value Result::json() const {
     return OvraDRCore::fromString(document, out) ? document : Json::Value();
 }
 
-Program::Program(const Arguments &arguments, const std::string &input)
+Program::Program(const Arguments &arguments, const std::string &input,
+                 const std::function<void()> &prepare)
     : streams_{anonymousFile(input), anonymousFile(), anonymousFile()}
-    , process_(arguments, [this] {
+    , process_(arguments, [this, &prepare] {
         for (const int fd : {STDIN_FILENO, STDOUT_FILENO, STDERR_FILENO}) {
             dup2(streams_[static_cast<std::size_t>(fd)], fd);
         }
+        prepare();
     }) {}
 
 Program::~Program() {
@@ -90,8 +93,18 @@ Result Program::finish() {
             readFile(folder + std::to_string(streams_[2]))};
 }
 
-Result run(const Arguments &arguments, const std::string &input) {
-    return Program(arguments, input).finish();
+Result run(const Arguments &arguments, const std::string &input,
+           const std::function<void()> &prepare) {
+    return Program(arguments, input, prepare).finish();
+}
+
+Result runAsNobody(const Arguments &arguments) {
+    constexpr unsigned int kNobody = 65534;
+    return run(arguments, "", [] {
+        if (setgroups(0, nullptr) != 0 || setgid(kNobody) != 0 || setuid(kNobody) != 0) {
+            _exit(kNoOtherUser);
+        }
+    });
 }
 
 Terminal::Terminal(const Arguments &arguments) {

@@ -50,7 +50,10 @@ struct Result {
 /// The program, running with `input` as its standard input.
 class Program {
 public:
-    explicit Program(const Arguments &arguments, const std::string &input = "");
+    /// \param prepare  what the child does before
+    explicit Program(
+        const Arguments &arguments, const std::string &input = "",
+        const std::function<void()> &prepare = [] {});
     ~Program();
 
     pid_t pid() const { return process_.pid(); }
@@ -62,7 +65,12 @@ private:
 };
 
 /// Runs the program to its end.
-Result run(const Arguments &arguments, const std::string &input = "");
+Result run(
+    const Arguments &arguments, const std::string &input = "",
+    const std::function<void()> &prepare = [] {});
+/// As somebody without rights. The exit code is kNoOtherUser where there is nobody else.
+Result runAsNobody(const Arguments &arguments);
+inline constexpr int kNoOtherUser = 99;
 
 /// The program on its own terminal, with simulated input.
 class Terminal {
