@@ -54,9 +54,9 @@ void appendUtf8(std::string &text, char32_t code) {
 }
 
 /// Reads from left to right; every read...() is false at the first byte that is not of the grammar.
-class Reader {
+class DocumentReader {
 public:
-    Reader(std::string_view text, JsonLimits &limits)
+    DocumentReader(std::string_view text, JsonLimits &limits)
         : rest_(text)
         , left_(limits) {}
 
@@ -351,7 +351,7 @@ private:
 } // namespace
 
 JsonFault readJson(std::string_view text, JsonLimits &limits, Json::Value &value) {
-    return Reader(text, limits).readDocument(value);
+    return DocumentReader(text, limits).readDocument(value);
 }
 
 } // namespace OvraDRCore
