@@ -23,6 +23,7 @@ test: deps-test deps-lab build-dev ## every test, each on its own node (TESTS=re
 
 torture: deps-test deps-check deps-lab build-dev ## what crashes, failing calls and rubbish leave (OVRA_TORTURE=N: how long)
 	OVRA_TORTURE=$(or $(OVRA_TORTURE),100) ctest --preset dev -L torture -j $(JOBS)
+	tools/check-threads
 	tools/fuzz 600
 
 bench: deps-build deps-lab build/bench/build.ninja ## the benchmarks, compared with their baselines

@@ -315,46 +315,6 @@ TEST_F(CacheTest, ADirectoryThatIsNotOursAloneIsMovedAwayAndWithoutOneTheValueIs
     EXPECT_EQ(log.count("going on without a cache"), 1);
 }
 
-TEST_F(CacheTest, WritersThatAreKilledBesideOthersLoseAndTearNothing) {
-    constexpr int kProcesses = 4;
-    constexpr int kEach = 400;
-    const auto name = [](int process, int i) { return std::to_string(process * kEach + i); };
-    std::mt19937 random(11);
-    const int good = inProcesses(
-        kProcesses,
-        [&](int process) {
-            const TestCache shared("shared");
-            for (int i = 0; i < kEach; ++i) {
-                const TestCache cache(name(process, i));
-                const std::string content(3000, static_cast<char>('0' + i % 10));
-                const bool stored = cache.UpdateWithData(i) && shared.UpdateWithData(content);
-                const std::string seen = shared.GetCachedData().asString();
-                if (!stored || cache.GetCachedData() != Json::Value(i) ||
-                    seen != std::string(3000, seen[0])) {
-                    _exit(1);
-                }
-            }
-        },
-        [&] {
-            for (int round = 0; round < 60; ++round) {
-                const pid_t victim = fork();
-                if (victim == 0) {
-                    for (int i = 0;; ++i) {
-                        TestCache(name(99, i % 500)).UpdateWithData(std::string(200, 'm'));
-                    }
-                }
-                std::this_thread::sleep_for(std::chrono::microseconds(500 + random() % 20000));
-                kill(victim, SIGKILL);
-                waitpid(victim, nullptr, 0);
-                ASSERT_TRUE(TestCache("after").UpdateWithData(round)) << "no lock is left behind";
-            }
-        });
-    ASSERT_EQ(good, kProcesses);
-    for (int i = 0; i < kProcesses * kEach; ++i) {
-        ASSERT_EQ(TestCache(std::to_string(i)).GetCachedData(), Json::Value(i % kEach));
-    }
-}
-
 TEST_F(CacheTest, OfManyReadersOneRefreshesAndTheOthersShareItsResultOrItsFailure) {
     for (const bool success : {false, true}) { // an earlier failure counts for nothing
         const std::string refreshes = success ? "/tmp/successes" : "/tmp/failures";

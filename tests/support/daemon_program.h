@@ -33,7 +33,9 @@ public:
             dup2(ends[1], STDERR_FILENO);
             prepare();
             // A daemon that exits with calls in progress abandons their threads, on purpose.
-            setenv("TSAN_OPTIONS", "report_thread_leaks=0", 1);
+            const char *const options = getenv("TSAN_OPTIONS");
+            const std::string own = options != nullptr ? options : "";
+            setenv("TSAN_OPTIONS", (own + ":report_thread_leaks=0").c_str(), 1);
             std::vector<char *> argv;
             for (std::string &argument : command) {
                 argv.push_back(argument.data());

@@ -24,6 +24,7 @@
 #include <list>
 #include <map>
 #include <new>
+#include <random>
 #include <set>
 #include <thread>
 #include <vector>
@@ -235,9 +236,20 @@ void prepare() {
 TEST(Crowd, LosesNoUpdateReadsNoHalfValueWaitsNotTooLongAndLeavesNothing) {
     prepare();
     const std::chrono::seconds duration(std::min(2 * OvraTest::tortureScale(), 60));
-    // Locks shall be scarce, not processors.
-    const auto board = play(milliseconds(10), Lie::kNone,
-                            [duration](const Board &) { std::this_thread::sleep_for(duration); });
+    // Locks shall be scarce, not processors. Meanwhile others come and are killed.
+    const auto board = play(milliseconds(10), Lie::kNone, [duration](const Board &) {
+        std::mt19937 random(1);
+        for (const auto end = steady_clock::now() + duration; steady_clock::now() < end;) {
+            const OvraTest::OtherProcess victim([] {
+                for (int i = 0;; ++i) {
+                    setCached(std::to_string(i % 500), std::string(200, 'v'));
+                    setAttr("victim", std::to_string(i));
+                }
+                return 0;
+            });
+            std::this_thread::sleep_for(std::chrono::microseconds(500 + random() % 20'000));
+        }
+    });
     for (std::size_t which = 0; which <= kIdentity; ++which) {
         const Board::Of &of = board->of[which];
         const char *const name = which < kIdentity ? kStores[which].name : "identity";

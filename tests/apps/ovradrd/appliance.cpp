@@ -84,43 +84,64 @@ void Appliance::restart(const OvraService::HttpLimits &limits, std::size_t testF
     ASSERT_TRUE(started) << started.error().text;
 }
 
-Reply Appliance::http(const HttpCall &call) const {
-    const std::unique_ptr<CURL, void (*)(CURL *)> curl(curl_easy_init(), curl_easy_cleanup);
+HttpClient::HttpClient(int https, int http)
+    : https_(https)
+    , http_(http)
+    , curl_(curl_easy_init(), curl_easy_cleanup) {}
+
+Reply HttpClient::http(const HttpCall &call) const {
+    CURL *const curl = curl_.get();
+    curl_easy_reset(curl);
     curl_slist *headers = curl_slist_append(nullptr, ("Content-Type: " + call.type).c_str());
     headers = curl_slist_append(headers, "Expect:");
     if (call.chunked) {
         headers = curl_slist_append(headers, "Transfer-Encoding: chunked");
     }
     const std::string url = (call.tls ? "https://127.0.0.1:" : "http://127.0.0.1:") +
-                            std::to_string(port(call.tls)) + call.path;
+                            std::to_string(call.tls ? https_ : http_) + call.path;
     Reply reply;
-    curl_easy_setopt(curl.get(), CURLOPT_URL, url.c_str());
-    curl_easy_setopt(curl.get(), CURLOPT_NOPROXY, "*");
-    curl_easy_setopt(curl.get(), CURLOPT_SSL_VERIFYPEER, 0L);
-    curl_easy_setopt(curl.get(), CURLOPT_SSL_VERIFYHOST, 0L);
-    curl_easy_setopt(curl.get(), CURLOPT_TIMEOUT, 30L);
-    curl_easy_setopt(curl.get(), CURLOPT_NOSIGNAL, 1L);
-    curl_easy_setopt(curl.get(), CURLOPT_HTTPHEADER, headers);
-    curl_easy_setopt(curl.get(), CURLOPT_WRITEFUNCTION, takeBody);
-    curl_easy_setopt(curl.get(), CURLOPT_WRITEDATA, &reply.text);
-    if (call.method != "GET") {
-        curl_easy_setopt(curl.get(), CURLOPT_POSTFIELDSIZE_LARGE,
-                         static_cast<curl_off_t>(call.body.size()));
-        curl_easy_setopt(curl.get(), CURLOPT_POSTFIELDS, call.body.c_str());
-        curl_easy_setopt(curl.get(), CURLOPT_CUSTOMREQUEST, call.method.c_str());
+    curl_easy_setopt(curl, CURLOPT_URL, url.c_str());
+    curl_easy_setopt(curl, CURLOPT_NOPROXY, "*");
+    curl_easy_setopt(curl, CURLOPT_SSL_VERIFYPEER, 0L);
+    curl_easy_setopt(curl, CURLOPT_SSL_VERIFYHOST, 0L);
+    curl_easy_setopt(curl, CURLOPT_TIMEOUT, 100L);
+    curl_easy_setopt(curl, CURLOPT_NOSIGNAL, 1L);
+    curl_easy_setopt(curl, CURLOPT_HTTPHEADER, headers);
+    curl_easy_setopt(curl, CURLOPT_WRITEFUNCTION, takeBody);
+    curl_easy_setopt(curl, CURLOPT_WRITEDATA, &reply.text);
+    if (!call.from.empty()) {
+        curl_easy_setopt(curl, CURLOPT_INTERFACE, call.from.c_str());
     }
-    if (curl_easy_perform(curl.get()) == CURLE_OK) {
-        curl_easy_getinfo(curl.get(), CURLINFO_RESPONSE_CODE, &reply.status);
+    if (call.method != "GET") {
+        curl_easy_setopt(curl, CURLOPT_POSTFIELDSIZE_LARGE,
+                         static_cast<curl_off_t>(call.body.size()));
+        curl_easy_setopt(curl, CURLOPT_POSTFIELDS, call.body.c_str());
+        curl_easy_setopt(curl, CURLOPT_CUSTOMREQUEST, call.method.c_str());
+    }
+    if (curl_easy_perform(curl) == CURLE_OK) {
+        curl_easy_getinfo(curl, CURLINFO_RESPONSE_CODE, &reply.status);
     }
     curl_slist_free_all(headers);
     (void)OvraDRCore::fromString(reply.document, reply.text); // not every answer is a document
     return reply;
 }
 
-Reply Appliance::call(const std::string &api, int version, const std::string &method,
-                      const Json::Value &params, const std::string &sid, bool tls) const {
+Reply HttpClient::call(const std::string &api, int version, const std::string &method,
+                       const Json::Value &params, const std::string &sid, bool tls) const {
     const OvraPlatform::WireCall wire{{api, version, method, params}, sid, ""};
     return http({.body = OvraPlatform::encodeForm(wire).value(), .tls = tls});
+}
+
+Reply HttpClient::login(const std::string &account, const std::string &password,
+                        const std::string &code, const std::string &from) const {
+    Json::Value params;
+    params["account"] = account;
+    params["passwd"] = password;
+    if (!code.empty()) {
+        params["otp_code"] = code;
+    }
+    const OvraPlatform::WireCall wire{{"OVRA.Core.Auth", 1, "login", params}, "", ""};
+    return http({.body = OvraPlatform::encodeForm(wire).value(), .from = from});
 }
 
 Json::Value Appliance::callHere(const char *api, int version, const char *method,
@@ -128,17 +149,6 @@ Json::Value Appliance::callHere(const char *api, int version, const char *method
     Json::Value reply;
     OVRA::APIRunner().Exec(reply, api, version, method, params, "admin");
     return reply;
-}
-
-Reply Appliance::login(const std::string &account, const std::string &password,
-                       const std::string &code) const {
-    Json::Value params;
-    params["account"] = account;
-    params["passwd"] = password;
-    if (!code.empty()) {
-        params["otp_code"] = code;
-    }
-    return call("OVRA.Core.Auth", 1, "login", params);
 }
 
 } // namespace OvraTest

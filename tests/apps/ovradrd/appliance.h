@@ -30,6 +30,26 @@ struct HttpCall {
     std::string type = "application/x-www-form-urlencoded";
     bool tls = true;
     bool chunked = false;
+    std::string from; ///< the address that connects, of 127.0.0.0/8
+};
+
+/// A client of the web server at these ports of 127.0.0.1, for one thread. It keeps its
+/// connections.
+class HttpClient {
+public:
+    HttpClient(int https, int http);
+    Reply http(const HttpCall &call) const;
+    /// \param sid  "": none
+    Reply call(const std::string &api, int version, const std::string &method,
+               const Json::Value &params = Json::Value(), const std::string &sid = "",
+               bool tls = true) const;
+    Reply login(const std::string &account, const std::string &password,
+                const std::string &code = "", const std::string &from = "") const;
+
+private:
+    const int https_;
+    const int http_;
+    std::unique_ptr<void, void (*)(void *)> curl_;
 };
 
 /// A fixture with an appliance set up in the test's sandbox, and a daemon in this process that
@@ -45,16 +65,20 @@ public:
     static std::string session(const std::string &user, int timeout = 3600);
 
     int port(bool tls) const { return tls ? daemon_->httpsPort() : daemon_->httpPort(); }
-    Reply http(const HttpCall &call) const;
-    /// \param sid  "": none
+    /// The calls of HttpClient, each over a new connection.
+    Reply http(const HttpCall &call) const { return client().http(call); }
     Reply call(const std::string &api, int version, const std::string &method,
                const Json::Value &params = Json::Value(), const std::string &sid = "",
-               bool tls = true) const;
+               bool tls = true) const {
+        return client().call(api, version, method, params, sid, tls);
+    }
+    Reply login(const std::string &account, const std::string &password,
+                const std::string &code = "") const {
+        return client().login(account, password, code);
+    }
     /// The answer to a process of the appliance, which calls through the Unix socket.
     static Json::Value callHere(const char *api, int version, const char *method,
                                 const Json::Value &params = Json::objectValue);
-    Reply login(const std::string &account, const std::string &password,
-                const std::string &code = "") const;
 
 protected:
     void SetUp() override;
@@ -64,6 +88,8 @@ protected:
     Ovradrd::Daemon &daemon() { return *daemon_; }
 
 private:
+    HttpClient client() const { return {port(true), port(false)}; }
+
     std::unique_ptr<Ovradrd::Daemon> daemon_;
 };
 

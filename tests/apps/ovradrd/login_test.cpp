@@ -2,15 +2,10 @@
 #include "appliance.h"
 #include "handlers/auth.h"
 #include "support/log_capture.h"
-#include "support/totp.h"
 
 #include <ovraplatform/account_store.h>
 #include <ovraplatform/session_store.h>
 #include <ovraplatform/totp.h>
-
-#include <future>
-#include <map>
-#include <vector>
 
 namespace {
 
@@ -116,24 +111,6 @@ TEST_F(Login, LetsInWhoLoggedInBeforeWhileStrangersGuess) {
         EXPECT_EQ(loginFrom(row.address, kPassword, row.device), row.code)
             << row.address << " " << row.device;
     }
-}
-
-TEST_F(Login, TakesACodeOnceOfEightAtOnceAndNotAgainAfterARestart) {
-    addAccount("coded", false);
-    const std::string secret = OvraPlatform::newTotpSecret();
-    ASSERT_TRUE(AccountStore().setTotp("coded", secret));
-    const std::string code = OvraTest::totp(secret, std::time(nullptr));
-    std::vector<std::future<Reply>> logins(8);
-    for (auto &each : logins) {
-        each = std::async(std::launch::async, [&] { return login("coded", kPassword, code); });
-    }
-    std::map<int, int> codes;
-    for (auto &each : logins) {
-        ++codes[each.get().code()];
-    }
-    EXPECT_EQ(codes, (std::map<int, int>{{0, 1}, {404, 7}}));
-    restart({});
-    EXPECT_EQ(login("coded", kPassword, code).code(), 404);
 }
 
 TEST_F(Login, WritesNoSecretToTheLog) {

@@ -1,11 +1,9 @@
 // SPDX-License-Identifier: Apache-2.0
-#include "appliance.h"
-#include "platform/own_files.h"
 #include "service/certificate.h"
-#include "support/daemon_program.h"
 #include "support/local_node.h"
 #include "support/misbehaving_server.h"
 #include "support/soon.h"
+#include "the_program.h"
 
 #include <ovraplatform/appliance.h>
 #include <ovraplatform/peer_trust.h>
@@ -28,24 +26,6 @@ using namespace OvraTest;
 using namespace std::chrono_literals;
 
 constexpr char kNode[] = "OVRA.DR.Node";
-
-struct Program : DaemonProgram {
-    explicit Program(const std::function<void()> &prepare = [] {})
-        : DaemonProgram({OVRADRD_PROGRAM}, prepare) {}
-};
-
-class TheProgram : public testing::Test {
-protected:
-    TheProgram() { Appliance::provision(); }
-    void configure(const std::string &more = "") const {
-        writeFile(OvraPlatform::kConfigFile, "address=\"127.0.0.1\"\nhttp_port=\"" + http +
-                                                 "\"\nhttps_port=\"" + https + "\"\n" + more);
-    }
-
-    const std::string http = std::to_string(unusedPort());
-    const std::string https = std::to_string(unusedPort());
-    const std::string ready = "ovradrd: ready, https " + https + ", http " + http + "\n";
-};
 
 TEST_F(TheProgram, DoesNotStartWithWhatItCannotUse) {
     const auto says = [](const char *what, int code) {

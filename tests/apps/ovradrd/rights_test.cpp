@@ -1,13 +1,12 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "appliance.h"
 #include "platform/store/raw_sqlite.h"
+#include "support/doc_page.h"
 #include "support/local_node.h"
 
 #include <ovraplatform/account_store.h>
-#include <ovraplatform/api_registry.h>
 #include <ovraplatform/session_store.h>
 
-#include <algorithm>
 #include <ctime>
 #include <filesystem>
 #include <functional>
@@ -173,16 +172,26 @@ TEST_F(Rights, OfAnAccountThatMayPairAreItsOwnAndNobodyElses) {
     }
 }
 
-TEST_F(Rights, AreStatedHereForEveryMethod) {
-    for (const auto &method : OvraPlatform::APIRegistry::hosted()->methods()) {
-        EXPECT_TRUE(std::any_of(std::begin(kScenes), std::end(kScenes),
-                                [&](const Scene &scene) {
-                                    return scene.api == method.api &&
-                                           scene.method == method.method &&
-                                           scene.version == method.version;
-                                }))
-            << "kScenes has no row for " << method.api << " " << method.version << " "
-            << method.method << ": add one";
+/// Each method of the manual has rows above, and they say what the manual says.
+TEST_F(Rights, AreThoseOfTheManual) {
+    for (const auto &row : OvraTest::DocPage("docs/ovradrd.md").rows("What can be called")) {
+        const std::string right = row.at(1).substr(0, row[1].find(';'));
+        const bool higher = right == "administrator" || right == "local";
+        const bool mayPair = right == "pairing";
+        int scenes = 0;
+        for (const Scene &scene : kScenes) {
+            const std::string version = std::to_string(scene.version);
+            if (row[0] ==
+                "`" + std::string(scene.api) + "` " + version + " `" + scene.method + "`") {
+                ++scenes;
+                EXPECT_EQ(scene.nobody == 119, right != "anybody") << row[0];
+                EXPECT_TRUE((scene.user == 105) == (higher || mayPair) || row[1] != right)
+                    << row[0];
+                EXPECT_TRUE((scene.pairing == 105) == higher || row[1] != right) << row[0];
+                EXPECT_EQ(scene.administrator == 105, right == "local") << row[0];
+            }
+        }
+        EXPECT_GT(scenes, 0) << "kScenes has no row for " << row[0] << ": add one";
     }
 }
 
