@@ -43,6 +43,7 @@ using OvraService::TlsIdentity;
 
 constexpr unsigned long kDescriptors = 16384;
 constexpr int kMaxAliases = 4000; // what fits into the file of aliases, with room to spare
+constexpr long kMaxLease = 10L * 365 * 24 * 60 * 60; // seconds
 constexpr std::chrono::seconds kTick{1};
 constexpr int kTicksOfMemory = 20; // between two times at which freed memory is returned
 
@@ -214,7 +215,7 @@ int run(int argc, char **argv) {
         ->check(CLI::Range(1, OvraBase::kMaxPort));
     app.add_option("--lease", options.leaseSeconds,
                    "Seconds for which an alias stays its owner's when that is gone (30 days)")
-        ->check(CLI::PositiveNumber);
+        ->check(CLI::Range(1L, kMaxLease));
     app.add_option("--state", options.state, "Folder for key and aliases (/usr/ovra/var/farlinkd)");
     try {
         app.parse(argc, argv);

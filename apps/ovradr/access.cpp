@@ -6,6 +6,7 @@
 #include <ovraplatform/appliance.h>
 
 #include <fcntl.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <cerrno>
@@ -23,6 +24,12 @@ Expected<void> checkUser() {
         }
     }
     return {};
+}
+
+bool isOwnUser() {
+    struct stat status {};
+    return geteuid() == 0 ||
+           (stat(OvraPlatform::kConfigDir, &status) == 0 && status.st_uid == geteuid());
 }
 
 Command forOwnUser(Command command) {

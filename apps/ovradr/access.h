@@ -11,6 +11,9 @@ namespace Ovradr {
 /// read for missing.
 [[nodiscard]] Expected<void> checkUser();
 
+/// Whether this user is the superuser or owns the appliance's files: what he makes is of use to it.
+[[nodiscard]] bool isOwnUser();
+
 /// The command, refused where checkUser() fails.
 Command forOwnUser(Command command);
 

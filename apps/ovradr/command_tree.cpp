@@ -32,6 +32,12 @@ void addCommandTree(CLI::App &app, bool &json, Command &chosen) {
     addDoctorCommand(app, chosen);
     addSpeedCommand(app, chosen);
     addFarlinkCommands(app, chosen);
+    // The examples of the whole are none of a family's.
+    for (CLI::App *family : app.get_subcommands([](const CLI::App *) { return true; })) {
+        if (family->get_footer() == app.get_footer()) {
+            family->footer("");
+        }
+    }
 }
 
 } // namespace Ovradr

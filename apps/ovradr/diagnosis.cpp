@@ -6,19 +6,24 @@
 #include "output.h"
 #include "provision/data_files.h"
 #include "provision/node_database.h"
+#include "renewal.h"
 #include "target.h"
 #include "tcp_reach.h"
 #include "trust.h"
 
+#include <ovrabase/file.h>
 #include <ovrabase/safe_path.h>
 #include <ovracredential/cred_request.h>
+#include <ovradrcore/cache_folder.h>
 #include <ovradrcore/json.h>
+#include <ovradrnode/cred_permission_cache.h>
 #include <ovradrnode/node_api.h>
 #include <ovradrnode/sender.h>
 #include <ovraplatform/api_errors.h>
 #include <ovraplatform/appliance.h>
 
 #include <array>
+#include <cerrno>
 #include <chrono>
 #include <cmath>
 #include <cstdio>
@@ -66,7 +71,7 @@ const char *stateWord(Diagnosis::Step::State state) {
 
 /// Whether nobody else can change what root runs or reads.
 Expected<std::string> checkPaths() {
-    std::vector<std::string> paths = {"/proc/self/exe", "/run/lock", "/tmp/.ovradrcache"};
+    std::vector<std::string> paths = {"/proc/self/exe", "/run/lock", OvraPlatform::kCacheDir};
     for (const char *folder : {OvraPlatform::kConfigDir, OvraPlatform::kStateDir, kScriptFolder}) {
         paths.emplace_back(folder);
         std::error_code error;
@@ -82,6 +87,69 @@ Expected<std::string> checkPaths() {
         }
     }
     return std::string("nobody else can change what root runs or reads");
+}
+
+/// What the daemon would refuse at its next start.
+Expected<std::string> checkSettings() {
+    const OvraPlatform::ApplianceConfig config = OvraPlatform::readApplianceConfig();
+    std::string problem = config.problems.empty() ? "" : config.problems.front();
+    if (problem.empty() && !config.servesAllAddresses && config.addresses.empty()) {
+        problem = "it names no address to serve at";
+    }
+    if (!problem.empty()) {
+        return failure(ExitCode::kNotSetUp,
+                       std::string(OvraPlatform::kConfigFile) + ": " + problem + ".",
+                       "ovradrd does not start with it: correct the file.");
+    }
+    return "https " + std::to_string(config.httpsPort) + ", http " +
+           std::to_string(config.httpPort);
+}
+
+/// Whether the secret keys are there, and nobody else can read them.
+Expected<std::string> checkKeys() {
+    using OvraBase::Links;
+    struct KeyFile {
+        const char *path;
+        Links links;
+        bool needed;
+    };
+    for (const KeyFile &key : {KeyFile{OvraPlatform::kTlsKeyFile, Links::kFollow, true},
+                               {OvraPlatform::kSealKeyFile, Links::kRefuse, true},
+                               {OvraPlatform::kDeviceKeyFile, Links::kRefuse, false},
+                               {OvraPlatform::kFarlinkKeyFile, Links::kRefuse, false}}) {
+        const auto content = OvraBase::readPrivateFile(key.path, key.links);
+        if (content || (content.error().number == ENOENT && !key.needed)) {
+            continue;
+        }
+        const std::string path = key.path;
+        const bool tls = path == OvraPlatform::kTlsKeyFile;
+        return failure(ExitCode::kNotSetUp,
+                       "The key " + path + " cannot be used: " + content.error().text + ".",
+                       content.error().number == ENOENT
+                           ? "Restore it from a backup, or have `ovradr setup` make a new one" +
+                                 std::string(tls ? ", with ovradrd.crt moved away" : "") +
+                                 ": the others have to trust it."
+                           : "chmod 600 " + path + "; if others may have read it, move it" +
+                                 std::string(tls ? " and ovradrd.crt" : "") +
+                                 " away, run `ovradr setup` and start ovradrd again: the others "
+                                 "have to trust the new one.");
+    }
+    return std::string("nobody else can read them");
+}
+
+/// Whether what is learnt about other nodes is kept.
+Expected<std::string> checkCache() {
+    const std::string folder = OvraPlatform::kCacheDir;
+    std::string problem = OvraDRCore::prepareCacheFolder(folder);
+    if (problem.empty()) {
+        OvraDRNode::CredPermissionCache probe("doctor");
+        if (probe.SetCacheData(true) && probe.Remove()) {
+            return folder;
+        }
+        problem = "takes no entry: make room, or remove what is in it";
+    }
+    return failure(ExitCode::kNotSetUp, folder + " " + problem + ".",
+                   "Without a cache every request asks again whether its endpoint answers.");
 }
 
 /// The same failure under another exit code.
@@ -171,7 +239,18 @@ private:
         return text;
     }
 
-    Expected<std::string> connect() { return connectAny(addresses_, place_); }
+    Expected<std::string> connect() const {
+        auto connected = connectAny(addresses_, place_);
+        if (!connected && connected.error().exit == ExitCode::kNotReachable && subject_.own &&
+            !subject_.conn.isFarlink()) {
+            connected.error().hint =
+                subject_.daemonRuns
+                    ? "ovradrd runs, but does not serve there: it reads the settings when it is "
+                      "started. Start it again, or correct the settings."
+                    : "Start ovradrd.";
+        }
+        return connected;
+    }
 
     Expected<std::string> key() {
         const auto met =
@@ -221,8 +300,8 @@ private:
             return failure(ExitCode::kCertificate,
                            targetText(conn_) + " shows " + peer.fingerprint +
                                ", which is not the key that is expected.",
-                           "After the key was changed ovradrd has to be started again; if it was "
-                           "not changed, something else answers there.");
+                           "ovradrd reads keys and settings when it is started: start it again "
+                           "after a change; without one, something else answers there.");
         }
         return peer.fingerprint + ", as expected";
     }
@@ -237,6 +316,9 @@ private:
 
     Refusal senderFailure(const Response &response) const {
         Refusal found = failureOf(errorOf(*sender_, response));
+        if (subject_.cred) {
+            found = credFailure(found, subject_.cred->credId);
+        }
         found.value().message.insert(0, targetText(conn_) + ": ");
         return found;
     }
@@ -395,7 +477,7 @@ void diagnoseEndpoint(const DiagnosisSubject &subject, Diagnosis &diagnosis) {
     EndpointSteps(subject, diagnosis).run();
 }
 
-void diagnoseAppliance(Diagnosis &diagnosis) {
+bool diagnoseAppliance(Diagnosis &diagnosis) {
     std::string nodeId;
     diagnosis.run("files", [&nodeId]() -> Expected<std::string> {
         const Expected<std::string> id = localNode();
@@ -408,7 +490,10 @@ void diagnoseAppliance(Diagnosis &diagnosis) {
         nodeId = *id;
         return "node " + nodeId;
     });
+    diagnosis.run("settings", checkSettings);
     diagnosis.run("folders", checkPaths);
+    diagnosis.run("keys", checkKeys);
+    diagnosis.run("cache", checkCache);
     diagnosis.run("trusted keys", []() -> Expected<std::string> {
         const std::string problem = OvraPlatform::TrustStore().problem();
         if (!problem.empty()) {
@@ -420,12 +505,14 @@ void diagnoseAppliance(Diagnosis &diagnosis) {
         }
         return std::string(OvraPlatform::kKnownEndpointsFile);
     });
-    diagnosis.run("daemon", [&nodeId]() -> Expected<std::string> {
+    bool daemonRuns = false;
+    diagnosis.run("daemon", [&nodeId, &daemonRuns]() -> Expected<std::string> {
         const Response info = BaseSender::run(WebAPI::getDRNodeInfoAPI({}));
         if (!info.isSuccess()) {
             return failure(ExitCode::kNotReachable, "The daemon of this appliance does not answer.",
                            "Start ovradrd, and read what it says in the system log.");
         }
+        daemonRuns = true;
         if (!nodeId.empty() && info.getDataFieldtoStr("node_id") != nodeId) {
             return failure(ExitCode::kWrongNode,
                            "The daemon still answers as the node " +
@@ -434,6 +521,7 @@ void diagnoseAppliance(Diagnosis &diagnosis) {
         }
         return "answers as " + info.getDataFieldtoStr("hostname");
     });
+    return daemonRuns;
 }
 
 } // namespace Ovradr

@@ -28,6 +28,7 @@ struct DiagnosisSubject {
     std::optional<LoginTrial> login;        ///< tried instead of a session
     std::string fingerprint;                ///< the required key, or ""
     bool own = false;                       ///< of this appliance: only the steps up to "answer"
+    bool daemonRuns = false;                ///< of an own one: ovradrd answers on its socket
 };
 
 /// Examines things step by step. If a step fails, the steps that need it are skipped; the first
@@ -70,7 +71,8 @@ private:
 /// is trusted without being asked for. Takes at most 10 seconds per step, and 60 for a request.
 void diagnoseEndpoint(const DiagnosisSubject &subject, Diagnosis &diagnosis);
 
-/// Examines what this appliance itself needs: the steps "files" and "daemon".
-void diagnoseAppliance(Diagnosis &diagnosis);
+/// Examines what this appliance itself needs: its files, settings, keys, caches and daemon.
+/// \return whether the daemon answers on its socket
+bool diagnoseAppliance(Diagnosis &diagnosis);
 
 } // namespace Ovradr

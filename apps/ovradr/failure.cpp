@@ -41,6 +41,7 @@ constexpr const char *kAdministrator =
 constexpr const char *kSameVersion = "Check that both appliances run versions that fit together.";
 constexpr const char *kCheckName = "Check how it is written, and what the other appliance offers.";
 constexpr const char *kPairAgain = "Make a new credential with `ovradr cred create`.";
+constexpr const char *kLogInAgain = "Log in again with `ovradr cred set CRED_ID --account NAME`.";
 constexpr const char *kSystemLog = "The system log says more.";
 
 /// Everything that the library and the web API report by number.
@@ -68,7 +69,7 @@ constexpr std::array kErrors = {
                "The appliance did not accept the sealed request",
                "Try again; if that does not help, check the clocks of both appliances."},
     ErrorEntry{APIError::kNoSession, ExitCode::kLoginRefused, "no_session",
-               "The appliance no longer knows the session of the credential", kPairAgain},
+               "The appliance no longer knows the session of the credential", kLogInAgain},
     ErrorEntry{APIError::kLoginFailed, ExitCode::kLoginRefused, "login_failed",
                "The account or the password is wrong", "Check both and try again."},
     ErrorEntry{ERR::kBadParameter, ExitCode::kFailed, "bad_argument",
@@ -133,7 +134,7 @@ constexpr std::array kErrors = {
     ErrorEntry{ERR::kNoSuchUser, ExitCode::kNotFound, "no_such_user",
                "There is no such user on that appliance", "Check the name."},
     ErrorEntry{ERR::kSessionUserUnknown, ExitCode::kNotFound, "session_user_unknown",
-               "The account of the session is not known", kPairAgain},
+               "The account of the session is not known", kLogInAgain},
 };
 
 std::string detailText(int code, const Json::Value &detail) {

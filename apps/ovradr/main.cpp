@@ -1,9 +1,11 @@
 // SPDX-License-Identifier: Apache-2.0
 // ovradr: the command line of an appliance. docs/ovradr.md describes it.
+#include "access.h"
 #include "command_tree.h"
 #include "output.h"
 
 #include <ovrabase/file.h>
+#include <ovradrcore/cache_folder.h>
 
 #include <algorithm>
 #include <csignal>
@@ -75,6 +77,9 @@ Refusal missingFailure(const CLI::App &app, const std::string &what) {
 }
 
 Outcome runChosen(const Command &chosen) {
+    if (!isOwnUser()) {
+        OvraDRCore::makeNoCacheFolder();
+    }
     try {
         return chosen();
     } catch (const std::exception &error) {

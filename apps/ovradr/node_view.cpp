@@ -64,7 +64,7 @@ std::string reasonText(const std::vector<NodeCandidate> &candidates, std::size_t
         return "its record is not complete; pair again";
     case Outlook::kNext:
         if (candidate.remembered) {
-            return "it worked last";
+            return "its node answered over it last";
         }
         return position == 0 ? "the first that may have the right"
                              : "those before it are passed over";
@@ -72,7 +72,7 @@ std::string reasonText(const std::vector<NodeCandidate> &candidates, std::size_t
         break;
     }
     if (candidate.privilege.known && !candidate.privilege.value) {
-        return "it was refused for lack of the right";
+        return "the last request over it failed, or was not permitted";
     }
     return "if those before it do not get through";
 }

@@ -6,6 +6,7 @@
 #include <ovradrcore/json.h>
 
 #include <json/writer.h>
+#include <unistd.h>
 
 #include <algorithm>
 #include <array>
@@ -136,7 +137,12 @@ std::string prettyJson(const Json::Value &value) {
     Json::StreamWriterBuilder builder;
     builder["indentation"] = "  ";
     builder["commentStyle"] = "None";
+    builder["enableYAMLCompatibility"] = true; // no space before a colon
     std::string text = Json::writeString(builder, value) + "\n";
+    // The writer begins an object or array below its name. Within a string there is no line break.
+    for (std::size_t at = 0; (at = text.find(": \n", at)) != std::string::npos; at += 2) {
+        text.erase(at + 2, text.find_first_not_of(" \n", at + 2) - at - 2);
+    }
     for (std::size_t at = 0; (at = text.find('\x7f', at)) != std::string::npos;) {
         text.replace(at, 1, "\\u007f"); // the one character of ASCII that it leaves to the terminal
     }
@@ -163,9 +169,13 @@ ExitCode tell(const Outcome &outcome, bool json) {
         told = put(outcome->text, stdout);
     } else {
         const Failure &failure = outcome.error();
+        // At a terminal the reader has it before his eyes.
+        const bool shown =
+            !failure.text.empty() && isatty(STDOUT_FILENO) != 0 && isatty(STDERR_FILENO) != 0;
         told = put(failure.text, stdout) &&
-               put("ovradr: " + printable(failure.message) + "\n" +
-                       (failure.hint.empty() ? "" : printable(failure.hint) + "\n"),
+               put(shown ? ""
+                         : "ovradr: " + printable(failure.message) + "\n" +
+                               (failure.hint.empty() ? "" : printable(failure.hint) + "\n"),
                    stderr);
     }
     if (told || exit != ExitCode::kOk) {

@@ -90,8 +90,8 @@ private:
 };
 
 Refusal unreadable(const std::string &where, const std::string &why) {
-    return failure(ExitCode::kFailed, "No password can be read from " + where + ": " + why + ".",
-                   "Give a file whose first line is the password.");
+    return failure(ExitCode::kFailed, "No secret can be read from " + where + ": " + why + ".",
+                   "Its first line has to be the password or, for --from-session, the session.");
 }
 
 /// Reads up to the end of the line. One byte at a time: what follows the line is not ours.

@@ -5,6 +5,8 @@
 #include <ovrabase/number.h>
 #include <ovraplatform/peer_trust.h>
 
+#include <arpa/inet.h>
+
 #include <optional>
 #include <string_view>
 
@@ -53,6 +55,10 @@ Expected<Conn> parseAuthority(const std::string &text, std::string_view rest,
         host = OvraBase::normalizeIpv6(host);
         return host.empty() ? refused(text, "what stands in brackets is not an IPv6 address")
                             : Expected<Conn>(Conn(host, protocol, port));
+    }
+    in_addr address{};
+    if (inet_aton(host.c_str(), &address) != 0 && !OvraBase::isNumericAddress(host)) {
+        return refused(text, "an IPv4 address has four numbers, as 192.0.2.7");
     }
     if (!OvraBase::isHostName(host)) {
         return refused(text, host.empty() ? "it has no host" : "its host is not a valid name");

@@ -28,7 +28,7 @@ Refusal connectFailure(const std::string &where, int error) {
     }
     if (error == ECONNREFUSED) {
         return failure(ExitCode::kNotReachable, where + " refuses connections.",
-                       "Check the port, and that ovradrd runs over there.");
+                       "Check the port, and that ovradrd runs on that appliance.");
     }
     if (error == ETIMEDOUT) {
         return failure(ExitCode::kNotReachable, where + " does not answer at all.",

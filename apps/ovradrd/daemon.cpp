@@ -12,6 +12,8 @@
 #include "test_files.h"
 
 #include <ovrabase/address.h>
+#include <ovradrcore/cache_folder.h>
+#include <ovradrcore/log.h>
 #include <ovradrnode/dr_node.h>
 #include <ovradrnode/node_db.h>
 #include <ovraplatform/api_registry.h>
@@ -168,6 +170,11 @@ tl::expected<void, StartError> Daemon::start() {
         return failed({"the node id can be neither read nor made: see the log, and check that the "
                        "disk is neither full nor read-only"});
     }
+    if (const std::string problem = OvraDRCore::prepareCacheFolder(OvraPlatform::kCacheDir);
+        !problem.empty()) {
+        OVRA_ERR("The folder of the caches [%s] %s; goes on without them", OvraPlatform::kCacheDir,
+                 problem.c_str());
+    }
     if (const Expected<void> loaded = self.loadKeys(); !loaded) {
         return failed(loaded.error());
     }
@@ -239,6 +246,7 @@ Expected<bool> Daemon::reload(const Settings &settings) {
 
 void Daemon::doPeriodicWork() {
     (void)OvraPlatform::SessionStore().sweep(); // the log says why not; the next one is soon
+    sweepTestFiles();
     impl_->retries->begin();
     impl_->dispatcher->tellRefusals();
 }

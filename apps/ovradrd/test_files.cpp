@@ -6,7 +6,10 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <chrono>
+#include <filesystem>
 #include <string>
+#include <system_error>
 
 namespace Ovradrd {
 
@@ -18,6 +21,8 @@ using OvraBase::UniqueFd;
 constexpr char kFolder[] = "/usr/ovra/var/ovradr/speedtest";
 constexpr std::string_view kNameStart = "speed-";
 constexpr std::size_t kNameDigits = 32;
+/// 32 endpoints of this node, 45 seconds each.
+constexpr std::chrono::minutes kLongestUse{30};
 
 bool consume(std::string_view &text, std::string_view prefix) {
     const bool matches = text.starts_with(prefix);
@@ -61,6 +66,18 @@ std::optional<OvraService::ServedFile> openTestFile(std::string_view path) {
         return std::nullopt;
     }
     return OvraService::ServedFile{std::move(file), static_cast<std::uint64_t>(status.st_size)};
+}
+
+void sweepTestFiles() {
+    std::error_code error;
+    const auto now = std::filesystem::file_time_type::clock::now();
+    for (const auto &entry : std::filesystem::directory_iterator(kFolder, error)) {
+        const auto path = std::string(kTestFilesUrl) + entry.path().string();
+        const auto made = std::filesystem::last_write_time(entry.path(), error);
+        if (!nameIn(path).empty() && !error && now - made > kLongestUse) {
+            std::filesystem::remove(entry.path(), error);
+        }
+    }
 }
 
 OvraService::FileSource testFiles(std::size_t atOnce) {

@@ -19,6 +19,9 @@ inline constexpr std::string_view kTestFilesUrl = "/webman/modules/ovradr/";
 /// \param path  with its escapes resolved
 [[nodiscard]] std::optional<OvraService::ServedFile> openTestFile(std::string_view path);
 
+/// Removes those that no measurement uses any more: one that was interrupted leaves its file.
+void sweepTestFiles();
+
 /// Those files for the HTTP server.
 /// \param atOnce  how many are sent at once
 OvraService::FileSource testFiles(std::size_t atOnce);

@@ -105,7 +105,9 @@ __attribute__((format(printf, 2, 0))) void logLibrary(void * /*self*/, const cha
     }
     std::array<char, 512> line{};
     std::vsnprintf(line.data(), line.size(), format, arguments);
-    OVRA_DEBUG("%s", line.data());
+    std::string_view text = line.data();
+    text = text.substr(0, text.find_last_not_of('\n') + 1);
+    OVRA_DEBUG("%.*s", static_cast<int>(text.size()), text.data());
 }
 
 } // namespace

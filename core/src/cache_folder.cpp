@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "cache_folder.h"
 
+#include "ovradrcore/cache_folder.h"
 #include "ovradrcore/log.h"
 #include "ovradrcore/util.h"
 
@@ -19,13 +20,9 @@ namespace {
 
 using OvraBase::UniqueFd;
 
-bool refuse(const std::string &directory, const std::string &reason) {
-    static std::atomic<bool> reported{false};
-    if (!reported.exchange(true)) {
-        OVRA_ERR("Cache directory [%s] %s; going on without a cache", directory.c_str(),
-                 reason.c_str());
-    }
-    return false;
+std::atomic<bool> &makesFolders() {
+    static std::atomic<bool> makes{true};
+    return makes;
 }
 
 /// Opening a name failed because of what has it, not for want of a name, descriptors or space.
@@ -52,20 +49,16 @@ bool moveAway(const std::string &directory) {
     return moved;
 }
 
-} // namespace
+constexpr const char *kMissing = "is missing";
 
-bool isOursAlone(const struct stat &status) {
-    return status.st_uid == geteuid() && (status.st_mode & (S_IWGRP | S_IWOTH)) == 0 &&
-           (S_ISDIR(status.st_mode) || status.st_nlink <= 1);
-}
-
-bool checkCacheFolder(const std::string &directory, bool create) {
+/// "" if the directory may be trusted; see checkCacheFolder().
+std::string problemOf(const std::string &directory, bool create) {
     struct stat status {};
     constexpr int kAttempts = 3; // somebody may put another one there
     for (int attempt = 0; attempt < kAttempts; ++attempt) {
         if (lstat(directory.c_str(), &status) != 0) {
             if (errno == ENOENT && !create) {
-                return false;
+                return kMissing;
             }
             // The umask may take rights of our own as well.
             const bool made =
@@ -73,18 +66,43 @@ bool checkCacheFolder(const std::string &directory, bool create) {
                 ((mkdir(directory.c_str(), 0700) == 0 && chmod(directory.c_str(), 0700) == 0) ||
                  errno == EEXIST);
             if (!made || lstat(directory.c_str(), &status) != 0) {
-                return refuse(directory, "cannot be used: " + OvraBase::errnoText(errno));
+                return "cannot be used: " + OvraBase::errnoText(errno);
             }
         }
         if (S_ISDIR(status.st_mode) && isOursAlone(status)) {
-            return true;
+            return "";
         }
         if (!moveAway(directory)) {
             break;
         }
     }
-    return refuse(directory, "is not a directory of user " + std::to_string(geteuid()) +
-                                 " that only he may write (remove it)");
+    return "is not a directory of user " + std::to_string(geteuid()) +
+           " that only he may write (remove it)";
+}
+
+} // namespace
+
+std::string prepareCacheFolder(const std::string &directory) {
+    return problemOf(directory, true);
+}
+
+void makeNoCacheFolder() {
+    makesFolders() = false;
+}
+
+bool isOursAlone(const struct stat &status) {
+    return status.st_uid == geteuid() && (status.st_mode & (S_IWGRP | S_IWOTH)) == 0 &&
+           (S_ISDIR(status.st_mode) || status.st_nlink <= 1);
+}
+
+bool checkCacheFolder(const std::string &directory, bool create) {
+    const std::string problem = problemOf(directory, create && makesFolders());
+    static std::atomic<bool> reported{false};
+    if (!problem.empty() && problem != kMissing && !reported.exchange(true)) {
+        OVRA_ERR("Cache directory [%s] %s; going on without a cache", directory.c_str(),
+                 problem.c_str());
+    }
+    return problem.empty();
 }
 
 UniqueFd openCacheFile(const std::string &path, int flags) {

@@ -33,7 +33,8 @@ struct OVRADRNODE_EXPORT NodeCandidate {
     bool temporary = false;
     bool remembered = false; ///< it worked last, or was found to have the right
     CachedVerdict reachable; ///< the endpoint answers
-    CachedVerdict privilege; ///< the credential has the right on its node
+    /// The credential has the right on its node. False also if its last request got no answer.
+    CachedVerdict privilege;
     Outlook outlook = Outlook::kLater;
 
     /// Members "cred_id", "endpoint" (an object), "temporary", "remembered", "reachable",

@@ -117,14 +117,23 @@ linkWord() {
     echo "$(<"$lab/n$1/link$2")$shape"
 }
 
-# daemonWord NODE YES-OR-NO: whether the node's daemon answers now, checked from inside.
+silentWord="does not answer"
+
+# daemonWord NODE YES-OR-NO: whether the node's daemon answers now, at each address and port, checked from
+# inside.
 daemonWord() {
+    local address urls=()
     if [[ $2 == no ]]; then
         echo "none"
-    elif (enterNode "$1" curl --silent --insecure --noproxy '*' --max-time 3 --output /dev/null \
-        "https://$(nodeAddress "$labWay" "$1" 0):5001/webapi/query.cgi") >/dev/null 2>&1 </dev/null; then
+        return
+    fi
+    for address in $(nodeAddresses "$labWay" "$1" | tr , ' '); do
+        urls+=("https://$address:5001/webapi/query.cgi" "http://$address:5000/webapi/query.cgi")
+    done
+    if (enterNode "$1" curl --silent --insecure --noproxy '*' --max-time 5 --fail-early "${urls[@]}") \
+        >/dev/null 2>&1 </dev/null; then
         echo "https 5001, http 5000"
     else
-        echo "does not answer"
+        echo "$silentWord"
     fi
 }

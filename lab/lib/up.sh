@@ -8,7 +8,7 @@ maxNodes=32
 upSeconds=90
 
 labUp() {
-    local count="" withDaemon=yes argument
+    local count="" withDaemon=yes argument status i
     for argument; do
         case $argument in
         --no-daemon) withDaemon=no ;;
@@ -31,22 +31,33 @@ labUp() {
 
     # If this script ends early for any reason, SIGKILL included, the end of the keeper's standard
     # input ends the lab.
-    trap 'endEarly "interrupted"' INT TERM HUP
+    trap 'endEarly "interrupted" 130' INT
+    trap 'endEarly "interrupted" 143' TERM
+    trap 'endEarly "interrupted" 129' HUP
     exec {keeper}> >(exec setsid bash "$labLib/keeper.sh" "$lab" >"$lab/keeper.log" 2>&1)
     waitForNodes "$count" || endEarly "the lab did not come up"
+    # Under load a daemon that has answered once may be slow to do it again.
+    status=$(labStatus)
+    for ((i = 1; i <= count; i++)); do
+        if [[ $status =~ (^|$'\n')node-$i\ [^$'\n']*"$silentWord" ]]; then
+            showNode "$i" "does not answer"
+            endEarly "node-$i does not answer"
+        fi
+    done
     trap '' INT TERM HUP
     echo keep >&"$keeper"
     exec {keeper}>&- 9<&-
     trap - INT TERM HUP
-    labStatus
+    printf '%s\n' "$status"
 }
 
-# endEarly WHY: takes down a lab that is coming up, and fails.
+# endEarly WHY [CODE]: takes down a lab that is coming up, and fails, with that exit code.
 endEarly() {
     trap '' INT TERM HUP
     exec {keeper}>&- 9<&-
-    waitUntilGone || fail "$1, and $lab is still there; end it with: lab down"
-    fail "$1; it was taken down again"
+    local state="it was taken down again"
+    waitUntilGone || state="and $lab is still there; end it with: lab down"
+    (fail "$1; $state") || exit "${2-1}"
 }
 
 checkPrograms() {

@@ -99,14 +99,15 @@ sandboxPassesWhatGoesInAndOut() {
     same "a file of the working folder" "$(<file)" made
 }
 
-# signalled SIGNAL COMMAND...: COMMAND fails if it gets the signal as soon as $scratch/runs is there.
+# signalled SIGNAL COMMAND...: COMMAND fails, with this code, if it gets the signal as soon as $scratch/runs is
+# there.
 signalled() {
     rm -f "$scratch/runs"
     # A shell starts background jobs with SIGINT ignored, nohup with SIGHUP; this one must receive them.
     perl -e '$SIG{INT} = $SIG{HUP} = "DEFAULT"; exec @ARGV' "${@:2}" >"$scratch/out" 2>&1 &
     eventually "the command runs" test -e "$scratch/runs"
     kill -"$1" $!
-    ! wait $! || broken "SIG$1 counts as success"
+    wait $! && broken "SIG$1 counts as success" || code=$?
 }
 
 sandboxLeavesNothingAfterASignal() {
@@ -253,7 +254,13 @@ failedStartIsShownAndCleared() {
     ends "which step failed" 1 "ovradrd ended with exit code 5" lab up 2
     holds "what it logged" "$output" "port taken"
     cleared "after the daemon failed"
-    rm "$scratch/bin/ovradrd"
+    # A daemon that answers once and then no more.
+    programs 'exit 0' "exec sleep $mark"
+    printf '#!/bin/sh\ncase "$*" in *--fail-early*) exit 7 ;; esac\n' >"$scratch/bin/curl"
+    chmod +x "$scratch/bin/curl"
+    ends "a node that falls silent" 1 "node-1 does not answer" lab up 1
+    cleared "after a node fell silent"
+    rm "$scratch/bin/ovradrd" "$scratch/bin/curl"
     ends "a program that is not there" 1 "ovradrd is not installed in $scratch" lab up 2
     cleared "after a program was missing"
 }
@@ -263,6 +270,7 @@ interruptedStartIsCleared() {
     programs 'exit 0' "touch '$scratch/runs'; exec sleep $mark"
     for signal in INT TERM KILL; do
         signalled "$signal" "$root/lab/lab" up 2
+        same "exit code after SIG$signal" "$code" $((128 + $(kill -l "$signal")))
         cleared "after SIG$signal"
     done
 }

@@ -2,6 +2,7 @@
 #include "commands/commands.h"
 #include "node_ref.h"
 #include "output.h"
+#include "renewal.h"
 
 #include <ovradrcore/json.h>
 #include <ovradrnode/node_db.h>
@@ -181,7 +182,13 @@ Outcome call(const CallOptions &options) {
                        "The relay service does not tell where the node is reached now.",
                        "`ovradr farlink status`, here and over there, says more.");
     }
-    return report(*answer);
+    Outcome outcome = report(*answer);
+    if (outcome) {
+        return outcome;
+    }
+    const Refusal refused(outcome.error());
+    return options.credId.empty() ? nodeFailure(refused, *nodeId)
+                                  : credFailure(refused, options.credId);
 }
 
 } // namespace

@@ -3,6 +3,7 @@
 #include "commands/commands.h"
 #include "endpoint.h"
 #include "output.h"
+#include "progress.h"
 #include "prompt.h"
 #include "target.h"
 #include "trust.h"
@@ -47,6 +48,9 @@ Outcome test(const Conn &conn) {
     if (!direct) {
         return Refusal(direct.error());
     }
+    // An endpoint that says nothing takes a while.
+    Progress progress;
+    progress.say("asking " + targetText(conn));
     const auto start = std::chrono::steady_clock::now();
     if (const auto answers = probeEndpoint(*direct); !answers) {
         return Refusal(answers.error());

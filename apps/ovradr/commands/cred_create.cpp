@@ -6,6 +6,7 @@
 #include "remote_login.h"
 #include "target.h"
 
+#include <ovradrcore/err_recorder.h>
 #include <ovradrnode/node_create.h>
 
 #include <memory>
@@ -109,8 +110,14 @@ Outcome createBySession(const CreateOptions &options, const Conn &conn) {
         return Refusal(session.error());
     }
     const std::unique_ptr<CredCreate> flow = newFlow(options.temporary);
-    return flow->setCred(conn, session->get()) ? runFlow(*flow, conn, options)
-                                               : flowFailure(*flow, conn);
+    if (flow->setCred(conn, session->get())) {
+        return runFlow(*flow, conn, options);
+    }
+    Refusal found = flowFailure(*flow, conn);
+    if (found.value().code == OvraDRCore::ERR::kSessionUserUnknown) {
+        found.value().hint = "Get a session that has not ended, or pair with --account NAME.";
+    }
+    return found;
 }
 
 /// The other end is known and trusted already.

@@ -2,6 +2,7 @@
 #include "commands/cred_commands.h"
 #include "cred_report.h"
 #include "node_ref.h"
+#include "renewal.h"
 #include "target.h"
 
 #include <ovradrnode/node_api.h>
@@ -30,7 +31,7 @@ Outcome test(const FoundCred &cred) {
 Outcome testCred(OvraDRNode::BaseSender &sender, const FoundCred &cred) {
     const DRNode &record = cred.record;
     const auto refusal = [&](const Response &response) {
-        Refusal found = failureOf(errorOf(sender, response));
+        Refusal found = credFailure(failureOf(errorOf(sender, response)), record.credId);
         found.value().message.insert(0, targetText(record.conn) + ": ");
         return found;
     };

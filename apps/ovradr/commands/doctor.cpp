@@ -53,10 +53,10 @@ Outcome conclude(const std::vector<Diagnosis> &diagnoses) {
 Outcome examineLocal() {
     std::vector<Diagnosis> diagnoses;
     diagnoses.emplace_back("This appliance");
-    diagnoseAppliance(diagnoses.back());
+    const bool daemonRuns = diagnoseAppliance(diagnoses.back());
     for (const Conn &conn : Conn::listLocal()) {
         diagnoses.emplace_back("Own endpoint " + targetText(conn));
-        diagnoseEndpoint({conn, {}, {}, ownFingerprint(conn), true}, diagnoses.back());
+        diagnoseEndpoint({conn, {}, {}, ownFingerprint(conn), true, daemonRuns}, diagnoses.back());
     }
     return conclude(diagnoses);
 }

@@ -2,6 +2,7 @@
 #include "access.h"
 #include "commands/commands.h"
 #include "output.h"
+#include "progress.h"
 #include "target.h"
 #include "trust.h"
 
@@ -12,7 +13,9 @@
 #include <ovraplatform/farlink.h>
 
 #include <cctype>
+#include <chrono>
 #include <memory>
+#include <thread>
 
 namespace Ovradr {
 
@@ -94,6 +97,33 @@ Response askDaemon() {
         OvraDRCore::Request("OVRA.Core.Farlink", 1, "get", Json::Value(Json::objectValue)));
 }
 
+constexpr const char *kNoDaemon = "ovradrd does not run";
+
+/// Waits until the daemon is connected under the alias at that port, which shows in its answers.
+/// \return "", or why it is not connected in time
+std::string waitForDaemon(int port) {
+    // A daemon that had another alias notices the new one when its present call ends.
+    constexpr std::chrono::seconds kLongest = OvraPlatform::kFarlinkHold + std::chrono::seconds(15);
+    constexpr std::chrono::milliseconds kStep{200};
+    Progress progress;
+    progress.say("waiting for ovradrd to connect");
+    const auto end = std::chrono::steady_clock::now() + kLongest;
+    std::string problem = "it has not connected yet";
+    while (std::chrono::steady_clock::now() < end) {
+        const Response daemon = askDaemon();
+        if (!daemon.isSuccess()) {
+            return kNoDaemon;
+        }
+        if (daemon.getDataField("connected") == true && daemon.getDataField("port") == port) {
+            return "";
+        }
+        const std::string told = OvraDRCore::memberString(daemon.getData(), "problem");
+        problem = told.empty() ? problem : told;
+        std::this_thread::sleep_for(kStep);
+    }
+    return problem;
+}
+
 Refusal notWritten() {
     return failure(ExitCode::kNotSetUp,
                    std::string(OvraPlatform::kFarlinkFile) + " cannot be written.",
@@ -128,11 +158,29 @@ Outcome enable(const FarlinkOptions &options) {
     if (!OvraPlatform::writeFarlinkSettings(settings)) {
         return notWritten();
     }
+    std::string problem;
+    if (!settings.alias.empty()) {
+        problem = waitForDaemon(report.data["port"].asInt());
+        report.data["connected"] = problem.empty();
+        report.data["problem"] = problem;
+    }
     report.text = listing(
         {{"server", report.data["server"].asString()},
          {"alias", settings.alias.empty() ? "none: only others are looked up" : settings.alias},
-         {"callers at", settings.alias.empty() ? "" : "port " + report.data["port"].asString()}});
-    return report;
+         {"callers at", settings.alias.empty() ? "" : "port " + report.data["port"].asString()},
+         {"connected", settings.alias.empty() ? ""
+                       : problem.empty()      ? "yes"
+                                              : "no: " + problem}});
+    if (problem.empty() || problem == kNoDaemon) {
+        report.text += problem.empty() ? "" : "Nobody can call before ovradrd is started.\n";
+        return report;
+    }
+    Refusal late =
+        failure(ExitCode::kNotReachable,
+                "The relay service is set up, but ovradrd is not connected to it: " + problem + ".",
+                "It goes on trying; `ovradr farlink status` shows when it is.");
+    late.value().data = report.data;
+    return late;
 }
 
 Outcome disable(const FarlinkOptions &options) {

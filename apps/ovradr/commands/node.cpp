@@ -3,6 +3,7 @@
 #include "node_ref.h"
 #include "node_view.h"
 #include "output.h"
+#include "renewal.h"
 #include "target.h"
 
 #include <ovradrcore/json.h>
@@ -73,7 +74,7 @@ Expected<Json::Value> askNode(const std::string &nodeId) {
     if (answer.isSuccess()) {
         return answer.getData();
     }
-    return failureOf(errorOf(sender, answer));
+    return nodeFailure(failureOf(errorOf(sender, answer)), nodeId);
 }
 
 Outcome nodeInfo(const std::string &nodeId, bool refresh) {

@@ -2,7 +2,9 @@
 #include "commands/session_commands.h"
 #include "granted_session.h"
 #include "node_ref.h"
+#include "node_view.h"
 #include "output.h"
+#include "renewal.h"
 #include "target.h"
 
 #include <ovradrcore/json.h>
@@ -68,7 +70,7 @@ Expected<Json::Value> ask(const std::string &nodeId, const char *method,
     if (answer.isSuccess()) {
         return answer.getData();
     }
-    return failureOf(errorOf(sender, answer));
+    return nodeFailure(failureOf(errorOf(sender, answer)), nodeId);
 }
 
 Expected<std::vector<HeldCred>> heldCreds(const std::string &nodeId, const std::string &localId) {
@@ -223,9 +225,36 @@ Outcome revoke(const Audit &first, const Audit &second) {
     return report;
 }
 
+/// The failure for a node that no credential reaches: it may hold sessions here all the same.
+Refusal noWayTo(const std::string &node, const Failure &unknown) {
+    const Expected<std::vector<GrantedSession>> sessions = grantedSessions();
+    if (!sessions) {
+        return Refusal(sessions.error());
+    }
+    const auto found =
+        std::find_if(sessions->rbegin(), sessions->rend(), [&node](const GrantedSession &session) {
+            return !node.empty() && session.nodeId.starts_with(node);
+        });
+    if (found == sessions->rend()) {
+        return Refusal(unknown);
+    }
+    const std::string &client = found->record.remote;
+    return failure(ExitCode::kNotFound,
+                   "No credential reaches the node " + found->nodeId +
+                       ", which has a session here as " + found->record.user +
+                       (client.empty() ? "" : ", granted to " + client) +
+                       ": nobody can ask it what it still uses.",
+                   "Make a way to it with `ovradr cred create URL --account NAME`, or end what it "
+                   "has with `ovradr session revoke --node " +
+                       shortId(found->nodeId) + "`.");
+}
+
 Outcome audit(const AuditOptions &options) {
     const Expected<std::string> nodeId = resolveNode(options.node);
     const Expected<std::string> localId = localNode();
+    if (!nodeId && nodeId.error().exit == ExitCode::kNotFound) {
+        return noWayTo(options.node, nodeId.error());
+    }
     if (!nodeId || !localId) {
         return Refusal((nodeId ? localId : nodeId).error());
     }

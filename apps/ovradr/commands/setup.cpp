@@ -10,6 +10,7 @@
 #include <ovrabase/address.h>
 #include <ovrabase/number.h>
 #include <ovracore/ovracore.h>
+#include <ovradrcore/cache_folder.h>
 #include <ovradrcore/util.h>
 #include <ovradrnode/dr_node.h>
 #include <ovradrnode/node_db.h>
@@ -191,6 +192,17 @@ Expected<SetUpStep> provisionTrust() {
     return SetUpStep{"trusted keys", !problem.empty(), kKnownEndpointsFile};
 }
 
+Expected<SetUpStep> provisionCacheFolder() {
+    const bool there = access(OvraPlatform::kCacheDir, F_OK) == 0;
+    const std::string problem = OvraDRCore::prepareCacheFolder(OvraPlatform::kCacheDir);
+    if (!problem.empty()) {
+        return failure(ExitCode::kNotSetUp,
+                       std::string(OvraPlatform::kCacheDir) + " " + problem + ".",
+                       "Correct that and run `ovradr setup` again.");
+    }
+    return SetUpStep{"cache folder", !there, OvraPlatform::kCacheDir};
+}
+
 Expected<SetUpStep> provisionNodeId() {
     const std::string file = std::string(OvraPlatform::kConfigDir) + "/node.info";
     const bool there = OLIBCFileExist(file.c_str()) != 0;
@@ -249,6 +261,7 @@ Outcome setUp(const Settings &settings) {
         provisionTrust,
         provisionNodeId,
         provisionScripts,
+        provisionCacheFolder,
     };
     for (const auto &step : steps) {
         const Expected<SetUpStep> result = step();

@@ -24,15 +24,16 @@ const char *outlookText(NodeCandidate::Outlook outlook) {
     }
 }
 
-std::string conclusion(const std::vector<NodeCandidate> &candidates) {
+std::string conclusion(const std::string &nodeId, const std::vector<NodeCandidate> &candidates) {
+    const std::string doctor = "`ovradr doctor " + shortId(nodeId) +
+                               "` tries each credential and says what is wrong with it.\n";
     const NodeCandidate *const next = winner(candidates);
     if (next == nullptr) {
-        return "A request sent now fails at once: no credential is usable. `ovradr doctor` says "
-               "more.\n";
+        return "A request sent now fails at once: no credential is usable.\n" + doctor;
     }
     return printable("A request sent now goes over " + targetText(next->node.conn) +
                      ". What is marked \"was\" is asked again first.") +
-           "\n";
+           "\nWhat was answered is not kept: " + doctor;
 }
 
 Report why(const std::string &nodeId) {
@@ -58,8 +59,9 @@ Report why(const std::string &nodeId) {
                         outlookText(candidate.outlook) + reason});
     }
     report.text =
-        table({"CREDENTIAL", "ENDPOINT", "KIND", "ANSWERS", "RIGHT", "A REQUEST TRIES IT"}, rows) +
-        conclusion(candidates);
+        table({"CREDENTIAL", "ENDPOINT", "KIND", "ANSWERS", "GOT THROUGH", "A REQUEST TRIES IT"},
+              rows) +
+        conclusion(nodeId, candidates);
     return report;
 }
 

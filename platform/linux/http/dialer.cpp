@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "http/dialer.h"
 
+#include "ovraplatform/appliance.h"
 #include "relay/alias_place.h"
 
 #include <ovradrcore/cache.h>
@@ -16,7 +17,6 @@ namespace OvraPlatform {
 
 namespace {
 
-constexpr char kAddressCache[] = "/tmp/.ovradrcache/dr_address_cache";
 constexpr long kLifetime = 24L * 60 * 60; // seconds
 constexpr int kReadAttempts = 3;
 
@@ -25,7 +25,8 @@ constexpr int kReadAttempts = 3;
 class AddressCache : public OvraDRCore::Cache {
 public:
     explicit AddressCache(const Endpoint &endpoint)
-        : Cache(kAddressCache, endpoint.key(), kLifetime, false, kReadAttempts) {}
+        : Cache(std::string(kCacheDir) + "/dr_address_cache", endpoint.key(), kLifetime, false,
+                kReadAttempts) {}
 
     Json::Value GetInfo() const override {
         Json::Value info(Json::objectValue);

@@ -87,6 +87,9 @@ TEST(CommandLine, SaysToAnOrdinaryUserWhichFileHeCannotReadAndNothingElse) {
         EXPECT_EQ(result.exit, 9) << line;
         EXPECT_EQ(result.out + result.err, told) << line;
     }
+    std::filesystem::remove_all("/tmp/.ovradrcache");
+    EXPECT_EQ(runAsNobody({"conn", "test", "https://127.0.0.1:1"}).exit, 3);
+    EXPECT_FALSE(std::filesystem::exists("/tmp/.ovradrcache")) << "it would be his";
 }
 
 TEST(CommandLine, HelpAndVersionAreNoFailures) {

@@ -2,6 +2,10 @@
 // The program's diagnosis of a paired node with scripted failures.
 #include "scripted_node.h"
 
+#include <sys/resource.h>
+
+#include <csignal>
+
 namespace OvradrTest {
 
 namespace {
@@ -52,6 +56,7 @@ TEST_F(Diagnosis, NamesTheStepThatFailsAndHasAnExitCodeForEach) {
         const Result result = run({"doctor", "n1", "--json"});
         EXPECT_EQ(result.exit, exit) << step << result.out;
         EXPECT_EQ(failedStep(result.json()), step) << result.out;
+        EXPECT_EQ(result.out.find("ovradr cred set ") != std::string::npos, exit == 4);
         if (exit == 3 && std::string_view(step) == "key") {
             continue; // it waits 10 seconds for the key each time
         }
@@ -67,7 +72,7 @@ TEST_F(Diagnosis, KnowsWhatANodeThatIsGoneSaidLast) {
     pair(remote);
     const auto why = [] { return run({"why", "n1", "--json"}).json()["data"]["candidates"][0]; };
     EXPECT_EQ(run({"node", "info", "n1", "--refresh"}).exit, 0);
-    EXPECT_EQ(why()["reason"], "it worked last");
+    EXPECT_EQ(why()["reason"], "its node answered over it last");
     remote.die();
     EXPECT_EQ(run({"node", "info", "n1", "--refresh"}).exit, 3);
     const Json::Value info = run({"node", "info", "n1", "--json"}).json()["data"];
@@ -80,6 +85,38 @@ TEST_F(Diagnosis, KnowsWhatANodeThatIsGoneSaidLast) {
     EXPECT_TRUE(nodes[0]["local"].asBool());
     EXPECT_EQ(nodes[1]["hostname"], "far-host");
     EXPECT_TRUE(nodes[1]["cred_id"].isNull()) << "no credential would be used";
+    EXPECT_EQ(run({"why", "n1"}).out.find("right"), std::string::npos) << "nobody spoke of it";
+}
+
+TEST_F(Diagnosis, OfTheApplianceSeesWhatItsDaemonWouldNotServeWith) {
+    const std::string etc = "/usr/ovra/etc/ovradr/";
+    const auto blocked = [] { // the files of the caches are larger
+        std::signal(SIGXFSZ, SIG_IGN);
+        const rlimit small{65536, 65536};
+        setrlimit(RLIMIT_FSIZE, &small);
+    };
+    const std::tuple<const char *, std::string, std::function<void()>> cases[] = {
+        {"settings", "ovradrd does not start with it",
+         [&] { writeFile(etc + "ovradrd.conf", "https_port=\"x\"\n"); }},
+        {"keys", "chmod 600", [&] { chmod((etc + "ovradrd.seal").c_str(), 0644); }},
+        {"keys", "ovradr setup", [&] { std::filesystem::remove(etc + "ovradrd.seal"); }},
+        {"cache", "takes no entry", [] { std::filesystem::remove_all("/tmp/.ovradrcache"); }},
+        {"daemon", "Start ovradrd", [] {}},
+    };
+    for (const auto &[step, told, harm] : cases) {
+        std::filesystem::remove(etc + "ovradrd.conf");
+        EXPECT_EQ(run({"setup"}).exit, 0);
+        harm();
+        const bool full = std::string_view(step) == "cache";
+        const Result result = run(
+            {"doctor", "--json"}, "", full ? std::function<void()>(blocked) : [] {});
+        EXPECT_EQ(failedStep(result.json()), step) << result.out;
+        EXPECT_NE(result.out.find(told), std::string::npos) << result.out;
+        chmod((etc + "ovradrd.seal").c_str(), 0600);
+    }
+    Terminal shown({"doctor"});
+    EXPECT_EQ(shown.finish(), 3);
+    EXPECT_EQ(shown.screen().find("ovradr: "), std::string::npos) << "it is above already";
 }
 
 } // namespace OvradrTest

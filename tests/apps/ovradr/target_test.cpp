@@ -39,7 +39,7 @@ TEST(Target, IsRefusedWhenAnythingInItWouldBeLost) {
           "nas2:-1",    "nas2:+80",    "nas2:5001x",   "nas2/path", "nas2//",
           "nas2?x",     "nas2#x",      "bob:pw@nas2",  "nas 2",     "nas2\r\nX: 1",
           "n\xC3\xA4s", "2001:db8::7", "[2001:db8::7", "[nas2]",    "[fe80::1%eth0]",
-          "[::1]x",     "-nas2"}) {
+          "[::1]x",     "-nas2",       "10.77.2"}) {
         refused.push_back(std::string("https://") + authority);
     }
     for (const std::string &text : refused) {

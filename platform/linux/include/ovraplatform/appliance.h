@@ -29,6 +29,9 @@ inline constexpr char kLoginsFile[] = "/usr/ovra/var/ovradr/logins.db";
 inline constexpr char kDeviceKeyFile[] = "/usr/ovra/var/ovradr/device.key"; ///< mode 0600
 inline constexpr char kKnownEndpointsFile[] = "/usr/ovra/var/ovradr/known_endpoints";
 
+/// The library's caches, which all processes of the appliance share. Mode 0700.
+inline constexpr char kCacheDir[] = "/tmp/.ovradrcache";
+
 /// The keys of kConfigFile.
 namespace Setting {
 inline constexpr char kHttpPort[] = "http_port";
