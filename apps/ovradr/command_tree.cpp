@@ -17,12 +17,14 @@ void addCommandTree(CLI::App &app, bool &json, Command &chosen) {
         "also 10 name unknown, 11 no appliance, 12 wrong node, 13 clocks\n"
         "Examples:\n"
         "  ovradr setup\n"
-        "  ovradr user add repl --admin\n"
-        "  ovradr cred create https://nas2 --account repl\n"
+        "  ovradr invite\n"
+        "  ovradr pair 22TQ8-...\n"
         "  ovradr call 3f2a OVRA.DR.Node info");
     addSetupCommand(app, chosen);
     addNodeCommands(app, chosen);
     addUserCommands(app, chosen);
+    addInviteCommand(app, chosen);
+    addPairCommand(app, chosen);
     addCredCommands(app, chosen);
     addSessionCommands(app, chosen);
     addCallCommand(app, chosen);

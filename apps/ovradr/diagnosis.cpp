@@ -3,6 +3,7 @@
 
 #include "endpoint.h"
 #include "node_ref.h"
+#include "open_call.h"
 #include "output.h"
 #include "provision/data_files.h"
 #include "provision/node_database.h"
@@ -45,7 +46,6 @@ namespace WebAPI = OvraDRNode::WebAPI;
 
 /// One-time codes are accepted one step of 30 seconds early or late.
 constexpr double kMaxClockSeconds = 30;
-constexpr long kClockTimeout = 10; // seconds
 
 const char *stateText(Diagnosis::Step::State state) {
     switch (state) {
@@ -162,11 +162,6 @@ std::string decimal(double number) {
     std::array<char, 64> text{};
     std::snprintf(text.data(), text.size(), "%.1f", number);
     return text.data();
-}
-
-double wallClock() {
-    return std::chrono::duration<double>(std::chrono::system_clock::now().time_since_epoch())
-        .count();
 }
 
 /// The steps that examine one endpoint; each uses what those before it have found.
@@ -368,35 +363,11 @@ private:
     }
 
     Expected<std::string> clock() const {
-        OVRA::CredRequest request;
-        const std::unique_ptr<OVRACred, decltype(&OVRACredFree)> cred(OVRACredAlloc(),
-                                                                      &OVRACredFree);
-        const bool ready = cred &&
-                           OVRACredItemSetProtocol(cred.get(), conn_.protocol.c_str()) == 0 &&
-                           OVRACredItemSetHost(cred.get(), conn_.addr.c_str()) == 0 &&
-                           OVRACredItemSetPort(cred.get(), conn_.port) == 0 &&
-                           OVRA::CredRequest::CreateWebAPIRequest(request, cred.get(), nullptr,
-                                                                  "OVRA.Core.Encryption", 1,
-                                                                  "getinfo", Json::Value()) != 0 &&
-                           request.SetResponseTimeout(kClockTimeout) != 0;
-        const double start = wallClock();
-        if (!ready || request.Process(true, 0) == 0) {
-            return endpointFailure(conn_, static_cast<CredError>(request.GetError()));
-        }
-        const double middle = (start + wallClock()) / 2;
-        Response response;
-        response.setResp(request.GetResponse());
-        const Json::Value time = response.getDataField("time");
-        if (!time.isInt64()) {
-            return failure(ExitCode::kNoAppliance, targetText(conn_) + " does not tell its time.",
-                           "Check that both appliances run versions that fit together.");
-        }
-        return judgeClock(static_cast<double>(time.asInt64()) / 1000 - middle);
+        return clockAhead(conn_).and_then([this](double ahead) { return judgeClock(ahead); });
     }
 
     Expected<std::string> judgeClock(double ahead) const {
-        const std::string text =
-            decimal(std::abs(ahead)) + " s " + (ahead < 0 ? "behind" : "ahead of") + " this one";
+        const std::string text = clockText(ahead);
         if (std::abs(ahead) > kMaxClockSeconds) {
             return failure(ExitCode::kClock,
                            "The clock of " + targetText(conn_) + " is " + text + ".",

@@ -21,19 +21,28 @@ namespace Ovradr {
 namespace {
 
 constexpr std::string_view kOneTimeCodeOption = "--otp";
+constexpr std::string_view kPair = "pair";
 
-/// Copies the arguments and wipes a one-time code from where every process can see it.
+/// Whether an argument of `pair` may be the code of an invitation, or a part of it.
+bool isInviteCode(const std::string &argument) {
+    return !argument.starts_with("-") && argument.find(':') == std::string::npos;
+}
+
+/// Copies the arguments and wipes a one-time code and the code of an invitation from where every
+/// process can see them.
 std::vector<std::string> takeArguments(int argc, char **argv) {
     std::vector<std::string> arguments;
     bool codeFollows = false;
+    bool pairs = false;
     for (int i = 1; i < argc; ++i) {
         const std::string argument = argv[i];
         const bool codeInside = argument.starts_with(std::string(kOneTimeCodeOption) + "=");
-        if (codeFollows || codeInside) {
+        if (codeFollows || codeInside || (pairs && isInviteCode(argument))) {
             const std::size_t kept = codeInside ? kOneTimeCodeOption.size() + 1 : 0;
             std::memset(argv[i] + kept, '*', argument.size() - kept);
         }
         codeFollows = argument == kOneTimeCodeOption;
+        pairs = pairs || argument == kPair;
         arguments.push_back(argument);
     }
     return arguments;

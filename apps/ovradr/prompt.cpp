@@ -161,6 +161,12 @@ Expected<Secret> askSecret(const std::string &question) {
     return readLine(STDIN_FILENO, "the terminal");
 }
 
+Expected<Secret> askLine(const std::string &question) {
+    std::fprintf(stderr, "%s: ", printable(question).c_str());
+    std::fflush(stderr);
+    return readLine(STDIN_FILENO, "the terminal");
+}
+
 Expected<Secret> obtainPassword(const PasswordSource &source, const std::string &question,
                                 bool twice) {
     if (source.fromStdin) {

@@ -30,6 +30,9 @@ bool isInteractive();
 /// Asks for a secret on the terminal, without echo. Only where isInteractive().
 [[nodiscard]] Expected<Secret> askSecret(const std::string &question);
 
+/// Asks for a line on the terminal. Only where isInteractive().
+[[nodiscard]] Expected<Secret> askLine(const std::string &question);
+
 /// Asks a question on the terminal that only "y" or "yes" answers with true. Only where
 /// isInteractive().
 bool confirm(const std::string &question);

@@ -5,6 +5,7 @@
 #include "farlink_agent.h"
 #include "handlers/auth.h"
 #include "handlers/handlers.h"
+#include "handlers/invite.h"
 #include "release_retries.h"
 #include "service/listener.h"
 #include "service/tls_identity.h"
@@ -100,6 +101,7 @@ struct Daemon::Impl {
     std::optional<OvraPlatform::SealKeyPair> keys;
     OvraPlatform::ReplayGuard guard;
     LoginApi loginApi;
+    InviteApi inviteApi;
     OvraPlatform::APIRegistry registry;
     std::optional<CallDispatcher> dispatcher;
     std::optional<FarlinkAgent> farlink;
@@ -126,6 +128,7 @@ Expected<void> Daemon::Impl::loadKeys() {
 
 void Daemon::Impl::addHandlers() {
     loginApi.addTo(registry);
+    inviteApi.addTo(registry);
     addEncryptionAPI(registry, *keys, guard);
     addUserAPI(registry);
     addFarlinkAPI(registry, *farlink);

@@ -18,6 +18,8 @@ using Command = std::function<Outcome()>;
 void addSetupCommand(CLI::App &app, Command &chosen);
 void addNodeCommands(CLI::App &app, Command &chosen);
 void addUserCommands(CLI::App &app, Command &chosen);
+void addInviteCommand(CLI::App &app, Command &chosen);
+void addPairCommand(CLI::App &app, Command &chosen);
 void addCredCommands(CLI::App &app, Command &chosen);
 void addSessionCommands(CLI::App &app, Command &chosen);
 void addCallCommand(CLI::App &app, Command &chosen);

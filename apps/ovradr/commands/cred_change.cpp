@@ -3,6 +3,7 @@
 #include "cred_report.h"
 #include "endpoint.h"
 #include "node_ref.h"
+#include "open_call.h"
 #include "output.h"
 #include "remote_login.h"
 #include "shared/session_lock.h"
@@ -50,7 +51,7 @@ Refusal setFailure(const DRNodeCredSet &flow, const Conn &conn) {
                        "The credential is as it was. The system log says why; correct that and "
                        "try again.");
     }
-    Failure found = failureOf(flow).value();
+    Failure found = withClock(failureOf(flow), conn).value();
     if (flow.GetErrCode() == ERR::kOtherNode) {
         found.message = "This is another node than the one that the credential is for.";
         found.hint = "Check the URL, or make a new credential with `ovradr cred create`.";

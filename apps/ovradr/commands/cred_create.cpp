@@ -2,6 +2,7 @@
 #include "commands/cred_commands.h"
 #include "cred_report.h"
 #include "node_ref.h"
+#include "pairing.h"
 #include "provision/node_database.h"
 #include "remote_login.h"
 #include "target.h"
@@ -15,11 +16,9 @@ namespace Ovradr {
 
 namespace {
 
-using OvraApps::FlowState;
 using OvraDRNode::Conn;
 using OvraDRNode::CredCreate;
 using OvraDRNode::DRNode;
-namespace ERR = OvraDRCore::ERR;
 
 constexpr const char *kStandardInput = "-";
 
@@ -40,21 +39,9 @@ std::unique_ptr<CredCreate> newFlow(bool temporary) {
     return std::make_unique<OvraDRNode::DRNodeCredCreate>();
 }
 
-Refusal flowFailure(const CredCreate &flow, const Conn &conn) {
-    // The one code with which storing the row fails; no other step of a creation has it.
-    if (flow.GetErrCode() == ERR::kCredNotFound) {
-        return failure(ExitCode::kNotSetUp,
-                       "The other appliance granted the credential, but it could not be stored.",
-                       "The system log says why; correct that and make the credential again.");
-    }
-    Refusal found = failureOf(flow);
-    found.value().message.insert(0, targetText(conn) + ": ");
-    return found;
-}
-
 Outcome checkOnly(const CredCreate &flow, const Conn &conn) {
     if (!flow.check()) {
-        return flowFailure(flow, conn);
+        return creationFailure(flow, conn);
     }
     Report report;
     report.data["would_work"] = true;
@@ -64,19 +51,14 @@ Outcome checkOnly(const CredCreate &flow, const Conn &conn) {
 
 /// Carries out a flow that has proved itself.
 Outcome runFlow(CredCreate &flow, const Conn &conn, const CreateOptions &options) {
-    if (!flow.getRemoteNodeInfo()) {
-        return flowFailure(flow, conn);
-    }
-    if (flow.isLocalNode()) {
-        return failure(ExitCode::kUsage, targetText(conn) + " is this appliance itself.",
-                       "Give the URL of another one.");
+    if (const auto met = meetNode(flow, conn); !met) {
+        return Refusal(met.error());
     }
     if (options.dryRun) {
         return checkOnly(flow, conn);
     }
-    const FlowState state = OvraApps::createCredential(flow);
-    if (state != FlowState::kDone) {
-        return state == FlowState::kBusy ? busyFailure() : flowFailure(flow, conn);
+    if (const auto created = createCred(flow, conn); !created) {
+        return Refusal(created.error());
     }
     const DRNode &record = flow.getNode();
     Report report;
@@ -90,15 +72,9 @@ Outcome runFlow(CredCreate &flow, const Conn &conn, const CreateOptions &options
 
 Outcome createByAccount(const CreateOptions &options, const Conn &conn) {
     const std::unique_ptr<CredCreate> flow = newFlow(options.temporary);
-    bool proved = false;
-    const auto attempt = [&](const std::string &password, const std::string &code) {
-        proved = flow->setCred(conn, options.login.account, password, code);
-        return proved ? 0 : flow->GetErrCode();
-    };
-    if (const auto tried = logIn(options.login, conn.addr, attempt); !tried) {
-        return Refusal(tried.error());
-    }
-    return proved ? runFlow(*flow, conn, options) : flowFailure(*flow, conn);
+    return proveByAccount(*flow, options.login, conn).and_then([&] {
+        return runFlow(*flow, conn, options);
+    });
 }
 
 Outcome createBySession(const CreateOptions &options, const Conn &conn) {
@@ -113,7 +89,7 @@ Outcome createBySession(const CreateOptions &options, const Conn &conn) {
     if (flow->setCred(conn, session->get())) {
         return runFlow(*flow, conn, options);
     }
-    Refusal found = flowFailure(*flow, conn);
+    Refusal found = creationFailure(*flow, conn);
     if (found.value().code == OvraDRCore::ERR::kSessionUserUnknown) {
         found.value().hint = "Get a session that has not ended, or pair with --account NAME.";
     }
@@ -128,7 +104,7 @@ Outcome createByCred(const CreateOptions &options) {
     }
     const std::unique_ptr<CredCreate> flow = newFlow(options.temporary);
     return flow->setCred(cred->record.credId) ? runFlow(*flow, cred->record.conn, options)
-                                              : flowFailure(*flow, cred->record.conn);
+                                              : creationFailure(*flow, cred->record.conn);
 }
 
 Expected<void> checkProof(const CreateOptions &options) {

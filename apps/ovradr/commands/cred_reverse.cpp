@@ -2,14 +2,11 @@
 #include "commands/cred_commands.h"
 #include "node_ref.h"
 #include "output.h"
+#include "pairing.h"
 #include "target.h"
 
 #include <ovradrcore/json.h>
 #include <ovradrnode/cred_reverse_create.h>
-#include <ovradrnode/node_api.h>
-#include <ovradrnode/sender.h>
-#include <ovraplatform/api_errors.h>
-#include <ovraplatform/role.h>
 
 #include <memory>
 #include <vector>
@@ -22,7 +19,6 @@ using OvraDRCore::memberString;
 using OvraDRNode::Conn;
 using OvraDRNode::CredReverseCreate;
 using OvraDRNode::DRNode;
-using OvraPlatform::Role;
 namespace ERR = OvraDRCore::ERR;
 
 struct ReverseOptions {
@@ -32,63 +28,6 @@ struct ReverseOptions {
     bool temporary = false;
     bool dryRun = false;
 };
-
-/// This appliance's daemon must run, and the account must be allowed to grant sessions.
-Expected<void> checkAccount(const std::string &account) {
-    const OvraDRCore::Response answer =
-        OvraDRNode::BaseSender::run(OvraDRNode::WebAPI::OvraCoreUserGetAPI(account));
-    if (answer.getErrCode() == OvraPlatform::APIError::kBadParameter) {
-        return failure(ExitCode::kNotFound, "This appliance has no account \"" + account + "\".",
-                       "`ovradr user list` shows those that it has.");
-    }
-    if (!answer.isSuccess()) {
-        Refusal found = failureOf(answer.getErrCode(), answer.getErrMsg());
-        found.value().message.insert(0, "The account " + account + " of this appliance: ");
-        return found;
-    }
-    const Json::Value &data = answer.getData();
-    const std::string role = memberString(data, "role");
-    if (role == OvraPlatform::roleWord(Role::kPairing) ||
-        role == OvraPlatform::roleWord(Role::kAdministrator)) {
-        return {};
-    }
-    return failure(ExitCode::kNotPermitted,
-                   "The account " + account + " of this appliance may not pair.",
-                   "The other appliance would get no session with it; use one with the role "
-                   "pairing or administrator.");
-}
-
-/// The endpoints to offer: the named ones, or all of this appliance.
-Expected<std::vector<Conn>> offeredConns(const std::vector<std::string> &endpoints) {
-    std::vector<Conn> conns;
-    for (const std::string &text : endpoints) {
-        const Expected<Conn> conn = parseTarget(text);
-        if (!conn) {
-            return Refusal(conn.error());
-        }
-        conns.push_back(*conn);
-    }
-    if (conns.empty()) {
-        conns = DRNode::getLocalConn();
-    }
-    if (conns.empty()) {
-        return failure(ExitCode::kFailed, "This appliance has no address that others reach.",
-                       "Bring an interface up, or name an endpoint with --endpoint.");
-    }
-    return conns;
-}
-
-Refusal reverseFailure(const CredReverseCreate &flow) {
-    // With words it is what the other appliance said about the endpoints of this one.
-    const bool unreachable =
-        flow.GetErrCode() == ERR::kNotConnectable && !flow.GetErrMsg().isNull();
-    Refusal found = unreachable ? failureOf(ERR::kRemoteConnInvalid)
-                                : failureOf(flow.GetErrCode() == ERR::kNone ? ERR::kCredIncomplete
-                                                                            : flow.GetErrCode(),
-                                            flow.GetErrMsg());
-    found.value().message.insert(0, "No credential back to this appliance: ");
-    return found;
-}
 
 Outcome report(const ReverseOptions &options, const DRNode &via, const CredReverseCreate &flow) {
     Report report;
@@ -122,7 +61,7 @@ Outcome reverse(const ReverseOptions &options) {
     if (!conns) {
         return Refusal(conns.error());
     }
-    if (const auto permitted = checkAccount(options.account); !permitted) {
+    if (const auto permitted = localAccount(options.account); !permitted) {
         return Refusal(permitted.error());
     }
     const std::unique_ptr<CredReverseCreate> flow =

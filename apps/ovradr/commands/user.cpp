@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "commands/commands.h"
 #include "output.h"
+#include "qr.h"
 
 #include <ovradrnode/dr_node.h>
 #include <ovraplatform/account_store.h>
@@ -12,6 +13,8 @@
 #include <algorithm>
 #include <array>
 #include <cctype>
+#include <cstdio>
+#include <ctime>
 #include <memory>
 #include <vector>
 
@@ -184,23 +187,55 @@ Outcome switchTotpOff(AccountStore &store, const std::string &name) {
     return changed(store, name, "The account " + name + " needs no one-time code any more.");
 }
 
+/// Whether somebody can read the secret here and type a code.
+bool isAtTerminal() {
+    return isInteractive() && isatty(STDOUT_FILENO) == 1;
+}
+
+/// Shows the secret to a person, and has a code of the authenticator typed: an account must not
+/// depend on one that did not get it.
+Expected<void> confirmTotp(const std::string &uri, const std::string &secret) {
+    constexpr int kTries = 3;
+    std::fprintf(stderr, "%s%sGive this to the authenticator; it is not shown again.\n",
+                 qrForTerminal(uri).c_str(), listing({{"URI", uri}, {"secret", secret}}).c_str());
+    for (int i = 0; i < kTries; ++i) {
+        const Expected<Secret> code = askLine("The code that it shows now");
+        if (!code) {
+            return Refusal(code.error());
+        }
+        if (OvraPlatform::matchTotp(secret, code->get(), std::time(nullptr))) {
+            return {};
+        }
+        std::fprintf(stderr, "That is not the code for %s by the clock of this appliance.\n",
+                     timeText(std::time(nullptr)).c_str());
+    }
+    return failure(ExitCode::kOneTimeCode, "No code was right: log-ins need none, as before.",
+                   "Remove the entry from the authenticator, set the clocks, and try again.");
+}
+
 Outcome switchTotpOn(AccountStore &store, const std::string &name) {
     std::string secret = OvraPlatform::newTotpSecret();
-    if (secret.empty() || !store.setTotp(name, secret)) {
-        return storeFailure(ExitCode::kFailed,
-                            secret.empty() ? "The system gives no random numbers." : store.error());
+    const OvraBase::WipeAtEnd wiped(secret);
+    if (secret.empty()) {
+        return storeFailure(ExitCode::kFailed, "The system gives no random numbers.");
     }
     const std::string uri =
         OvraPlatform::totpUri(OvraDRNode::DRNode::getLocalHostName(), name, secret);
+    const bool confirms = isAtTerminal();
+    if (const auto confirmed = confirms ? confirmTotp(uri, secret) : Expected<void>(); !confirmed) {
+        return Refusal(confirmed.error());
+    }
+    if (!store.setTotp(name, secret)) {
+        return storeFailure(ExitCode::kFailed, store.error());
+    }
     Report report;
     report.data["account"] = name;
     report.data["uri"] = uri;
     report.data["secret"] = secret;
-    report.text = "The account " + printable(name) +
-                  " needs a one-time code from now on. Give this to its authenticator; it is not "
-                  "shown again.\n" +
-                  listing({{"URI", uri}, {"secret", secret}});
-    OvraBase::wipe(secret);
+    report.text = "The account " + printable(name) + " needs a one-time code from now on." +
+                  (confirms ? "\n"
+                            : " Give this to its authenticator; it is not shown again.\n" +
+                                  listing({{"URI", uri}, {"secret", secret}}));
     return report;
 }
 

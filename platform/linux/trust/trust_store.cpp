@@ -296,6 +296,30 @@ TrustVerdict TrustStore::trust(const std::string &endpoint, const std::string &v
     return TrustVerdict::kTrusted;
 }
 
+bool TrustStore::undoTrust(const std::string &endpoint, const std::string &value,
+                           const std::optional<Entry> &before) {
+    const auto file = OvraBase::FileUpdate::begin(path_);
+    if (!file) {
+        logUnchangeable(path_, file.error().text);
+        return false;
+    }
+    auto content = read();
+    const auto line = content ? content->find(endpoint) : std::vector<Line>::iterator();
+    if (!content || line == content->lines.end() || line->entry.value != value) {
+        return content.has_value();
+    }
+    if (before) {
+        content->put(*before);
+    } else {
+        content->lines.erase(line);
+    }
+    if (!write(*file, *content)) {
+        return false;
+    }
+    OVRA_NOTICE("The key [%s] of [%s] is not trusted after all", value.c_str(), endpoint.c_str());
+    return true;
+}
+
 bool TrustStore::forget(const std::string &endpoint) {
     if (auto known = read(); known && known->find(endpoint) == known->lines.end()) {
         return true; // also where there is no folder yet

@@ -45,6 +45,7 @@ const Scene kScenes[] = {
     {"OVRA.Core.Auth", "login", "{}", 2, 104, 104, 104},
     {"OVRA.Core.Auth", "login", "{}", 1, 106, 106, 106, 101},
     {"OVRA.Core.Auth", "logout", "{}", 1, 119, 0, 0, 119},
+    {"OVRA.DR.Invite", "redeem", "{}", 1, 106, 106, 106, 101},
     {"OVRA.Core.Encryption", "getinfo", "{}", 1, 0, 0, 0},
     {kUser, "get", R"({"name":"user"})", 1, 119, 0, 0, 0, 105},
     {kUser, "get", R"({"name":"root"})", 1, 119, 105, 0, 0, 105},

@@ -73,6 +73,12 @@ public:
     /// \param replace  also in place of another pinned key
     /// \return kTrusted; kDifferent if another key is pinned, which stays; kUnavailable
     TrustVerdict trust(const std::string &endpoint, const std::string &value, bool replace);
+    /// Takes a decision back: puts back what was known of the endpoint before trust(), unless
+    /// something else than its `value` is known by now.
+    /// \param before  of find() then; std::nullopt: nothing
+    /// \return false if the file could not be changed.
+    [[nodiscard]] bool undoTrust(const std::string &endpoint, const std::string &value,
+                                 const std::optional<Entry> &before);
     /// A person's decision: withdraws what is known of the endpoint; only trust() makes it known
     /// again. \return false if the file could not be changed; an endpoint that is not named in it
     /// is not a failure.
