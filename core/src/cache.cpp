@@ -11,8 +11,11 @@
 
 #include <algorithm>
 #include <chrono>
+#include <map>
 #include <optional>
 #include <thread>
+#include <unordered_map>
+#include <utility>
 #include <vector>
 
 namespace OvraDRCore {
@@ -36,10 +39,49 @@ struct Stored {
     std::int64_t age = -1; ///< milliseconds; negative: stamped in the future
 };
 
-std::optional<Stored> load(const std::string &path, const std::string &name, int attempts) {
-    const std::optional<CacheEntry> entry = CacheFile(path).read(name, attempts);
+/// The cache files as they were when this thread's listing first looked.
+class Snapshots {
+public:
+    void enter() { ++depth_; }
+    void leave() {
+        if (--depth_ == 0) {
+            files_.clear();
+        }
+    }
+    bool active() const { return depth_ > 0; }
+
+    /// Null if there is none; valid as long as the listing.
+    const CacheEntry *find(const std::string &path, const std::string &name) {
+        const auto [file, isNew] = files_.try_emplace(path);
+        if (isNew) {
+            for (CacheEntry &entry : CacheFile(path).readAll()) {
+                std::string key = entry.name;
+                file->second.insert_or_assign(std::move(key), std::move(entry));
+            }
+        }
+        const auto entry = file->second.find(name);
+        return entry == file->second.end() ? nullptr : &entry->second;
+    }
+
+private:
+    int depth_ = 0;
+    std::map<std::string, std::unordered_map<std::string, CacheEntry>> files_;
+};
+
+thread_local Snapshots snapshots;
+
+/// \param listing  whether the snapshot of a listing will do
+std::optional<Stored> load(const std::string &path, const std::string &name, int attempts,
+                           bool listing = false) {
+    std::optional<CacheEntry> read;
+    const CacheEntry *entry = nullptr;
+    if (listing && snapshots.active()) {
+        entry = snapshots.find(path, name);
+    } else if ((read = CacheFile(path).read(name, attempts))) {
+        entry = &*read;
+    }
     Stored stored;
-    if (!entry || !fromString(stored.value, entry->value)) {
+    if (entry == nullptr || !fromString(stored.value, entry->value)) {
         return std::nullopt;
     }
     stored.age = OvraBase::saturatingDifference(systemMilliseconds(), entry->end);
@@ -180,12 +222,12 @@ Json::Value Cache::Read() const {
 }
 
 Json::Value Cache::GetCachedData() const {
-    const std::optional<Stored> stored = load(path_, name_, count_);
+    const std::optional<Stored> stored = load(path_, name_, count_, true);
     return stored ? stored->value : Json::Value();
 }
 
 double Cache::GetCachedAge() const {
-    const std::optional<Stored> stored = load(path_, name_, count_);
+    const std::optional<Stored> stored = load(path_, name_, count_, true);
     return stored && stored->age >= 0 ? static_cast<double>(stored->age) / kSecond : -1;
 }
 
@@ -242,6 +284,14 @@ bool Cache::UpdateWithFinding(const Json::Value &value, std::int64_t start) cons
 
 bool Cache::Remove() {
     return CacheFile(path_).remove(name_);
+}
+
+CacheSnapshotScope::CacheSnapshotScope() {
+    snapshots.enter();
+}
+
+CacheSnapshotScope::~CacheSnapshotScope() {
+    snapshots.leave();
 }
 
 CacheWaitScope::CacheWaitScope() {

@@ -19,6 +19,7 @@
 #include <cerrno>
 #include <chrono>
 #include <filesystem>
+#include <iterator>
 
 namespace OvraDRCore {
 
@@ -309,6 +310,25 @@ std::optional<CacheEntry> CacheFile::read(std::string_view name, int attempts) c
         }
     }
     return std::nullopt;
+}
+
+std::vector<CacheEntry> CacheFile::readAll() const {
+    std::vector<CacheEntry> all;
+    if (!checkCacheFolder(OvraBase::folderOf(path_), false)) {
+        return all;
+    }
+    const UniqueFd fd = openCacheFile(path_, O_RDONLY);
+    struct stat status {};
+    const std::uint32_t buckets = fd && fstat(fd.get(), &status) == 0 ? bucketsOf(status) : 0;
+    Pair pair;
+    for (std::uint32_t index = 0; index < buckets && readPair(fd.get(), index, pair); ++index) {
+        const Choice choice = choose(pair, buckets, index);
+        if (choice.valid) {
+            std::vector<CacheEntry> entries = BucketImage::entries(chosenCopy(pair, choice));
+            std::move(entries.begin(), entries.end(), std::back_inserter(all));
+        }
+    }
+    return all;
 }
 
 bool CacheFile::write(const CacheEntry &entry, std::int64_t now, Younger younger) const {

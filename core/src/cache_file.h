@@ -7,6 +7,7 @@
 #include <optional>
 #include <string>
 #include <string_view>
+#include <vector>
 
 namespace OvraDRCore {
 
@@ -17,6 +18,9 @@ public:
 
     /// \param attempts  reads that may collide with a write before one waits for the lock
     std::optional<CacheEntry> read(std::string_view name, int attempts) const;
+    /// Every entry, in no order, without a lock; those of a bucket that is being written may be
+    /// missing.
+    std::vector<CacheEntry> readAll() const;
     /// What happens to a stored value that was taken later than the one to write; one with a stamp
     /// in the future never stays.
     enum class Younger { kReplace, kKeep };

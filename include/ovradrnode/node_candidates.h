@@ -6,6 +6,7 @@
 
 #include <json/value.h>
 
+#include <map>
 #include <string>
 #include <vector>
 
@@ -48,5 +49,9 @@ struct OVRADRNODE_EXPORT NodeCandidate {
 /// first lasting one that may. A sender refreshes stale entries first, which may change the order.
 /// \return empty for an unknown node and for the local one.
 OVRADRNODE_EXPORT std::vector<NodeCandidate> listNodeCandidates(const std::string &nodeId);
+
+/// The same of every node that a credential reaches, by its id, at the cost of two statements and
+/// of one reading of each cache file.
+OVRADRNODE_EXPORT std::map<std::string, std::vector<NodeCandidate>> listAllNodeCandidates();
 
 } // namespace OvraDRNode

@@ -91,6 +91,11 @@ public:
     /// Appends the attributes that the application stores about the node.
     [[nodiscard]] static bool ListAttr(const std::string &nodeId, const std::string &app,
                                        std::vector<DRNodeAttr> &attrs);
+    /// Appends the attributes that the application stores, of all nodes.
+    [[nodiscard]] static bool ListAppAttr(const std::string &app, std::vector<DRNodeAttr> &attrs);
+    /// Removes one attribute. True also if there is none.
+    [[nodiscard]] static bool DeleteAttr(const std::string &nodeId, const std::string &app,
+                                         const std::string &attr);
     /// Adds or changes one attribute. The existence check and the write are two statements.
     [[nodiscard]] static bool SetAttr(const DRNodeAttr &attr);
     [[nodiscard]] static bool SetAttr(const std::string &nodeId, const std::string &app,

@@ -123,6 +123,47 @@ bool DRNodeDB::ListAttr(const std::string &nodeId, const std::string &app,
     return true;
 }
 
+bool DRNodeDB::ListAppAttr(const std::string &app, std::vector<DRNodeAttr> &attrs) {
+    if (app.empty()) {
+        OVRA_ERR("Invalid app[%s]", app.c_str());
+        return false;
+    }
+    SelectCommand command;
+    command.SetTable(NodeAttrSqliteTable());
+    command.AddField(Word::kNodeId);
+    command.AddField(Word::kAttr);
+    command.AddField(Word::kValue);
+    command.SetCondition(SqliteEqual(Word::kApp, app));
+    std::vector<SqliteValueList> rows;
+    if (!NodeDBHandler::GetHandler().SelectRecords(command, rows)) {
+        OVRA_ERR("Failed to list attrs of app[%s]", app.c_str());
+        return false;
+    }
+    for (const SqliteValueList &row : rows) {
+        DRNodeAttr found("", app, "", "");
+        (void)row.GetValue(Word::kNodeId, found.nodeId);
+        (void)row.GetValue(Word::kAttr, found.attr);
+        (void)row.GetValue(Word::kValue, found.value);
+        attrs.push_back(found);
+    }
+    return true;
+}
+
+bool DRNodeDB::DeleteAttr(const std::string &nodeId, const std::string &app,
+                          const std::string &attr) {
+    if (!DRNodeAttr(nodeId, app, attr, "").isValid()) {
+        OVRA_ERR("Invalid nodeId[%s]/app[%s]/attr[%s]", nodeId.c_str(), app.c_str(), attr.c_str());
+        return false;
+    }
+    if (!NodeDBHandler::GetHandler().DeleteRecord(attrFilter(nodeId, app, attr),
+                                                  NodeAttrSqliteTable())) {
+        OVRA_ERR("Failed to delete attr[%s]/app[%s]/nodeId[%s]", attr.c_str(), app.c_str(),
+                 nodeId.c_str());
+        return false;
+    }
+    return true;
+}
+
 bool DRNodeDB::SetAttr(const DRNodeAttr &attr) {
     if (!attr.isValid()) {
         OVRA_ERR("Failed to insert invalid attr[%s]", OvraDRCore::toString(attr.toJson()).c_str());

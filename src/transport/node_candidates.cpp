@@ -13,6 +13,8 @@ namespace OvraDRNode {
 
 namespace {
 
+constexpr DRNodeDB::CredType kTables[] = {DRNodeDB::CRED_TYPE_NODE, DRNodeDB::CRED_TYPE_TEMP};
+
 CachedVerdict verdictOf(const OvraDRCore::Cache &cache) {
     const Json::Value stored = cache.GetCachedData();
     CachedVerdict verdict;
@@ -48,19 +50,13 @@ const char *word(NodeCandidate::Outlook outlook) {
     return "later";
 }
 
-void addCandidates(const std::string &nodeId, DRNodeDB::CredType type,
-                   const std::string &remembered, std::vector<NodeCandidate> &candidates) {
-    std::vector<DRNode> nodes;
-    DRNodeDB::ListCred(nodeId, nodes, type);
-    for (const DRNode &node : nodes) {
-        NodeCandidate candidate;
-        candidate.node = node;
-        candidate.temporary = type == DRNodeDB::CRED_TYPE_TEMP;
-        candidate.remembered = !remembered.empty() && node.credId == remembered;
-        candidate.reachable = verdictOf(ConnCache(node.conn));
-        candidate.privilege = verdictOf(CredPermissionCache(node.credId));
-        candidates.push_back(candidate);
-    }
+NodeCandidate candidateOf(const DRNode &node, DRNodeDB::CredType type) {
+    NodeCandidate candidate;
+    candidate.node = node;
+    candidate.temporary = type == DRNodeDB::CRED_TYPE_TEMP;
+    candidate.reachable = verdictOf(ConnCache(node.conn));
+    candidate.privilege = verdictOf(CredPermissionCache(node.credId));
+    return candidate;
 }
 
 bool isDenied(const CachedVerdict &verdict) {
@@ -97,6 +93,31 @@ std::string firstCredId(const NodeValidCredCache &cache,
     return first == candidates.end() ? std::string() : first->node.credId;
 }
 
+/// Says of the credentials of a node, in the order of the tables, how a request would use them, and
+/// puts the one first that it begins with.
+void judge(const std::string &nodeId, std::vector<NodeCandidate> &candidates) {
+    const NodeValidCredCache cache(nodeId);
+    const std::string remembered = cache.getStoredCredId();
+    for (NodeCandidate &candidate : candidates) {
+        candidate.remembered = !remembered.empty() && candidate.node.credId == remembered;
+    }
+    const std::string first = firstCredId(cache, candidates);
+    std::stable_partition(
+        candidates.begin(), candidates.end(),
+        [&first](const NodeCandidate &candidate) { return candidate.node.credId == first; });
+    bool nextFound = false;
+    for (NodeCandidate &candidate : candidates) {
+        if (!candidate.node.isValid()) {
+            candidate.outlook = NodeCandidate::Outlook::kInvalid;
+        } else if (isDenied(candidate.reachable)) {
+            candidate.outlook = NodeCandidate::Outlook::kUnreachable;
+        } else if (!nextFound) {
+            candidate.outlook = NodeCandidate::Outlook::kNext;
+            nextFound = true;
+        }
+    }
+}
+
 } // namespace
 
 Json::Value NodeCandidate::toJson() const {
@@ -116,26 +137,33 @@ std::vector<NodeCandidate> listNodeCandidates(const std::string &nodeId) {
     if (nodeId.empty() || DRNode::isLocalNodeId(nodeId)) {
         return candidates;
     }
-    const NodeValidCredCache cache(nodeId);
-    const std::string remembered = cache.getStoredCredId();
-    addCandidates(nodeId, DRNodeDB::CRED_TYPE_NODE, remembered, candidates);
-    addCandidates(nodeId, DRNodeDB::CRED_TYPE_TEMP, remembered, candidates);
-    const std::string first = firstCredId(cache, candidates);
-    std::stable_partition(
-        candidates.begin(), candidates.end(),
-        [&first](const NodeCandidate &candidate) { return candidate.node.credId == first; });
-    bool nextFound = false;
-    for (NodeCandidate &candidate : candidates) {
-        if (!candidate.node.isValid()) {
-            candidate.outlook = NodeCandidate::Outlook::kInvalid;
-        } else if (isDenied(candidate.reachable)) {
-            candidate.outlook = NodeCandidate::Outlook::kUnreachable;
-        } else if (!nextFound) {
-            candidate.outlook = NodeCandidate::Outlook::kNext;
-            nextFound = true;
+    for (const DRNodeDB::CredType type : kTables) {
+        std::vector<DRNode> nodes;
+        DRNodeDB::ListCred(nodeId, nodes, type);
+        for (const DRNode &node : nodes) {
+            candidates.push_back(candidateOf(node, type));
         }
     }
+    judge(nodeId, candidates);
     return candidates;
+}
+
+std::map<std::string, std::vector<NodeCandidate>> listAllNodeCandidates() {
+    const OvraDRCore::CacheSnapshotScope snapshot;
+    std::map<std::string, std::vector<NodeCandidate>> all;
+    for (const DRNodeDB::CredType type : kTables) {
+        std::vector<DRNode> nodes;
+        DRNodeDB::List(nodes, type);
+        for (const DRNode &node : nodes) {
+            if (!node.nodeId.empty() && !DRNode::isLocalNodeId(node.nodeId)) {
+                all[node.nodeId].push_back(candidateOf(node, type));
+            }
+        }
+    }
+    for (auto &[nodeId, candidates] : all) {
+        judge(nodeId, candidates);
+    }
+    return all;
 }
 
 } // namespace OvraDRNode

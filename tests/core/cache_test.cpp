@@ -149,6 +149,25 @@ TEST_F(CacheTest, AStoredValueIsReadWhileItIsFreshAndUsable) {
     EXPECT_EQ(TestCache("a").GetCachedAge(), 2) << "as old as its end";
 }
 
+TEST_F(CacheTest, AListingSeesTheFileAsItWasAndEveryEntryOfIt) {
+    constexpr int kMany = 500; // so that the file grows
+    for (int i = 0; i < kMany; ++i) {
+        ASSERT_TRUE(TestCache(std::to_string(i)).UpdateWithData(std::to_string(i)));
+    }
+    {
+        const CacheSnapshotScope scope;
+        for (int i = 0; i < kMany; ++i) {
+            EXPECT_EQ(TestCache(std::to_string(i)).GetCachedData(), std::to_string(i));
+        }
+        EXPECT_EQ(text(TestCache("none").GetCachedData()), "null");
+        const CacheSnapshotScope inner;
+        ASSERT_TRUE(TestCache("0").UpdateWithData("new"));
+        EXPECT_EQ(TestCache("0").GetCachedData(), "0");
+        EXPECT_EQ(TestCache("0").Read(), "new") << "what decides is read as ever";
+    }
+    EXPECT_EQ(TestCache("0").GetCachedData(), "new");
+}
+
 TEST_F(CacheTest, ARefreshMayReadAndWriteItsOwnEntry) {
     for (const bool success : {true, false}) {
         TestCache cache("a");

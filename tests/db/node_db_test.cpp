@@ -161,6 +161,16 @@ TEST_F(NodeDb, AttributesAreKeptPerNodeAndApplication) {
     EXPECT_FALSE(DRNodeDB::SetAttr("n1", "app", "", "v"));
     EXPECT_EQ(log.count("Failed to insert invalid attr["), 1);
     EXPECT_EQ(querySql("SELECT count(*) FROM node_attr"), "3\n");
+    EXPECT_TRUE(DRNodeDB::SetAttr("n2", "app", "k", "far"));
+    attrs.clear();
+    EXPECT_TRUE(DRNodeDB::ListAppAttr("app", attrs));
+    ASSERT_EQ(attrs.size(), 3U);
+    EXPECT_EQ(attrs[2].nodeId + attrs[2].app + attrs[2].attr + attrs[2].value, "n2appkfar");
+    EXPECT_FALSE(DRNodeDB::ListAppAttr("", attrs) || DRNodeDB::DeleteAttr("n1", "", "k"));
+    EXPECT_TRUE(DRNodeDB::DeleteAttr("n1", "app", "k"));
+    EXPECT_TRUE(DRNodeDB::DeleteAttr("n1", "app", "k")) << "there is none any more";
+    EXPECT_EQ(querySql("SELECT node_id || app || attr FROM node_attr ORDER BY 1"),
+              "n1appempty\nn1otherk\nn2appk\n");
 }
 
 TEST_F(NodeDb, TwoWritersOfANewAttributeBothSucceedAndOneValueStays) {

@@ -73,6 +73,7 @@ TEST_F(NodeCandidates, AreListedAsTheSenderThenTriesThem) {
         remote.forgetCalls();
         other.forgetCalls();
         EXPECT_EQ(textOf(listNodeCandidates("n1")), each.listed) << each.what;
+        EXPECT_EQ(textOf(listAllNodeCandidates().at("n1")), each.listed) << each.what;
         EXPECT_EQ(remote.calls() + other.calls(), "") << each.what << ": nothing is sent";
         EXPECT_TRUE(NodeSender("n1").process(info).isSuccess());
         EXPECT_EQ(remote.count(each.used) + other.count(each.used), 1) << each.what;

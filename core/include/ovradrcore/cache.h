@@ -93,6 +93,18 @@ private:
     int count_;
 };
 
+/// A listing of this thread: while a scope exists, GetCachedData() and GetCachedAge() look into
+/// each cache file as it was when the first of them did, read at once. So what they say of ten
+/// thousand entries costs a reading of the file, not ten thousand. Nothing else changes, and
+/// Read() refreshes what is stale as ever. A scope within a scope changes nothing.
+class OVRADRCORE_EXPORT CacheSnapshotScope {
+public:
+    CacheSnapshotScope();
+    ~CacheSnapshotScope();
+    CacheSnapshotScope(const CacheSnapshotScope &) = delete;
+    CacheSnapshotScope &operator=(const CacheSnapshotScope &) = delete;
+};
+
 /// One request of this thread, which may read several cache entries: while a scope exists, the
 /// thread waits Cache::kLongestRefresh in sum at most for refreshes by others, then refreshes
 /// itself whatever is being refreshed. A scope within a scope changes nothing.

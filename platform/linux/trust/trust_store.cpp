@@ -4,6 +4,7 @@
 #include <ovrabase/connect.h>
 #include <ovrabase/encoding.h>
 #include <ovrabase/file.h>
+#include <ovrabase/number.h>
 #include <ovradrcore/log.h>
 
 #include <sys/stat.h>
@@ -11,6 +12,10 @@
 #include <algorithm>
 #include <atomic>
 #include <cerrno>
+#include <ctime>
+#include <string_view>
+#include <unordered_map>
+#include <unordered_set>
 #include <utility>
 
 namespace OvraPlatform {
@@ -18,6 +23,7 @@ namespace OvraPlatform {
 namespace {
 
 constexpr std::string_view kHeading = "# ovradr-trust 1";
+constexpr std::string_view kSince = "#since ";
 /// What the heading of any version begins with.
 constexpr std::string_view kAnyHeading = "# ovradr-trust ";
 /// Stands in a file that was begun anew after one was lost. A program that does not know it takes
@@ -51,6 +57,14 @@ TrustVerdict verdictOf(const OvraBase::Error &error) {
                                               : TrustVerdict::kUnavailable;
 }
 
+/// When the line of an endpoint was written is in a comment of its own, "#since SECONDS" and this
+/// tag: an earlier version takes a third word for damage. The tag names the key, so that a line
+/// that a person changes by hand leaves no wrong time behind.
+std::string sinceTag(const TrustStore::Entry &entry) {
+    constexpr std::size_t kTold = 15; // of a fingerprint "SHA256:" and 48 bits
+    return " " + entry.endpoint + " " + entry.value.substr(0, kTold);
+}
+
 } // namespace
 
 /// A line as it is in the file.
@@ -75,6 +89,10 @@ struct TrustStore::Line {
         return isEndpoint(entry.endpoint) && isValueFor(entry.endpoint, entry.value);
     }
     bool isFor(const std::string &endpoint) const { return says() && entry.endpoint == endpoint; }
+    bool tellsSince() const { return text.starts_with(kSince); }
+    bool tellsSinceOf(const std::string &endpoint) const {
+        return tellsSince() && text.find(" " + endpoint + " ") != std::string::npos;
+    }
 };
 
 struct TrustStore::Content {
@@ -129,7 +147,17 @@ struct TrustStore::Content {
         }
         return value == fingerprint ? TrustVerdict::kTrusted : TrustVerdict::kDifferent;
     }
+    void remove(const std::string &endpoint) {
+        std::erase_if(lines, [&endpoint](const Line &line) {
+            return line.isFor(endpoint) || line.tellsSinceOf(endpoint);
+        });
+    }
     void put(const Entry &entry) {
+        std::erase_if(lines, [&](const Line &line) { return line.tellsSinceOf(entry.endpoint); });
+        if (entry.value != kForgotten) {
+            lines.emplace_back(std::string(kSince) + std::to_string(std::time(nullptr)) +
+                               sinceTag(entry));
+        }
         if (const auto line = find(entry.endpoint); line != lines.end()) {
             *line = Line(entry);
         } else {
@@ -191,9 +219,16 @@ tl::expected<TrustStore::Change, TrustVerdict> TrustStore::beginChange() const {
 
 tl::expected<void, TrustVerdict> TrustStore::write(const OvraBase::FileUpdate &file,
                                                    const Content &content) const {
-    std::string text;
-    for (const Line &line : content.lines) {
-        text += line.text + '\n';
+    const auto textOf = [&content](bool withSince) {
+        std::string all;
+        for (const Line &line : content.lines) {
+            all += withSince || !line.tellsSince() ? line.text + '\n' : "";
+        }
+        return all;
+    };
+    std::string text = textOf(true);
+    if (text.size() > OvraBase::kMaxTextFile) {
+        text = textOf(false); // room for keys
     }
     const OvraBase::Expected<void> written = text.size() > OvraBase::kMaxTextFile
                                                  ? OvraBase::systemError(EFBIG)
@@ -298,22 +333,21 @@ TrustVerdict TrustStore::trust(const std::string &endpoint, const std::string &v
 
 bool TrustStore::undoTrust(const std::string &endpoint, const std::string &value,
                            const std::optional<Entry> &before) {
-    const auto file = OvraBase::FileUpdate::begin(path_);
-    if (!file) {
-        logUnchangeable(path_, file.error().text);
+    auto change = beginChange();
+    if (!change) {
         return false;
     }
-    auto content = read();
-    const auto line = content ? content->find(endpoint) : std::vector<Line>::iterator();
-    if (!content || line == content->lines.end() || line->entry.value != value) {
-        return content.has_value();
+    Content &content = change->content;
+    const auto line = content.find(endpoint);
+    if (line == content.lines.end() || line->entry.value != value) {
+        return true;
     }
     if (before) {
-        content->put(*before);
+        content.put(*before);
     } else {
-        content->lines.erase(line);
+        content.remove(endpoint);
     }
-    if (!write(*file, *content)) {
+    if (!write(change->file, content)) {
         return false;
     }
     OVRA_NOTICE("The key [%s] of [%s] is not trusted after all", value.c_str(), endpoint.c_str());
@@ -357,11 +391,22 @@ std::optional<std::vector<TrustStore::Entry>> TrustStore::list() const {
     if (!content) {
         return std::nullopt;
     }
-    std::vector<Entry> entries;
+    std::unordered_map<std::string, std::int64_t> since; // by tag
     for (const Line &line : content->lines) {
-        const auto same = [&line](const Entry &entry) { return line.isFor(entry.endpoint); };
-        if (line.says() && line.isSound() && std::none_of(entries.begin(), entries.end(), same)) {
+        const std::size_t tag = line.text.find(' ', kSince.size());
+        if (line.tellsSince() && tag != std::string::npos) {
+            const std::string_view seconds(line.text.data() + kSince.size(), tag - kSince.size());
+            since[line.text.substr(tag)] =
+                OvraBase::parseNumber<std::int64_t>(seconds, 0).value_or(0);
+        }
+    }
+    std::vector<Entry> entries;
+    std::unordered_set<std::string> told;
+    for (const Line &line : content->lines) {
+        if (line.says() && line.isSound() && told.insert(line.entry.endpoint).second) {
             entries.push_back(line.entry);
+            const auto noted = since.find(sinceTag(line.entry));
+            entries.back().since = noted == since.end() ? 0 : noted->second;
         }
     }
     return entries;

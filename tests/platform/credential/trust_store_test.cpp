@@ -7,6 +7,8 @@
 #include <gtest/gtest.h>
 #include <sys/resource.h>
 
+#include <ctime>
+
 namespace {
 
 using namespace OvraPlatform;
@@ -45,8 +47,15 @@ TEST_F(TrustScene, TrustsTheKeyThatAnEndpointHadFirstUntilAPersonForgets) {
     }
     EXPECT_EQ(store().trust("https://b:1", key, false), V::kTrusted);
     EXPECT_EQ(store().trust("https://b:1", fingerprint("b"), true), V::kTrusted);
-    EXPECT_EQ(OvraTest::readFile(file()),
-              "# ovradr-trust 1\nhttps://a:1 forgotten\nhttps://b:1 " + fingerprint("b") + "\n");
+    const std::string since = std::to_string(store().list()->at(1).since);
+    EXPECT_LT(std::time(nullptr) - std::stoll(since), 60) << "since then it is trusted";
+    const std::string value = fingerprint("b");
+    const std::string lines = "# ovradr-trust 1\nhttps://a:1 forgotten\nhttps://b:1 " + value +
+                              "\n#since " + since + " https://b:1 " + value.substr(0, 15) + "\n";
+    EXPECT_EQ(OvraTest::readFile(file()), lines);
+    // Another key, written in by hand, has not been trusted since then.
+    OvraTest::writeFile(file(), std::string(lines).replace(lines.find(value), value.size(), key));
+    EXPECT_EQ(store().list()->at(1).since, 0);
 }
 
 TEST_F(TrustScene, TakesNobodyForUnknownWithoutASoundFile) {

@@ -46,8 +46,9 @@ public:
     static constexpr char kForgotten[] = "forgotten";
 
     struct Entry {
-        std::string endpoint; ///< "https://host:5001" in lower case, or "flk:alias"
-        std::string value;    ///< "SHA256:...", kSystem or kForgotten
+        std::string endpoint;   ///< "https://host:5001" in lower case, or "flk:alias"
+        std::string value;      ///< "SHA256:...", kSystem or kForgotten
+        std::int64_t since = 0; ///< when that was noted, in seconds of the system clock; 0: unknown
     };
     /// Changes when the file does.
     using Stamp = std::tuple<dev_t, ino_t, std::int64_t, std::int64_t, off_t>;
