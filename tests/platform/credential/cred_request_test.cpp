@@ -317,6 +317,7 @@ TEST_F(CredRequestScene, RefusesAnEndpointWhoseKeyHasChangedAlsoOnAKeptConnectio
 TEST_F(CredRequestScene, AsksForTheKeyOfTheAliasWhateverTheRelaySays) {
     MisbehavingServer relay({.tls = true});
     MisbehavingServer liar({.tls = true});
+    EXPECT_TRUE(TrustStore().create());
     trust(relay);
     std::filesystem::create_directories(kConfigDir);
     ASSERT_TRUE(writeFarlinkSettings({"127.0.0.1", relay.port(), ""}));
