@@ -1,7 +1,8 @@
 // SPDX-License-Identifier: Apache-2.0
 // Two whole appliances on the loopback interface: this process's, and a far one with a file system
 // view of its own. Their programs are killed and stopped in the middle of what they do.
-#include "faults/faults.h"
+#include "faults/own_view.h"
+#include "faults/victim.h"
 #include "program.h"
 #include "shared/pending_releases.h"
 #include "support/daemon_program.h"
@@ -10,9 +11,6 @@
 #include <ovraplatform/session_store.h>
 
 #include <gtest/gtest.h>
-#include <sched.h>
-#include <sys/mman.h>
-#include <sys/mount.h>
 
 #include <map>
 #include <memory>
@@ -29,11 +27,13 @@ using OvraPlatform::SessionRecord;
 using OvraPlatform::SessionStore;
 using OvraTest::DaemonProgram;
 using OvraTest::Fault;
-using OvraTest::FaultControl;
+using OvraTest::Victim;
 
-constexpr const char *kFar = "/tmp/far";
-const std::pair<std::string, const char *> kOwn[] = {
-    {"/ovra", "/usr/ovra"}, {"/caches", "/tmp/.ovradrcache"}, {"/lock", "/run/lock"}};
+/// The far appliance's files, and where it sees them.
+const std::vector<std::pair<std::string, std::string>> kFarView = {
+    {"/tmp/far/ovra", "/usr/ovra"},
+    {"/tmp/far/caches", "/tmp/.ovradrcache"},
+    {"/tmp/far/lock", "/run/lock"}};
 constexpr const char *kPassword = "/tmp/password";
 const std::string kUrl = "https://127.0.0.2:5001";
 
@@ -41,50 +41,6 @@ int scale() {
     const char *const text = std::getenv("OVRA_TORTURE");
     return text != nullptr ? std::max(1, std::atoi(text)) : 1;
 }
-
-/// From here on this process sees the far appliance's files.
-bool enterFar() {
-    bool entered =
-        unshare(CLONE_NEWNS) == 0 && mount("none", "/", nullptr, MS_REC | MS_PRIVATE, nullptr) == 0;
-    for (const auto &[from, to] : kOwn) {
-        entered = entered && mount((kFar + from).c_str(), to, nullptr, MS_BIND, nullptr) == 0;
-    }
-    return entered;
-}
-
-/// Who is to meet a fault, in a file that its program maps, too.
-class Victim {
-public:
-    explicit Victim(const std::string &name)
-        : path_("/tmp/faults-" + name) {
-        writeFile(path_, std::string(sizeof(FaultControl), '\0'));
-        const int fd = open(path_.c_str(), O_RDWR | O_CLOEXEC);
-        control_ = static_cast<FaultControl *>(
-            mmap(nullptr, sizeof(FaultControl), PROT_READ | PROT_WRITE, MAP_SHARED, fd, 0));
-        close(fd);
-    }
-    void arm(Fault fault, int at, int error = 0) const {
-        control_->plan = {fault, error, {}};
-        control_->left = at;
-        control_->met = false;
-        control_->armed = true;
-    }
-    /// \return how many calls there were since
-    int disarm(int at) const {
-        control_->armed = false;
-        return at - control_->left;
-    }
-    bool met() const { return control_->met; }
-    /// For the process that is to become its program.
-    void enter() const {
-        setenv(OvraTest::kControlVariable, path_.c_str(), 1);
-        setenv("LD_PRELOAD", OVRA_FAULTS_LIBRARY, 1);
-    }
-
-private:
-    std::string path_;
-    FaultControl *control_;
-};
 
 /// What one appliance holds of the other, and grants it.
 struct Holdings {
@@ -96,11 +52,11 @@ struct Holdings {
 class TwoAppliances : public testing::Test {
 protected:
     void SetUp() override {
-        if (OvraTest::OtherProcess([] { return unshare(CLONE_NEWNS); }).wait() != 0) {
+        if (OvraTest::OtherProcess([] { return OvraTest::enterView({}) ? 0 : 1; }).wait() != 0) {
             GTEST_SKIP() << "there are no mount namespaces here";
         }
-        for (const auto &[from, to] : kOwn) {
-            fs::create_directories(kFar + from);
+        for (const auto &[from, to] : kFarView) {
+            fs::create_directories(from);
             fs::create_directories(to);
         }
         fs::permissions("/tmp/far/caches", fs::perms::owner_all);
@@ -122,7 +78,7 @@ protected:
     static std::unique_ptr<DaemonProgram> start(const char *program, const Arguments &arguments,
                                                 bool far, const Victim *victim = nullptr) {
         return std::make_unique<DaemonProgram>(Arguments{program} + arguments, [=] {
-            if (far && !enterFar()) {
+            if (far && !OvraTest::enterView(kFarView)) {
                 _exit(126);
             }
             if (victim != nullptr) {
@@ -248,8 +204,8 @@ protected:
 
     std::string key_;
     std::string said_;
-    const Victim caller_{"caller"};
-    const Victim daemonVictims_[2] = {Victim("near"), Victim("far")};
+    const Victim caller_{"caller", OVRA_FAULTS_LIBRARY};
+    const Victim daemonVictims_[2] = {{"near", OVRA_FAULTS_LIBRARY}, {"far", OVRA_FAULTS_LIBRARY}};
     std::map<bool, std::unique_ptr<DaemonProgram>> daemons_;
 };
 
@@ -281,8 +237,8 @@ TEST_F(TwoAppliances, KilledInTheMiddleOfAFlowTheyLoseNoSession) {
             1 + static_cast<int>(random() % (all == 0 ? 600U : static_cast<unsigned>(all)));
         victim.arm(Fault::kKill, at);
         finish(flows[flow], false, far ? nullptr : &caller_);
-        const int made = victim.disarm(at);
-        all = victim.met() ? all : made;
+        victim.disarm();
+        all = victim.met() ? all : at - victim.left();
         SCOPED_TRACE(flows[flow][1] + ", call " + std::to_string(at) + " of " +
                      std::to_string(all) + (far ? " of the far daemon" : " of the caller"));
         kills += victim.met() ? 1 : 0;
@@ -367,7 +323,7 @@ TEST_F(TwoAppliances, NobodyWaitsLongForOneWhoIsStopped) {
                 most = std::max(most, took.count());
             }
         }
-        victim.disarm(0);
+        victim.disarm();
         kill(role == 0 ? stopped->pid() : daemons_[role == 1]->pid(), SIGCONT);
         int code = -1;
         for (int i = 0; i < 4 && code == -1; ++i) {
@@ -407,7 +363,7 @@ TEST_F(TwoAppliances, AClockThatJumpsAYearHarmsNothing) {
                          caller),
                   0)
             << said_;
-        victim.disarm(0);
+        victim.disarm();
         settle();
     }
 }
