@@ -70,7 +70,7 @@ Expected<void> checkPathToRun(const std::string &path) {
         if (lstat(done.c_str(), &status) != 0) {
             return errno == ENOENT || errno == ENOTDIR ? Expected<void>() : lastSystemError();
         }
-        if (const auto judged = judge(done, status); !judged) {
+        if (auto judged = judge(done, status); !judged) {
             return judged;
         }
         if (S_ISLNK(status.st_mode)) {
@@ -78,7 +78,7 @@ Expected<void> checkPathToRun(const std::string &path) {
                 return Unexpected({path + " has too many links", ELOOP});
             }
             const std::string target = linkTarget(done);
-            rest = target + "/" + rest;
+            rest.insert(0, target + "/");
             done = target.starts_with('/') ? "/" : folderOf(done);
         }
         rest.erase(0, rest.find_first_not_of('/'));

@@ -4,6 +4,7 @@
 #include "alias_registry.h"
 #include "apps/files/scene.h"
 #include "credential/device_token.h"
+#include "faults/damage.h"
 #include "http/endpoint.h"
 #include "login_throttle.h"
 #include "service/tls_identity.h"
@@ -25,7 +26,6 @@
 #include <openssl/x509.h>
 #include <sys/mman.h>
 
-#include <algorithm>
 #include <cstring>
 #include <random>
 
@@ -273,47 +273,6 @@ const Kind kKinds[] = {
     {"deviceKey", kState + "device.key", useDeviceKey, true},
 };
 
-/// What a disk, an editor or a person may do to a file, once to three times.
-std::string damage(std::string text, std::mt19937 &random) {
-    const auto below = [&random](std::size_t bound) { return bound == 0 ? 0 : random() % bound; };
-    for (std::size_t times = 1 + below(3); times > 0; --times) {
-        std::size_t at = below(text.size());
-        while (at < text.size() && text[at] == '\0' && below(64) != 0) {
-            at = below(text.size()); // most bytes of a database are of no use
-        }
-        const std::size_t some = std::min(text.size() - at, std::size_t{1} << below(13));
-        constexpr std::string_view kLiked("\0\xff\n\"'= #-/019azAZ\x80\x7f", 21);
-        switch (below(9)) {
-        case 0:
-        case 1:
-            text.empty() ? void() : void(text[at] = static_cast<char>(text[at] ^ (1 << below(8))));
-            break;
-        case 2:
-            text.empty() ? void() : void(text[at] = kLiked[below(kLiked.size())]);
-            break;
-        case 3:
-            text.insert(at, 1 + below(3), kLiked[below(kLiked.size())]);
-            break;
-        case 4:
-            text.erase(at, below(2) == 0 ? 1 : some);
-            break;
-        case 5:
-            text.resize(at);
-            break;
-        case 6:
-            text.replace(at, some, some, '\0');
-            break;
-        case 7:
-            text.insert(at, text.substr(below(text.size()), some));
-            break;
-        default:
-            std::generate_n(text.begin() + static_cast<std::ptrdiff_t>(at), some,
-                            [&random] { return static_cast<char>(random()); });
-        }
-    }
-    return text;
-}
-
 /// The process's last word.
 char *const word = static_cast<char *>(
     mmap(nullptr, 4096, PROT_READ | PROT_WRITE, MAP_SHARED | MAP_ANONYMOUS, -1, 0));
@@ -361,7 +320,8 @@ TEST_P(DamagedFile, IsRefusedWithAReasonOrHealed) {
     const int rounds = scale != nullptr ? 625 * std::max(1, std::atoi(scale)) / 100 : 12;
     std::mt19937 random(20);
     for (int round = 0; round < rounds && !HasFailure(); ++round) {
-        const std::string text = round == 0 ? whole_.substr(0, 1) : damage(whole_, random);
+        const std::string text =
+            round == 0 ? whole_.substr(0, 1) : OvraTest::damage(whole_, random);
         put(text);
         std::memset(word, 0, 4096);
         OvraTest::OtherProcess process([&] {

@@ -3,12 +3,17 @@
 
 #include <dlfcn.h>
 #include <fcntl.h>
+#include <sys/mman.h>
+#include <sys/socket.h>
 #include <sys/stat.h>
+#include <sys/time.h>
 #include <sys/uio.h>
 #include <unistd.h>
 
 #include <cerrno>
 #include <csignal>
+#include <cstdlib>
+#include <ctime>
 #include <filesystem>
 #include <fstream>
 #include <iterator>
@@ -22,18 +27,19 @@ namespace fs = std::filesystem;
 using OvraTest::Fault;
 using OvraTest::Lie;
 
-enum class Call { kLook, kOpen, kChange, kWrite, kMemory };
+enum class Call { kLook, kOpen, kChange, kWrite, kNetwork, kMemory };
 enum class Verdict { kPass, kFail, kHalf, kLose };
 
 constexpr const char *kDisk = "/usr/ovra";
 
-bool armed = false;
-bool met = false;
-int left = 0; // until the call that meets the fault
-OvraTest::FaultPlan plan;
+OvraTest::FaultControl own;
+OvraTest::FaultControl *control = &own;
+OvraTest::FaultPlan &plan() {
+    return control->plan;
+}
 
 bool isPower() {
-    return plan.fault == Fault::kPowerNewNames || plan.fault == Fault::kPowerOldNames;
+    return plan().fault == Fault::kPowerNewNames || plan().fault == Fault::kPowerOldNames;
 }
 
 /// What is on the disk. Nothing that is opened to look is closed: that would drop the locks of
@@ -88,7 +94,7 @@ void losePower() {
     for (const auto &[path, inode] : now) {
         unlink(path.c_str());
     }
-    for (const auto &[path, inode] : plan.fault == Fault::kPowerNewNames ? now : disk->names) {
+    for (const auto &[path, inode] : plan().fault == Fault::kPowerNewNames ? now : disk->names) {
         std::ofstream(path, std::ios::binary) << disk->contents[inode];
         chmod(path.c_str(), 0600);
     }
@@ -96,7 +102,7 @@ void losePower() {
 
 bool concerns(Call call) {
     const bool changes = call == Call::kChange || call == Call::kWrite;
-    switch (plan.fault) {
+    switch (plan().fault) {
     case Fault::kNoMemory:
     case Fault::kNoMemoryAtAll:
         return call == Call::kMemory;
@@ -105,33 +111,41 @@ bool concerns(Call call) {
     case Fault::kLost:
         return changes;
     case Fault::kError:
-        return call != Call::kMemory &&
-               (plan.error == EIO || call == Call::kOpen || (plan.error == ENOSPC && changes));
+        return call != Call::kMemory && call != Call::kNetwork &&
+               (plan().error == EIO || call == Call::kOpen || (plan().error == ENOSPC && changes));
     default:
         return call != Call::kMemory;
     }
 }
 
 Verdict judge(Call call) {
-    if (!armed || !concerns(call) || --left > 0 ||
-        (left < 0 && plan.fault != Fault::kNoMemoryAtAll)) {
+    if (!control->armed || !concerns(call)) {
         return Verdict::kPass;
     }
-    met = true;
-    switch (plan.fault) {
+    const int left = --control->left;
+    if (left > 0 || (left < 0 && plan().fault != Fault::kNoMemoryAtAll)) {
+        return Verdict::kPass;
+    }
+    control->met = true;
+    switch (plan().fault) {
     case Fault::kShort:
         return Verdict::kHalf;
     case Fault::kLost:
         return Verdict::kLose;
     case Fault::kError:
-        errno = plan.error;
+        errno = plan().error;
         return Verdict::kFail;
     case Fault::kNoMemory:
     case Fault::kNoMemoryAtAll:
         errno = ENOMEM;
         return Verdict::kFail;
+    case Fault::kStop:
+        raise(SIGSTOP);
+        return Verdict::kPass;
+    case Fault::kClock:
+        return Verdict::kPass;
     default:
-        armed = false;
+        control->armed = false;
         if (isPower()) {
             losePower();
         }
@@ -146,18 +160,14 @@ Function *next(const char *name) {
 }
 
 bool isDropped(int fd) {
-    if (!armed || plan.lie != Lie::kJournal) {
+    if (!control->armed || plan().lie != Lie::kJournal) {
         return false;
     }
-    armed = false;
+    control->armed = false;
     const bool journal =
         fs::read_symlink("/proc/self/fd/" + std::to_string(fd)).string().ends_with("-journal");
-    armed = true;
+    control->armed = true;
     return journal;
-}
-
-bool isLock(int command) {
-    return command == F_SETLK || command == F_SETLKW || command == F_OFD_SETLK;
 }
 
 template <typename Real, typename... Offset>
@@ -173,35 +183,54 @@ ssize_t writeTo(Real *real, int fd, const void *data, std::size_t size, Offset..
 
 int sync(int fd) {
     const Verdict verdict = judge(Call::kChange);
-    if (armed && verdict == Verdict::kPass && plan.lie != Lie::kSync && isPower()) {
-        armed = false;
+    if (control->armed && verdict == Verdict::kPass && plan().lie != Lie::kSync && isPower()) {
+        control->armed = false;
         noteSync(fd);
-        armed = true;
+        control->armed = true;
     }
     return verdict == Verdict::kFail ? -1 : 0;
+}
+
+bool isLock(int command) {
+    return command == F_SETLK || command == F_SETLKW || command == F_OFD_SETLK ||
+           command == F_OFD_SETLKW;
+}
+
+std::time_t secondsAhead() {
+    return control->armed && control->met && plan().fault == Fault::kClock ? plan().error : 0;
+}
+
+/// Shares the control with the test that started this program.
+__attribute__((constructor)) void shareControl() {
+    const char *const name = getenv(OvraTest::kControlVariable);
+    const int fd = name != nullptr ? open(name, O_RDWR) : -1;
+    void *const shared = mmap(nullptr, sizeof(own), PROT_READ | PROT_WRITE, MAP_SHARED, fd, 0);
+    if (fd >= 0 && shared != MAP_FAILED) {
+        control = static_cast<OvraTest::FaultControl *>(shared);
+    }
 }
 
 } // namespace
 
 void OvraTest::beginFaults(const FaultPlan &what, int at) {
-    plan = what;
-    left = at;
-    met = false;
+    plan() = what;
+    control->left = at;
+    control->met = false;
     if (isPower()) {
         disk = new Disk{namesNow(), {}};
         for (const auto &[path, inode] : disk->names) {
             disk->contents[inode] = contentOf(path);
         }
     }
-    armed = true;
+    control->armed = true;
 }
 
 bool OvraTest::endFaults() {
-    armed = false;
+    control->armed = false;
     if (isPower()) {
         losePower();
     }
-    return met;
+    return control->met;
 }
 
 // Functions of libc, under names of our own: its headers declare them in ways that differ.
@@ -217,12 +246,14 @@ bool OvraTest::endFaults() {
                    ? real arguments                                                                \
                    : static_cast<result>(verdict == Verdict::kFail ? -1 : 0);                      \
     }
-#define OVRA_LOCK(name, parameters, isLock, arguments)                                             \
+#define OVRA_LOCK(name, parameters, arguments, locks)                                              \
     OVRA_REPLACE(int, name, parameters) {                                                          \
         static int(*const real) parameters = next<int parameters>(#name);                          \
         const Verdict verdict = judge(Call::kLook);                                                \
-        const bool lie = armed && plan.lie == Lie::kLock && isLock;                                \
-        return verdict == Verdict::kPass ? (lie ? 0 : real arguments) : -1;                        \
+        if (verdict == Verdict::kPass && (locks) && control->armed && plan().lie == Lie::kLock) {  \
+            return usleep(200) * 0;                                                                \
+        }                                                                                          \
+        return verdict == Verdict::kPass ? real arguments : -1;                                    \
     }
 #define OVRA_WRITE(name, parameters, ...)                                                          \
     OVRA_REPLACE(ssize_t, name, parameters) {                                                      \
@@ -252,9 +283,6 @@ OVRA_COUNT(kLook, ssize_t, pread, (int fd, void *data, std::size_t size, off_t a
            (fd, data, size, at))
 OVRA_COUNT(kLook, ssize_t, pread64, (int fd, void *data, std::size_t size, off_t at),
            (fd, data, size, at))
-OVRA_LOCK(flock, (int fd, int operation), true, (fd, operation))
-OVRA_LOCK(fcntl, (int fd, int command, void *argument), isLock(command), (fd, command, argument))
-OVRA_LOCK(fcntl64, (int fd, int command, void *argument), isLock(command), (fd, command, argument))
 OVRA_COUNT(kChange, int, mkdir, (const char *path, mode_t mode), (path, mode))
 OVRA_COUNT(kChange, int, mknod, (const char *path, mode_t mode, dev_t device), (path, mode, device))
 OVRA_COUNT(kChange, int, chmod, (const char *path, mode_t mode), (path, mode))
@@ -264,12 +292,43 @@ OVRA_COUNT(kChange, int, ftruncate, (int fd, off_t size), (fd, size))
 OVRA_COUNT(kChange, int, ftruncate64, (int fd, off_t size), (fd, size))
 OVRA_COUNT(kChange, int, unlink, (const char *path), (path))
 OVRA_COUNT(kChange, int, link, (const char *from, const char *to), (from, to))
+OVRA_LOCK(flock, (int fd, int operation), (fd, operation), true)
+OVRA_LOCK(fcntl, (int fd, int command, void *argument), (fd, command, argument), isLock(command))
+OVRA_LOCK(fcntl64, (int fd, int command, void *argument), (fd, command, argument), isLock(command))
 OVRA_WRITE(write, (int fd, const void *data, std::size_t size), fd, data, size)
 OVRA_WRITE(pwrite, (int fd, const void *data, std::size_t size, off_t at), fd, data, size, at)
 OVRA_WRITE(pwrite64, (int fd, const void *data, std::size_t size, off_t at), fd, data, size, at)
 OVRA_ALLOCATE(malloc, __libc_malloc, (std::size_t size), (size))
 OVRA_ALLOCATE(calloc, __libc_calloc, (std::size_t count, std::size_t size), (count, size))
 OVRA_ALLOCATE(realloc, __libc_realloc, (void *old, std::size_t size), (old, size))
+
+OVRA_COUNT(kNetwork, int, connect, (int fd, const sockaddr *to, socklen_t size), (fd, to, size))
+OVRA_COUNT(kNetwork, ssize_t, send, (int fd, const void *data, std::size_t size, int flags),
+           (fd, data, size, flags))
+OVRA_COUNT(kNetwork, ssize_t, sendmsg, (int fd, const msghdr *message, int flags),
+           (fd, message, flags))
+OVRA_COUNT(kNetwork, ssize_t, recv, (int fd, void *data, std::size_t size, int flags),
+           (fd, data, size, flags))
+OVRA_COUNT(kNetwork, ssize_t, recvmsg, (int fd, msghdr *message, int flags), (fd, message, flags))
+
+OVRA_REPLACE(int, clock_gettime, (clockid_t clock, timespec *time)) {
+    static int (*const real)(clockid_t, timespec *) =
+        next<int(clockid_t, timespec *)>("clock_gettime");
+    const int result = real(clock, time);
+    time->tv_sec += clock == CLOCK_REALTIME ? secondsAhead() : 0;
+    return result;
+}
+OVRA_REPLACE(std::time_t, time, (std::time_t * out)) {
+    timespec now{};
+    ovra_clock_gettime(CLOCK_REALTIME, &now);
+    return out != nullptr ? *out = now.tv_sec : now.tv_sec;
+}
+OVRA_REPLACE(int, gettimeofday, (timeval * time, void *)) {
+    timespec now{};
+    ovra_clock_gettime(CLOCK_REALTIME, &now);
+    *time = {now.tv_sec, now.tv_nsec / 1000};
+    return 0;
+}
 
 OVRA_REPLACE(int, fsync, (int fd)) {
     return sync(fd);
@@ -281,7 +340,7 @@ OVRA_REPLACE(int, rename, (const char *from, const char *to)) {
     static int (*const real)(const char *, const char *) =
         next<int(const char *, const char *)>("rename");
     const Verdict verdict = judge(Call::kChange);
-    if (verdict == Verdict::kPass && armed && plan.lie == Lie::kRename) {
+    if (verdict == Verdict::kPass && control->armed && plan().lie == Lie::kRename) {
         const std::string text = contentOf(from);
         const int fd = open(to, O_WRONLY | O_CREAT | O_TRUNC, 0600);
         const bool copied = write(fd, text.data(), text.size()) >= 0;

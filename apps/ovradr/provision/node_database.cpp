@@ -149,10 +149,16 @@ Expected<SetUpStep> provisionNodeDatabase(const std::string &path, const std::st
     if (!database) {
         return unusable(path, database.error().text, kRestore);
     }
-    return fill(database->get(), path, *schema).map([&path](bool filled) {
-        return SetUpStep{"node database", filled,
-                         path + ", schema " + std::to_string(kNodeSchemaVersion)};
-    });
+    const auto filled = fill(database->get(), path, *schema);
+    if (!filled) {
+        return Refusal(filled.error());
+    }
+    // The end of the change, and the file's name, stay after a power failure.
+    if (const auto synced = OvraBase::syncFolderOf(path); *filled && !synced) {
+        return fileFailure(path, synced.error().number);
+    }
+    return SetUpStep{"node database", *filled,
+                     path + ", schema " + std::to_string(kNodeSchemaVersion)};
 }
 
 Expected<void> checkNodeDatabase() {
