@@ -10,6 +10,7 @@
 #include "provision/node_database.h"
 #include "remote_login.h"
 #include "shared/invites.h"
+#include "shared/session_lock.h"
 #include "target.h"
 #include "trust.h"
 
@@ -314,6 +315,12 @@ Outcome pairByCode(const PairOptions &options, const std::string &text) {
     const Expected<Found> found = findAppliance(*code);
     if (!found) {
         return Refusal(found.error());
+    }
+    // Another one of this appliance that fails must not take back the key while this one needs it.
+    const OvraApps::SessionLock turn("pair " + found->fingerprint,
+                                     OvraApps::SessionLock::Purpose::kRelease);
+    if (turn.isBusy()) {
+        return busyFailure();
     }
     Undo undo;
     if (const auto trusted = trustFound(*found, undo); !trusted) {

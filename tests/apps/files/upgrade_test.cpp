@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "platform/store/raw_sqlite.h"
 #include "scene.h"
+#include "shared/invites.h"
 #include "shared/pending_releases.h"
 #include "support/local_node.h"
 
@@ -30,6 +31,7 @@ std::string askEverything() {
     for (const Arguments &command : {Arguments{"setup"},
                                      {"user", "list"},
                                      {"session", "pending"},
+                                     {"invite", "--list"},
                                      {"node", "list"},
                                      {"attr", "get", "local", "app", "name"},
                                      {"attr", "set", "local", "app", "other", "v"},
@@ -73,6 +75,7 @@ TEST(Fixtures, DISABLED_AreMade) {
     ASSERT_EQ(run({"attr", "set", "local", "app", "name", "value"}).exit, 0);
     OvraTest::addCred("node_cred", "n1", "c1", "https", 5001, "a session");
     ASSERT_TRUE(PendingReleases().note({"a session", {}, "n1", "c1"}));
+    ASSERT_TRUE(OvraApps::Invites().make("ann", 60));
     ASSERT_TRUE(OvraPlatform::SessionStore().create({"ann", "", "", "", "", -1, true}));
     writeFile(kState + "known_endpoints",
               kTrustHeading + ("https://192.0.2.1:5001 SHA256:" + std::string(42, 'x')) +
@@ -126,6 +129,7 @@ TEST(FilesOfANewerVersion, AreRefusedAndLeftAsTheyAre) {
             {kState + "accounts.db", nextLayout, "layout 99"},
             {kState + "sessions.db", nextLayout, "layout 99"},
             {kState + "releases.db", nextLayout, "layout 99"},
+            {kState + "invites.db", nextLayout, "layout 99"},
             {kConfig + "ovradrd.seal", heading, "ovradrd.seal"},
             {kAliases, heading, "aliases"},
             {kState + "known_endpoints",

@@ -2,7 +2,9 @@
 #include "invite_code.h"
 #include "scripted_node.h"
 
+#include <atomic>
 #include <ctime>
+#include <memory>
 #include <tuple>
 
 namespace OvradrTest {
@@ -130,6 +132,29 @@ TEST_F(Invited, LeavesNothingBehindWhenAStepFails) {
     remote.answer("redeem", refusal(411));
     EXPECT_EQ(run({"pair", ours}).exit, 4);
     EXPECT_EQ(trust(), "pinned") << "what a person trusted before stays";
+}
+
+TEST_F(Invited, OfEightAtOnceOnePairsAndKeepsTheKey) {
+    std::atomic<int> redeemed = 0;
+    remote.before("redeem", [&] {
+        if (redeemed++ > 0) {
+            remote.answer("redeem", refusal(411));
+        }
+    });
+    std::vector<std::unique_ptr<Program>> programs;
+    for (int i = 0; i < 8; ++i) {
+        programs.push_back(
+            std::make_unique<Program>(Arguments{"pair", code(remote.server.fingerprint())}));
+    }
+    int paired = 0;
+    for (const auto &program : programs) {
+        const Result result = program->finish();
+        EXPECT_TRUE(result.exit == 0 || result.exit == 4) << result.err;
+        paired += result.exit == 0 ? 1 : 0;
+    }
+    EXPECT_EQ(paired, 1);
+    EXPECT_EQ(credentials(), "n1\n");
+    EXPECT_EQ(trust(), "pinned");
 }
 
 TEST_F(Invited, AtATerminalTheCodeIsAskedFor) {

@@ -1,5 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "program.h"
+#include "support/totp.h"
 
 #include <ovraplatform/account_store.h>
 #include <ovraplatform/session_store.h>
@@ -8,6 +9,7 @@
 #include <gtest/gtest.h>
 
 #include <csignal>
+#include <ctime>
 
 namespace OvradrTest {
 
@@ -68,6 +70,22 @@ TEST(User, WhoIsRemovedLosesHisSessionsAndNobodyElseDoes) {
     EXPECT_FALSE(sessions.find(*his));
     EXPECT_TRUE(sessions.find(*hers));
     EXPECT_EQ((result.out + result.err).find(*his), std::string::npos);
+}
+
+TEST(User, OneTimeCodesAreNeededOnceTheAuthenticatorHasShownARightOne) {
+    ASSERT_EQ(addBob(), 0);
+    for (const bool right : {false, true}) {
+        Terminal terminal({"user", "totp", "bob"});
+        ASSERT_TRUE(terminal.shows("secret:  ")) << terminal.screen();
+        ASSERT_TRUE(terminal.shows("The code that it shows now: "));
+        const std::string screen = terminal.screen();
+        const std::string secret = screen.substr(screen.find("secret:  ") + 9, 32);
+        for (int i = 0; i < (right ? 1 : 3); ++i) {
+            terminal.type(right ? OvraTest::totp(secret, std::time(nullptr)) + "\n" : "00x\n");
+        }
+        EXPECT_EQ(terminal.finish(), right ? 0 : 5) << terminal.screen();
+        EXPECT_EQ(logIn(kPassword), right ? LoginResult::kCodeRequired : LoginResult::kOk);
+    }
 }
 
 TEST(User, TheSecretOfOneTimeCodesIsShownOnlyWhereItIsAskedFor) {
