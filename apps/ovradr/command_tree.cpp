@@ -21,6 +21,7 @@ void addCommandTree(CLI::App &app, bool &json, Command &chosen) {
         "  ovradr pair 22TQ8-...\n"
         "  ovradr call 3f2a OVRA.DR.Node info");
     addSetupCommand(app, chosen);
+    addStatusCommand(app, chosen);
     addNodeCommands(app, chosen);
     addUserCommands(app, chosen);
     addInviteCommand(app, chosen);

@@ -5,6 +5,8 @@
 
 #include <ovradrnode/node_session.h>
 
+#include <set>
+
 namespace Ovradr {
 
 using OvraDRNode::NodeSession;
@@ -25,11 +27,21 @@ Expected<std::vector<GrantedSession>> grantedSessions() {
     return sessions;
 }
 
-Json::Value sessionJson(const GrantedSession &session) {
+OvraApps::NodeNames namesOf(const std::vector<GrantedSession> &sessions) {
+    std::set<std::string> ids;
+    for (const GrantedSession &session : sessions) {
+        ids.insert(session.nodeId);
+    }
+    ids.erase("");
+    return OvraApps::NodeNames(ids);
+}
+
+Json::Value sessionJson(const GrantedSession &session, const OvraApps::NodeNames &names) {
     Json::Value json;
     json["reference"] = session.reference();
     json["account"] = session.record.user;
     json["node_id"] = session.nodeId;
+    json["name"] = names.of(session.nodeId).shown();
     json["client"] = session.record.remote;
     json["created"] = Json::Int64(session.record.created);
     json["expires"] =
@@ -38,15 +50,17 @@ Json::Value sessionJson(const GrantedSession &session) {
 }
 
 std::string sessionTable(const std::vector<GrantedSession> &sessions) {
+    const OvraApps::NodeNames names = namesOf(sessions);
     std::vector<std::vector<std::string>> rows;
     for (const GrantedSession &session : sessions) {
         const SessionRecord &record = session.record;
-        rows.push_back({session.reference(), record.user,
+        rows.push_back({names.of(session.nodeId).shown(), session.reference(), record.user,
                         session.nodeId.empty() ? "(none)" : session.nodeId,
                         timeText(record.created),
                         record.expires ? timeText(*record.expires) : "never", record.remote});
     }
-    return table({"SESSION", "ACCOUNT", "GRANTED TO NODE", "SINCE", "ENDS", "CLIENT"}, rows);
+    return table({"NAME", "SESSION", "ACCOUNT", "GRANTED TO NODE", "SINCE", "ENDS", "CLIENT"},
+                 rows);
 }
 
 Expected<void> endSessions(const std::vector<GrantedSession> &sessions) {

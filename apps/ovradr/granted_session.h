@@ -2,6 +2,7 @@
 #pragma once
 
 #include "failure.h"
+#include "shared/node_names.h"
 
 #include <ovraplatform/session_store.h>
 
@@ -22,8 +23,11 @@ struct GrantedSession {
 /// All of them, oldest first, without log-ins of people.
 [[nodiscard]] Expected<std::vector<GrantedSession>> grantedSessions();
 
+/// The names of the nodes that have them.
+OvraApps::NodeNames namesOf(const std::vector<GrantedSession> &sessions);
+
 /// As scripts see it; never contains its id.
-Json::Value sessionJson(const GrantedSession &session);
+Json::Value sessionJson(const GrantedSession &session, const OvraApps::NodeNames &names);
 
 /// A table for people.
 std::string sessionTable(const std::vector<GrantedSession> &sessions);

@@ -89,12 +89,13 @@ struct CallDispatcher::Call {
 
 CallDispatcher::CallDispatcher(const OvraPlatform::APIRegistry &registry,
                                const OvraPlatform::SealKeyPair &keys,
-                               OvraPlatform::ReplayGuard &guard, LoginApi &api, WorkQueues &queues,
-                               bool logsCalls)
+                               OvraPlatform::ReplayGuard &guard, LoginApi &api, SessionUses &uses,
+                               WorkQueues &queues, bool logsCalls)
     : registry_(registry)
     , keys_(keys)
     , guard_(guard)
     , loginApi_(api)
+    , uses_(uses)
     , queues_(queues)
     , logsCalls_(logsCalls) {}
 
@@ -228,6 +229,7 @@ bool CallDispatcher::admit(Call &call) {
         call.caller.user = owner.account.name;
         call.caller.role = owner.account.role;
         call.caller.session = call.wire.sid;
+        uses_.note(call.wire.sid, call.caller.address);
     }
     if (const auto refused = registry_.refusal(call.wire, call.caller)) {
         note(call, *refused, {});

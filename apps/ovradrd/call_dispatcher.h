@@ -5,6 +5,7 @@
 #include "refusal_log.h"
 #include "service/http_server.h"
 #include "service/work_queue.h"
+#include "session_uses.h"
 
 #include <ovraplatform/api_registry.h>
 #include <ovraplatform/sealed_box.h>
@@ -32,6 +33,7 @@ struct WorkQueues {
     // logged in before do not wait for those of strangers.
     OvraService::WorkQueue login{2, {512, 64}};
     OvraService::WorkQueue knownLogin{1, {512, 64}};
+    OvraService::WorkQueue watch{8, {16384, 16384}}; ///< our own questions to other nodes
 
     OvraService::WorkQueue &of(OvraPlatform::APIQueue queue);
 };
@@ -43,8 +45,8 @@ public:
     /// Everything must outlive the dispatcher and the jobs in the queues.
     /// \param logsCalls  every call gets a line at level debug, and not only the refused ones
     CallDispatcher(const OvraPlatform::APIRegistry &registry, const OvraPlatform::SealKeyPair &keys,
-                   OvraPlatform::ReplayGuard &guard, LoginApi &api, WorkQueues &queues,
-                   bool logsCalls = false);
+                   OvraPlatform::ReplayGuard &guard, LoginApi &api, SessionUses &uses,
+                   WorkQueues &queues, bool logsCalls = false);
     CallDispatcher(const CallDispatcher &) = delete;
     CallDispatcher &operator=(const CallDispatcher &) = delete;
 
@@ -93,6 +95,7 @@ private:
     const OvraPlatform::SealKeyPair &keys_;
     OvraPlatform::ReplayGuard &guard_;
     LoginApi &loginApi_;
+    SessionUses &uses_;
     WorkQueues &queues_;
     const bool logsCalls_;
     RefusalLog refusals_;

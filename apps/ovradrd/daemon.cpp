@@ -6,10 +6,12 @@
 #include "handlers/auth.h"
 #include "handlers/handlers.h"
 #include "handlers/invite.h"
+#include "peer_watch.h"
 #include "release_retries.h"
 #include "service/listener.h"
 #include "service/tls_identity.h"
 #include "service/work_queue.h"
+#include "session_uses.h"
 #include "test_files.h"
 
 #include <ovrabase/address.h>
@@ -102,11 +104,13 @@ struct Daemon::Impl {
     OvraPlatform::ReplayGuard guard;
     LoginApi loginApi;
     InviteApi inviteApi;
+    SessionUses uses;
     OvraPlatform::APIRegistry registry;
     std::optional<CallDispatcher> dispatcher;
     std::optional<FarlinkAgent> farlink;
     // Their threads use everything above.
     std::optional<ReleaseRetries> retries;
+    std::optional<PeerWatch> watch;
     std::optional<WorkQueues> queues;
     std::optional<HttpServer> http;
     std::optional<OvraPlatform::LocalServer> local;
@@ -133,6 +137,7 @@ void Daemon::Impl::addHandlers() {
     addUserAPI(registry);
     addFarlinkAPI(registry, *farlink);
     addNodeAPI(registry);
+    addStatusAPI(registry, *keys, {*watch, uses});
     addSpeedAPI(registry);
     addNodeSessionAPI(registry);
     addCredentialAPI(registry);
@@ -196,12 +201,13 @@ tl::expected<void, StartError> Daemon::start() {
             OvraBase::addressText(reinterpret_cast<const sockaddr *>(&client.address)));
         self.http->adopt(std::move(client));
     });
-    self.addHandlers();
     self.loginApi.recall();
     self.queues.emplace();
     self.retries.emplace(self.queues->outbound);
-    self.dispatcher.emplace(self.registry, *self.keys, self.guard, self.loginApi, *self.queues,
-                            self.settings.logsCalls);
+    self.watch.emplace(self.queues->watch);
+    self.addHandlers();
+    self.dispatcher.emplace(self.registry, *self.keys, self.guard, self.loginApi, self.uses,
+                            *self.queues, self.settings.logsCalls);
     self.local.emplace(OvraPlatform::kSocketFile, [&self](const LocalCall &call) {
         return self.dispatcher->serveLocal(call);
     });
@@ -251,6 +257,7 @@ void Daemon::doPeriodicWork() {
     (void)OvraPlatform::SessionStore().sweep(); // the log says why not; the next one is soon
     sweepTestFiles();
     impl_->retries->begin();
+    impl_->watch->round();
     impl_->dispatcher->tellRefusals();
 }
 
@@ -271,7 +278,7 @@ bool Daemon::stop() {
     if (self.queues) {
         WorkQueues &queues = *self.queues;
         for (WorkQueue *queue : {&queues.login, &queues.knownLogin, &queues.relay, &queues.twoWay,
-                                 &queues.outbound, &queues.quick}) {
+                                 &queues.outbound, &queues.watch, &queues.quick}) {
             ended = queue->stop(deadline) && ended;
         }
     }

@@ -26,7 +26,8 @@ TEST_F(CredFlow, CreatesFromAnAccountAndLogsOutAgain) {
         std::regex(
             R"(\{"account":"joe",("device_token":".{43}",)?"otp_code":"123456","passwd":"pw"\})")))
         << remote.params("login");
-    EXPECT_EQ(remote.params("create"), R"({"node_id":")" + DRNode::getLocalNodeId() + "\"}");
+    EXPECT_EQ(remote.params("create"), R"({"_hostname":")" + DRNode::getLocalHostName() +
+                                           R"(","node_id":")" + DRNode::getLocalNodeId() + "\"}");
     EXPECT_EQ(sent("login-sid logout"), 2);
     EXPECT_GE(sent("granted test_privilege"), 1) << "the session was tried before it was stored";
     EXPECT_EQ(NodeCache("n1", false).GetCachedData()["hostname"].asString(), "b");

@@ -83,6 +83,19 @@ Outcome get(const AttrOptions &options) {
     return report;
 }
 
+Outcome unset(const AttrOptions &options) {
+    return get(options).and_then([&options](const Report &found) -> Outcome {
+        if (!DRNodeDB::DeleteAttr(options.node, options.app, options.attr)) {
+            return failure(ExitCode::kNotSetUp, "The attribute cannot be removed.",
+                           "Check that the disk is neither full nor read-only; the system log says "
+                           "more.");
+        }
+        Report report;
+        report.data["removed"] = found.data;
+        return report;
+    });
+}
+
 Report reportOf(const std::vector<DRNodeAttr> &attrs) {
     Report report;
     report.data["attrs"] = Json::Value(Json::arrayValue);
@@ -105,8 +118,7 @@ using Action = Outcome (*)(const AttrOptions &);
 CLI::App *addAction(CLI::App &family, const char *name, const char *description,
                     const std::shared_ptr<AttrOptions> &options, Command &chosen, Action action) {
     CLI::App *command = family.add_subcommand(name, description);
-    command->add_option("NODE", options->node, "\"local\", a node id, or the beginning of one")
-        ->required();
+    command->add_option("NODE", options->node, kNodeHelp)->required();
     command->add_option("APP", options->app, "Name of the application that keeps it")
         ->required()
         ->check(checkName);
@@ -131,7 +143,9 @@ void addAttrCommands(CLI::App &app, Command &chosen) {
         addAction(*family, "set", "Set an attribute, new or not.", options, chosen, set);
     CLI::App *getCommand =
         addAction(*family, "get", "Print the value of an attribute.", options, chosen, get);
-    for (CLI::App *command : {setCommand, getCommand}) {
+    CLI::App *unsetCommand =
+        addAction(*family, "unset", "Remove an attribute.", options, chosen, unset);
+    for (CLI::App *command : {setCommand, getCommand, unsetCommand}) {
         command->add_option("ATTR", options->attr, "Name of the attribute")
             ->required()
             ->check(checkName);
@@ -140,6 +154,7 @@ void addAttrCommands(CLI::App &app, Command &chosen) {
         ->required()
         ->check(checkValue);
     setCommand->footer("Example:\n  ovradr attr set 3f2a backup site 'Rack 7, Zürich'");
+    unsetCommand->footer("Example:\n  ovradr attr unset 3f2a backup site");
     getCommand->footer("Example:\n  ovradr attr get 3f2a backup site");
     addAction(*family, "list", "List the attributes of a node.", options, chosen, list)
         ->footer("Example:\n  ovradr attr list local backup");

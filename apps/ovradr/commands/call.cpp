@@ -196,8 +196,7 @@ Outcome call(const CallOptions &options) {
 void addCallCommand(CLI::App &app, Command &chosen) {
     CLI::App *command = app.add_subcommand("call", "Call a web API of a node.");
     const auto options = std::make_shared<CallOptions>();
-    command->add_option("NODE", options->node, "\"local\", a node id, or the beginning of one")
-        ->required();
+    command->add_option("NODE", options->node, kNodeHelp)->required();
     command->add_option("API", options->api, "Name of the API")->required();
     command->add_option("METHOD", options->method, "Its method")->required();
     command->add_option("--version", options->version, "Version of the method (1)")

@@ -27,6 +27,7 @@ void addConnCommands(CLI::App &app, Command &chosen);
 void addAttrCommands(CLI::App &app, Command &chosen);
 void addWhyCommand(CLI::App &app, Command &chosen);
 void addDoctorCommand(CLI::App &app, Command &chosen);
+void addStatusCommand(CLI::App &app, Command &chosen);
 void addSpeedCommand(CLI::App &app, Command &chosen);
 void addFarlinkCommands(CLI::App &app, Command &chosen);
 

@@ -9,6 +9,7 @@
 #include <ovradrnode/node_db.h>
 
 #include <memory>
+#include <set>
 #include <vector>
 
 namespace Ovradr {
@@ -35,27 +36,37 @@ Outcome list(const CredOptions &options) {
     }
     Report report;
     report.data["creds"] = Json::Value(Json::arrayValue);
-    std::vector<std::vector<std::string>> rows;
-    const auto add = [&](bool temporary) {
+    std::vector<FoundCred> creds;
+    std::set<std::string> nodes;
+    const auto read = [&](bool temporary) {
         const DRNodeDB::CredType table =
             temporary ? DRNodeDB::CRED_TYPE_TEMP : DRNodeDB::CRED_TYPE_NODE;
         std::vector<DRNode> records;
         nodeId->empty() ? DRNodeDB::List(records, table)
                         : DRNodeDB::ListCred(*nodeId, records, table);
         for (const DRNode &record : records) {
-            report.data["creds"].append(credJson(record, temporary));
-            rows.push_back({record.credId, record.nodeId, targetText(record.conn),
-                            temporary ? "temporary" : "lasting"});
+            creds.push_back({record, temporary});
+            nodes.insert(record.nodeId);
         }
     };
-    add(false);
+    read(false);
     if (options.temporary) {
-        add(true);
+        read(true);
+    }
+    const OvraApps::NodeNames names(nodes);
+    std::vector<std::vector<std::string>> rows;
+    for (const auto &[record, temporary] : creds) {
+        const std::string &name = names.of(record.nodeId).shown();
+        Json::Value json = credJson(record, temporary);
+        json["name"] = name;
+        report.data["creds"].append(std::move(json));
+        rows.push_back({name, record.credId, record.nodeId, targetText(record.conn),
+                        temporary ? "temporary" : "lasting"});
     }
     report.text = rows.empty()
                       ? "There are no credentials; `ovradr cred create URL --account NAME` "
                         "makes one.\n"
-                      : table({"CREDENTIAL", "NODE", "ENDPOINT", "KIND"}, rows);
+                      : table({"NAME", "CREDENTIAL", "NODE", "ENDPOINT", "KIND"}, rows);
     return report;
 }
 

@@ -127,8 +127,9 @@ void addDoctorCommand(CLI::App &app, Command &chosen) {
     CLI::App *command =
         app.add_subcommand("doctor", "Find out, step by step, what is in the way to a node.");
     const auto options = std::make_shared<DoctorOptions>();
-    command->add_option("SUBJECT", options->subject,
-                        "A node id or the beginning of one, a URL, or \"local\" (the default)");
+    command->add_option(
+        "SUBJECT", options->subject,
+        "A node, by its name, its id or the beginning of it; a URL; or \"local\" (the default)");
     CLI::Option *account =
         command->add_option("--account", options->account, "Try a log-in with this account");
     addPasswordOptions(*command, options->password);

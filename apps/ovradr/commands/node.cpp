@@ -1,8 +1,10 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "commands/commands.h"
+#include "commands/node_commands.h"
 #include "node_ref.h"
 #include "node_view.h"
 #include "output.h"
+#include "provision/node_database.h"
 #include "renewal.h"
 #include "target.h"
 
@@ -12,11 +14,13 @@
 #include <ovradrnode/sender.h>
 
 #include <memory>
+#include <set>
 
 namespace Ovradr {
 
 namespace {
 
+using OvraApps::NodeName;
 using OvraDRNode::CachedVerdict;
 using OvraDRNode::DRNode;
 using OvraDRNode::NodeCache;
@@ -94,14 +98,17 @@ Outcome nodeInfo(const std::string &nodeId, bool refresh) {
     const bool local = DRNode::isLocalNodeId(nodeId);
     const CachedVerdict reachable = reachability(OvraDRNode::listNodeCandidates(nodeId));
     const double age = cache.GetCachedAge();
+    const NodeName name = OvraApps::NodeNames({nodeId}).of(nodeId);
     Report report;
-    report.data["node_id"] = nodeId;
+    report.data = nodeJson(nodeId, name);
     report.data["local"] = local;
     report.data["info"] = info;
     report.data["age"] = age;
     report.data["reachable"] = local ? Json::Value(true) : toJson(reachable);
     report.text =
-        listing({{"node", nodeId},
+        listing({{"name", name.given},
+                 {"node", nodeId},
+                 {"comment", name.comment},
                  {"host name", OvraDRCore::memberString(info, "hostname")},
                  {"serial number", OvraDRCore::memberString(info, "serial")},
                  {"time zone", OvraDRCore::memberString(info.get("additional", {}), "timezone")},
@@ -110,50 +117,61 @@ Outcome nodeInfo(const std::string &nodeId, bool refresh) {
     return report;
 }
 
-void addRow(const std::string &nodeId, Report &report,
+/// \param candidates  none for this node
+void addRow(const std::string &nodeId, const NodeName &name,
+            const std::vector<NodeCandidate> &candidates, Report &report,
             std::vector<std::vector<std::string>> &rows) {
     const bool local = DRNode::isLocalNodeId(nodeId);
-    const auto candidates = OvraDRNode::listNodeCandidates(nodeId);
     const NodeCandidate *const next = winner(candidates);
     const CachedVerdict reachable = reachability(candidates);
-    const std::string name =
-        local ? DRNode::getLocalHostName()
-              : OvraDRCore::memberString(NodeCache(nodeId, false).GetCachedData(), "hostname");
-    Json::Value json;
-    json["node_id"] = nodeId;
-    json["hostname"] = name;
+    Json::Value json = nodeJson(nodeId, name);
     json["local"] = local;
     json["reachable"] = local ? Json::Value(true) : toJson(reachable);
     json["creds"] = Json::UInt64(candidates.size());
     json["cred_id"] = next == nullptr ? Json::Value() : Json::Value(next->node.credId);
     json["endpoint"] = next == nullptr ? Json::Value() : Json::Value(targetText(next->node.conn));
-    report.data["nodes"].append(json);
-    rows.push_back({nodeId, name, local ? "this node" : verdictText(reachable),
+    report.data["nodes"].append(std::move(json));
+    rows.push_back({name.shown(), nodeId, local ? "this node" : verdictText(reachable),
                     std::to_string(candidates.size()),
                     next == nullptr ? "" : shortId(next->node.credId),
                     next == nullptr ? "" : targetText(next->node.conn)});
 }
 
 /// From the caches alone; this node first.
-Report nodeList(const std::set<std::string> &nodes) {
+Report nodeList(const std::string &local) {
+    const OvraDRCore::CacheSnapshotScope snapshot;
+    const auto nodes = OvraDRNode::listAllNodeCandidates();
+    std::set<std::string> ids{local};
+    for (const auto &[nodeId, candidates] : nodes) {
+        ids.insert(nodeId);
+    }
+    const OvraApps::NodeNames names(ids);
     Report report;
     report.data["nodes"] = Json::Value(Json::arrayValue);
     std::vector<std::vector<std::string>> rows;
-    addRow(DRNode::getLocalNodeId(), report, rows);
-    for (const std::string &nodeId : nodes) {
-        if (!DRNode::isLocalNodeId(nodeId)) {
-            addRow(nodeId, report, rows);
-        }
+    addRow(local, names.of(local), {}, report, rows);
+    for (const auto &[nodeId, candidates] : nodes) {
+        addRow(nodeId, names.of(nodeId), candidates, report, rows);
     }
-    report.text = table({"NODE", "NAME", "ANSWERS", "CREDS", "NEXT", "OVER"}, rows);
+    report.text = table({"NAME", "NODE", "ANSWERS", "CREDS", "NEXT", "OVER"}, rows);
     return report;
+}
+
+Outcome listAll() {
+    const Expected<std::string> local = localNode();
+    if (!local) {
+        return Refusal(local.error());
+    }
+    if (const auto usable = checkNodeDatabase(); !usable) {
+        return Refusal(usable.error());
+    }
+    return nodeList(*local);
 }
 
 void addInfo(CLI::App &family, Command &chosen) {
     CLI::App *info = family.add_subcommand("info", "Show what a node says about itself.");
     const auto options = std::make_shared<NodeInfoOptions>();
-    info->add_option("NODE", options->node, "\"local\", a node id, or the beginning of one")
-        ->required();
+    info->add_option("NODE", options->node, kNodeHelp)->required();
     info->add_flag("--refresh", options->refresh, "Ask it now, and fail when it does not answer");
     info->footer("Without --refresh a node is asked when its last answer is older than a minute, "
                  "and\nshown as it was when it does not answer.\n"
@@ -181,10 +199,11 @@ void addNodeCommands(CLI::App &app, Command &chosen) {
     id->callback([&chosen, options] { chosen = [options] { return nodeId(*options); }; });
 
     addInfo(*family, chosen);
+    addNodeNoteCommands(*family, chosen);
     CLI::App *list = family->add_subcommand("list", "List the nodes and how they are reached.");
     list->footer("It tells what the processes of this appliance know and sends nothing.\n"
                  "Example:\n  ovradr node list");
-    list->callback([&chosen] { chosen = [] { return listNodes().map(nodeList); }; });
+    list->callback([&chosen] { chosen = listAll; });
 }
 
 } // namespace Ovradr

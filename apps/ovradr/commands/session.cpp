@@ -33,7 +33,7 @@ Expected<std::string> resolveGrantee(const std::vector<GrantedSession> &sessions
         }
     }
     return text.empty() ? Expected<std::string>("")
-                        : chooseId(ids, text, "node with a session here", kListHint);
+                        : chooseNode(ids, text, "node with a session here", kListHint);
 }
 
 /// The selected session, "" for "".
@@ -69,8 +69,9 @@ Expected<std::vector<GrantedSession>> select(const SelectOptions &options) {
 Report reportOf(const std::vector<GrantedSession> &sessions, const char *member) {
     Report report;
     report.data[member] = Json::Value(Json::arrayValue);
+    const OvraApps::NodeNames names = namesOf(sessions);
     for (const GrantedSession &session : sessions) {
-        report.data[member].append(sessionJson(session));
+        report.data[member].append(sessionJson(session, names));
     }
     return report;
 }
@@ -126,7 +127,8 @@ Outcome revoke(const SelectOptions &options) {
 }
 
 void addFilters(CLI::App &command, SelectOptions &options) {
-    command.add_option("--node", options.node, "Those of this node: its id, or its beginning");
+    command.add_option("--node", options.node,
+                       "Those of this node: its name, its id, or the beginning of it");
     command.add_option("--account", options.account, "Those of this account");
 }
 

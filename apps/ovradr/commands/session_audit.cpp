@@ -139,8 +139,9 @@ Json::Value toJson(const Audit &audit) {
     json["node_id"] = audit.nodeId;
     json["sessions"] = Json::Value(Json::arrayValue);
     json["creds"] = Json::Value(Json::arrayValue);
+    const OvraApps::NodeNames names = namesOf(audit.granted);
     for (const GrantedSession &session : audit.granted) {
-        Json::Value entry = sessionJson(session);
+        Json::Value entry = sessionJson(session, names);
         entry["orphan"] = audit.isOrphan(session);
         json["sessions"].append(entry);
     }
@@ -291,7 +292,8 @@ void addSessionAuditCommand(CLI::App &family, Command &chosen) {
     CLI::App *command = family.add_subcommand(
         "audit", "Compare the sessions granted to a node with the credentials that it holds.");
     const auto options = std::make_shared<AuditOptions>();
-    command->add_option("NODE", options->node, "A node id, or the beginning of one")->required();
+    command->add_option("NODE", options->node, "A name, a node id, or the beginning of one")
+        ->required();
     CLI::Option *revoking =
         command->add_flag("--revoke", options->revoke,
                           "End the sessions that no credential over there uses, and have the "

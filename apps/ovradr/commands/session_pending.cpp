@@ -35,10 +35,11 @@ Json::Value toJson(const PendingRelease &release) {
     return json;
 }
 
-std::vector<std::string> toRow(const PendingRelease &release) {
+std::vector<std::string> toRow(const PendingRelease &release, const std::string &name) {
     // Noted by a command that is still in progress, or was killed.
     const bool fresh = release.attempts == 0;
-    return {release.reference(),
+    return {name,
+            release.reference(),
             release.nodeId,
             targetText(release.conn),
             timeText(release.noted),
@@ -50,15 +51,23 @@ std::vector<std::string> toRow(const PendingRelease &release) {
 Report reportOf(const std::vector<PendingRelease> &releases) {
     Report report;
     report.data["pending"] = Json::Value(Json::arrayValue);
+    std::set<std::string> nodes;
+    std::transform(releases.begin(), releases.end(), std::inserter(nodes, nodes.end()),
+                   [](const PendingRelease &release) { return release.nodeId; });
+    const OvraApps::NodeNames names(nodes);
     std::vector<std::vector<std::string>> rows;
     for (const PendingRelease &release : releases) {
-        report.data["pending"].append(toJson(release));
-        rows.push_back(toRow(release));
+        const std::string &name = names.of(release.nodeId).shown();
+        Json::Value json = toJson(release);
+        json["name"] = name;
+        report.data["pending"].append(std::move(json));
+        rows.push_back(toRow(release, name));
     }
     report.text =
         rows.empty()
             ? "No session waits to be released on another node.\n"
-            : table({"SESSION", "NODE", "ENDPOINT", "SINCE", "TRIES", "NEXT TRY", "WHY"}, rows);
+            : table({"NAME", "SESSION", "NODE", "ENDPOINT", "SINCE", "TRIES", "NEXT TRY", "WHY"},
+                    rows);
     return report;
 }
 

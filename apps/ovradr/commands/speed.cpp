@@ -185,8 +185,9 @@ void addSpeedCommand(CLI::App &app, Command &chosen) {
     CLI::App *command =
         app.add_subcommand("speed", "Measure how fast data moves to a node, or from a URL.");
     const auto options = std::make_shared<SpeedOptions>();
-    command->add_option("NODE", options->node,
-                        "The node that downloads from this one: a node id, or the beginning of it");
+    command->add_option(
+        "NODE", options->node,
+        "The node that downloads from this one: its name, its id, or the beginning of it");
     command->add_option("--url", options->url, "Download from this URL to here instead");
     command->add_option("--retries", options->retries, "Further attempts at each endpoint (1)")
         ->check(CLI::Range(0, kMaxRetries));

@@ -71,7 +71,7 @@ void addWhyCommand(CLI::App &app, Command &chosen) {
     CLI::App *command =
         app.add_subcommand("why", "Tell why requests to a node go the way that they go.");
     const auto node = std::make_shared<std::string>();
-    command->add_option("NODE", *node, "A node id, or the beginning of one")->required();
+    command->add_option("NODE", *node, "A name, a node id, or the beginning of one")->required();
     command->footer("It reads what the processes of this appliance know and sends nothing.\n"
                     "Example:\n  ovradr why 3f2a");
     command->callback([&chosen, node] { chosen = [node] { return resolveNode(*node).map(why); }; });

@@ -2,6 +2,8 @@
 #pragma once
 
 #include "farlink_agent.h"
+#include "peer_watch.h"
+#include "session_uses.h"
 
 #include <ovraplatform/api_registry.h>
 #include <ovraplatform/sealed_box.h>
@@ -19,6 +21,16 @@ void addUserAPI(OvraPlatform::APIRegistry &registry);
 /// "OVRA.Core.Farlink": how this appliance is reached through the relay service. \param agent  must
 /// outlive the registry
 void addFarlinkAPI(OvraPlatform::APIRegistry &registry, const FarlinkAgent &agent);
+/// What only this process knows.
+struct StatusSources {
+    PeerWatch &watch;
+    const SessionUses &uses;
+};
+
+/// "OVRA.DR.Status": everything that is known of this node and those around it. \param keys,
+/// sources must outlive the registry
+void addStatusAPI(OvraPlatform::APIRegistry &registry, const OvraPlatform::SealKeyPair &keys,
+                  StatusSources sources);
 /// "OVRA.DR.Node": facts about this node, and tests.
 void addNodeAPI(OvraPlatform::APIRegistry &registry);
 /// "OVRA.DR.Node": how fast data moves to this node, and from it to others.

@@ -5,6 +5,7 @@
 #include "timezone.h"
 #include "version.h"
 
+#include <ovradrcore/cache.h>
 #include <ovradrcore/err_recorder.h>
 #include <ovradrnode/dr_node.h>
 #include <ovradrnode/sender.h>
@@ -34,10 +35,11 @@ constexpr std::size_t kMaxEndpoints = 32;
 constexpr std::chrono::seconds kProbeTime{45};
 
 /// What callers may request besides the facts in every answer.
-const std::map<std::string, std::function<std::string()>> &furtherFacts() {
-    static const std::map<std::string, std::function<std::string()>> kFacts = {
-        {"timezone", [] { return localTimezone(); }},
-        {"version", [] { return std::string(kVersion); }},
+const std::map<std::string, std::function<Json::Value()>> &furtherFacts() {
+    static const std::map<std::string, std::function<Json::Value()>> kFacts = {
+        {"timezone", [] { return Json::Value(localTimezone()); }},
+        {"version", [] { return Json::Value(kVersion); }},
+        {"time", [] { return Json::Value(Json::Int64{OvraDRCore::Cache::Now()}); }},
     };
     return kFacts;
 }

@@ -2,17 +2,23 @@
 #include "handlers/flow_error.h"
 #include "handlers/handlers.h"
 #include "handlers/params.h"
+#include "shared/node_names.h"
 
+#include <ovradrnode/node_db.h>
 #include <ovradrnode/node_session.h>
 #include <ovraplatform/api_errors.h>
+#include <ovraplatform/session_store.h>
 #include <ovraplatform/session_walk.h>
 
+#include <algorithm>
 #include <mutex>
+#include <vector>
 
 namespace Ovradrd {
 
 namespace {
 
+using OvraDRNode::DRNodeDB;
 using OvraDRNode::NodeSession;
 using OvraPlatform::APICaller;
 
@@ -27,6 +33,25 @@ Json::Value granted(const NodeSession &sessions, const std::string &session) {
     Json::Value data(Json::objectValue);
     data["session"] = session;
     return OvraPlatform::apiSuccess(data);
+}
+
+/// Remembers what the node calls itself, for lists of who has access: it may be that nothing here
+/// can ask it. What it gave is shown only where it can be shown.
+void noteHostName(const std::string &nodeId, const Json::Value &given) {
+    const std::string name = given.isString() ? given.asString() : "";
+    if (!OvraApps::nodeNameProblem(name).empty()) {
+        return;
+    }
+    std::vector<OvraDRNode::DRNodeAttr> attrs;
+    const bool read = DRNodeDB::ListAttr(nodeId, OvraApps::kOwnApplication, attrs);
+    const OvraDRNode::DRNodeAttr attr(nodeId, OvraApps::kOwnApplication, OvraApps::kHostNameAttr,
+                                      name);
+    const bool isKnown = std::any_of(attrs.begin(), attrs.end(), [&attr](const auto &other) {
+        return other.attr == attr.attr && other.value == attr.value;
+    });
+    if (read && !isKnown) {
+        (void)DRNodeDB::SetAttr(attr); // the log says why not
+    }
 }
 
 /// A session for the caller's account, tied to a node.
@@ -44,6 +69,9 @@ Json::Value create(const Json::Value &params, const APICaller &caller) {
         {caller.user, NodeSession::kApplication, NodeSession::ExtraOf(nodeId)});
     NodeSession sessions;
     const std::string session = sessions.CreateNodeSession(nodeId, caller.user);
+    if (!session.empty()) {
+        noteHostName(nodeId, params["_hostname"]);
+    }
     return granted(sessions, session);
 }
 
@@ -53,7 +81,7 @@ Json::Value createTemporary(const Json::Value & /*params*/, const APICaller &cal
     return granted(sessions, session);
 }
 
-/// Whose session it is.
+/// Whose session it is, and when it ends.
 Json::Value get(const Json::Value &params, const APICaller & /*caller*/) {
     Params in(params);
     const std::string session = in.text("session", Params::kMaxSession);
@@ -67,6 +95,10 @@ Json::Value get(const Json::Value &params, const APICaller & /*caller*/) {
     }
     Json::Value data(Json::objectValue);
     data["account"] = account;
+    const auto record = OvraPlatform::SessionStore().find(session);
+    if (record && record->expires) {
+        data["expires"] = Json::Int64{*record->expires};
+    }
     return OvraPlatform::apiSuccess(data);
 }
 

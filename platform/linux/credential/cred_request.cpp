@@ -6,8 +6,10 @@
 #include "trust/peer_keys.h"
 
 #include <ovrabase/secret.h>
+#include <ovracore/ovracore.h>
 #include <ovradrcore/log.h>
 
+#include <array>
 #include <chrono>
 #include <exception>
 #include <optional>
@@ -29,6 +31,17 @@ constexpr int kModeRequest = 0;
 constexpr int kModeProbe = 2;
 constexpr int kPlain = 0;
 constexpr int kSealed = 2;
+constexpr int kMaxHostName = 256;
+
+/// Tells the node that grants this one a session what this one is called: it may hold no credential
+/// with which it could ask.
+void nameOwnHost(WireCall &call) {
+    std::array<char, kMaxHostName> name{};
+    if (call.api == "OVRA.DR.Node.Session" && call.method == "create" &&
+        OVRALnxGetHostname(name.data(), kMaxHostName) > 0) {
+        call.params["_hostname"] = name.data();
+    }
+}
 
 } // namespace
 
@@ -163,6 +176,7 @@ int CredRequest::CreateWebAPIRequest(CredRequest &req, OVRACred *cred, OVRACredS
         if (sess != nullptr) {
             call.sid = sess->token.get();
             OvraPlatform::nameOwnKeys(call.params);
+            nameOwnHost(call);
         }
         return 1;
     } catch (const std::exception &) {

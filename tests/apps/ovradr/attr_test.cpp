@@ -23,6 +23,8 @@ TEST(Attributes, AreSetReadAndListedPerNodeAndApplication) {
                                                       "k          it's 1\n");
     EXPECT_EQ(run({"attr", "get", "n1", "app", "k", "--json"}).json()["data"]["node_id"],
               "n1-remote");
+    EXPECT_EQ(run({"attr", "unset", "n1", "app", "k"}).exit, 0);
+    EXPECT_EQ(run({"attr", "unset", "n1", "app", "k"}).exit, 7);
     EXPECT_EQ(run({"attr", "set", "n1", "", "k", "v"}).exit, 2);
     EXPECT_EQ(run({"attr", "set", "nowhere", "app", "k", "v"}).exit, 7);
 }

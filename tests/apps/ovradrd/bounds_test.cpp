@@ -171,9 +171,10 @@ TEST(FullQueues, RefuseAtOnceAndDoNotHoldUpTheLowerOnes) {
     const auto keys = OvraPlatform::SealKeyPair::load(OvraPlatform::kSealKeyFile).value();
     OvraPlatform::ReplayGuard guard;
     Ovradrd::LoginApi api;
+    Ovradrd::SessionUses uses;
     std::optional<Ovradrd::CallDispatcher> dispatcher;
     Ovradrd::WorkQueues queues;
-    dispatcher.emplace(registry, keys, guard, api, queues);
+    dispatcher.emplace(registry, keys, guard, api, uses, queues);
     const auto serve = [&](const std::string &method, int client = 1) {
         dispatcher->serve(
             {"api=Test&version=1&method=" + method, "127.0.0." + std::to_string(client), true},

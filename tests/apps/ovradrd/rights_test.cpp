@@ -3,8 +3,11 @@
 #include "platform/store/raw_sqlite.h"
 #include "support/doc_page.h"
 #include "support/local_node.h"
+#include "support/soon.h"
 
 #include <ovraplatform/account_store.h>
+#include <ovraplatform/api_registry.h>
+#include <ovraplatform/peer_trust.h>
 #include <ovraplatform/session_store.h>
 
 #include <ctime>
@@ -61,6 +64,8 @@ const Scene kScenes[] = {
     {kNode, "test_sync_speed", R"({"node_id":"n","retries":-1,"timeout":0})", 1, 119, 105, 106},
     {kNode, "test_connection", kOneEndpoint, 1, 119, 105, 500},
     {kNode, "test_connection", "{}", 1, 119, 105, 106},
+    {"OVRA.DR.Status", "overview", "{}", 1, 119, 105, 0},
+    {"OVRA.DR.Status", "overview", R"({"limit":5001})", 1, 119, 105, 106},
     {kSession, "create", R"({"node_id":"n1"})", 1, 104, 104, 104},
     {kSession, "create", R"({"node_id":"n1"})", 2, 119, 105, 0, 527},
     {kSession, "create", R"({"node_id":""})", 2, 119, 105, 106},
@@ -286,6 +291,38 @@ TEST_F(Node, FindsTheFirstEndpointThatItReaches) {
     }
     EXPECT_EQ(call(kNode, 1, "test_connection", params, session("root")).data(),
               params["conns"][1]);
+}
+
+TEST_F(Node, IsWatchedBySomebodyWhoLooksInBothDirections) {
+    // The appliance is its own peer, under another id: so it reaches, and is reached.
+    addAccount("root", true);
+    const std::string sid = session("root");
+    Json::Value params = json(R"({"node_id":"n1","_hostname":"nas1"})");
+    const std::string granted =
+        call(kSession, 2, "create", params, sid).data()["session"].asString();
+    OvraTest::addCred("node_cred", "n1", "c1", "https", port(true), granted);
+    OvraTest::addCred("temp_cred", "n1", "t1", "https", port(true),
+                      call(kSession, 1, "temp_create", {}, sid).data()["session"].asString());
+    const auto key = OvraPlatform::peerFingerprint("https", "127.0.0.1", port(true), 10);
+    ASSERT_TRUE(key && OvraPlatform::TrustStore().create());
+    OvraPlatform::trustEndpoint("https", "127.0.0.1", port(true), key->fingerprint);
+    const auto overview = [&] { return call("OVRA.DR.Status", 1, "overview", {}, sid).data(); };
+    const auto peer = [&] { return overview()["peers"][0]; };
+    EXPECT_EQ(peer()["name"], "nas1") << "as it called itself";
+    ASSERT_TRUE(OvraTest::soon([&] {
+        return overview()["temporary"][0].isMember("ends") &&
+               peer()["reach"]["ways"][0].isMember("latency");
+    }));
+    const Json::Value found = peer();
+    EXPECT_TRUE(found["reach"]["answers"].asBool());
+    EXPECT_EQ(found["reach"]["ways"][0]["trusted"], key->fingerprint);
+    EXPECT_GT(found["reach"]["ways"][0]["trusted_since"].asInt64(), 0);
+    EXPECT_EQ(found["reached_by"][0]["account"], "root");
+    EXPECT_EQ(found["reached_by"][0]["client"], "127.0.0.1");
+    EXPECT_EQ(overview()["problems"][0]["kind"], "wrong_node") << "it is not n1";
+    EXPECT_FALSE(found.isMember("version")) << "what another node says";
+    const std::string all = call("OVRA.DR.Status", 1, "overview", {}, sid).text;
+    EXPECT_EQ(all.find(granted), std::string::npos) << "no secret";
 }
 
 TEST_F(Node, TellsItsOwnProcessesHowItIsReached) {
