@@ -237,7 +237,7 @@ private:
 
     Refusal senderFailure(const Response &response) const {
         Refusal found = failureOf(errorOf(*sender_, response));
-        found.value().message.insert(0, targetText(conn_) + ": ");
+        nameEndpoint(found.value(), conn_);
         return found;
     }
 
@@ -370,7 +370,7 @@ Json::Value Diagnosis::toJson() const {
         Json::Value entry;
         entry["step"] = step.name;
         entry["state"] = stateWord(step.state);
-        entry["milliseconds"] = step.milliseconds;
+        entry["milliseconds"] = tenths(step.milliseconds);
         entry["detail"] = step.detail;
         entry["hint"] = step.hint;
         json["steps"].append(entry);

@@ -85,6 +85,9 @@ public:
     /// The session that the remote node granted, a secret; "" before requestRemoteSession(). It may
     /// live although the creation failed.
     const std::string &getGrantedSession() const { return grantedSession; }
+    /// Why the remote node granted no session (509): its answer, or what the sender met; code 0 if
+    /// it granted one, or was not asked.
+    const OvraDRCore::ErrRecorder &getSessionError() const { return sessionError; }
 
 private:
     [[nodiscard]] bool completes(bool done);
@@ -93,6 +96,7 @@ private:
     DRNode node;
     std::string account;
     std::string grantedSession;
+    OvraDRCore::ErrRecorder sessionError;
     BaseSender *sender = nullptr;
 };
 

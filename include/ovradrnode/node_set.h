@@ -37,6 +37,8 @@ public:
     /// The session that the remote node granted for this change, a secret; "" before
     /// requestRemoteSession(). It may live although the change failed.
     const std::string &getGrantedSession() const { return grantedSession; }
+    /// As CredCreate::getSessionError().
+    const OvraDRCore::ErrRecorder &getSessionError() const { return sessionError; }
     /// Whether the new login reaches the node that the credential belongs to (518 if another).
     [[nodiscard]] bool check();
     [[nodiscard]] bool checkRemoteNodeInfo();
@@ -50,6 +52,7 @@ private:
     CredAccountSender sender;
     std::string newSession;
     std::string grantedSession;
+    OvraDRCore::ErrRecorder sessionError;
     Conn storedConn;
 };
 

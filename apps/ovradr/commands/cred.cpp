@@ -44,7 +44,7 @@ Outcome list(const CredOptions &options) {
                         : DRNodeDB::ListCred(*nodeId, records, table);
         for (const DRNode &record : records) {
             report.data["creds"].append(credJson(record, temporary));
-            rows.push_back({record.credId, record.nodeId, targetText(record.conn),
+            rows.push_back({shortId(record.credId), shortId(record.nodeId), targetText(record.conn),
                             temporary ? "temporary" : "lasting"});
         }
     };
@@ -52,9 +52,12 @@ Outcome list(const CredOptions &options) {
     if (options.temporary) {
         add(true);
     }
+    const std::string none = nodeId->empty() ? "There are no credentials"
+                             : options.temporary
+                                 ? "There is no credential for the node " + *nodeId
+                                 : "There is no lasting credential for the node " + *nodeId;
     report.text = rows.empty()
-                      ? "There are no credentials; `ovradr cred create URL --account NAME` "
-                        "makes one.\n"
+                      ? printable(none) + "; `ovradr cred create URL --account NAME` makes one.\n"
                       : table({"CREDENTIAL", "NODE", "ENDPOINT", "KIND"}, rows);
     return report;
 }

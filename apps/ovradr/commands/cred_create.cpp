@@ -46,9 +46,7 @@ Refusal flowFailure(const CredCreate &flow, const Conn &conn) {
                        "The other appliance granted the credential, but it could not be stored.",
                        "The system log says why; correct that and make the credential again.");
     }
-    Refusal found = failureOf(flow);
-    found.value().message.insert(0, targetText(conn) + ": ");
-    return found;
+    return credFlowFailure(flow, flow.getSessionError(), conn);
 }
 
 Outcome checkOnly(const CredCreate &flow, const Conn &conn) {

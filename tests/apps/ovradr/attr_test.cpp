@@ -23,6 +23,10 @@ TEST(Attributes, AreSetReadAndListedPerNodeAndApplication) {
                                                       "k          it's 1\n");
     EXPECT_EQ(run({"attr", "get", "n1", "app", "k", "--json"}).json()["data"]["node_id"],
               "n1-remote");
+    ASSERT_EQ(run({"attr", "set", "n1", "app", "k", "\xff\n"}).exit, 0);
+    EXPECT_EQ(run({"attr", "get", "n1", "app", "k", "--raw"}).out, "\xff\n");
+    const Json::Value data = run({"attr", "get", "n1", "app", "k", "--json"}).json()["data"];
+    EXPECT_TRUE(data["value"].isNull() && data["base64"] == "/wo=") << data;
     EXPECT_EQ(run({"attr", "set", "n1", "", "k", "v"}).exit, 2);
     EXPECT_EQ(run({"attr", "set", "nowhere", "app", "k", "v"}).exit, 7);
 }

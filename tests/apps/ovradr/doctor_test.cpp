@@ -2,6 +2,9 @@
 // The program's diagnosis of a paired node with scripted failures.
 #include "scripted_node.h"
 
+#include <algorithm>
+#include <sstream>
+
 namespace OvradrTest {
 
 namespace {
@@ -80,6 +83,20 @@ TEST_F(Diagnosis, KnowsWhatANodeThatIsGoneSaidLast) {
     EXPECT_TRUE(nodes[0]["local"].asBool());
     EXPECT_EQ(nodes[1]["hostname"], "far-host");
     EXPECT_TRUE(nodes[1]["cred_id"].isNull()) << "no credential would be used";
+}
+
+TEST_F(Diagnosis, FitsTheTerminalUnlessItMayBeWide) {
+    for (const bool wide : {false, true}) {
+        Terminal terminal(Arguments{"doctor", "https://no-such-host.invalid"} +
+                          (wide ? Arguments{"--wide"} : Arguments{}));
+        EXPECT_EQ(terminal.finish(), 10);
+        std::istringstream lines(terminal.screen());
+        std::size_t longest = 0;
+        for (std::string line; std::getline(lines, line) && line.find("ovradr: ") != 0;) {
+            longest = std::max(longest, line.find_last_not_of('\r') + 1);
+        }
+        EXPECT_EQ(longest > 80, wide) << terminal.screen();
+    }
 }
 
 } // namespace OvradrTest
