@@ -11,6 +11,7 @@ inline constexpr const char *kIdentityLock = "drnode.info.lock";
 inline constexpr const char *kDatabase = "/usr/ovra/etc/ovradr/node.db";
 
 inline constexpr const char *kNodeCache = "/tmp/.ovradrcache//node";
+inline constexpr const char *kLearntCache = "/tmp/.ovradrcache//node_learnt";
 inline constexpr const char *kPermissionCache = "/tmp/.ovradrcache//dr_cred_premission_cache";
 inline constexpr const char *kConnCache = "/tmp/.ovradrcache//dr_node_conn_cache";
 inline constexpr const char *kValidCredCache = "/tmp/.ovradrcache//dr_node_cred_cache";

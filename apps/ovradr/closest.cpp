@@ -13,6 +13,7 @@ namespace {
 
 using Row = std::vector<std::size_t>;
 
+constexpr std::size_t kFewestTyped = 3;
 constexpr std::size_t kMostTyped = 64;
 constexpr std::size_t kMostMistakes = 2;
 constexpr std::size_t kLettersForAMistake = 4;
@@ -46,9 +47,10 @@ std::size_t mistakes(std::string_view text, std::string_view word, bool whole) {
 
 std::string closest(const std::string &text, const std::vector<std::string> &words) {
     const std::string typed = OvraBase::toLower(text);
-    std::size_t least = std::min(kMostMistakes, typed.size() / kLettersForAMistake) + 1;
+    const std::size_t allowed = std::max<std::size_t>(typed.size() / kLettersForAMistake, 1);
+    std::size_t least = std::min(kMostMistakes, allowed) + 1;
     std::string found;
-    if (typed.size() > kMostTyped || least == 1) {
+    if (typed.size() > kMostTyped || typed.size() < kFewestTyped) {
         return found;
     }
     for (const std::string &word : words) {

@@ -8,9 +8,13 @@ namespace Ovradr {
 
 using OvraApps::Release;
 using OvraDRNode::DRNode;
+namespace ERR = OvraDRCore::ERR;
 
 Json::Value credJson(const DRNode &record, bool temporary) {
-    Json::Value json = record.toJson();
+    Json::Value json;
+    json["cred_id"] = record.credId;
+    json["node_id"] = record.nodeId;
+    json["endpoint"] = targetText(record.conn);
     json["temporary"] = temporary;
     return json;
 }
@@ -43,6 +47,17 @@ std::string releaseText(const Release &release, bool foreseen) {
     return "left behind: " + why +
            (release.remembered ? " ovradrd tries again; see `ovradr session pending`."
                                : " Nobody tries again: revoke it on the other appliance.");
+}
+
+Refusal credFlowFailure(const OvraDRCore::ErrRecorder &flow,
+                        const OvraDRCore::ErrRecorder &sessionError, const OvraDRNode::Conn &conn) {
+    Refusal found = failureOf(sessionError.GetErrCode() != ERR::kNone ? sessionError : flow);
+    if (flow.GetErrCode() == ERR::kNotConnectable) {
+        addReason(found.value(), conn);
+    } else {
+        nameEndpoint(found.value(), conn);
+    }
+    return found;
 }
 
 Refusal busyFailure() {

@@ -27,6 +27,12 @@ std::string releaseText(const OvraApps::Release &release, bool foreseen);
 /// message) and "retried".
 void addRelease(Json::Value &data, const OvraApps::Release &release);
 
+/// Why a flow that makes or changes a credential failed.
+/// \param sessionError  why the other appliance granted no session; code 0 for any other reason
+/// \param conn          its endpoint
+Refusal credFlowFailure(const OvraDRCore::ErrRecorder &flow,
+                        const OvraDRCore::ErrRecorder &sessionError, const OvraDRNode::Conn &conn);
+
 /// The failure of a flow behind another one that does not end.
 Refusal busyFailure();
 

@@ -314,7 +314,7 @@ private:
         if (subject_.cred) {
             found = credFailure(found, subject_.cred->credId);
         }
-        found.value().message.insert(0, targetText(conn_) + ": ");
+        nameEndpoint(found.value(), conn_);
         return found;
     }
 
@@ -423,7 +423,7 @@ Json::Value Diagnosis::toJson() const {
         Json::Value entry;
         entry["step"] = step.name;
         entry["state"] = stateWord(step.state);
-        entry["milliseconds"] = step.milliseconds;
+        entry["milliseconds"] = tenths(step.milliseconds);
         entry["detail"] = step.detail;
         entry["hint"] = step.hint;
         json["steps"].append(entry);

@@ -16,8 +16,12 @@ namespace Ovradr {
 /// Where to connect to: for a relay endpoint what the relay service names now, any other unchanged.
 [[nodiscard]] Expected<OvraDRNode::Conn> placeOf(const OvraDRNode::Conn &conn);
 
-/// Probes a direct endpoint, at most 10 seconds and 5 more to learn why it does not answer. All
-/// processes share the verdict.
+/// Why a direct endpoint did not answer: looks again, for 9 seconds at most, and tells an unknown
+/// name, a refused port, a lack of a route, silence, and a port that speaks something else apart.
+Refusal whyNotReachable(const OvraDRNode::Conn &conn);
+
+/// Probes a direct endpoint, at most 10 seconds and 9 more to learn why it does not answer. All
+/// processes share the verdict, and nobody's earlier one is used.
 /// \return success, or why it does not answer.
 [[nodiscard]] Expected<void> probeEndpoint(const OvraDRNode::Conn &conn);
 

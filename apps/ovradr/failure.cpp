@@ -2,6 +2,7 @@
 #include "failure.h"
 
 #include "access.h"
+#include "endpoint.h"
 #include "target.h"
 
 #include <ovradrcore/json.h>
@@ -248,7 +249,28 @@ Refusal failureOf(const OvraDRCore::ErrRecorder &error) {
     if (error.GetErrCode() == ERR::kLoginFailed && refusal.code != 0) {
         return failureOf(refusal.code, refusal.detail);
     }
-    return failureOf(error.GetErrCode(), error.GetErrMsg());
+    Refusal found = failureOf(error.GetErrCode(), error.GetErrMsg());
+    if (error.GetErrCode() == ERR::kNotConnectable && error.GetErrMsg().isObject()) {
+        addReason(found.value(), OvraDRNode::Conn::fromJson(error.GetErrMsg()));
+    }
+    return found;
+}
+
+void nameEndpoint(Failure &failure, const OvraDRNode::Conn &conn) {
+    static const std::string kAdvice = "ovradr conn trust";
+    failure.message.insert(0, targetText(conn) + ": ");
+    if (const std::size_t at = failure.hint.find(kAdvice); at != std::string::npos) {
+        failure.hint.replace(at, kAdvice.size(), "`" + kAdvice + " " + targetText(conn) + "`");
+    }
+}
+
+void addReason(Failure &failure, const OvraDRNode::Conn &conn) {
+    const Expected<OvraDRNode::Conn> direct = directEndpoint(conn);
+    if (conn.isValid() && direct) {
+        const Failure why = whyNotReachable(*direct).value();
+        failure.message = why.message;
+        failure.hint = why.hint;
+    }
 }
 
 } // namespace Ovradr

@@ -2,6 +2,7 @@
 #pragma once
 
 #include <ovradrcore/err_recorder.h>
+#include <ovradrnode/conn.h>
 #include <ovraplatform/cred_errors.h>
 
 #include <json/value.h>
@@ -66,7 +67,14 @@ Refusal storeFailure(ExitCode exit, const std::string &sentences);
 /// The failure for an error code of the library or of the web API.
 /// \param detail  what came with the code; null if nothing did
 Refusal failureOf(int code, const Json::Value &detail = Json::Value());
+/// An endpoint that did not answer is looked at again to say why, which takes up to 9 seconds.
 Refusal failureOf(const OvraDRCore::ErrRecorder &error);
+
+/// Has the failure, and the command that it advises, name the endpoint.
+void nameEndpoint(Failure &failure, const OvraDRNode::Conn &conn);
+
+/// Has the failure say why the endpoint does not answer (whyNotReachable()). Not of an invalid one.
+void addReason(Failure &failure, const OvraDRNode::Conn &conn);
 
 /// What a command found or did, in both output forms.
 struct Report {

@@ -54,10 +54,10 @@ std::string sessionTable(const std::vector<GrantedSession> &sessions) {
     std::vector<std::vector<std::string>> rows;
     for (const GrantedSession &session : sessions) {
         const SessionRecord &record = session.record;
-        rows.push_back({names.of(session.nodeId).shown(), session.reference(), record.user,
-                        session.nodeId.empty() ? "(none)" : session.nodeId,
-                        timeText(record.created),
-                        record.expires ? timeText(*record.expires) : "never", record.remote});
+        rows.push_back({names.of(session.nodeId).shown(), shortId(session.reference()), record.user,
+                        session.nodeId.empty() ? "(none)" : shortId(session.nodeId),
+                        whenText(record.created),
+                        record.expires ? whenText(*record.expires) : "never", record.remote});
     }
     return table({"NAME", "SESSION", "ACCOUNT", "GRANTED TO NODE", "SINCE", "ENDS", "CLIENT"},
                  rows);

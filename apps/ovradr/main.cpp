@@ -2,7 +2,9 @@
 // ovradr: the command line of an appliance. docs/ovradr.md describes it.
 #include "access.h"
 #include "command_tree.h"
+#include "help.h"
 #include "output.h"
+#include "usage.h"
 
 #include <ovrabase/file.h>
 #include <ovradrcore/cache_folder.h>
@@ -48,43 +50,6 @@ std::vector<std::string> takeArguments(int argc, char **argv) {
     return arguments;
 }
 
-constexpr const char *kHelpHint =
-    "`ovradr --help`, or --help behind a command, shows what there is.";
-
-/// The error for surplus arguments. Repeats only option names: the rest may be a misplaced
-/// password.
-Refusal surplusFailure(const CLI::App &app) {
-    std::string names;
-    for (const std::string &argument : app.remaining(true)) {
-        if (argument.starts_with("-")) {
-            names += (names.empty() ? "" : ", ") + argument.substr(0, argument.find('='));
-        }
-    }
-    if (names.find("--password") != std::string::npos) {
-        return failure(ExitCode::kUsage, "A password is never an argument.",
-                       "Use --password-file or --password-stdin, or have it asked for.");
-    }
-    return failure(ExitCode::kUsage,
-                   names.empty() ? "There are more arguments than the command takes."
-                                 : "The command has no option " + names + ".",
-                   kHelpHint);
-}
-
-/// The error for a command line that lacks something.
-Refusal missingFailure(const CLI::App &app, const std::string &what) {
-    const CLI::App *last = &app;
-    std::string path = app.get_name();
-    while (!last->get_subcommands().empty()) {
-        last = last->get_subcommands().front();
-        path += " " + last->get_name();
-    }
-    if (last->get_require_subcommand_min() > 0 && app.remaining_size(true) > 0) {
-        return failure(ExitCode::kUsage, "There is no such command.",
-                       "`" + path + " --help` shows those that there are.");
-    }
-    return failure(ExitCode::kUsage, what + ".", kHelpHint);
-}
-
 Outcome runChosen(const Command &chosen) {
     if (!isOwnUser()) {
         OvraDRCore::makeNoCacheFolder();
@@ -108,13 +73,12 @@ int run(int argc, char **argv) {
     try {
         std::reverse(arguments.begin(), arguments.end());
         app.parse(arguments);
-    } catch (const CLI::ExtrasError &) {
-        return static_cast<int>(tell(surplusFailure(app), json));
+    } catch (const CLI::CallForHelp &) {
+        return static_cast<int>(tell(helpOf(reachedCommand(app)), json));
+    } catch (const CLI::CallForVersion &) {
+        return static_cast<int>(tell(versionReport(), json));
     } catch (const CLI::ParseError &error) {
-        if (error.get_exit_code() == 0) {
-            return app.exit(error); // the help or the version
-        }
-        return static_cast<int>(tell(missingFailure(app, error.what()), json));
+        return static_cast<int>(tell(usageFailure(app, error), json));
     }
     return static_cast<int>(tell(runChosen(chosen), json));
 }

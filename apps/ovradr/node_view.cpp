@@ -1,9 +1,9 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "node_view.h"
 
+#include "output.h"
+
 #include <algorithm>
-#include <array>
-#include <cmath>
 
 namespace Ovradr {
 
@@ -13,26 +13,7 @@ using OvraDRNode::CachedVerdict;
 using OvraDRNode::NodeCandidate;
 using Outlook = NodeCandidate::Outlook;
 
-constexpr std::size_t kShortId = 8;
-
 } // namespace
-
-std::string ageText(double seconds) {
-    struct Unit {
-        double seconds;
-        const char *name;
-    };
-    constexpr std::array kUnits = {Unit{86400, "d"}, Unit{3600, "h"}, Unit{60, "min"}};
-    if (seconds < 0) {
-        return "";
-    }
-    const auto *const unit =
-        std::find_if(kUnits.begin(), kUnits.end(),
-                     [seconds](const Unit &each) { return seconds >= 2 * each.seconds; });
-    const bool large = unit != kUnits.end();
-    return std::to_string(std::lround(large ? seconds / unit->seconds : seconds)) + " " +
-           (large ? unit->name : "s");
-}
 
 std::string verdictText(const CachedVerdict &verdict) {
     if (!verdict.known) {
@@ -41,10 +22,6 @@ std::string verdictText(const CachedVerdict &verdict) {
     const std::string age = ageText(verdict.age);
     return std::string(verdict.fresh ? "" : "was ") + (verdict.value ? "yes" : "no") +
            (age.empty() ? "" : ", " + age + " ago");
-}
-
-std::string shortId(const std::string &id) {
-    return id.substr(0, kShortId);
 }
 
 const NodeCandidate *winner(const std::vector<NodeCandidate> &candidates) {

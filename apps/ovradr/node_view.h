@@ -9,14 +9,8 @@
 
 namespace Ovradr {
 
-/// "3 s", "5 min", "2 h", "4 d"; "" for a negative age.
-std::string ageText(double seconds);
-
 /// "yes, 2 s ago"; "was no, 41 s ago" for a verdict that is checked again before use; "unknown".
 std::string verdictText(const OvraDRNode::CachedVerdict &verdict);
-
-/// The first eight characters of the id, usually enough to find it again.
-std::string shortId(const std::string &id);
 
 /// The candidate that a request would use now, according to the caches; null if all are passed
 /// over.

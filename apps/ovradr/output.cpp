@@ -6,15 +6,18 @@
 #include <ovradrcore/json.h>
 
 #include <json/writer.h>
+#include <sys/ioctl.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <array>
 #include <cerrno>
 #include <clocale>
+#include <cmath>
 #include <cstdio>
 #include <ctime>
 #include <cwchar>
+#include <numeric>
 #include <string_view>
 
 namespace Ovradr {
@@ -22,6 +25,16 @@ namespace Ovradr {
 namespace {
 
 constexpr std::size_t kGap = 2;
+constexpr std::size_t kShortId = 8;
+constexpr std::size_t kLeastColumn = 20; ///< a narrower one is not worth breaking lines for
+
+bool wide = false; ///< what one run of the program shows; set before it shows anything
+
+/// The columns of the terminal that standard output is; 0 if it is none.
+std::size_t terminalWidth() {
+    winsize size{};
+    return ioctl(STDOUT_FILENO, TIOCGWINSZ, &size) == 0 ? size.ws_col : 0;
+}
 
 /// The C library's knowledge of Unicode, for this thread, whatever the user's own locale is.
 class UnicodeScope {
@@ -81,6 +94,14 @@ bool put(const std::string &text, FILE *stream) {
 
 } // namespace
 
+void useWideOutput() {
+    wide = true;
+}
+
+std::string shortId(const std::string &id) {
+    return wide ? id : id.substr(0, kShortId);
+}
+
 std::string printable(const std::string &text) {
     return OvraBase::shown(text);
 }
@@ -95,6 +116,29 @@ std::size_t displayWidth(const std::string &text) {
         rest.remove_prefix(std::max<std::size_t>(character.size, 1));
     }
     return width;
+}
+
+std::string wrapped(const std::string &text, std::size_t width, std::size_t indent) {
+    const std::string margin(indent, ' ');
+    std::string lines = margin;
+    std::size_t used = indent;
+    for (std::size_t at = 0; at < text.size();) {
+        const std::size_t end = std::min(text.find(' ', at), text.size());
+        const std::string word = text.substr(at, end - at);
+        const std::size_t columns = displayWidth(word);
+        const bool first = used == indent;
+        if (!first && used + 1 + columns > width) {
+            lines += "\n" + margin;
+            used = indent;
+        } else if (!first) {
+            lines += " ";
+            ++used;
+        }
+        lines += word;
+        used += columns;
+        at = end + 1;
+    }
+    return lines;
 }
 
 std::string table(const std::vector<std::string> &headings,
@@ -112,8 +156,15 @@ std::string table(const std::vector<std::string> &headings,
             widths[i] = std::max(widths[i], displayWidth(cells[i]));
         }
     }
+    const std::size_t column =
+        std::accumulate(widths.begin(), widths.end() - 1, kGap * (widths.size() - 1));
+    const std::size_t width = wide ? 0 : terminalWidth();
+    const bool breaks = width >= column + kLeastColumn && width < column + widths.back();
     std::string text;
-    for (const auto &cells : lines) {
+    for (auto &cells : lines) {
+        if (breaks) {
+            cells.back() = wrapped(cells.back(), width, column).substr(column);
+        }
         text += line(cells, widths);
     }
     return text;
@@ -147,6 +198,39 @@ std::string prettyJson(const Json::Value &value) {
         text.replace(at, 1, "\\u007f"); // the one character of ASCII that it leaves to the terminal
     }
     return text;
+}
+
+std::string counted(std::size_t number, const std::string &what) {
+    return std::to_string(number) + " " + what + (number == 1 ? "" : "s");
+}
+
+double tenths(double number) {
+    return std::round(number * 10) / 10;
+}
+
+std::string ageText(double seconds) {
+    struct Unit {
+        double seconds;
+        const char *name;
+    };
+    constexpr std::array kUnits = {Unit{86400, "d"}, Unit{3600, "h"}, Unit{60, "min"}};
+    if (seconds < 0) {
+        return "";
+    }
+    const auto *const unit =
+        std::find_if(kUnits.begin(), kUnits.end(),
+                     [seconds](const Unit &each) { return seconds >= 2 * each.seconds; });
+    const bool large = unit != kUnits.end();
+    return std::to_string(std::lround(large ? seconds / unit->seconds : seconds)) + " " +
+           (large ? unit->name : "s");
+}
+
+std::string whenText(std::int64_t seconds) {
+    const double ago = std::difftime(std::time(nullptr), seconds);
+    if (wide) {
+        return timeText(seconds);
+    }
+    return ago < 0 ? "in " + ageText(-ago) : ageText(ago) + " ago";
 }
 
 std::string timeText(std::int64_t seconds) {

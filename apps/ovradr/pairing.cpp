@@ -80,9 +80,7 @@ Refusal creationFailure(const CredCreate &flow, const Conn &conn) {
                        "The other appliance granted the credential, but it could not be stored.",
                        "The system log says why; correct that and make the credential again.");
     }
-    Refusal found = withClock(failureOf(flow), conn);
-    found.value().message.insert(0, targetText(conn) + ": ");
-    return found;
+    return withClock(credFlowFailure(flow, flow.getSessionError(), conn), conn);
 }
 
 Expected<void> proveByAccount(CredCreate &flow, const RemoteLogin &login, const Conn &conn) {

@@ -4,8 +4,11 @@
 #include "commands/commands.h"
 #include "endpoint.h"
 #include "trust.h"
+#include "usage.h"
 
 #include <ovradrcore/err_recorder.h>
+
+#include <cctype>
 
 namespace Ovradr {
 
@@ -13,31 +16,46 @@ namespace {
 
 using OvraDRNode::Conn;
 
+/// Authenticators show codes in groups.
+std::string withoutBlanks(std::string code) {
+    std::erase_if(code, [](unsigned char c) { return std::isspace(c) != 0; });
+    return code;
+}
+
 Expected<std::string> askOneTimeCode() {
     if (!isInteractive()) {
         return failure(ExitCode::kUsage,
                        "There is no terminal on which the one-time code could be asked for.",
                        "Give it with --otp.");
     }
-    return askSecret("One-time code").map([](const Secret &given) { return given.get(); });
+    return askSecret("One-time code").map([](const Secret &given) {
+        return withoutBlanks(given.get());
+    });
 }
 
 } // namespace
+
+CLI::Option *addOneTimeCodeOption(CLI::App &command, std::string &code) {
+    return command.add_option("--otp", code, "One-time code of the account")
+        ->transform(withoutBlanks);
+}
 
 CLI::Option *addRemoteLoginOptions(CLI::App &command, RemoteLogin &login) {
     CLI::Option *account =
         command.add_option("--account", login.account, "Account on the other appliance");
     addPasswordOptions(command, login.password);
-    CLI::Option *code =
-        command.add_option("--otp", login.oneTimeCode, "One-time code of the account");
+    CLI::Option *code = addOneTimeCodeOption(command, login.oneTimeCode);
     command.add_flag("--otp-prompt", login.askOneTimeCode, "Ask for the one-time code")
         ->excludes(code);
     return account;
 }
 
-void addFingerprintOption(CLI::App &command, std::string &fingerprint) {
-    command.add_option("--fingerprint", fingerprint, "The key that the other end must have")
-        ->check(checkFingerprint);
+CLI::Option *addFingerprintOption(CLI::App &command, std::string &fingerprint) {
+    CLI::Option *option =
+        command.add_option("--fingerprint", fingerprint, "The key that the other end must have")
+            ->check(checkFingerprint);
+    trims(*option);
+    return option;
 }
 
 Expected<void> trustedEndpoint(const Conn &conn, const std::string &fingerprint) {

@@ -28,8 +28,11 @@ struct RemoteLogin {
 /// `command`. \return --account
 CLI::Option *addRemoteLoginOptions(CLI::App &command, RemoteLogin &login);
 
+/// --otp, without the blanks in what is given; `code` must outlive `command`.
+CLI::Option *addOneTimeCodeOption(CLI::App &command, std::string &code);
+
 /// --fingerprint; `fingerprint` must outlive `command`.
-void addFingerprintOption(CLI::App &command, std::string &fingerprint);
+CLI::Option *addFingerprintOption(CLI::App &command, std::string &fingerprint);
 
 /// Makes sure that the key of an endpoint is trusted before anything secret is sent to it.
 /// \param conn         may be a relay endpoint

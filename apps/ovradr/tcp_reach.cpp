@@ -11,10 +11,8 @@ namespace Ovradr {
 
 namespace {
 
-constexpr std::chrono::seconds kReachTime{10};
-
-OvraBase::Deadline deadline() {
-    return std::chrono::steady_clock::now() + kReachTime;
+OvraBase::Deadline deadline(std::chrono::seconds limit) {
+    return std::chrono::steady_clock::now() + limit;
 }
 
 Refusal shortage(const std::string &what, int error) {
@@ -41,22 +39,25 @@ Refusal connectFailure(const std::string &where, int error) {
 
 } // namespace
 
-Expected<std::vector<OvraBase::SocketAddress>> resolveHost(const std::string &host, int port) {
-    auto found = OvraBase::resolveHost(host, port, deadline());
+Expected<std::vector<OvraBase::SocketAddress>> resolveHost(const std::string &host, int port,
+                                                           std::chrono::seconds limit) {
+    auto found = OvraBase::resolveHost(host, port, deadline(limit));
     if (!found && OvraBase::isShortage(found.error().number)) {
         return shortage("The host cannot be looked up here", found.error().number);
     }
     if (!found) {
         return failure(ExitCode::kNameUnknown,
-                       "The host " + host + " is not known: " + found.error().text + ".",
+                       found.error().number == ETIMEDOUT
+                           ? "The name service does not say in time where " + host + " is."
+                           : "The name " + host + " is not known: " + found.error().text + ".",
                        "Check how it is written, and the name service; or use its address.");
     }
     return std::move(*found);
 }
 
 Expected<std::string> connectAny(const std::vector<OvraBase::SocketAddress> &addresses,
-                                 const OvraDRNode::Conn &conn) {
-    const auto connected = OvraBase::connectFirst(addresses, deadline());
+                                 const OvraDRNode::Conn &conn, std::chrono::seconds limit) {
+    const auto connected = OvraBase::connectFirst(addresses, deadline(limit));
     if (!connected) {
         return connectFailure(targetText(conn), connected.error().number);
     }

@@ -70,20 +70,17 @@ void endLossOfKeys() {
     }
 }
 
-bool askWhetherToTrust(const Conn &conn, const PeerIdentity &identity) {
-    std::fprintf(stderr,
-                 "The key of %s %s. It shows now:\n  %s\n"
-                 "Compare that with what `ovradr conn local` prints on that appliance.\n",
+bool askWhetherToTrust(const Conn &conn, const PeerIdentity &identity, const char *shown) {
+    std::fprintf(stderr, "The key of %s %s. It shows now:\n  %s\nCompare that with what %s.\n",
                  printable(targetText(conn)).c_str(), standing(identity.pinned),
-                 identity.fingerprint.c_str());
+                 identity.fingerprint.c_str(), shown);
     return confirm("Is it the same?");
 }
 
-Refusal nobodyToAsk(const Conn &conn, const PeerIdentity &identity) {
-    return keyFailure(conn, identity,
-                      std::string(standing(identity.pinned)) + ", and nobody can be asked",
-                      "Compare it with what `ovradr conn local` shows over there, and give it "
-                      "with --fingerprint.");
+Refusal nobodyToAsk(const Conn &conn, const PeerIdentity &identity, const char *shown) {
+    return keyFailure(
+        conn, identity, std::string(standing(identity.pinned)) + ", and nobody can be asked",
+        std::string("Compare it with what ") + shown + ", and give it with --fingerprint.");
 }
 
 Refusal notNamed(const Conn &conn, const PeerIdentity &identity) {
@@ -101,11 +98,8 @@ std::string checkFingerprint(const std::string &text) {
 }
 
 Refusal endpointFailure(const Conn &conn, CredError error) {
-    const Expected<Conn> relayed = parseTarget(targetText(conn));
-    if (error == CredError::kCannotConnect && relayed && relayed->isFarlink()) {
-        if (const auto place = placeOf(*relayed); !place) {
-            return Refusal(place.error()); // the relay service knows more
-        }
+    if (error == CredError::kCannotConnect) {
+        return whyNotReachable(conn);
     }
     // The sentence of the library says what is wrong and, behind a colon, what to do.
     const std::string text = OvraPlatform::credErrorText(static_cast<int>(error));
@@ -114,7 +108,7 @@ Refusal endpointFailure(const Conn &conn, CredError error) {
     if (!hint.empty()) {
         hint.front() = static_cast<char>(std::toupper(static_cast<unsigned char>(hint.front())));
     } else {
-        hint = "Check name, address and port, and that the appliance runs.";
+        hint = "`ovradr doctor " + targetText(conn) + "` shows each step on the way.";
     }
     return failure(exitOf(error), targetText(conn) + ": " + text.substr(0, colon) + ".", hint);
 }
@@ -162,7 +156,7 @@ std::string trustText(const PeerIdentity &identity) {
                           : "the known keys cannot be read";
 }
 
-Expected<void> trustPeer(const Conn &conn, const std::string &expected) {
+Expected<void> trustPeer(const Conn &conn, const std::string &expected, const char *shown) {
     const auto met =
         OvraPlatform::peerFingerprint(conn.protocol, conn.addr, conn.port, kKeySeconds);
     if (!met) {
@@ -183,9 +177,9 @@ Expected<void> trustPeer(const Conn &conn, const std::string &expected) {
         return {};
     }
     if (expected.empty() && !isInteractive()) {
-        return nobodyToAsk(conn, identity);
+        return nobodyToAsk(conn, identity, shown);
     }
-    if (expected.empty() && !askWhetherToTrust(conn, identity)) {
+    if (expected.empty() && !askWhetherToTrust(conn, identity, shown)) {
         return notTrusted(conn, identity);
     }
     switch (

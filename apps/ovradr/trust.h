@@ -26,12 +26,18 @@ std::string trustText(const OvraPlatform::PeerIdentity &identity);
 /// The same as one word for scripts.
 std::string trustWord(const OvraPlatform::PeerIdentity &identity);
 
+/// Where a person sees the key that an endpoint has to show.
+inline constexpr const char *kShownByAppliance = "`ovradr conn local` prints on that appliance";
+inline constexpr const char *kShownByRelay = "farlinkd prints when it starts";
+
 /// Shows a person the key of an endpoint, which nobody has checked, and asks whether it is the one
-/// that the other appliance shows. Only where isInteractive().
-bool askWhetherToTrust(const OvraDRNode::Conn &conn, const OvraPlatform::PeerIdentity &identity);
+/// that is shown over there. Only where isInteractive().
+bool askWhetherToTrust(const OvraDRNode::Conn &conn, const OvraPlatform::PeerIdentity &identity,
+                       const char *shown = kShownByAppliance);
 
 /// Why a key is not trusted: a person is needed; it is not the named one; the person said no.
-Refusal nobodyToAsk(const OvraDRNode::Conn &conn, const OvraPlatform::PeerIdentity &identity);
+Refusal nobodyToAsk(const OvraDRNode::Conn &conn, const OvraPlatform::PeerIdentity &identity,
+                    const char *shown = kShownByAppliance);
 Refusal notNamed(const OvraDRNode::Conn &conn, const OvraPlatform::PeerIdentity &identity);
 Refusal notTrusted(const OvraDRNode::Conn &conn, const OvraPlatform::PeerIdentity &identity);
 
@@ -44,7 +50,9 @@ void endLossOfKeys();
 /// confirms it; an expected one is pinned whoever else vouches for it. Another key than the known
 /// one is refused.
 /// \param expected  the required fingerprint, or ""
+/// \param shown     where a person finds it
 /// \return success if the key is trusted, else what is in the way.
-[[nodiscard]] Expected<void> trustPeer(const OvraDRNode::Conn &conn, const std::string &expected);
+[[nodiscard]] Expected<void> trustPeer(const OvraDRNode::Conn &conn, const std::string &expected,
+                                       const char *shown = kShownByAppliance);
 
 } // namespace Ovradr

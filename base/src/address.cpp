@@ -2,6 +2,7 @@
 #include "ovrabase/address.h"
 
 #include <arpa/inet.h>
+#include <net/if.h>
 #include <netinet/in.h>
 
 #include <algorithm>
@@ -19,6 +20,12 @@ constexpr std::size_t kNetworkBytes = 8;
 bool isHostNameCharacter(char c) {
     return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z') || (c >= '0' && c <= '9') || c == '-' ||
            c == '.' || c == '_';
+}
+
+/// Whether it is "%" and what can be the name of an interface.
+bool isLink(const std::string &text) {
+    return text.size() > 1 && text.size() <= IF_NAMESIZE &&
+           std::all_of(text.begin() + 1, text.end(), isHostNameCharacter);
 }
 
 /// inet_pton(3) would stop at the first NUL.
@@ -67,8 +74,18 @@ std::string normalizeIpv6(std::string text) {
     if (text.size() > 2 && text.front() == '[' && text.back() == ']') {
         text = text.substr(1, text.size() - 2);
     }
+    const std::size_t percent = std::min(text.find('%'), text.size());
+    std::string link = text.substr(percent);
+    text.resize(percent);
+    if (link.starts_with("%25") && link.size() > 3) {
+        link.erase(1, 2);
+    }
     in6_addr binary{};
-    return toBinary(AF_INET6, text, &binary) ? toText(AF_INET6, &binary) : "";
+    if (!toBinary(AF_INET6, text, &binary) ||
+        !(link.empty() || (IN6_IS_ADDR_LINKLOCAL(&binary) && isLink(link)))) {
+        return "";
+    }
+    return toText(AF_INET6, &binary) + link;
 }
 
 std::string addressText(const sockaddr *address) {
@@ -100,6 +117,12 @@ bool isHostName(std::string_view text) {
 std::string joinHostPort(const std::string &host, int port) {
     const bool ipv6 = host.find(':') != std::string::npos;
     return (ipv6 ? "[" + host + "]" : host) + ":" + std::to_string(port);
+}
+
+std::string trimmed(std::string_view text) {
+    constexpr std::string_view kBlank = " \t\r\n\f\v";
+    const std::size_t begin = std::min(text.find_first_not_of(kBlank), text.size());
+    return std::string(text.substr(begin, text.find_last_not_of(kBlank) + 1 - begin));
 }
 
 std::string toLower(std::string_view text) {

@@ -35,6 +35,11 @@ bool sodiumReady() {
     return sodium_init() >= 0;
 }
 
+std::string toBase64(std::string_view bytes) {
+    return toBase64(reinterpret_cast<const unsigned char *>(bytes.data()), bytes.size(),
+                    sodium_base64_VARIANT_ORIGINAL);
+}
+
 std::string toBase64Url(const unsigned char *data, std::size_t size) {
     return toBase64(data, size, sodium_base64_VARIANT_URLSAFE_NO_PADDING);
 }

@@ -29,6 +29,12 @@ public:
     std::string GetSerialNum() const;
     std::string GetTimeZone() const;
 
+    /// Seconds since the node said what is stored, which may be longer ago than it was asked last;
+    /// -1 if unknown. Sends nothing.
+    double GetLearntAge() const;
+    /// Stores what the node has just said.
+    bool Learn(const Json::Value &facts) const;
+
 private:
     std::string nodeId;
 };

@@ -92,6 +92,9 @@ public:
     void setGrantObserver(std::function<void(const std::string &session)> observer) {
         grantObserver = std::move(observer);
     }
+    /// Why the remote node granted no session (509): its answer, or what the sender met; code 0 if
+    /// it granted one, or was not asked.
+    const OvraDRCore::ErrRecorder &getSessionError() const { return sessionError; }
 
 private:
     [[nodiscard]] bool completes(bool done);
@@ -101,6 +104,7 @@ private:
     std::string account;
     std::string grantedSession;
     std::function<void(const std::string &)> grantObserver;
+    OvraDRCore::ErrRecorder sessionError;
     BaseSender *sender = nullptr;
 };
 

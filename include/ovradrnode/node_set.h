@@ -43,6 +43,8 @@ public:
     void setGrantObserver(std::function<void(const std::string &session)> observer) {
         grantObserver = std::move(observer);
     }
+    /// As CredCreate::getSessionError().
+    const OvraDRCore::ErrRecorder &getSessionError() const { return sessionError; }
     /// Whether the new login reaches the node that the credential belongs to (518 if another).
     [[nodiscard]] bool check();
     [[nodiscard]] bool checkRemoteNodeInfo();
@@ -57,6 +59,7 @@ private:
     std::string newSession;
     std::string grantedSession;
     std::function<void(const std::string &)> grantObserver;
+    OvraDRCore::ErrRecorder sessionError;
     Conn storedConn;
 };
 

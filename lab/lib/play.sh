@@ -63,7 +63,7 @@ up() {
 # fingerprint NODE [PROTOCOL]: the fingerprint of the node's key for HTTPS, or for PROTOCOL.
 fingerprint() {
     "$lab" run "$1" -- ovradr --json conn local |
-        jq -er --arg protocol "${2-https}" 'first(.data.conns[] | select(.protocol == $protocol)).fingerprint'
+        jq -er --arg protocol "${2-https}://" 'first(.data.conns[] | select(.endpoint | startswith($protocol))).fingerprint'
 }
 create() {
     local code=$1

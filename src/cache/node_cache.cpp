@@ -17,6 +17,21 @@ constexpr long kLocalLifetime = 5;   // seconds
 constexpr long kRemoteLifetime = 60; // seconds
 constexpr int kReadAttempts = 3;
 
+/// As old as the facts about a node are; nothing refreshes it.
+class LearntCache : public OvraDRCore::Cache {
+public:
+    explicit LearntCache(const std::string &nodeId)
+        : Cache(Path::kLearntCache, nodeId, kRemoteLifetime, false, kReadAttempts) {}
+
+    Json::Value GetInfo() const override {
+        Json::Value info(Json::objectValue);
+        info[Word::kName] = "learnt cache";
+        return info;
+    }
+    bool GetUpdatedData(Json::Value &) const override { return false; }
+    bool IsValid(const Json::Value &) const override { return true; }
+};
+
 } // namespace
 
 NodeCache::NodeCache(const std::string &nodeId_, bool flag)
@@ -54,8 +69,17 @@ bool NodeCache::GetUpdatedData(Json::Value &value) const {
     }
     if (response.isSuccess()) {
         value = response.getData();
+        LearntCache(nodeId).UpdateWithData(true);
     }
     return response.isSuccess();
+}
+
+double NodeCache::GetLearntAge() const {
+    return LearntCache(nodeId).GetCachedAge();
+}
+
+bool NodeCache::Learn(const Json::Value &facts) const {
+    return UpdateWithData(facts) && LearntCache(nodeId).UpdateWithData(true);
 }
 
 std::string NodeCache::GetHostName() const {

@@ -246,8 +246,11 @@ bool CredCreate::getRemoteNodeInfo() {
 }
 
 bool CredCreate::requestRemoteSession() {
+    sessionError.SetErr(ERR::kNone);
     const Response response = sendReq(getSessionRequestAPI());
     if (!response.isSuccess()) {
+        sessionError =
+            sender == nullptr ? OvraDRCore::ErrRecorder(*this) : errorOf(*sender, response);
         return false;
     }
     if (!response.hasDataField(Word::kSession)) {

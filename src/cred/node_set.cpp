@@ -139,8 +139,10 @@ bool DRNodeCredSet::checkRemoteNodeInfo() {
 
 bool DRNodeCredSet::requestRemoteSession() {
     const Request request = WebAPI::getDRNodeSessionCreateAPI(DRNode::getLocalNodeId());
+    sessionError.SetErr(ERR::kNone);
     const Response response = sender.process(request);
     if (!response.isSuccess()) {
+        sessionError = errorOf(sender, response);
         OVRA_ERR("Bad resp[%s]/req[%s] of host[%s]", toLogString(response.toJson()).c_str(),
                  toLogString(request.toJson()).c_str(), sender.getConn().addr.c_str());
         return false;

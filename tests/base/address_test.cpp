@@ -41,7 +41,11 @@ TEST(Address, OneSubscriberIsOneClient) {
 
 TEST(Address, AHostHasOneSpelling) {
     EXPECT_EQ(normalizeIpv6("[2001:DB8::0:1]"), "2001:db8::1");
-    EXPECT_EQ(normalizeIpv6("2001:db8::1%eth0"), "");
+    EXPECT_EQ(normalizeIpv6("[FE80::0:1%eth0]"), "fe80::1%eth0");
+    for (const char *text :
+         {"2001:db8::1%eth0", "fe80::1%", "fe80::1%a/b", "fe80::1%sixteencharacter"}) {
+        EXPECT_EQ(normalizeIpv6(text), "") << text;
+    }
     EXPECT_EQ(joinHostPort("2001:db8::1", 5001), "[2001:db8::1]:5001");
     EXPECT_EQ(joinHostPort("nas.example", 80), "nas.example:80");
     EXPECT_EQ(toLower("NAS-1.Example"), "nas-1.example");

@@ -63,6 +63,8 @@ TEST_F(NodeInfo, ANodeThatRefusesOrIsAwayKeepsWhatItSaidLast) {
     EXPECT_EQ(cache.GetHostName(), "b");
     EXPECT_TRUE(cache.Update());
     EXPECT_EQ(cache.GetHostName(), "b");
+    EXPECT_EQ(cache.GetCachedAge(), 0) << "when it was asked";
+    EXPECT_EQ(cache.GetLearntAge(), 3661) << "when it answered";
 }
 
 TEST_F(NodeInfo, TheLocalNodeNeedsAWholeAnswer) {

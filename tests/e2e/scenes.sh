@@ -246,8 +246,8 @@ failuresSeenFromBothSides() {
     on 1 0 ovradr cred reverse "$cred" --account back
     on 1 3 ovradr cred reverse "$cred" --account back --endpoint "https://$("$lab" addr 1):5999"
     on 1 7 ovradr cred reverse "$cred" --account nobody
-    account=plain create 1
-    says "granted no session"
+    account=plain create 8
+    says "does not permit"
     remain 1 1 1
     remain 2 1 1
     # The endpoint belongs to another node: this one.

@@ -4,6 +4,8 @@
 #include "output.h"
 #include "provision/node_database.h"
 
+#include <ovrabase/encoding.h>
+#include <ovrabase/utf8.h>
 #include <ovradrnode/node_db.h>
 
 #include <algorithm>
@@ -25,7 +27,17 @@ struct AttrOptions {
     std::string app;
     std::string attr;
     std::string value;
+    bool raw = false;
 };
+
+/// The attribute for scripts. JSON holds no bytes that are not UTF-8, so that the value stands
+/// there in base64 (RFC 4648, section 4) as well.
+Json::Value attrJson(const DRNodeAttr &attr) {
+    Json::Value json = attr.toJson();
+    json["value"] = OvraBase::isUtf8(attr.value) ? Json::Value(attr.value) : Json::Value();
+    json["base64"] = OvraBase::toBase64(attr.value);
+    return json;
+}
 
 std::string checkName(const std::string &name) {
     return name.empty() || name.size() > kMaxName ? "a name has 1 to 255 bytes" : "";
@@ -59,7 +71,7 @@ Outcome set(const AttrOptions &options) {
                        "more.");
     }
     Report report;
-    report.data = attr.toJson();
+    report.data = attrJson(attr);
     return report;
 }
 
@@ -78,8 +90,8 @@ Outcome get(const AttrOptions &options) {
                        "`ovradr attr list NODE APP` shows those that there are.");
     }
     Report report;
-    report.data = found->toJson();
-    report.text = printable(found->value) + "\n";
+    report.data = attrJson(*found);
+    report.text = options.raw ? found->value : printable(found->value) + "\n";
     return report;
 }
 
@@ -101,7 +113,7 @@ Report reportOf(const std::vector<DRNodeAttr> &attrs) {
     report.data["attrs"] = Json::Value(Json::arrayValue);
     std::vector<std::vector<std::string>> rows;
     for (const DRNodeAttr &attr : attrs) {
-        report.data["attrs"].append(attr.toJson());
+        report.data["attrs"].append(attrJson(attr));
         rows.push_back({attr.attr, attr.value});
     }
     report.text = rows.empty() ? "The application keeps no attributes about this node.\n"
@@ -155,6 +167,7 @@ void addAttrCommands(CLI::App &app, Command &chosen) {
         ->check(checkValue);
     setCommand->footer("Example:\n  ovradr attr set 3f2a backup site 'Rack 7, Zürich'");
     unsetCommand->footer("Example:\n  ovradr attr unset 3f2a backup site");
+    getCommand->add_flag("--raw", options->raw, "Its very bytes, and no line break behind them");
     getCommand->footer("Example:\n  ovradr attr get 3f2a backup site");
     addAction(*family, "list", "List the attributes of a node.", options, chosen, list)
         ->footer("Example:\n  ovradr attr list local backup");

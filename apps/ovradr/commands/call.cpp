@@ -3,6 +3,7 @@
 #include "node_ref.h"
 #include "output.h"
 #include "renewal.h"
+#include "usage.h"
 
 #include <ovradrcore/json.h>
 #include <ovradrnode/node_db.h>
@@ -13,6 +14,7 @@
 #include <algorithm>
 #include <fstream>
 #include <iostream>
+#include <limits>
 #include <memory>
 #include <vector>
 
@@ -200,7 +202,7 @@ void addCallCommand(CLI::App &app, Command &chosen) {
     command->add_option("API", options->api, "Name of the API")->required();
     command->add_option("METHOD", options->method, "Its method")->required();
     command->add_option("--version", options->version, "Version of the method (1)")
-        ->check(CLI::PositiveNumber);
+        ->check(wholeNumber(1, std::numeric_limits<int>::max()));
     command
         ->add_option("--param", options->params,
                      "NAME=VALUE, where VALUE is JSON or else text; NAME:=JSON")
@@ -210,7 +212,7 @@ void addCallCommand(CLI::App &app, Command &chosen) {
     command->add_option("--cred", options->credId, "Over this credential and no other");
     command->add_flag("--encrypt", options->encrypt, "Seal the parameters to the receiver");
     command->add_option("--timeout", options->timeout, "Seconds to wait for the answer")
-        ->check(CLI::Range(1L, kMaxTimeout));
+        ->check(wholeNumber(1, kMaxTimeout));
     command->footer("Secrets in the answer show as ***. A parameter that is a secret belongs into "
                     "--params-file.\n"
                     "Examples:\n"

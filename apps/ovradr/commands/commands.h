@@ -15,6 +15,7 @@ using Command = std::function<Outcome()>;
 
 // Each adds a family of commands to the program. Parsing one of them sets `chosen`, which must
 // outlive `app`.
+void addHelpCommand(CLI::App &app, Command &chosen);
 void addSetupCommand(CLI::App &app, Command &chosen);
 void addNodeCommands(CLI::App &app, Command &chosen);
 void addUserCommands(CLI::App &app, Command &chosen);

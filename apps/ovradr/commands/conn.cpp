@@ -5,6 +5,7 @@
 #include "output.h"
 #include "progress.h"
 #include "prompt.h"
+#include "remote_login.h"
 #include "target.h"
 #include "trust.h"
 
@@ -33,7 +34,8 @@ Outcome local() {
     report.data["conns"] = Json::Value(Json::arrayValue);
     std::vector<std::vector<std::string>> rows;
     for (const Conn &conn : Conn::listLocal()) {
-        Json::Value json = conn.toJson();
+        Json::Value json;
+        json["endpoint"] = targetText(conn);
         json["fingerprint"] = ownFingerprint(conn);
         report.data["conns"].append(json);
         rows.push_back({targetText(conn), json["fingerprint"].asString()});
@@ -105,9 +107,11 @@ Outcome forget(const Conn &conn) {
     }
     Report report;
     report.data["endpoint"] = targetText(conn);
-    report.text = printable("The key of " + targetText(conn) +
-                            " is forgotten: nothing is sent there until you trust one again.") +
-                  "\n";
+    report.text =
+        printable("The key of " + targetText(conn) +
+                  " is forgotten: nothing is sent there until you run `ovradr conn trust " +
+                  targetText(conn) + "`.") +
+        "\n";
     return report;
 }
 
@@ -184,8 +188,8 @@ void addTrustCommand(CLI::App &family, Command &chosen) {
     CLI::App *command =
         family.add_subcommand("trust", "Trust the key of an endpoint, also in place of another.");
     addUrl(*command, options->url);
-    command->add_option("--fingerprint", options->fingerprint, "The key, instead of a question")
-        ->check(checkFingerprint);
+    addFingerprintOption(*command, options->fingerprint)
+        ->description("The key, instead of a question");
     command->footer("Examples:\n"
                     "  ovradr conn trust https://nas2\n"
                     "  ovradr conn trust flk:nas3 --fingerprint SHA256:...");

@@ -60,12 +60,15 @@ Outcome list(const CredOptions &options) {
         Json::Value json = credJson(record, temporary);
         json["name"] = name;
         report.data["creds"].append(std::move(json));
-        rows.push_back({name, record.credId, record.nodeId, targetText(record.conn),
-                        temporary ? "temporary" : "lasting"});
+        rows.push_back({name, shortId(record.credId), shortId(record.nodeId),
+                        targetText(record.conn), temporary ? "temporary" : "lasting"});
     }
+    const std::string none = nodeId->empty() ? "There are no credentials"
+                             : options.temporary
+                                 ? "There is no credential for the node " + *nodeId
+                                 : "There is no lasting credential for the node " + *nodeId;
     report.text = rows.empty()
-                      ? "There are no credentials; `ovradr cred create URL --account NAME` "
-                        "makes one.\n"
+                      ? printable(none) + "; `ovradr cred create URL --account NAME` makes one.\n"
                       : table({"NAME", "CREDENTIAL", "NODE", "ENDPOINT", "KIND"}, rows);
     return report;
 }

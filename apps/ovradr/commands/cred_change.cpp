@@ -51,13 +51,13 @@ Refusal setFailure(const DRNodeCredSet &flow, const Conn &conn) {
                        "The credential is as it was. The system log says why; correct that and "
                        "try again.");
     }
-    Failure found = withClock(failureOf(flow), conn).value();
+    Refusal found = withClock(credFlowFailure(flow, flow.getSessionError(), conn), conn);
     if (flow.GetErrCode() == ERR::kOtherNode) {
-        found.message = "This is another node than the one that the credential is for.";
-        found.hint = "Check the URL, or make a new credential with `ovradr cred create`.";
+        found.value().message =
+            targetText(conn) + ": This is another node than the one that the credential is for.";
+        found.value().hint = "Check the URL, or make a new credential with `ovradr cred create`.";
     }
-    found.message.insert(0, targetText(conn) + ": ");
-    return Refusal(found);
+    return found;
 }
 
 /// What an update did.

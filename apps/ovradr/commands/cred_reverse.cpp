@@ -40,10 +40,11 @@ Outcome report(const ReverseOptions &options, const DRNode &via, const CredRever
     if (!made.isObject()) {
         return reverseFailure(flow);
     }
-    report.data["made"] = OvraDRCore::maskSecrets(made);
-    report.data["node_id"] = via.nodeId;
-    report.data["temporary"] = options.temporary;
     const Conn conn = Conn::fromJson(made);
+    report.data["cred_id"] = memberString(made, "cred_id");
+    report.data["node_id"] = via.nodeId;
+    report.data["endpoint"] = conn.isValid() ? Json::Value(targetText(conn)) : Json::Value();
+    report.data["temporary"] = options.temporary;
     report.text = listing({{"credential", memberString(made, "cred_id")},
                            {"held by", via.nodeId},
                            {"endpoint", conn.isValid() ? targetText(conn) : ""},

@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "commands/cred_commands.h"
 #include "cred_report.h"
+#include "endpoint.h"
 #include "node_ref.h"
 #include "renewal.h"
 #include "target.h"
@@ -19,6 +20,11 @@ using OvraDRNode::DRNode;
 namespace WebAPI = OvraDRNode::WebAPI;
 
 Outcome test(const FoundCred &cred) {
+    // Now, whatever others found before.
+    const auto answers = directEndpoint(cred.record.conn).and_then(probeEndpoint);
+    if (!answers) {
+        return Refusal(answers.error());
+    }
     OvraDRNode::CredNodeSender sender(cred.record);
     return testCred(sender, cred).map([](Report report) {
         report.text += "It works.\n";
@@ -32,7 +38,7 @@ Outcome testCred(OvraDRNode::BaseSender &sender, const FoundCred &cred) {
     const DRNode &record = cred.record;
     const auto refusal = [&](const Response &response) {
         Refusal found = credFailure(failureOf(errorOf(sender, response)), record.credId);
-        found.value().message.insert(0, targetText(record.conn) + ": ");
+        nameEndpoint(found.value(), record.conn);
         return found;
     };
     const Response info = sender.process(WebAPI::getDRNodeInfoAPI({}));

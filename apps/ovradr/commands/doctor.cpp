@@ -6,6 +6,7 @@
 #include "node_ref.h"
 #include "node_view.h"
 #include "output.h"
+#include "remote_login.h"
 #include "target.h"
 #include "trust.h"
 
@@ -102,7 +103,7 @@ Outcome examineUrl(const DoctorOptions &options) {
 }
 
 bool isUrl(const std::string &text) {
-    return text.find("://") != std::string::npos || text.starts_with("flk:");
+    return text.find("://") != std::string::npos || text.find("flk:") != std::string::npos;
 }
 
 Outcome doctor(const DoctorOptions &options) {
@@ -133,12 +134,8 @@ void addDoctorCommand(CLI::App &app, Command &chosen) {
     CLI::Option *account =
         command->add_option("--account", options->account, "Try a log-in with this account");
     addPasswordOptions(*command, options->password);
-    command->add_option("--otp", options->oneTimeCode, "One-time code of the account")
-        ->needs(account);
-    command
-        ->add_option("--fingerprint", options->fingerprint, "The key that the endpoint must have")
-        ->needs(account)
-        ->check(checkFingerprint);
+    addOneTimeCodeOption(*command, options->oneTimeCode)->needs(account);
+    addFingerprintOption(*command, options->fingerprint)->needs(account);
     command->footer("Each step that can fail has an exit code of its own.\n"
                     "Examples:\n"
                     "  ovradr doctor\n"

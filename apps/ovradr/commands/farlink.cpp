@@ -3,9 +3,11 @@
 #include "commands/commands.h"
 #include "output.h"
 #include "progress.h"
+#include "remote_login.h"
 #include "target.h"
 #include "trust.h"
 
+#include <ovrabase/address.h>
 #include <ovradrcore/json.h>
 #include <ovradrcore/response.h>
 #include <ovradrnode/sender.h>
@@ -49,7 +51,8 @@ Conn serverOf(const FarlinkSettings &settings) {
 }
 
 /// The service named by the user: https://HOST[:5443].
-Expected<FarlinkSettings> parseServer(const std::string &text) {
+Expected<FarlinkSettings> parseServer(const std::string &given) {
+    const std::string text = OvraBase::trimmed(given);
     const std::size_t host = text.find("://");
     const bool hasPort =
         host != std::string::npos &&
@@ -137,7 +140,8 @@ Outcome enable(const FarlinkOptions &options) {
     }
     FarlinkSettings settings = *server;
     settings.alias = options.alias;
-    if (const auto trusted = trustPeer(serverOf(settings), options.fingerprint); !trusted) {
+    if (const auto trusted = trustPeer(serverOf(settings), options.fingerprint, kShownByRelay);
+        !trusted) {
         return Refusal(trusted.error());
     }
     Report report;
@@ -270,9 +274,7 @@ void addFarlinkCommands(CLI::App &app, Command &chosen) {
         ->add_option("--alias", options->alias,
                      "Name of this appliance there; without one it only reaches others")
         ->check(checkAlias);
-    enableCommand
-        ->add_option("--fingerprint", options->fingerprint, "The key that the service must have")
-        ->check(checkFingerprint);
+    addFingerprintOption(*enableCommand, options->fingerprint);
     enableCommand->footer("Example:\n"
                           "  ovradr farlink enable --server https://relay.example --alias nas1");
     enableCommand->callback(

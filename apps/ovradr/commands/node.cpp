@@ -9,6 +9,7 @@
 #include "target.h"
 
 #include <ovradrcore/json.h>
+#include <ovradrnode/cred_permission_cache.h>
 #include <ovradrnode/node_api.h>
 #include <ovradrnode/node_cache.h>
 #include <ovradrnode/sender.h>
@@ -70,6 +71,21 @@ Outcome nodeId(const NodeIdOptions &options) {
     });
 }
 
+/// Has the node be asked whatever was found before: what stands against it is checked anew.
+void dropVerdicts(const std::string &nodeId) {
+    for (const NodeCandidate &candidate : OvraDRNode::listNodeCandidates(nodeId)) {
+        const auto stands = [](const CachedVerdict &verdict) {
+            return verdict.known && verdict.fresh && !verdict.value;
+        };
+        if (stands(candidate.reachable)) {
+            (void)OvraDRNode::CredNodeSender::IsConnectable(candidate.node);
+        }
+        if (stands(candidate.privilege)) {
+            (void)OvraDRNode::CredPermissionCache(candidate.node.credId).Update();
+        }
+    }
+}
+
 /// What a node says about itself, asked now.
 Expected<Json::Value> askNode(const std::string &nodeId) {
     OvraDRNode::NodeSender sender(nodeId);
@@ -88,22 +104,23 @@ Outcome nodeInfo(const std::string &nodeId, bool refresh) {
         info = cache.Read();
     }
     if (!info.isObject()) {
+        dropVerdicts(nodeId);
         const Expected<Json::Value> asked = askNode(nodeId);
         if (!asked) {
             return Refusal(asked.error());
         }
         info = *asked;
-        cache.UpdateWithData(info);
+        cache.Learn(info);
     }
     const bool local = DRNode::isLocalNodeId(nodeId);
     const CachedVerdict reachable = reachability(OvraDRNode::listNodeCandidates(nodeId));
-    const double age = cache.GetCachedAge();
+    const double age = cache.GetLearntAge();
     const NodeName name = OvraApps::NodeNames({nodeId}).of(nodeId);
     Report report;
     report.data = nodeJson(nodeId, name);
     report.data["local"] = local;
     report.data["info"] = info;
-    report.data["age"] = age;
+    report.data["age"] = age < 0 ? Json::Value() : Json::Value(tenths(age));
     report.data["reachable"] = local ? Json::Value(true) : toJson(reachable);
     report.text =
         listing({{"name", name.given},
@@ -112,7 +129,7 @@ Outcome nodeInfo(const std::string &nodeId, bool refresh) {
                  {"host name", OvraDRCore::memberString(info, "hostname")},
                  {"serial number", OvraDRCore::memberString(info, "serial")},
                  {"time zone", OvraDRCore::memberString(info.get("additional", {}), "timezone")},
-                 {"asked", age < 0 ? "" : ageText(age) + " ago"},
+                 {"learnt", age < 0 ? "" : ageText(age) + " ago"},
                  {"answers", local ? "this node" : verdictText(reachable)}});
     return report;
 }
@@ -131,7 +148,7 @@ void addRow(const std::string &nodeId, const NodeName &name,
     json["cred_id"] = next == nullptr ? Json::Value() : Json::Value(next->node.credId);
     json["endpoint"] = next == nullptr ? Json::Value() : Json::Value(targetText(next->node.conn));
     report.data["nodes"].append(std::move(json));
-    rows.push_back({name.shown(), nodeId, local ? "this node" : verdictText(reachable),
+    rows.push_back({name.shown(), shortId(nodeId), local ? "this node" : verdictText(reachable),
                     std::to_string(candidates.size()),
                     next == nullptr ? "" : shortId(next->node.credId),
                     next == nullptr ? "" : targetText(next->node.conn)});

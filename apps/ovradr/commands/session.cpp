@@ -92,8 +92,8 @@ Expected<void> confirmRevocation(const SelectOptions &options,
         return failure(ExitCode::kUsage, "There is no terminal on which this could be confirmed.",
                        "Add --yes if you mean it.");
     }
-    return confirm("Nodes that use these " + std::to_string(sessions.size()) +
-                   " sessions will have to pair with this one again. End them?")
+    return confirm(counted(sessions.size(), "session") +
+                   " would end; nodes that use them have to pair with this one again. Go on?")
                ? Expected<void>()
                : failure(ExitCode::kFailed, "The sessions stay.", "");
 }
@@ -121,8 +121,7 @@ Outcome revoke(const SelectOptions &options) {
         return Refusal(ended.error());
     }
     Report report = reportOf(*sessions, "revoked");
-    report.text = "Ended: " + std::to_string(sessions->size()) +
-                  (sessions->size() == 1 ? " session.\n" : " sessions.\n");
+    report.text = "Ended: " + counted(sessions->size(), "session") + ".\n";
     return report;
 }
 

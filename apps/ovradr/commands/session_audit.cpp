@@ -146,7 +146,8 @@ Json::Value toJson(const Audit &audit) {
         json["sessions"].append(entry);
     }
     for (const HeldCred &cred : audit.held) {
-        Json::Value entry = cred.conn.toJson();
+        Json::Value entry;
+        entry["endpoint"] = targetText(cred.conn);
         entry["cred_id"] = cred.credId;
         entry["reference"] = cred.reference;
         entry["temporary"] = cred.temporary;
@@ -160,14 +161,14 @@ std::string toText(const Audit &audit) {
     std::vector<std::vector<std::string>> rows;
     for (const GrantedSession &session : audit.granted) {
         if (audit.isOrphan(session)) {
-            rows.push_back({session.reference(), session.record.user, "", "",
+            rows.push_back({shortId(session.reference()), session.record.user, "", "",
                             "orphan: no credential over there uses it"});
         }
     }
     for (const HeldCred &cred : audit.held) {
         const auto account = audit.live.find(cred.reference);
         rows.push_back({cred.reference, account == audit.live.end() ? "" : account->second,
-                        cred.credId, targetText(cred.conn),
+                        shortId(cred.credId), targetText(cred.conn),
                         audit.isOrphan(cred) ? "orphan: its session is gone here" : "in use"});
     }
     return rows.empty()
@@ -176,8 +177,7 @@ std::string toText(const Audit &audit) {
 }
 
 std::string countText(std::size_t sessions, std::size_t creds) {
-    return std::to_string(sessions) + (sessions == 1 ? " session" : " sessions") + " here, " +
-           std::to_string(creds) + (creds == 1 ? " credential" : " credentials") + " over there";
+    return counted(sessions, "session") + " here, " + counted(creds, "credential") + " over there";
 }
 
 Expected<void> confirmRevocation(bool yes, const std::string &found, std::size_t sessions,

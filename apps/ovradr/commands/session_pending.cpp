@@ -1,12 +1,16 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "commands/session_commands.h"
 #include "cred_report.h"
+#include "endpoint.h"
 #include "node_ref.h"
 #include "output.h"
 #include "target.h"
 
+#include <ovradrnode/sender.h>
+
 #include <algorithm>
 #include <memory>
+#include <optional>
 #include <set>
 #include <vector>
 
@@ -27,7 +31,7 @@ Json::Value toJson(const PendingRelease &release) {
     json["reference"] = release.reference();
     json["node_id"] = release.nodeId;
     json["cred_id"] = release.credId;
-    json["conn"] = release.conn.toJson();
+    json["endpoint"] = targetText(release.conn);
     json["noted"] = Json::Int64(release.noted);
     json["attempts"] = release.attempts;
     json["next_try"] = Json::Int64(release.nextTry);
@@ -39,12 +43,12 @@ std::vector<std::string> toRow(const PendingRelease &release, const std::string 
     // Noted by a command that is still in progress, or was killed.
     const bool fresh = release.attempts == 0;
     return {name,
-            release.reference(),
-            release.nodeId,
+            shortId(release.reference()),
+            shortId(release.nodeId),
             targetText(release.conn),
-            timeText(release.noted),
+            whenText(release.noted),
             std::to_string(release.attempts),
-            timeText(release.nextTry),
+            whenText(release.nextTry),
             fresh ? "not tried yet" : failureOf(release.code).value().message};
 }
 
@@ -90,17 +94,31 @@ Outcome forget(PendingReleases &store, const std::vector<PendingRelease> &releas
     return report;
 }
 
-/// Tries each once, even if not due, and reports the result.
-Report retry(PendingReleases &store, const std::vector<PendingRelease> &releases) {
+/// Tries each once, even if not due and whatever was found about its endpoint before, and reports
+/// the result: the first failure, if a session is left behind.
+Outcome retry(PendingReleases &store, const std::vector<PendingRelease> &releases) {
     Report report;
     report.data["tried"] = Json::Value(Json::arrayValue);
+    std::optional<Failure> left;
     for (const PendingRelease &release : releases) {
+        (void)directEndpoint(release.conn).map(OvraDRNode::BaseSender::IsConnectable);
         const OvraApps::Release result = OvraApps::retryRelease(release, store);
         Json::Value json = toJson(release);
         addRelease(json, result);
         report.data["tried"].append(json);
         report.text += release.reference() + " at " + printable(targetText(release.conn)) + ": " +
                        printable(releaseText(result, false)) + "\n";
+        if (!left && result.state == OvraApps::Release::State::kLeft) {
+            left = failureOf(result.code, result.detail).value();
+            if (result.code == OvraDRCore::ERR::kNotConnectable) {
+                addReason(*left, release.conn);
+            }
+        }
+    }
+    if (left) {
+        left->data = report.data;
+        left->text = report.text;
+        return Refusal(*left);
     }
     if (releases.empty()) {
         report.text = reportOf(releases).text;
@@ -117,7 +135,7 @@ Outcome pending(const PendingOptions &options) {
     if (!options.forget.empty()) {
         return forget(store, releases, options.forget);
     }
-    return options.retry ? retry(store, releases) : reportOf(releases);
+    return options.retry ? retry(store, releases) : Outcome(reportOf(releases));
 }
 
 } // namespace

@@ -6,6 +6,7 @@
 #include "provision/data_files.h"
 #include "provision/node_database.h"
 #include "service/certificate.h"
+#include "usage.h"
 
 #include <ovrabase/address.h>
 #include <ovrabase/number.h>
@@ -292,9 +293,9 @@ void addSetupCommand(CLI::App &app, Command &chosen) {
                      "Numeric addresses to serve at, separated by commas; \"\" for all")
         ->check(usableAs(Setting::kAddress));
     command->add_option("--http-port", settings->httpPort, "Port for HTTP (5000)")
-        ->check(CLI::Range(1, OvraBase::kMaxPort));
+        ->check(wholeNumber(1, OvraBase::kMaxPort));
     command->add_option("--https-port", settings->httpsPort, "Port for HTTPS (5001)")
-        ->check(CLI::Range(1, OvraBase::kMaxPort));
+        ->check(wholeNumber(1, OvraBase::kMaxPort));
     command->footer("What is there already stays as it is.\n"
                     "Examples:\n"
                     "  ovradr setup\n"

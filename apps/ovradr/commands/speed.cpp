@@ -6,6 +6,7 @@
 #include "provision/node_database.h"
 #include "rate.h"
 #include "target.h"
+#include "usage.h"
 
 #include <ovradrnode/node.h>
 #include <ovradrnode/sender.h>
@@ -190,11 +191,11 @@ void addSpeedCommand(CLI::App &app, Command &chosen) {
         "The node that downloads from this one: its name, its id, or the beginning of it");
     command->add_option("--url", options->url, "Download from this URL to here instead");
     command->add_option("--retries", options->retries, "Further attempts at each endpoint (1)")
-        ->check(CLI::Range(0, kMaxRetries));
+        ->check(wholeNumber(0, kMaxRetries));
     command
         ->add_option("--timeout", options->seconds,
                      "Seconds for each endpoint (15), at most 45; 600 with --url")
-        ->check(CLI::Range(1, kMaxUrlSeconds));
+        ->check(wholeNumber(1, kMaxUrlSeconds));
     command->footer(
         "The endpoints of this appliance are tried one after the other until one works.\n"
         "Examples:\n"

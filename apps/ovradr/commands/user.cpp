@@ -34,6 +34,8 @@ struct UserOptions {
     std::string role;
     bool off = false;
     bool show = false;
+    bool yes = false;
+    bool dryRun = false;
     PasswordSource password;
 };
 
@@ -112,8 +114,15 @@ Role chosenRole(const UserOptions &options) {
     return options.administrator ? Role::kAdministrator : Role::kUser;
 }
 
-std::string endedText(int sessions) {
-    return sessions == 0 ? "" : " Its sessions (" + std::to_string(sessions) + ") have ended.";
+Expected<int> countSessions(const std::string &user) {
+    SessionStore store;
+    std::vector<SessionRecord> sessions;
+    if (!store.isOpen() || !store.list(sessions)) {
+        return storeFailure(ExitCode::kNotSetUp, store.error());
+    }
+    return static_cast<int>(
+        std::count_if(sessions.begin(), sessions.end(),
+                      [&user](const SessionRecord &session) { return session.user == user; }));
 }
 
 Outcome add(const UserOptions &options) {
@@ -160,7 +169,7 @@ Outcome list() {
         const char *login = !account.remoteLogin ? "not over the network" : "yes";
         rows.push_back({account.name, OvraPlatform::roleWord(account.role),
                         account.disabled ? "disabled" : login, account.oneTimeCode ? "yes" : "no",
-                        timeText(account.created)});
+                        whenText(account.created)});
     }
     report.text = rows.empty()
                       ? "There are no accounts; `ovradr user add NAME` makes one.\n"
@@ -267,8 +276,47 @@ Outcome setDisabled(AccountStore &store, const Account &account, const UserOptio
                             : " is disabled; its sessions rest until it is enabled again."));
 }
 
+Expected<void> confirmRemoval(const std::string &name, int sessions) {
+    if (!isInteractive()) {
+        return failure(ExitCode::kUsage, "There is no terminal on which this could be confirmed.",
+                       "Add --yes if you mean it; --dry-run tells what would end.");
+    }
+    return confirm(printable("The account " + name + " has " +
+                             counted(static_cast<std::size_t>(sessions), "session") +
+                             ", which would end; nodes that use them have to pair again. Remove "
+                             "it?"))
+               ? Expected<void>()
+               : failure(ExitCode::kFailed, "The account stays.", "");
+}
+
+Report removalReport(const std::string &name, int sessions, bool foreseen) {
+    Report report;
+    report.data["name"] = name;
+    report.data[foreseen ? "would_end_sessions" : "ended_sessions"] = sessions;
+    const std::string ends =
+        sessions == 0 ? "."
+                      : ", and " + counted(static_cast<std::size_t>(sessions), "session") +
+                            (foreseen ? " of it would end." : " of it ended.");
+    report.text = printable("The account " + name +
+                            (foreseen ? " would be removed" : " was removed") + ends) +
+                  "\n";
+    return report;
+}
+
 /// Disabled first: nothing is granted to it meanwhile, and an interrupted removal can be repeated.
-Outcome remove(AccountStore &store, const Account &account, const UserOptions & /*options*/) {
+Outcome remove(AccountStore &store, const Account &account, const UserOptions &options) {
+    const Expected<int> present = countSessions(account.name);
+    if (!present) {
+        return Refusal(present.error());
+    }
+    if (options.dryRun) {
+        return removalReport(account.name, *present, true);
+    }
+    if (*present > 0 && !options.yes) {
+        if (const auto confirmed = confirmRemoval(account.name, *present); !confirmed) {
+            return Refusal(confirmed.error());
+        }
+    }
     if (!store.setDisabled(account.name, true)) {
         return storeFailure(ExitCode::kFailed, store.error());
     }
@@ -279,12 +327,7 @@ Outcome remove(AccountStore &store, const Account &account, const UserOptions & 
     if (!store.remove(account.name)) {
         return storeFailure(ExitCode::kFailed, store.error());
     }
-    Report report;
-    report.data["name"] = account.name;
-    report.data["ended_sessions"] = *ended;
-    report.text =
-        printable("The account " + account.name + " was removed." + endedText(*ended)) + "\n";
-    return report;
+    return removalReport(account.name, *ended, false);
 }
 
 /// Performs an operation on the named account.
@@ -362,7 +405,11 @@ void addUserCommands(CLI::App &app, Command &chosen) {
 
     CLI::App *removal = addUserCommand(*family, "remove", "Remove an account and end its sessions.",
                                        options, chosen, onAccount<remove>);
-    removal->footer("Example:\n  ovradr user remove repl");
+    removal->add_flag("--yes", options->yes, "Do not ask, also when it has sessions");
+    removal->add_flag("--dry-run", options->dryRun, "Only tell what would end");
+    removal->footer("Examples:\n"
+                    "  ovradr user remove repl --dry-run\n"
+                    "  ovradr user remove repl");
 }
 
 } // namespace Ovradr

@@ -51,6 +51,7 @@ Report why(const std::string &nodeId) {
         const NodeCandidate &candidate = candidates[i];
         const std::string reason = reasonText(candidates, i);
         Json::Value json = candidate.toJson();
+        json["endpoint"] = targetText(candidate.node.conn);
         json["reason"] = reason;
         report.data["candidates"].append(json);
         rows.push_back({shortId(candidate.node.credId), targetText(candidate.node.conn),

@@ -28,7 +28,8 @@ bool isNumericAddress(const std::string &text);
 bool isIpv6LinkLocal(const std::string &text);
 
 /// The canonical form of an IPv6 address (RFC 5952), with or without brackets; "" for any other
-/// text.
+/// text. A link-local one may name its link: "fe80::1%eth0", or "fe80::1%25eth0" as in a URL (RFC
+/// 6874).
 std::string normalizeIpv6(std::string text);
 
 /// The numeric text of a socket address, without port; an IPv4-mapped address as IPv4. "" for
@@ -46,6 +47,9 @@ bool isHostName(std::string_view text);
 
 /// "host:port", with an IPv6 address in brackets.
 std::string joinHostPort(const std::string &host, int port);
+
+/// The text without the white space around it.
+std::string trimmed(std::string_view text);
 
 /// The text with its ASCII letters in lower case.
 std::string toLower(std::string_view text);

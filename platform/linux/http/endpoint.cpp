@@ -83,7 +83,9 @@ std::optional<std::string> Endpoint::url(const std::string &path) const {
     if (!clean || path.size() > kMaxPath) {
         return std::nullopt;
     }
-    return key() + (path.starts_with('/') ? "" : "/") + path;
+    // The other end has no use for the name of a link here (RFC 6874, 1).
+    return protocol_ + "://" + OvraBase::joinHostPort(host_.substr(0, host_.find('%')), port_) +
+           (path.starts_with('/') ? "" : "/") + path;
 }
 
 } // namespace OvraPlatform

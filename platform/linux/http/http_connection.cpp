@@ -193,7 +193,7 @@ bool HttpConnection::setUp() {
     // dial() finds the address; this one only keeps libcurl from asking for it as well (RFC 5737).
     const bool listed =
         append(headers_, "Accept: application/json") && append(headers_, "Expect:") &&
-        (OvraBase::isNumericAddress(host) ||
+        (endpoint_.isIpv6() || OvraBase::isNumericAddress(host) ||
          append(addresses_, OvraBase::joinHostPort(host, endpoint_.port()) + ":192.0.2.1"));
     if (!listed) {
         return false;

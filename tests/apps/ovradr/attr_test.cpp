@@ -25,6 +25,10 @@ TEST(Attributes, AreSetReadAndListedPerNodeAndApplication) {
               "n1-remote");
     EXPECT_EQ(run({"attr", "unset", "n1", "app", "k"}).exit, 0);
     EXPECT_EQ(run({"attr", "unset", "n1", "app", "k"}).exit, 7);
+    ASSERT_EQ(run({"attr", "set", "n1", "app", "k", "\xff\n"}).exit, 0);
+    EXPECT_EQ(run({"attr", "get", "n1", "app", "k", "--raw"}).out, "\xff\n");
+    const Json::Value data = run({"attr", "get", "n1", "app", "k", "--json"}).json()["data"];
+    EXPECT_TRUE(data["value"].isNull() && data["base64"] == "/wo=") << data;
     EXPECT_EQ(run({"attr", "set", "n1", "", "k", "v"}).exit, 2);
     EXPECT_EQ(run({"attr", "set", "nowhere", "app", "k", "v"}).exit, 7);
 }

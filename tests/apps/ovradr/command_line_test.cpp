@@ -14,10 +14,6 @@ TEST(CommandLine, EveryFailureIsOneSentenceForPeopleAndOneDocumentForScripts) {
     const std::string dead = "https://127.0.0.1:" + std::to_string(OvraTest::unusedPort());
     ASSERT_EQ(run({"setup"}).exit, 0);
     const std::tuple<Arguments, int, const char *> cases[] = {
-        {Arguments{}, 2, "usage"},
-        {{"nonsense"}, 2, "usage"},
-        {{"user"}, 2, "usage"},
-        {{"user", "add"}, 2, "usage"},
         {{"user", "add", "b\x1b[2Jb", "--password-stdin"}, 2, "usage"},
         {{"cred", "list", "--bogus"}, 2, "usage"},
         {{"cred", "create", "nas2", "--account", "bob", "--password-stdin"}, 2, "usage"},
@@ -92,12 +88,42 @@ TEST(CommandLine, SaysToAnOrdinaryUserWhichFileHeCannotReadAndNothingElse) {
     EXPECT_FALSE(std::filesystem::exists("/tmp/.ovradrcache")) << "it would be his";
 }
 
+TEST(CommandLine, WhatIsMistypedIsNamedWithWhatWasMeant) {
+    const std::tuple<Arguments, const char *, const char *> cases[] = {
+        {Arguments{}, "A command is missing.", "`ovradr`"},
+        {{"user"}, "A command is missing.", "`ovradr user`"},
+        {{"crd", "list"}, R"("ovradr crd")", "Did you mean `ovradr cred`? There are: help, "},
+        {{"cred", "lsit"}, R"("ovradr cred lsit")", "Did you mean `ovradr cred list`?"},
+        {{"attr", "delete", "x"}, R"("ovradr attr delete")", "There are: "},
+        {{"help", "cred", "creat"}, R"("ovradr cred creat")", "`ovradr cred create`"},
+        {{"-v"}, "no option -v.", "--version"},
+        {{"cred", "list", "--nod=x"}, "no option --nod.", "--node? `ovradr cred list --help`"},
+        {{"user", "add"}, "NAME is missing.", "`ovradr user add --help`"},
+        {{"call", "x"}, "API and METHOD are missing.", "ovradr call"},
+        {{"cred", "show", "a", "b"}, "more arguments than", "ovradr cred show"},
+        {{"call", "x", "A", "m", "--version", "0"}, "--version: a whole number from 1 to ", ""},
+        {{"session", "revoke", "--all", "x"}, "SESSION and --all do not go together.", ""},
+        {{"node", "id", "--yes"}, "--yes is of use only with --reset.", ""},
+        {{"user", "add", "--password-file"}, "--password-file needs a value.", ""},
+        {{"call", "--cred", "a", "--cred", "b"}, "--cred is given more than once.", ""},
+        {{"--json=x", "node", "id"}, "--json takes no value.", ""},
+    };
+    for (const auto &[arguments, message, hint] : cases) {
+        const Result result = run(arguments);
+        EXPECT_EQ(result.exit, 2);
+        EXPECT_NE(result.err.find(message), std::string::npos) << result.err;
+        EXPECT_NE(result.err.find(hint), std::string::npos) << result.err;
+    }
+}
+
 TEST(CommandLine, HelpAndVersionAreNoFailures) {
     EXPECT_EQ(run({"--version"}).out, "ovradr " OVRADR_VERSION "\n");
-    EXPECT_NE(run({"cred", "crate"}).err.find("no such command"), std::string::npos);
-    const Result help = run({"call", "--help"});
+    EXPECT_EQ(run({"--version", "--json"}).json()["data"]["version"], OVRADR_VERSION);
+    const Result help = run({"cred", "create", "--help"});
     EXPECT_EQ(help.exit, 0);
-    EXPECT_NE(help.out.find("Example"), std::string::npos) << help.out;
+    EXPECT_EQ(run({"help", "cred", "create"}).out, help.out);
+    EXPECT_EQ(run({"help", "cred", "create", "--json"}).json()["data"]["help"], help.out);
+    EXPECT_EQ(run({}).out, run({"help"}).out + "\n");
 }
 
 TEST(CommandLine, OutputThatCannotBeWrittenIsAFailure) {

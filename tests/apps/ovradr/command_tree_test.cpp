@@ -1,5 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "command_tree.h"
+#include "output.h"
 #include "support/doc_page.h"
 
 #include <gtest/gtest.h>
@@ -9,6 +10,7 @@
 #include <optional>
 #include <regex>
 #include <set>
+#include <sstream>
 
 namespace {
 
@@ -159,6 +161,17 @@ TEST_F(CommandTree, ShowsAnExampleOfEveryCommand) {
     for (const auto &[command, node] : commands_) {
         EXPECT_NE(node->get_footer().find("ovradr " + command), std::string::npos)
             << "--help of `ovradr " << command << "` has no example: add one to its footer";
+    }
+}
+
+TEST_F(CommandTree, HasHelpOfEightyColumns) {
+    for (const auto &[command, node] : commands_) {
+        for (const CLI::App *app : {node, node->get_parent()}) {
+            std::istringstream lines(app == nullptr ? "" : app->help());
+            for (std::string line; std::getline(lines, line);) {
+                EXPECT_LE(Ovradr::displayWidth(line), 80U) << command << ": " << line;
+            }
+        }
     }
 }
 

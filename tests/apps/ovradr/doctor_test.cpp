@@ -4,7 +4,9 @@
 
 #include <sys/resource.h>
 
+#include <algorithm>
 #include <csignal>
+#include <sstream>
 
 namespace OvradrTest {
 
@@ -117,6 +119,20 @@ TEST_F(Diagnosis, OfTheApplianceSeesWhatItsDaemonWouldNotServeWith) {
     Terminal shown({"doctor"});
     EXPECT_EQ(shown.finish(), 3);
     EXPECT_EQ(shown.screen().find("ovradr: "), std::string::npos) << "it is above already";
+}
+
+TEST_F(Diagnosis, FitsTheTerminalUnlessItMayBeWide) {
+    for (const bool wide : {false, true}) {
+        Terminal terminal(Arguments{"doctor", "https://no-such-host.invalid"} +
+                          (wide ? Arguments{"--wide"} : Arguments{}));
+        EXPECT_EQ(terminal.finish(), 10);
+        std::istringstream lines(terminal.screen());
+        std::size_t longest = 0;
+        for (std::string line; std::getline(lines, line) && line.find("ovradr: ") != 0;) {
+            longest = std::max(longest, line.find_last_not_of('\r') + 1);
+        }
+        EXPECT_EQ(longest > 80, wide) << terminal.screen();
+    }
 }
 
 } // namespace OvradrTest

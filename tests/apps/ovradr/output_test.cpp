@@ -39,6 +39,14 @@ TEST(Output, NothingThatATerminalObeysGetsThrough) {
     EXPECT_EQ(prettyJson("\x7f\u202e"), "\"\\u007f\\u202e\"\n");
 }
 
+TEST(Output, NumbersOfThingsAndTimesReadWell) {
+    EXPECT_EQ(counted(1, "session") + ", " + counted(0, "session"), "1 session, 0 sessions");
+    EXPECT_EQ(whenText(std::time(nullptr) - 7200), "2 h ago");
+    EXPECT_EQ(whenText(std::time(nullptr) + 300000), "in 3 d");
+    EXPECT_EQ(tenths(2.6886), 2.7);
+    EXPECT_EQ(wrapped("aa \u00e4\u00e4 cc", 6, 1), " aa \u00e4\u00e4\n cc");
+}
+
 TEST(Output, ColumnsLineUpWhateverTheCellsHold) {
     EXPECT_EQ(table({"NAME", "ROLE", "LAST"}, {{"bob", "user", "1"},
                                                {"\xC3\xA4", "\xE6\x97\xA5\xE6\x9C\xAC", "2"},

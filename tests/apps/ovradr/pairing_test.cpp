@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 // The program against a node with scripted answers.
 #include "scripted_node.h"
+#include "shared/pending_releases.h"
 
 #include <ovraplatform/appliance.h>
 
@@ -34,21 +35,31 @@ protected:
 
 TEST_F(Pairing, StoresACredentialAndShowsNothingSecretOfIt) {
     const std::string temporary = pair({"--temp"})["cred_id"].asString();
-    const std::string id = pair({"--otp", "123456"})["cred_id"].asString();
+    const std::string id = pair({"--otp", " 123 456\n"})["cred_id"].asString();
     EXPECT_NE(remote.params("login").find(R"("otp_code":"123456")"), std::string::npos);
     EXPECT_EQ(credentials(), paired);
     EXPECT_TRUE(run({"cred", "show", temporary, "--json"}).json()["data"]["temporary"].asBool());
     for (const Arguments &arguments : {Arguments{"cred", "list", "--temp"},
                                        {"cred", "list"},
-                                       {"cred", "list", "--json", "--node", "n"},
                                        {"cred", "show", id.substr(0, 8)},
-                                       {"cred", "show", id, "--json"}}) {
+                                       {"cred", "list", "--json", "--node", "n"},
+                                       {"cred", "show", id, "--json"},
+                                       {"why", "n1", "--json"}}) {
         const Result result = run(arguments);
         EXPECT_EQ(result.exit, 0) << result.err;
-        EXPECT_NE(result.out.find(id), std::string::npos) << result.out;
+        const bool table = arguments[1] == "list" && result.out.front() != '{';
+        EXPECT_EQ(result.out.find(id) == std::string::npos, table) << "short in a table";
+        EXPECT_NE(result.out.find(id.substr(0, 8)), std::string::npos) << result.out;
+        EXPECT_NE(result.out.find(url), std::string::npos) << result.out;
+        EXPECT_EQ(result.out.find(R"("addr")"), std::string::npos) << "one form of an endpoint";
         EXPECT_EQ(result.out.find("s3cret"), std::string::npos) << result.out;
-        EXPECT_EQ(result.out.find(temporary) != std::string::npos, arguments.back() == "--temp");
+        EXPECT_EQ(result.out.find(temporary.substr(0, 8)) != std::string::npos,
+                  arguments.back() == "--temp" || arguments[0] == "why");
     }
+    EXPECT_NE(run({"cred", "list", "--wide"}).out.find(id), std::string::npos);
+    EXPECT_NE(
+        run({"cred", "list", "--node", "local"}).out.find("no lasting credential for the node"),
+        std::string::npos);
 }
 
 TEST_F(Pairing, NothingSecretIsSentToAKeyThatNobodyTrusts) {
@@ -70,7 +81,7 @@ TEST_F(Pairing, NothingSecretIsSentToAKeyThatNobodyTrusts) {
 }
 
 TEST_F(Pairing, AKeyThatChangedOrWasForgottenOrLostIsRefusedUntilAPersonTrustsIt) {
-    pair();
+    const std::string credId = pair()["cred_id"].asString();
     const std::string old = remote.server.fingerprint();
     remote.server.changeCertificate();
     const Arguments trust{"conn", "trust", url};
@@ -95,6 +106,9 @@ TEST_F(Pairing, AKeyThatChangedOrWasForgottenOrLostIsRefusedUntilAPersonTrustsIt
     remote.forgetCalls();
     EXPECT_EQ(run({"call", "n1", "OVRA.DR.Node", "info"}).exit, 6);
     EXPECT_EQ(run({"doctor", "n1"}).exit, 6);
+    const Result distrusted = run({"cred", "test", credId});
+    EXPECT_NE(distrusted.err.find("`ovradr conn trust " + url + "`"), std::string::npos)
+        << distrusted.err;
     EXPECT_EQ(remote.calls().find("s3cret"), std::string::npos) << remote.calls();
     EXPECT_EQ(run(named + Arguments{"--json"}).json()["data"]["before"], "forgotten");
     EXPECT_EQ(logIn(remote, create).exit, 0);
@@ -155,7 +169,8 @@ TEST_F(Pairing, EachRefusalHasItsExitCode) {
         {"login", refusal(404), 5, 505},
         {"info", refusal(105), 8, 525},
         {"info", success(R"({"node_id":"x"})"), 1, 519},
-        {"create", refusal(105), 1, 509},
+        {"create", refusal(105), 8, 105},
+        {"create", success("{}"), 1, 509},
     };
     for (const auto &[call, answer, exit, code] : cases) {
         admitBob(remote);
@@ -253,12 +268,51 @@ TEST_F(Pairing, AnEndpointIsTested) {
     EXPECT_EQ(open["trust"], "unknown");
     pair();
     EXPECT_EQ(tested()["trust"], "pinned");
-    const Result plain = run({"conn", "test", "http" + url.substr(std::string("https").size())});
-    EXPECT_EQ(plain.exit, 3) << "HTTP to a TLS port: " << plain.out << plain.err;
+    const OvraTest::MisbehavingServer plain;
     remote.server.refuse();
-    const Result closed = run({"conn", "test", url});
-    EXPECT_EQ(closed.exit, 3);
-    EXPECT_NE(closed.err.find("cannot connect"), std::string::npos) << closed.err;
+    const std::pair<std::string, const char *> cases[] = {
+        {"https://no-such-host.invalid", "is not known"},
+        {url, "refuses connections"},
+        {"https://127.0.0.1:" + std::to_string(plain.port()), "does not speak HTTPS"},
+    };
+    for (const auto &[target, why] : cases) {
+        for (const Arguments &command :
+             {Arguments{"conn", "test", target}, {"conn", "trust", target}, create}) {
+            const Result failed =
+                command == create ? logIn(remote, {"cred", "create", target}) : run(command);
+            EXPECT_EQ(failed.exit, 3) << failed.err;
+            EXPECT_NE(failed.err.find(why), std::string::npos) << failed.err;
+            EXPECT_NE(failed.err.find("ovradr doctor http"), std::string::npos) << failed.err;
+        }
+    }
+    const Result called = run({"call", "n1", "A", "m", "--json"});
+    EXPECT_EQ(called.exit, 3);
+    EXPECT_EQ(called.json()["error"]["code"], 500);
+    EXPECT_NE(called.out.find("refuses connections"), std::string::npos) << called.out;
+}
+
+TEST_F(Pairing, WhatIsAskedNowIsAskedWhateverWasFoundBefore) {
+    const std::string id = pair()["cred_id"].asString();
+    remote.answer("s test_privilege", refusal(119)); // has ended
+    ASSERT_TRUE(OvraApps::PendingReleases().note(
+        {"s", OvraDRNode::Conn::https("127.0.0.1", remote.port()), "n1", "c0"}));
+    for (const Arguments &command : {Arguments{"cred", "test", id},
+                                     {"node", "info", "n1", "--refresh"},
+                                     {"session", "pending", "--retry"}}) {
+        remote.server.answerOnce(OvraTest::Answer::status(500));
+        EXPECT_EQ(run({"conn", "test", url}).exit, 3);
+        EXPECT_EQ(run({"call", "n1", "A", "m"}).exit, 3) << "it is held unreachable";
+        const Result asked = run(command);
+        EXPECT_EQ(asked.exit, 0) << command[0] << asked.out << asked.err;
+    }
+    remote.die();
+    ASSERT_TRUE(OvraApps::PendingReleases().note(
+        {"s2", OvraDRNode::Conn::https("127.0.0.1", remote.port()), "n1", "c0"}));
+    for (const Arguments &command : {Arguments{"cred", "test", id},
+                                     {"node", "info", "n1", "--refresh"},
+                                     {"session", "pending", "--retry"}}) {
+        EXPECT_EQ(run(command).exit, 3) << command[0];
+    }
 }
 
 } // namespace OvradrTest

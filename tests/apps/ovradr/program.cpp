@@ -108,7 +108,8 @@ Result runAsNobody(const Arguments &arguments) {
 }
 
 Terminal::Terminal(const Arguments &arguments) {
-    EXPECT_EQ(openpty(&master_, &slave_, nullptr, nullptr, nullptr), 0);
+    const winsize size{24, 80, 0, 0};
+    EXPECT_EQ(openpty(&master_, &slave_, nullptr, nullptr, &size), 0);
     process_.emplace(arguments, [this] { login_tty(slave_); });
 }
 

@@ -17,6 +17,14 @@ TEST(Target, IsReadAsPeopleWriteIt) {
          {"2001:db8::7", "http", 65535},
          "http://[2001:db8::7]:65535"},
         {"https://[::1]", {"::1", "https", 5001}, "https://[::1]:5001"},
+        {" \thttps://nas2\r\n", {"nas2", "https", 5001}, "https://nas2:5001"},
+        {"https://[fe80::1%eth0]", {"fe80::1%eth0", "https", 5001}, "https://[fe80::1%eth0]:5001"},
+        {"https://[FE80::1%25eth0]",
+         {"fe80::1%eth0", "https", 5001},
+         "https://[fe80::1%eth0]:5001"},
+        {"https://N\u00c4S2.example:7",
+         {"xn--ns2-qla.example", "https", 7},
+         "https://xn--ns2-qla.example:7"},
         {"flk:my-nas", OvraDRNode::Conn::farlink("my-nas"), "flk:my-nas"},
     };
     for (const auto &[text, conn, written] : cases) {
@@ -35,11 +43,11 @@ TEST(Target, IsRefusedWhenAnythingInItWouldBeLost) {
         refused.emplace_back(text);
     }
     for (const char *authority :
-         {"",           ":5001",       "nas2:",        "nas2:0",    "nas2:65536",
-          "nas2:-1",    "nas2:+80",    "nas2:5001x",   "nas2/path", "nas2//",
-          "nas2?x",     "nas2#x",      "bob:pw@nas2",  "nas 2",     "nas2\r\nX: 1",
-          "n\xC3\xA4s", "2001:db8::7", "[2001:db8::7", "[nas2]",    "[fe80::1%eth0]",
-          "[::1]x",     "-nas2",       "10.77.2"}) {
+         {"",        ":5001",       "nas2:",        "nas2:0",    "nas2:65536",
+          "nas2:-1", "nas2:+80",    "nas2:5001x",   "nas2/path", "nas2//",
+          "nas2?x",  "nas2#x",      "bob:pw@nas2",  "nas 2",     "nas2\r\nX: 1",
+          "n\xC3s",  "2001:db8::7", "[2001:db8::7", "[nas2]",    "[fe80::1]",
+          "[::1]x",  "-nas2",       "10.77.2",      "a\u2028b",  "[2001:db8::1%eth0]"}) {
         refused.push_back(std::string("https://") + authority);
     }
     for (const std::string &text : refused) {
@@ -47,6 +55,8 @@ TEST(Target, IsRefusedWhenAnythingInItWouldBeLost) {
         ASSERT_FALSE(conn) << text;
         EXPECT_EQ(conn.error().exit, ExitCode::kUsage) << text;
     }
+    EXPECT_EQ(parseTarget(" nas2:7").error().hint,
+              "Write https://nas2:7, or http:// for plain HTTP.");
 }
 
 } // namespace Ovradr

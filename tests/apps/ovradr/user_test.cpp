@@ -65,7 +65,14 @@ TEST(User, WhoIsRemovedLosesHisSessionsAndNobodyElseDoes) {
     ASSERT_TRUE(his && hers);
     ASSERT_EQ(run({"user", "disable", "bob"}).exit, 0);
     EXPECT_TRUE(sessions.find(*his)) << "pairings live on when the account is enabled again";
-    const Result result = run({"user", "remove", "bob"});
+    EXPECT_EQ(run({"user", "remove", "bob"}).exit, 2) << "nobody can be asked";
+    const Result foreseen = run({"user", "remove", "bob", "--dry-run", "--json"});
+    EXPECT_EQ(foreseen.json()["data"]["would_end_sessions"], 1);
+    Terminal terminal({"user", "remove", "bob"});
+    ASSERT_TRUE(terminal.answers("has 1 session, which would end", "n"));
+    EXPECT_EQ(terminal.finish(), 1);
+    EXPECT_TRUE(sessions.find(*his));
+    const Result result = run({"user", "remove", "bob", "--yes"});
     EXPECT_EQ(result.exit, 0) << result.err;
     EXPECT_FALSE(sessions.find(*his));
     EXPECT_TRUE(sessions.find(*hers));

@@ -75,11 +75,13 @@ TEST(Endpoint, HasOneSpellingOrIsRefused) {
     EXPECT_EQ(key("http", "10.0.0.2", 80), "http://10.0.0.2:80");
     EXPECT_EQ(key("https", "2001:DB8:0::1", 1), "https://[2001:db8::1]:1");
     EXPECT_EQ(key("https", "[::1]", 65535), "https://[::1]:65535");
+    EXPECT_EQ(key("https", "FE80::1%eth0", 1), "https://[fe80::1%eth0]:1");
+    EXPECT_EQ(Endpoint::make("https", "fe80::1%eth0", 1)->url("x"), "https://[fe80::1]:1/x");
     for (const char *protocol : {"flk", "HTTPS", "ftp"}) {
         EXPECT_EQ(key(protocol, "a", 1), "") << protocol;
     }
     for (const char *host : {"", "a b", "a/b", "u@a", "a?b", "a#b", "a\nb", "a\\b", "a%41", "a:80",
-                             "[::1", "fe80::1%eth0"}) {
+                             "[::1", "fe80::1%a/b", "2001:db8::1%eth0"}) {
         EXPECT_EQ(key("https", host, 1), "") << host;
     }
     EXPECT_EQ(key("https", "a", 0) + key("https", "a", 65536), "");
