@@ -27,7 +27,7 @@ struct ConnectionLimits {
     /// Bytes a second. A body or reply that travels this fast has all the time that it needs: the
     /// bytes that have passed lengthen the time for the rest. The least of what links between
     /// appliances carry, 64 kbit/s.
-    std::size_t leastRate = 8 * 1024;
+    std::size_t leastRate = 8192;
     std::size_t total = 1024;
     std::size_t perClient = 768;
 };
