@@ -21,7 +21,7 @@ test: deps-test deps-lab build-dev ## every test, each on its own node (TESTS=re
 	@lab/lab way | sed 's/^/tests run by way of /'
 	ctest --preset dev -j $(TEST_JOBS) --no-tests=error $(if $(TESTS),-R '$(TESTS)')
 
-torture: deps-test deps-check deps-lab build-dev ## what crashes, failing calls and rubbish leave (OVRA_TORTURE=N: how long)
+torture: deps-test deps-check deps-lab build-dev ## what crashes, crowds, rubbish and long use leave (OVRA_TORTURE=N: how long)
 	OVRA_TORTURE=$(or $(OVRA_TORTURE),100) ctest --preset dev -L torture -j $(JOBS)
 	tools/check-threads
 	tools/fuzz 600

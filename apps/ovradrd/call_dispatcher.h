@@ -24,8 +24,6 @@ namespace Ovradrd {
 
 /// The queues that calls run in.
 struct WorkQueues {
-    OvraService::WorkQueue quick{
-        4, {1024, 512}}; ///< reads calls, and runs those that answer from this machine alone
     OvraService::WorkQueue outbound{16, {128, 64}};
     OvraService::WorkQueue twoWay{16, {128, 64}};
     OvraService::WorkQueue relay{8, {128, 64}};
@@ -34,6 +32,9 @@ struct WorkQueues {
     OvraService::WorkQueue login{2, {512, 64}};
     OvraService::WorkQueue knownLogin{1, {512, 64}};
     OvraService::WorkQueue watch{8, {16384, 16384}}; ///< our own questions to other nodes
+    /// Reads calls, and runs those that answer from this machine alone. The last one, so that it
+    /// ends first: its threads give jobs to the others.
+    OvraService::WorkQueue quick{4, {1024, 512}};
 
     OvraService::WorkQueue &of(OvraPlatform::APIQueue queue);
 };
