@@ -41,10 +41,6 @@ playAttack-slow() {
     on 3 0 ovradr user add replica --admin --password-file /usr/ovra/pw
     on 3 0 ovradr farlink enable --server "$server" --alias nas-3 --fingerprint "$key"
     on 1 0 ovradr farlink enable --server "$server" --fingerprint "$key"
-    for _ in $(seq 100); do
-        ! "$lab" run 1 -- ovradr conn test flk:nas-3 >/dev/null 2>&1 || break
-        sleep 0.1
-    done
     key=$(fingerprint 3) url=flk:nas-3 account=replica
     create 0 --json
     on 3 0 ovradr --json node id
