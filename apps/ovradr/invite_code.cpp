@@ -72,9 +72,9 @@ void putEndpoint(Bytes &bytes, const Conn &conn) {
 }
 
 /// Takes what was put, in the same order; once there is too little it has failed.
-class Reader {
+class CodeReader {
 public:
-    explicit Reader(const Bytes &bytes)
+    explicit CodeReader(const Bytes &bytes)
         : bytes_(bytes) {}
 
     Bytes take(std::size_t size) {
@@ -230,7 +230,7 @@ Expected<InviteCode> readInviteCode(const std::string &text) {
         return unreadable("it is mistyped or not complete");
     }
     bytes->resize(bytes->size() - kCheckBytes);
-    Reader in(*bytes);
+    CodeReader in(*bytes);
     const std::uint64_t head = in.number(1);
     if (head >> 4 != kVersion) {
         return failure(ExitCode::kUsage, "The code is of a newer version.",

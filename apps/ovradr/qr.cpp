@@ -5,6 +5,7 @@
 #include <sys/ioctl.h>
 #include <unistd.h>
 
+#include <cstddef>
 #include <memory>
 
 namespace Ovradr {
@@ -32,7 +33,8 @@ std::string qrForTerminal(const std::string &text) {
     const int width = code->width;
     const auto light = [&code, width](int x, int y) {
         const bool inside = x >= 0 && y >= 0 && x < width && y < width;
-        return !inside || (code->data[y * width + x] & 1) == 0;
+        const auto row = static_cast<std::size_t>(y) * static_cast<std::size_t>(width);
+        return !inside || (code->data[row + static_cast<std::size_t>(x)] & 1) == 0;
     };
     // A line of text is two rows of modules: half blocks, or a module would be twice as high as
     // wide.

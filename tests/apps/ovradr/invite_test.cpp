@@ -3,6 +3,7 @@
 #include "scripted_node.h"
 
 #include <atomic>
+#include <cctype>
 #include <ctime>
 #include <memory>
 #include <tuple>
@@ -54,7 +55,9 @@ TEST(InviteCode, SaysWhatWasWrittenHoweverItIsTyped) {
     const std::string text = Ovradr::writeInviteCode(written);
     std::string typed;
     for (const char c : text) {
-        typed += c == '0' ? 'o' : c == '1' ? 'l' : static_cast<char>(std::tolower(c));
+        typed += c == '0'   ? 'o'
+                 : c == '1' ? 'l'
+                            : static_cast<char>(std::tolower(static_cast<unsigned char>(c)));
         typed += c == '-' ? " " : "";
     }
     for (const std::string &form : {text, typed}) {
