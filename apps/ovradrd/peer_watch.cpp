@@ -68,7 +68,7 @@ WayFacts askOver(const DRNode &cred, bool temporary) {
             message.isString() ? message.asString() : OvraDRCore::memberString(message, "text");
         return found;
     }
-    const Json::Value data = answer.getData();
+    const Json::Value &data = answer.getData();
     const Json::Value additional =
         data.isObject() ? data.get("additional", Json::Value()) : Json::Value();
     found.latency = took.count();
