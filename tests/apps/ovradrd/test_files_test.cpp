@@ -1,10 +1,12 @@
 // SPDX-License-Identifier: Apache-2.0
 #include "appliance.h"
 #include "support/sockets.h"
+#include "test_files.h"
 
 #include <sys/stat.h>
 
 #include <array>
+#include <chrono>
 #include <filesystem>
 #include <fstream>
 #include <vector>
@@ -116,4 +118,17 @@ TEST_F(TestFiles, OnlySoManyAreSentAtOnce) {
         reply = get(kUrl + named('0'), "Range: bytes=0-1\r\n");
     }
     EXPECT_EQ(reply.substr(0, 12), "HTTP/1.1 503") << reply;
+}
+
+TEST_F(TestFiles, AreSweptWhenNoTestCanUseThemAnyMore) {
+    const std::string other = kFolder + "/other";
+    for (const std::string &path : {named('1'), other}) {
+        std::ofstream(path) << kContent;
+        std::filesystem::last_write_time(path, std::filesystem::file_time_type::clock::now() -
+                                                   std::chrono::hours(1));
+    }
+    Ovradrd::sweepTestFiles();
+    EXPECT_TRUE(std::filesystem::exists(named('0')));
+    EXPECT_FALSE(std::filesystem::exists(named('1')));
+    EXPECT_TRUE(std::filesystem::exists(other)) << "nobody knows whose it is";
 }
