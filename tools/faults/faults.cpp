@@ -202,7 +202,7 @@ std::time_t secondsAhead() {
 
 /// Shares the control with the test that started this program.
 __attribute__((constructor)) void shareControl() {
-    const char *const name = getenv(OvraTest::kControlVariable);
+    const char *const name = getenv(OvraTest::kControlVariable); // NOLINT: no other thread yet
     const int fd = name != nullptr ? open(name, O_RDWR) : -1;
     void *const shared = mmap(nullptr, sizeof(own), PROT_READ | PROT_WRITE, MAP_SHARED, fd, 0);
     if (fd >= 0 && shared != MAP_FAILED) {
@@ -234,6 +234,7 @@ bool OvraTest::endFaults() {
 }
 
 // Functions of libc, under names of our own: its headers declare them in ways that differ.
+// NOLINTBEGIN(bugprone-macro-parentheses): the arguments are parts of declarations.
 #define OVRA_REPLACE(result, name, parameters)                                                     \
     extern "C" __attribute__((visibility("default")))                                              \
     result ovra_##name parameters __asm__(#name);                                                  \
@@ -292,6 +293,8 @@ OVRA_COUNT(kChange, int, ftruncate, (int fd, off_t size), (fd, size))
 OVRA_COUNT(kChange, int, ftruncate64, (int fd, off_t size), (fd, size))
 OVRA_COUNT(kChange, int, unlink, (const char *path), (path))
 OVRA_COUNT(kChange, int, link, (const char *from, const char *to), (from, to))
+// NOLINTEND(bugprone-macro-parentheses)
+
 OVRA_LOCK(flock, (int fd, int operation), (fd, operation), true)
 OVRA_LOCK(fcntl, (int fd, int command, void *argument), (fd, command, argument), isLock(command))
 OVRA_LOCK(fcntl64, (int fd, int command, void *argument), (fd, command, argument), isLock(command))
