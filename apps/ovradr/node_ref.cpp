@@ -5,6 +5,7 @@
 #include "closest.h"
 #include "granted_session.h"
 #include "node_view.h"
+#include "output.h"
 #include "provision/node_database.h"
 
 #include <ovradrnode/node_db.h>

@@ -3,6 +3,7 @@
 
 #include "node_ref.h"
 #include "node_view.h"
+#include "output.h"
 #include "target.h"
 
 #include <ovraplatform/api_errors.h>

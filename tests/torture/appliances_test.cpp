@@ -7,6 +7,7 @@
 #include "shared/pending_releases.h"
 #include "support/daemon_program.h"
 #include "support/local_node.h"
+#include "support/torture.h"
 
 #include <ovraplatform/session_store.h>
 
@@ -27,6 +28,7 @@ using OvraPlatform::SessionRecord;
 using OvraPlatform::SessionStore;
 using OvraTest::DaemonProgram;
 using OvraTest::Fault;
+using OvraTest::tortureScale;
 using OvraTest::Victim;
 
 /// The far appliance's files, and where it sees them.
@@ -36,11 +38,6 @@ const std::vector<std::pair<std::string, std::string>> kFarView = {
     {"/tmp/far/lock", "/run/lock"}};
 constexpr const char *kPassword = "/tmp/password";
 const std::string kUrl = "https://127.0.0.2:5001";
-
-int scale() {
-    const char *const text = std::getenv("OVRA_TORTURE");
-    return text != nullptr ? std::max(1, std::atoi(text)) : 1;
-}
 
 /// What one appliance holds of the other, and grants it.
 struct Holdings {
@@ -215,7 +212,7 @@ TEST_F(TwoAppliances, KilledInTheMiddleOfAFlowTheyLoseNoSession) {
     std::mt19937 random(13);
     std::map<std::pair<std::size_t, bool>, int>
         calls; // of a whole flow, by the flow and who is killed
-    const int rounds = scale() == 1 ? 16 : 20 * scale();
+    const int rounds = tortureScale() == 1 ? 16 : 20 * tortureScale();
     int kills = 0;
     const auto begin = std::chrono::steady_clock::now();
     for (int round = 0; round < rounds && !HasFailure(); ++round) {
@@ -293,7 +290,7 @@ TEST_F(TwoAppliances, NobodyWaitsLongForOneWhoIsStopped) {
         {"cred", "set", creds[1], "--account", "ann", "--password-file", kPassword},
         {"cred", "reverse", creds[1], "--account", "ann"}};
     std::map<std::string, double> longest;
-    const int rounds = scale() == 1 ? 1 : scale() / 2;
+    const int rounds = tortureScale() == 1 ? 1 : tortureScale() / 2;
     for (int round = 0; round < rounds && !HasFailure(); ++round) {
         const Arguments &flow = flows[round / 3 % 3];
         const int role = (round + 1) % 3; // the caller, the far daemon, the near daemon
@@ -307,7 +304,7 @@ TEST_F(TwoAppliances, NobodyWaitsLongForOneWhoIsStopped) {
             usleep(5'000);
         }
         for (const auto &[other, bound, quick] : others) {
-            if (scale() > 1 || quick) {
+            if (tortureScale() > 1 || quick) {
                 const auto begin = std::chrono::steady_clock::now();
                 auto program = start(OVRADR_PROGRAM, other, false);
                 int code = -1;
@@ -343,7 +340,7 @@ TEST_F(TwoAppliances, NobodyWaitsLongForOneWhoIsStopped) {
 TEST_F(TwoAppliances, AClockThatJumpsAYearHarmsNothing) {
     constexpr int kYear = 365 * 24 * 3600;
     std::mt19937 random(15);
-    const int rounds = scale() == 1 ? 2 : scale() / 2;
+    const int rounds = tortureScale() == 1 ? 2 : tortureScale() / 2;
     for (int round = 0; round < rounds && !HasFailure(); ++round) {
         const bool far = round / 2 % 2 == 1;
         const Victim &victim = daemonVictims_[far];

@@ -11,6 +11,7 @@
 #include "shared/pending_releases.h"
 #include "support/local_node.h"
 #include "support/log_capture.h"
+#include "support/torture.h"
 
 #include <ovrabase/address.h>
 #include <ovradrcore/cache.h>
@@ -316,8 +317,7 @@ protected:
 
 TEST_P(DamagedFile, IsRefusedWithAReasonOrHealed) {
     const Kind &kind = GetParam();
-    const char *const scale = std::getenv("OVRA_TORTURE");
-    const int rounds = scale != nullptr ? 625 * std::max(1, std::atoi(scale)) / 100 : 12;
+    const int rounds = std::max(12, 625 * OvraTest::tortureScale() / 100);
     std::mt19937 random(20);
     for (int round = 0; round < rounds && !HasFailure(); ++round) {
         const std::string text =

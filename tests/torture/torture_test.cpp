@@ -357,7 +357,7 @@ TEST_P(Torture, LeavesTheOldOrTheNewAtEveryCall) {
         {"power, old names", {Fault::kPowerOldNames}},
     };
     for (const auto &[name, plan] : faults) {
-        if (scale() == 1 && std::string_view(GetParam().name).ends_with("First") &&
+        if (tortureScale() == 1 && std::string_view(GetParam().name).ends_with("First") &&
             plan.fault != Fault::kKill && plan.fault != Fault::kPowerOldNames) {
             continue; // as in the other cases
         }
