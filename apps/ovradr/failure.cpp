@@ -249,11 +249,7 @@ Refusal failureOf(const OvraDRCore::ErrRecorder &error) {
     if (error.GetErrCode() == ERR::kLoginFailed && refusal.code != 0) {
         return failureOf(refusal.code, refusal.detail);
     }
-    Refusal found = failureOf(error.GetErrCode(), error.GetErrMsg());
-    if (error.GetErrCode() == ERR::kNotConnectable && error.GetErrMsg().isObject()) {
-        addReason(found.value(), OvraDRNode::Conn::fromJson(error.GetErrMsg()));
-    }
-    return found;
+    return failureOf(error.GetErrCode(), error.GetErrMsg());
 }
 
 void nameEndpoint(Failure &failure, const OvraDRNode::Conn &conn) {

@@ -330,7 +330,7 @@ callsThroughTheRelay() {
     url=flk:nas-3 key=$thirdKey
     create 0 --json
     on 1 0 ovradr --json cred set "$(made)" --account replica --password-file /usr/ovra/pw
-    holds '.data | .protocol == "flk" and .endpoint_changed == false'
+    holds '.data | (.endpoint | startswith("flk:")) and .endpoint_changed == false'
     on 3 0 ovradr --json node id
     remote=$(value .data.node_id)
     info 0
