@@ -67,7 +67,11 @@ Refusal unknownOption(const CLI::App &command, const std::string &name) {
                        "Use --password-file or --password-stdin, or have it asked for.");
     }
     const std::string word = OvraBase::toLower(name.substr(name.find_first_not_of('-')));
-    const std::string meant = closest(word, longOptions(command));
+    const std::vector<std::string> names = longOptions(command);
+    const auto begins = [&word](const std::string &each) { return each.starts_with(word); };
+    const std::string meant = std::count_if(names.begin(), names.end(), begins) == 1
+                                  ? *std::find_if(names.begin(), names.end(), begins)
+                                  : closest(word, names);
     return failure(ExitCode::kUsage, "The command has no option " + name + ".",
                    (meant.empty() ? "" : "Did you mean --" + meant + "? ") + helpHint(command));
 }
@@ -174,7 +178,8 @@ const CLI::App &reachedCommand(const CLI::App &app) {
 
 Refusal usageFailure(const CLI::App &app, const CLI::ParseError &error) {
     const CLI::App &command = reachedCommand(app);
-    const std::vector<std::string> surplus = app.remaining(true);
+    std::vector<std::string> surplus = app.remaining(true);
+    std::erase(surplus, "--"); // the parser leaves it there
     const auto option = std::find_if(surplus.begin(), surplus.end(), isOption);
     const bool family = command.get_require_subcommand_min() > 0;
     if (family && !surplus.empty() && option != surplus.begin()) {

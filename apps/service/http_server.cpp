@@ -585,7 +585,7 @@ OvraBase::Expected<void> HttpServer::start(std::vector<Listener> https, std::vec
             {"the key for TLS session tickets cannot be made: is the kernel "
              "out of random numbers?"});
     }
-    if (auto taken = impl_->use(identity); !taken) {
+    if (auto taken = https.empty() ? OvraBase::Expected<void>() : impl_->use(identity); !taken) {
         return taken;
     }
     for (const bool secure : {true, false}) {

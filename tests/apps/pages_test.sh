@@ -23,7 +23,7 @@ tree 'does not describe `ovradr attr list`' 's/`ovradr attr list [^`]*`//' Comma
 tree 'has an option --retry' '/^| `--retry`/d' CommandTree.IsDocumentedAsAWhole
 tree 'takes SUBJECT' 's/`ovradr doctor \[SUBJECT\]`/`ovradr doctor`/' CommandTree.IsDocumentedAsAWhole
 tree 'there is no `ovradr user lists' 's/`ovradr user list`/`ovradr user lists`/' CommandTree.IsAllThatPagesMention
-tree 'has no option --admins' 's/ovradr user add NAME \[--admin\]/ovradr user add NAME [--admins]/' CommandTree.IsAllThatPagesMention
+tree 'has no option --roles' 's/ovradr user add NAME \[--role ROLE\]/ovradr user add NAME [--roles ROLE]/' CommandTree.IsAllThatPagesMention
 tree 'an option --forgot' 's/`--forget SESSION`/`--forgot SESSION`/' CommandTree.HasEveryOptionThatItsPageDescribes
 tree 'add a row with the `data` of `why`' '/^| `why` /d' CommandTree.HasItsDocumentsForScriptsDescribed
 tree '| 505 | `otp_wrong` | 5 |' '/^| 505 /d' Failure.IsDocumentedWithWhatItsCodeMeans

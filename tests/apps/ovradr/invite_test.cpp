@@ -103,7 +103,7 @@ TEST_F(Invited, LeavesNothingBehindWhenAStepFails) {
         {"redeem", refusal(107), 1, "too_busy"},
         {"get", refusal(105), 7, "session_user_unknown"},
         {"info", refusal(105), 8, "no_privilege"},
-        {"create", refusal(105), 1, "cred_incomplete"},
+        {"create", refusal(105), 8, "no_permission"},
     };
     for (const auto &[call, answer, exit, name] : cases) {
         admitBob(remote);
