@@ -26,6 +26,7 @@
 #include <iterator>
 #include <ostream>
 #include <random>
+#include <regex>
 #include <vector>
 
 using namespace OvraDRNode;
@@ -198,7 +199,10 @@ const Scene kScenes[] = {
          return TrustStore().pin("https://n1:5001", "SHA256:" + std::string(43, 'A')) ==
                 TrustVerdict::kTrusted;
      },
-     [] { return fileText(kKnownEndpointsFile); }},
+     [] { // without the time, which passes
+         static const std::regex kSeconds("#since [0-9]+");
+         return std::regex_replace(fileText(kKnownEndpointsFile), kSeconds, "#since");
+     }},
     {"releaseNote", prepareStores,
      [] {
          std::vector<OvraApps::PendingRelease> all;
