@@ -18,7 +18,8 @@ inline std::string damage(std::string text, std::mt19937 &random) {
             at = below(text.size()); // most bytes of a database are of no use
         }
         const std::size_t some = std::min(text.size() - at, std::size_t{1} << below(13));
-        constexpr std::string_view kLiked("\0\xff\n\"'= #-/019azAZ\x80\x7f", 21);
+        using namespace std::string_view_literals;
+        constexpr std::string_view kLiked = "\0\xff\n\"'= #-/019azAZ\x80\x7f"sv;
         switch (below(9)) {
         case 0:
         case 1:
