@@ -8,6 +8,7 @@
 #include "provision/data_files.h"
 #include "provision/node_database.h"
 #include "renewal.h"
+#include "shared/overview.h"
 #include "target.h"
 #include "tcp_reach.h"
 #include "trust.h"
@@ -43,9 +44,6 @@ using OvraPlatform::CredError;
 using OvraPlatform::PeerIdentity;
 using OvraPlatform::TrustVerdict;
 namespace WebAPI = OvraDRNode::WebAPI;
-
-/// One-time codes are accepted one step of 30 seconds early or late.
-constexpr double kMaxClockSeconds = 30;
 
 const char *stateText(Diagnosis::Step::State state) {
     switch (state) {
@@ -368,7 +366,7 @@ private:
 
     Expected<std::string> judgeClock(double ahead) const {
         const std::string text = clockText(ahead);
-        if (std::abs(ahead) > kMaxClockSeconds) {
+        if (std::abs(ahead) > OvraApps::kMaxClockSeconds) {
             return failure(ExitCode::kClock,
                            "The clock of " + targetText(conn_) + " is " + text + ".",
                            "Set both by NTP: one-time codes need clocks that agree.");

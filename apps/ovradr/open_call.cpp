@@ -2,6 +2,7 @@
 #include "open_call.h"
 
 #include "endpoint.h"
+#include "shared/overview.h"
 #include "target.h"
 #include "trust.h"
 
@@ -79,7 +80,8 @@ Refusal withClock(Refusal failed, const Conn &conn) {
     if (ahead) {
         failed.value().hint =
             "Use the present code, each only once. Its clock is " + clockText(*ahead) +
-            (std::abs(*ahead) < 30 ? ", which is near enough." : ": set both by NTP.");
+            (std::abs(*ahead) <= OvraApps::kMaxClockSeconds ? ", which is near enough."
+                                                            : ": set both by NTP.");
     }
     return failed;
 }

@@ -38,8 +38,6 @@ using OvraDRNode::NodeSession;
 using OvraPlatform::SessionRecord;
 using Outlook = NodeCandidate::Outlook;
 
-/// One-time codes are accepted one step of 30 seconds early or late.
-constexpr double kMaxClockSeconds = 30;
 /// A release that has been tried for so long has a node that is gone for good.
 constexpr std::int64_t kPatience = std::int64_t{7} * 24 * 3600;
 constexpr std::size_t kMostProblems = 1000;

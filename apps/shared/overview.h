@@ -13,6 +13,10 @@
 // (OVRA.DR.Status overview; docs/wire.md describes its members).
 namespace OvraApps {
 
+/// How far the clocks of two appliances may be apart: one-time codes are accepted one step of 30
+/// seconds early or late (RFC 6238, 5.2).
+inline constexpr double kMaxClockSeconds = 30;
+
 /// What the daemon learnt when it last asked over a credential. Times are seconds of the system
 /// clock.
 struct WayFacts {
