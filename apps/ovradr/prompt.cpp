@@ -91,7 +91,8 @@ private:
 
 Refusal unreadable(const std::string &where, const std::string &why) {
     return failure(ExitCode::kFailed, "No secret can be read from " + where + ": " + why + ".",
-                   "Its first line has to be the password or, for --from-session, the session.");
+                   "Its first line has to be the password or, where one is asked for, the session "
+                   "or the code.");
 }
 
 /// Reads up to the end of the line. One byte at a time: what follows the line is not ours.

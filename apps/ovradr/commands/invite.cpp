@@ -1,4 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
+#include "access.h"
 #include "commands/commands.h"
 #include "endpoint.h"
 #include "invite_code.h"
@@ -256,7 +257,8 @@ void addInviteCommand(CLI::App &app, Command &chosen) {
                     "  ovradr invite\n"
                     "  ovradr invite --minutes 60 --endpoint https://nas1.example.com\n"
                     "  ovradr invite --list");
-    command->callback([&chosen, options] { chosen = [options] { return invite(*options); }; });
+    command->callback(
+        [&chosen, options] { chosen = forOwnUser([options] { return invite(*options); }); });
 }
 
 } // namespace Ovradr

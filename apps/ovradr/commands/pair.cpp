@@ -1,4 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
+#include "access.h"
 #include "commands/commands.h"
 #include "cred_report.h"
 #include "endpoint.h"
@@ -452,7 +453,8 @@ void addPairCommand(CLI::App &app, Command &chosen) {
                     "  ovradr pair 22TQ8-... --both\n"
                     "  ovradr pair - < code\n"
                     "  ovradr pair https://nas2");
-    command->callback([&chosen, options] { chosen = [options] { return pair(*options); }; });
+    command->callback(
+        [&chosen, options] { chosen = forOwnUser([options] { return pair(*options); }); });
 }
 
 } // namespace Ovradr

@@ -74,7 +74,7 @@ TEST(CommandLine, SaysToAnOrdinaryUserWhichFileHeCannotReadAndNothingElse) {
          {"setup", "node list", "node info local", "doctor", "doctor https://127.0.0.1:1",
           "cred list", "user list", "session list", "session pending", "conn local",
           "conn forget https://127.0.0.1:1", "conn trust https://127.0.0.1:1", "farlink status",
-          "farlink disable", "call local A m"}) {
+          "farlink disable", "call local A m", "invite", "invite --list", "pair 2222", "status"}) {
         std::istringstream words(line);
         const Result result = runAsNobody({std::istream_iterator<std::string>(words), {}});
         if (result.exit == kNoOtherUser) {
